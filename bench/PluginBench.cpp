@@ -1,0 +1,154 @@
+// What planning costs for each application, and what one edit of the todo list costs beside a plain
+// rewrite of the same bytes. Files are written to the working directory: it should be on a disk.
+//
+// Names: planning/N (one call with N applications), todoListEdit, todoListPlainRewrite.
+
+#include <benchmark/benchmark.h>
+#include <fcntl.h>
+#include <unistd.h>
+
+#include <cstdlib>
+#include <filesystem>
+#include <memory>
+#include <stdexcept>
+#include <string>
+
+#include "client/AppsClient.h"
+#include "client/Paths.h"
+#include "client/TodoList.h"
+#include "simulation/SimulatedPlatform.h"
+#include "system/PropertyListCodec.h"
+#include "system/RootedFileSystem.h"
+
+namespace appsync {
+namespace {
+
+constexpr int kEditedListLength = 1000;
+
+std::string identifierOf(int number) { return "com.example.application" + std::to_string(number); }
+
+PropertyList todoListOf(int count) {
+    PropertyList list = PropertyList::array();
+    for (int i = 0; i < count; ++i) {
+        list.append(PropertyList::map({{kTodoIdentifierKey, identifierOf(i)},
+                                       {kTodoOperationKey, kTodoInstall},
+                                       {kTodoVersionKey, "1.0"},
+                                       {kTodoNameKey, "Application " + std::to_string(i)}}));
+    }
+    return list;
+}
+
+/// What the host has staged: the todo list, and for each application its info dictionary.
+void stage(SimulatedPlatform& platform, int count) {
+    platform.addPropertyList(std::string(kTodoListPath), todoListOf(count));
+    for (int i = 0; i < count; ++i) {
+        const std::string directory =
+            formatPath(kInDirectoryFormat, {kTodoDirectory, identifierOf(i)});
+        platform.addPropertyList(formatPath(kInfoFormat, {directory}),
+                                 PropertyList::map({{BundleIdentifierKey, identifierOf(i)},
+                                                    {BundleDisplayNameKey, "Application"}}));
+    }
+}
+
+void planning(benchmark::State& state) {
+    const int count = static_cast<int>(state.range(0));
+    for (auto _ : state) {
+        state.PauseTiming();
+        SystemPropertyLists codec;
+        auto platform = std::make_unique<SimulatedPlatform>(codec);
+        platform->recorder.setEnabled(false);
+        stage(*platform, count);
+        auto client = AppsClient::create(platform->services());
+        state.ResumeTiming();
+        auto assets = client->outstandingAssetTransfers();
+        state.PauseTiming();
+        if (assets.size() != static_cast<std::size_t>(count))
+            state.SkipWithError("not all planned");
+        assets.clear();
+        client.reset();
+        platform.reset();
+        state.ResumeTiming();
+    }
+    state.SetItemsProcessed(state.iterations() * count);
+}
+BENCHMARK(planning)->Arg(1000)->Arg(10000)->Unit(benchmark::kMillisecond);
+
+/// A directory of its own under the working directory, gone at the end.
+class ScratchDirectory {
+  public:
+    ScratchDirectory() {
+        std::string path = (std::filesystem::current_path() / "appsync-bench-XXXXXX").string();
+        if (::mkdtemp(path.data()) == nullptr) throw std::runtime_error("cannot make " + path);
+        path_ = path;
+    }
+    ~ScratchDirectory() {
+        std::error_code ignored;
+        std::filesystem::remove_all(path_, ignored);
+    }
+    ScratchDirectory(const ScratchDirectory&) = delete;
+    ScratchDirectory& operator=(const ScratchDirectory&) = delete;
+
+    [[nodiscard]] const std::string& path() const { return path_; }
+
+  private:
+    std::string path_;
+};
+
+/// The simulated platform, but with files on disk and property lists as a device has them.
+Platform withRealFiles(SimulatedPlatform& simulated, FileSystem& files,
+                       PropertyListSerialization& propertyLists) {
+    const Platform all = simulated.services();
+    return Platform{
+        all.host,   all.log,    all.registry,   all.installer,     all.coordination,
+        all.policy, all.backup, all.homeScreen, all.icons,         all.transactions,
+        all.queues, files,      propertyLists,  all.notifications, all.notificationCenter};
+}
+
+Bytes encodedTodoList() {
+    return *SystemPropertyLists().serialize(todoListOf(kEditedListLength),
+                                            PropertyListFormat::Binary);
+}
+
+void todoListEdit(benchmark::State& state) {
+    const ScratchDirectory scratch;
+    const auto files = *RootedFileSystem::open(scratch.path());
+    files->createDirectory(std::string(kTodoDirectory), true, nullptr).ignore();
+    files->writeFileAtomically(std::string(kTodoListPath), encodedTodoList()).ignore();
+    SystemPropertyLists codec;
+    SimulatedPlatform simulated(codec);
+    simulated.recorder.setEnabled(false);
+    const auto client = AppsClient::create(withRealFiles(simulated, *files, codec));
+    const std::string identifier = identifierOf(kEditedListLength / 2);
+    bool sent = false;
+    for (auto _ : state) {
+        sent = !sent;
+        client->changeAssetID(identifier, sent ? kTodoSent : kTodoDownloaded);
+    }
+    const auto operation = client->_operationStateForIdentifier(identifier);
+    if (operation != (sent ? kTodoSent : kTodoDownloaded)) state.SkipWithError("not edited");
+}
+BENCHMARK(todoListEdit)->Unit(benchmark::kMicrosecond)->UseRealTime();
+
+bool rewrite(const std::string& temporary, const std::string& target, const Bytes& bytes) {
+    const int file = ::open(temporary.c_str(), O_WRONLY | O_CREAT | O_TRUNC | O_CLOEXEC, 0644);
+    if (file < 0) return false;
+    const bool written =
+        ::write(file, bytes.data(), bytes.size()) == static_cast<ssize_t>(bytes.size());
+    const bool synced = ::fsync(file) == 0;
+    return ::close(file) == 0 && written && synced &&
+           ::rename(temporary.c_str(), target.c_str()) == 0;
+}
+
+void todoListPlainRewrite(benchmark::State& state) {
+    const ScratchDirectory scratch;
+    const Bytes bytes = encodedTodoList();
+    const std::string target = scratch.path() + "/list";
+    for (auto _ : state) {
+        if (!rewrite(target + ".new", target, bytes)) state.SkipWithError("not written");
+    }
+    state.SetBytesProcessed(state.iterations() * static_cast<std::int64_t>(bytes.size()));
+}
+BENCHMARK(todoListPlainRewrite)->Unit(benchmark::kMicrosecond)->UseRealTime();
+
+}  // namespace
+}  // namespace appsync

@@ -1,0 +1,24 @@
+#pragma once
+
+#include <optional>
+#include <string>
+
+#include "platform/PropertyList.h"
+#include "platform/PropertyListSerialization.h"
+#include "platform/Result.h"
+
+namespace appsync {
+
+struct Platform;
+
+/// The map in a property-list file, either encoding. Nothing when the file is missing, cannot be
+/// read or parsed, or holds something else.
+[[nodiscard]] std::optional<PropertyList> readMapFile(const Platform& platform,
+                                                      const std::string& path);
+
+/// Writes a property list atomically. The error of whichever failed, the encoder or the file
+/// system; nothing is written then.
+Status writePropertyListFile(const Platform& platform, const std::string& path,
+                             const PropertyList& value, PropertyListFormat format);
+
+}  // namespace appsync

@@ -1,0 +1,16 @@
+# Everything third-party comes from Debian packages (scripts/setup installs them). Nothing is downloaded.
+
+find_package(Threads REQUIRED)
+find_package(PkgConfig REQUIRED)
+pkg_check_modules(SQLITE3 REQUIRED IMPORTED_TARGET sqlite3)
+pkg_check_modules(LIBZIP REQUIRED IMPORTED_TARGET libzip)
+pkg_check_modules(CAIRO REQUIRED IMPORTED_TARGET cairo)
+find_package(pugixml REQUIRED)
+find_package(CLI11 REQUIRED)
+find_package(nlohmann_json REQUIRED)
+if(APPSYNC_TESTS)
+    find_package(GTest REQUIRED)
+endif()
+if(APPSYNC_BENCH)
+    find_package(benchmark REQUIRED)
+endif()

@@ -1,0 +1,40 @@
+# What the CMakeLists.txt of the folders are written with. Each folder globs its own sources, so a new
+# file needs no edit of any CMakeLists.txt.
+
+# Adds the calling folder's sources to the library TARGET.
+function(appsync_add_folder target)
+    file(GLOB sources CONFIGURE_DEPENDS "${CMAKE_CURRENT_SOURCE_DIR}/*.cpp" "${CMAKE_CURRENT_SOURCE_DIR}/*.h")
+    list(FILTER sources EXCLUDE REGEX "/main\\.cpp$")
+    target_sources(${target} PRIVATE "${CMAKE_CURRENT_SOURCE_DIR}/CMakeLists.txt" ${sources})
+endfunction()
+
+# Settings that every library shares: includes are written from the root of the tree.
+function(appsync_finish_library target)
+    set_target_properties(${target} PROPERTIES LINKER_LANGUAGE CXX)
+    target_include_directories(${target} PUBLIC "${CMAKE_SOURCE_DIR}")
+endfunction()
+
+# A static library TARGET of the calling folder's sources, linked with LIBRARIES.
+function(appsync_library target)
+    add_library(${target} STATIC)
+    appsync_add_folder(${target})
+    appsync_finish_library(${target})
+    target_link_libraries(${target} PUBLIC ${ARGN})
+endfunction()
+
+# The unit tests of the calling folder as one executable test_<folder>, linked with LIBRARIES.
+# A folder without a .cpp file has no executable.
+function(appsync_tests)
+    get_filename_component(folder "${CMAKE_CURRENT_SOURCE_DIR}" NAME)
+    file(GLOB sources CONFIGURE_DEPENDS "${CMAKE_CURRENT_SOURCE_DIR}/*.cpp")
+    if(NOT sources)
+        return()
+    endif()
+    set(target test_${folder})
+    add_executable(${target} ${sources})
+    target_include_directories(${target} PRIVATE "${CMAKE_SOURCE_DIR}")
+    target_link_libraries(${target} PRIVATE ${ARGN} GTest::gmock GTest::gtest GTest::gtest_main Threads::Threads)
+    target_precompile_headers(${target} REUSE_FROM appsync_test_headers)
+    set_target_properties(${target} PROPERTIES RUNTIME_OUTPUT_DIRECTORY "${CMAKE_BINARY_DIR}/tests")
+    add_test(NAME ${target} COMMAND ${target})
+endfunction()

@@ -1,0 +1,1 @@
+// The home of the precompiled test headers: a target needs one source file.

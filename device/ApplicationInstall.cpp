@@ -1,0 +1,127 @@
+#include "device/ApplicationInstall.h"
+
+#include <sys/statvfs.h>
+
+#include <cerrno>
+#include <memory>
+
+#include "device/Containers.h"
+#include "device/Database.h"
+#include "device/DeviceDatabase.h"
+#include "device/DurabilityBarrier.h"
+#include "device/InstallContext.h"
+#include "device/PackageReader.h"
+#include "device/ProgressBook.h"
+#include "device/RegistryTables.h"
+#include "platform/FileURL.h"
+#include "system/PosixError.h"
+#include "system/RootDirectory.h"
+#include "system/RootedFileSystem.h"
+
+namespace appsync {
+
+namespace {
+
+Result<PackageReader> openPackage(const InstallContext& context, const std::string& identifier,
+                                  const FileURL& package) {
+    const Result<RegularFile> file =
+        context.files.root().openRegularFile(package.path(), "read the package");
+    if (!file) return file.error();
+    Result<PackageReader> reader = PackageReader::open(
+        file->descriptor.get(), displayPath(package.path()), context.propertyLists);
+    if (!reader) return reader;
+    if (Status status = reader->expectIdentifier(identifier); !status) return status.error();
+    return reader;
+}
+
+Status checkSpace(int directory, const std::string& identifier, const PackageInfo& info) {
+    struct statvfs space = {};
+    if (::fstatvfs(directory, &space) != 0) return {};  // the writes will tell
+    const std::uint64_t free = std::uint64_t{space.f_bavail} * space.f_frsize;
+    if (info.unpackedBytes <= free) return {};
+    return posixError(ENOSPC, "unpack", identifier,
+                      "it needs " + std::to_string(info.unpackedBytes) + " bytes and " +
+                          std::to_string(free) +
+                          " are free; remove something from the device and sync again");
+}
+
+Status unpack(const NewContainer& container, PackageReader& reader, InstallProgressRecord* record) {
+    PackageUnpackOptions options;
+    options.progress = [record](std::uint64_t done, std::uint64_t total) {
+        const double fraction =
+            total == 0 ? 1 : static_cast<double>(done) / static_cast<double>(total);
+        return ProgressBook::installing(record, fraction);
+    };
+    return reader.unpackInto(container.descriptor(), options);
+}
+
+// After a failed sync nobody knows what is on disk, so everything is written anew, once.
+Result<NewContainer> unpackDurably(const InstallContext& context, const std::string& identifier,
+                                   PackageReader& reader) {
+    const std::shared_ptr<InstallProgressRecord> record = context.progress.record(identifier);
+    for (bool again : {true, false}) {
+        Result<NewContainer> container = context.containers.make();
+        if (!container) return container;
+        Status status = checkSpace(container->descriptor(), identifier, reader.info());
+        if (status) status = unpack(*container, reader, record.get());
+        if (!status) return status.error();
+        status = context.barrier.pass();
+        if (status) return container;
+        if (!again) return status.error();
+    }
+    return posixError(EIO, "unpack", identifier);
+}
+
+BundleRow rowOf(const PackageInfo& info, const NewContainer& container, std::uint64_t installType) {
+    BundleRow row;
+    row.identifier = info.identifier;
+    if (!info.version.empty()) row.version = info.version;
+    row.name = info.displayName;
+    row.installType = installType;
+    row.container = container.name();
+    row.bundle = info.bundleDirectoryName;
+    row.iconFile = info.iconFile;
+    row.bytes = info.unpackedBytes;
+    return row;
+}
+
+Status commitInstall(const InstallContext& context, const PackageInfo& info,
+                     NewContainer& container, std::uint64_t installType) {
+    const BundleRow row = rowOf(info, container, installType);
+    FreedContainers freed;
+    const Status committed = context.database.change(Durability::OnDisk, [&](Database& database) {
+        return recordInstalled(database, row, freed);
+    });
+    if (!committed) return asRegistryStatus(committed);
+    container.keep();
+    context.progress.forget(info.identifier, kInstallStateFinished);
+    context.containers.remove(freed.application);
+    context.containers.remove(freed.placeholder);
+    return {};
+}
+
+Status install(const InstallContext& context, const std::string& identifier, const FileURL& package,
+               std::uint64_t installType) {
+    Result<PackageReader> reader = openPackage(context, identifier, package);
+    if (!reader) return reader.error();
+    Result<NewContainer> container = unpackDurably(context, identifier, *reader);
+    if (!container) return container.error();
+    return commitInstall(context, reader->info(), *container, installType);
+}
+
+}  // namespace
+
+Status installApplication(const InstallContext& context, const std::string& identifier,
+                          const FileURL& package, std::uint64_t installType) {
+    Status status = install(context, identifier, package, installType);
+    if (status) return status;
+    rememberFailure(context, identifier, status.error());
+    if (const auto record = context.progress.record(identifier)) {
+        if (record->installState() != kInstallStateCanceled) {
+            record->setInstallState(kInstallStateFailed);
+        }
+    }
+    return status;
+}
+
+}  // namespace appsync

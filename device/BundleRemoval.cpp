@@ -1,0 +1,145 @@
+#include "device/BundleRemoval.h"
+
+#include "device/Containers.h"
+#include "device/Database.h"
+#include "device/DeviceDatabase.h"
+#include "device/DeviceError.h"
+#include "device/DevicePaths.h"
+#include "device/InstallContext.h"
+#include "device/ProgressBook.h"
+#include "device/RegistryTables.h"
+#include "device/WallClock.h"
+#include "system/RootedFileSystem.h"
+
+namespace appsync {
+
+namespace {
+
+/// What a removal found, and what it leaves to be done once it is committed.
+struct Outcome {
+    std::optional<BundleRow> application;
+    std::optional<BundleRow> placeholder;
+    bool removedApplication = false;
+    bool removedPlaceholder = false;
+    FreedContainers freed;
+
+    [[nodiscard]] bool nothingRemains() const {
+        return (removedApplication || !application) && (removedPlaceholder || !placeholder);
+    }
+    [[nodiscard]] bool dataGoes() const {
+        if (!nothingRemains()) return false;
+        return removedApplication || placeholder->installType != kInstallTypeSync;
+    }
+};
+
+Status find(Database& database, const std::string& identifier, Outcome& outcome) {
+    auto application = findBundle(database, BundleTable::Applications, identifier);
+    if (!application) return application.error();
+    outcome.application = std::move(*application);
+    auto placeholder = findBundle(database, BundleTable::Placeholders, identifier);
+    if (!placeholder) return placeholder.error();
+    outcome.placeholder = std::move(*placeholder);
+    return {};
+}
+
+// Decides what goes. An error when that is nothing.
+Status decide(const std::string& identifier, Removal removal, Outcome& outcome) {
+    outcome.removedPlaceholder = outcome.placeholder.has_value();
+    const bool applicationToo =
+        removal == Removal::Everything ||
+        (removal == Removal::PlaceholderFirst && !outcome.removedPlaceholder);
+    outcome.removedApplication = applicationToo && outcome.application.has_value();
+    if (outcome.removedApplication && outcome.application->type == kApplicationTypeSystem) {
+        return registryError(RegistryErrorCode::SystemApplication,
+                             identifier + " is a system application and cannot be removed");
+    }
+    if (outcome.removedApplication || outcome.removedPlaceholder) return {};
+    const char* what =
+        removal == Removal::PlaceholderOnly ? " has no placeholder to remove" : " is not installed";
+    return registryError(RegistryErrorCode::NothingInstalled, identifier + what);
+}
+
+Status runFor(Database& database, const char* sql, const std::string& identifier) {
+    return database.query(sql).bind(identifier).run();
+}
+
+Status noteUninstalled(Database& database, const std::string& identifier, const Outcome& outcome) {
+    const std::optional<BundleRow>& row =
+        outcome.application ? outcome.application : outcome.placeholder;
+    return database
+        .query("INSERT OR REPLACE INTO uninstalled (identifier, version, time) VALUES (?, ?, ?)")
+        .bind(identifier, row->version, milliseconds(wallNow()))
+        .run();
+}
+
+Status forget(Database& database, const std::string& identifier, Outcome& outcome) {
+    Status status;
+    if (outcome.removedPlaceholder) {
+        status = forgetBundle(database, BundleTable::Placeholders, identifier,
+                              outcome.freed.placeholder);
+    }
+    if (status && outcome.removedApplication) {
+        status = forgetBundle(database, BundleTable::Applications, identifier,
+                              outcome.freed.application);
+    }
+    if (!status || !outcome.nothingRemains()) return status;
+    status = runFor(database, "DELETE FROM denials WHERE identifier = ?", identifier);
+    if (!status) return status;
+    return runFor(database, "DELETE FROM restore_data WHERE identifier = ?", identifier);
+}
+
+Status removeRows(Database& database, const std::string& identifier, Removal removal,
+                  Outcome& outcome) {
+    outcome = {};
+    Status status = find(database, identifier, outcome);
+    if (status) status = decide(identifier, removal, outcome);
+    if (status) status = forget(database, identifier, outcome);
+    if (!status || removal != Removal::Everything) return status;
+    status = runFor(database, "DELETE FROM failures WHERE identifier = ?", identifier);
+    return status ? noteUninstalled(database, identifier, outcome) : status;
+}
+
+}  // namespace
+
+Status removeBundles(const InstallContext& context, const std::string& identifier,
+                     Removal removal) {
+    Outcome outcome;
+    const Status committed = context.database.change(Durability::OnDisk, [&](Database& database) {
+        return removeRows(database, identifier, removal, outcome);
+    });
+    if (!committed) return asRegistryStatus(committed);
+    if (outcome.removedPlaceholder) {
+        context.progress.forget(identifier, kInstallStateCanceled);
+        context.containers.remove(outcome.freed.placeholder);
+    }
+    if (outcome.removedApplication) context.containers.remove(outcome.freed.application);
+    if (outcome.dataGoes()) context.files.removeItem(dataDirectoryOf(identifier)).ignore();
+    return {};
+}
+
+Result<std::vector<std::string>> removeSyncPlaceholders(const InstallContext& context) {
+    std::vector<std::string> identifiers;
+    std::vector<std::string> containers;
+    const Status committed = context.database.change(Durability::OnDisk, [&](Database& database) {
+        Query rows = database.query(
+            "DELETE FROM placeholders WHERE install_type = ? RETURNING identifier, container");
+        rows.bind(static_cast<std::uint64_t>(kInstallTypeSync));
+        while (rows.next()) {
+            identifiers.push_back(rows.text(0));
+            containers.push_back(rows.text(1));
+        }
+        return rows.status();
+    });
+    if (!committed) return committed.error();
+    for (const std::string& identifier : identifiers) {
+        context.progress.forget(identifier, kInstallStateCanceled);
+    }
+    for (const std::string& container : containers) context.containers.remove(container);
+    return identifiers;
+}
+
+std::string dataDirectoryOf(const std::string& identifier) {
+    return std::string(kDataDirectory) + "/" + identifier;
+}
+
+}  // namespace appsync

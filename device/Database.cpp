@@ -1,0 +1,178 @@
+#include "device/Database.h"
+
+#include <sqlite3.h>
+
+#include "device/DeviceError.h"
+
+namespace appsync {
+
+namespace {
+
+constexpr int kBusyTimeoutMilliseconds = 10'000;
+
+// The one place where SQLite's result codes become errors.
+ErrorRecord databaseError(int resultCode, const std::string& reason, const std::string& path) {
+    switch (resultCode & 0xff) {
+        case SQLITE_CORRUPT:
+        case SQLITE_NOTADB:
+            return deviceError(DeviceErrorCode::Damaged,
+                               "the device's database " + path + " is damaged (" + reason +
+                                   "); put a copy of the device in its place, or create a new "
+                                   "device and sync it");
+        case SQLITE_BUSY:
+        case SQLITE_LOCKED:
+            return deviceError(DeviceErrorCode::InUse,
+                               "the device's database " + path +
+                                   " has been held by another process for ten seconds; try again "
+                                   "when that one is done");
+        case SQLITE_FULL:
+            return deviceError(DeviceErrorCode::CannotUse,
+                               "the device's database " + path +
+                                   " cannot grow: the disk is full; free some space and try again");
+        default:
+            return deviceError(DeviceErrorCode::CannotUse, "the device's database " + path +
+                                                               " cannot be used: " + reason +
+                                                               "; check the disk and who may "
+                                                               "write there");
+    }
+}
+
+}  // namespace
+
+// Query
+
+Query::Query(Database& database, sqlite3_stmt* statement, Status status)
+    : database_(database), statement_(statement), status_(std::move(status)) {}
+
+Query::Query(Query&& other) noexcept
+    : database_(other.database_),
+      statement_(std::exchange(other.statement_, nullptr)),
+      status_(std::move(other.status_)),
+      bound_(other.bound_) {}
+
+Query::~Query() {
+    if (statement_ == nullptr) return;
+    sqlite3_reset(statement_);
+    sqlite3_clear_bindings(statement_);
+}
+
+void Query::check(int resultCode) {
+    if (resultCode != SQLITE_OK && status_) status_ = database_.error(resultCode);
+}
+
+void Query::bindNext(std::int64_t value) {
+    if (status_) check(sqlite3_bind_int64(statement_, ++bound_, value));
+}
+
+void Query::bindNext(std::string_view value) {
+    if (!status_) return;
+    // A null pointer would bind the null value.
+    const char* bytes = value.data() == nullptr ? "" : value.data();
+    check(sqlite3_bind_text64(statement_, ++bound_, bytes, value.size(), SQLITE_TRANSIENT,
+                              SQLITE_UTF8));
+}
+
+void Query::bindNext(ByteView value) {
+    if (!status_) return;
+    const void* bytes = value.empty() ? static_cast<const void*>("") : value.data();
+    check(sqlite3_bind_blob64(statement_, ++bound_, bytes, value.size(), SQLITE_TRANSIENT));
+}
+
+void Query::bindNext(std::nullopt_t) {
+    if (status_) check(sqlite3_bind_null(statement_, ++bound_));
+}
+
+bool Query::next() {
+    if (!status_) return false;
+    const int resultCode = sqlite3_step(statement_);
+    if (resultCode == SQLITE_ROW) return true;
+    if (resultCode != SQLITE_DONE) status_ = database_.error(resultCode);
+    return false;
+}
+
+Status Query::run() {
+    while (next()) continue;
+    return status_;
+}
+
+std::int64_t Query::integer(int column) const { return sqlite3_column_int64(statement_, column); }
+
+std::uint64_t Query::unsignedInteger(int column) const {
+    return static_cast<std::uint64_t>(integer(column));
+}
+
+std::string Query::text(int column) const { return optionalText(column).value_or(std::string()); }
+
+std::optional<std::string> Query::optionalText(int column) const {
+    const unsigned char* text = sqlite3_column_text(statement_, column);
+    if (text == nullptr) return std::nullopt;
+    const auto size = static_cast<std::size_t>(sqlite3_column_bytes(statement_, column));
+    return std::string(reinterpret_cast<const char*>(text), size);
+}
+
+Bytes Query::blob(int column) const {
+    const auto* bytes = static_cast<const std::uint8_t*>(sqlite3_column_blob(statement_, column));
+    if (bytes == nullptr) return {};
+    return {bytes, bytes + sqlite3_column_bytes(statement_, column)};
+}
+
+// Database
+
+Result<std::unique_ptr<Database>> Database::open(const std::string& path, Mode mode) {
+    sqlite3* handle = nullptr;
+    const int creation = mode == Mode::Create ? SQLITE_OPEN_CREATE : 0;
+    const int flags = SQLITE_OPEN_READWRITE | SQLITE_OPEN_NOMUTEX | SQLITE_OPEN_EXRESCODE;
+    const int resultCode = sqlite3_open_v2(path.c_str(), &handle, flags | creation, nullptr);
+    std::unique_ptr<Database> database(new Database(handle, path));
+    if (resultCode != SQLITE_OK) return database->error(resultCode);
+    sqlite3_busy_timeout(handle, kBusyTimeoutMilliseconds);
+    sqlite3_db_config(handle, SQLITE_DBCONFIG_DEFENSIVE, 1, nullptr);
+    if (Status status = database->execute("PRAGMA foreign_keys = ON; PRAGMA trusted_schema = OFF;");
+        !status) {
+        return status.error();
+    }
+    return database;
+}
+
+Database::Database(sqlite3* handle, std::string path) : handle_(handle), path_(std::move(path)) {}
+
+Database::~Database() {
+    for (const auto& [sql, statement] : statements_) sqlite3_finalize(statement);
+    sqlite3_close(handle_);
+}
+
+Query Database::query(const char* sql) {
+    sqlite3_stmt*& statement = statements_[sql];
+    if (statement != nullptr) return {*this, statement, {}};
+    const int resultCode =
+        sqlite3_prepare_v3(handle_, sql, -1, SQLITE_PREPARE_PERSISTENT, &statement, nullptr);
+    if (resultCode == SQLITE_OK) return {*this, statement, {}};
+    statements_.erase(sql);
+    return {*this, nullptr, error(resultCode)};
+}
+
+Status Database::execute(const char* sql) {
+    const int resultCode = sqlite3_exec(handle_, sql, nullptr, nullptr, nullptr);
+    if (resultCode == SQLITE_OK) return {};
+    return error(resultCode);
+}
+
+Result<std::int64_t> Database::integer(const char* sql) {
+    Query rows = query(sql);
+    const std::int64_t value = rows.next() ? rows.integer(0) : 0;
+    if (Status status = rows.status(); !status) return status.error();
+    return value;
+}
+
+bool Database::inTransaction() const { return sqlite3_get_autocommit(handle_) == 0; }
+
+std::size_t Database::changedRows() const {
+    return static_cast<std::size_t>(sqlite3_changes64(handle_));
+}
+
+ErrorRecord Database::error(int resultCode) const {
+    const char* reason = handle_ == nullptr ? sqlite3_errstr(resultCode) : sqlite3_errmsg(handle_);
+    return databaseError(resultCode, reason, path_);
+}
+
+}  // namespace appsync

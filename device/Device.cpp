@@ -1,0 +1,243 @@
+#include "device/Device.h"
+
+#include <sys/statvfs.h>
+
+#include <algorithm>
+#include <cerrno>
+#include <filesystem>
+#include <fstream>
+#include <map>
+
+#include "device/BundleRemoval.h"
+#include "device/CairoIconRenderer.h"
+#include "device/Containers.h"
+#include "device/Database.h"
+#include "device/DeviceCreation.h"
+#include "device/DeviceDatabase.h"
+#include "device/DeviceError.h"
+#include "device/DeviceHomeScreen.h"
+#include "device/DeviceOpening.h"
+#include "device/DevicePaths.h"
+#include "device/DeviceQueries.h"
+#include "device/DeviceRegistry.h"
+#include "device/DeviceServices.h"
+#include "device/DurabilityBarrier.h"
+#include "device/InstallContext.h"
+#include "device/PlaceholderInstall.h"
+#include "device/ProgressBook.h"
+#include "device/Reconciliation.h"
+#include "device/SessionLock.h"
+#include "system/PosixError.h"
+#include "system/PropertyListCodec.h"
+#include "system/RootedFileSystem.h"
+#include "system/SystemNotifications.h"
+#include "system/SystemWorkQueues.h"
+
+namespace appsync {
+
+namespace {
+
+std::string readBoot() {
+    std::ifstream file("/proc/sys/kernel/random/boot_id");
+    std::string boot;
+    std::getline(file, boot);
+    return boot;
+}
+
+}  // namespace
+
+double InstallProgress::fraction() const noexcept {
+    const double loaded =
+        totalUnits <= 0 ? 0 : static_cast<double>(completedUnits) / static_cast<double>(totalUnits);
+    const bool loading = phase == kInstallPhaseLoading;
+    return (loading ? std::clamp(loaded, 0.0, 1.0) : 1.0) / 2 + std::clamp(unpacked, 0.0, 1.0) / 2;
+}
+
+/// Everything that an open device consists of. Members are destroyed from the last to the first:
+/// whatever runs tasks goes before the services that those use.
+struct Device::State {
+    State(OpenedDevice opened, const DeviceOpenOptions& openOptions)
+        : options(openOptions),
+          path(std::move(opened.path)),
+          lock(std::move(opened.lock)),
+          files(std::move(opened.files)),
+          database(std::move(opened.database)),
+          barrier(files->root().descriptor()),
+          containers(*files),
+          progress(*database, [this] { registry.touch(); }),
+          registry(context),
+          policy(*database),
+          coordination(policy),
+          installer(*database),
+          backup(*database),
+          history(*database),
+          homeScreen(*database, propertyLists, options.retryInterval),
+          icons(files->root(), propertyLists) {}
+
+    const DeviceOpenOptions options;
+    const std::string path;
+    const std::string boot = readBoot();
+    const std::optional<SessionLock> lock;
+    std::vector<std::string> repairs;
+    SystemPropertyLists propertyLists;
+    const std::unique_ptr<RootedFileSystem> files;
+    const std::unique_ptr<DeviceDatabase> database;
+    DurabilityBarrier barrier;
+    Containers containers;
+    ProgressBook progress;
+    const InstallContext context{*database, *files,        containers, barrier,
+                                 progress,  propertyLists, boot};
+    DeviceRegistry registry;
+    DevicePolicy policy;
+    DeviceCoordination coordination;
+    DeviceInstaller installer;
+    DeviceBackup backup;
+    DeviceHistory history;
+    DeviceHomeScreen homeScreen;
+    CairoIconRenderer icons;
+    SystemNotifications notifications;
+    SystemNotificationCenter notificationCenter;
+    SystemWorkQueues queues;
+};
+
+Status Device::create(const std::string& path, const DeviceCreateOptions& options) {
+    return createDevice(path, options.coordination);
+}
+
+Result<std::unique_ptr<Device>> Device::open(const std::string& path,
+                                             const DeviceOpenOptions& options) {
+    const bool session = options.access == DeviceAccess::Session;
+    Result<OpenedDevice> opened = openDevice(path, session);
+    if (!opened) return opened.error();
+    auto state = std::make_unique<State>(std::move(*opened), options);
+    if (session) {
+        Result<std::vector<std::string>> repairs = reconcileDevice(state->context);
+        if (!repairs) return cannotUseDevice(path, repairs.error());
+        state->repairs = std::move(*repairs);
+        if (Status begun = beginSession(state->context); !begun) return begun.error();
+    }
+    return std::unique_ptr<Device>(new Device(std::move(state)));
+}
+
+Device::Device(std::unique_ptr<State> state) : state_(std::move(state)) {}
+
+Device::~Device() {
+    state_->database->flush().ignore();
+    if (state_->lock) endSession(state_->context).ignore();
+}
+
+Platform Device::platform(SyncHost& host, LogFacility& log) {
+    return {host,
+            log,
+            state_->registry,
+            state_->installer,
+            state_->coordination,
+            state_->policy,
+            state_->backup,
+            state_->homeScreen,
+            state_->icons,
+            state_->history,
+            state_->queues,
+            *state_->files,
+            state_->propertyLists,
+            state_->notifications,
+            state_->notificationCenter};
+}
+
+AppRegistry& Device::registry() { return state_->registry; }
+FileSystem& Device::files() { return *state_->files; }
+PropertyListSerialization& Device::propertyLists() { return state_->propertyLists; }
+WorkQueues& Device::queues() { return state_->queues; }
+IconRenderer& Device::icons() { return state_->icons; }
+const RootDirectory& Device::root() { return state_->files->root(); }
+const std::string& Device::path() const noexcept { return state_->path; }
+const std::vector<std::string>& Device::repairs() const noexcept { return state_->repairs; }
+
+std::string Device::logPath() const { return state_->path + "/" + std::string(kLogName); }
+
+Result<std::uint64_t> Device::freeSpace() const {
+    struct statvfs space = {};
+    if (::fstatvfs(state_->files->root().descriptor(), &space) != 0) {
+        return posixError(errno, "ask for the free space of", state_->path);
+    }
+    return std::uint64_t{space.f_bavail} * space.f_frsize;
+}
+
+std::optional<ErrorRecord> Device::databaseFailure() const { return state_->database->failure(); }
+
+Result<std::vector<ApplicationRecord>> Device::applications() {
+    return listApplications(*state_->database);
+}
+
+std::optional<InstallProgress> Device::installProgress(const std::string& identifier) {
+    if (state_->lock) return state_->progress.progress(identifier);
+    return storedProgress(*state_->database, identifier);
+}
+
+Result<ApplicationStatus> Device::status(const std::string& identifier) {
+    Result<ApplicationStatus> status = applicationStatus(*state_->database, identifier);
+    if (!status) return status;
+    status->sessionUnderWay = SessionLock::isHeld(state_->path);
+    status->isHeld = status->isHeld && status->sessionUnderWay;
+    if (!status->sessionUnderWay) status->denial.reset();
+    return status;
+}
+
+Result<std::vector<HomeScreenItem>> Device::homeScreen() {
+    const Result<std::vector<std::string>> order = state_->homeScreen.order();
+    if (!order) return order.error();
+    const Result<std::vector<ApplicationRecord>> records = applications();
+    if (!records) return records.error();
+    return homeScreenItems(*order, *records, state_->files->root());
+}
+
+Result<std::vector<HistoryRecord>> Device::history(std::size_t limit) {
+    return state_->history.records(limit);
+}
+
+Result<DeviceSettings> Device::settings() { return state_->policy.settings(); }
+
+Status Device::change(const DeviceSettingsChange& change) { return state_->policy.change(change); }
+
+Status Device::run(const std::string& identifier) {
+    const bool stale = !SessionLock::isHeld(state_->path);
+    return state_->database->change(Durability::OnDisk, [&](Database& database) {
+        return markRunning(database, identifier, stale);
+    });
+}
+
+Status Device::quit(const std::string& identifier) {
+    return state_->database->change(
+        Durability::OnDisk, [&](Database& database) { return endRunning(database, identifier); });
+}
+
+Status Device::uninstall(const std::string& identifier) {
+    if (Status status = requireLegalIdentifier(identifier); !status) return status;
+    return removeBundles(state_->context, identifier, Removal::Everything);
+}
+
+Result<std::vector<std::string>> Device::removeLeftoverSyncPlaceholders() {
+    if (Status status = requireSession(); !status) return status.error();
+    return removeSyncPlaceholders(state_->context);
+}
+
+Status Device::demote(const std::string& identifier, DemotedBy by) {
+    if (Status status = requireSession(); !status) return status;
+    if (Status status = requireLegalIdentifier(identifier); !status) return status;
+    const std::uint64_t type =
+        by == DemotedBy::System ? kInstallTypeDowngrade : kInstallTypeIntentionalDowngrade;
+    return demoteApplication(state_->context, identifier, type);
+}
+
+Status Device::setRestoreDataExpected(const std::string& identifier, bool expected) {
+    if (Status status = requireLegalIdentifier(identifier); !status) return status;
+    return state_->backup.setRestoreDataExpected(identifier, expected);
+}
+
+Status Device::requireSession() const {
+    if (state_->lock) return {};
+    return deviceError(DeviceErrorCode::CannotUse,
+                       "the device " + state_->path + " is not open for a session");
+}
+
+}  // namespace appsync

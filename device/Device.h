@@ -1,0 +1,139 @@
+#pragma once
+
+#include <chrono>
+#include <cstdint>
+#include <memory>
+#include <optional>
+#include <string>
+#include <vector>
+
+#include "device/DeviceRecords.h"
+#include "device/HomeScreenPicture.h"
+#include "platform/Platform.h"
+#include "platform/Result.h"
+
+namespace appsync {
+
+class RootDirectory;
+
+/// What a device is opened for.
+enum class DeviceAccess {
+    /// To sync: one session at a time holds the device. What an interrupted session left is put in
+    /// order first.
+    Session,
+    /// For everything else. Works while a session is under way; takes nothing away from it.
+    Look,
+};
+
+struct DeviceCreateOptions {
+    bool coordination = false;
+};
+
+struct DeviceOpenOptions {
+    DeviceAccess access = DeviceAccess::Look;
+    /// When a denied termination is asked for again; only told to people, as the plug-in keeps the
+    /// time.
+    std::chrono::seconds retryInterval{30};
+};
+
+/// Who takes an application's bundle away while its placeholder and its data stay.
+enum class DemotedBy { Person, System };
+
+/// A whole device in one directory (docs/device-format.md): the services that the plug-in needs,
+/// and what a person or a manager can do on the device itself.
+///
+/// Callable on any thread, except that the destructor comes last: after every client that was made
+/// with its platform has gone and its queued work is done. Errors of opening and creating are of
+/// `kDeviceErrorDomain`, as are those of the other operations when the device's database fails; a
+/// request that is refused is an error of `kRegistryErrorDomain`. Each holds one sentence that says
+/// what is wrong and what to do.
+class Device {
+  public:
+    /// Makes an empty device in a new directory: all of it or, on failure, nothing. The parent
+    /// directory must exist, the path must not.
+    static Status create(const std::string& path, const DeviceCreateOptions& options = {});
+
+    [[nodiscard]] static Result<std::unique_ptr<Device>> open(
+        const std::string& path, const DeviceOpenOptions& options = {});
+
+    /// Writes what is still to be written.
+    ~Device();
+    Device(const Device&) = delete;
+    Device& operator=(const Device&) = delete;
+
+    /// Everything that a client needs. Host and log outlive the client, as does this device.
+    [[nodiscard]] Platform platform(SyncHost& host, LogFacility& log);
+
+    // Single services, for those who make no client.
+    [[nodiscard]] AppRegistry& registry();
+    [[nodiscard]] FileSystem& files();
+    [[nodiscard]] PropertyListSerialization& propertyLists();
+    [[nodiscard]] WorkQueues& queues();
+    [[nodiscard]] IconRenderer& icons();
+    /// The device's files as descriptors, for transfers in pieces.
+    [[nodiscard]] const RootDirectory& root();
+
+    /// Absolute path of the device directory on this machine.
+    [[nodiscard]] const std::string& path() const noexcept;
+    /// The system log on this machine: one JSON object a line. It may not exist yet.
+    [[nodiscard]] std::string logPath() const;
+    /// Bytes that may still be written to the file system that holds the device.
+    [[nodiscard]] Result<std::uint64_t> freeSpace() const;
+
+    /// What went wrong with the database first, if anything did: the services of the platform
+    /// cannot all say so. A session with such a failure has failed.
+    [[nodiscard]] std::optional<ErrorRecord> databaseFailure() const;
+
+    /// What the opening of a session found missing, one sentence each, for the log: applications
+    /// whose bundles somebody took away.
+    [[nodiscard]] const std::vector<std::string>& repairs() const noexcept;
+
+    // What there is.
+
+    /// Installed applications and placeholders, ordered by identifier; an application stands before
+    /// the placeholder that covers it.
+    [[nodiscard]] Result<std::vector<ApplicationRecord>> applications();
+    /// How far an install has come; nothing when none is under way. Cheap; may be polled.
+    [[nodiscard]] std::optional<InstallProgress> installProgress(const std::string& identifier);
+    [[nodiscard]] Result<ApplicationStatus> status(const std::string& identifier);
+    /// What `drawHomeScreen` draws: one item an application, in home-screen order.
+    [[nodiscard]] Result<std::vector<HomeScreenItem>> homeScreen();
+    /// The transaction log, oldest first; at most the last `limit` records.
+    [[nodiscard]] Result<std::vector<HistoryRecord>> history(std::size_t limit = 100'000);
+
+    [[nodiscard]] Result<DeviceSettings> settings();
+    /// Takes effect at once, also for a session that is under way (coordination: for the next).
+    Status change(const DeviceSettingsChange& change);
+
+    // What a person does on the device. An identifier under which there is nothing is refused.
+
+    /// The application runs until it is quit: its termination is denied. Refused while an install
+    /// holds it.
+    Status run(const std::string& identifier);
+    /// It ends. No failure when it does not run.
+    Status quit(const std::string& identifier);
+    /// Removes the application, its placeholder and its data, and puts it on the installer's list.
+    Status uninstall(const std::string& identifier);
+
+    // What the device or a host does between sessions. Only with DeviceAccess::Session.
+
+    /// Removes the placeholders of type `kInstallTypeSync` that an interrupted session left. Gives
+    /// their identifiers.
+    [[nodiscard]] Result<std::vector<std::string>> removeLeftoverSyncPlaceholders();
+    /// Takes the bundle away and leaves placeholder and data.
+    Status demote(const std::string& identifier, DemotedBy by);
+
+    /// Whether the backup service holds data to restore for the application: until the application
+    /// is installed or its restore is given up.
+    Status setRestoreDataExpected(const std::string& identifier, bool expected);
+
+  private:
+    struct State;
+    explicit Device(std::unique_ptr<State> state);
+
+    [[nodiscard]] Status requireSession() const;
+
+    std::unique_ptr<State> state_;
+};
+
+}  // namespace appsync

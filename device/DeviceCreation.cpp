@@ -1,0 +1,162 @@
+#include "device/DeviceCreation.h"
+
+#include <fcntl.h>
+#include <sys/file.h>
+#include <sys/stat.h>
+#include <unistd.h>
+
+#include <array>
+#include <cerrno>
+#include <cstdio>
+#include <filesystem>
+
+#include "device/Containers.h"
+#include "device/Database.h"
+#include "device/DeviceError.h"
+#include "device/DevicePaths.h"
+#include "device/DeviceSchema.h"
+#include "system/PosixError.h"
+#include "system/UniqueFd.h"
+
+namespace appsync {
+
+namespace {
+
+namespace fs = std::filesystem;
+
+constexpr std::array<std::string_view, 6> kDirectories = {
+    kTemporaryDirectory,  kPublicStagingDirectory, kDataDirectory,
+    kContainersDirectory, "/var/mobile/Library",   "/var/mobile/Library/Preferences"};
+
+ErrorRecord cannotCreate(const fs::path& device, const ErrorRecord& cause) {
+    return deviceError(
+        DeviceErrorCode::CannotUse,
+        "cannot create the device " + displayPath(device.string()) + ": " + cause.description());
+}
+
+ErrorRecord alreadyExists(const fs::path& device) {
+    return deviceError(DeviceErrorCode::AlreadyExists,
+                       displayPath(device.string()) +
+                           " exists already; give the path of a new directory, or remove it first");
+}
+
+/// A directory in the making: locked while it is, and removed unless it was put in its place.
+class Scaffold {
+  public:
+    explicit Scaffold(const fs::path& device)
+        : device_(device), prefix_("." + device.filename().string() + ".creating-") {}
+    Scaffold(const Scaffold&) = delete;
+    Scaffold& operator=(const Scaffold&) = delete;
+    ~Scaffold() { discard(path_); }
+
+    /// Removes what crashed creations left, and makes the directory.
+    Status make() {
+        clearStale();
+        std::string pattern = (device_.parent_path() / (prefix_ + "XXXXXX")).string();
+        if (::mkdtemp(pattern.data()) == nullptr) {
+            return posixError(errno, "create", device_.string());
+        }
+        path_ = pattern;
+        lock_ = openDirectory(path_);
+        if (!lock_ || ::flock(lock_.get(), LOCK_EX | LOCK_NB) != 0 ||
+            ::fchmod(lock_.get(), 0755) != 0) {
+            return posixError(errno, "create", device_.string());
+        }
+        return {};
+    }
+
+    /// Makes it durable, and the device.
+    Status putInPlace() {
+        if (::syncfs(lock_.get()) != 0) return posixError(errno, "sync", device_.string());
+        if (::renameat2(AT_FDCWD, path_.c_str(), AT_FDCWD, device_.c_str(), RENAME_NOREPLACE) !=
+            0) {
+            if (errno == EEXIST) return alreadyExists(device_);
+            return posixError(errno, "create", device_.string());
+        }
+        path_.clear();
+        const UniqueFd parent = openDirectory(device_.parent_path());
+        if (!parent || ::fsync(parent.get()) != 0) {
+            return posixError(errno, "sync", device_.parent_path().string());
+        }
+        return {};
+    }
+
+    [[nodiscard]] const fs::path& path() const { return path_; }
+
+  private:
+    static UniqueFd openDirectory(const fs::path& path) {
+        return UniqueFd(::open(path.c_str(), O_RDONLY | O_DIRECTORY | O_CLOEXEC | O_NOFOLLOW));
+    }
+
+    static void discard(const fs::path& path) {
+        std::error_code ignored;
+        if (!path.empty()) fs::remove_all(path, ignored);
+    }
+
+    void clearStale() const {
+        std::error_code error;
+        for (fs::directory_iterator entry(device_.parent_path(), error), end;
+             !error && entry != end; entry.increment(error)) {
+            if (!entry->path().filename().string().starts_with(prefix_)) continue;
+            const UniqueFd directory = openDirectory(entry->path());
+            const bool stale = directory && ::flock(directory.get(), LOCK_EX | LOCK_NB) == 0;
+            if (stale) discard(entry->path());
+        }
+    }
+
+    const fs::path device_;
+    const std::string prefix_;
+    fs::path path_;
+    UniqueFd lock_;
+};
+
+Status makeDirectories(const fs::path& device) {
+    for (const std::string_view directory : kDirectories) {
+        const fs::path path = device / kRootName / directory.substr(1);
+        std::error_code error;
+        fs::create_directories(path, error);
+        if (error) return posixError(error.value(), "create", path.string());
+    }
+    std::error_code error;
+    fs::create_directory(device / kLogDirectoryName, error);
+    if (error) return posixError(error.value(), "create", (device / kLogDirectoryName).string());
+    return {};
+}
+
+Status makeDatabase(const fs::path& device, bool coordination) {
+    const std::string path = (device / kDatabaseName).string();
+    const Result<std::unique_ptr<Database>> database = Database::open(path, Database::Mode::Create);
+    if (!database) return database.error();
+    if (Status status = createDeviceSchema(**database); !status) return status;
+    return (*database)
+        ->query("INSERT INTO settings (name, value) VALUES ('coordination', ?)")
+        .bind(coordination)
+        .run();
+}
+
+Status build(Scaffold& scaffold, bool coordination) {
+    Status status = scaffold.make();
+    if (status) status = makeDirectories(scaffold.path());
+    if (status) status = makeDatabase(scaffold.path(), coordination);
+    return status ? scaffold.putInPlace() : status;
+}
+
+}  // namespace
+
+Status createDevice(const std::string& path, bool coordination) {
+    std::error_code error;
+    fs::path device = fs::absolute(path, error).lexically_normal();
+    if (device.filename().empty()) device = device.parent_path();
+    if (path.empty() || path.find('\0') != path.npos || error || device.filename().empty()) {
+        return cannotCreate(path, posixError(EINVAL, "use", path, "it is no path of a directory"));
+    }
+    if (fs::symlink_status(device, error).type() != fs::file_type::not_found && !error) {
+        return alreadyExists(device);
+    }
+    Scaffold scaffold(device);
+    Status status = build(scaffold, coordination);
+    if (status || status.error().domain == kDeviceErrorDomain) return status;
+    return cannotCreate(device, status.error());
+}
+
+}  // namespace appsync

@@ -1,0 +1,181 @@
+#include "device/DeviceDatabase.h"
+
+#include <algorithm>
+#include <chrono>
+#include <iterator>
+#include <system_error>
+
+#include "device/Database.h"
+#include "device/DeviceError.h"
+#include "device/DeviceSchema.h"
+
+namespace appsync {
+
+namespace {
+
+constexpr std::chrono::milliseconds kLongestDelay{100};
+
+Result<std::unique_ptr<Database>> connect(const std::string& path) {
+    Result<std::unique_ptr<Database>> database = Database::open(path, Database::Mode::Existing);
+    if (!database) return database;
+    if (Status status = checkDeviceSchema(**database); !status) return status.error();
+    if (Status status = (*database)->execute("PRAGMA synchronous = FULL"); !status) {
+        return status.error();
+    }
+    return database;
+}
+
+}  // namespace
+
+/// A change in the queue, and what became of it.
+struct DeviceDatabase::Waiting {
+    const Change& change;
+    Durability durability;
+    Status status = {};
+    bool done = false;
+};
+
+Result<std::unique_ptr<DeviceDatabase>> DeviceDatabase::open(const std::string& path) {
+    Result<std::unique_ptr<Database>> reader = connect(path);
+    if (!reader) return reader.error();
+    Result<std::unique_ptr<Database>> writer = connect(path);
+    if (!writer) return writer.error();
+    return std::unique_ptr<DeviceDatabase>(
+        new DeviceDatabase(std::move(*reader), std::move(*writer)));
+}
+
+DeviceDatabase::DeviceDatabase(std::unique_ptr<Database> reader, std::unique_ptr<Database> writer)
+    : reader_(std::move(reader)), writer_(std::move(writer)) {}
+
+DeviceDatabase::~DeviceDatabase() {
+    {
+        const std::lock_guard lock(mutex_);
+        closing_ = true;
+        flusherWakes_.notify_all();
+    }
+    if (flusher_.joinable()) flusher_.join();
+    flush().ignore();
+}
+
+Status DeviceDatabase::read(const Reading& reading) {
+    const std::lock_guard lock(readerMutex_);
+    return noteFailure(reading(*reader_));
+}
+
+Status DeviceDatabase::change(Durability durability, const Change& change) {
+    Waiting own{change, durability};
+    std::unique_lock lock(mutex_);
+    queue_.push_back(&own);
+    turn_.wait(lock, [&] { return own.done || queue_.front() == &own; });
+    if (!own.done) lead(lock);
+    lock.unlock();
+    return noteFailure(std::move(own.status));
+}
+
+// Commits for everybody in the queue, the caller being the first of them.
+void DeviceDatabase::lead(std::unique_lock<std::mutex>& lock) {
+    const std::vector<Waiting*> batch(queue_.begin(), queue_.end());
+    const std::vector<Change> later = std::exchange(later_, {});
+    lock.unlock();
+    commitTogether(batch, later);
+    lock.lock();
+    queue_.erase(queue_.begin(), queue_.begin() + static_cast<std::ptrdiff_t>(batch.size()));
+    for (Waiting* waiting : batch) waiting->done = true;
+    turn_.notify_all();
+}
+
+void DeviceDatabase::commitTogether(const std::vector<Waiting*>& batch,
+                                    const std::vector<Change>& later) {
+    const bool onDisk = std::any_of(batch.begin(), batch.end(), [](const Waiting* waiting) {
+        return waiting->durability == Durability::OnDisk;
+    });
+    const Status begun = beginTransaction(onDisk ? Durability::OnDisk : Durability::Soon);
+    if (!begun) {
+        for (Waiting* waiting : batch) waiting->status = begun;
+        return;
+    }
+    for (const Change& change : later) noteFailure(makeChange(change)).ignore();
+    for (Waiting* waiting : batch) waiting->status = makeChange(waiting->change);
+    endTransaction(batch);
+}
+
+Status DeviceDatabase::beginTransaction(Durability durability) {
+    if (durability != writerDurability_) {
+        const bool onDisk = durability == Durability::OnDisk;
+        const char* pragma = onDisk ? "PRAGMA synchronous = FULL" : "PRAGMA synchronous = NORMAL";
+        if (Status status = writer_->execute(pragma); !status) return status;
+        writerDurability_ = durability;
+    }
+    return writer_->query("BEGIN IMMEDIATE").run();
+}
+
+Status DeviceDatabase::makeChange(const Change& change) {
+    if (Status status = writer_->query("SAVEPOINT change").run(); !status) return status;
+    Status status = change(*writer_);
+    if (!status) writer_->query("ROLLBACK TO change").run().ignore();
+    if (Status released = writer_->query("RELEASE change").run(); !released && status) {
+        return released;
+    }
+    return status;
+}
+
+void DeviceDatabase::endTransaction(const std::vector<Waiting*>& batch) {
+    // Some failures (a full disk) roll the whole transaction back on their own.
+    const Status committed = writer_->query("COMMIT").run();
+    if (committed) return;
+    if (writer_->inTransaction()) writer_->query("ROLLBACK").run().ignore();
+    const auto culprit = std::find_if(batch.begin(), batch.end(), [](const Waiting* waiting) {
+        return !waiting->status && waiting->status.error().domain == kDeviceErrorDomain;
+    });
+    const Status cause = culprit == batch.end() ? committed : (*culprit)->status;
+    for (Waiting* waiting : batch) {
+        if (waiting->status) waiting->status = cause;
+    }
+}
+
+void DeviceDatabase::changeLater(Change change) {
+    const std::lock_guard lock(mutex_);
+    later_.push_back(std::move(change));
+    if (later_.size() == 1) flusherWakes_.notify_all();
+    if (flusher_.joinable() || closing_) return;
+    try {
+        flusher_ = std::thread([this] { flushNowAndThen(); });
+    } catch (const std::system_error&) {
+        // Without a thread they go with the next change, or when the database is closed.
+        return;
+    }
+}
+
+void DeviceDatabase::flushNowAndThen() {
+    std::unique_lock lock(mutex_);
+    while (!closing_) {
+        flusherWakes_.wait(lock, [this] { return closing_ || !later_.empty(); });
+        flusherWakes_.wait_for(lock, kLongestDelay, [this] { return closing_; });
+        if (later_.empty()) continue;
+        lock.unlock();
+        flush().ignore();
+        lock.lock();
+    }
+}
+
+Status DeviceDatabase::flush() {
+    {
+        const std::lock_guard lock(mutex_);
+        if (later_.empty() && queue_.empty()) return {};
+    }
+    return change(Durability::Soon, [](Database&) { return Status(); });
+}
+
+std::optional<ErrorRecord> DeviceDatabase::failure() const {
+    const std::lock_guard lock(mutex_);
+    return failure_;
+}
+
+Status DeviceDatabase::noteFailure(Status status) {
+    if (status || status.error().domain != kDeviceErrorDomain) return status;
+    const std::lock_guard lock(mutex_);
+    if (!failure_) failure_ = status.error();
+    return status;
+}
+
+}  // namespace appsync

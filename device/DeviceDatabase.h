@@ -1,0 +1,92 @@
+#pragma once
+
+#include <condition_variable>
+#include <deque>
+#include <functional>
+#include <memory>
+#include <mutex>
+#include <optional>
+#include <string>
+#include <thread>
+#include <vector>
+
+#include "platform/Result.h"
+
+namespace appsync {
+
+class Database;
+
+/// When a change is safe from a loss of power. It survives the end of this process, and everybody
+/// sees it, in either case.
+enum class Durability {
+    OnDisk,  // when the call returns
+    Soon,    // with the next change that is OnDisk, or when the system gets to it
+};
+
+/// A device's database: one connection that reads, one that writes.
+///
+/// Writers that come at the same time share one transaction and one sync: the first of them
+/// commits for all that wait by then. Callable on any thread. The functions that are passed in may
+/// run on another thread than the caller's, but not after the call has returned; they must not call
+/// this object.
+class DeviceDatabase {
+  public:
+    using Change = std::function<Status(Database&)>;
+    using Reading = std::function<Status(Database&)>;
+
+    /// Opens the database and checks that it is one that this version can use.
+    [[nodiscard]] static Result<std::unique_ptr<DeviceDatabase>> open(const std::string& path);
+
+    /// Makes the changes that were left for later.
+    ~DeviceDatabase();
+    DeviceDatabase(const DeviceDatabase&) = delete;
+    DeviceDatabase& operator=(const DeviceDatabase&) = delete;
+
+    /// Reads what is committed.
+    Status read(const Reading& reading);
+
+    /// Makes a change, whole: when it fails, or the commit does, nothing has changed. Everybody
+    /// sees it once the call has returned.
+    Status change(Durability durability, const Change& change);
+
+    /// Leaves a change for later: it goes with the next change of anyone's, at the latest a tenth
+    /// of a second from now. It runs after those that were left before it. What fails is dropped,
+    /// and a crash may lose it. It may run after this call has returned.
+    void changeLater(Change change);
+
+    /// Makes the changes that were left for later, now.
+    Status flush();
+
+    /// The first failure of the database itself, whoever met it.
+    [[nodiscard]] std::optional<ErrorRecord> failure() const;
+
+  private:
+    struct Waiting;
+
+    DeviceDatabase(std::unique_ptr<Database> reader, std::unique_ptr<Database> writer);
+
+    void lead(std::unique_lock<std::mutex>& lock);
+    void commitTogether(const std::vector<Waiting*>& batch, const std::vector<Change>& later);
+    Status beginTransaction(Durability durability);
+    Status makeChange(const Change& change);
+    void endTransaction(const std::vector<Waiting*>& batch);
+    Status noteFailure(Status status);
+    void flushNowAndThen();
+
+    std::mutex readerMutex_;
+    const std::unique_ptr<Database> reader_;            // protected by readerMutex_
+    const std::unique_ptr<Database> writer_;            // used by whoever stands first in queue_
+    Durability writerDurability_ = Durability::OnDisk;  // likewise
+
+    mutable std::mutex mutex_;
+    // Protected by mutex_.
+    std::condition_variable turn_;
+    std::deque<Waiting*> queue_;
+    std::vector<Change> later_;
+    std::optional<ErrorRecord> failure_;
+    std::condition_variable flusherWakes_;
+    bool closing_ = false;
+    std::thread flusher_;  // started with the first change that is left for later
+};
+
+}  // namespace appsync

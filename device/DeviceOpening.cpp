@@ -1,0 +1,145 @@
+#include "device/DeviceOpening.h"
+
+#include <signal.h>
+#include <sys/stat.h>
+
+#include <cerrno>
+#include <filesystem>
+
+#include "device/Containers.h"
+#include "device/Database.h"
+#include "device/DeviceError.h"
+#include "device/DevicePaths.h"
+#include "device/DeviceSchema.h"
+#include "system/PosixError.h"
+
+namespace appsync {
+
+namespace {
+
+namespace fs = std::filesystem;
+
+enum class Found { Nothing, File, Directory, Other };
+
+Result<Found> look(const fs::path& path, bool followLink) {
+    struct stat status = {};
+    const int result = followLink ? ::stat(path.c_str(), &status) : ::lstat(path.c_str(), &status);
+    if (result != 0 && (errno == ENOENT || errno == ENOTDIR)) return Found::Nothing;
+    if (result != 0) return posixError(errno, "open", path.string());
+    if (S_ISREG(status.st_mode)) return Found::File;
+    return S_ISDIR(status.st_mode) ? Found::Directory : Found::Other;
+}
+
+std::string shown(const fs::path& path) { return displayPath(path.string()); }
+
+Status missing(const fs::path& device) {
+    return deviceError(DeviceErrorCode::Missing, "there is no device at " + shown(device) +
+                                                     "; create one there, or give its path");
+}
+
+Status notADevice(const fs::path& device, std::string_view reason) {
+    return deviceError(DeviceErrorCode::NotADevice, shown(device) +
+                                                        " is not a device: " + std::string(reason) +
+                                                        "; give the directory of a device");
+}
+
+Status halfCreated(const fs::path& device, std::string_view absent) {
+    return deviceError(DeviceErrorCode::HalfCreated,
+                       "the device " + shown(device) + " is not whole: it has no " +
+                           std::string(absent) +
+                           "; remove the directory and create the device again");
+}
+
+Status checkRoot(const fs::path& device) {
+    const std::string containers = std::string(kRootName).append(kContainersDirectory);
+    for (const std::string& directory : {std::string(kRootName), containers}) {
+        const Result<Found> found = look(device / directory, false);
+        if (!found) return found.error();
+        if (*found != Found::Directory) return halfCreated(device, directory);
+    }
+    return {};
+}
+
+Status checkDirectory(const fs::path& device) {
+    const Result<Found> found = look(device, true);
+    if (!found) return found.error();
+    if (*found == Found::Nothing) return missing(device);
+    if (*found != Found::Directory) return notADevice(device, "it is not a directory");
+    const Result<Found> database = look(device / kDatabaseName, false);
+    if (!database) return database.error();
+    if (*database == Found::Nothing) {
+        const Result<Found> root = look(device / kRootName, false);
+        if (root && *root == Found::Directory) return halfCreated(device, kDatabaseName);
+        return notADevice(device, "it holds no device.db");
+    }
+    if (*database != Found::File) return notADevice(device, "its device.db is not a file");
+    return checkRoot(device);
+}
+
+// The process that holds the device, as far as its database can tell.
+std::int64_t holderOf(const fs::path& device) {
+    const auto database =
+        Database::open((device / kDatabaseName).string(), Database::Mode::Existing);
+    if (!database) return 0;
+    const Result<std::int64_t> process = (*database)->integer("SELECT process FROM session");
+    if (!process || *process <= 0) return 0;
+    const bool lives = ::kill(static_cast<pid_t>(*process), 0) == 0 || errno == EPERM;
+    return lives ? *process : 0;
+}
+
+ErrorRecord inUse(const fs::path& device) {
+    const std::int64_t holder = holderOf(device);
+    const std::string who = holder == 0 ? "" : " (process " + std::to_string(holder) + ")";
+    return deviceError(DeviceErrorCode::InUse, "the device " + shown(device) +
+                                                   " is in use by another session" + who +
+                                                   "; try again when that one has ended");
+}
+
+Status takeLock(const fs::path& device, std::optional<SessionLock>& lock) {
+    Result<std::optional<SessionLock>> taken = SessionLock::take(device.string());
+    if (!taken) return taken.error();
+    if (!*taken) return inUse(device);
+    lock = std::move(*taken);
+    return {};
+}
+
+Status openDatabase(const fs::path& device, bool session, OpenedDevice& opened) {
+    auto database = DeviceDatabase::open((device / kDatabaseName).string());
+    if (!database) return database.error();
+    opened.database = std::move(*database);
+    if (!session) return {};
+    return opened.database->read([](Database& whole) { return checkDeviceDatabase(whole); });
+}
+
+Status openFiles(const fs::path& device, OpenedDevice& opened) {
+    RootedFileSystemOptions options;
+    options.temporaryDirectory = kTemporaryDirectory;
+    auto files = RootedFileSystem::open((device / kRootName).string(), std::move(options));
+    if (!files) return files.error();
+    opened.files = std::move(*files);
+    return {};
+}
+
+}  // namespace
+
+ErrorRecord cannotUseDevice(const std::string& path, const ErrorRecord& cause) {
+    if (cause.domain == kDeviceErrorDomain) return cause;
+    return deviceError(DeviceErrorCode::CannotUse,
+                       "cannot use the device " + displayPath(path) + ": " + cause.description());
+}
+
+Result<OpenedDevice> openDevice(const std::string& path, bool session) {
+    std::error_code error;
+    const fs::path device = fs::absolute(path, error);
+    if (path.empty() || path.find('\0') != path.npos || error) return missing(path).error();
+    OpenedDevice opened;
+    opened.path = device.string();
+    Status status = checkDirectory(device);
+    if (status && session) status = takeLock(device, opened.lock);
+    if (status) status = openDatabase(device, session, opened);
+    if (status) status = openFiles(device, opened);
+    if (!status) return cannotUseDevice(path, status.error());
+    return opened;
+}
+
+}  // namespace appsync

@@ -1,0 +1,19 @@
+#pragma once
+
+#include <string_view>
+
+namespace appsync {
+
+// Where things stand in a device directory.
+inline constexpr std::string_view kDatabaseName = "device.db";
+inline constexpr std::string_view kRootName = "root";
+inline constexpr std::string_view kLogDirectoryName = "log";
+inline constexpr std::string_view kLogName = "log/system.log";
+
+// Device paths.
+inline constexpr std::string_view kTemporaryDirectory = "/var/mobile/tmp";
+inline constexpr std::string_view kWorkAreaDirectory = "/var/mobile/Library/ApplicationSync";
+inline constexpr std::string_view kPublicStagingDirectory = "/var/mobile/Media/PublicStaging";
+inline constexpr std::string_view kDataDirectory = "/var/mobile/Containers/Data";
+
+}  // namespace appsync

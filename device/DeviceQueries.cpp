@@ -1,0 +1,182 @@
+#include "device/DeviceQueries.h"
+
+#include <algorithm>
+#include <functional>
+#include <unordered_map>
+
+#include "device/Database.h"
+#include "device/DeviceDatabase.h"
+#include "device/IconDrawing.h"
+#include "device/ProgressBook.h"
+#include "device/RegistryTables.h"
+#include "device/WallClock.h"
+#include "system/DescriptorIO.h"
+#include "system/RootDirectory.h"
+
+namespace appsync {
+
+namespace {
+
+using ProgressByIdentifier = std::unordered_map<std::string, InstallProgress>;
+
+Result<ProgressByIdentifier> allProgress(Database& database) {
+    Query rows =
+        database.query("SELECT identifier, state, phase, total, completed, unpacked FROM progress");
+    ProgressByIdentifier all;
+    while (rows.next()) all.insert_or_assign(rows.text(0), readProgress(rows, 1));
+    if (Status status = rows.status(); !status) return status.error();
+    return all;
+}
+
+Status appendRecords(Database& database, BundleTable table,
+                     std::vector<ApplicationRecord>& records) {
+    const Result<std::vector<BundleRow>> rows = allBundles(database, table);
+    if (!rows) return rows.error();
+    for (const BundleRow& row : *rows) records.push_back(recordOf(row, table));
+    return {};
+}
+
+Status addProgress(Database& database, std::vector<ApplicationRecord>& records) {
+    const Result<ProgressByIdentifier> progress = allProgress(database);
+    if (!progress) return progress.error();
+    for (ApplicationRecord& record : records) {
+        const auto found = progress->find(record.identifier);
+        if (record.isPlaceholder && found != progress->end()) record.progress = found->second;
+    }
+    return {};
+}
+
+// Calls `take` with the one row that a statement finds for the identifier, if it does.
+Status withRow(Database& database, const char* sql, const std::string& identifier,
+               const std::function<void(const Query&)>& take) {
+    Query rows = database.query(sql);
+    rows.bind(identifier);
+    if (rows.next()) take(rows);
+    return rows.status();
+}
+
+Status findRecords(Database& database, const std::string& identifier, ApplicationStatus& status) {
+    const auto application = findBundle(database, BundleTable::Applications, identifier);
+    if (!application) return application.error();
+    if (*application) status.installed = recordOf(**application, BundleTable::Applications);
+    const auto placeholder = findBundle(database, BundleTable::Placeholders, identifier);
+    if (!placeholder) return placeholder.error();
+    if (!*placeholder) return {};
+    status.placeholder = recordOf(**placeholder, BundleTable::Placeholders);
+    const auto progress = loadProgress(database, identifier);
+    if (!progress) return progress.error();
+    status.placeholder->progress = *progress;
+    return {};
+}
+
+Status findMarks(Database& database, const std::string& identifier, ApplicationStatus& status) {
+    Status found = withRow(database, "SELECT 1 FROM running WHERE identifier = ?", identifier,
+                           [&](const Query&) { status.isRunning = true; });
+    if (found) {
+        found = withRow(database, "SELECT 1 FROM assertions WHERE identifier = ?", identifier,
+                        [&](const Query&) { status.isHeld = true; });
+    }
+    if (!found) return found;
+    return withRow(database, "SELECT 1 FROM restore_data WHERE identifier = ?", identifier,
+                   [&](const Query&) { status.awaitsRestoreData = true; });
+}
+
+InstallFailure failureOf(const Query& row) {
+    return {wallTime(row.integer(0)), ErrorRecord::make(row.text(1), row.integer(2), row.text(3))};
+}
+
+Status findEvents(Database& database, const std::string& identifier, ApplicationStatus& status) {
+    Status found = withRow(
+        database, "SELECT time, next_try FROM denials WHERE identifier = ?", identifier,
+        [&](const Query& row) {
+            status.denial = TerminationDenial{wallTime(row.integer(0)), wallTime(row.integer(1))};
+        });
+    if (found) {
+        found = withRow(database,
+                        "SELECT time, domain, code, description FROM failures"
+                        " WHERE identifier = ?",
+                        identifier, [&](const Query& row) { status.lastFailure = failureOf(row); });
+    }
+    if (!found) return found;
+    return withRow(database, "SELECT time FROM uninstalled WHERE identifier = ?", identifier,
+                   [&](const Query& row) { status.uninstalled = wallTime(row.integer(0)); });
+}
+
+Bytes iconOf(const ApplicationRecord& record, const RootDirectory& root) {
+    const Result<RegularFile> file = root.openRegularFile(record.bundle + "/" + record.iconFile);
+    if (!file) return {};
+    Bytes bytes;
+    if (readWhole(file->descriptor.get(), file->size, kMaximumIconFileBytes, bytes) != 0) return {};
+    Result<Bytes> icon = renderIcon(bytes);
+    return icon ? std::move(*icon) : Bytes();
+}
+
+HomeScreenItem itemOf(const ApplicationRecord& record, const RootDirectory& root) {
+    HomeScreenItem item;
+    item.identifier = record.identifier;
+    item.name = record.name.value_or(record.identifier);
+    item.icon = iconOf(record, root);
+    item.isPlaceholder = record.isPlaceholder;
+    if (record.progress) item.progress = record.progress->fraction();
+    return item;
+}
+
+}  // namespace
+
+Result<std::vector<ApplicationRecord>> listApplications(DeviceDatabase& database) {
+    database.flush().ignore();
+    std::vector<ApplicationRecord> records;
+    const Status status = database.read([&](Database& connection) {
+        Status read = appendRecords(connection, BundleTable::Applications, records);
+        if (read) read = appendRecords(connection, BundleTable::Placeholders, records);
+        return read ? addProgress(connection, records) : read;
+    });
+    if (!status) return status.error();
+    std::stable_sort(records.begin(), records.end(),
+                     [](const ApplicationRecord& left, const ApplicationRecord& right) {
+                         return left.identifier < right.identifier;
+                     });
+    return records;
+}
+
+std::optional<InstallProgress> storedProgress(DeviceDatabase& database,
+                                              const std::string& identifier) {
+    std::optional<InstallProgress> progress;
+    database
+        .read([&](Database& connection) -> Status {
+            const auto found = loadProgress(connection, identifier);
+            if (!found) return found.error();
+            progress = *found;
+            return {};
+        })
+        .ignore();
+    return progress;
+}
+
+Result<ApplicationStatus> applicationStatus(DeviceDatabase& database,
+                                            const std::string& identifier) {
+    database.flush().ignore();
+    ApplicationStatus status;
+    const Status read = database.read([&](Database& connection) {
+        Status found = findRecords(connection, identifier, status);
+        if (found) found = findMarks(connection, identifier, status);
+        return found ? findEvents(connection, identifier, status) : found;
+    });
+    if (!read) return read.error();
+    return status;
+}
+
+std::vector<HomeScreenItem> homeScreenItems(std::span<const std::string> order,
+                                            std::span<const ApplicationRecord> records,
+                                            const RootDirectory& root) {
+    std::unordered_map<std::string_view, const ApplicationRecord*> byIdentifier;
+    for (const ApplicationRecord& record : records) byIdentifier[record.identifier] = &record;
+    std::vector<HomeScreenItem> items;
+    for (const std::string& identifier : order) {
+        const auto found = byIdentifier.find(identifier);
+        if (found != byIdentifier.end()) items.push_back(itemOf(*found->second, root));
+    }
+    return items;
+}
+
+}  // namespace appsync

@@ -1,0 +1,35 @@
+#pragma once
+
+#include <optional>
+#include <span>
+#include <string>
+#include <vector>
+
+#include "device/DeviceRecords.h"
+#include "device/HomeScreenPicture.h"
+#include "platform/Result.h"
+
+namespace appsync {
+
+class DeviceDatabase;
+class RootDirectory;
+
+/// See Device::applications.
+[[nodiscard]] Result<std::vector<ApplicationRecord>> listApplications(DeviceDatabase& database);
+
+/// How far an install has come, as the database knows it; nothing when none is under way.
+[[nodiscard]] std::optional<InstallProgress> storedProgress(DeviceDatabase& database,
+                                                            const std::string& identifier);
+
+/// What the database knows of an identifier. Whether a session is under way is for the caller to
+/// fill in, and what that means for the rest.
+[[nodiscard]] Result<ApplicationStatus> applicationStatus(DeviceDatabase& database,
+                                                          const std::string& identifier);
+
+/// The items of the home screen: of `order` those that `records` hold. A placeholder stands before
+/// the application that it covers. Icons that cannot be read are left out.
+[[nodiscard]] std::vector<HomeScreenItem> homeScreenItems(
+    std::span<const std::string> order, std::span<const ApplicationRecord> records,
+    const RootDirectory& root);
+
+}  // namespace appsync

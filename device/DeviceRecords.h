@@ -1,0 +1,105 @@
+#pragma once
+
+#include <chrono>
+#include <cstdint>
+#include <optional>
+#include <string>
+
+#include "platform/DevicePolicyService.h"
+#include "platform/Error.h"
+
+namespace appsync {
+
+/// A point in time as people know it; kept with a resolution of a millisecond.
+using WallTime = std::chrono::system_clock::time_point;
+
+/// How far the install of one application has come.
+struct InstallProgress {
+    std::uint64_t state = 0;  // an InstallState
+    std::uint64_t phase = 0;  // an InstallPhase
+    /// Of the transfer, in the units of whoever reports it.
+    std::int64_t totalUnits = 0;
+    std::int64_t completedUnits = 0;
+    /// Of the unpacking: from 0 to 1.
+    double unpacked = 0;
+
+    /// Of both together, from 0 to 1: the first half is the transfer.
+    [[nodiscard]] double fraction() const noexcept;
+};
+
+/// One installed application, or one placeholder. An update under way has a record of each.
+struct ApplicationRecord {
+    std::string identifier;
+    std::optional<std::string> version;
+    std::optional<std::string> name;
+    bool isPlaceholder = false;
+    std::string type;               // "User" or "System"
+    std::uint64_t installType = 0;  // an InstallType
+    std::string container;          // device path of the directory that holds the bundle
+    std::string bundle;             // device path of the bundle
+    std::string iconFile;           // name of a file that the bundle may hold
+    std::uint64_t bytes = 0;
+    /// Of a placeholder whose install is under way.
+    std::optional<InstallProgress> progress;
+};
+
+/// What a person or a manager has set.
+struct DeviceSettings {
+    PolicyAnswer installation = PolicyAnswer::Unset;
+    PolicyAnswer removal = PolicyAnswer::Unset;
+    bool coordination = false;
+};
+
+/// What to set; what is absent stays as it is.
+struct DeviceSettingsChange {
+    std::optional<PolicyAnswer> installation = std::nullopt;
+    std::optional<PolicyAnswer> removal = std::nullopt;
+    std::optional<bool> coordination = std::nullopt;
+};
+
+/// One record of the transaction log.
+struct HistoryRecord {
+    enum class Kind { Step, Scenario };
+
+    WallTime time;
+    Kind kind = Kind::Step;
+    std::string scenario;     // scenarios only
+    std::uint64_t step = 0;   // the step's kind; the step of a scenario
+    std::uint64_t party = 0;  // steps only
+    std::uint64_t phase = 0;  // steps only: 1 start, 2 end
+    bool success = false;
+    std::string identifier;
+    std::string description;
+};
+
+/// That the termination of a running application was denied.
+struct TerminationDenial {
+    WallTime when;
+    WallTime nextTry;
+};
+
+/// The last failure of an install. A later success takes it away.
+struct InstallFailure {
+    WallTime when;
+    ErrorRecord error;
+};
+
+/// What is known of one identifier, for whoever wants to know what it waits for.
+struct ApplicationStatus {
+    std::optional<ApplicationRecord> installed;
+    std::optional<ApplicationRecord> placeholder;
+    bool isRunning = false;
+    /// An install of it is at work and keeps it from running.
+    bool isHeld = false;
+    /// A session holds the device at this moment.
+    bool sessionUnderWay = false;
+    /// Present while an install waits for the application to end.
+    std::optional<TerminationDenial> denial;
+    std::optional<InstallFailure> lastFailure;
+    /// Data to restore is yet to come.
+    bool awaitsRestoreData = false;
+    /// When a person removed it from the device, if the host has not taken note of that yet.
+    std::optional<WallTime> uninstalled;
+};
+
+}  // namespace appsync

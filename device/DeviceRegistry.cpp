@@ -1,0 +1,225 @@
+#include "device/DeviceRegistry.h"
+
+#include <vector>
+
+#include "device/ApplicationInstall.h"
+#include "device/BundleRemoval.h"
+#include "device/Database.h"
+#include "device/DeviceDatabase.h"
+#include "device/DeviceError.h"
+#include "device/PackageError.h"
+#include "device/PackageIdentifier.h"
+#include "device/PlaceholderInstall.h"
+#include "device/ProgressBook.h"
+#include "device/RegistryTables.h"
+#include "platform/FileURL.h"
+
+namespace appsync {
+
+namespace {
+
+std::vector<AppProxy> proxiesOf(const std::vector<BundleRow>& rows, BundleTable table) {
+    std::vector<AppProxy> proxies;
+    proxies.reserve(rows.size());
+    for (const BundleRow& row : rows) proxies.push_back(proxyOf(row, table));
+    return proxies;
+}
+
+Result<std::vector<BundleRow>> rowsOf(Database& database, BundleTable table,
+                                      AppRegistry::BundleType type) {
+    switch (type) {
+        case AppRegistry::kEveryBundle:
+            return allBundles(database, table);
+        case AppRegistry::kUserBundles:
+            return bundlesOfType(database, table, kApplicationTypeUser);
+        case AppRegistry::kSystemBundles:
+            return bundlesOfType(database, table, kApplicationTypeSystem);
+    }
+    return std::vector<BundleRow>();
+}
+
+Status appendProxies(Database& database, BundleTable table, AppRegistry::BundleType type,
+                     std::vector<AppProxy>& proxies) {
+    const Result<std::vector<BundleRow>> rows = rowsOf(database, table, type);
+    if (!rows) return rows.error();
+    for (AppProxy& proxy : proxiesOf(*rows, table)) proxies.push_back(std::move(proxy));
+    return {};
+}
+
+Status find(Database& database, BundleTable table, const std::string& identifier,
+            std::optional<AppProxy>& proxy) {
+    const Result<std::optional<BundleRow>> row = findBundle(database, table, identifier);
+    if (!row) return row.error();
+    if (*row) proxy = proxyOf(**row, table);
+    return {};
+}
+
+Status optionsRefused(std::string_view what) {
+    return registryError(RegistryErrorCode::IllegalOptions,
+                         "the options of the install are refused: " + std::string(what));
+}
+
+// The identifier that the options name, when they are for that type of package.
+Result<std::string> identifierOf(const PropertyList& options, std::string_view packageType) {
+    const std::string* type = options.findString(PackageTypeKey);
+    if (type == nullptr || *type != packageType) {
+        return optionsRefused("the package type is not " + std::string(packageType)).error();
+    }
+    const std::string* identifier = options.findString(BundleIdentifierKey);
+    if (identifier == nullptr) return optionsRefused("they name no identifier").error();
+    if (Status status = requireLegalIdentifier(*identifier); !status) return status.error();
+    return *identifier;
+}
+
+Result<std::optional<Bytes>> dataOf(const PropertyList& options, std::string_view key) {
+    const PropertyList* value = options.find(key);
+    if (value == nullptr || value->isNull()) return std::optional<Bytes>();
+    if (const Bytes* data = value->asData()) return std::optional<Bytes>(*data);
+    return optionsRefused(std::string(key) + " is not data").error();
+}
+
+std::uint64_t installTypeOf(const PropertyList& options) {
+    const PropertyList* value = options.find(InstallTypeKey);
+    return value == nullptr ? std::uint64_t{kInstallTypeNone}
+                            : value->asUnsigned().value_or(kInstallTypeNone);
+}
+
+Result<std::vector<std::string>> placeholdersByArrival(Database& database) {
+    Query rows = database.query(
+        "SELECT identifier FROM placeholders JOIN progress USING (identifier) ORDER BY arrived");
+    std::vector<std::string> identifiers;
+    while (rows.next()) identifiers.push_back(rows.text(0));
+    if (Status status = rows.status(); !status) return status.error();
+    return identifiers;
+}
+
+Status placeholdersUnderWay(Database& database, std::vector<AppProxy>& proxies) {
+    const Result<std::vector<std::string>> identifiers = placeholdersByArrival(database);
+    if (!identifiers) return identifiers.error();
+    for (const std::string& identifier : *identifiers) {
+        std::optional<AppProxy> proxy;
+        const Status status = find(database, BundleTable::Placeholders, identifier, proxy);
+        if (!status) return status;
+        if (proxy) proxies.push_back(*std::move(proxy));
+    }
+    return {};
+}
+
+}  // namespace
+
+Status requireLegalIdentifier(const std::string& identifier) {
+    if (isLegalIdentifier(identifier)) return {};
+    return registryError(RegistryErrorCode::IllegalIdentifier,
+                         quotedName(identifier) +
+                             " is not the identifier of an application: 1 to 255 letters, digits, "
+                             "'.', '-' and '_'");
+}
+
+DeviceRegistry::DeviceRegistry(const InstallContext& context)
+    : context_(context), observers_([this] { return installsUnderWay(); }) {}
+
+std::optional<AppProxy> DeviceRegistry::proxyForIdentifier(const std::string& identifier,
+                                                           Placeholders placeholders) {
+    std::optional<AppProxy> proxy;
+    context_.database
+        .read([&](Database& database) -> Status {
+            proxy.reset();
+            if (placeholders == Placeholders::Included) {
+                Status status = find(database, BundleTable::Placeholders, identifier, proxy);
+                if (!status || proxy) return status;
+            }
+            return find(database, BundleTable::Applications, identifier, proxy);
+        })
+        .ignore();
+    return proxy;
+}
+
+bool DeviceRegistry::isApplicationInstalled(const std::string& identifier) {
+    return proxyForIdentifier(identifier, Placeholders::Included).has_value();
+}
+
+void DeviceRegistry::enumerateBundles(BundleType type, const ProxyCallback& callback) {
+    std::vector<AppProxy> proxies;
+    context_.database
+        .read([&](Database& database) -> Status {
+            Status status = appendProxies(database, BundleTable::Applications, type, proxies);
+            if (!status) return status;
+            return appendProxies(database, BundleTable::Placeholders, type, proxies);
+        })
+        .ignore();
+    bool stop = false;
+    for (const AppProxy& proxy : proxies) {
+        callback(proxy, stop);
+        if (stop) return;
+    }
+}
+
+std::shared_ptr<InstallProgressRecord> DeviceRegistry::installProgress(const AppProxy& proxy,
+                                                                       std::uint64_t /*phase*/) {
+    return context_.progress.record(proxy.applicationIdentifier);
+}
+
+void DeviceRegistry::finishInstallPhase(InstallProgressRecord& record) {
+    context_.progress.finishPhase(record);
+}
+
+Status DeviceRegistry::installPackage(const FileURL& package, const PropertyList& options) {
+    const Result<std::string> identifier = identifierOf(options, PackageTypeCustomer);
+    if (!identifier) return identifier.error();
+    return installApplication(context_, *identifier, package, installTypeOf(options));
+}
+
+Status DeviceRegistry::installPlaceholderBundle(const FileURL& directory,
+                                                const PropertyList& options) {
+    const Result<std::string> identifier = identifierOf(options, PackageTypePlaceholder);
+    if (!identifier) return identifier.error();
+    Result<std::optional<Bytes>> metadata = dataOf(options, StoreMetadataKey);
+    if (!metadata) return metadata.error();
+    Result<std::optional<Bytes>> sinf = dataOf(options, AppSinfKey);
+    if (!sinf) return sinf.error();
+    PlaceholderSource source;
+    source.identifier = *identifier;
+    source.bundle = directory.path();
+    source.installType = installTypeOf(options);
+    source.storeMetadata = std::move(*metadata);
+    source.sinf = std::move(*sinf);
+    return installPlaceholder(context_, source);
+}
+
+Status DeviceRegistry::uninstallApplication(const std::string& identifier,
+                                            const PropertyList& options) {
+    if (Status status = requireLegalIdentifier(identifier); !status) return status;
+    const PropertyList* only = options.find(UninstallPlaceholderOnlyKey);
+    const bool placeholderOnly = only != nullptr && only->booleanConversion().value_or(false);
+    return removeBundles(context_, identifier,
+                         placeholderOnly ? Removal::PlaceholderOnly : Removal::PlaceholderFirst);
+}
+
+void DeviceRegistry::addObserver(std::weak_ptr<AppRegistryObserver> observer) {
+    observers_.add(std::move(observer));
+}
+
+void DeviceRegistry::removeObserver(const AppRegistryObserver* observer) {
+    observers_.remove(observer);
+}
+
+InstallsUnderWay DeviceRegistry::installsUnderWay() {
+    std::vector<AppProxy> placeholders;
+    context_.database
+        .read([&](Database& database) { return placeholdersUnderWay(database, placeholders); })
+        .ignore();
+    InstallsUnderWay lists;
+    for (AppProxy& proxy : placeholders) {
+        const auto record = context_.progress.record(proxy.applicationIdentifier);
+        if (record == nullptr) continue;
+        const std::uint64_t state = record->installState();
+        if (state == kInstallStatePaused) {
+            lists.paused.push_back(std::move(proxy));
+        } else if (state == kInstallStateWaiting || state == kInstallStateActive) {
+            lists.prioritized.push_back(std::move(proxy));
+        }
+    }
+    return lists;
+}
+
+}  // namespace appsync

@@ -1,0 +1,50 @@
+#pragma once
+
+#include <memory>
+#include <optional>
+#include <string>
+
+#include "device/InstallContext.h"
+#include "device/RegistryObservers.h"
+#include "platform/AppRegistry.h"
+
+namespace appsync {
+
+/// The registry of a device: what is installed is what its database says, and the containers on
+/// disk hold it. A failure of the database reads as "nothing there"; `Device::databaseFailure`
+/// tells of it.
+class DeviceRegistry final : public AppRegistry {
+  public:
+    explicit DeviceRegistry(const InstallContext& context);
+
+    [[nodiscard]] std::optional<AppProxy> proxyForIdentifier(const std::string& identifier,
+                                                             Placeholders placeholders) override;
+    [[nodiscard]] bool isApplicationInstalled(const std::string& identifier) override;
+    void enumerateBundles(BundleType type, const ProxyCallback& callback) override;
+
+    [[nodiscard]] std::shared_ptr<InstallProgressRecord> installProgress(
+        const AppProxy& proxy, std::uint64_t phase) override;
+    void finishInstallPhase(InstallProgressRecord& record) override;
+
+    Status installPackage(const FileURL& package, const PropertyList& options) override;
+    Status installPlaceholderBundle(const FileURL& directory, const PropertyList& options) override;
+    Status uninstallApplication(const std::string& identifier,
+                                const PropertyList& options) override;
+
+    void addObserver(std::weak_ptr<AppRegistryObserver> observer) override;
+    void removeObserver(const AppRegistryObserver* observer) override;
+
+    /// The installs under way may have changed.
+    void touch() { observers_.touch(); }
+
+  private:
+    [[nodiscard]] InstallsUnderWay installsUnderWay();
+
+    const InstallContext context_;
+    RegistryObservers observers_;
+};
+
+/// A registry error unless the identifier is a legal one.
+Status requireLegalIdentifier(const std::string& identifier);
+
+}  // namespace appsync

@@ -1,0 +1,24 @@
+#pragma once
+
+#include "platform/Result.h"
+
+namespace appsync {
+
+class Database;
+
+/// Marks a file as a device's database ("Apps" in SQLite's application_id).
+inline constexpr int kDeviceApplicationId = 0x41707073;
+
+/// The schema that this version reads and writes; docs/device-format.md describes it.
+inline constexpr int kDeviceSchemaVersion = 1;
+
+/// Makes the tables of an empty database, and marks it as a device's.
+Status createDeviceSchema(Database& database);
+
+/// Refuses a database that is no device's, that is not whole, or that a newer version made.
+Status checkDeviceSchema(Database& database);
+
+/// Reads the whole database and refuses it when it is damaged.
+Status checkDeviceDatabase(Database& database);
+
+}  // namespace appsync

@@ -1,0 +1,69 @@
+#pragma once
+
+#include <cstddef>
+#include <cstdint>
+#include <functional>
+#include <memory>
+#include <span>
+#include <string>
+#include <string_view>
+#include <vector>
+
+#include "device/PackageEntries.h"
+#include "device/PackageLimits.h"
+#include "platform/Bytes.h"
+#include "platform/Result.h"
+
+struct zip;
+
+namespace appsync {
+
+class PackageFile;
+
+/// A package as an archive: its entries, checked and arranged as a tree, and their contents. The
+/// one place that knows libzip's reader. One thread at a time. Errors do not name the package;
+/// `name` does.
+class PackageArchive {
+  public:
+    /// Opens and checks everything but what the bundle says of itself.
+    [[nodiscard]] static Result<std::unique_ptr<PackageArchive>> open(PackageFile file,
+                                                                      const PackageLimits& limits);
+    ~PackageArchive();
+    PackageArchive(const PackageArchive&) = delete;
+    PackageArchive& operator=(const PackageArchive&) = delete;
+
+    [[nodiscard]] const std::string& name() const noexcept;
+    [[nodiscard]] std::uint64_t packedBytes() const noexcept;
+    [[nodiscard]] std::uint64_t unpackedBytes() const noexcept;
+    /// In tree order.
+    [[nodiscard]] const std::vector<PackageEntry>& entries() const noexcept { return entries_; }
+    /// Null when there is none.
+    [[nodiscard]] const PackageEntry* find(std::string_view entryName) const noexcept;
+
+    /// Gives the contents piece by piece, through `buffer`, to `sink`; stops at the first error.
+    /// Succeeds only when the sizes and the CRC were right. Nothing is true of the pieces before
+    /// that.
+    [[nodiscard]] Status stream(const PackageEntry& entry, std::span<std::uint8_t> buffer,
+                                const std::function<Status(ByteView piece)>& sink);
+
+    /// The contents of a file that is at most `maximumBytes` long.
+    [[nodiscard]] Result<Bytes> read(const PackageEntry& entry, std::uint64_t maximumBytes);
+
+    /// The error with what it is about before it: the package.
+    [[nodiscard]] ErrorRecord named(const ErrorRecord& error) const;
+
+  private:
+    class Source;
+    explicit PackageArchive(std::unique_ptr<Source> source);
+
+    [[nodiscard]] Status openArchive();
+    [[nodiscard]] Status listEntries(const PackageLimits& limits);
+    [[nodiscard]] Result<PackageEntry> entryAt(std::uint64_t index, const PackageLimits& limits);
+
+    // The archive reads from the source, and is closed before it goes.
+    std::unique_ptr<Source> source_;
+    zip* archive_ = nullptr;
+    std::vector<PackageEntry> entries_;
+};
+
+}  // namespace appsync

@@ -1,0 +1,54 @@
+#include "device/PackageFile.h"
+
+#include <fcntl.h>
+#include <sys/stat.h>
+#include <unistd.h>
+
+#include <cerrno>
+#include <utility>
+
+#include "device/PackageError.h"
+#include "system/PosixError.h"
+
+namespace appsync {
+
+PackageFile::PackageFile(UniqueFd descriptor, std::uint64_t size, std::string_view name)
+    : descriptor_(std::move(descriptor)), size_(size), name_(name) {}
+
+Result<PackageFile> PackageFile::open(const std::string& path) {
+    UniqueFd descriptor(::open(path.c_str(), O_RDONLY | O_NONBLOCK | O_NOCTTY | O_CLOEXEC));
+    if (!descriptor) return posixError(errno, "open", path);
+    return take(std::move(descriptor), path);
+}
+
+Result<PackageFile> PackageFile::duplicate(int fileDescriptor, std::string_view name) {
+    UniqueFd descriptor(::fcntl(fileDescriptor, F_DUPFD_CLOEXEC, 0));
+    if (!descriptor) return posixError(errno, "open", name);
+    return take(std::move(descriptor), name);
+}
+
+Result<PackageFile> PackageFile::take(UniqueFd descriptor, std::string_view name) {
+    struct stat status = {};
+    if (::fstat(descriptor.get(), &status) != 0) return posixError(errno, "examine", name);
+    if (!S_ISREG(status.st_mode)) {
+        return packageError(PackageErrorCode::NotARegularFile,
+                            "package " + quotedName(name) +
+                                ": it is not a regular file; name the .zip file itself");
+    }
+    return PackageFile(std::move(descriptor), static_cast<std::uint64_t>(status.st_size), name);
+}
+
+Result<std::size_t> PackageFile::readAt(std::uint64_t offset, std::span<std::uint8_t> bytes) const {
+    std::size_t done = 0;
+    while (done < bytes.size()) {
+        const ssize_t count = ::pread(descriptor_.get(), bytes.data() + done, bytes.size() - done,
+                                      static_cast<off_t>(offset + done));
+        if (count < 0 && errno == EINTR) continue;
+        if (count < 0) return posixError(errno, "read", name_);
+        if (count == 0) break;
+        done += static_cast<std::size_t>(count);
+    }
+    return done;
+}
+
+}  // namespace appsync

@@ -1,0 +1,42 @@
+#pragma once
+
+#include <cstddef>
+#include <cstdint>
+#include <span>
+#include <string>
+#include <string_view>
+
+#include "platform/Result.h"
+#include "system/UniqueFd.h"
+
+namespace appsync {
+
+/// The regular file that a package is, opened for reading. Reading does not move the offset of the
+/// descriptor, so that any number of readers may share it.
+class PackageFile {
+  public:
+    /// Opens a path of this machine. `NotARegularFile` for anything else, without waiting on a
+    /// pipe.
+    [[nodiscard]] static Result<PackageFile> open(const std::string& path);
+
+    /// Duplicates a descriptor. `name` is what errors call the file.
+    [[nodiscard]] static Result<PackageFile> duplicate(int fileDescriptor, std::string_view name);
+
+    [[nodiscard]] const std::string& name() const noexcept { return name_; }
+    /// The size when it was opened.
+    [[nodiscard]] std::uint64_t size() const noexcept { return size_; }
+
+    /// Reads at an offset; fewer bytes than asked for only at the end of the file.
+    [[nodiscard]] Result<std::size_t> readAt(std::uint64_t offset,
+                                             std::span<std::uint8_t> bytes) const;
+
+  private:
+    PackageFile(UniqueFd descriptor, std::uint64_t size, std::string_view name);
+    [[nodiscard]] static Result<PackageFile> take(UniqueFd descriptor, std::string_view name);
+
+    UniqueFd descriptor_;
+    std::uint64_t size_;
+    std::string name_;
+};
+
+}  // namespace appsync

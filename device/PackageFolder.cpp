@@ -1,0 +1,102 @@
+#include "device/PackageFolder.h"
+
+#include <sys/stat.h>
+
+#include <algorithm>
+#include <cerrno>
+#include <filesystem>
+#include <system_error>
+#include <utility>
+
+#include "device/PackageEntries.h"
+#include "system/PosixError.h"
+
+namespace appsync {
+
+namespace {
+
+namespace fs = std::filesystem;
+
+std::uint32_t packedMode(mode_t mode) noexcept {
+    if (S_ISDIR(mode)) return S_IFDIR | 0755U;
+    return S_IFREG | ((mode & S_IXUSR) != 0 ? 0755U : 0644U);
+}
+
+/// Collects what a folder holds, as the package is to hold it.
+class FolderListing {
+  public:
+    explicit FolderListing(const PackageLimits& limits) : limits_(limits) {}
+
+    Status addContents(const fs::path& folder, const std::string& prefix) {
+        std::error_code error;
+        fs::directory_iterator place(folder, error);
+        for (; !error && place != fs::directory_iterator(); place.increment(error)) {
+            const std::string name = place->path().filename().native();
+            if (Status status = add(place->path(), prefix + name); !status) return status;
+        }
+        if (error) return posixError(error.value(), "read", folder.native());
+        return {};
+    }
+
+    Status add(const fs::path& path, std::string entryName) {
+        struct stat status = {};
+        if (::lstat(path.c_str(), &status) != 0) return posixError(errno, "examine", path.native());
+        const bool isDirectory = S_ISDIR(status.st_mode);
+        if (isDirectory) entryName += '/';
+        const auto size = isDirectory ? 0 : static_cast<std::uint64_t>(status.st_size);
+        Result<PackageEntry> entry =
+            checkedEntry({.name = entryName, .mode = status.st_mode, .size = size}, limits_);
+        if (!entry) return refusal(entry.error(), path);
+        if (entries_.size() >= limits_.entries) return tooMany(path);
+        entries_.push_back(*std::move(entry));
+        items_.push_back({path.native(), entryName, packedMode(status.st_mode), size});
+        return isDirectory ? addContents(path, entryName) : Status();
+    }
+
+    Result<std::vector<PackageItem>> finish(const fs::path& folder) {
+        Status status = arrangeAsTree(entries_);
+        if (!status) return refusal(status.error(), folder);
+        const Result<std::string> bundle = bundleDirectoryOf(entries_);
+        if (!bundle) return refusal(bundle.error(), folder);
+        std::sort(items_.begin(), items_.end(), [](const PackageItem& a, const PackageItem& b) {
+            return precedesInTree(a.entryName, b.entryName);
+        });
+        return std::move(items_);
+    }
+
+  private:
+    static ErrorRecord refusal(const ErrorRecord& error, const fs::path& path) {
+        return cannotPack(static_cast<PackageErrorCode>(error.code), path.native(),
+                          error.description());
+    }
+
+    [[nodiscard]] ErrorRecord tooMany(const fs::path& path) const {
+        return cannotPack(PackageErrorCode::TooManyEntries, path.native(),
+                          "a package holds at most " + std::to_string(limits_.entries) +
+                              " files and directories");
+    }
+
+    const PackageLimits& limits_;
+    std::vector<PackageEntry> entries_;
+    std::vector<PackageItem> items_;
+};
+
+}  // namespace
+
+Result<std::vector<PackageItem>> listPackageFolder(const std::string& folder,
+                                                   const PackageLimits& limits) {
+    std::error_code error;
+    const fs::path path = fs::canonical(folder, error);
+    if (error) return posixError(error.value(), "open", folder);
+    FolderListing listing(limits);
+    Status status = path.extension() == ".app" ? listing.add(path, path.filename().native())
+                                               : listing.addContents(path, "");
+    if (!status) return status.error();
+    return listing.finish(path);
+}
+
+ErrorRecord cannotPack(PackageErrorCode code, std::string_view path, std::string_view reason) {
+    return packageError(code, "cannot pack " + quotedName(path) + ": " + std::string(reason));
+}
+
+}  // namespace appsync

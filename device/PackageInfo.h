@@ -1,0 +1,18 @@
+#pragma once
+
+#include <string_view>
+
+#include "device/PackageLimits.h"
+#include "device/PackageReader.h"
+#include "platform/PropertyList.h"
+#include "platform/Result.h"
+
+namespace appsync {
+
+/// What an Info.plist says, its values checked: the texts and `info` of the result; the rest is
+/// left to the reader. Errors do not name the package.
+[[nodiscard]] Result<PackageInfo> packageInfoFrom(PropertyList info,
+                                                  std::string_view bundleDirectoryName,
+                                                  const PackageLimits& limits);
+
+}  // namespace appsync

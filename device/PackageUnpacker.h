@@ -1,0 +1,54 @@
+#pragma once
+
+#include <cstdint>
+#include <string>
+#include <string_view>
+#include <vector>
+
+#include "device/PackageEntries.h"
+#include "device/PackageReader.h"
+#include "platform/Bytes.h"
+#include "platform/Result.h"
+#include "system/UniqueFd.h"
+
+namespace appsync {
+
+class PackageArchive;
+
+/// One unpacking of an archive into a directory; see PackageReader::unpackInto. Entries come in
+/// tree order, so that the directories on the way to an entry are open already, mostly, and every
+/// name is looked up in its own directory. Errors do not name the package.
+class PackageUnpacker {
+  public:
+    PackageUnpacker(PackageArchive& archive, int directoryDescriptor,
+                    const PackageUnpackOptions& options);
+
+    [[nodiscard]] Status run();
+
+  private:
+    [[nodiscard]] Status unpack(const PackageEntry& entry);
+    [[nodiscard]] Status unpackFile(const PackageEntry& entry);
+    [[nodiscard]] Status writePiece(const PackageEntry& entry, int fileDescriptor, ByteView piece);
+    [[nodiscard]] Status finishFile(const PackageEntry& entry, UniqueFd file);
+    /// Makes the directory and those it lies in, unless they are open; `mode` is for the last one.
+    [[nodiscard]] Status enter(std::string_view directory, std::uint32_t mode);
+    /// Closes directories until the innermost one is, or holds, that directory.
+    void leaveUntil(std::string_view directory);
+    [[nodiscard]] Status makeDirectory(std::string_view directory, std::uint32_t mode);
+    [[nodiscard]] int innermost() const noexcept;
+    [[nodiscard]] Status reportProgress() const;
+    [[nodiscard]] ErrorRecord failed(int errorNumber, std::string_view action,
+                                     std::string_view name) const;
+
+    PackageArchive& archive_;
+    const int top_;
+    const PackageUnpackOptions& options_;
+    const std::uint64_t total_;
+    std::uint64_t done_ = 0;
+    Bytes buffer_;
+    /// The directories from the top to the innermost open one, whose whole name `path_` is.
+    std::vector<UniqueFd> open_;
+    std::string path_;
+};
+
+}  // namespace appsync

@@ -1,0 +1,286 @@
+#include "device/PlaceholderInstall.h"
+
+#include <fcntl.h>
+#include <sys/stat.h>
+
+#include <cerrno>
+
+#include "device/Containers.h"
+#include "device/Database.h"
+#include "device/DeviceDatabase.h"
+#include "device/DeviceError.h"
+#include "device/DurabilityBarrier.h"
+#include "device/IconDrawing.h"
+#include "device/InstallContext.h"
+#include "device/PackageError.h"
+#include "device/ProgressBook.h"
+#include "device/RegistryTables.h"
+#include "platform/AppRegistry.h"
+#include "platform/PropertyListSerialization.h"
+#include "system/DescriptorIO.h"
+#include "system/PosixError.h"
+#include "system/RootDirectory.h"
+#include "system/RootedFileSystem.h"
+
+namespace appsync {
+
+namespace {
+
+constexpr std::uint64_t kLargestInfo = std::uint64_t{1} << 20U;
+constexpr std::string_view kInfoName = "Info.plist";
+constexpr std::string_view kMetadataName = "VessikMetadata.plist";
+constexpr std::string_view kDefaultIconName = "Icon.png";
+
+/// A placeholder bundle as it was read.
+struct Bundle {
+    std::string directoryName;
+    std::optional<std::string> version;
+    std::optional<std::string> name;
+    std::string iconName;
+    Bytes info;
+    Bytes icon;  // empty when there is none that can be used
+};
+
+Status refused(const std::string& identifier, std::string_view reason) {
+    return registryError(
+        RegistryErrorCode::PlaceholderRefused,
+        "the placeholder of " + identifier + " is refused: " + std::string(reason));
+}
+
+Result<Bytes> readLimited(const InstallContext& context, const std::string& path,
+                          std::uint64_t limit) {
+    const Result<RegularFile> file = context.files.root().openRegularFile(path);
+    if (!file) return file.error();
+    Bytes contents;
+    const int error = readWhole(file->descriptor.get(), file->size, limit, contents);
+    if (error != 0) return posixError(error, "read", path);
+    return contents;
+}
+
+std::string lastComponent(std::string_view path) {
+    while (path.size() > 1 && path.ends_with('/')) path.remove_suffix(1);
+    return std::string(path.substr(path.rfind('/') + 1));
+}
+
+bool isPlainName(std::string_view name) {
+    return !name.empty() && name.size() <= 255 && name != "." && name != ".." &&
+           name != kInfoName && name.find_first_of(std::string_view("/\0", 2)) == name.npos;
+}
+
+std::optional<std::string> textAt(const PropertyList& info, std::string_view key) {
+    const std::string* text = info.findString(key);
+    if (text == nullptr || text->empty()) return std::nullopt;
+    return *text;
+}
+
+Status readInfo(const InstallContext& context, const PlaceholderSource& source, Bundle& bundle) {
+    const std::string path = source.bundle + "/" + std::string(kInfoName);
+    Result<Bytes> bytes = readLimited(context, path, kLargestInfo);
+    if (!bytes) return refused(source.identifier, bytes.error().description());
+    const Result<PropertyList> info = context.propertyLists.parse(*bytes);
+    if (!info) return refused(source.identifier, info.error().withContext(path).description());
+    const std::string* identifier = info->findString(BundleIdentifierKey);
+    if (identifier == nullptr || *identifier != source.identifier) {
+        const std::string found = identifier == nullptr ? "none" : quotedName(*identifier);
+        return refused(source.identifier, "the identifier in its Info.plist is " + found);
+    }
+    bundle.version = textAt(*info, BundleVersionKey);
+    bundle.name = textAt(*info, BundleDisplayNameKey);
+    bundle.iconName = textAt(*info, BundleIconFileKey).value_or(std::string(kDefaultIconName));
+    if (!isPlainName(bundle.iconName)) bundle.iconName = kDefaultIconName;
+    bundle.info = std::move(*bytes);
+    return {};
+}
+
+// A placeholder without its icon is still one.
+Result<Bundle> readBundle(const InstallContext& context, const PlaceholderSource& source) {
+    Bundle bundle;
+    if (Status status = readInfo(context, source, bundle); !status) return status.error();
+    bundle.directoryName = lastComponent(source.bundle);
+    if (!isPlainName(bundle.directoryName)) {
+        return refused(source.identifier, "its directory has no name").error();
+    }
+    Result<Bytes> icon =
+        readLimited(context, source.bundle + "/" + bundle.iconName, kMaximumIconFileBytes);
+    if (icon) bundle.icon = std::move(*icon);
+    return bundle;
+}
+
+Status writeNewFile(int directory, std::string_view name, ByteView contents) {
+    const std::string path(name);
+    const int flags = O_WRONLY | O_CREAT | O_EXCL | O_CLOEXEC | O_NOFOLLOW;
+    const UniqueFd file(::openat(directory, path.c_str(), flags, 0644));
+    if (!file) return posixError(errno, "create", path);
+    const WriteOutcome outcome = writeWhole(file.get(), contents);
+    if (outcome.error != 0) return posixError(outcome.error, "write", path);
+    return {};
+}
+
+Status writeBundle(int container, const Bundle& bundle) {
+    const char* name = bundle.directoryName.c_str();
+    if (::mkdirat(container, name, 0755) != 0) return posixError(errno, "create", name);
+    const UniqueFd directory(::openat(container, name, O_RDONLY | O_DIRECTORY | O_CLOEXEC));
+    if (!directory) return posixError(errno, "open", name);
+    if (Status status = writeNewFile(directory.get(), kInfoName, bundle.info); !status) {
+        return status;
+    }
+    if (bundle.icon.empty()) return {};
+    return writeNewFile(directory.get(), bundle.iconName, bundle.icon);
+}
+
+Result<NewContainer> writeContainer(const InstallContext& context, const Bundle& bundle,
+                                    const PlaceholderSource& source) {
+    Result<NewContainer> container = context.containers.make();
+    if (!container) return container;
+    Status status = writeBundle(container->descriptor(), bundle);
+    if (status && source.storeMetadata) {
+        status = writeNewFile(container->descriptor(), kMetadataName, *source.storeMetadata);
+    }
+    if (!status) return status.error();
+    return container;
+}
+
+BundleRow rowOf(const Bundle& bundle, const PlaceholderSource& source,
+                const NewContainer& container) {
+    BundleRow row;
+    row.identifier = source.identifier;
+    row.version = bundle.version;
+    row.name = bundle.name;
+    row.installType = source.installType;
+    row.container = container.name();
+    row.bundle = bundle.directoryName;
+    row.iconFile = bundle.iconName;
+    row.bytes = bundle.info.size() + bundle.icon.size();
+    if (source.storeMetadata) row.bytes += source.storeMetadata->size();
+    return row;
+}
+
+bool isDemoted(std::uint64_t installType) {
+    return installType == kInstallTypeDowngrade || installType == kInstallTypeIntentionalDowngrade;
+}
+
+Status beginProgress(Database& database, const BundleRow& row) {
+    Query remove = database.query("DELETE FROM progress WHERE identifier = ?");
+    if (Status status = remove.bind(row.identifier).run(); !status) return status;
+    if (isDemoted(row.installType)) return {};
+    return database
+        .query(
+            "INSERT INTO progress (identifier, state, phase, total, completed)"
+            " VALUES (?, ?, ?, ?, 0)")
+        .bind(row.identifier, static_cast<std::uint64_t>(kInstallStateWaiting),
+              static_cast<std::uint64_t>(kInstallPhaseLoading), kProgressUnits)
+        .run();
+}
+
+// Whether a loss of power may take the placeholder with it.
+bool mayBeLost(const InstallContext& context, const PlaceholderSource& source) {
+    if (source.installType != kInstallTypeSync || context.boot.empty()) return false;
+    bool isNew = false;
+    const Status status = context.database.read([&](Database& database) -> Status {
+        const auto row = findBundle(database, BundleTable::Placeholders, source.identifier);
+        if (!row) return row.error();
+        isNew = !row->has_value();
+        return {};
+    });
+    return status && isNew;
+}
+
+Status commitPlaceholder(const InstallContext& context, const BundleRow& row,
+                         const PlaceholderExtras& extras, NewContainer& container) {
+    FreedContainers freed;
+    context.progress.forget(row.identifier);
+    const Durability durability = extras.unsyncedBoot ? Durability::Soon : Durability::OnDisk;
+    const Status committed = context.database.change(durability, [&](Database& database) {
+        const Status status = recordPlaceholder(database, row, extras, freed);
+        return status ? beginProgress(database, row) : status;
+    });
+    if (!committed) return asRegistryStatus(committed);
+    container.keep();
+    context.progress.forget(row.identifier);
+    context.containers.remove(freed.placeholder);
+    return {};
+}
+
+Status install(const InstallContext& context, const PlaceholderSource& source) {
+    const Result<Bundle> bundle = readBundle(context, source);
+    if (!bundle) return bundle.error();
+    Result<NewContainer> container = writeContainer(context, *bundle, source);
+    if (!container) return container.error();
+    PlaceholderExtras extras{source.sinf, std::nullopt};
+    if (mayBeLost(context, source)) {
+        extras.unsyncedBoot = context.boot;
+    } else if (Status status = context.barrier.pass(); !status) {
+        return status;
+    }
+    return commitPlaceholder(context, rowOf(*bundle, source, *container), extras, *container);
+}
+
+Result<BundleRow> findDemotable(const InstallContext& context, const std::string& identifier) {
+    std::optional<BundleRow> application;
+    bool covered = false;
+    const Status status = context.database.read([&](Database& database) -> Status {
+        const auto placeholder = findBundle(database, BundleTable::Placeholders, identifier);
+        if (!placeholder) return placeholder.error();
+        covered = placeholder->has_value();
+        auto row = findBundle(database, BundleTable::Applications, identifier);
+        if (!row) return row.error();
+        application = std::move(*row);
+        return {};
+    });
+    if (!status) return asRegistryStatus(status).error();
+    if (!application) {
+        return registryError(RegistryErrorCode::NothingInstalled,
+                             identifier + " is not installed, so it cannot be demoted");
+    }
+    if (!covered) return *std::move(application);
+    return registryError(RegistryErrorCode::UpdateUnderWay,
+                         "an update of " + identifier +
+                             " is under way; let a sync finish it, or uninstall its placeholder, "
+                             "and demote it then");
+}
+
+PlaceholderSource sourceOf(const InstallContext& context, const BundleRow& application,
+                           std::uint64_t installType) {
+    const AppProxy proxy = proxyOf(application, BundleTable::Applications);
+    PlaceholderSource source;
+    source.identifier = application.identifier;
+    source.bundle = proxy.bundlePath;
+    source.installType = installType;
+    const std::string metadata = proxy.bundleContainerPath + "/" + std::string(kMetadataName);
+    Result<Bytes> bytes = readLimited(context, metadata, kLargestInfo);
+    if (bytes) source.storeMetadata = std::move(*bytes);
+    return source;
+}
+
+}  // namespace
+
+Status installPlaceholder(const InstallContext& context, const PlaceholderSource& source) {
+    Status status = install(context, source);
+    if (!status) rememberFailure(context, source.identifier, status.error());
+    return status;
+}
+
+Status demoteApplication(const InstallContext& context, const std::string& identifier,
+                         std::uint64_t installType) {
+    const Result<BundleRow> application = findDemotable(context, identifier);
+    if (!application) return application.error();
+    const PlaceholderSource source = sourceOf(context, *application, installType);
+    const Result<Bundle> bundle = readBundle(context, source);
+    if (!bundle) return bundle.error();
+    Result<NewContainer> container = writeContainer(context, *bundle, source);
+    if (!container) return container.error();
+    if (Status status = context.barrier.pass(); !status) return status;
+    const BundleRow row = rowOf(*bundle, source, *container);
+    FreedContainers freed;
+    const Status committed = context.database.change(Durability::OnDisk, [&](Database& database) {
+        const Status status = recordPlaceholder(database, row, {}, freed);
+        if (!status) return status;
+        return forgetBundle(database, BundleTable::Applications, identifier, freed.application);
+    });
+    if (!committed) return asRegistryStatus(committed);
+    container->keep();
+    context.containers.remove(freed.application);
+    return {};
+}
+
+}  // namespace appsync

@@ -1,0 +1,244 @@
+#include "device/Reconciliation.h"
+
+#include <unistd.h>
+
+#include <algorithm>
+#include <unordered_set>
+
+#include "device/Containers.h"
+#include "device/Database.h"
+#include "device/DeviceDatabase.h"
+#include "device/DevicePaths.h"
+#include "device/DurabilityBarrier.h"
+#include "device/InstallContext.h"
+#include "device/PackageIdentifier.h"
+#include "device/RegistryTables.h"
+#include "device/WallClock.h"
+#include "platform/InstallProgressRecord.h"
+#include "system/RootDirectory.h"
+#include "system/RootedFileSystem.h"
+
+namespace appsync {
+
+namespace {
+
+constexpr std::int64_t kKeptHistory = 100'000;
+constexpr std::string_view kPackageSuffix = ".zip";
+
+/// An identifier and the container of its record.
+struct Holding {
+    std::string identifier;
+    std::string container;
+};
+
+Result<std::vector<Holding>> holdingsOf(Database& database, BundleTable table) {
+    Query rows = database.query(table == BundleTable::Applications
+                                    ? "SELECT identifier, container FROM applications"
+                                    : "SELECT identifier, container FROM placeholders");
+    std::vector<Holding> holdings;
+    while (rows.next()) holdings.push_back({rows.text(0), rows.text(1)});
+    if (Status status = rows.status(); !status) return status.error();
+    return holdings;
+}
+
+// The files of a placeholder that another boot did not sync may be anything.
+Status forgetUnsynced(Database& database, const std::string& boot) {
+    return database.query("DELETE FROM placeholders WHERE unsynced_boot <> ?").bind(boot).run();
+}
+
+// Nothing is at work on an install when a session begins.
+Status resetProgress(Database& database) {
+    Status status =
+        database.query("UPDATE progress SET state = ? WHERE state = ?")
+            .bind(std::uint64_t{kInstallStateWaiting}, std::uint64_t{kInstallStateActive})
+            .run();
+    if (!status) return status;
+    return database.query("UPDATE progress SET phase = ?, unpacked = 0 WHERE phase = ?")
+        .bind(std::uint64_t{kInstallPhaseLoading}, std::uint64_t{kInstallPhaseInstalling})
+        .run();
+}
+
+Status forgetAssertions(Database& database) {
+    if (Status status = database.query("DELETE FROM assertions").run(); !status) return status;
+    return database.query("DELETE FROM denials").run();
+}
+
+Status trimHistory(Database& database) {
+    return database
+        .query("DELETE FROM history WHERE id <= (SELECT coalesce(max(id), 0) FROM history) - ?")
+        .bind(kKeptHistory)
+        .run();
+}
+
+Status tidyTables(Database& database, const std::string& boot) {
+    Status status = forgetUnsynced(database, boot);
+    if (status) status = resetProgress(database);
+    if (status) status = forgetAssertions(database);
+    if (status) status = trimHistory(database);
+    return status;
+}
+
+Status noteLost(Database& database, const std::string& identifier) {
+    return database
+        .query(
+            "INSERT INTO history (time, kind, scenario, step, party, phase, success,"
+            " identifier, description)"
+            " VALUES (?, 1, 'Device start', 0, 0, 0, 0, ?, 'Bundle missing on disk')")
+        .bind(milliseconds(wallNow()), identifier)
+        .run();
+}
+
+/// What database and disk hold, and what of it fits together.
+class Comparison {
+  public:
+    explicit Comparison(const InstallContext& context) : context_(context) {}
+
+    Status run() {
+        if (Status status = gather(); !status) return status;
+        if (Status status = forgetLostRecords(); !status) return status;
+        for (const std::string& name : onDisk_) {
+            if (!recorded_.contains(name)) context_.containers.remove(name);
+        }
+        return {};
+    }
+
+    [[nodiscard]] std::vector<std::string> takeNotes() { return std::move(notes_); }
+
+  private:
+    Status gather() {
+        Result<std::vector<std::string>> names = context_.containers.names();
+        if (!names) return names.error();
+        onDisk_.insert(names->begin(), names->end());
+        return context_.database.read([this](Database& database) -> Status {
+            Status status = compare(database, BundleTable::Applications, lostApplications_);
+            if (!status) return status;
+            return compare(database, BundleTable::Placeholders, lostPlaceholders_);
+        });
+    }
+
+    Status compare(Database& database, BundleTable table, std::vector<std::string>& lost) {
+        const Result<std::vector<Holding>> holdings = holdingsOf(database, table);
+        if (!holdings) return holdings.error();
+        for (const Holding& holding : *holdings) {
+            recorded_.insert(holding.container);
+            if (!onDisk_.contains(holding.container)) lost.push_back(holding.identifier);
+        }
+        return {};
+    }
+
+    Status forgetLostRecords() {
+        if (lostApplications_.empty() && lostPlaceholders_.empty()) return {};
+        for (const std::string& identifier : lostApplications_) {
+            notes_.push_back("the bundle of " + identifier +
+                             " is missing on disk, so the application is no longer installed; "
+                             "sync it again");
+        }
+        return context_.database.change(Durability::OnDisk,
+                                        [this](Database& database) { return forgetIn(database); });
+    }
+
+    Status forgetIn(Database& database) {
+        std::string container;
+        for (const std::string& identifier : lostPlaceholders_) {
+            const Status status =
+                forgetBundle(database, BundleTable::Placeholders, identifier, container);
+            if (!status) return status;
+        }
+        for (const std::string& identifier : lostApplications_) {
+            Status status =
+                forgetBundle(database, BundleTable::Applications, identifier, container);
+            if (status) status = noteLost(database, identifier);
+            if (!status) return status;
+        }
+        return {};
+    }
+
+    const InstallContext& context_;
+    std::unordered_set<std::string> onDisk_;
+    std::unordered_set<std::string> recorded_;
+    std::vector<std::string> lostApplications_;
+    std::vector<std::string> lostPlaceholders_;
+    std::vector<std::string> notes_;
+};
+
+std::vector<std::string> namesAt(const InstallContext& context, std::string_view directory) {
+    const std::string path(directory);
+    const Result<UniqueFd> opened = context.files.root().openDirectory(path, "list");
+    if (!opened) return {};
+    Result<std::vector<std::string>> names = namesIn(opened->get(), path);
+    return names ? std::move(*names) : std::vector<std::string>();
+}
+
+std::unordered_set<std::string> identifiersWithRestoreData(const InstallContext& context) {
+    std::unordered_set<std::string> identifiers;
+    context.database
+        .read([&](Database& database) {
+            Query rows = database.query("SELECT identifier FROM restore_data");
+            while (rows.next()) identifiers.insert(rows.text(0));
+            return rows.status();
+        })
+        .ignore();
+    return identifiers;
+}
+
+// A package whose data is yet to come waits for it where it lies; any other is sent again.
+void clearPackages(const InstallContext& context) {
+    const std::unordered_set<std::string> waiting = identifiersWithRestoreData(context);
+    for (const std::string& name : namesAt(context, kPublicStagingDirectory)) {
+        if (!name.ends_with(kPackageSuffix)) continue;
+        const std::string identifier = name.substr(0, name.size() - kPackageSuffix.size());
+        if (!isLegalIdentifier(identifier) || waiting.contains(identifier)) continue;
+        context.files.removeItem(std::string(kPublicStagingDirectory) + "/" + name).ignore();
+    }
+}
+
+void clearTemporaries(const InstallContext& context) {
+    for (const std::string& name : namesAt(context, kTemporaryDirectory)) {
+        context.files.removeItem(std::string(kTemporaryDirectory) + "/" + name).ignore();
+    }
+    for (const std::string_view directory : {kWorkAreaDirectory, kPublicStagingDirectory}) {
+        context.files.removeStaleTemporaries(std::string(directory)).ignore();
+    }
+}
+
+}  // namespace
+
+Result<std::vector<std::string>> reconcileDevice(const InstallContext& context) {
+    const Status tidied = context.database.change(
+        Durability::Soon, [&](Database& database) { return tidyTables(database, context.boot); });
+    if (!tidied) return tidied.error();
+    Comparison comparison(context);
+    if (Status status = comparison.run(); !status) return status.error();
+    clearPackages(context);
+    clearTemporaries(context);
+    return comparison.takeNotes();
+}
+
+Status beginSession(const InstallContext& context) {
+    return context.database.change(Durability::Soon, [](Database& database) {
+        return database
+            .query("INSERT OR REPLACE INTO session (id, process, started) VALUES (1, ?, ?)")
+            .bind(std::int64_t{::getpid()}, milliseconds(wallNow()))
+            .run();
+    });
+}
+
+Status endSession(const InstallContext& context) {
+    std::int64_t unsynced = 0;
+    Status status = context.database.read([&](Database& database) {
+        Query rows =
+            database.query("SELECT count(*) FROM placeholders WHERE unsynced_boot IS NOT NULL");
+        if (rows.next()) unsynced = rows.integer(0);
+        return rows.status();
+    });
+    if (status && unsynced > 0) status = context.barrier.pass();
+    if (!status) return status;
+    return context.database.change(Durability::OnDisk, [](Database& database) -> Status {
+        Query synced = database.query(
+            "UPDATE placeholders SET unsynced_boot = NULL WHERE unsynced_boot IS NOT NULL");
+        if (Status marked = synced.run(); !marked) return marked;
+        return database.query("DELETE FROM session").run();
+    });
+}
+
+}  // namespace appsync

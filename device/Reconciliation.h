@@ -1,0 +1,23 @@
+#pragma once
+
+#include <string>
+#include <vector>
+
+#include "platform/Result.h"
+
+namespace appsync {
+
+struct InstallContext;
+
+/// Puts a device in order that an interrupted session, or a loss of power, left: whatever neither
+/// the database nor the disk can account for goes. Only while the session's lock is held. Gives one
+/// sentence for each thing that a person may miss. Costs a look at the names of all containers.
+[[nodiscard]] Result<std::vector<std::string>> reconcileDevice(const InstallContext& context);
+
+/// Says in the database that this process's session holds the device.
+Status beginSession(const InstallContext& context);
+
+/// Makes everything durable and says that the session is over.
+Status endSession(const InstallContext& context);
+
+}  // namespace appsync

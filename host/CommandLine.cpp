@@ -1,0 +1,383 @@
+#include "host/CommandLine.h"
+
+#include <algorithm>
+#include <functional>
+#include <map>
+#include <memory>
+#include <ostream>
+#include <utility>
+
+#include <CLI/CLI.hpp>
+
+#include "host/Commands.h"
+#include "host/Console.h"
+#include "host/Problem.h"
+
+namespace appsync {
+namespace {
+
+constexpr const char* kDescription =
+    "appsync keeps the applications of a device in step with a folder of packages.";
+constexpr const char* kFooter =
+    "Exit status: 0 done; 1 something failed, each failure named; 2 wrong usage; 3 the device or\n"
+    "the library cannot be used.";
+
+// Declares the commands and remembers which one was chosen. The values that options are parsed into
+// live as long as the commands' actions.
+class Commands {
+  public:
+    explicit Commands(const Console& console) : console_(console), app_(kDescription, "appsync") {
+        app_.require_subcommand(1);
+        app_.footer(kFooter);
+        addSync();
+        addPlan();
+        addSend();
+        addDevice();
+        addLook();
+        addLog();
+        addCoordination();
+        addPackage();
+        addPropertyList();
+    }
+
+    int run(std::vector<std::string> arguments) {
+        if (!arguments.empty() && isUnknownCommand(arguments.front())) {
+            return console_.fail(
+                wrongUsage("there is no command " + arguments.front(), "see appsync --help"));
+        }
+        std::reverse(arguments.begin(), arguments.end());  // as CLI11 wants them
+        try {
+            app_.parse(std::move(arguments));
+        } catch (const CLI::Success& help) {
+            app_.exit(help, console_.out, console_.err);
+            return kExitDone;
+        } catch (const CLI::ParseError& error) {
+            console_.complain(std::string(error.what()) + ": see appsync --help");
+            return kExitWrongUsage;
+        }
+        return action_ ? action_() : kExitWrongUsage;
+    }
+
+  private:
+    [[nodiscard]] bool isUnknownCommand(const std::string& name) const {
+        const auto known = app_.get_subcommands(
+            [&name](const CLI::App* command) { return command->get_name() == name; });
+        return !name.starts_with('-') && known.empty();
+    }
+
+    // A command whose options are parsed into one `Values`.
+    template <typename Values>
+    CLI::App& command(CLI::App& parent, const std::string& name, const std::string& description,
+                      const std::shared_ptr<Values>& values,
+                      std::function<int(const Values&)> action) {
+        CLI::App& added = *parent.add_subcommand(name, description);
+        added.callback([this, values, action = std::move(action)] {
+            action_ = [values, action] { return action(*values); };
+        });
+        return added;
+    }
+
+    static void addDisplay(CLI::App& added, SyncDisplayKind& display) {
+        CLI::Option* json = added.add_flag_callback(
+            "--json", [&display] { display = SyncDisplayKind::Json; }, "print one JSON object");
+        added
+            .add_flag_callback(
+                "--json-lines", [&display] { display = SyncDisplayKind::JsonLines; },
+                "print one JSON object per event, the summary last")
+            ->excludes(json);
+    }
+
+    static void addPlanOptions(CLI::App& added, SyncArguments& values) {
+        added.add_option("DEVICE", values.device, "the device's directory")->required();
+        added.add_option("LIBRARY", values.library, "the folder of packages")->required();
+        added.add_option("--remove", values.plan.remove, "remove this application")
+            ->type_name("ID")
+            ->expected(1)
+            ->take_all();
+        added.add_flag("--mirror", values.plan.mirror,
+                       "remove every user application that LIBRARY lacks");
+        added.add_flag("--staged", values.isStaged,
+                       "the staging area is there already: send what it asks for");
+    }
+
+    void addSync() {
+        const auto values = std::make_shared<SyncArguments>();
+        CLI::App& added = command<SyncArguments>(
+            app_, "sync", "Bring the device in step with a folder of packages", values,
+            [this](const SyncArguments& parsed) { return runSync(parsed, console_); });
+        addPlanOptions(added, *values);
+        added.add_flag("--dry-run", values->isDryRun, "only say what would be done (= plan)");
+        addDisplay(added, values->display);
+    }
+
+    void addPlan() {
+        const auto values = std::make_shared<SyncArguments>();
+        values->isDryRun = true;
+        CLI::App& added = command<SyncArguments>(
+            app_, "plan", "Say what a sync would do and whether it fits", values,
+            [this](const SyncArguments& parsed) { return runSync(parsed, console_); });
+        addPlanOptions(added, *values);
+        added.add_flag_callback(
+            "--json", [values] { values->display = SyncDisplayKind::Json; }, "print JSON");
+    }
+
+    void addSend() {
+        const auto values = std::make_shared<SendArguments>();
+        CLI::App& added = command<SendArguments>(
+            app_, "send", "Send one package unasked, or a restore's package or data", values,
+            [this](const SendArguments& parsed) { return runSend(parsed, console_); });
+        added.add_option("DEVICE", values->device, "the device's directory")->required();
+        added.add_option("ID", values->identifier, "the application's identifier")->required();
+        added.add_option("FILE", values->file, "the package, or the data")->required();
+        added.add_flag("--restore", values->isRestore, "it belongs to a restore");
+        added
+            .add_option("--parts", values->parts,
+                        "1: the package, its data follows; 2: the data; 3: all at once")
+            ->type_name("N")
+            ->check(CLI::Range(1U, 3U));
+        addDisplay(added, values->display);
+    }
+
+    struct DeviceValues {
+        std::string device;
+        std::string identifier;
+        std::string other;
+        std::vector<std::string> assignments;
+        bool flag = false;
+    };
+    using DeviceAction = std::function<int(const DeviceValues&)>;
+
+    CLI::App& deviceCommand(const std::string& name, const std::string& description,
+                            const std::shared_ptr<DeviceValues>& values, DeviceAction action) {
+        CLI::App& added = command<DeviceValues>(app_, name, description, values, std::move(action));
+        added.add_option("DEVICE", values->device, "the device's directory")->required();
+        return added;
+    }
+
+    CLI::App& applicationCommand(const std::string& name, const std::string& description,
+                                 const std::shared_ptr<DeviceValues>& values, DeviceAction action) {
+        CLI::App& added = deviceCommand(name, description, values, std::move(action));
+        added.add_option("ID", values->identifier, "the application's identifier")->required();
+        return added;
+    }
+
+    void addDevice() {
+        addCreate();
+        addSet();
+        addDemote();
+        applicationCommand("run", "Mark an application as running: its termination is denied",
+                           std::make_shared<DeviceValues>(), [this](const DeviceValues& parsed) {
+                               return runRun(parsed.device, parsed.identifier, console_);
+                           });
+        applicationCommand("quit", "Mark it as not running any more",
+                           std::make_shared<DeviceValues>(), [this](const DeviceValues& parsed) {
+                               return runQuit(parsed.device, parsed.identifier, console_);
+                           });
+        applicationCommand("uninstall", "Remove an application as a person does on the device",
+                           std::make_shared<DeviceValues>(), [this](const DeviceValues& parsed) {
+                               return runUninstall(parsed.device, parsed.identifier, console_);
+                           });
+        deviceCommand("reset", "Make the device forget what it keeps for syncing",
+                      std::make_shared<DeviceValues>(), [this](const DeviceValues& parsed) {
+                          return runReset(parsed.device, console_);
+                      });
+    }
+
+    void addCreate() {
+        const auto values = std::make_shared<DeviceValues>();
+        CLI::App& added =
+            deviceCommand("create", "Make an empty device in a new directory", values,
+                          [this](const DeviceValues& parsed) {
+                              return runCreate(parsed.device, parsed.other == "on", console_);
+                          });
+        added.add_option("--coordination", values->other, "whether installs are coordinated")
+            ->check(CLI::IsMember({"on", "off"}));
+    }
+
+    void addSet() {
+        const auto values = std::make_shared<DeviceValues>();
+        CLI::App& added =
+            deviceCommand("set", "Change what the device's owner allows", values,
+                          [this](const DeviceValues& parsed) {
+                              return runSet(parsed.device, parsed.assignments, console_);
+                          });
+        added
+            .add_option("NAME=VALUE", values->assignments,
+                        "installation=yes|no|unset  removal=yes|no|unset  coordination=on|off")
+            ->required();
+    }
+
+    void addDemote() {
+        const auto values = std::make_shared<DeviceValues>();
+        CLI::App& added = applicationCommand(
+            "demote", "Offload an application: its placeholder and its data stay", values,
+            [this](const DeviceValues& parsed) {
+                return runDemote(parsed.device, parsed.identifier, parsed.other == "system",
+                                 console_);
+            });
+        added.add_option("--by", values->other, "who does it")
+            ->check(CLI::IsMember({"person", "system"}));
+    }
+
+    void addJson(CLI::App& added, const std::shared_ptr<DeviceValues>& values) {
+        added.add_flag("--json", values->flag, "print JSON");
+    }
+
+    void addLook() {
+        addLook("apps", "Show installed applications and placeholders", runApps);
+        addLook("inventory", "Show what the plug-in reports: deleted, metrics, accounts",
+                runInventory);
+        addLook("history", "Show the transaction log", runHistory);
+        addWhy();
+        const auto values = std::make_shared<DeviceValues>();
+        deviceCommand("screen", "Draw the home screen as a PNG picture", values,
+                      [this](const DeviceValues& parsed) {
+                          return runScreen(parsed.device, parsed.other, console_);
+                      })
+            .add_option("OUT", values->other, "the picture to write")
+            ->required();
+    }
+
+    void addLook(const std::string& name, const std::string& description,
+                 int (*show)(const std::string&, bool, const Console&)) {
+        const auto values = std::make_shared<DeviceValues>();
+        CLI::App& added =
+            deviceCommand(name, description, values, [this, show](const DeviceValues& parsed) {
+                return show(parsed.device, parsed.flag, console_);
+            });
+        addJson(added, values);
+    }
+
+    void addWhy() {
+        const auto values = std::make_shared<DeviceValues>();
+        CLI::App& added = applicationCommand(
+            "why", "Say what an application waits for", values, [this](const DeviceValues& parsed) {
+                return runWhy(parsed.device, parsed.identifier, parsed.flag, console_);
+            });
+        addJson(added, values);
+    }
+
+    void addLog() {
+        static const std::map<std::string, LogLevel> kLevels = {{"debug", LogLevel::Debug},
+                                                                {"info", LogLevel::Info},
+                                                                {"default", LogLevel::Default},
+                                                                {"error", LogLevel::Error},
+                                                                {"fault", LogLevel::Fault}};
+        const auto values = std::make_shared<LogArguments>();
+        CLI::App& added = command<LogArguments>(
+            app_, "log", "Show the system log", values,
+            [this](const LogArguments& parsed) { return runLog(parsed, console_); });
+        added.add_option("DEVICE", values->device, "the device's directory")->required();
+        added.add_option("--category", values->category, "only this category")->type_name("N");
+        added.add_option("--level", values->level, "only this level and those above it")
+            ->type_name("debug|info|default|error|fault")
+            ->transform(CLI::CheckedTransformer(kLevels).description(""));
+        added.add_flag("--follow", values->follows, "go on as lines come");
+        added.add_flag("--json", values->asJson, "print the lines as they are kept");
+    }
+
+    void addCoordination() {
+        const auto values = std::make_shared<CoordinatorArguments>();
+        CLI::App& added = command<CoordinatorArguments>(
+            app_, "coordinator", "Play another client of the coordination service", values,
+            [this](const CoordinatorArguments& parsed) {
+                return runCoordinator(parsed, console_);
+            });
+        added.add_option("DEVICE", values->device, "the device's directory")->required();
+        added.add_option("ACTION", values->action, "list, create or cancel")
+            ->required()
+            ->check(CLI::IsMember({"list", "create", "cancel"}));
+        added.add_option("ID", values->identifier, "the application's identifier");
+        added.add_option("--client", values->client, "the client to play")->type_name("N");
+        added.add_flag("--json", values->asJson, "print JSON");
+        addStore();
+    }
+
+    void addStore() {
+        const auto values = std::make_shared<DeviceValues>();
+        CLI::App& added = deviceCommand(
+            "store", "Play the app store: keep the promises of restoring applications", values,
+            [this](const DeviceValues& parsed) {
+                return runStore(parsed.device, parsed.other, parsed.flag, console_);
+            });
+        added.add_option("FOLDER", values->other, "the store's packages")->required();
+        addJson(added, values);
+    }
+
+    struct FileValues {
+        std::string file;
+        std::string package;
+        std::optional<std::string> output;
+        PropertyListFormat format = PropertyListFormat::Xml;
+        bool asJson = false;
+    };
+
+    CLI::App& group(const std::string& name, const std::string& description) {
+        CLI::App& added = *app_.add_subcommand(name, description);
+        added.require_subcommand(1);
+        return added;
+    }
+
+    void addPackage() {
+        CLI::App& parent = group("package", "Make or look at application packages");
+        const auto made = std::make_shared<FileValues>();
+        CLI::App& make = command<FileValues>(
+            parent, "make", "Make a package of a folder that holds NAME.app", made,
+            [this](const FileValues& parsed) {
+                return runPackageMake(parsed.file, parsed.package, parsed.asJson, console_);
+            });
+        make.add_option("FOLDER", made->file, "the folder")->required();
+        make.add_option("OUT", made->package, "the package to write")->required();
+        make.add_flag("--json", made->asJson, "print JSON");
+        const auto shown = std::make_shared<FileValues>();
+        CLI::App& show =
+            command<FileValues>(parent, "show", "Check a package and show what it says of itself",
+                                shown, [this](const FileValues& parsed) {
+                                    return runPackageShow(parsed.file, parsed.asJson, console_);
+                                });
+        show.add_option("FILE", shown->file, "the package")->required();
+        show.add_flag("--json", shown->asJson, "print JSON");
+    }
+
+    void addPropertyList() {
+        CLI::App& parent = group("plist", "Look at or convert property lists");
+        const auto shown = std::make_shared<FileValues>();
+        CLI::App& show = command<FileValues>(
+            parent, "show", "Show a property list of either encoding", shown,
+            [this](const FileValues& parsed) {
+                return runPropertyListShow(parsed.file, parsed.asJson, console_);
+            });
+        show.add_option("FILE", shown->file, "the property list")->required();
+        show.add_flag("--json", shown->asJson, "print JSON");
+        addConvert(parent);
+    }
+
+    void addConvert(CLI::App& parent) {
+        static const std::map<std::string, PropertyListFormat> kFormats = {
+            {"xml", PropertyListFormat::Xml}, {"binary", PropertyListFormat::Binary}};
+        const auto values = std::make_shared<FileValues>();
+        CLI::App& added = command<FileValues>(
+            parent, "convert", "Write a property list in another encoding", values,
+            [this](const FileValues& parsed) {
+                return runPropertyListConvert(parsed.file, parsed.format, parsed.output, console_);
+            });
+        added.add_option("FILE", values->file, "the property list")->required();
+        added.add_option("--to", values->format, "the encoding to write")
+            ->required()
+            ->type_name("xml|binary")
+            ->transform(CLI::CheckedTransformer(kFormats).description(""));
+        added.add_option("--out", values->output, "the file to write; else standard output");
+    }
+
+    const Console& console_;
+    CLI::App app_;
+    std::function<int()> action_;
+};
+
+}  // namespace
+
+int runCommandLine(std::vector<std::string> arguments, const Console& console) {
+    return Commands(console).run(std::move(arguments));
+}
+
+}  // namespace appsync

@@ -1,0 +1,105 @@
+#pragma once
+
+#include <optional>
+#include <string>
+#include <vector>
+
+#include "device/DeviceRecords.h"
+#include "host/SyncDisplays.h"
+#include "host/SyncPlan.h"
+#include "platform/LogFacility.h"
+#include "platform/PropertyListSerialization.h"
+
+namespace appsync {
+
+struct Console;
+
+// What each command does, once its arguments are understood. Each gives the exit status (see
+// host/Problem.h); errors have then been told on the console.
+
+// host/SyncCommand.cpp
+
+struct SyncArguments {
+    std::string device;
+    std::string library;
+    PlanOptions plan;
+    bool isStaged = false;
+    bool isDryRun = false;
+    SyncDisplayKind display = SyncDisplayKind::Text;
+};
+[[nodiscard]] int runSync(const SyncArguments& arguments, const Console& console);
+
+// host/SendCommand.cpp
+
+struct SendArguments {
+    std::string device;
+    std::string identifier;
+    std::string file;
+    bool isRestore = false;
+    /// 1, 2 or 3, see AssetParts.
+    unsigned parts = 1;
+    SyncDisplayKind display = SyncDisplayKind::Text;
+};
+[[nodiscard]] int runSend(const SendArguments& arguments, const Console& console);
+
+// host/DeviceCommands.cpp: what changes a device outside a sync.
+
+[[nodiscard]] int runCreate(const std::string& device, bool coordination, const Console& console);
+[[nodiscard]] int runSet(const std::string& device, const std::vector<std::string>& assignments,
+                         const Console& console);
+[[nodiscard]] int runRun(const std::string& device, const std::string& identifier,
+                         const Console& console);
+[[nodiscard]] int runQuit(const std::string& device, const std::string& identifier,
+                          const Console& console);
+[[nodiscard]] int runUninstall(const std::string& device, const std::string& identifier,
+                               const Console& console);
+[[nodiscard]] int runDemote(const std::string& device, const std::string& identifier, bool bySystem,
+                            const Console& console);
+[[nodiscard]] int runReset(const std::string& device, const Console& console);
+
+// host/LookCommands.cpp: what shows a device.
+
+[[nodiscard]] int runApps(const std::string& device, bool asJson, const Console& console);
+[[nodiscard]] int runWhy(const std::string& device, const std::string& identifier, bool asJson,
+                         const Console& console);
+[[nodiscard]] int runInventory(const std::string& device, bool asJson, const Console& console);
+[[nodiscard]] int runHistory(const std::string& device, bool asJson, const Console& console);
+[[nodiscard]] int runScreen(const std::string& device, const std::string& picture,
+                            const Console& console);
+
+// host/LogCommand.cpp
+
+struct LogArguments {
+    std::string device;
+    std::optional<int> category;
+    /// This level and those above it.
+    std::optional<LogLevel> level;
+    bool follows = false;
+    bool asJson = false;
+};
+[[nodiscard]] int runLog(const LogArguments& arguments, const Console& console);
+
+// host/CoordinationCommands.cpp
+
+struct CoordinatorArguments {
+    std::string device;
+    std::string action;  // "list", "create" or "cancel"
+    std::string identifier;
+    int client = 1;
+    bool asJson = false;
+};
+[[nodiscard]] int runCoordinator(const CoordinatorArguments& arguments, const Console& console);
+[[nodiscard]] int runStore(const std::string& device, const std::string& folder, bool asJson,
+                           const Console& console);
+
+// host/FileCommands.cpp: packages and property lists of this machine.
+
+[[nodiscard]] int runPackageMake(const std::string& folder, const std::string& package, bool asJson,
+                                 const Console& console);
+[[nodiscard]] int runPackageShow(const std::string& package, bool asJson, const Console& console);
+[[nodiscard]] int runPropertyListShow(const std::string& file, bool asJson, const Console& console);
+[[nodiscard]] int runPropertyListConvert(const std::string& file, PropertyListFormat format,
+                                         const std::optional<std::string>& output,
+                                         const Console& console);
+
+}  // namespace appsync

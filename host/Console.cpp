@@ -1,0 +1,45 @@
+#include "host/Console.h"
+
+#include <sys/ioctl.h>
+#include <unistd.h>
+
+#include <algorithm>
+#include <cstdlib>
+#include <iostream>
+#include <string_view>
+
+#include "host/Problem.h"
+#include "host/Text.h"
+
+namespace appsync {
+namespace {
+
+constexpr std::size_t kNarrowest = 40;
+
+bool canRedraw() {
+    const char* terminal = std::getenv("TERM");
+    return ::isatty(STDOUT_FILENO) != 0 && terminal != nullptr &&
+           std::string_view(terminal) != "dumb";
+}
+
+std::size_t terminalWidth() {
+    winsize size{};
+    if (::ioctl(STDOUT_FILENO, TIOCGWINSZ, &size) != 0 || size.ws_col == 0) return 80;
+    return std::max<std::size_t>(size.ws_col, kNarrowest);
+}
+
+}  // namespace
+
+void Console::complain(std::string_view text) const {
+    out.flush();
+    err << "appsync: " << printable(text) << '\n' << std::flush;
+}
+
+int Console::fail(const ErrorRecord& error) const {
+    complain(error.description());
+    return exitStatusOf(error);
+}
+
+Console processConsole() { return {std::cout, std::cerr, canRedraw(), terminalWidth()}; }
+
+}  // namespace appsync

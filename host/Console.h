@@ -1,0 +1,29 @@
+#pragma once
+
+#include <cstddef>
+#include <iosfwd>
+#include <string_view>
+
+namespace appsync {
+
+struct ErrorRecord;
+
+/// Where a command prints. The streams belong to the caller.
+struct Console {
+    std::ostream& out;
+    std::ostream& err;
+    /// `out` is a terminal that can redraw lines.
+    bool isTerminal = false;
+    /// Characters in a line of that terminal.
+    std::size_t width = 80;
+
+    /// One line on the error stream: "appsync: " and the text, made safe to print.
+    void complain(std::string_view text) const;
+    /// The same of an error. Gives the exit status that it asks for.
+    int fail(const ErrorRecord& error) const;
+};
+
+/// The console of this process.
+[[nodiscard]] Console processConsole();
+
+}  // namespace appsync

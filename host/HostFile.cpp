@@ -1,0 +1,107 @@
+#include "host/HostFile.h"
+
+#include <fcntl.h>
+#include <sys/stat.h>
+#include <unistd.h>
+
+#include <algorithm>
+#include <cerrno>
+#include <system_error>
+
+namespace appsync {
+
+ErrorRecord systemError(int errorNumber, const std::string& what) {
+    const std::string text = std::generic_category().message(errorNumber);
+    return ErrorRecord::make(kPosixErrorDomain, errorNumber, what + ": " + text);
+}
+
+Result<HostFile> HostFile::open(const std::string& path) {
+    const int descriptor = ::open(path.c_str(), O_RDONLY | O_CLOEXEC | O_NONBLOCK);
+    if (descriptor < 0) return systemError(errno, "cannot open " + path);
+    HostFile file(descriptor, 0);
+    struct stat attributes {};
+    if (::fstat(descriptor, &attributes) != 0) return systemError(errno, "cannot look at " + path);
+    if (!S_ISREG(attributes.st_mode)) {
+        return ErrorRecord::make(kPosixErrorDomain, EINVAL, path + " is not a regular file");
+    }
+    file.size_ = static_cast<std::uint64_t>(attributes.st_size);
+    return file;
+}
+
+HostFile& HostFile::operator=(HostFile&& other) noexcept {
+    std::swap(descriptor_, other.descriptor_);
+    std::swap(size_, other.size_);
+    return *this;
+}
+
+HostFile::~HostFile() {
+    if (descriptor_ >= 0) ::close(descriptor_);
+}
+
+Result<std::size_t> HostFile::read(std::span<std::uint8_t> buffer) {
+    for (;;) {
+        const ssize_t count = ::read(descriptor_, buffer.data(), buffer.size());
+        if (count >= 0) return static_cast<std::size_t>(count);
+        if (errno != EINTR) return systemError(errno, "cannot read");
+    }
+}
+
+Result<Bytes> readHostFile(const std::string& path, std::uint64_t maximumBytes) {
+    Result<HostFile> file = HostFile::open(path);
+    if (!file) return file.error();
+    Bytes contents(std::min(file->size(), maximumBytes) + 1);
+    std::size_t length = 0;
+    while (length < contents.size()) {
+        const Result<std::size_t> count = file->read(std::span(contents).subspan(length));
+        if (!count) return count.error().withContext(path);
+        if (*count == 0) break;
+        length += *count;
+    }
+    if (length == contents.size()) {
+        return ErrorRecord::make(kPosixErrorDomain, EFBIG,
+                                 path + " is too large, or grows while it is read");
+    }
+    contents.resize(length);
+    return contents;
+}
+
+namespace {
+
+Status writeAndClose(int descriptor, const std::string& path, ByteView contents) {
+    Status status;
+    while (!contents.empty() && status) {
+        const ssize_t count = ::write(descriptor, contents.data(), contents.size());
+        if (count >= 0) {
+            contents = contents.subspan(static_cast<std::size_t>(count));
+        } else if (errno != EINTR) {
+            status = systemError(errno, "cannot write " + path);
+        }
+    }
+    if (::close(descriptor) != 0 && status) status = systemError(errno, "cannot write " + path);
+    return status;
+}
+
+bool isSpecial(const std::string& path) {
+    struct stat attributes {};
+    return ::stat(path.c_str(), &attributes) == 0 && !S_ISREG(attributes.st_mode);
+}
+
+}  // namespace
+
+Status writeHostFile(const std::string& path, ByteView contents) {
+    // A pipe or a terminal is written to, not replaced.
+    const bool isDirect = isSpecial(path);
+    const std::string target = isDirect ? path : path + "." + std::to_string(::getpid()) + ".new";
+    const int descriptor =
+        ::open(target.c_str(), O_WRONLY | O_CREAT | O_CLOEXEC | (isDirect ? 0 : O_EXCL), 0666);
+    if (descriptor < 0) return systemError(errno, "cannot write " + path);
+    Status status = writeAndClose(descriptor, path, contents);
+    if (isDirect) return status;
+    if (status && ::rename(target.c_str(), path.c_str()) != 0) {
+        status = systemError(errno, "cannot write " + path);
+    }
+    if (!status) ::unlink(target.c_str());
+    return status;
+}
+
+}  // namespace appsync

@@ -1,0 +1,90 @@
+#include "host/Json.h"
+
+#include <nlohmann/json.hpp>
+
+#include "host/JsonWriting.h"
+#include "host/Text.h"
+
+namespace appsync {
+namespace {
+
+using Json = nlohmann::ordered_json;
+
+Json failures(const std::vector<SyncFailure>& failed) {
+    Json list = Json::array();
+    for (const SyncFailure& each : failed) {
+        list.push_back({{"identifier", each.identifier}, {"error", each.error}});
+    }
+    return list;
+}
+
+Json skips(const std::vector<PlannedSkip>& skipped) {
+    Json list = Json::array();
+    for (const PlannedSkip& each : skipped) {
+        list.push_back({{"identifier", each.identifier}, {"why", each.why}});
+    }
+    return list;
+}
+
+Json identifiers(const std::vector<PlannedInstall>& installs) {
+    Json list = Json::array();
+    for (const PlannedInstall& each : installs) list.push_back(each.identifier);
+    return list;
+}
+
+Json updates(const std::vector<PlannedInstall>& planned) {
+    Json list = Json::array();
+    for (const PlannedInstall& each : planned) {
+        list.push_back({{"identifier", each.identifier},
+                        {"oldVersion", each.oldVersion},
+                        {"newVersion", each.newVersion}});
+    }
+    return list;
+}
+
+}  // namespace
+
+std::string jsonText(const SyncEvent& event) {
+    Json object = {{"event", nameOf(event.kind)},
+                   {"phase", nameOf(event.phase)},
+                   {"identifier", event.identifier},
+                   {"done", event.done},
+                   {"total", event.total},
+                   {"state", nameOf(event.state)},
+                   {"nextTry", nullptr}};
+    if (event.nextTry) object["nextTry"] = formatTime(*event.nextTry);
+    if (event.state == SyncState::Failed) object["error"] = event.text;
+    if (event.state == SyncState::Waiting) object["waitsFor"] = event.text;
+    return dumped(object);
+}
+
+std::string jsonText(const SyncSummary& summary, JsonLayout layout) {
+    Json object;
+    if (layout == JsonLayout::SummaryLine) object["event"] = "summary";
+    object["requested"] = summary.requested;
+    object["installed"] = summary.installed;
+    object["updated"] = summary.updated;
+    object["removed"] = summary.removed;
+    object["failed"] = failures(summary.failed);
+    object["skipped"] = skips(summary.skipped);
+    object["bytes"] = summary.bytes;
+    object["seconds"] = summary.seconds;
+    return layout == JsonLayout::SummaryLine ? dumped(object) : indented(object);
+}
+
+std::string jsonText(const SyncPlan& plan, const SpaceCheck& space) {
+    const Json object = {{"install", identifiers(plan.install)},
+                         {"update", updates(plan.update)},
+                         {"remove", plan.remove},
+                         {"skipped", skips(plan.skipped)},
+                         {"failed", failures(plan.failed)},
+                         {"bytes", plan.bytes()},
+                         {"needed", space.needed},
+                         {"free", space.free},
+                         {"reclaimed", space.reclaimed},
+                         {"missing", space.missing()},
+                         {"fits", space.fits()}};
+    return indented(object);
+}
+
+}  // namespace appsync

@@ -1,0 +1,21 @@
+#pragma once
+
+#include <string>
+
+#include "host/SyncEvents.h"
+#include "host/SyncPlan.h"
+
+namespace appsync {
+
+enum class JsonLayout {
+    Indented,     // for one object of a command
+    SummaryLine,  // on one line, marked as the event "summary"
+};
+
+// One JSON text each, without a line end. Bytes that are not UTF-8 become U+FFFD.
+
+[[nodiscard]] std::string jsonText(const SyncEvent& event);
+[[nodiscard]] std::string jsonText(const SyncSummary& summary, JsonLayout layout);
+[[nodiscard]] std::string jsonText(const SyncPlan& plan, const SpaceCheck& space);
+
+}  // namespace appsync

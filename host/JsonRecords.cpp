@@ -1,0 +1,150 @@
+#include "host/JsonRecords.h"
+
+#include <cmath>
+#include <utility>
+
+#include <nlohmann/json.hpp>
+
+#include "device/PackageReader.h"
+#include "host/JsonWriting.h"
+#include "host/PropertyListOutline.h"
+#include "host/Text.h"
+#include "host/WhyAnswer.h"
+#include "platform/PropertyList.h"
+
+namespace appsync {
+namespace {
+
+using Json = nlohmann::ordered_json;
+
+template <typename Value>
+Json orNull(const std::optional<Value>& value) {
+    return value ? Json(*value) : Json();
+}
+
+Json jsonOf(const ApplicationRecord& record) {
+    return {{"identifier", record.identifier},
+            {"version", orNull(record.version)},
+            {"name", orNull(record.name)},
+            {"state", record.isPlaceholder ? "placeholder" : "installed"},
+            {"type", record.type},
+            {"installType", record.installType},
+            {"container", record.container},
+            {"bytes", record.bytes}};
+}
+
+Json jsonOf(const HistoryRecord& record) {
+    const bool isScenario = record.kind == HistoryRecord::Kind::Scenario;
+    Json object = {{"time", formatTime(record.time)}, {"kind", isScenario ? "scenario" : "step"}};
+    if (isScenario) {
+        object["scenario"] = record.scenario;
+    } else {
+        object["step"] = record.step;
+    }
+    object["party"] = isScenario ? Json() : Json(record.party);
+    object["phase"] = isScenario ? Json() : Json(record.phase);
+    object["success"] = record.success;
+    object["identifier"] = record.identifier;
+    object["description"] = record.description;
+    return object;
+}
+
+template <typename Record>
+std::string listText(const std::vector<Record>& records) {
+    Json list = Json::array();
+    for (const Record& record : records) list.push_back(jsonOf(record));
+    return indented(list);
+}
+
+Json jsonOf(const SyncAccountInfo& account) {
+    return {{"accountID", account.accountID},
+            {"personID", orNull(account.personID)},
+            {"alternatePersonID", orNull(account.alternatePersonID)}};
+}
+
+Json jsonOf(const PropertyList& value);
+
+Json jsonOfMap(const PropertyList& map) {
+    Json object = Json::object();
+    for (const PropertyList::Entry& entry : map.entries()) object[entry.key] = jsonOf(entry.value);
+    return object;
+}
+
+Json jsonOfArray(const PropertyList& array) {
+    Json list = Json::array();
+    for (const PropertyList& element : array.elements()) list.push_back(jsonOf(element));
+    return list;
+}
+
+Json jsonOf(const PropertyList& value) {
+    switch (value.kind()) {
+        case PropertyList::Kind::Null:
+            return {};
+        case PropertyList::Kind::Boolean:
+            return *value.asBoolean();
+        case PropertyList::Kind::Integer:
+            return *value.asInteger();
+        case PropertyList::Kind::Unsigned:
+            return *value.asUnsigned();
+        case PropertyList::Kind::Real:
+            return *value.asReal();
+        case PropertyList::Kind::Date:
+            return {{"date", dateText(*value.asDate())}};
+        case PropertyList::Kind::Data:
+            return {{"data", base64Text(*value.asData())}};
+        case PropertyList::Kind::String:
+            return *value.asString();
+        case PropertyList::Kind::Array:
+            return jsonOfArray(value);
+        case PropertyList::Kind::Map:
+            return jsonOfMap(value);
+    }
+    return {};
+}
+
+}  // namespace
+
+std::string jsonText(const std::vector<ApplicationRecord>& records) { return listText(records); }
+
+std::string jsonText(const std::vector<HistoryRecord>& records) { return listText(records); }
+
+std::string jsonText(const Inventory& inventory) {
+    Json accounts = Json::array();
+    for (const SyncAccountInfo& account : inventory.accounts) accounts.push_back(jsonOf(account));
+    return indented({{"deleted", inventory.deleted},
+                     {"count", inventory.count},
+                     {"physicalSize", inventory.physicalSize},
+                     {"purgeableSize", inventory.purgeableSize},
+                     {"accountIDs", inventory.accountIDs},
+                     {"accounts", std::move(accounts)}});
+}
+
+std::string jsonText(const WhyAnswer& answer) {
+    Json waitsFor;
+    if (answer.waitsFor) {
+        waitsFor = {{"what", answer.waitsFor->what}, {"who", answer.waitsFor->who}};
+        waitsFor["nextTry"] =
+            answer.waitsFor->nextTry ? Json(formatTime(*answer.waitsFor->nextTry)) : Json();
+    }
+    return indented({{"identifier", answer.identifier},
+                     {"state", answer.state},
+                     {"waitsFor", std::move(waitsFor)},
+                     {"lastError", orNull(answer.lastError)}});
+}
+
+std::string jsonText(const PackageInfo& info) {
+    return indented({{"identifier", info.identifier},
+                     {"version", info.version},
+                     {"name", info.displayName},
+                     {"executable", info.executable},
+                     {"iconFile", info.iconFile},
+                     {"bundle", info.bundleDirectoryName},
+                     {"entries", info.entryCount},
+                     {"bytes", info.packedBytes},
+                     {"unpackedBytes", info.unpackedBytes},
+                     {"storeMetadata", info.hasStoreMetadata}});
+}
+
+std::string jsonText(const PropertyList& value) { return indented(jsonOf(value)); }
+
+}  // namespace appsync

@@ -1,0 +1,38 @@
+#pragma once
+
+#include <cstdint>
+#include <set>
+#include <string>
+#include <vector>
+
+#include "device/DeviceRecords.h"
+#include "platform/SyncAccountInfo.h"
+
+namespace appsync {
+
+class PropertyList;
+struct PackageInfo;
+struct WhyAnswer;
+
+/// What the plug-in reports of the device.
+struct Inventory {
+    std::vector<std::string> deleted;
+    std::uint64_t count = 0;
+    std::uint64_t physicalSize = 0;
+    std::uint64_t purgeableSize = 0;
+    std::set<std::string> accountIDs;
+    std::set<SyncAccountInfo> accounts;
+};
+
+// One JSON text each, over several lines, without a line end. Bytes that are not UTF-8 become
+// U+FFFD.
+
+[[nodiscard]] std::string jsonText(const std::vector<ApplicationRecord>& records);
+[[nodiscard]] std::string jsonText(const std::vector<HistoryRecord>& records);
+[[nodiscard]] std::string jsonText(const Inventory& inventory);
+[[nodiscard]] std::string jsonText(const WhyAnswer& answer);
+[[nodiscard]] std::string jsonText(const PackageInfo& info);
+/// Data becomes a map {"data": base64}, a date {"date": ISO 8601}.
+[[nodiscard]] std::string jsonText(const PropertyList& value);
+
+}  // namespace appsync

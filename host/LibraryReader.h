@@ -1,0 +1,21 @@
+#pragma once
+
+#include <string>
+#include <string_view>
+
+#include "host/Library.h"
+#include "platform/Result.h"
+
+namespace appsync {
+
+class PropertyListSerialization;
+
+/// The name of a library's icon layout.
+inline constexpr std::string_view kIconOrderFile = "IconOrder.plist";
+
+/// Reads a folder of packages: every "*.zip" directly in it, and IconOrder.plist. Packages and a
+/// layout that cannot be used become faults. An error only when the folder itself cannot be read.
+[[nodiscard]] Result<Library> readLibrary(const std::string& folder,
+                                          PropertyListSerialization& propertyLists);
+
+}  // namespace appsync

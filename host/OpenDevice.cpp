@@ -1,0 +1,20 @@
+#include "host/OpenDevice.h"
+
+#include "device/DeviceError.h"
+#include "host/Problem.h"
+
+namespace appsync {
+
+Result<std::unique_ptr<Device>> openDevice(const std::string& path, DeviceAccess access) {
+    DeviceOpenOptions options;
+    options.access = access;
+    Result<std::unique_ptr<Device>> device = Device::open(path, options);
+    if (!device) return unusable(device.error());
+    return device;
+}
+
+ErrorRecord classified(const ErrorRecord& error) {
+    return error.domain == kDeviceErrorDomain ? unusable(error) : error;
+}
+
+}  // namespace appsync

@@ -1,0 +1,37 @@
+#include "host/PlanText.h"
+
+#include "host/Text.h"
+
+namespace appsync {
+namespace {
+
+std::string installLine(const PlannedInstall& each) {
+    return "install  " + printable(each.identifier) + " " + printable(each.newVersion) + " (" +
+           formatBytes(each.bytes) + ")\n";
+}
+
+std::string updateLine(const PlannedInstall& each) {
+    return "update   " + printable(each.identifier) + " " + printable(each.oldVersion) + " -> " +
+           printable(each.newVersion) + " (" + formatBytes(each.bytes) + ")\n";
+}
+
+}  // namespace
+
+std::string planText(const SyncPlan& plan, const SpaceCheck& space) {
+    std::string text;
+    for (const std::string& each : plan.remove) text += "remove   " + printable(each) + "\n";
+    for (const PlannedInstall& each : plan.install) text += installLine(each);
+    for (const PlannedInstall& each : plan.update) text += updateLine(each);
+    for (const PlannedSkip& each : plan.skipped) {
+        text += "skip     " + printable(each.identifier) + ": " + printable(each.why) + "\n";
+    }
+    for (const SyncFailure& each : plan.failed) {
+        text += "failed   " + printable(each.identifier) + ": " + printable(each.error) + "\n";
+    }
+    if (plan.empty()) return text + "Nothing to do: all is in step.\n";
+    return text + counted(plan.install.size() + plan.update.size(), "package") + " to send, " +
+           formatBytes(plan.bytes()) + "; needed " + formatBytes(space.needed) + ", free " +
+           formatBytes(space.free) + (space.fits() ? ": it fits\n" : ": it does not fit\n");
+}
+
+}  // namespace appsync

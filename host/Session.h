@@ -1,0 +1,90 @@
+#pragma once
+
+#include <atomic>
+#include <cstdint>
+#include <functional>
+#include <memory>
+#include <optional>
+#include <string>
+#include <vector>
+
+#include "host/PackageSender.h"
+#include "platform/Error.h"
+#include "platform/Result.h"
+#include "platform/SyncAsset.h"
+
+namespace appsync {
+
+class Device;
+class PlugIn;
+class SessionFacts;
+class SessionWatch;
+class SyncClient;
+class SyncEvents;
+
+/// How a session ended.
+struct SessionEnd {
+    /// Device policy rules the whole dataclass out; nothing was done.
+    bool isDisabled = false;
+    /// The person stopped it.
+    bool isInterrupted = false;
+    /// Why nothing could be transferred at all.
+    std::optional<ErrorRecord> error;
+    /// Bytes that were sent.
+    std::uint64_t bytes = 0;
+
+    [[nodiscard]] bool isSuccess() const { return !isDisabled && !isInterrupted && !error; }
+};
+
+/// The sync daemon's side of one session with the plug-in: calls it in the order that SyncClient
+/// names, and sends it what it asks for.
+class Session {
+  public:
+    /// The file with the package of an identifier, or why there is none.
+    using PackageSource = std::function<Result<std::string>(const std::string& identifier)>;
+
+    /// Everything must outlive the session.
+    /// The plug-in was loaded with a watch on the same events and facts.
+    Session(Device& device, PlugIn& plugIn, SyncEvents& events, SessionFacts& facts,
+            const std::atomic<bool>& stopRequested);
+
+    /// A whole sync with what stands in the staging area. Returns when every install has ended.
+    [[nodiscard]] SessionEnd sync(const PackageSource& packages);
+
+    /// A session that brings one asset that the device has not asked for. The asset's path is set
+    /// from where the file was put: `directory`/`name` of the device; not when `keepsPath`.
+    struct Parcel {
+        SyncAssetPointer asset;
+        std::string file;
+        std::string directory;
+        std::string name;
+        bool keepsPath = false;
+    };
+    [[nodiscard]] SessionEnd deliver(const Parcel& parcel);
+
+  private:
+    void transfer(const SyncAssetPointer& asset, const PackageSource& packages);
+    Result<std::string> packageOf(const SyncAsset& asset, const PackageSource& packages);
+    void send(const Parcel& parcel);
+    void reportFailure(const SyncAssetPointer& asset, const ErrorRecord& error);
+    // `known`: the applications that the last session saw, where this one does not look.
+    const SessionEnd& end(bool transfersSucceeded, const std::vector<std::string>& known);
+
+    Device& device_;
+    SyncClient& client_;
+    SessionWatch& watch_;
+    SyncEvents& events_;
+    SessionFacts& facts_;
+    const std::atomic<bool>& stopRequested_;
+    PackageSender sender_;
+    SessionEnd end_;
+};
+
+/// Writes the identifiers of the user applications that are present, beside those of `also`, so
+/// that the next session can tell what has gone.
+Status writeLastSyncState(Device& device, const std::vector<std::string>& also);
+
+/// The identifiers that the last session wrote; none when there are none.
+[[nodiscard]] std::vector<std::string> readLastSyncState(Device& device);
+
+}  // namespace appsync

@@ -1,0 +1,47 @@
+#include "host/SessionFacts.h"
+
+namespace appsync {
+
+void SessionFacts::failed(const std::string& identifier, const std::string& error) {
+    const std::lock_guard guard(mutex_);
+    failures_.try_emplace(identifier, error);
+}
+
+void SessionFacts::installed(const std::string& identifier) {
+    const std::lock_guard guard(mutex_);
+    installed_.insert(identifier);
+}
+
+void SessionFacts::removed(const std::string& identifier) {
+    const std::lock_guard guard(mutex_);
+    removed_.insert(identifier);
+}
+
+void SessionFacts::requested(const std::string& identifier) {
+    const std::lock_guard guard(mutex_);
+    requests_.push_back(identifier);
+}
+
+std::optional<std::string> SessionFacts::firstFailure(const std::string& identifier) const {
+    const std::lock_guard guard(mutex_);
+    const auto found = failures_.find(identifier);
+    if (found == failures_.end()) return std::nullopt;
+    return found->second;
+}
+
+bool SessionFacts::wasInstalled(const std::string& identifier) const {
+    const std::lock_guard guard(mutex_);
+    return installed_.contains(identifier);
+}
+
+bool SessionFacts::wasRemoved(const std::string& identifier) const {
+    const std::lock_guard guard(mutex_);
+    return removed_.contains(identifier);
+}
+
+std::vector<std::string> SessionFacts::requests() const {
+    const std::lock_guard guard(mutex_);
+    return requests_;
+}
+
+}  // namespace appsync

@@ -1,0 +1,37 @@
+#pragma once
+
+#include <cstdint>
+#include <map>
+#include <mutex>
+#include <optional>
+#include <set>
+#include <string>
+#include <vector>
+
+namespace appsync {
+
+/// What was seen of each application in one session. Callable on any thread.
+class SessionFacts {
+  public:
+    /// Keeps the error unless the application has one already: the first cause is what counts.
+    void failed(const std::string& identifier, const std::string& error);
+    void installed(const std::string& identifier);
+    void removed(const std::string& identifier);
+    void requested(const std::string& identifier);
+
+    [[nodiscard]] std::optional<std::string> firstFailure(const std::string& identifier) const;
+    [[nodiscard]] bool wasInstalled(const std::string& identifier) const;
+    [[nodiscard]] bool wasRemoved(const std::string& identifier) const;
+    /// In the order in which the device asked.
+    [[nodiscard]] std::vector<std::string> requests() const;
+
+  private:
+    mutable std::mutex mutex_;
+    // Guarded by mutex_.
+    std::map<std::string, std::string> failures_;
+    std::set<std::string> installed_;
+    std::set<std::string> removed_;
+    std::vector<std::string> requests_;
+};
+
+}  // namespace appsync

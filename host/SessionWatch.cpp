@@ -1,0 +1,204 @@
+#include "host/SessionWatch.h"
+
+#include <chrono>
+#include <utility>
+
+#include "device/Device.h"
+#include "host/SessionFacts.h"
+#include "host/SyncEvents.h"
+#include "platform/PropertyList.h"
+
+namespace appsync {
+namespace {
+
+constexpr std::chrono::milliseconds kPollInterval{100};
+constexpr std::chrono::seconds kUsualRetryInterval{30};
+
+std::string identifierOf(const PropertyList& options) {
+    const std::string* identifier = options.findString(BundleIdentifierKey);
+    return identifier != nullptr ? *identifier : std::string();
+}
+
+// Hands every call on, and tells the watch of those that change something.
+class WatchedRegistry : public AppRegistry {
+  public:
+    WatchedRegistry(AppRegistry& registry, SessionWatch& watch)
+        : registry_(registry), watch_(watch) {}
+
+    std::optional<AppProxy> proxyForIdentifier(const std::string& identifier,
+                                               Placeholders placeholders) override {
+        return registry_.proxyForIdentifier(identifier, placeholders);
+    }
+    bool isApplicationInstalled(const std::string& identifier) override {
+        return registry_.isApplicationInstalled(identifier);
+    }
+    void enumerateBundles(BundleType type, const ProxyCallback& callback) override {
+        registry_.enumerateBundles(type, callback);
+    }
+    std::shared_ptr<InstallProgressRecord> installProgress(const AppProxy& proxy,
+                                                           std::uint64_t phase) override {
+        return registry_.installProgress(proxy, phase);
+    }
+    void finishInstallPhase(InstallProgressRecord& record) override {
+        registry_.finishInstallPhase(record);
+    }
+    Status installPackage(const FileURL& package, const PropertyList& options) override {
+        const std::string identifier = identifierOf(options);
+        watch_.installBegins(identifier);
+        Status status = registry_.installPackage(package, options);
+        watch_.installEnded(identifier, status);
+        return status;
+    }
+    Status installPlaceholderBundle(const FileURL& directory,
+                                    const PropertyList& options) override {
+        Status status = registry_.installPlaceholderBundle(directory, options);
+        if (!status) watch_.placeholderRefused(identifierOf(options), status.error());
+        return status;
+    }
+    Status uninstallApplication(const std::string& identifier,
+                                const PropertyList& options) override {
+        Status status = registry_.uninstallApplication(identifier, options);
+        watch_.uninstallEnded(identifier, status);
+        return status;
+    }
+    void addObserver(std::weak_ptr<AppRegistryObserver> observer) override {
+        registry_.addObserver(std::move(observer));
+    }
+    void removeObserver(const AppRegistryObserver* observer) override {
+        registry_.removeObserver(observer);
+    }
+
+  private:
+    AppRegistry& registry_;
+    SessionWatch& watch_;
+};
+
+class WatchedHomeScreen : public HomeScreenService {
+  public:
+    WatchedHomeScreen(HomeScreenService& homeScreen, SessionWatch& watch)
+        : homeScreen_(homeScreen), watch_(watch) {}
+
+    std::shared_ptr<HomeScreenConnection> blockableConnection() override {
+        return homeScreen_.blockableConnection();
+    }
+    TerminationAssertionResult takeTerminationAssertion(const std::string& identifier,
+                                                        std::uint64_t reason) override {
+        TerminationAssertionResult result =
+            homeScreen_.takeTerminationAssertion(identifier, reason);
+        if (result.outcome == TerminationAssertionResult::kDenied) {
+            watch_.terminationDenied(identifier);
+        }
+        return result;
+    }
+
+  private:
+    HomeScreenService& homeScreen_;
+    SessionWatch& watch_;
+};
+
+}  // namespace
+
+SessionWatch::SessionWatch(Device& device, AppRegistry& registry, HomeScreenService& homeScreen,
+                           SyncEvents& events, SessionFacts& facts)
+    : device_(device),
+      events_(events),
+      facts_(facts),
+      registry_(std::make_unique<WatchedRegistry>(registry, *this)),
+      homeScreen_(std::make_unique<WatchedHomeScreen>(homeScreen, *this)),
+      poller_([this] { poll(); }) {}
+
+SessionWatch::~SessionWatch() {
+    {
+        const std::lock_guard guard(mutex_);
+        isOver_ = true;
+    }
+    ended_.notify_all();
+    poller_.join();
+}
+
+void SessionWatch::setSize(const std::string& identifier, std::uint64_t bytes) {
+    const std::lock_guard guard(mutex_);
+    sizes_[identifier] = bytes;
+}
+
+std::uint64_t SessionWatch::sizeOf(const std::string& identifier) const {
+    const std::lock_guard guard(mutex_);
+    const auto found = sizes_.find(identifier);
+    return found != sizes_.end() ? found->second : 0;
+}
+
+void SessionWatch::placeholderRefused(const std::string& identifier, const ErrorRecord& error) {
+    facts_.failed(identifier, error.description());
+}
+
+void SessionWatch::terminationDenied(const std::string& identifier) {
+    const Result<ApplicationStatus> status = device_.status(identifier);
+    const bool isKnown = status && status->denial;
+    const auto nextTry =
+        isKnown ? status->denial->nextTry : std::chrono::system_clock::now() + kUsualRetryInterval;
+    events_.report({SyncEventKind::Waiting, SyncPhase::Install, identifier, 0, sizeOf(identifier),
+                    SyncState::Waiting, nextTry, identifier + " is running"});
+}
+
+void SessionWatch::installBegins(const std::string& identifier) {
+    const std::uint64_t size = sizeOf(identifier);
+    events_.report({SyncEventKind::Started, SyncPhase::Install, identifier, 0, size,
+                    SyncState::Active, std::nullopt, ""});
+    const std::lock_guard guard(mutex_);
+    installing_[identifier] = size;
+}
+
+void SessionWatch::installEnded(const std::string& identifier, const Status& status) {
+    const std::uint64_t size = sizeOf(identifier);
+    {
+        const std::lock_guard guard(mutex_);
+        installing_.erase(identifier);
+    }
+    if (status) {
+        facts_.installed(identifier);
+    } else {
+        facts_.failed(identifier, status.error().description());
+    }
+    events_.report({SyncEventKind::Ended, SyncPhase::Install, identifier, status ? size : 0, size,
+                    status ? SyncState::Finished : SyncState::Failed, std::nullopt,
+                    status ? "" : status.error().description()});
+}
+
+void SessionWatch::uninstallEnded(const std::string& identifier, const Status& status) {
+    if (!removing_) return;
+    if (status) {
+        facts_.removed(identifier);
+    } else {
+        facts_.failed(identifier, status.error().description());
+    }
+    events_.report({SyncEventKind::Ended, SyncPhase::Remove, identifier, status ? 1U : 0U, 1,
+                    status ? SyncState::Finished : SyncState::Failed, std::nullopt,
+                    status ? "" : status.error().description()});
+}
+
+void SessionWatch::poll() {
+    std::unique_lock lock(mutex_);
+    while (!ended_.wait_for(lock, kPollInterval, [this] { return isOver_; })) {
+        lock.unlock();
+        reportProgress();
+        lock.lock();
+    }
+}
+
+void SessionWatch::reportProgress() {
+    std::map<std::string, std::uint64_t> installing;
+    {
+        const std::lock_guard guard(mutex_);
+        installing = installing_;
+    }
+    for (const auto& [identifier, size] : installing) {
+        const std::optional<InstallProgress> progress = device_.installProgress(identifier);
+        if (!progress) continue;
+        const auto done =
+            static_cast<std::uint64_t>(progress->unpacked * static_cast<double>(size));
+        events_.report({SyncEventKind::Progress, SyncPhase::Install, identifier, done, size,
+                        SyncState::Active, std::nullopt, ""});
+    }
+}
+
+}  // namespace appsync

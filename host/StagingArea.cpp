@@ -1,0 +1,222 @@
+#include "host/StagingArea.h"
+
+#include <dirent.h>
+#include <fcntl.h>
+#include <sys/stat.h>
+
+#include <algorithm>
+#include <memory>
+#include <set>
+#include <utility>
+#include <vector>
+
+#include "client/Paths.h"
+#include "device/Device.h"
+#include "device/PackageReader.h"
+#include "host/Library.h"
+#include "host/SyncPlan.h"
+#include "platform/FileSystem.h"
+#include "platform/PropertyListSerialization.h"
+#include "system/RootDirectory.h"
+
+namespace appsync {
+namespace {
+
+constexpr std::uint64_t kMaximumIconBytes = std::uint64_t{8} << 20;
+constexpr std::string_view kUnfinishedStagingArea =
+    "/var/mobile/Media/PublicStaging/ApplicationSync.new";
+constexpr std::string_view kTodoListName = "ApplicationsSync.plist";
+constexpr std::string_view kPackageSuffix = ".zip";
+// Twice what a device is expected to hold: a session with more would go on for hours.
+constexpr std::size_t kMostInstalls = 20'000;
+
+const FileAttributes kMobile{"mobile", "mobile"};
+
+PropertyList todoEntry(std::string_view identifier, std::string_view operation) {
+    return PropertyList::map({{"identifier", identifier}, {"operation", operation}});
+}
+
+PropertyList installEntry(const PlannedInstall& planned) {
+    PropertyList entry = todoEntry(planned.identifier, "install");
+    if (!planned.newVersion.empty()) entry.set("version", planned.newVersion);
+    if (!planned.name.empty()) entry.set("name", planned.name);
+    return entry;
+}
+
+// Writes the files of a staging area that nobody looks at yet. The first failure stays.
+class StagingWriter {
+  public:
+    StagingWriter(Device& device, std::string directory)
+        : device_(device), directory_(std::move(directory)) {}
+
+    Status write(const SyncPlan& plan, const Library& library) {
+        status_ = device_.files().createDirectory(directory_, true, &kMobile);
+        addTodoList(plan);
+        if (library.iconOrder) add("DeskoraIconState.plist", *library.iconOrder);
+        for (const PlannedInstall& each : plan.install) addApplication(library, each.identifier);
+        for (const PlannedInstall& each : plan.update) addApplication(library, each.identifier);
+        return status_;
+    }
+
+  private:
+    void addTodoList(const SyncPlan& plan) {
+        const Result<Bytes> bytes =
+            device_.propertyLists().serialize(todoListOf(plan), PropertyListFormat::Binary);
+        if (bytes) {
+            add(std::string(kTodoListName), *bytes);
+        } else if (status_) {
+            status_ = bytes.error();
+        }
+    }
+
+    void addApplication(const Library& library, const std::string& identifier) {
+        const LibraryPackage* known = library.find(identifier);
+        if (known == nullptr || !status_) return;
+        Result<PackageReader> package = PackageReader::open(known->file, device_.propertyLists());
+        if (!package) return;  // the transfer will say so
+        status_ = device_.files().createDirectory(directory_ + "/" + identifier, false, &kMobile);
+        addIcon(identifier, *package);
+        addPart(identifier + "/VessikMetadata.plist", package->readStoreMetadata());
+        addPart(identifier + "/Info.plist", package->readInfoPropertyList());
+    }
+
+    void addIcon(const std::string& identifier, PackageReader& package) {
+        const std::string& name = package.info().iconFile;
+        const Result<Bytes> icon = package.readBundleFile(name, kMaximumIconBytes);
+        addPart(identifier + "/" + name, icon);
+        if (name != "VessikArtwork") addPart(identifier + "/VessikArtwork", icon);
+    }
+
+    // What a package lacks, it lacks here too.
+    void addPart(const std::string& name, const Result<Bytes>& bytes) {
+        if (bytes) add(name, *bytes);
+    }
+
+    void add(const std::string& name, ByteView contents) {
+        if (!status_) return;
+        status_ = device_.files().createFile(directory_ + "/" + name, contents, kMobile);
+    }
+
+    Device& device_;
+    const std::string directory_;
+    Status status_;
+};
+
+Status takeIntoPlace(FileSystem& files) {
+    const std::string place(kStagingArea);
+    // Not only what exists: a link that leads nowhere would be in the way, too.
+    files.removeItem(place).ignore();
+    return files.moveItem(std::string(kUnfinishedStagingArea), place);
+}
+
+struct CloseDirectory {
+    void operator()(DIR* directory) const { ::closedir(directory); }
+};
+
+// The names in a directory of the device; none when there is no such directory.
+std::vector<std::string> namesIn(const RootDirectory& root, std::string_view path) {
+    std::vector<std::string> names;
+    Result<UniqueFd> descriptor = root.openDirectory(std::string(path));
+    if (!descriptor) return names;
+    const std::unique_ptr<DIR, CloseDirectory> directory(::fdopendir(descriptor->get()));
+    if (!directory) return names;
+    [[maybe_unused]] const int owned = descriptor->release();  // the directory's now
+    while (const dirent* entry = ::readdir(directory.get())) names.emplace_back(entry->d_name);
+    return names;
+}
+
+void collectPaths(const PropertyList& restoreState, std::set<std::string>& paths) {
+    for (const PropertyList::Entry& application : restoreState.entries()) {
+        for (const PropertyList::Entry& version : application.value.entries()) {
+            if (const std::string* path = version.value.findString("path")) paths.insert(*path);
+        }
+    }
+}
+
+std::set<std::string> packagesThatWait(Device& device) {
+    std::set<std::string> paths;
+    const Result<Bytes> bytes = device.files().readFile(std::string(kRestoreStatePath));
+    if (!bytes) return paths;
+    const Result<PropertyList> state = device.propertyLists().parse(*bytes);
+    if (state) collectPaths(*state, paths);
+    return paths;
+}
+
+bool isLink(const RootDirectory& root, const std::string& path) {
+    const Result<ItemPlace> place = root.place(path);
+    if (!place) return false;
+    struct stat attributes {};
+    const int found =
+        ::fstatat(place->directory.get(), place->name.c_str(), &attributes, AT_SYMLINK_NOFOLLOW);
+    return found == 0 && S_ISLNK(attributes.st_mode);
+}
+
+Result<PropertyList> loadTodoList(Device& device, const std::string& path) {
+    const Result<Bytes> bytes = device.files().readFile(path);
+    if (!bytes) return bytes.error();
+    return device.propertyLists().parse(*bytes);
+}
+
+std::size_t installsIn(const PropertyList& todoList) {
+    std::size_t count = 0;
+    for (const PropertyList& entry : todoList.elements()) {
+        const std::string* operation = entry.findString("operation");
+        if (operation != nullptr && *operation == "install") ++count;
+    }
+    return count;
+}
+
+}  // namespace
+
+PropertyList todoListOf(const SyncPlan& plan) {
+    PropertyList list = PropertyList::array(plan.remove.size() + plan.install.size());
+    for (const std::string& identifier : plan.remove) list.append(todoEntry(identifier, "remove"));
+    for (const PlannedInstall& each : plan.install) list.append(installEntry(each));
+    for (const PlannedInstall& each : plan.update) list.append(installEntry(each));
+    return list;
+}
+
+Status writeStagingArea(Device& device, const SyncPlan& plan, const Library& library) {
+    const std::string unfinished(kUnfinishedStagingArea);
+    device.files().removeItem(unfinished).ignore();
+    Status status = StagingWriter(device, unfinished).write(plan, library);
+    if (status) status = takeIntoPlace(device.files());
+    if (!status) device.files().removeItem(unfinished).ignore();
+    return status;
+}
+
+StagedTodoList readStagedTodoList(Device& device) {
+    StagedTodoList staged;
+    const std::string place(kStagingArea);
+    if (!device.files().itemExists(place)) {
+        if (isLink(device.root(), place)) staged.error = place + " is a link that leads nowhere";
+        return staged;
+    }
+    Result<PropertyList> list = loadTodoList(device, place + "/" + std::string(kTodoListName));
+    if (!list) {
+        staged.error = list.error().description();
+    } else if (!list->isArray()) {
+        staged.error = "it is not a list";
+    } else if (const std::size_t installs = installsIn(*list); installs > kMostInstalls) {
+        staged.error = "it asks for " + std::to_string(installs) + " installs, and " +
+                       std::to_string(kMostInstalls) + " are the most";
+        staged.isTooLarge = true;
+    } else {
+        staged.list = *std::move(list);
+    }
+    return staged;
+}
+
+Status removeStaleTransfers(Device& device) {
+    const std::set<std::string> waiting = packagesThatWait(device);
+    device.files().removeItem(std::string(kUnfinishedStagingArea)).ignore();
+    for (const std::string& name : namesIn(device.root(), kPublicStaging)) {
+        const std::string path = std::string(kPublicStaging) + "/" + name;
+        if (!name.ends_with(kPackageSuffix) || waiting.contains(path)) continue;
+        Status removed = device.files().removeItem(path);
+        if (!removed) return removed;
+    }
+    return {};
+}
+
+}  // namespace appsync

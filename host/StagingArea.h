@@ -1,0 +1,40 @@
+#pragma once
+
+#include <optional>
+#include <string>
+#include <string_view>
+
+#include "platform/PropertyList.h"
+#include "platform/Result.h"
+
+namespace appsync {
+
+class Device;
+struct Library;
+struct SyncPlan;
+
+/// The todo list of a plan: its removals, then its installs and updates.
+[[nodiscard]] PropertyList todoListOf(const SyncPlan& plan);
+
+/// Writes the staging area for the plan: the todo list, the icon layout, and a directory for each
+/// application that is to come. It is built beside its place and then renamed, in the place of one
+/// that stood there: whoever looks sees all of it or none. A package that cannot be read any more
+/// gets no directory. On failure nothing stays.
+Status writeStagingArea(Device& device, const SyncPlan& plan, const Library& library);
+
+/// What a host left in the staging area of the device.
+struct StagedTodoList {
+    /// Null when there is none, or no usable one.
+    PropertyList list;
+    /// Why a staging area has no usable one.
+    std::optional<std::string> error;
+    /// It asks for more than a session can do: the device must not get to see it.
+    bool isTooLarge = false;
+};
+[[nodiscard]] StagedTodoList readStagedTodoList(Device& device);
+
+/// Removes what an interrupted session left among the received files: packages, but not those that
+/// wait for their application's data, and a staging area that was not finished.
+Status removeStaleTransfers(Device& device);
+
+}  // namespace appsync

@@ -1,0 +1,36 @@
+#pragma once
+
+#include <string>
+#include <string_view>
+
+#include "platform/SyncHost.h"
+
+namespace appsync {
+
+/// Domain of errors of a transfer that the host itself finds.
+inline constexpr std::string_view kTransferErrorDomain = "AppsyncTransfer";
+
+/// The codes of `kTransferErrorDomain`.
+enum TransferErrorCode : int {
+    kTransferInterrupted = 1,  // the person stopped it: recoverable
+    kTransferNoPackage = 2,    // the library has no package of that identifier
+    kTransferIllegalName = 3,  // no legal identifier
+    kTransferCutShort = 4,     // the package became shorter while it was sent: recoverable
+};
+
+/// The sync daemon that loads the plug-in.
+class SyncDaemon : public SyncHost {
+  public:
+    [[nodiscard]] std::string mainBundleIdentifier() const override { return "com.korvu.trd"; }
+    [[nodiscard]] std::string pluginBundleIdentifier() const override {
+        return "com.korvu.trd.appsync";
+    }
+
+    /// Recoverable is what a later try may not meet again: a transfer that was interrupted or cut
+    /// short, and those failures of the operating system that pass (a full disk, a read error, no
+    /// more memory or descriptors, a call that was interrupted or timed out). Everything else is
+    /// not: a package that is missing or refused stays so.
+    [[nodiscard]] bool isRecoverableError(const ErrorRecord& error) const override;
+};
+
+}  // namespace appsync

@@ -1,0 +1,200 @@
+#include "host/SyncDisplays.h"
+
+#include <algorithm>
+#include <array>
+#include <cstdio>
+#include <ostream>
+
+#include "host/Console.h"
+#include "host/Json.h"
+#include "host/Text.h"
+
+namespace appsync {
+namespace {
+
+constexpr std::size_t kPhaseWidth = 9;
+constexpr std::size_t kNameWidth = 28;
+constexpr std::size_t kBarWidth = 20;
+
+std::string percentText(const SyncEvent& event) {
+    return std::to_string(percentOf(event.done, event.total)) + " %";
+}
+
+std::string waitText(const SyncEvent& event) {
+    std::string text = "waiting: " + event.text;
+    if (event.nextTry) text += "; next try at " + formatClock(*event.nextTry);
+    return text;
+}
+
+std::string stateText(const SyncEvent& event) {
+    switch (event.state) {
+        case SyncState::Waiting:
+            return waitText(event);
+        case SyncState::Finished:
+            return "done";
+        case SyncState::Failed:
+            return "failed: " + event.text;
+        case SyncState::Active:
+            break;
+    }
+    if (event.kind == SyncEventKind::Started) return "begins";
+    return percentText(event) + " (" + formatBytes(event.done) + " of " + formatBytes(event.total) +
+           ")";
+}
+
+// A line per event.
+class LineDisplay : public SyncDisplay {
+  public:
+    explicit LineDisplay(const Console& console) : console_(console) {}
+
+    void show(const SyncEvent& event) override {
+        console_.out << eventLine(event) << '\n' << std::flush;
+    }
+
+    void finish(const SyncSummary& summary) override {
+        console_.out << summaryText(summary) << std::flush;
+    }
+
+  private:
+    const Console& console_;
+};
+
+// What has ended scrolls up; what is under way is redrawn below it.
+class BarDisplay : public SyncDisplay {
+  public:
+    explicit BarDisplay(const Console& console) : console_(console) {}
+
+    void show(const SyncEvent& event) override {
+        const auto drawn = std::find_if(bars_.begin(), bars_.end(), [&](const SyncEvent& bar) {
+            return bar.phase == event.phase && bar.identifier == event.identifier;
+        });
+        erase();
+        if (event.kind == SyncEventKind::Ended) {
+            if (drawn != bars_.end()) bars_.erase(drawn);
+            console_.out << eventBar(event, console_.width - 1) << '\n';
+        } else if (drawn != bars_.end()) {
+            *drawn = event;
+        } else {
+            bars_.push_back(event);
+        }
+        draw();
+    }
+
+    void finish(const SyncSummary& summary) override {
+        erase();
+        console_.out << summaryText(summary) << std::flush;
+    }
+
+  private:
+    void erase() {
+        if (drawnLines_ > 0) console_.out << "\x1b[" << drawnLines_ << "A\x1b[J";
+        drawnLines_ = 0;
+    }
+
+    void draw() {
+        constexpr std::size_t kMostBars = 12;  // more could be taller than the window
+        drawnLines_ = std::min(bars_.size(), kMostBars);
+        for (std::size_t index = 0; index < drawnLines_; ++index) {
+            console_.out << eventBar(bars_[index], console_.width - 1) << '\n';
+        }
+        console_.out << std::flush;
+    }
+
+    const Console& console_;
+    std::vector<SyncEvent> bars_;
+    std::size_t drawnLines_ = 0;
+};
+
+class JsonDisplay : public SyncDisplay {
+  public:
+    explicit JsonDisplay(const Console& console) : console_(console) {}
+    void show(const SyncEvent&) override {}
+    void finish(const SyncSummary& summary) override {
+        console_.out << jsonText(summary, JsonLayout::Indented) << '\n' << std::flush;
+    }
+
+  private:
+    const Console& console_;
+};
+
+class JsonLinesDisplay : public SyncDisplay {
+  public:
+    explicit JsonLinesDisplay(const Console& console) : console_(console) {}
+    void show(const SyncEvent& event) override {
+        console_.out << jsonText(event) << '\n' << std::flush;
+    }
+    void finish(const SyncSummary& summary) override {
+        console_.out << jsonText(summary, JsonLayout::SummaryLine) << '\n' << std::flush;
+    }
+
+  private:
+    const Console& console_;
+};
+
+std::string listed(const char* title, const std::vector<std::string>& identifiers) {
+    if (identifiers.empty()) return {};
+    std::string text = std::string(title) + " " + std::to_string(identifiers.size()) + ":";
+    constexpr std::size_t kMost = 20;
+    for (std::size_t index = 0; index < std::min(identifiers.size(), kMost); ++index) {
+        text += " " + printable(identifiers[index]);
+    }
+    if (identifiers.size() > kMost) text += " ...";
+    return text + "\n";
+}
+
+std::string amountLine(const SyncSummary& summary) {
+    std::array<char, 32> seconds{};
+    std::snprintf(seconds.data(), seconds.size(), "%.1f", summary.seconds);
+    return formatBytes(summary.bytes) + " sent in " + seconds.data() + " s\n";
+}
+
+}  // namespace
+
+std::string eventLine(const SyncEvent& event) {
+    return std::string(nameOf(event.phase)) + " " + printable(event.identifier) + ": " +
+           printable(stateText(event));
+}
+
+std::string eventBar(const SyncEvent& event, std::size_t width) {
+    std::string line = fitted(nameOf(event.phase), kPhaseWidth) +
+                       fitted(printable(event.identifier), kNameWidth) + " ";
+    if (event.state == SyncState::Waiting || event.state == SyncState::Failed) {
+        line += printable(stateText(event));
+    } else {
+        const unsigned percent = percentOf(event.done, event.total);
+        const std::size_t filled = percent * kBarWidth / 100;
+        std::array<char, 8> number{};
+        std::snprintf(number.data(), number.size(), " %3u %%", percent);
+        line += "[" + std::string(filled, '#') + std::string(kBarWidth - filled, '.') + "]" +
+                number.data();
+    }
+    return displayWidth(line) > width ? fitted(line, width) : line;
+}
+
+std::string summaryText(const SyncSummary& summary) {
+    std::string text = listed("Installed", summary.installed) + listed("Updated", summary.updated) +
+                       listed("Removed", summary.removed);
+    for (const PlannedSkip& skip : summary.skipped) {
+        text += "Skipped " + printable(skip.identifier) + ": " + printable(skip.why) + "\n";
+    }
+    for (const SyncFailure& failed : summary.failed) {
+        text += "Failed " + printable(failed.identifier) + ": " + printable(failed.error) + "\n";
+    }
+    if (text.empty() && summary.requested.empty()) return "Nothing to do: all is in step.\n";
+    return text + amountLine(summary);
+}
+
+std::unique_ptr<SyncDisplay> makeSyncDisplay(SyncDisplayKind kind, const Console& console) {
+    switch (kind) {
+        case SyncDisplayKind::Json:
+            return std::make_unique<JsonDisplay>(console);
+        case SyncDisplayKind::JsonLines:
+            return std::make_unique<JsonLinesDisplay>(console);
+        case SyncDisplayKind::Text:
+            break;
+    }
+    if (console.isTerminal) return std::make_unique<BarDisplay>(console);
+    return std::make_unique<LineDisplay>(console);
+}
+
+}  // namespace appsync

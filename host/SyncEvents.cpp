@@ -1,0 +1,82 @@
+#include "host/SyncEvents.h"
+
+#include <algorithm>
+
+namespace appsync {
+
+std::string_view nameOf(SyncEventKind kind) {
+    switch (kind) {
+        case SyncEventKind::Started:
+            return "started";
+        case SyncEventKind::Progress:
+            return "progress";
+        case SyncEventKind::Waiting:
+            return "waiting";
+        case SyncEventKind::Ended:
+            return "ended";
+    }
+    return "";
+}
+
+std::string_view nameOf(SyncPhase phase) {
+    switch (phase) {
+        case SyncPhase::Remove:
+            return "remove";
+        case SyncPhase::Transfer:
+            return "transfer";
+        case SyncPhase::Install:
+            return "install";
+    }
+    return "";
+}
+
+std::string_view nameOf(SyncState state) {
+    switch (state) {
+        case SyncState::Active:
+            return "active";
+        case SyncState::Waiting:
+            return "waiting";
+        case SyncState::Finished:
+            return "finished";
+        case SyncState::Failed:
+            return "failed";
+    }
+    return "";
+}
+
+unsigned percentOf(std::uint64_t done, std::uint64_t total) {
+    if (done >= total) return 100;
+    const double fraction = static_cast<double>(done) / static_cast<double>(total);
+    return std::min(99U, static_cast<unsigned>(fraction * 100));
+}
+
+namespace {
+
+bool isNews(const SyncEvent& progress, const SyncEvent& last) {
+    if (last.kind == SyncEventKind::Ended) return false;  // it comes too late
+    return progress.state != last.state ||
+           percentOf(progress.done, progress.total) > percentOf(last.done, last.total);
+}
+
+}  // namespace
+
+void SyncEvents::report(SyncEvent event) {
+    const std::lock_guard guard(mutex_);
+    const auto [position, isFirst] = shown_.try_emplace({event.phase, event.identifier}, event);
+    SyncEvent& last = position->second;
+    if (!isFirst) {
+        if (last.total > 0) event.total = last.total;
+        event.done = std::max(event.done, last.done);
+    }
+    event.done = std::min(event.done, event.total);
+    if (!isFirst && event.kind == SyncEventKind::Progress && !isNews(event, last)) return;
+    last = event;
+    display_.show(event);
+}
+
+void SyncEvents::finish(const SyncSummary& summary) {
+    const std::lock_guard guard(mutex_);
+    display_.finish(summary);
+}
+
+}  // namespace appsync

@@ -1,0 +1,85 @@
+#pragma once
+
+#include <chrono>
+#include <cstdint>
+#include <map>
+#include <mutex>
+#include <optional>
+#include <string>
+#include <string_view>
+#include <utility>
+#include <vector>
+
+#include "host/SyncPlan.h"
+
+namespace appsync {
+
+enum class SyncEventKind { Started, Progress, Waiting, Ended };
+enum class SyncPhase { Remove, Transfer, Install };
+enum class SyncState { Active, Waiting, Finished, Failed };
+
+[[nodiscard]] std::string_view nameOf(SyncEventKind kind);
+[[nodiscard]] std::string_view nameOf(SyncPhase phase);
+[[nodiscard]] std::string_view nameOf(SyncState state);
+
+/// Something that happened to one application in a session.
+struct SyncEvent {
+    SyncEventKind kind = SyncEventKind::Started;
+    SyncPhase phase = SyncPhase::Transfer;
+    std::string identifier;
+    /// Bytes; `done` never passes `total` and never goes back within one phase of an identifier.
+    std::uint64_t done = 0;
+    std::uint64_t total = 0;
+    SyncState state = SyncState::Active;
+    /// When what waits is tried again.
+    std::optional<std::chrono::system_clock::time_point> nextTry;
+    /// Why it failed, or what it waits for.
+    std::string text;
+};
+
+/// What came of a session.
+struct SyncSummary {
+    std::vector<std::string> requested;
+    std::vector<std::string> installed;
+    std::vector<std::string> updated;
+    std::vector<std::string> removed;
+    std::vector<SyncFailure> failed;
+    std::vector<PlannedSkip> skipped;
+    std::uint64_t bytes = 0;
+    double seconds = 0;
+    /// Something that was asked for did not happen.
+    bool incomplete = false;
+};
+
+/// Shows a session to whoever started it. One call at a time.
+class SyncDisplay {
+  public:
+    virtual ~SyncDisplay() = default;
+    virtual void show(const SyncEvent& event) = 0;
+    /// The session is over; nothing is shown after this.
+    virtual void finish(const SyncSummary& summary) = 0;
+};
+
+/// Brings the events of all threads in one order and hands them to a display. What would make
+/// progress go back is raised to what was shown before, what passes the total is cut, and a
+/// progress event that shows no new whole per cent is dropped.
+class SyncEvents {
+  public:
+    explicit SyncEvents(SyncDisplay& display) : display_(display) {}
+
+    /// Callable on any thread.
+    void report(SyncEvent event);
+    /// The last call.
+    void finish(const SyncSummary& summary);
+
+  private:
+    SyncDisplay& display_;
+    std::mutex mutex_;
+    // Guarded by mutex_: the last event shown, by phase and identifier.
+    std::map<std::pair<SyncPhase, std::string>, SyncEvent> shown_;
+};
+
+/// How much of the total is done, in whole per cent, rounded down; 100 when the total is 0.
+[[nodiscard]] unsigned percentOf(std::uint64_t done, std::uint64_t total);
+
+}  // namespace appsync

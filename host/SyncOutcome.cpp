@@ -1,0 +1,136 @@
+#include "host/SyncOutcome.h"
+
+#include <algorithm>
+#include <map>
+#include <set>
+#include <utility>
+
+#include "device/Device.h"
+#include "host/Problem.h"
+#include "host/Session.h"
+#include "host/SessionFacts.h"
+#include "host/SyncPlan.h"
+
+namespace appsync {
+namespace {
+
+bool hasUnmet(const std::vector<PlannedSkip>& skipped) {
+    return std::any_of(skipped.begin(), skipped.end(),
+                       [](const PlannedSkip& skip) { return skip.isUnmet; });
+}
+
+class Summarizer {
+  public:
+    Summarizer(const SyncPlan& plan, const SessionFacts& facts, const SessionAftermath& aftermath)
+        : plan_(plan), facts_(facts), aftermath_(aftermath) {
+        for (const ApplicationRecord& record : aftermath.present) {
+            present_.insert(record.identifier);
+            if (!record.isPlaceholder) versions_[record.identifier] = record.version.value_or("");
+        }
+        for (const PlannedInstall& each : plan.install) installs_.insert(each.identifier);
+        for (const PlannedInstall& each : plan.update) installs_.insert(each.identifier);
+    }
+
+    SyncSummary make() {
+        summary_.requested = facts_.requests();
+        summary_.failed = plan_.failed;
+        summary_.skipped = plan_.skipped;
+        for (const std::string& identifier : plan_.remove) judgeRemoval(identifier);
+        for (const PlannedInstall& each : plan_.install) judge(each, summary_.installed);
+        for (const PlannedInstall& each : plan_.update) judge(each, summary_.updated);
+        judgeUnplanned();
+        if (aftermath_.isInterrupted && summary_.failed.empty()) addSessionFailure("interrupted");
+        if (aftermath_.failure) addSessionFailure(*aftermath_.failure);
+        summary_.incomplete = !summary_.failed.empty() || hasUnmet(summary_.skipped);
+        return std::move(summary_);
+    }
+
+  private:
+    void judge(const PlannedInstall& planned, std::vector<std::string>& done) {
+        const auto found = versions_.find(planned.identifier);
+        const bool isThere = found != versions_.end() && facts_.wasInstalled(planned.identifier);
+        if (isThere && (planned.newVersion.empty() || found->second == planned.newVersion)) {
+            done.push_back(planned.identifier);
+        } else if (isThere) {
+            fail(planned.identifier, "version " + found->second + " was installed instead of " +
+                                         planned.newVersion +
+                                         ": the package has changed meanwhile");
+        } else {
+            undone(planned.identifier, aftermath_.installationAllowed,
+                   "device policy does not allow installing applications",
+                   "the device did not ask for its package: appsync log tells why");
+        }
+    }
+
+    void judgeRemoval(const std::string& identifier) {
+        const bool isGone = facts_.wasRemoved(identifier) &&
+                            (!present_.contains(identifier) || installs_.contains(identifier));
+        if (isGone) {
+            summary_.removed.push_back(identifier);
+        } else {
+            undone(identifier, aftermath_.removalAllowed,
+                   "device policy does not allow removing applications", "it is still there");
+        }
+    }
+
+    // What failed without having been in the plan: an entry that the host could make nothing of.
+    void judgeUnplanned() {
+        std::set<std::string> named;
+        for (const SyncFailure& each : summary_.failed) named.insert(each.identifier);
+        for (const std::string& identifier : summary_.requested) {
+            if (installs_.contains(identifier) || !named.insert(identifier).second) continue;
+            if (const auto cause = facts_.firstFailure(identifier)) fail(identifier, *cause);
+        }
+    }
+
+    void undone(const std::string& identifier, bool isAllowed, const std::string& whyForbidden,
+                const std::string& whyElse) {
+        if (const auto cause = facts_.firstFailure(identifier)) return fail(identifier, *cause);
+        if (aftermath_.failure) return fail(identifier, *aftermath_.failure);
+        if (!isAllowed) {
+            summary_.skipped.push_back({identifier, whyForbidden, true});
+            return;
+        }
+        fail(identifier,
+             aftermath_.isInterrupted ? "interrupted: run the same command again" : whyElse);
+    }
+
+    void fail(const std::string& identifier, const std::string& error) {
+        summary_.failed.push_back({identifier, error});
+    }
+
+    void addSessionFailure(const std::string& error) { fail("session", error); }
+
+    const SyncPlan& plan_;
+    const SessionFacts& facts_;
+    const SessionAftermath& aftermath_;
+    std::set<std::string> present_;
+    std::map<std::string, std::string> versions_;
+    std::set<std::string> installs_;
+    SyncSummary summary_;
+};
+
+}  // namespace
+
+Result<SessionAftermath> aftermathOf(Device& device, const SessionEnd& end) {
+    Result<std::vector<ApplicationRecord>> present = device.applications();
+    if (!present) return unusable(present.error());
+    const Result<DeviceSettings> settings = device.settings();
+    if (!settings) return unusable(settings.error());
+    SessionAftermath aftermath;
+    aftermath.present = *std::move(present);
+    aftermath.installationAllowed = settings->installation != PolicyAnswer::No;
+    aftermath.removalAllowed = settings->removal != PolicyAnswer::No;
+    aftermath.isInterrupted = end.isInterrupted;
+    std::optional<ErrorRecord> failure = device.databaseFailure();
+    if (!failure) failure = end.error;
+    if (failure) aftermath.failure = failure->description();
+    return aftermath;
+}
+
+SyncSummary summarize(const SyncPlan& plan, const SessionFacts& facts,
+                      const SessionAftermath& aftermath) {
+    return Summarizer(plan, facts, aftermath).make();
+}
+
+}  // namespace appsync

@@ -1,0 +1,38 @@
+#pragma once
+
+#include <optional>
+#include <string>
+#include <vector>
+
+#include "device/DeviceRecords.h"
+#include "host/SyncEvents.h"
+#include "platform/Result.h"
+
+namespace appsync {
+
+class Device;
+class SessionFacts;
+struct SessionEnd;
+struct SyncPlan;
+
+/// What is known when a session is over.
+struct SessionAftermath {
+    /// Everything that the device holds now.
+    std::vector<ApplicationRecord> present;
+    bool installationAllowed = true;
+    bool removalAllowed = true;
+    bool isInterrupted = false;
+    /// Why the session as a whole failed, if it did.
+    std::optional<std::string> failure;
+};
+
+/// Asks the device what is known.
+[[nodiscard]] Result<SessionAftermath> aftermathOf(Device& device, const SessionEnd& end);
+
+/// Holds the plan against what the device holds after the session: what was asked for and did not
+/// happen is failed, with its first cause, or skipped where policy forbids it. Times and bytes are
+/// the caller's to fill in.
+[[nodiscard]] SyncSummary summarize(const SyncPlan& plan, const SessionFacts& facts,
+                                    const SessionAftermath& aftermath);
+
+}  // namespace appsync

@@ -1,0 +1,247 @@
+#include "host/SyncPlan.h"
+
+#include <algorithm>
+#include <map>
+#include <set>
+#include <string_view>
+#include <utility>
+
+#include "device/DeviceRecords.h"
+#include "device/PackageIdentifier.h"
+#include "host/Library.h"
+#include "host/Text.h"
+#include "platform/AppRegistry.h"
+#include "platform/InstallProgressRecord.h"
+#include "platform/PropertyList.h"
+
+namespace appsync {
+namespace {
+
+// One identifier's records together: the application, and the placeholder that may stand for it.
+struct Present {
+    const ApplicationRecord* application = nullptr;
+    const ApplicationRecord* placeholder = nullptr;
+
+    [[nodiscard]] const ApplicationRecord& any() const {
+        return application ? *application : *placeholder;
+    }
+    [[nodiscard]] bool isSystem() const { return any().type == kApplicationTypeSystem; }
+};
+
+using PresentByIdentifier = std::map<std::string, Present, std::less<>>;
+
+// The placeholder of a sync stands for nothing: it is cleared before the session begins.
+bool isOfSync(const ApplicationRecord& record) {
+    return record.isPlaceholder && record.installType == kInstallTypeSync;
+}
+
+PresentByIdentifier byIdentifier(const std::vector<ApplicationRecord>& present) {
+    PresentByIdentifier result;
+    for (const ApplicationRecord& record : present) {
+        if (isOfSync(record)) continue;
+        Present& entry = result[record.identifier];
+        (record.isPlaceholder ? entry.placeholder : entry.application) = &record;
+    }
+    return result;
+}
+
+bool isOffloaded(const ApplicationRecord& placeholder) {
+    return placeholder.installType == kInstallTypeDowngrade ||
+           placeholder.installType == kInstallTypeIntentionalDowngrade;
+}
+
+std::string whyNot(const Present& present) {
+    if (present.isSystem()) return "it belongs to the system";
+    if (isOffloaded(*present.placeholder)) {
+        return "it is offloaded on the device: appsync send brings it back";
+    }
+    return "another install of it is under way on the device";
+}
+
+PlannedInstall plannedInstall(const LibraryPackage& package, std::string oldVersion) {
+    return {package.identifier, package.name,  std::move(oldVersion),
+            package.version,    package.bytes, package.unpackedBytes};
+}
+
+class Planner {
+  public:
+    Planner(const Library& library, const std::vector<ApplicationRecord>& present,
+            const PlanOptions& options)
+        : library_(library), options_(options), present_(byIdentifier(present)) {}
+
+    SyncPlan make() {
+        for (const LibraryFault& fault : library_.faults) {
+            plan_.failed.push_back({fault.fileName, fault.error});
+        }
+        for (const std::string& identifier : options_.remove) removeNamed(identifier);
+        for (const LibraryPackage& package : library_.packages) bringInStep(package);
+        if (options_.mirror) removeWhatLibraryLacks();
+        return std::move(plan_);
+    }
+
+  private:
+    void removeNamed(const std::string& identifier) {
+        if (!named_.insert(identifier).second) return;
+        const auto found = present_.find(identifier);
+        if (found == present_.end()) {
+            skip(identifier, "it is not on the device", false);
+        } else if (found->second.isSystem()) {
+            skip(identifier, "it belongs to the system", true);
+        } else {
+            remove(identifier, found->second);
+        }
+    }
+
+    void bringInStep(const LibraryPackage& package) {
+        if (named_.contains(package.identifier)) return;
+        const auto found = present_.find(package.identifier);
+        if (found == present_.end()) {
+            plan_.install.push_back(plannedInstall(package, {}));
+            return;
+        }
+        const Present& present = found->second;
+        if (present.isSystem() || present.placeholder != nullptr) {
+            skip(package.identifier, whyNot(present), true);
+        } else if (present.application->version.value_or("") != package.version) {
+            plan_.update.push_back(
+                plannedInstall(package, present.application->version.value_or("")));
+        }
+    }
+
+    void removeWhatLibraryLacks() {
+        for (const auto& [identifier, present] : present_) {
+            if (present.isSystem() || named_.contains(identifier)) continue;
+            if (library_.find(identifier) != nullptr) continue;
+            if (present.application == nullptr && !isOffloaded(*present.placeholder)) continue;
+            if (library_.faults.empty()) {
+                remove(identifier, present);
+            } else {
+                // An unreadable package may be this very application's.
+                skip(identifier, "it is kept while the library holds what cannot be read", true);
+            }
+        }
+    }
+
+    void remove(const std::string& identifier, const Present& present) {
+        plan_.remove.push_back(identifier);
+        plan_.reclaimed += present.any().bytes;
+    }
+
+    void skip(const std::string& identifier, std::string why, bool isUnmet) {
+        plan_.skipped.push_back({identifier, std::move(why), isUnmet});
+    }
+
+    const Library& library_;
+    const PlanOptions& options_;
+    const PresentByIdentifier present_;
+    std::set<std::string> named_;
+    SyncPlan plan_;
+};
+
+// Plans what a todo list asks for; the list may be hostile.
+class StagedPlanner {
+  public:
+    StagedPlanner(const Library& library, const std::vector<ApplicationRecord>& present)
+        : library_(library), present_(byIdentifier(present)) {}
+
+    SyncPlan make(const PropertyList& todoList) {
+        std::size_t number = 0;
+        for (const PropertyList& entry : todoList.elements()) add(entry, ++number);
+        return std::move(plan_);
+    }
+
+  private:
+    void add(const PropertyList& entry, std::size_t number) {
+        const std::string entryName = "entry " + std::to_string(number) + " of the todo list";
+        if (!entry.isMap()) return fail(entryName, "it is not a map");
+        const std::string* operation = entry.findString("operation");
+        if (operation == nullptr) return fail(entryName, "it has no operation");
+        const bool isInstall = *operation == "install";
+        if (!isInstall && *operation != "remove") return;
+        const std::string* identifier = entry.findString("identifier");
+        if (identifier == nullptr) return fail(entryName, "its identifier is not a string");
+        if (!isLegalIdentifier(*identifier)) {
+            return fail(identifier->empty() ? entryName : *identifier,
+                        "it is not a legal identifier");
+        }
+        if (isInstall) {
+            install(*identifier);
+        } else {
+            remove(*identifier);
+        }
+    }
+
+    void install(const std::string& identifier) {
+        if (!installs_.insert(identifier).second) return;
+        const auto found = present_.find(identifier);
+        const bool isUpdate = found != present_.end() && found->second.application != nullptr;
+        PlannedInstall planned{identifier, {}, {}, {}, 0, 0};
+        if (isUpdate) planned.oldVersion = found->second.application->version.value_or("");
+        if (const LibraryPackage* package = library_.find(identifier)) {
+            planned = plannedInstall(*package, planned.oldVersion);
+        }
+        (isUpdate ? plan_.update : plan_.install).push_back(std::move(planned));
+    }
+
+    void remove(const std::string& identifier) {
+        if (!removals_.insert(identifier).second) return;
+        const auto found = present_.find(identifier);
+        if (found == present_.end()) {
+            plan_.skipped.push_back({identifier, "it is not on the device", false});
+            return;
+        }
+        plan_.remove.push_back(identifier);
+        plan_.reclaimed += found->second.any().bytes;
+    }
+
+    void fail(std::string identifier, std::string error) {
+        plan_.failed.push_back({std::move(identifier), std::move(error)});
+    }
+
+    const Library& library_;
+    const PresentByIdentifier present_;
+    std::set<std::string> installs_;
+    std::set<std::string> removals_;
+    SyncPlan plan_;
+};
+
+template <typename Number>
+std::uint64_t total(const SyncPlan& plan, Number number) {
+    std::uint64_t sum = 0;
+    for (const PlannedInstall& each : plan.install) sum += number(each);
+    for (const PlannedInstall& each : plan.update) sum += number(each);
+    return sum;
+}
+
+}  // namespace
+
+std::uint64_t SyncPlan::bytes() const {
+    return total(*this, [](const PlannedInstall& each) { return each.bytes; });
+}
+
+std::uint64_t SyncPlan::needed() const {
+    return total(*this, [](const PlannedInstall& each) { return each.bytes + each.unpackedBytes; });
+}
+
+std::string SpaceCheck::description() const {
+    std::string text =
+        "the plan needs " + formatBytes(needed) + ", the device has " + formatBytes(free) + " free";
+    if (reclaimed > 0) text += " and gets " + formatBytes(reclaimed) + " back from removals";
+    if (!fits()) {
+        text += ", " + formatBytes(missing()) +
+                " are missing: free space on the device or take packages out of the library";
+    }
+    return text;
+}
+
+SyncPlan makePlan(const Library& library, const std::vector<ApplicationRecord>& present,
+                  const PlanOptions& options) {
+    return Planner(library, present, options).make();
+}
+
+SyncPlan makeStagedPlan(const PropertyList& todoList, const Library& library,
+                        const std::vector<ApplicationRecord>& present) {
+    return StagedPlanner(library, present).make(todoList);
+}
+
+}  // namespace appsync

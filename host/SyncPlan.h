@@ -1,0 +1,90 @@
+#pragma once
+
+#include <cstdint>
+#include <string>
+#include <vector>
+
+namespace appsync {
+
+struct ApplicationRecord;
+struct Library;
+class PropertyList;
+
+/// What the person asked for, beside "in step with the library".
+struct PlanOptions {
+    /// Identifiers to remove, whatever the library holds.
+    std::vector<std::string> remove;
+    /// Remove every user application that the library lacks.
+    bool mirror = false;
+};
+
+/// An application to bring to the device, or to bring up to date there.
+struct PlannedInstall {
+    std::string identifier;
+    std::string name;
+    std::string oldVersion;  // empty for one that is absent
+    std::string newVersion;
+    std::uint64_t bytes = 0;          // that travel
+    std::uint64_t unpackedBytes = 0;  // that it takes when installed
+};
+
+/// Something that is left alone.
+struct PlannedSkip {
+    std::string identifier;
+    std::string why;
+    /// It was asked for all the same: the device will not be in step.
+    bool isUnmet = false;
+};
+
+/// An application, or a file, and what is wrong with it.
+struct SyncFailure {
+    std::string identifier;
+    std::string error;
+};
+
+/// What a sync would do.
+struct SyncPlan {
+    std::vector<PlannedInstall> install;
+    std::vector<PlannedInstall> update;
+    std::vector<std::string> remove;
+    std::vector<PlannedSkip> skipped;
+    /// What is asked for but cannot even be tried.
+    std::vector<SyncFailure> failed;
+    /// Bytes on the device that the removals give back.
+    std::uint64_t reclaimed = 0;
+
+    [[nodiscard]] bool empty() const { return install.empty() && update.empty() && remove.empty(); }
+    /// Bytes of all packages that travel.
+    [[nodiscard]] std::uint64_t bytes() const;
+    /// Bytes that the device must have free: every package, and every application unpacked. An
+    /// update too is unpacked beside the version that it replaces.
+    [[nodiscard]] std::uint64_t needed() const;
+};
+
+/// Whether a plan fits on a device.
+struct SpaceCheck {
+    std::uint64_t needed = 0;
+    std::uint64_t free = 0;  // as the device is now
+    /// What the removals give back before the first package comes.
+    std::uint64_t reclaimed = 0;
+
+    [[nodiscard]] std::uint64_t missing() const {
+        const std::uint64_t available = free + reclaimed;
+        return needed > available ? needed - available : 0;
+    }
+    [[nodiscard]] bool fits() const { return missing() == 0; }
+    /// One sentence for people: what is needed, what is free, how much is missing, what to do.
+    [[nodiscard]] std::string description() const;
+};
+
+/// Compares a library with what the device holds (every record of it, in any order).
+[[nodiscard]] SyncPlan makePlan(const Library& library,
+                                const std::vector<ApplicationRecord>& present,
+                                const PlanOptions& options);
+
+/// The plan that a todo list asks for, whatever stands in it. Entries with another operation than
+/// "install" and "remove" ask for nothing.
+[[nodiscard]] SyncPlan makeStagedPlan(const PropertyList& todoList, const Library& library,
+                                      const std::vector<ApplicationRecord>& present);
+
+}  // namespace appsync

@@ -1,0 +1,103 @@
+#include "host/Text.h"
+
+#include <algorithm>
+#include <array>
+#include <cstdio>
+#include <ctime>
+
+namespace appsync {
+namespace {
+
+std::string formatWith(const char* format, const std::tm& parts) {
+    std::array<char, 64> buffer{};
+    const std::size_t length = std::strftime(buffer.data(), buffer.size(), format, &parts);
+    return {buffer.data(), length};
+}
+
+bool isContinuation(char byte) { return (static_cast<unsigned char>(byte) & 0xC0U) == 0x80U; }
+
+std::size_t sequenceLength(unsigned char lead) {
+    if (lead < 0x80) return 1;
+    if (lead >= 0xC2 && lead < 0xE0) return 2;
+    if (lead >= 0xE0 && lead < 0xF0) return 3;
+    if (lead >= 0xF0 && lead < 0xF5) return 4;
+    return 0;
+}
+
+// The length of the well-formed, printable character at the start of the text; 0 when there is
+// none.
+std::size_t printableLength(std::string_view text) {
+    const auto lead = static_cast<unsigned char>(text.front());
+    const std::size_t length = sequenceLength(lead);
+    if (length == 0 || length > text.size()) return 0;
+    const std::string_view tail = text.substr(1, length - 1);
+    if (!std::all_of(tail.begin(), tail.end(), isContinuation)) return 0;
+    if (length == 1) return lead >= 0x20 && lead != 0x7F ? 1 : 0;
+    const bool isControl = lead == 0xC2 && static_cast<unsigned char>(text[1]) < 0xA0;
+    return isControl ? 0 : length;
+}
+
+}  // namespace
+
+std::string formatBytes(std::uint64_t bytes) {
+    if (bytes < 1024) return bytes == 1 ? "1 byte" : std::to_string(bytes) + " bytes";
+    static constexpr std::array kUnits = {"KiB", "MiB", "GiB", "TiB", "PiB", "EiB"};
+    double value = static_cast<double>(bytes) / 1024;
+    std::size_t unit = 0;
+    for (; value >= 1023.95 && unit + 1 < kUnits.size(); ++unit) value /= 1024;
+    std::array<char, 32> buffer{};
+    std::snprintf(buffer.data(), buffer.size(), "%.1f %s", value, kUnits.at(unit));
+    return buffer.data();
+}
+
+std::string formatTime(std::chrono::system_clock::time_point time) {
+    const std::time_t seconds = std::chrono::system_clock::to_time_t(time);
+    std::tm parts{};
+    gmtime_r(&seconds, &parts);
+    return formatWith("%Y-%m-%dT%H:%M:%SZ", parts);
+}
+
+std::string formatClock(std::chrono::system_clock::time_point time) {
+    const std::time_t seconds = std::chrono::system_clock::to_time_t(time);
+    std::tm parts{};
+    localtime_r(&seconds, &parts);
+    return formatWith("%H:%M:%S", parts);
+}
+
+std::string printable(std::string_view text) {
+    std::string result;
+    result.reserve(text.size());
+    while (!text.empty()) {
+        const std::size_t length = printableLength(text);
+        if (length == 0) {
+            result += '?';
+        } else {
+            result += text.substr(0, length);
+        }
+        text.remove_prefix(std::max<std::size_t>(length, 1));
+    }
+    return result;
+}
+
+std::size_t displayWidth(std::string_view text) {
+    return static_cast<std::size_t>(
+        std::count_if(text.begin(), text.end(), [](char byte) { return !isContinuation(byte); }));
+}
+
+std::string fitted(std::string_view text, std::size_t width) {
+    const std::size_t length = displayWidth(text);
+    std::string result(text);
+    if (length <= width) return result.append(width - length, ' ');
+    if (width == 0) return {};
+    std::size_t end = 0;
+    for (std::size_t characters = 0; end < text.size(); ++end) {
+        if (!isContinuation(text[end]) && ++characters == width) break;
+    }
+    return result.substr(0, end) + "~";
+}
+
+std::string counted(std::uint64_t number, std::string_view noun) {
+    return std::to_string(number) + " " + std::string(noun) + (number == 1 ? "" : "s");
+}
+
+}  // namespace appsync

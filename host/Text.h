@@ -1,0 +1,34 @@
+#pragma once
+
+#include <chrono>
+#include <cstddef>
+#include <cstdint>
+#include <string>
+#include <string_view>
+
+namespace appsync {
+
+/// A number of bytes for people: "812 bytes", "1.5 MiB".
+[[nodiscard]] std::string formatBytes(std::uint64_t bytes);
+
+/// A point in time as ISO 8601 in UTC, to the second: "2026-01-31T12:00:00Z".
+[[nodiscard]] std::string formatTime(std::chrono::system_clock::time_point time);
+
+/// The time of day in the machine's time zone: "12:00:00".
+[[nodiscard]] std::string formatClock(std::chrono::system_clock::time_point time);
+
+/// The text with everything that a terminal could take for a command (control characters, broken
+/// UTF-8) replaced by "?".
+[[nodiscard]] std::string printable(std::string_view text);
+
+/// The first `width` characters of the text, the last of them "~" when something is cut off, filled
+/// up with blanks. Counts code points.
+[[nodiscard]] std::string fitted(std::string_view text, std::size_t width);
+
+/// The number of code points.
+[[nodiscard]] std::size_t displayWidth(std::string_view text);
+
+/// "1 application", "2 applications".
+[[nodiscard]] std::string counted(std::uint64_t number, std::string_view noun);
+
+}  // namespace appsync

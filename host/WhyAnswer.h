@@ -1,0 +1,38 @@
+#pragma once
+
+#include <chrono>
+#include <optional>
+#include <string>
+
+namespace appsync {
+
+struct ApplicationStatus;
+
+/// What an application waits for.
+struct AwaitedThing {
+    /// "termination", "transfer", "install", "sync", "restore data" or "store".
+    std::string what;
+    /// Who has to do something: an identifier, "host", "device" or "store".
+    std::string who;
+    std::optional<std::chrono::system_clock::time_point> nextTry;
+    /// The same as a sentence, with what a person can do.
+    std::string sentence;
+};
+
+/// Everything about one application in one answer.
+struct WhyAnswer {
+    std::string identifier;
+    /// "installed", "placeholder" or "absent".
+    std::string state;
+    std::optional<AwaitedThing> waitsFor;
+    std::optional<std::string> lastError;
+    /// A sentence for people about the state.
+    std::string sentence;
+};
+
+[[nodiscard]] WhyAnswer explain(const std::string& identifier, const ApplicationStatus& status);
+
+/// The answer for people; ends with a line end.
+[[nodiscard]] std::string whyText(const WhyAnswer& answer);
+
+}  // namespace appsync

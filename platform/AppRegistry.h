@@ -1,0 +1,151 @@
+#pragma once
+
+#include <cstdint>
+#include <functional>
+#include <memory>
+#include <optional>
+#include <string>
+#include <string_view>
+#include <vector>
+
+#include "platform/FileURL.h"
+#include "platform/InstallProgressRecord.h"
+#include "platform/Result.h"
+
+namespace appsync {
+
+/// Keys of a bundle's info dictionary.
+inline constexpr std::string_view BundleIdentifierKey = "BundleIdentifier";
+inline constexpr std::string_view BundleVersionKey = "BundleVersion";
+inline constexpr std::string_view BundleDisplayNameKey = "BundleDisplayName";
+inline constexpr std::string_view BundleExecutableKey = "BundleExecutable";
+inline constexpr std::string_view BundleIconFileKey = "BundleIconFile";
+
+/// Keys of install options. `BundleIdentifierKey` and "RGInstallType" (unsigned integer) are
+/// options too.
+inline constexpr std::string_view PackageTypeKey = "PackageType";
+inline constexpr std::string_view StoreMetadataKey = "StoreMetadata";  // data
+inline constexpr std::string_view AppSinfKey = "ApplicationSINF";      // data, or the null marker
+inline constexpr std::string_view InstallTypeKey = "RGInstallType";
+
+/// Values of `PackageTypeKey`.
+inline constexpr std::string_view PackageTypeCustomer = "Customer";
+inline constexpr std::string_view PackageTypePlaceholder = "Placeholder";
+
+/// Option of an uninstall (boolean): remove the application's placeholder and nothing else.
+inline constexpr std::string_view UninstallPlaceholderOnlyKey = "PlaceholderOnly";
+
+/// Values of an AppProxy's application type.
+inline constexpr std::string_view kApplicationTypeUser = "User";
+inline constexpr std::string_view kApplicationTypeSystem = "System";
+
+/// What an application's bundle is at this moment.
+struct ApplicationState {
+    bool installed = false;
+    bool placeholder = false;
+};
+
+/// The registry's record of one installed application or of one placeholder, as it was when asked
+/// for. An update under way has both: the installed application, and the placeholder that covers
+/// it.
+struct AppProxy {
+    std::string applicationIdentifier;
+    std::optional<std::string> bundleVersion;
+    std::optional<std::string> displayName;
+    /// The directory `<Name>.app`, an absolute device path.
+    std::string bundlePath;
+    /// The directory that holds the bundle and the store metadata file.
+    std::string bundleContainerPath;
+    /// "User" or "System".
+    std::string applicationType{kApplicationTypeUser};
+    /// How it came: an `InstallType`.
+    std::uint64_t installType = 0;
+    ApplicationState state;
+    /// Bytes that the bundle takes on disk.
+    std::uint64_t staticDiskUsage = 0;
+};
+
+/// Hears from the registry, on a thread of the registry's, one call at a time for one observer.
+class AppRegistryObserver {
+  public:
+    virtual ~AppRegistryObserver() = default;
+
+    /// `applicationInstallsArePrioritized:arePaused:`: the installs under way, in two lists. Comes
+    /// once soon after the observer was added, and again whenever the lists change.
+    virtual void applicationInstallsArePrioritized(const std::vector<AppProxy>& prioritized,
+                                                   const std::vector<AppProxy>& paused) = 0;
+
+    /// `applicationInstallsDidCancel:`: somebody cancelled these installs.
+    virtual void applicationInstallsDidCancel(const std::vector<AppProxy>& cancelled) = 0;
+};
+
+/// The device's book of installed applications and placeholders.
+///
+/// Callable on any thread, by several at once. Nothing throws. What it changes, it changes whole:
+/// after a crash each application is there as before the call or as after it. It refuses
+/// identifiers that are not legal (1 to 255 bytes of letters, digits, '.', '-', '_'; not "." or
+/// "..") with an error of `kRegistryErrorDomain`; for errors that a package causes see
+/// `kInstallerErrorDomain`.
+class AppRegistry {
+  public:
+    /// Whether a look-up may answer with a placeholder.
+    enum class Placeholders { Excluded, Included };
+    /// Which bundles to walk: the numbers are the registry's.
+    enum BundleType : unsigned {
+        kEveryBundle = 0,    // every application and placeholder
+        kUserBundles = 1,    // every user application and user placeholder
+        kSystemBundles = 7,  // system applications and their placeholders
+    };
+    /// Gets each proxy in turn; sets `stop` to end the walk.
+    using ProxyCallback = std::function<void(const AppProxy& proxy, bool& stop)>;
+
+    virtual ~AppRegistry() = default;
+
+    /// The record of an identifier. With placeholders included, one that covers an installed
+    /// application is preferred to it; without, only installed applications are looked at.
+    [[nodiscard]] virtual std::optional<AppProxy> proxyForIdentifier(const std::string& identifier,
+                                                                     Placeholders placeholders) = 0;
+
+    /// Whether there is anything under the identifier: an application or a placeholder.
+    [[nodiscard]] virtual bool isApplicationInstalled(const std::string& identifier) = 0;
+
+    /// Calls back, on the calling thread and before it returns, once for each record of the type.
+    /// The callback may call the registry.
+    virtual void enumerateBundles(BundleType type, const ProxyCallback& callback) = 0;
+
+    /// The install-progress record of an application or placeholder, fetched synchronously; null
+    /// when no install is under way for it. `phase` 0 asks for the record of the whole install.
+    [[nodiscard]] virtual std::shared_ptr<InstallProgressRecord> installProgress(
+        const AppProxy& proxy, std::uint64_t phase) = 0;
+
+    /// Ends the install phase that the record is in: loading is over, installing begins.
+    virtual void finishInstallPhase(InstallProgressRecord& record) = 0;
+
+    /// Installs a package. `options` is a map: `PackageTypeKey` = `PackageTypeCustomer`,
+    /// `BundleIdentifierKey` = the identifier that the package must have. Replaces an installed
+    /// version and takes the placeholder away; on failure both are as before. The file is only
+    /// read.
+    virtual Status installPackage(const FileURL& package, const PropertyList& options) = 0;
+
+    /// Installs a directory as a placeholder; the registry takes its own copy. `options` is a map:
+    /// `PackageTypeKey` = `PackageTypePlaceholder`, `BundleIdentifierKey`, `InstallTypeKey`, and
+    /// optionally `StoreMetadataKey` and `AppSinfKey`. An installed application that the
+    /// placeholder covers stays usable.
+    virtual Status installPlaceholderBundle(const FileURL& directory,
+                                            const PropertyList& options) = 0;
+
+    /// Uninstalls. `options` is a map or null (no options). The placeholder goes first: where one
+    /// covers an installed application, it alone is removed. With `UninstallPlaceholderOnlyKey`
+    /// true the application is never touched. An error when there is nothing to remove.
+    virtual Status uninstallApplication(const std::string& identifier,
+                                        const PropertyList& options) = 0;
+
+    /// From now on the observer hears. It is held weakly; while it is being called it is kept
+    /// alive.
+    virtual void addObserver(std::weak_ptr<AppRegistryObserver> observer) = 0;
+    /// No call begins after this one has returned. Known by its address: it may be called from the
+    /// observer's destructor.
+    virtual void removeObserver(const AppRegistryObserver* observer) = 0;
+};
+
+}  // namespace appsync

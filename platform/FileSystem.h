@@ -1,0 +1,73 @@
+#pragma once
+
+#include <cstdint>
+#include <optional>
+#include <string>
+
+#include "platform/Bytes.h"
+#include "platform/Result.h"
+
+namespace appsync {
+
+/// Whom a new file or directory belongs to: account names of the device.
+struct FileAttributes {
+    std::optional<std::string> owner;
+    std::optional<std::string> group;
+};
+
+/// What stands at a path.
+struct ItemAttributes {
+    std::uint64_t size = 0;
+    bool isDirectory = false;
+};
+
+/// The device's files. Paths are absolute device paths; they are resolved inside the device's root,
+/// links and ".." included, and lead nowhere else. A path that holds a NUL is refused.
+///
+/// Callable on any thread; two threads must not change one file at once (the atomic operations
+/// may). Failures are errors of `kPosixErrorDomain` with the errno value and a sentence that names
+/// the operation and the path. Nothing but regular files is ever read or copied: a link at the end
+/// of a path is followed inside the root; a device or a pipe is refused without waiting on it.
+class FileSystem {
+  public:
+    virtual ~FileSystem() = default;
+
+    /// Whether a file or a directory stands there.
+    [[nodiscard]] virtual bool itemExists(const std::string& path) = 0;
+    virtual Result<ItemAttributes> attributes(const std::string& path) = 0;
+
+    /// Makes a directory; the parents too, if asked for, and then one that exists is no failure.
+    /// `attributes` may be null: whatever the device gives by default.
+    virtual Status createDirectory(const std::string& path, bool withIntermediates,
+                                   const FileAttributes* attributes) = 0;
+
+    /// Removes a file, a link (not what it points to) or a directory with everything in it. ENOENT
+    /// when there is none.
+    virtual Status removeItem(const std::string& path) = 0;
+
+    /// Renames. EEXIST when something stands at `to`.
+    virtual Status moveItem(const std::string& from, const std::string& to) = 0;
+
+    /// Copies a regular file. EEXIST when something stands at `to`.
+    virtual Status copyItem(const std::string& from, const std::string& to) = 0;
+
+    /// The whole file, past any cache of the process.
+    virtual Result<Bytes> readFile(const std::string& path) = 0;
+
+    /// Writes the file whole, durably: temporary file in the same directory, sync, rename. After a
+    /// failure or a crash at any instant the old file is there or the new one, and no temporary
+    /// file stays for good.
+    virtual Status writeFileAtomically(const std::string& path, ByteView contents) = 0;
+
+    /// Creates or replaces a file, not atomically. `attributes` as with directories.
+    virtual Status createFile(const std::string& path, ByteView contents,
+                              const FileAttributes& attributes) = 0;
+
+    /// Sets the times of last access and modification to now.
+    virtual Status setTimesToNow(const std::string& path) = 0;
+
+    /// The process's directory for temporary files, without a slash at its end. It exists.
+    [[nodiscard]] virtual std::string temporaryDirectory() = 0;
+};
+
+}  // namespace appsync

@@ -1,0 +1,238 @@
+#include <cstdint>
+
+#include "client/AppsClient.h"
+#include "client/Paths.h"
+#include "client/PropertyListFile.h"
+#include "platform/IconRenderer.h"
+#include "platform/InstallTransactionLog.h"
+
+namespace appsync {
+
+namespace {
+
+// The directory, below that for temporary files, in which placeholder bundles are built.
+constexpr std::string_view kPlaceholderDirectory = "com.korvu.trd.Apps";
+constexpr std::string_view kBundleExtension = ".app";
+constexpr std::string_view kOwner = "mobile";
+constexpr std::string_view kIconFile = "Icon.png";
+constexpr std::string_view kInfoFile = "Info.plist";
+
+constexpr std::string_view kPresselKey = "VKPresselApp";
+constexpr std::string_view kLaunchProhibitedKey = "RGApplicationLaunchProhibited";
+
+constexpr std::string_view kRestoreScenario = "Vessik App Restore";
+constexpr std::string_view kDirectoryFailed = "Failed to create app directory";
+constexpr std::string_view kPlaceholderScenario = "Install placeholder";
+constexpr std::string_view kPlaceholderInstalled = "Installed placeholder";
+constexpr std::string_view kPlaceholderFailed = "Failed to install placeholder";
+
+constexpr std::string_view kPngType = "public.png";
+
+FileAttributes mobileAttributes() { return {std::string(kOwner), std::string(kOwner)}; }
+
+bool flagAt(const PropertyList& map, std::string_view key) {
+    const PropertyList* flag = map.find(key);
+    return flag != nullptr && flag->booleanConversion().value_or(false);
+}
+
+/// The info dictionary that came with the asset; empty when there is none.
+PropertyList infoOf(const Platform& platform, const SyncAsset& asset) {
+    if (!asset.infoPath) return PropertyList::map();
+    return readMapFile(platform, *asset.infoPath).value_or(PropertyList::map());
+}
+
+/// The placeholder's info dictionary. Without a version the asset's has no entry for one.
+PropertyList placeholderInfo(const SyncAsset& asset, const PropertyList& assetInfo) {
+    PropertyList info = PropertyList::map({{BundleIdentifierKey, asset.identifier}});
+    if (const std::string* version = asset.version()) info.set(BundleVersionKey, *version);
+    // The same string on purpose: a placeholder has no executable.
+    info.set(BundleExecutableKey, *asset.prettyName);
+    info.set(BundleDisplayNameKey, *asset.prettyName);
+    info.set(BundleIconFileKey, kIconFile);
+    info.set(kPresselKey, flagAt(assetInfo, kPresselKey));
+    info.set(kLaunchProhibitedKey, flagAt(assetInfo, kLaunchProhibitedKey));
+    return info;
+}
+
+Status installDirectory(AppRegistry& registry, const std::string& directory,
+                        const std::string& identifier) {
+    const auto url = FileURL::fromPath(directory, true);
+    if (!url) return ErrorRecord{std::string(kPosixErrorDomain), kPosixInvalidArgument, {}};
+    return registry.installPlaceholderBundle(
+        *url, PropertyList::map({{PackageTypeKey, PackageTypePlaceholder},
+                                 {BundleIdentifierKey, identifier},
+                                 {InstallTypeKey, std::uint64_t{kInstallTypeSync}}}));
+}
+
+/// The icon as a PNG image; nothing, and a message, when a step fails.
+std::optional<Bytes> encodeIcon(IconRenderer& icons, const IconImage& image, const Log& log) {
+    Bytes buffer;
+    const auto destination = icons.createImageDestination(kPngType, 1, buffer);
+    if (destination == nullptr) {
+        log(Level::Error, "%s|couldn't create image");
+        return std::nullopt;
+    }
+    destination->addImage(image);
+    if (!destination->finalize()) {
+        log(Level::Error, "%s|Couldn't finalize image");
+        return std::nullopt;
+    }
+    return buffer;
+}
+
+std::unique_ptr<IconImage> renderIcon(IconRenderer& icons,
+                                      const std::optional<std::string>& bundlePath,
+                                      const Log& log) {
+    if (!bundlePath) {
+        log(Level::Error, "%s|missing bundlePath");
+        return nullptr;
+    }
+    const auto url = FileURL::fromPath(*bundlePath, true);
+    if (!url) {
+        log(Level::Error, "%s|couldn't create URL");
+        return nullptr;
+    }
+    const auto bundle = icons.openBundle(*url);
+    if (bundle == nullptr) {
+        log(Level::Error, "%s|couldn't create bundle from URL");
+        return nullptr;
+    }
+    auto image = icons.homeScreenIcon(*bundle);
+    if (image == nullptr) log(Level::Error, "%s|couldn't create DK icon from bundle");
+    return image;
+}
+
+}  // namespace
+
+std::string AppsClient::placeholderAppPathForBundleIdentifier(const std::string& identifier) const {
+    const std::string directory = formatPath(
+        kInDirectoryFormat, {platform_.files.temporaryDirectory(), kPlaceholderDirectory});
+    return formatPath(kInDirectoryFormat, {directory, identifier}).append(kBundleExtension);
+}
+
+bool AppsClient::createPlaceHolderPath(const std::string& path, const std::string& identifier,
+                                       const FileAttributes& attributes) {
+    const Status created = platform_.files.createDirectory(path, true, &attributes);
+    if (!created) {
+        platform_.transactions.logScenario(kRestoreScenario, 0, false, identifier,
+                                           kDirectoryFailed);
+    }
+    log_(Level::Default,
+         "%s|Created app directory for '%{public}@' at %{public}@ with err=%{public}@", identifier,
+         path, created ? nullptr : &created.error());
+    return created.ok();
+}
+
+bool AppsClient::writeIconData(const Bytes* iconData, const std::string& path,
+                               std::uint64_t* fileSize, const std::string& identifier,
+                               const FileAttributes& attributes) {
+    if (iconData == nullptr) {
+        log_(Level::Error, "%s|no icon data for '%{public}@'", identifier);
+        return false;
+    }
+    const bool created = platform_.files.createFile(path, *iconData, attributes).ok();
+    std::uint64_t size = 0;
+    if (created) {
+        if (const auto written = platform_.files.attributes(path)) {
+            size = written->size;
+            if (fileSize != nullptr) *fileSize = size;
+        }
+    }
+    log_(Level::Default,
+         "%s|icon data for '%{public}@' was writen to %{public}@ with status:%d fileSize:%llu",
+         identifier, path, created, size);
+    return created;
+}
+
+void AppsClient::_createPlaceHolderApplication(const SyncAsset& asset) {
+    log_(Level::Default, "%s|plist %{public}@", asset.infoPath);
+    const PropertyList assetInfo = infoOf(platform_, asset);
+    if (asset.prettyName.value_or("").empty() || asset.identifier.empty()) return;
+
+    const std::string directory = placeholderAppPathForBundleIdentifier(asset.identifier);
+    if (!createPlaceHolderPath(directory, asset.identifier, mobileAttributes())) return;
+    copyIcon(asset, directory);
+    const PropertyList info = placeholderInfo(asset, assetInfo);
+    const Status written =
+        writePropertyListFile(platform_, formatPath(kInDirectoryFormat, {directory, kInfoFile}),
+                              info, PropertyListFormat::Xml);
+    if (!written) return;
+    installPlaceholder(asset, directory, info);
+}
+
+void AppsClient::copyIcon(const SyncAsset& asset, const std::string& directory) const {
+    if (!asset.icon) return;
+    const std::string& source = asset.icon->path();
+    const std::string destination = formatPath(kInDirectoryFormat, {directory, kIconFile});
+    const Status copied = platform_.files.copyItem(source, destination);
+    if (copied) return;
+    log_(Level::Error, "%s|Copying icon from %{public}@ to %{public}@ failed: %{public}@", source,
+         destination, copied.error());
+}
+
+void AppsClient::installPlaceholder(const SyncAsset& asset, const std::string& directory,
+                                    const PropertyList& info) {
+    log_(Level::Default, "%s|creating placeholder for '%{public}@'. info.plist=%{public}@",
+         asset.identifier, info);
+    const bool installed = installDirectory(platform_.registry, directory, asset.identifier).ok();
+    const PropertyList* isPressel = info.find(kPresselKey);
+    if (installed) {
+        log_(Level::Default,
+             "%s|Installed Placeholder app from path %{public}@: %{public}@ [%{public}@ "
+             "%{public}@] [isPressel: %{public}@]",
+             directory, asset.prettyName, asset.identifier, asset.version(), isPressel);
+    } else {
+        log_(Level::Error,
+             "%s|Placeholder app install failed from path %{public}@: %{public}@ [%{public}@ "
+             "%{public}@] [isPressel: %{public}@]",
+             directory, asset.prettyName, asset.identifier, asset.version(), isPressel);
+    }
+    platform_.transactions.logScenario(kPlaceholderScenario, 0, installed, asset.identifier,
+                                       installed ? kPlaceholderInstalled : kPlaceholderFailed);
+}
+
+bool AppsClient::_makeIconFromBundlePath(const Platform& platform,
+                                         const std::optional<std::string>& bundlePath,
+                                         const std::string& destination) {
+    const Log log(platform);
+    const auto image = renderIcon(platform.icons, bundlePath, log);
+    if (image == nullptr) return false;
+    const std::optional<Bytes> encoded = encodeIcon(platform.icons, *image, log);
+    if (!encoded) return false;
+    if (platform.files.writeFileAtomically(destination, *encoded)) return true;
+    log(Level::Error, "%s|Couldn't save image file to %{public}@", destination);
+    return false;
+}
+
+bool AppsClient::_placeholderExistsForApplication(const std::string& identifier) const {
+    if (_useInstallCoordinator) return false;
+    bool found = false;
+    platform_.registry.enumerateBundles(
+        AppRegistry::kUserBundles, [&](const AppProxy& proxy, bool& stop) {
+            if (proxy.applicationIdentifier != identifier) return;
+            found = true;
+            log_(Level::Default, "%s|Found placeholder for bundle %{public}@", identifier);
+            stop = true;
+        });
+    return found;
+}
+
+void AppsClient::_enumeratePlaceholdersWithBlock(const AppRegistry::ProxyCallback& callback) const {
+    platform_.registry.enumerateBundles(AppRegistry::kEveryBundle,
+                                        [&](const AppProxy& proxy, bool& stop) {
+                                            if (proxy.state.placeholder) callback(proxy, stop);
+                                        });
+}
+
+std::set<std::string> AppsClient::_getSystemAppPlaceholders() const {
+    std::set<std::string> identifiers;
+    platform_.registry.enumerateBundles(AppRegistry::kSystemBundles,
+                                        [&](const AppProxy& proxy, bool&) {
+                                            if (!proxy.state.placeholder) return;
+                                            identifiers.insert(proxy.applicationIdentifier);
+                                        });
+    log_(Level::Default, "%s|SystemAppPlaceholders %{public}@", listOf(identifiers));
+    return identifiers;
+}
+
+}  // namespace appsync

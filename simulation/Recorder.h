@@ -1,0 +1,87 @@
+#pragma once
+
+#include <cstddef>
+#include <functional>
+#include <iosfwd>
+#include <limits>
+#include <map>
+#include <string>
+#include <string_view>
+#include <vector>
+
+#include "platform/LogFacility.h"
+#include "simulation/Scheduler.h"
+
+namespace appsync {
+
+/// One thing that crossed platform/.
+struct RecordEntry {
+    enum class Kind { Call, Message };
+
+    Kind kind = Kind::Call;
+    /// Who was running: "host", "operation 1", "registry", "delayed work".
+    std::string task;
+    SimulatedTime time{0};
+
+    // Of a call: "AppRegistry", "isApplicationInstalled", "com.example.a", "yes". The result is
+    // empty when there is none, or none yet.
+    std::string service;
+    std::string method;
+    std::string arguments;
+    std::string result;
+
+    // Of a message. `text` is rendered, without the "bundle identifier|" that every message of the
+    // plug-in begins with; `prefix` is that beginning.
+    LogLevel level = LogLevel::Default;
+    LogCategory category = LogCategory::General;
+    std::string format;
+    std::string prefix;
+    std::string text;
+
+    /// "AppRegistry.isApplicationInstalled(com.example.a) -> yes", or "8 default the text".
+    [[nodiscard]] std::string line() const;
+};
+
+/// GoogleTest prints entries with it.
+std::ostream& operator<<(std::ostream& out, const RecordEntry& entry);
+
+/// Keeps, in order, everything that crosses platform/, and makes each of these crossings a point at
+/// which the scheduler may switch.
+class Recorder {
+  public:
+    using Hook = std::function<void(const RecordEntry&)>;
+
+    explicit Recorder(Scheduler& scheduler) : scheduler_(scheduler) {}
+
+    /// Switches, records the call and runs its hook. The number is for `end`.
+    std::size_t begin(std::string_view service, std::string_view method, std::string arguments);
+    /// Fills in the result of a call.
+    void end(std::size_t call, std::string result);
+    /// Switches and records a message.
+    void message(const LogMessage& message);
+
+    /// From now on `hook` runs whenever "Service.method" is called, on the caller's flow of
+    /// control, after the call was recorded and before it has any effect. An empty hook ends that.
+    void setHook(std::string call, Hook hook);
+
+    /// Recording costs memory; a long benchmark does without.
+    void setEnabled(bool enabled) { enabled_ = enabled; }
+    /// Whether anybody wants to know arguments and results.
+    [[nodiscard]] bool isListening() const { return enabled_ || !hooks_.empty(); }
+    void clear();
+    [[nodiscard]] const std::vector<RecordEntry>& entries() const { return entries_; }
+    [[nodiscard]] Scheduler& scheduler() { return scheduler_; }
+
+  private:
+    static constexpr std::size_t kNotRecorded = std::numeric_limits<std::size_t>::max();
+
+    [[nodiscard]] Hook hookOf(const RecordEntry& entry) const;
+
+    Scheduler& scheduler_;
+    std::vector<RecordEntry> entries_;
+    std::size_t forgotten_ = 0;  // how many entries were cleared
+    bool enabled_ = true;
+    std::map<std::string, Hook, std::less<>> hooks_;
+};
+
+}  // namespace appsync

@@ -1,0 +1,38 @@
+#include "simulation/SimulatedPropertyLists.h"
+
+#include <string_view>
+
+#include "simulation/RecordedCall.h"
+
+namespace appsync {
+namespace {
+
+constexpr std::string_view kService = "PropertyListSerialization";
+
+ErrorRecord takeFirst(std::deque<ErrorRecord>& errors) {
+    ErrorRecord error = std::move(errors.front());
+    errors.pop_front();
+    return error;
+}
+
+}  // namespace
+
+Result<PropertyList> SimulatedPropertyLists::parse(ByteView bytes) {
+    RecordedCall call(recorder_, kService, "parse", bytes);
+    if (!parseFailures_.empty()) {
+        return call.result(Result<PropertyList>(takeFirst(parseFailures_)));
+    }
+    return call.result(codec_.parse(bytes));
+}
+
+Result<Bytes> SimulatedPropertyLists::serialize(const PropertyList& value,
+                                                PropertyListFormat format) {
+    RecordedCall call(recorder_, kService, "serialize", value,
+                      format == PropertyListFormat::Xml ? "XML" : "binary");
+    if (!serializeFailures_.empty()) {
+        return call.result(Result<Bytes>(takeFirst(serializeFailures_)));
+    }
+    return call.result(codec_.serialize(value, format));
+}
+
+}  // namespace appsync

@@ -1,0 +1,25 @@
+#include "simulation/SimulatedSyncHost.h"
+
+#include <string_view>
+
+#include "simulation/RecordedCall.h"
+
+namespace appsync {
+namespace {
+constexpr std::string_view kService = "SyncHost";
+}
+
+std::string SimulatedSyncHost::mainBundleIdentifier() const {
+    RecordedCall call(recorder_, kService, "mainBundleIdentifier");
+    return call.result(main_);
+}
+
+// Asked with every message: not worth an entry in the recording.
+std::string SimulatedSyncHost::pluginBundleIdentifier() const { return plugin_; }
+
+bool SimulatedSyncHost::isRecoverableError(const ErrorRecord& error) const {
+    RecordedCall call(recorder_, kService, "isRecoverableError", error);
+    return call.result(recoverable_(error));
+}
+
+}  // namespace appsync

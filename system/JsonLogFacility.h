@@ -1,0 +1,66 @@
+#pragma once
+
+#include <chrono>
+#include <cstdint>
+#include <functional>
+#include <memory>
+#include <mutex>
+#include <string>
+#include <string_view>
+
+#include "platform/LogFacility.h"
+#include "system/UniqueFd.h"
+
+namespace appsync {
+
+/// One rendered message. The texts live for the duration of the call that gets it.
+struct LogLine {
+    std::chrono::system_clock::time_point time;
+    LogCategory category = LogCategory::General;
+    LogLevel level = LogLevel::Default;
+    std::string_view message;
+    std::string_view format;
+};
+
+/// The name of a level in a log: "default", "info", "debug", "error" or "fault".
+[[nodiscard]] std::string_view nameOf(LogLevel level) noexcept;
+
+/// The line as one JSON object without a line end: "time" (ISO 8601, UTC, microseconds), "category"
+/// (the number), "level" (the name), "message", "format". Bytes that are not UTF-8 become U+FFFD.
+[[nodiscard]] std::string toJson(const LogLine& line);
+
+/// A log that appends one JSON object a line to a file. Callable on any thread; nothing throws.
+/// Each line is one write, so several processes may share a file that was opened with O_APPEND. A
+/// line that cannot be written is dropped and counted.
+class JsonLogFacility : public LogFacility {
+  public:
+    /// Gets each message, on the thread that logs it, one call at a time. It must not log.
+    using Listener = std::function<void(const LogLine& line)>;
+
+    /// Appends to `file`, opened for writing with O_APPEND.
+    explicit JsonLogFacility(UniqueFd file) : file_(std::move(file)) {}
+
+    void write(const LogMessage& message) noexcept override;
+    [[nodiscard]] std::unique_ptr<LogHandle> makeHandle(std::string_view subsystem,
+                                                        std::string_view category) override;
+
+    /// From now on the listener gets each message; an empty one gets none. No call of the previous
+    /// listener is under way when this returns.
+    void setListener(Listener listener);
+
+    /// How many messages could not be written.
+    [[nodiscard]] std::uint64_t droppedLines() const;
+
+  private:
+    void append(const LogMessage& message);
+    [[nodiscard]] bool writeWhole(std::string_view text);
+
+    mutable std::mutex mutex_;
+    // Protected by mutex_.
+    const UniqueFd file_;
+    Listener listener_;
+    std::uint64_t droppedLines_ = 0;
+    bool lineIsCutOff_ = false;  // the last write ended inside a line
+};
+
+}  // namespace appsync

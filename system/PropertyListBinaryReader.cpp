@@ -1,0 +1,378 @@
+#include "system/PropertyListBinaryReader.h"
+
+#include <algorithm>
+#include <bit>
+#include <memory>
+#include <string>
+#include <string_view>
+#include <unordered_map>
+#include <utility>
+#include <vector>
+
+#include "system/PropertyListBinaryFormat.h"
+#include "system/PropertyListErrors.h"
+#include "system/PropertyListText.h"
+
+namespace appsync {
+
+namespace {
+
+std::uint64_t bigEndian(const std::uint8_t* bytes, std::size_t width) {
+    std::uint64_t value = 0;
+    for (std::size_t i = 0; i < width; ++i) value = value << 8U | bytes[i];
+    return value;
+}
+
+std::uint8_t kindOf(std::uint8_t marker) { return marker & 0xF0U; }
+std::uint8_t lowerHalf(std::uint8_t marker) { return marker & 0x0FU; }
+
+class BinaryReader {
+  public:
+    explicit BinaryReader(ByteView bytes)
+        : bytes_(bytes),
+          valuesLeft_(bytes.size() + kBinaryFreeValues),
+          longBytesLeft_(bytes.size()),
+          keyBytesLeft_(bytes.size() * kBinaryCopiedSize + kBinaryFreeKeyBytes) {}
+
+    Result<PropertyList> read() {
+        PropertyList value;
+        if (readTrailer() && readObject(top_, bytes_.size() - 16, value)) return value;
+        return binaryReadError(problemAt_, problem_);
+    }
+
+  private:
+    /// The content of an object: where it begins and its size in bytes.
+    struct Span {
+        std::size_t at = 0;
+        std::size_t size = 0;
+    };
+
+    bool refuse(std::size_t at, std::string problem) {
+        problemAt_ = at;
+        problem_ = std::move(problem);
+        return false;
+    }
+
+    bool readTrailer() {
+        if (bytes_.size() < kBinaryMagic.size() + kBinaryTrailerSize + 2) {
+            return refuse(bytes_.size(),
+                          "expected at least " +
+                              std::to_string(kBinaryMagic.size() + kBinaryTrailerSize + 2) +
+                              " bytes, found the end");
+        }
+        const std::size_t trailer = bytes_.size() - kBinaryTrailerSize;
+        const std::uint8_t* at = bytes_.data() + trailer;
+        offsetWidth_ = at[6];
+        referenceWidth_ = at[7];
+        objectCount_ = bigEndian(at + 8, 8);
+        top_ = bigEndian(at + 16, 8);
+        table_ = static_cast<std::size_t>(bigEndian(at + 24, 8));
+        return checkTrailer(trailer);
+    }
+
+    bool checkTrailer(std::size_t trailer) {
+        if (offsetWidth_ < 1 || offsetWidth_ > 8) {
+            return refuse(trailer + 6, "expected the width of an offset, 1 to 8");
+        }
+        if (referenceWidth_ < 1 || referenceWidth_ > 8) {
+            return refuse(trailer + 7, "expected the width of a reference, 1 to 8");
+        }
+        if (table_ <= kBinaryMagic.size() || table_ >= trailer) {
+            return refuse(trailer + 24,
+                          "expected the place of the offset table, between the "
+                          "header and the trailer");
+        }
+        const std::size_t tableSize = trailer - table_;
+        if (objectCount_ != tableSize / offsetWidth_ || tableSize % offsetWidth_ != 0) {
+            return refuse(trailer + 8, "expected the number of objects, one for each " +
+                                           std::to_string(offsetWidth_) +
+                                           " bytes of the offset table");
+        }
+        return true;
+    }
+
+    /// Reads the object that is referred to at `from`.
+    bool readObject(std::uint64_t reference, std::size_t from, PropertyList& value) {
+        std::size_t at = 0;
+        if (!locate(reference, from, at)) return false;
+        switch (kindOf(bytes_[at])) {
+            case kBinaryInteger:
+                return readInteger(at, value);
+            case kBinaryReal:
+                return readReal(at, value);
+            case kBinaryData:
+            case kBinaryAscii:
+            case kBinaryUtf16:
+                return readBlock(at, value);
+            case kBinaryArray:
+                return readContainer(at, &BinaryReader::readArray, value);
+            case kBinaryMap:
+                return readContainer(at, &BinaryReader::readMap, value);
+            default:
+                return readSimple(at, value);
+        }
+    }
+
+    /// Where the object stands that is referred to at `from`.
+    bool locate(std::uint64_t reference, std::size_t from, std::size_t& at) {
+        if (reference >= objectCount_) {
+            return refuse(from, "expected the number of an object below " +
+                                    std::to_string(objectCount_) + ", found " +
+                                    std::to_string(reference));
+        }
+        const std::size_t entry = table_ + static_cast<std::size_t>(reference) * offsetWidth_;
+        const std::uint64_t offset = bigEndian(bytes_.data() + entry, offsetWidth_);
+        if (offset < kBinaryMagic.size() || offset >= table_) {
+            return refuse(entry,
+                          "expected the offset of an object, between the header and the "
+                          "offset table, found " +
+                              std::to_string(offset));
+        }
+        at = static_cast<std::size_t>(offset);
+        return true;
+    }
+
+    bool readSimple(std::size_t at, PropertyList& value) {
+        const std::uint8_t marker = bytes_[at];
+        if (marker == kBinaryDate) return readDate(at, value);
+        if (marker != kBinaryFalse && marker != kBinaryTrue) {
+            return refuse(at,
+                          "expected a value (boolean, integer, real, date, data, string, array "
+                          "or map), found an object of kind " +
+                              std::to_string(marker));
+        }
+        value = marker == kBinaryTrue;
+        return true;
+    }
+
+    /// Whether so many bytes are left for objects.
+    bool checkSize(std::size_t at, std::uint64_t size) {
+        return size <= table_ - at || refuse(at, "expected " + std::to_string(size) +
+                                                     " more bytes before the offset "
+                                                     "table, found " +
+                                                     std::to_string(table_ - at));
+    }
+
+    bool readInteger(std::size_t at, PropertyList& value) {
+        const std::uint8_t exponent = lowerHalf(bytes_[at]);
+        if (exponent > 4) return refuse(at, "expected an integer of 1, 2, 4, 8 or 16 bytes");
+        const std::size_t width = std::size_t{1} << exponent;
+        if (!checkSize(at + 1, width)) return false;
+        const std::uint8_t* content = bytes_.data() + at + 1;
+        if (width < 16) {
+            // Narrow ones have no sign; those of 8 bytes do.
+            value = static_cast<std::int64_t>(bigEndian(content, width));
+            return true;
+        }
+        return readWideInteger(at, bigEndian(content, 8), bigEndian(content + 8, 8), value);
+    }
+
+    bool readWideInteger(std::size_t at, std::uint64_t high, std::uint64_t low,
+                         PropertyList& value) {
+        const bool negative = low >> 63U != 0;
+        if (high == 0 && negative) {
+            value = low;
+        } else if (high == (negative ? UINT64_MAX : 0)) {
+            value = static_cast<std::int64_t>(low);
+        } else {
+            return refuse(at, "expected an integer of at most 64 bits");
+        }
+        return true;
+    }
+
+    bool readReal(std::size_t at, PropertyList& value) {
+        const std::uint8_t exponent = lowerHalf(bytes_[at]);
+        if (exponent != 2 && exponent != 3) {
+            return refuse(at, "expected a real number of 4 or 8 bytes");
+        }
+        const std::size_t width = std::size_t{1} << exponent;
+        if (!checkSize(at + 1, width)) return false;
+        const std::uint64_t bits = bigEndian(bytes_.data() + at + 1, width);
+        value = width == 8 ? std::bit_cast<double>(bits)
+                           : double{std::bit_cast<float>(static_cast<std::uint32_t>(bits))};
+        return true;
+    }
+
+    bool readDate(std::size_t at, PropertyList& value) {
+        if (!checkSize(at + 1, 8)) return false;
+        const std::uint64_t bits = bigEndian(bytes_.data() + at + 1, 8);
+        value = PropertyList::Date{std::bit_cast<double>(bits)};
+        return true;
+    }
+
+    /// The content of an object that counts units of so many bytes.
+    bool readSpan(std::size_t at, std::size_t unit, Span& span) {
+        std::uint64_t count = lowerHalf(bytes_[at]);
+        std::size_t begin = at + 1;
+        if (count == kBinaryCountFollows && !readCount(begin, count)) return false;
+        if (count > (table_ - begin) / unit) {
+            return refuse(at, "expected a count that " + std::to_string(table_ - begin) +
+                                  " bytes before the offset table can hold, found " +
+                                  std::to_string(count));
+        }
+        span = {begin, static_cast<std::size_t>(count) * unit};
+        return true;
+    }
+
+    /// Reads a count that stands as an integer object at `at`, and moves `at` behind it.
+    bool readCount(std::size_t& at, std::uint64_t& count) {
+        if (!checkSize(at, 1)) return false;
+        const std::uint8_t exponent = lowerHalf(bytes_[at]);
+        if (kindOf(bytes_[at]) != kBinaryInteger || exponent > 3) {
+            return refuse(at, "expected a count, an integer of 1, 2, 4 or 8 bytes");
+        }
+        const std::size_t width = std::size_t{1} << exponent;
+        if (!checkSize(at + 1, width)) return false;
+        count = bigEndian(bytes_.data() + at + 1, width);
+        at += 1 + width;
+        return true;
+    }
+
+    /// Reads a string or data. Long ones are made once and shared by all that refer to them.
+    bool readBlock(std::size_t at, PropertyList& value) {
+        Span span;
+        if (!readSpan(at, kindOf(bytes_[at]) == kBinaryUtf16 ? 2 : 1, span)) return false;
+        if (span.size <= kBinaryCopiedSize) return makeBlock(at, span, value);
+        if (const auto known = longBlocks_.find(at); known != longBlocks_.end()) {
+            value = known->second;
+            return true;
+        }
+        if (span.size > longBytesLeft_) {
+            return refuse(at, "expected texts and data that do not overlap");
+        }
+        longBytesLeft_ -= span.size;
+        if (!makeBlock(at, span, value)) return false;
+        longBlocks_.emplace(at, value);
+        return true;
+    }
+
+    bool makeBlock(std::size_t at, Span span, PropertyList& value) {
+        const ByteView content = bytes_.subspan(span.at, span.size);
+        if (kindOf(bytes_[at]) == kBinaryData) {
+            value = Bytes(content.begin(), content.end());
+            return true;
+        }
+        std::string text;
+        if (!readText(at, span, text)) return false;
+        value = span.size <= kBinaryCopiedSize
+                    ? PropertyList(std::move(text))
+                    : PropertyList::shared(std::make_shared<const std::string>(std::move(text)));
+        return true;
+    }
+
+    bool readText(std::size_t at, Span span, std::string& text) {
+        const ByteView content = bytes_.subspan(span.at, span.size);
+        if (kindOf(bytes_[at]) == kBinaryUtf16) {
+            const auto bad = appendUtf16AsUtf8(content, text);
+            return !bad ||
+                   refuse(span.at + *bad, "expected UTF-16, found half of a surrogate pair");
+        }
+        const std::string_view all(reinterpret_cast<const char*>(content.data()), content.size());
+        const std::size_t ascii = asciiPrefix(all);
+        if (ascii != all.size()) return refuse(span.at + ascii, "expected an ASCII character");
+        text = all;
+        return true;
+    }
+
+    using ReadContent = bool (BinaryReader::*)(Span, PropertyList&);
+
+    bool readContainer(std::size_t at, ReadContent readContent, PropertyList& value) {
+        if (std::find(open_.begin(), open_.end(), at) != open_.end()) {
+            return refuse(at, "expected a container that is not inside itself");
+        }
+        if (open_.size() == PropertyList::kMaximumDepth) {
+            return refuse(at, "expected at most 128 containers in one another");
+        }
+        const std::size_t width = referenceWidth_ * (kindOf(bytes_[at]) == kBinaryMap ? 2U : 1U);
+        Span span;
+        if (!readSpan(at, width, span)) return false;
+        const std::size_t count = span.size / width;
+        if (count > valuesLeft_) {
+            return refuse(at,
+                          "expected no more values than an input of this size can hold; shared "
+                          "containers make this one larger");
+        }
+        valuesLeft_ -= count;
+        open_.push_back(at);
+        if (!(this->*readContent)(span, value)) return false;
+        open_.pop_back();
+        return true;
+    }
+
+    [[nodiscard]] std::uint64_t referenceAt(std::size_t at) const {
+        return bigEndian(bytes_.data() + at, referenceWidth_);
+    }
+
+    bool readArray(Span span, PropertyList& value) {
+        std::vector<PropertyList> elements(span.size / referenceWidth_);
+        std::size_t at = span.at;
+        for (PropertyList& element : elements) {
+            if (!readObject(referenceAt(at), at, element)) return false;
+            at += referenceWidth_;
+        }
+        return value.becomeArray(elements);
+    }
+
+    bool readMap(Span span, PropertyList& value) {
+        std::vector<PropertyList::Entry> entries(span.size / 2 / referenceWidth_);
+        std::size_t at = span.at;
+        for (auto& [key, inner] : entries) {
+            const std::size_t valueAt = at + span.size / 2;
+            if (!readKey(at, key) || !readObject(referenceAt(valueAt), valueAt, inner))
+                return false;
+            at += referenceWidth_;
+        }
+        if (value.becomeMap(entries)) return true;
+        const std::size_t repeated = PropertyList::findRepeatedKey(entries).value_or(0);
+        return refuse(span.at + repeated * referenceWidth_,
+                      "expected a key that the map does not have yet");
+    }
+
+    /// Reads the key that is referred to at `from`.
+    bool readKey(std::size_t from, std::string& key) {
+        std::size_t at = 0;
+        if (!locate(referenceAt(from), from, at)) return false;
+        const std::uint8_t kind = kindOf(bytes_[at]);
+        if (kind != kBinaryAscii && kind != kBinaryUtf16) {
+            return refuse(at, "expected a string, the key of an entry");
+        }
+        Span span;
+        if (!readSpan(at, kind == kBinaryUtf16 ? 2 : 1, span)) return false;
+        if (span.size <= kBinaryCopiedSize) return readText(at, span, key);
+        return readLongKey(at, key);
+    }
+
+    bool readLongKey(std::size_t at, std::string& key) {
+        PropertyList shared;
+        if (!readBlock(at, shared)) return false;
+        const std::string& text = *shared.asString();
+        if (text.size() > keyBytesLeft_) {
+            return refuse(at, "expected keys that an input of this size can hold");
+        }
+        keyBytesLeft_ -= text.size();
+        key = text;
+        return true;
+    }
+
+    ByteView bytes_;
+    std::size_t offsetWidth_ = 0;
+    std::size_t referenceWidth_ = 0;
+    std::uint64_t objectCount_ = 0;
+    std::uint64_t top_ = 0;
+    std::size_t table_ = 0;
+
+    std::size_t valuesLeft_;
+    std::size_t longBytesLeft_;
+    std::size_t keyBytesLeft_;
+    std::vector<std::size_t> open_;  // where the containers stand that are being read
+    std::unordered_map<std::size_t, PropertyList> longBlocks_;  // by where they stand
+
+    std::size_t problemAt_ = 0;
+    std::string problem_;
+};
+
+}  // namespace
+
+Result<PropertyList> readBinaryPropertyList(ByteView bytes) { return BinaryReader(bytes).read(); }
+
+}  // namespace appsync

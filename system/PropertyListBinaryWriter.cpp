@@ -1,0 +1,240 @@
+#include "system/PropertyListBinaryWriter.h"
+
+#include <array>
+#include <bit>
+#include <optional>
+#include <string_view>
+#include <utility>
+#include <vector>
+
+#include "platform/PropertyListKeyIndex.h"
+#include "system/PropertyListBinaryFormat.h"
+#include "system/PropertyListErrors.h"
+#include "system/PropertyListText.h"
+
+namespace appsync {
+
+namespace {
+
+/// How many bytes (1, 2, 4 or 8) hold a number.
+std::size_t widthOf(std::uint64_t value) {
+    if (value <= 0xFF) return 1;
+    if (value <= 0xFFFF) return 2;
+    return value <= 0xFFFFFFFF ? 4 : 8;
+}
+
+/// The same, 3 and 5 to 7 bytes allowed too.
+std::size_t tightWidthOf(std::uint64_t value) {
+    std::size_t width = 1;
+    while (width < 8 && value >> (8 * width) != 0) ++width;
+    return width;
+}
+
+std::uint8_t exponentOf(std::size_t width) {
+    return static_cast<std::uint8_t>(std::countr_zero(width));
+}
+
+class BinaryWriter {
+  public:
+    Result<Bytes> write(const PropertyList& root) {
+        // Level by level: a container's elements get their numbers when it is met in the list, so
+        // neither this loop nor the next recurses.
+        addValue(root);
+        for (std::size_t i = 0; i < objects_.size(); ++i) {
+            if (const PropertyList* value = objects_[i].value) addElements(*value);
+        }
+        referenceWidth_ = tightWidthOf(objects_.size() - 1);
+        bytes_.reserve(kBinaryMagic.size() + textBytes_ + references_.size() * referenceWidth_ +
+                       objects_.size() * 16 + kBinaryTrailerSize);
+        bytes_.assign(kBinaryMagic.begin(), kBinaryMagic.end());
+        for (const Object& object : objects_) {
+            offsets_.push_back(bytes_.size());
+            if (!writeObject(object)) return writeError(root, object.part, problem_);
+        }
+        writeTableAndTrailer();
+        if (keyBytes_ > bytes_.size() * kBinaryCopiedSize + kBinaryFreeKeyBytes) {
+            return writeError(root, &root, "the same long keys repeat too often; write it as XML");
+        }
+        return std::move(bytes_);
+    }
+
+  private:
+    /// One object of the output: a value other than a string, or a string.
+    struct Object {
+        const PropertyList* value = nullptr;
+        std::string_view text;
+        const void* part = nullptr;  // the first value or key that it stands for
+    };
+
+    std::size_t add(const Object& object) {
+        objects_.push_back(object);
+        return objects_.size() - 1;
+    }
+
+    std::size_t addValue(const PropertyList& value) {
+        if (const std::string* text = value.asString()) return addText(*text, &value);
+        if (const auto content = value.asBoolean()) {
+            std::optional<std::size_t>& known = booleans_[*content ? 1 : 0];
+            if (!known) known = add({&value, {}, &value});
+            return *known;
+        }
+        return add({&value, {}, &value});
+    }
+
+    std::size_t addText(std::string_view text, const void* part) {
+        const std::uint32_t hash = PropertyListKeyIndex::hashOf(text);
+        const auto textAt = [this](std::size_t i) { return objects_[textObjects_[i]].text; };
+        if (const auto known = textIndex_.find(hash, text, textAt)) return textObjects_[*known];
+        if (textObjects_.size() < PropertyListKeyIndex::kMaximumSize) {
+            textIndex_.add(hash, textObjects_.size());
+            textObjects_.push_back(objects_.size());
+        }
+        textBytes_ += text.size();
+        return add({nullptr, text, part});
+    }
+
+    void addElements(const PropertyList& container) {
+        for (const PropertyList& element : container.elements()) {
+            references_.push_back(addValue(element));
+        }
+        for (const auto& [key, value] : container.entries()) {
+            keyBytes_ += key.size();
+            references_.push_back(addText(key, &key));
+        }
+        for (const auto& [key, value] : container.entries()) {
+            references_.push_back(addValue(value));
+        }
+    }
+
+    bool writeObject(const Object& object) {
+        if (object.value == nullptr) return writeText(object.text);
+        const PropertyList& value = *object.value;
+        using Kind = PropertyList::Kind;
+        switch (value.kind()) {
+            case Kind::Null:
+                problem_ = "the null marker cannot be written; remove it";
+                return false;
+            case Kind::Boolean:
+                return putByte(*value.asBoolean() ? kBinaryTrue : kBinaryFalse), true;
+            case Kind::Integer:
+            case Kind::Unsigned:
+                return writeInteger(value), true;
+            case Kind::Real:
+                return writeReal(*value.asReal()), true;
+            case Kind::Date:
+                putByte(kBinaryDate);
+                return putBits(value.asDate()->secondsSince2001), true;
+            case Kind::Data:
+                putMarker(kBinaryData, value.asData()->size());
+                return putBytes(*value.asData()), true;
+            case Kind::Array:
+                putMarker(kBinaryArray, value.size());
+                return writeReferences(value.size()), true;
+            case Kind::Map:
+                putMarker(kBinaryMap, value.size());
+                return writeReferences(value.size() * 2), true;
+            case Kind::String:
+                return writeText(*value.asString());
+        }
+        return false;
+    }
+
+    void writeInteger(const PropertyList& value) {
+        const auto fitting = value.asInteger();
+        if (!fitting) {
+            // Eight bytes would read as a negative number.
+            putByte(kBinaryInteger | 4U);
+            putNumber(0, 8);
+            return putNumber(*value.asUnsigned(), 8);
+        }
+        putInteger(static_cast<std::uint64_t>(*fitting));
+    }
+
+    void putInteger(std::uint64_t value) {
+        const std::size_t width = widthOf(value);
+        putByte(static_cast<std::uint8_t>(kBinaryInteger | exponentOf(width)));
+        putNumber(value, width);
+    }
+
+    void writeReal(double value) {
+        const auto narrow = static_cast<float>(value);
+        if (double{narrow} != value) {
+            putByte(kBinaryReal | 3U);
+            return putBits(value);
+        }
+        putByte(kBinaryReal | 2U);
+        putNumber(std::bit_cast<std::uint32_t>(narrow), 4);
+    }
+
+    bool writeText(std::string_view text) {
+        if (asciiPrefix(text) == text.size()) {
+            putMarker(kBinaryAscii, text.size());
+            const auto* bytes = reinterpret_cast<const std::uint8_t*>(text.data());
+            return putBytes({bytes, text.size()}), true;
+        }
+        const auto wide = utf16FromUtf8(text);
+        if (!wide) {
+            problem_ = "the text is not UTF-8";
+            return false;
+        }
+        putMarker(kBinaryUtf16, wide->size() / 2);
+        return putBytes(*wide), true;
+    }
+
+    /// Containers are met in the order in which their references were noted.
+    void writeReferences(std::size_t count) {
+        for (; count != 0; --count) putNumber(references_[nextReference_++], referenceWidth_);
+    }
+
+    void writeTableAndTrailer() {
+        const std::size_t table = bytes_.size();
+        const std::size_t width = tightWidthOf(table);
+        for (const std::size_t offset : offsets_) putNumber(offset, width);
+        putNumber(0, 6);
+        putByte(static_cast<std::uint8_t>(width));
+        putByte(static_cast<std::uint8_t>(referenceWidth_));
+        putNumber(objects_.size(), 8);
+        putNumber(0, 8);
+        putNumber(table, 8);
+    }
+
+    void putMarker(std::uint8_t kind, std::size_t count) {
+        if (count < kBinaryCountFollows) return putByte(static_cast<std::uint8_t>(kind | count));
+        putByte(kind | kBinaryCountFollows);
+        putInteger(count);
+    }
+
+    void putByte(std::uint8_t byte) { bytes_.push_back(byte); }
+    void putBytes(ByteView bytes) { bytes_.insert(bytes_.end(), bytes.begin(), bytes.end()); }
+    void putBits(double value) { putNumber(std::bit_cast<std::uint64_t>(value), 8); }
+
+    void putNumber(std::uint64_t value, std::size_t width) {
+        std::array<std::uint8_t, 8> digits{};
+        for (std::size_t i = width; i != 0; --i, value >>= 8U) {
+            digits[i - 1] = static_cast<std::uint8_t>(value & 0xFFU);
+        }
+        putBytes({digits.data(), width});
+    }
+
+    std::vector<Object> objects_;
+    std::vector<std::size_t> references_;  // of all containers, one after the other
+    std::vector<std::size_t> textObjects_;
+    PropertyListKeyIndex textIndex_;  // into textObjects_
+    std::array<std::optional<std::size_t>, 2> booleans_;
+    std::size_t textBytes_ = 0;
+    std::size_t keyBytes_ = 0;
+
+    Bytes bytes_;
+    std::vector<std::size_t> offsets_;
+    std::size_t referenceWidth_ = 1;
+    std::size_t nextReference_ = 0;
+    std::string_view problem_;
+};
+
+}  // namespace
+
+Result<Bytes> writeBinaryPropertyList(const PropertyList& value) {
+    return BinaryWriter().write(value);
+}
+
+}  // namespace appsync

@@ -1,0 +1,105 @@
+#include "system/RootDirectory.h"
+
+#include <cerrno>
+#include <optional>
+#include <utility>
+
+#include <fcntl.h>
+#include <linux/openat2.h>
+#include <sys/stat.h>
+#include <sys/syscall.h>
+#include <unistd.h>
+
+#include "system/PosixError.h"
+
+namespace appsync {
+
+namespace {
+
+// The kernel answers EAGAIN where a rename anywhere on the machine met the resolution of a "..".
+constexpr int kResolutionTries = 1000;
+
+bool isWorthRepeating(int code) { return code == EAGAIN || code == EINTR; }
+
+UniqueFd openInRoot(int root, const char* path, int flags, mode_t mode) {
+    open_how how{};
+    how.flags = static_cast<std::uint64_t>(flags | O_CLOEXEC | O_NOCTTY);
+    if ((flags & O_PATH) != 0) how.flags = static_cast<std::uint64_t>(flags | O_CLOEXEC);
+    const bool creates = (flags & O_CREAT) != 0 || (flags & O_TMPFILE) == O_TMPFILE;
+    how.mode = creates ? mode : 0;
+    how.resolve = RESOLVE_IN_ROOT | RESOLVE_NO_MAGICLINKS;
+    UniqueFd opened;
+    for (int tries = 0; tries < kResolutionTries; ++tries) {
+        opened.reset(static_cast<int>(::syscall(SYS_openat2, root, path, &how, sizeof how)));
+        if (opened || !isWorthRepeating(errno)) break;
+    }
+    return opened;
+}
+
+/// What is wrong with the path before anybody looks for it; nothing when it may be used.
+std::optional<std::string_view> complaintAbout(std::string_view path) {
+    if (path.empty()) return "the path is empty";
+    if (path.find('\0') != std::string_view::npos) return "the path holds a NUL";
+    if (path.front() != '/') return "the path is not absolute";
+    return std::nullopt;
+}
+
+}  // namespace
+
+Result<RootDirectory> RootDirectory::open(const std::string& machinePath) {
+    UniqueFd root(::open(machinePath.c_str(), O_RDONLY | O_DIRECTORY | O_CLOEXEC));
+    if (!root) return posixError(errno, "open the device's files in", machinePath);
+    if (!openInRoot(root.get(), "/", O_PATH | O_DIRECTORY, 0)) {
+        const int code = errno;
+        return posixError(code, "resolve paths inside", machinePath,
+                          posixReason(code) + " (this needs openat2: Linux 5.6 or newer)");
+    }
+    return RootDirectory(std::move(root));
+}
+
+Result<UniqueFd> RootDirectory::openFile(const std::string& path, int flags, mode_t mode,
+                                         std::string_view operation) const {
+    if (const auto complaint = complaintAbout(path)) {
+        return posixError(EINVAL, operation, path, *complaint);
+    }
+    UniqueFd opened = openInRoot(descriptor_.get(), path.c_str(), flags, mode);
+    if (!opened) return posixError(errno, operation, path);
+    return opened;
+}
+
+Result<UniqueFd> RootDirectory::openDirectory(const std::string& path,
+                                              std::string_view operation) const {
+    return openFile(path, O_RDONLY | O_DIRECTORY, 0, operation);
+}
+
+Result<RegularFile> RootDirectory::openRegularFile(const std::string& path,
+                                                   std::string_view operation) const {
+    Result<UniqueFd> opened = openFile(path, O_RDONLY | O_NONBLOCK, 0, operation);
+    if (!opened) return opened.error();
+    struct stat status {};
+    if (::fstat(opened->get(), &status) != 0) return posixError(errno, operation, path);
+    if (S_ISDIR(status.st_mode)) return posixError(EISDIR, operation, path);
+    if (!S_ISREG(status.st_mode)) {
+        return posixError(EINVAL, operation, path, "it is not a regular file");
+    }
+    return RegularFile{std::move(*opened), static_cast<std::uint64_t>(status.st_size),
+                       status.st_mode & (S_IRWXU | S_IRWXG | S_IRWXO)};
+}
+
+Result<ItemPlace> RootDirectory::place(const std::string& path, std::string_view operation) const {
+    if (const auto complaint = complaintAbout(path)) {
+        return posixError(EINVAL, operation, path, *complaint);
+    }
+    const std::size_t end = path.find_last_not_of('/') + 1;
+    const std::size_t start = end == 0 ? 0 : path.rfind('/', end - 1) + 1;
+    std::string name = path.substr(start, end - start);
+    if (name.empty() || name == "." || name == "..") {
+        return posixError(EINVAL, operation, path, "the path does not end in a name");
+    }
+    UniqueFd directory =
+        openInRoot(descriptor_.get(), path.substr(0, start).c_str(), O_PATH | O_DIRECTORY, 0);
+    if (!directory) return posixError(errno, operation, path);
+    return ItemPlace{std::move(directory), std::move(name), end < path.size()};
+}
+
+}  // namespace appsync

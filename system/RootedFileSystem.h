@@ -1,0 +1,78 @@
+#pragma once
+
+#include <functional>
+#include <map>
+#include <memory>
+#include <string>
+
+#include <sys/types.h>
+
+#include "platform/FileSystem.h"
+#include "system/RootDirectory.h"
+
+namespace appsync {
+
+/// An account of the machine.
+struct MachineAccount {
+    uid_t user = 0;
+    gid_t group = 0;
+};
+
+/// From account names of the device to accounts of the machine.
+using AccountMap = std::map<std::string, MachineAccount, std::less<>>;
+
+/// How to make a `RootedFileSystem`.
+struct RootedFileSystemOptions {
+    /// The accounts that file attributes may name. "mobile" is added where it is missing: whoever
+    /// owns the root directory.
+    AccountMap accounts;
+    /// The process's directory for temporary files, an absolute device path; it is made if absent.
+    std::string temporaryDirectory = "/tmp";
+};
+
+/// A device's files in a directory of this machine.
+///
+/// Files are written through a temporary file in the same directory, named after the target (see
+/// `isTemporaryName`); the finished file takes the target's name, and where the target was a link,
+/// the link's place. A file that is replaced keeps its permissions and its owner. A crash can leave
+/// a temporary file; `removeStaleTemporaries` clears it.
+class RootedFileSystem : public FileSystem {
+  public:
+    /// The largest file that `readFile` reads.
+    static constexpr std::uint64_t kLargestFile = std::uint64_t{1} << 30U;
+
+    /// Opens the device whose root is at a path of the machine.
+    [[nodiscard]] static Result<std::unique_ptr<RootedFileSystem>> open(
+        const std::string& machinePath, RootedFileSystemOptions options = {});
+
+    /// The root, for work that needs descriptors. Lives as long as this object.
+    [[nodiscard]] const RootDirectory& root() const noexcept { return root_; }
+
+    [[nodiscard]] bool itemExists(const std::string& path) override;
+    Result<ItemAttributes> attributes(const std::string& path) override;
+    Status createDirectory(const std::string& path, bool withIntermediates,
+                           const FileAttributes* attributes) override;
+    Status removeItem(const std::string& path) override;
+    Status moveItem(const std::string& from, const std::string& to) override;
+    Status copyItem(const std::string& from, const std::string& to) override;
+    Result<Bytes> readFile(const std::string& path) override;
+    Status writeFileAtomically(const std::string& path, ByteView contents) override;
+    Status createFile(const std::string& path, ByteView contents,
+                      const FileAttributes& attributes) override;
+    Status setTimesToNow(const std::string& path) override;
+    [[nodiscard]] std::string temporaryDirectory() override;
+
+    /// Removes, from the directory and everything below it, the temporary files that crashed
+    /// processes left. Those that a living process is writing are left alone. No failure when there
+    /// is no such directory.
+    Status removeStaleTemporaries(const std::string& directory);
+
+  private:
+    RootedFileSystem(RootDirectory root, RootedFileSystemOptions options);
+
+    const RootDirectory root_;
+    const AccountMap accounts_;
+    const std::string temporaryDirectory_;
+};
+
+}  // namespace appsync

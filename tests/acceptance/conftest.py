@@ -1,0 +1,100 @@
+"""Drives the built command, named by the environment variable APPSYNC, as a user does."""
+
+import json
+import os
+import subprocess
+
+import pytest
+
+import packages
+
+TIMEOUT = float(os.environ.get("APPSYNC_TEST_TIMEOUT", "120"))
+
+
+class Command:
+    def __init__(self, program):
+        self.program = program
+
+    def __call__(self, *arguments, expect=0, timeout=TIMEOUT, text=True):
+        """Runs the command to its end; `expect` is the exit status that must come (None: any)."""
+        done = subprocess.run(
+            [self.program, *map(str, arguments)],
+            stdin=subprocess.DEVNULL,
+            capture_output=True,
+            text=text,
+            timeout=timeout,
+        )
+        if expect is not None:
+            assert done.returncode == expect, "%s -> %s\n%s\n%s" % (
+                arguments, done.returncode, done.stdout, done.stderr)
+        return done
+
+    def json(self, *arguments, expect=0, **more):
+        return json.loads(self(*arguments, "--json", expect=expect, **more).stdout)
+
+    def start(self, *arguments):
+        return subprocess.Popen(
+            [self.program, *map(str, arguments)],
+            stdin=subprocess.DEVNULL, stdout=subprocess.PIPE, stderr=subprocess.PIPE, text=True)
+
+
+class Device:
+    """A device directory and what the command says of it."""
+
+    def __init__(self, appsync, path):
+        self.appsync = appsync
+        self.path = str(path)
+        appsync("create", self.path)
+
+    def apps(self):
+        return {app["identifier"]: app for app in self.appsync.json("apps", self.path)
+                if app["state"] == "installed"}
+
+    def versions(self):
+        return {name: app["version"] for name, app in self.apps().items()}
+
+    def placeholders(self):
+        return sorted(app["identifier"] for app in self.appsync.json("apps", self.path)
+                      if app["state"] == "placeholder")
+
+    def sync(self, library, *options, expect=0):
+        return self.appsync.json("sync", self.path, library, *options, expect=expect)
+
+    def inside(self, path):
+        return os.path.join(self.path, "root", path.lstrip("/"))
+
+    def container_of(self, identifier):
+        return self.inside(self.apps()[identifier]["container"])
+
+    def tree(self):
+        """Every path below the device's root, without the log and the database."""
+        found = []
+        for base, folders, files in os.walk(os.path.join(self.path, "root")):
+            found += [os.path.relpath(os.path.join(base, name), self.path)
+                      for name in folders + files]
+        return sorted(found)
+
+
+@pytest.fixture(scope="session")
+def appsync():
+    program = os.environ.get("APPSYNC")
+    if not program:
+        pytest.exit("set APPSYNC to the command to test", returncode=2)
+    return Command(os.path.abspath(program))
+
+
+@pytest.fixture
+def device(appsync, tmp_path):
+    return Device(appsync, tmp_path / "device")
+
+
+@pytest.fixture
+def library(tmp_path):
+    folder = str(tmp_path / "library")
+    packages.make_library(folder, 5)
+    return folder
+
+
+def names_of(results):
+    """Identifiers of a result list, whether it holds strings or objects."""
+    return sorted(item if isinstance(item, str) else item["identifier"] for item in results)

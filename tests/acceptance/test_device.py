@@ -1,0 +1,328 @@
+"""Devices that cannot be used, and what the other commands say of those that can."""
+
+import json
+import os
+import plistlib
+import sqlite3
+import subprocess
+import time
+
+import pytest
+
+import packages
+
+COMMANDS = [["apps"], ["history"], ["inventory"], ["log"], ["why", "com.example.app00"], ["reset"],
+            ["set", "installation=no"], ["run", "com.example.app00"]]
+
+
+def one_line(done):
+    assert len(done.stderr.strip().splitlines()) == 1, done.stderr
+    assert "Traceback" not in done.stderr
+    return done.stderr
+
+
+@pytest.mark.parametrize("command", COMMANDS, ids=lambda c: c[0])
+def test_missing_device(appsync, tmp_path, command):
+    one_line(appsync(command[0], tmp_path / "none", *command[1:], expect=3))
+
+
+@pytest.mark.parametrize("command", COMMANDS, ids=lambda c: c[0])
+def test_folder_that_is_no_device(appsync, tmp_path, command):
+    one_line(appsync(command[0], tmp_path, *command[1:], expect=3))
+    assert os.listdir(tmp_path) == []
+
+
+def test_create_refuses_what_exists(appsync, device):
+    one_line(appsync("create", device.path, expect=3))
+    device.apps()
+
+
+def test_create_in_a_missing_folder(appsync, tmp_path):
+    one_line(appsync("create", tmp_path / "a" / "b", expect=3))
+
+
+def test_damaged_database(appsync, device, library):
+    device.sync(library)
+    path = os.path.join(device.path, "device.db")
+    with open(path, "r+b") as file:
+        file.write(os.urandom(8192))
+    for name in ("device.db-wal", "device.db-shm"):
+        if os.path.exists(os.path.join(device.path, name)):
+            os.remove(os.path.join(device.path, name))
+    for command in (["apps", device.path], ["sync", device.path, library]):
+        one_line(appsync(*command, expect=3))
+
+
+def test_database_that_is_gone(appsync, device, library):
+    device.sync(library)
+    os.remove(os.path.join(device.path, "device.db"))
+    one_line(appsync("sync", device.path, library, expect=3))
+    assert not os.path.exists(os.path.join(device.path, "device.db"))
+
+
+def test_newer_schema(appsync, device, library):
+    with sqlite3.connect(os.path.join(device.path, "device.db")) as database:
+        database.execute("PRAGMA user_version = 9999")
+    database.close()
+    one_line(appsync("apps", device.path, expect=3))
+    one_line(appsync("sync", device.path, library, expect=3))
+
+
+def test_second_session_is_told_that_the_device_is_in_use(appsync, device, library):
+    device.sync(library)
+    packages.make_package(library, "com.example.app00", "2.0")
+    appsync("run", device.path, "com.example.app00")
+    first = appsync.start("sync", device.path, library)
+    try:
+        wait_until(lambda: json.loads(appsync("why", device.path, "com.example.app00", "--json").stdout)
+                   .get("waitsFor"))
+        one_line(appsync("sync", device.path, library, expect=3))
+        device.apps()
+    finally:
+        first.kill()
+        first.communicate()
+
+
+def wait_until(condition, limit=60):
+    end = time.monotonic() + limit
+    while not condition():
+        assert time.monotonic() < end, "it never came"
+        time.sleep(0.05)
+
+
+def test_running_application_holds_up_its_install_until_it_quits(appsync, device, library):
+    device.sync(library)
+    packages.make_package(library, "com.example.app00", "2.0")
+    appsync("run", device.path, "com.example.app00")
+    sync = appsync.start("sync", device.path, library, "--json-lines")
+    events = []
+    for line in sync.stdout:
+        events.append(json.loads(line))
+        if events[-1].get("nextTry"):
+            break
+    assert events[-1]["identifier"] == "com.example.app00"
+    why = appsync.json("why", device.path, "com.example.app00")
+    assert why["identifier"] == "com.example.app00"
+    assert "com.example.app00" in json.dumps(why["waitsFor"])
+    assert device.versions()["com.example.app00"] == "1.0"
+    appsync("quit", device.path, "com.example.app00")
+    output, _ = sync.communicate(timeout=90)
+    assert sync.returncode == 0
+    assert json.loads(output.splitlines()[-1])["updated"] == ["com.example.app00"]
+    assert device.versions()["com.example.app00"] == "2.0"
+
+
+def test_policy_against_installing(appsync, device, library):
+    appsync("set", device.path, "installation=no")
+    result = device.sync(library, expect=1)
+    assert result["installed"] == [] and device.apps() == {}
+    assert len(result["skipped"]) + len(result["failed"]) == 5
+    appsync("set", device.path, "installation=unset")
+    assert len(device.sync(library)["installed"]) == 5
+
+
+def test_policy_against_removing(appsync, device, library):
+    device.sync(library)
+    appsync("set", device.path, "removal=no")
+    result = device.sync(library, "--remove", "com.example.app00", expect=1)
+    assert result["removed"] == [] and "com.example.app00" in device.apps()
+
+
+@pytest.mark.parametrize("setting", ["installation=maybe", "nonsense=yes", "installation", "=", ""])
+def test_wrong_setting(appsync, device, setting):
+    one_line(appsync("set", device.path, setting, expect=2))
+
+
+def test_uninstall_on_the_device_is_told_to_the_host_once(appsync, device, library):
+    device.sync(library)
+    appsync("uninstall", device.path, "com.example.app03")
+    assert "com.example.app03" not in device.apps()
+    assert appsync.json("inventory", device.path)["deleted"] == ["com.example.app03"]
+
+
+def test_inventory(appsync, device, library):
+    device.sync(library)
+    inventory = appsync.json("inventory", device.path)
+    assert inventory["deleted"] == []
+    assert inventory["count"] == 5
+    assert inventory["physicalSize"] == sum(a["bytes"] for a in device.apps().values())
+    assert inventory["purgeableSize"] == 0
+    assert inventory["accountIDs"] == ["account-1"]
+    assert inventory["accounts"] == [
+        {"accountID": "account-1", "personID": 7, "alternatePersonID": "alt-account-1"}]
+
+
+def test_history(appsync, device, library):
+    device.sync(library)
+    history = appsync.json("history", device.path)
+    assert {"time", "kind", "success", "identifier", "description"} <= set(history[0])
+    told = [(h["scenario"], h["identifier"], h["description"]) for h in history if h["kind"] == "scenario"]
+    assert ("Install placeholder", "com.example.app00", "Installed placeholder") in told
+    assert ("Asset install", "com.example.app00", "assertion not found") in told
+
+
+def test_log_file_is_one_object_a_line(appsync, device, library):
+    device.sync(library)
+    with open(os.path.join(device.path, "log", "system.log")) as file:
+        lines = [json.loads(line) for line in file]
+    assert all({"time", "category", "level", "message", "format"} <= set(line) for line in lines)
+    assert any(line["format"] == "%s|starting to reconcile sync with new anchor %{public}@"
+               for line in lines)
+    assert not any("%s|" in line["message"] for line in lines)
+
+
+def test_log_filters(appsync, device, library):
+    device.sync(library)
+    everything = appsync("log", device.path).stdout.splitlines()
+    some = appsync("log", device.path, "--category", "14").stdout.splitlines()
+    assert 0 < len(some) < len(everything)
+    assert len(appsync("log", device.path, "--level", "error").stdout.splitlines()) < len(everything)
+
+
+def test_screen_is_a_picture(appsync, device, library, tmp_path):
+    device.sync(library)
+    appsync("screen", device.path, tmp_path / "screen.png")
+    data = (tmp_path / "screen.png").read_bytes()
+    assert data.startswith(b"\x89PNG") and len(data) > 1000
+
+
+def test_reset_clears_sync_data_and_keeps_applications(appsync, device, library):
+    device.sync(library)
+    appsync("uninstall", device.path, "com.example.app01")
+    appsync("reset", device.path)
+    assert len(device.apps()) == 4
+    assert not os.path.exists(device.inside("/var/mobile/Library/ApplicationSync"))
+    assert appsync.json("inventory", device.path)["deleted"] == []
+
+
+def test_demote_keeps_placeholder_and_data(appsync, device, library):
+    device.sync(library)
+    data = device.inside("/var/mobile/Containers/Data/com.example.app02")
+    os.makedirs(data, exist_ok=True)
+    with open(os.path.join(data, "file"), "w") as file:
+        file.write("mine")
+    appsync("demote", device.path, "com.example.app02")
+    assert "com.example.app02" not in device.apps()
+    assert device.placeholders() == ["com.example.app02"]
+    with open(os.path.join(data, "file")) as file:
+        assert file.read() == "mine"
+    (app,) = [a for a in appsync.json("apps", device.path) if a["state"] == "placeholder"]
+    assert app["installType"] == 8
+    appsync("demote", device.path, "com.example.app03", "--by", "system")
+    assert {a["installType"] for a in appsync.json("apps", device.path) if a["state"] == "placeholder"} == {7, 8}
+
+
+def test_demoted_application_comes_back_by_send(appsync, device, library):
+    device.sync(library)
+    appsync("demote", device.path, "com.example.app02")
+    result = device.sync(library, expect=1)
+    assert "com.example.app02" in json.dumps(result["skipped"] + result["failed"])
+    appsync("send", device.path, "com.example.app02", os.path.join(library, "com.example.app02.zip"))
+    assert "com.example.app02" in device.apps() and device.placeholders() == []
+
+
+def test_coordination_is_refused_clearly(appsync, device, tmp_path):
+    one_line(appsync("set", device.path, "coordination=on", expect=None))
+    done = appsync("create", tmp_path / "new", "--coordination", "on", expect=None)
+    assert done.returncode in (2, 3) and not (tmp_path / "new").exists()
+    appsync("create", tmp_path / "new", "--coordination", "off")
+
+
+@pytest.mark.parametrize("arguments", [[], ["nonsense"], ["sync"], ["apps"], ["create"],
+                                       ["apps", "x", "--what"], ["plist", "convert", "x", "--to", "json"]])
+def test_wrong_usage(appsync, arguments):
+    done = appsync(*arguments, expect=2)
+    assert done.stderr.strip()
+
+
+@pytest.mark.parametrize("command", ["create", "sync", "plan", "apps", "screen", "why", "inventory", "set",
+                                     "run", "quit", "uninstall", "reset", "log", "history", "coordinator",
+                                     "demote", "store", "send", "package", "plist"])
+def test_every_command_has_help(appsync, command):
+    assert "sage" in appsync(command, "--help").stdout
+
+
+def test_output_into_a_closed_pipe(appsync, device, library):
+    device.sync(library)
+    done = subprocess.run("%s log %s | head -1" % (appsync.program, device.path), shell=True,
+                          capture_output=True, text=True, timeout=30)
+    assert len(done.stdout.splitlines()) == 1
+
+
+def test_stray_container_is_removed_when_the_device_is_opened(device, library):
+    device.sync(library)
+    stray = device.inside("/var/containers/Bundle/Application/0E1F2A3B-0000-4000-8000-000000000000")
+    os.makedirs(os.path.join(stray, "X.app"))
+    device.sync(library)
+    assert not os.path.exists(stray)
+
+
+def test_application_whose_container_is_gone_is_installed_again(device, library):
+    import shutil
+
+    device.sync(library)
+    shutil.rmtree(device.container_of("com.example.app00"))
+    device.sync(library, expect=None)
+    result = device.sync(library)
+    assert "com.example.app00" in device.apps()
+    assert os.path.isdir(device.container_of("com.example.app00"))
+    assert result["failed"] == []
+
+
+def test_plist_show_and_convert(appsync, tmp_path):
+    value = {"a": [1, -2, 2.5, True, b"\1\2", "é"], "big": 2**64 - 1, "small": -(2**63)}
+    source = tmp_path / "value.plist"
+    source.write_bytes(plistlib.dumps(value))
+    appsync("plist", "convert", source, "--to", "binary", "--out", tmp_path / "b.plist")
+    assert (tmp_path / "b.plist").read_bytes().startswith(b"bplist00")
+    assert plistlib.loads((tmp_path / "b.plist").read_bytes()) == value
+    appsync("plist", "convert", tmp_path / "b.plist", "--to", "xml", "--out", tmp_path / "x.plist")
+    assert plistlib.loads((tmp_path / "x.plist").read_bytes()) == value
+    assert "small" in appsync("plist", "show", tmp_path / "b.plist").stdout
+
+
+@pytest.mark.parametrize("data", [b"", b"<plist><array>", b"bplist00", b"<array>" * 200 + b"</array>" * 200,
+                                  b"<plist>" + b"<array>" * 100000],
+                         ids=["empty", "cut", "short", "deep", "very-deep"])
+def test_plist_that_cannot_be_read(appsync, tmp_path, data):
+    (tmp_path / "bad.plist").write_bytes(data)
+    done = appsync("plist", "show", tmp_path / "bad.plist", expect=None)
+    assert done.returncode in (1, 3)
+    assert "bad.plist" in one_line(done)
+
+
+def test_entities_are_not_expanded(appsync, tmp_path):
+    (tmp_path / "e.plist").write_bytes(
+        b'<?xml version="1.0"?><!DOCTYPE plist [<!ENTITY x SYSTEM "file:///etc/passwd">]>'
+        b"<plist><string>&x;</string></plist>")
+    done = appsync("plist", "show", tmp_path / "e.plist", expect=None)
+    assert "root:" not in done.stdout + done.stderr
+
+
+def test_send_to_a_device_that_was_never_synced(appsync, device, library):
+    appsync("send", device.path, "com.example.app00", os.path.join(library, "com.example.app00.zip"))
+    assert sorted(device.apps()) == ["com.example.app00"]
+
+
+def test_restore_in_two_parts_on_a_device_that_was_never_synced(appsync, device, library, tmp_path):
+    (tmp_path / "data.bin").write_bytes(b"mine")
+    package = os.path.join(library, "com.example.app00.zip")
+    appsync("send", device.path, "com.example.app00", package, "--restore", "--parts", "1")
+    assert device.apps() == {}
+    appsync("send", device.path, "com.example.app00", tmp_path / "data.bin", "--restore", "--parts", "2")
+    assert sorted(device.apps()) == ["com.example.app00"]
+
+
+def test_output_that_cannot_be_written_is_a_failure(appsync, device, library):
+    device.sync(library)
+    done = subprocess.run([appsync.program, "apps", device.path], stdout=open("/dev/full", "w"),
+                          stderr=subprocess.PIPE, text=True, timeout=30)
+    assert done.returncode == 1 and len(done.stderr.strip().splitlines()) == 1
+
+
+def test_log_folder_that_is_gone_is_made_again(device, library):
+    import shutil
+
+    shutil.rmtree(os.path.join(device.path, "log"), ignore_errors=True)
+    device.sync(library)
+    assert os.path.exists(os.path.join(device.path, "log", "system.log"))

@@ -1,0 +1,143 @@
+"""Syncs that are killed, stopped or run out of disk, and run again."""
+
+import os
+import random
+import signal
+import sqlite3
+import subprocess
+import sys
+import time
+
+import pytest
+
+import packages
+from conftest import Device
+
+
+@pytest.fixture
+def larger_library(tmp_path):
+    folder = str(tmp_path / "library")
+    packages.make_library(folder, 12, payload=random.Random(7).randbytes(400_000))
+    return folder
+
+
+def settle(device, library, expect=0):
+    """Runs the same command again and checks the whole device."""
+    device.sync(library, expect=expect)
+    with sqlite3.connect(os.path.join(device.path, "device.db")) as database:
+        assert database.execute("PRAGMA integrity_check").fetchall() == [("ok",)]
+    database.close()
+    assert device.placeholders() == []
+    containers = os.listdir(device.inside("/var/containers/Bundle/Application"))
+    assert sorted(containers) == sorted(os.path.basename(a["container"]) for a in device.apps().values())
+    staging = os.listdir(device.inside("/var/mobile/Media/PublicStaging"))
+    assert [name for name in staging if name.endswith(".zip")] == []
+
+
+def duration_of(appsync, library, path):
+    fresh = Device(appsync, path)
+    start = time.monotonic()
+    fresh.sync(library)
+    return time.monotonic() - start
+
+
+@pytest.mark.parametrize("number", [signal.SIGKILL, signal.SIGINT, signal.SIGTERM])
+def test_stopped_at_random_moments_and_run_again(appsync, larger_library, tmp_path, number):
+    """Twenty kills (ten for each polite signal), at moments from a fixed seed over the whole run."""
+    whole = duration_of(appsync, larger_library, tmp_path / "whole")
+    choose = random.Random(int(number))
+    for attempt in range(20 if number == signal.SIGKILL else 10):
+        device = Device(appsync, tmp_path / ("device%d" % attempt))
+        sync = appsync.start("sync", device.path, larger_library)
+        time.sleep(choose.uniform(0, whole))
+        sync.send_signal(number)
+        sync.communicate(timeout=60)
+        settle(device, larger_library)
+        assert len(device.apps()) == 12
+        assert device.sync(larger_library)["requested"] == []
+
+
+def test_killed_update_keeps_one_version_or_the_other(appsync, larger_library, tmp_path):
+    device = Device(appsync, tmp_path / "device")
+    device.sync(larger_library)
+    packages.make_library(larger_library, 12, "2.0", payload=random.Random(8).randbytes(400_000))
+    choose = random.Random(3)
+    for _ in range(5):
+        sync = appsync.start("sync", device.path, larger_library)
+        time.sleep(choose.uniform(0, 0.2))
+        sync.kill()
+        sync.communicate()
+        assert set(device.versions().values()) <= {"1.0", "2.0"}
+        assert len(device.apps()) == 12
+    settle(device, larger_library)
+    assert set(device.versions().values()) == {"2.0"}
+
+
+def test_interrupt_while_an_application_runs_ends_soon(appsync, device, library):
+    device.sync(library)
+    packages.make_package(library, "com.example.app00", "2.0")
+    appsync("run", device.path, "com.example.app00")
+    sync = appsync.start("sync", device.path, library, "--json-lines")
+    for line in sync.stdout:
+        if '"nextTry":"' in line.replace(" ", ""):
+            break
+    sync.send_signal(signal.SIGINT)
+    sync.communicate(timeout=15)
+    assert sync.returncode == 1
+    assert device.versions()["com.example.app00"] == "1.0"
+    appsync("quit", device.path, "com.example.app00")
+    settle(device, library)
+    assert device.versions()["com.example.app00"] == "2.0"
+
+
+FULL = """
+import subprocess, sys, os
+program, library, where = sys.argv[1:]
+run = lambda *a: subprocess.run([program, *a], capture_output=True, text=True, timeout=120)
+subprocess.run(["mount", "-t", "tmpfs", "-o", "size=1m", "tmpfs", where], check=True)
+done = run("create", where + "/device")
+assert done.returncode == 0, done.stderr
+fitted = False
+for kib in range(1024, 16384, 256):
+    subprocess.run(["mount", "-o", "remount,size=%dk" % kib, where], check=True)
+    done = run("sync", where + "/device", library)
+    assert done.returncode in (0, 1), (kib, done.returncode, done.stderr)
+    if done.returncode == 1:
+        assert done.stderr.strip(), kib
+    again = run("apps", where + "/device")
+    assert again.returncode == 0, again.stderr
+    if done.returncode == 0:
+        fitted = True
+        break
+assert fitted
+print("fits at", kib, "KiB")
+"""
+
+
+def test_full_disk_at_every_size_leaves_the_device_usable(appsync, library, tmp_path):
+    where = tmp_path / "small"
+    where.mkdir()
+    able = subprocess.run(["unshare", "-m", "true"], capture_output=True)
+    if able.returncode != 0:
+        pytest.skip("this machine allows no mount namespace")
+    done = subprocess.run(["unshare", "-m", sys.executable, "-c", FULL, appsync.program, library, str(where)],
+                          capture_output=True, text=True, timeout=300)
+    assert done.returncode == 0, done.stderr
+    assert "fits at" in done.stdout
+
+
+def test_plan_that_does_not_fit_says_how_much_is_missing(appsync, library, tmp_path):
+    where = tmp_path / "small"
+    where.mkdir()
+    if subprocess.run(["unshare", "-m", "true"], capture_output=True).returncode != 0:
+        pytest.skip("this machine allows no mount namespace")
+    packages.make_package(library, "com.example.large", payload=os.urandom(8 << 20))
+    script = ("mount -t tmpfs -o size=4m tmpfs {0} && {1} create {0}/d && {1} plan {0}/d {2} --json;"
+              " {1} sync {0}/d {2}; echo status $?; {1} apps {0}/d --json").format(where, appsync.program, library)
+    done = subprocess.run(["unshare", "-m", "sh", "-c", script], capture_output=True, text=True, timeout=60)
+    assert '"fits": false' in done.stdout or '"fits":false' in done.stdout
+    assert "status 1" in done.stdout
+    assert "com.example.app00" not in done.stdout.split("status 1")[1]
+    assert done.stderr.strip()
+
+

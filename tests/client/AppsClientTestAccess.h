@@ -1,0 +1,41 @@
+#pragma once
+
+#include <cstdint>
+#include <set>
+#include <string>
+
+#include "client/AppsClient.h"
+
+namespace appsync {
+
+/// What no operation of a client shows.
+struct AppsClientTestAccess {
+    static std::set<std::string>& kolmAppsToIgnore(AppsClient& client) {
+        return client._kolmAppsToIgnore;
+    }
+    static std::set<std::string>& placeholdersForRestoringApps(AppsClient& client) {
+        return client._placeholdersForRestoringApps;
+    }
+    static std::set<std::string>& updatingApps(AppsClient& client) { return client._updatingApps; }
+    static std::set<std::string>& userCancelledApps(AppsClient& client) {
+        return client._userCancelledApps;
+    }
+    static std::set<std::string> outstandingHFTTransfers(const AppsClient& client) {
+        return client._outstandingHFTTransfers.contents();
+    }
+    static bool finishedWaitingForPlaceHolderInstalls(const AppsClient& client) {
+        return client._finishedWaitingForPlaceHolderInstalls;
+    }
+    static void setUseInstallCoordinator(AppsClient& client, bool use) {
+        client._useInstallCoordinator = use;
+    }
+    static bool hasUninstalledApps(const AppsClient& client) {
+        return client._uninstalledApps.has_value();
+    }
+    static unsigned assetPartsFor(const AppsClient& client, const TransferItem& item,
+                                  const RestoreState& restoreState) {
+        return client.assetPartsFor(item, restoreState);
+    }
+};
+
+}  // namespace appsync

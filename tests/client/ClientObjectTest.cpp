@@ -1,0 +1,170 @@
+#include "tests/client/AppsClientFixture.h"
+
+namespace appsync {
+namespace {
+
+using testing::ElementsAre;
+using Access = AppsClientTestAccess;
+
+constexpr std::string_view kStartup = "com.korvu.trd.TRStartupCompleteNotification";
+
+class ClientObject : public AppsClientFixture {};
+
+TEST_F(ClientObject, IsMadeInOrder) {
+    client_.reset();
+    platform_.clearRecording();
+    client_ = AppsClient::create(platform_.services());
+    EXPECT_THAT(
+        platform_.lines(),
+        ElementsAre("WorkQueues.makeWaitGroup() -> WaitGroup#3",
+                    "WorkQueues.makeWaitGroup() -> WaitGroup#4",
+                    "WorkQueues.makeOperationQueue() -> OperationQueue#2",
+                    "OperationQueue#2.setMaximumConcurrentOperations(10)",
+                    "BackupService.makeManager() -> a manager",
+                    "WorkQueues.makeSerialQueue(com.korvu.qmx.Travend.AppSync) -> SerialQueue#3",
+                    "WorkQueues.makeSerialQueue(com.korvu.qmx.Travend.AppRestore) -> "
+                    "SerialQueue#4",
+                    "WorkQueues.makeLock() -> Lock#3", "WorkQueues.makeLock() -> Lock#4",
+                    "AppRegistry.addObserver()",
+                    "LogFacility.makeHandle(com.korvu.appinstallation, trd.appsync) -> a handle",
+                    "InstallTransactionLog.initialize(com.korvu.appinstallation/trd.appsync)",
+                    "InstallCoordinatorService.isCoordinationEnabled() -> no",
+                    "SyncHost.mainBundleIdentifier() -> com.korvu.trd",
+                    "NotificationCenter.addObserver(com.korvu.trd.TRStartupCompleteNotification, "
+                    "Drop)"));
+}
+
+TEST_F(ClientObject, OutsideTheDaemonDoesNotListenForItsStart) {
+    client_.reset();
+    platform_.host.setMainBundleIdentifier("com.example.other");
+    makeClient();
+    EXPECT_EQ(platform_.notificationCenter.observers(kStartup), 0U);
+    EXPECT_FALSE(Access::finishedWaitingForPlaceHolderInstalls(*client_));
+    platform_.clearRecording();
+    client_.reset();
+    EXPECT_THAT(platform_.calls(),
+                ElementsAre("AppRegistry.removeObserver()",
+                            "SyncHost.mainBundleIdentifier() -> com.example.other"));
+}
+
+TEST_F(ClientObject, InsideTheDaemonListensForItsStart) {
+    EXPECT_EQ(platform_.notificationCenter.observers(kStartup), 1U);
+    EXPECT_TRUE(Access::finishedWaitingForPlaceHolderInstalls(*client_));
+    platform_.notificationCenter.post(kStartup);
+    platform_.runUntilIdle();
+    EXPECT_THAT(platform_.lines(),
+                ElementsAre("NotificationCenterObserver.callback(" + std::string(kStartup) + ")"));
+}
+
+TEST_F(ClientObject, StopsListeningWhenItIsDestroyed) {
+    client_.reset();
+    EXPECT_THAT(platform_.lines(),
+                ElementsAre("AppRegistry.removeObserver()",
+                            "SyncHost.mainBundleIdentifier() -> com.korvu.trd",
+                            "NotificationCenter.removeObserver(" + std::string(kStartup) + ")"));
+    EXPECT_EQ(platform_.registry.observers(), 0U);
+    EXPECT_EQ(platform_.notificationCenter.observers(kStartup), 0U);
+}
+
+TEST_F(ClientObject, WarnsOfOutstandingTransfersWhenItIsDestroyed) {
+    client_->assetTransferUpdatedProgress(receivedAsset(kA), 0.5);
+    client_->assetTransferUpdatedProgress(receivedAsset(kB), 0.5);
+    client_.reset();
+    EXPECT_TRUE(logged(LogLevel::Error,
+                       "<AppsClient> getting dealloc'd with 2 outstanding HFT transfers!"));
+}
+
+TEST_F(ClientObject, WarnsOfAwaitedPlaceholdersWhenItIsDestroyed) {
+    Access::placeholdersForRestoringApps(*client_) = {kA, kB};
+    client_.reset();
+    EXPECT_TRUE(logged(LogLevel::Error,
+                       "<AppsClient> getting dealloc'd with (com.example.a, com.example.b)pending "
+                       "placeholder install complete notifications"));
+}
+
+TEST_F(ClientObject, IsRefusedOnADeviceThatCoordinatesItsInstalls) {
+    client_.reset();
+    platform_.clearRecording();
+    platform_.coordination.setEnabled(true);
+    std::optional<ErrorRecord> error;
+    EXPECT_EQ(AppsClient::create(platform_.services(), &error), nullptr);
+    ASSERT_TRUE(error);
+    EXPECT_EQ(error->domain, kPosixErrorDomain);
+    EXPECT_THAT(error->description(), testing::HasSubstr("turn install coordination off"));
+    EXPECT_EQ(AppsClient::create(platform_.services()), nullptr);
+    EXPECT_THAT(platform_.callsTo({"InstallCoordinatorService"}), testing::SizeIs(2));
+    EXPECT_EQ(platform_.registry.observers(), 0U);
+}
+
+TEST_F(ClientObject, AsksOnceWhetherInstallsAreCoordinated) {
+    platform_.coordination.setEnabled(true);
+    client_->assetTransferUpdatedProgress(receivedAsset(kA), 0.5);
+    EXPECT_THAT(client_->outstandingAssetTransfers(), testing::IsEmpty());
+    EXPECT_THAT(platform_.callsTo({"InstallCoordinatorService"}), testing::IsEmpty());
+}
+
+TEST_F(ClientObject, OwnsTheApplicationDataclass) {
+    EXPECT_THAT(client_->supportedDataclasses(), ElementsAre("Application"));
+}
+
+TEST_F(ClientObject, KeepsNoAnchorOfItsOwn) {
+    std::optional<ErrorRecord> error;
+    EXPECT_TRUE(client_->prepareForSyncWithHostAnchor("host anchor", {}, &error));
+    EXPECT_TRUE(client_->reconcileSync({}, "new anchor", {}, &error));
+    EXPECT_EQ(client_->currentSyncAnchor(), "NO_APP_SYNC_ANCHOR");
+}
+
+TEST_F(ClientObject, ForgetsTheApplicationsToIgnoreWhenASessionBegins) {
+    Access::kolmAppsToIgnore(*client_) = {kA};
+    std::optional<ErrorRecord> error;
+    EXPECT_TRUE(client_->prepareForSyncWithHostAnchor("anchor", {}, &error));
+    EXPECT_TRUE(Access::kolmAppsToIgnore(*client_).empty());
+    EXPECT_EQ(error, std::nullopt);
+    EXPECT_THAT(platform_.lines(), testing::IsEmpty());
+}
+
+struct PolicyCase {
+    PolicyAnswer installation;
+    PolicyAnswer removal;
+    bool disabled;
+};
+
+class DisabledAssetTypes : public ClientObject, public testing::WithParamInterface<PolicyCase> {};
+
+TEST_P(DisabledAssetTypes, NeedBothPoliciesToSayNo) {
+    platform_.policy.set(PolicyFeature::AppInstallationAllowed, GetParam().installation);
+    platform_.policy.set(PolicyFeature::AppRemovalAllowed, GetParam().removal);
+    const std::set<std::string> everything{"Application"};
+    EXPECT_EQ(client_->disabledAssetTypes(),
+              GetParam().disabled ? std::optional(everything) : std::nullopt);
+}
+
+constexpr auto kUnset = PolicyAnswer::Unset;
+constexpr auto kYes = PolicyAnswer::Yes;
+constexpr auto kNo = PolicyAnswer::No;
+
+INSTANTIATE_TEST_SUITE_P(EveryAnswer, DisabledAssetTypes,
+                         testing::Values(PolicyCase{kUnset, kUnset, false},
+                                         PolicyCase{kUnset, kNo, false},
+                                         PolicyCase{kYes, kNo, false}, PolicyCase{kNo, kYes, false},
+                                         PolicyCase{kNo, kUnset, false},
+                                         PolicyCase{kNo, kNo, true}));
+
+TEST_F(ClientObject, CountsAnUnsetPolicyAsAllowed) {
+    EXPECT_TRUE(client_->_appInstallationAllowed());
+    EXPECT_TRUE(client_->_appRemovalAllowed());
+    platform_.policy.set(PolicyFeature::AppRemovalAllowed, kNo);
+    EXPECT_TRUE(client_->_appInstallationAllowed());
+    EXPECT_FALSE(client_->_appRemovalAllowed());
+}
+
+TEST_F(ClientObject, CountsInstallAttemptsOnce) {
+    client_->_enqueueAssetInstall(receivedAsset(kA));
+    client_->_enqueueAssetInstall(receivedAsset(kB));
+    platform_.runUntilIdle();
+    EXPECT_EQ(client_->_getAndResetNumAppInstallsAttempted(), 2U);
+    EXPECT_EQ(client_->_getAndResetNumAppInstallsAttempted(), 0U);
+}
+
+}  // namespace
+}  // namespace appsync

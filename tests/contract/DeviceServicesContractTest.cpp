@@ -1,0 +1,180 @@
+#include <gmock/gmock.h>
+#include <gtest/gtest.h>
+
+#include <string>
+#include <vector>
+
+#include "tests/contract/DeviceUnderTest.h"
+
+namespace appsync {
+namespace {
+
+using testing::ElementsAre;
+using testing::IsEmpty;
+using Outcome = TerminationAssertionResult;
+
+constexpr const char* kA = "com.example.a";
+constexpr const char* kB = "com.example.b";
+
+class HomeScreenContract : public DeviceContract {
+  protected:
+    HomeScreenContract() : connection_(services_.homeScreen.blockableConnection()) {
+        EXPECT_NE(connection_, nullptr);
+    }
+
+    bool setLayout(const PropertyList& layout) {
+        const auto bytes = services_.propertyLists.serialize(layout, PropertyListFormat::Xml);
+        EXPECT_TRUE(bytes);
+        return connection_->setIconState(*bytes);
+    }
+    std::vector<std::string> layout() {
+        const std::optional<Bytes> bytes = connection_->flattenedIconState(1);
+        if (!bytes) return {"no answer"};
+        const auto list = services_.propertyLists.parse(*bytes);
+        if (!list || !list->isArray()) return {"not an array"};
+        std::vector<std::string> identifiers;
+        for (const PropertyList& element : list->elements()) {
+            identifiers.push_back(element.asString() != nullptr ? *element.asString() : "no text");
+        }
+        return identifiers;
+    }
+
+    const std::shared_ptr<HomeScreenConnection> connection_;
+};
+
+INSTANTIATE_TEST_SUITE_P(, HomeScreenContract, testing::ValuesIn(deviceImplementations()),
+                         nameOfDevice);
+
+TEST_P(HomeScreenContract, ALayoutComesBackFlattened) {
+    EXPECT_TRUE(setLayout(PropertyList::array({kB, kA})));
+    EXPECT_THAT(layout(), ElementsAre(kB, kA));
+    EXPECT_TRUE(setLayout(PropertyList::array({kA})));
+    EXPECT_THAT(layout(), ElementsAre(kA));
+}
+
+TEST_P(HomeScreenContract, WhatIsNoLayoutIsNotTaken) {
+    EXPECT_TRUE(setLayout(PropertyList::array({kB, kA})));
+    const std::string garbage = "no layout";
+    EXPECT_FALSE(connection_->setIconState(Bytes(garbage.begin(), garbage.end())));
+    EXPECT_FALSE(connection_->setIconState({}));
+    EXPECT_FALSE(setLayout(PropertyList::map()));
+    EXPECT_FALSE(setLayout(PropertyList::array({kA, 1})));
+    EXPECT_THAT(layout(), ElementsAre(kB, kA));
+}
+
+TEST_P(HomeScreenContract, WhatIsNotInstalledCannotBeHeld) {
+    const auto result = services_.homeScreen.takeTerminationAssertion(kA, 0);
+    EXPECT_EQ(result.outcome, Outcome::kNoSuchApplication);
+    EXPECT_EQ(result.assertion, nullptr);
+}
+
+TEST_P(HomeScreenContract, AnApplicationThatDoesNotRunIsHeld) {
+    ASSERT_TRUE(installPackage({kA}));
+    const auto result = services_.homeScreen.takeTerminationAssertion(kA, 0);
+    EXPECT_EQ(result.outcome, Outcome::kGranted);
+    EXPECT_NE(result.assertion, nullptr);
+}
+
+TEST_P(HomeScreenContract, ARunningApplicationIsNotHeldUntilItEnds) {
+    ASSERT_TRUE(installPackage({kA}));
+    device_->setRunning(kA, true);
+    EXPECT_EQ(services_.homeScreen.takeTerminationAssertion(kA, 0).outcome, Outcome::kDenied);
+    device_->setRunning(kA, false);
+    EXPECT_EQ(services_.homeScreen.takeTerminationAssertion(kA, 0).outcome, Outcome::kGranted);
+}
+
+TEST_P(HomeScreenContract, AReleasedAssertionCanBeTakenAgain) {
+    ASSERT_TRUE(installPackage({kA}));
+    for (int round = 0; round < 3; ++round) {
+        const auto result = services_.homeScreen.takeTerminationAssertion(kA, 0);
+        EXPECT_EQ(result.outcome, Outcome::kGranted);
+    }
+    device_->setRunning(kA, true);
+    EXPECT_EQ(services_.homeScreen.takeTerminationAssertion(kA, 0).outcome, Outcome::kDenied);
+}
+
+class DeviceServicesContract : public DeviceContract {};
+
+INSTANTIATE_TEST_SUITE_P(, DeviceServicesContract, testing::ValuesIn(deviceImplementations()),
+                         nameOfDevice);
+
+TEST_P(DeviceServicesContract, PolicyIsUnsetUntilItIsSet) {
+    DevicePolicyService& policy = services_.policy;
+    EXPECT_EQ(policy.effectiveValue(PolicyFeature::AppInstallationAllowed), PolicyAnswer::Unset);
+    device_->setPolicy(PolicyFeature::AppInstallationAllowed, PolicyAnswer::No);
+    EXPECT_EQ(policy.effectiveValue(PolicyFeature::AppInstallationAllowed), PolicyAnswer::No);
+    EXPECT_EQ(policy.effectiveValue(PolicyFeature::AppRemovalAllowed), PolicyAnswer::Unset);
+    device_->setPolicy(PolicyFeature::AppRemovalAllowed, PolicyAnswer::Yes);
+    EXPECT_EQ(policy.effectiveValue(PolicyFeature::AppRemovalAllowed), PolicyAnswer::Yes);
+}
+
+TEST_P(DeviceServicesContract, CoordinationIsOffAtFirst) {
+    EXPECT_FALSE(services_.coordination.isCoordinationEnabled());
+}
+
+TEST_P(DeviceServicesContract, RestoreDataIsThereUntilTheRestoreIsGivenUp) {
+    const auto manager = services_.backup.makeManager();
+    EXPECT_FALSE(manager->restoreDataExists(kA));
+    manager->cancelApplicationRestore(kA);
+    device_->addRestoreData(kA);
+    EXPECT_TRUE(manager->restoreDataExists(kA));
+    EXPECT_FALSE(manager->restoreDataExists(kB));
+    services_.backup.makeManager()->cancelApplicationRestore(kA);
+    EXPECT_FALSE(manager->restoreDataExists(kA));
+}
+
+TEST_P(DeviceServicesContract, WhatAPersonRemovesIsOnTheListUntilItIsCleared) {
+    InstallerService& installer = services_.installer;
+    EXPECT_TRUE(installer.lookupUninstalled()->isMap());
+    EXPECT_TRUE(installer.lookupUninstalled()->empty());
+    for (const char* identifier : {kA, kB}) {
+        ASSERT_TRUE(installPackage({identifier}));
+        device_->uninstallAsPerson(identifier);
+        EXPECT_FALSE(registry_.isApplicationInstalled(identifier));
+    }
+    EXPECT_EQ(installer.lookupUninstalled()->size(), 2U);
+    const std::vector<std::string> taken{kA, "com.example.unknown"};
+    EXPECT_TRUE(installer.clearUninstalled(taken));
+    EXPECT_EQ(installer.lookupUninstalled()->size(), 1U);
+    EXPECT_NE(installer.lookupUninstalled()->find(kB), nullptr);
+}
+
+TEST_P(DeviceServicesContract, WhatTheRegistryUninstallsIsNotOnTheList) {
+    ASSERT_TRUE(installPackage({kA}));
+    ASSERT_TRUE(registry_.uninstallApplication(kA, {}));
+    EXPECT_TRUE(services_.installer.lookupUninstalled()->empty());
+}
+
+TEST_P(DeviceServicesContract, TheTransactionLogKeepsTheOrder) {
+    InstallTransactionLog& log = services_.transactions;
+    log.initialize(*services_.log.makeHandle("com.example", "first"));
+    log.initialize(*services_.log.makeHandle("com.example", "second"));
+    log.logScenario("Asset install", 0, true, kA, "assertion succeeded");
+    log.logStep(1, 1, 1, true, kA, "");
+    log.logScenario("Nimbra restore", 0, false, kB, "install failed recoverably");
+    EXPECT_THAT(device_->scenarios(),
+                ElementsAre("Asset install|com.example.a|yes|assertion succeeded",
+                            "Nimbra restore|com.example.b|no|install failed recoverably"));
+}
+
+class IconRendererContract : public DeviceContract {};
+
+INSTANTIATE_TEST_SUITE_P(, IconRendererContract, testing::ValuesIn(deviceImplementations()),
+                         nameOfDevice);
+
+TEST_P(IconRendererContract, OnlyKnownImageTypesAreEncoded) {
+    Bytes buffer;
+    EXPECT_NE(services_.icons.createImageDestination("public.png", 1, buffer), nullptr);
+    EXPECT_EQ(services_.icons.createImageDestination("public.no-such-type", 1, buffer), nullptr);
+}
+
+TEST_P(IconRendererContract, NothingAddedIsNothingWritten) {
+    Bytes buffer;
+    const auto destination = services_.icons.createImageDestination("public.png", 1, buffer);
+    ASSERT_NE(destination, nullptr);
+    EXPECT_FALSE(destination->finalize());
+    EXPECT_THAT(buffer, IsEmpty());
+}
+
+}  // namespace
+}  // namespace appsync

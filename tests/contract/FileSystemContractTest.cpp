@@ -1,0 +1,342 @@
+#include <gmock/gmock.h>
+#include <gtest/gtest.h>
+
+#include <cerrno>
+#include <functional>
+#include <string>
+
+#include "tests/contract/SystemUnderTest.h"
+
+namespace appsync {
+namespace {
+
+using testing::ElementsAre;
+using testing::HasSubstr;
+using testing::IsEmpty;
+
+Bytes bytes(std::string_view text) { return {text.begin(), text.end()}; }
+
+/// 0 for success, otherwise the errno value; -1 for an error that is none.
+template <typename Value>
+std::int64_t codeOf(const Result<Value>& result) {
+    if (result) return 0;
+    return result.error().domain == kPosixErrorDomain ? result.error().code : -1;
+}
+
+class FileSystemContract : public SystemContract {
+  protected:
+    FileSystemContract() : files_(system_->files()) { make("/d"); }
+
+    void make(const std::string& directory) {
+        EXPECT_EQ(codeOf(files_.createDirectory(directory, true, nullptr)), 0);
+    }
+    void write(const std::string& path, std::string_view text) {
+        EXPECT_EQ(codeOf(files_.writeFileAtomically(path, bytes(text))), 0);
+    }
+    std::string read(const std::string& path) {
+        const Result<Bytes> contents = files_.readFile(path);
+        return contents ? std::string(contents->begin(), contents->end())
+                        : contents.error().description();
+    }
+
+    FileSystem& files_;
+};
+
+INSTANTIATE_TEST_SUITE_P(, FileSystemContract, testing::ValuesIn(systemImplementations()),
+                         nameOfSystem);
+
+TEST_P(FileSystemContract, ADirectoryThatWasMadeIsThere) {
+    EXPECT_FALSE(files_.itemExists("/d/e"));
+    EXPECT_EQ(codeOf(files_.createDirectory("/d/e", false, nullptr)), 0);
+    EXPECT_TRUE(files_.itemExists("/d/e"));
+    const Result<ItemAttributes> attributes = files_.attributes("/d/e");
+    ASSERT_TRUE(attributes);
+    EXPECT_TRUE(attributes->isDirectory);
+}
+
+TEST_P(FileSystemContract, ADirectoryNeedsItsParent) {
+    EXPECT_EQ(codeOf(files_.createDirectory("/d/e/f", false, nullptr)), ENOENT);
+    EXPECT_FALSE(files_.itemExists("/d/e"));
+}
+
+TEST_P(FileSystemContract, ADirectoryIsMadeOnlyOnce) {
+    EXPECT_EQ(codeOf(files_.createDirectory("/d", false, nullptr)), EEXIST);
+    write("/d/file", "");
+    EXPECT_EQ(codeOf(files_.createDirectory("/d/file", false, nullptr)), EEXIST);
+}
+
+TEST_P(FileSystemContract, ParentsAreMadeOnRequest) {
+    EXPECT_EQ(codeOf(files_.createDirectory("/d/e/f/g", true, nullptr)), 0);
+    EXPECT_TRUE(files_.itemExists("/d/e/f/g"));
+    EXPECT_EQ(codeOf(files_.createDirectory("/d/e/f/g", true, nullptr)), 0);
+    EXPECT_EQ(codeOf(files_.createDirectory("/", true, nullptr)), 0);
+}
+
+TEST_P(FileSystemContract, AFileInTheWayOfADirectoryIsAFailure) {
+    write("/d/file", "kept");
+    EXPECT_NE(codeOf(files_.createDirectory("/d/file", true, nullptr)), 0);
+    EXPECT_NE(codeOf(files_.createDirectory("/d/file/below", true, nullptr)), 0);
+    EXPECT_EQ(read("/d/file"), "kept");
+}
+
+TEST_P(FileSystemContract, NewItemsBelongToWhomTheyAreGiven) {
+    const FileAttributes mobile{"mobile", "mobile"};
+    EXPECT_EQ(codeOf(files_.createDirectory("/d/e/f", true, &mobile)), 0);
+    EXPECT_EQ(codeOf(files_.createFile("/d/file", bytes("x"), mobile)), 0);
+}
+
+TEST_P(FileSystemContract, AnUnknownAccountIsRefusedAndNothingMade) {
+    const FileAttributes nobody{"no such account", std::nullopt};
+    EXPECT_EQ(codeOf(files_.createDirectory("/d/e", true, &nobody)), EINVAL);
+    EXPECT_EQ(codeOf(files_.createFile("/d/file", bytes("x"), nobody)), EINVAL);
+    EXPECT_THAT(system_->names("/d"), IsEmpty());
+}
+
+TEST_P(FileSystemContract, WhatIsWrittenIsRead) {
+    using std::string_literals::operator""s;
+    for (const std::string& text : {""s, "text"s, "with \0 and \xff"s, std::string(1 << 20, 'x')}) {
+        write("/d/file", text);
+        EXPECT_EQ(read("/d/file"), text);
+        EXPECT_EQ(files_.attributes("/d/file")->size, text.size());
+    }
+}
+
+TEST_P(FileSystemContract, WritingLeavesNothingBeside) {
+    write("/d/file", "one");
+    write("/d/file", "two");
+    EXPECT_EQ(codeOf(files_.createFile("/d/file", bytes("three"), {})), 0);
+    EXPECT_THAT(system_->names("/d"), ElementsAre("file"));
+}
+
+TEST_P(FileSystemContract, AFileNeedsItsDirectory) {
+    EXPECT_EQ(codeOf(files_.writeFileAtomically("/d/e/file", bytes("x"))), ENOENT);
+    EXPECT_EQ(codeOf(files_.createFile("/d/e/file", bytes("x"), {})), ENOENT);
+    EXPECT_EQ(codeOf(files_.readFile("/d/e/file")), ENOENT);
+}
+
+TEST_P(FileSystemContract, AFileDoesNotReplaceADirectory) {
+    make("/d/e");
+    EXPECT_EQ(codeOf(files_.writeFileAtomically("/d/e", bytes("x"))), EISDIR);
+    EXPECT_EQ(codeOf(files_.createFile("/d/e", bytes("x"), {})), EISDIR);
+    EXPECT_THAT(system_->names("/d"), ElementsAre("e"));
+}
+
+TEST_P(FileSystemContract, CreatingReplacesWhatWasThere) {
+    write("/d/file", "old and longer");
+    EXPECT_EQ(codeOf(files_.createFile("/d/file", bytes("new"), {})), 0);
+    EXPECT_EQ(read("/d/file"), "new");
+}
+
+TEST_P(FileSystemContract, WhatIsMissingHasNoAttributes) {
+    EXPECT_EQ(codeOf(files_.attributes("/d/missing")), ENOENT);
+    EXPECT_EQ(codeOf(files_.setTimesToNow("/d/missing")), ENOENT);
+    write("/d/file", "x");
+    EXPECT_EQ(codeOf(files_.setTimesToNow("/d/file")), 0);
+    EXPECT_EQ(codeOf(files_.setTimesToNow("/d")), 0);
+}
+
+TEST_P(FileSystemContract, AFileIsNoDirectory) {
+    write("/d/file", "x");
+    EXPECT_EQ(codeOf(files_.readFile("/d/file/below")), ENOTDIR);
+    EXPECT_EQ(codeOf(files_.writeFileAtomically("/d/file/below", bytes("x"))), ENOTDIR);
+    EXPECT_EQ(codeOf(files_.readFile("/d/file/")), ENOTDIR);
+    EXPECT_FALSE(files_.itemExists("/d/file/below"));
+}
+
+TEST_P(FileSystemContract, RemovingTakesEverythingBelow) {
+    make("/d/e/f");
+    write("/d/e/f/file", "x");
+    write("/d/kept", "x");
+    EXPECT_EQ(codeOf(files_.removeItem("/d/e")), 0);
+    EXPECT_THAT(system_->names("/d"), ElementsAre("kept"));
+    EXPECT_EQ(codeOf(files_.removeItem("/d/e")), ENOENT);
+}
+
+TEST_P(FileSystemContract, RemovingALinkLeavesWhatItPointsTo) {
+    make("/d/target");
+    write("/d/target/file", "kept");
+    system_->addLink("/d/link", "/d/target");
+    make("/d/tree");
+    system_->addLink("/d/tree/link", "../target");
+    EXPECT_EQ(codeOf(files_.removeItem("/d/link")), 0);
+    EXPECT_EQ(codeOf(files_.removeItem("/d/tree")), 0);
+    EXPECT_THAT(system_->names("/d"), ElementsAre("target"));
+    EXPECT_EQ(read("/d/target/file"), "kept");
+}
+
+TEST_P(FileSystemContract, MovingTakesEverythingAlong) {
+    make("/d/e");
+    write("/d/e/file", "text");
+    EXPECT_EQ(codeOf(files_.moveItem("/d/e", "/d/f")), 0);
+    EXPECT_THAT(system_->names("/d"), ElementsAre("f"));
+    EXPECT_EQ(read("/d/f/file"), "text");
+}
+
+TEST_P(FileSystemContract, MovingReplacesNothing) {
+    write("/d/from", "one");
+    write("/d/to", "two");
+    make("/d/directory");
+    EXPECT_EQ(codeOf(files_.moveItem("/d/from", "/d/to")), EEXIST);
+    EXPECT_EQ(codeOf(files_.moveItem("/d/from", "/d/directory")), EEXIST);
+    EXPECT_EQ(read("/d/from"), "one");
+    EXPECT_EQ(read("/d/to"), "two");
+}
+
+TEST_P(FileSystemContract, MovingNeedsBothEnds) {
+    write("/d/from", "kept");
+    EXPECT_EQ(codeOf(files_.moveItem("/d/missing", "/d/to")), ENOENT);
+    EXPECT_EQ(codeOf(files_.moveItem("/d/from", "/d/missing/to")), ENOENT);
+    EXPECT_EQ(read("/d/from"), "kept");
+}
+
+TEST_P(FileSystemContract, ADirectoryDoesNotMoveIntoItself) {
+    make("/d/e");
+    EXPECT_EQ(codeOf(files_.moveItem("/d/e", "/d/e/f")), EINVAL);
+    EXPECT_TRUE(files_.itemExists("/d/e"));
+}
+
+TEST_P(FileSystemContract, CopyingLeavesTheSource) {
+    write("/d/from", "text");
+    EXPECT_EQ(codeOf(files_.copyItem("/d/from", "/d/to")), 0);
+    EXPECT_EQ(read("/d/from"), "text");
+    EXPECT_EQ(read("/d/to"), "text");
+}
+
+TEST_P(FileSystemContract, CopyingReplacesNothing) {
+    write("/d/from", "one");
+    write("/d/to", "two");
+    EXPECT_EQ(codeOf(files_.copyItem("/d/from", "/d/to")), EEXIST);
+    EXPECT_EQ(codeOf(files_.copyItem("/d/missing", "/d/other")), ENOENT);
+    EXPECT_EQ(codeOf(files_.copyItem("/d/from", "/d/missing/to")), ENOENT);
+    EXPECT_EQ(read("/d/to"), "two");
+}
+
+TEST_P(FileSystemContract, OnlyRegularFilesAreReadOrCopied) {
+    make("/d/e");
+    system_->addPipe("/d/pipe");
+    EXPECT_EQ(codeOf(files_.readFile("/d/e")), EISDIR);
+    EXPECT_EQ(codeOf(files_.copyItem("/d/e", "/d/to")), EISDIR);
+    EXPECT_EQ(codeOf(files_.readFile("/d/pipe")), EINVAL);
+    EXPECT_EQ(codeOf(files_.copyItem("/d/pipe", "/d/to")), EINVAL);
+    EXPECT_FALSE(files_.itemExists("/d/to"));
+}
+
+TEST_P(FileSystemContract, LinksAreFollowed) {
+    make("/d/e");
+    write("/d/e/file", "text");
+    system_->addLink("/d/relative", "e");
+    system_->addLink("/d/absolute", "/d/e/file");
+    EXPECT_EQ(read("/d/relative/file"), "text");
+    EXPECT_EQ(read("/d/absolute"), "text");
+    EXPECT_EQ(files_.attributes("/d/absolute")->size, 4U);
+    EXPECT_EQ(codeOf(files_.copyItem("/d/absolute", "/d/copy")), 0);
+    EXPECT_EQ(read("/d/copy"), "text");
+}
+
+TEST_P(FileSystemContract, NothingLeadsOutOfTheRoot) {
+    write("/d/file", "inside");
+    system_->addLink("/d/up", "../../../..");
+    system_->addLink("/d/passwd", "/etc/passwd");
+    EXPECT_EQ(read("/d/up/d/file"), "inside");
+    EXPECT_EQ(read("/../../d/file"), "inside");
+    EXPECT_EQ(codeOf(files_.readFile("/d/passwd")), ENOENT);
+    EXPECT_FALSE(files_.itemExists("/d/up/etc/passwd"));
+}
+
+TEST_P(FileSystemContract, ALinkToNothingIsNotThereButInTheWay) {
+    system_->addLink("/d/link", "missing");
+    write("/d/file", "x");
+    EXPECT_FALSE(files_.itemExists("/d/link"));
+    EXPECT_EQ(codeOf(files_.readFile("/d/link")), ENOENT);
+    EXPECT_EQ(codeOf(files_.moveItem("/d/file", "/d/link")), EEXIST);
+    EXPECT_EQ(codeOf(files_.copyItem("/d/file", "/d/link")), EEXIST);
+}
+
+TEST_P(FileSystemContract, LinksInACircleAreRefused) {
+    system_->addLink("/d/a", "b");
+    system_->addLink("/d/b", "a");
+    EXPECT_EQ(codeOf(files_.readFile("/d/a")), ELOOP);
+    EXPECT_FALSE(files_.itemExists("/d/a"));
+}
+
+TEST_P(FileSystemContract, AWrittenFileTakesALinksPlace) {
+    write("/d/target", "kept");
+    system_->addLink("/d/link", "target");
+    write("/d/link", "new");
+    EXPECT_EQ(read("/d/link"), "new");
+    EXPECT_EQ(read("/d/target"), "kept");
+}
+
+TEST_P(FileSystemContract, TheTemporaryDirectoryIsThere) {
+    const std::string path = files_.temporaryDirectory();
+    EXPECT_TRUE(path.starts_with('/'));
+    EXPECT_FALSE(path.ends_with('/'));
+    EXPECT_TRUE(files_.attributes(path)->isDirectory);
+}
+
+/// Each operation on one path, as a table.
+std::vector<std::pair<std::string, std::function<std::int64_t(FileSystem&, const std::string&)>>>
+operationsOnAPath() {
+    return {
+        {"attributes", [](auto& files, auto& path) { return codeOf(files.attributes(path)); }},
+        {"createDirectory",
+         [](auto& files, auto& path) {
+             return codeOf(files.createDirectory(path, false, nullptr));
+         }},
+        {"createDirectories",
+         [](auto& files, auto& path) {
+             return codeOf(files.createDirectory(path, true, nullptr));
+         }},
+        {"removeItem", [](auto& files, auto& path) { return codeOf(files.removeItem(path)); }},
+        {"moveItem from",
+         [](auto& files, auto& path) { return codeOf(files.moveItem(path, "/d/new")); }},
+        {"moveItem to",
+         [](auto& files, auto& path) { return codeOf(files.moveItem("/d/file", path)); }},
+        {"copyItem from",
+         [](auto& files, auto& path) { return codeOf(files.copyItem(path, "/d/new")); }},
+        {"copyItem to",
+         [](auto& files, auto& path) { return codeOf(files.copyItem("/d/file", path)); }},
+        {"readFile", [](auto& files, auto& path) { return codeOf(files.readFile(path)); }},
+        {"writeFileAtomically",
+         [](auto& files, auto& path) { return codeOf(files.writeFileAtomically(path, {})); }},
+        {"createFile",
+         [](auto& files, auto& path) { return codeOf(files.createFile(path, {}, {})); }},
+        {"setTimesToNow",
+         [](auto& files, auto& path) { return codeOf(files.setTimesToNow(path)); }},
+    };
+}
+
+TEST_P(FileSystemContract, EveryOperationRefusesAPathThatIsNone) {
+    using std::string_literals::operator""s;
+    write("/d/file", "kept");
+    for (const std::string& path : {""s, "d/file"s, "/d/fi\0le"s}) {
+        EXPECT_FALSE(files_.itemExists(path));
+        for (const auto& [name, operation] : operationsOnAPath()) {
+            EXPECT_EQ(operation(files_, path), EINVAL) << name << " of '" << path << "'";
+        }
+    }
+    EXPECT_THAT(system_->names("/d"), ElementsAre("file"));
+}
+
+TEST_P(FileSystemContract, EveryOperationRefusesAPathThatIsTooLong) {
+    write("/d/file", "kept");
+    std::string longPath = "/d";
+    while (longPath.size() < 5000) longPath += "/name";
+    for (const std::string& path : {"/d/" + std::string(256, 'x'), longPath}) {
+        for (const auto& [name, operation] : operationsOnAPath()) {
+            EXPECT_EQ(operation(files_, path), ENAMETOOLONG) << name;
+        }
+    }
+}
+
+TEST_P(FileSystemContract, AnErrorNamesThePath) {
+    const Result<Bytes> contents = files_.readFile("/d/missing");
+    ASSERT_FALSE(contents);
+    EXPECT_THAT(contents.error().description(), HasSubstr("/d/missing"));
+    const Status moved = files_.moveItem("/d/from", "/d/to");
+    ASSERT_FALSE(moved);
+    EXPECT_THAT(moved.error().description(), HasSubstr("/d/from"));
+}
+
+}  // namespace
+}  // namespace appsync

@@ -1,0 +1,253 @@
+#include <gmock/gmock.h>
+#include <gtest/gtest.h>
+
+#include <memory>
+#include <mutex>
+#include <string>
+#include <vector>
+
+#include "tests/contract/DeviceUnderTest.h"
+
+namespace appsync {
+namespace {
+
+using testing::ElementsAre;
+using testing::IsEmpty;
+
+constexpr const char* kA = "com.example.a";
+constexpr const char* kB = "com.example.b";
+
+class InstallProgressContract : public DeviceContract {};
+
+INSTANTIATE_TEST_SUITE_P(, InstallProgressContract, testing::ValuesIn(deviceImplementations()),
+                         nameOfDevice);
+
+TEST_P(InstallProgressContract, OnlyAnInstallUnderWayHasARecord) {
+    ASSERT_TRUE(installPackage({kA}));
+    EXPECT_EQ(progress(kA), nullptr);
+    ASSERT_TRUE(installPlaceholder({kB}, kInstallTypeSync));
+    EXPECT_NE(progress(kB), nullptr);
+}
+
+TEST_P(InstallProgressContract, AnInstallBeginsByLoading) {
+    ASSERT_TRUE(installPlaceholder({kA}, kInstallTypeSync));
+    const auto record = progress(kA);
+    ASSERT_NE(record, nullptr);
+    EXPECT_LT(record->installState(), std::uint64_t{kInstallStatePaused});
+    EXPECT_EQ(record->installPhase(), std::uint64_t{kInstallPhaseLoading});
+    EXPECT_EQ(record->completedUnitCount(), 0);
+}
+
+TEST_P(InstallProgressContract, AChangeIsSeenByEverybodyAtOnce) {
+    ASSERT_TRUE(installPlaceholder({kA}, kInstallTypeSync));
+    const auto one = progress(kA);
+    const auto other = progress(kA);
+    ASSERT_NE(one, nullptr);
+    one->setInstallState(kInstallStateActive);
+    one->setInstallPhase(kInstallPhaseRestoringData);
+    one->setTotalUnitCount(1000);
+    one->setCompletedUnitCount(456);
+    EXPECT_EQ(other->installState(), std::uint64_t{kInstallStateActive});
+    EXPECT_EQ(other->installPhase(), std::uint64_t{kInstallPhaseRestoringData});
+    EXPECT_EQ(other->totalUnitCount(), 1000);
+    EXPECT_EQ(other->completedUnitCount(), 456);
+}
+
+TEST_P(InstallProgressContract, FinishingTheLoadingPhaseBeginsTheInstalling) {
+    ASSERT_TRUE(installPlaceholder({kA}, kInstallTypeSync));
+    const auto record = progress(kA);
+    ASSERT_NE(record, nullptr);
+    registry_.finishInstallPhase(*record);
+    EXPECT_EQ(record->installPhase(), std::uint64_t{kInstallPhaseInstalling});
+}
+
+TEST_P(InstallProgressContract, CancellingSaysSo) {
+    ASSERT_TRUE(installPlaceholder({kA}, kInstallTypeSync));
+    const auto record = progress(kA);
+    ASSERT_NE(record, nullptr);
+    record->cancel();
+    EXPECT_EQ(record->installState(), std::uint64_t{kInstallStateCanceled});
+    EXPECT_TRUE(preferred(kA)->state.placeholder);
+}
+
+TEST_P(InstallProgressContract, ARecordHasADescription) {
+    ASSERT_TRUE(installPlaceholder({kA}, kInstallTypeSync));
+    const std::string description = progress(kA)->description();
+    EXPECT_THAT(description, testing::HasSubstr(kA));
+    EXPECT_EQ(description.find('\n'), std::string::npos);
+}
+
+TEST_P(InstallProgressContract, ARecordWhoseInstallIsOverChangesNothingAnyMore) {
+    ASSERT_TRUE(installPlaceholder({kA}, kInstallTypeSync));
+    const auto record = progress(kA);
+    ASSERT_NE(record, nullptr);
+    record->setCompletedUnitCount(456);
+    ASSERT_TRUE(registry_.uninstallApplication(kA, {}));
+    const std::uint64_t state = record->installState();
+    record->setCompletedUnitCount(789);
+    record->setInstallState(kInstallStateActive);
+    record->cancel();
+    EXPECT_EQ(record->completedUnitCount(), 456);
+    EXPECT_EQ(record->installState(), state);
+}
+
+TEST_P(InstallProgressContract, ANewInstallHasANewRecord) {
+    ASSERT_TRUE(installPlaceholder({kA}, kInstallTypeSync));
+    progress(kA)->setCompletedUnitCount(456);
+    ASSERT_TRUE(registry_.uninstallApplication(kA, {}));
+    ASSERT_TRUE(installPlaceholder({kA}, kInstallTypeSync));
+    EXPECT_EQ(progress(kA)->completedUnitCount(), 0);
+}
+
+TEST_P(InstallProgressContract, InstallingThePackageEndsTheInstall) {
+    ASSERT_TRUE(installPlaceholder({kA}, kInstallTypeSync));
+    const auto record = progress(kA);
+    ASSERT_NE(record, nullptr);
+    ASSERT_TRUE(installPackage({kA}));
+    EXPECT_EQ(progress(kA), nullptr);
+    EXPECT_EQ(record->installState(), std::uint64_t{kInstallStateFinished});
+}
+
+/// Keeps the reports that it hears; the test waits for those that it expects.
+class ReportKeeper : public AppRegistryObserver {
+  public:
+    using Identifiers = std::vector<std::string>;
+
+    explicit ReportKeeper(WorkQueues& queues)
+        : lock_(queues.makeLock()), heard_(queues.makeSemaphore(0)) {}
+
+    void applicationInstallsArePrioritized(const std::vector<AppProxy>& prioritized,
+                                           const std::vector<AppProxy>& paused) override {
+        {
+            const std::lock_guard<Lock> held(*lock_);
+            prioritized_ = identifiersOf(prioritized);
+            paused_ = identifiersOf(paused);
+            ++reports_;
+        }
+        heard_->signal();
+    }
+    void applicationInstallsDidCancel(const std::vector<AppProxy>&) override {}
+
+    /// Returns once a report has said this; never when none does.
+    void waitFor(const Identifiers& prioritized, const Identifiers& paused) {
+        while (!says(prioritized, paused)) EXPECT_TRUE(heard_->wait());
+    }
+    [[nodiscard]] int reports() {
+        const std::lock_guard<Lock> held(*lock_);
+        return reports_;
+    }
+
+  private:
+    static Identifiers identifiersOf(const std::vector<AppProxy>& proxies) {
+        Identifiers identifiers;
+        for (const AppProxy& proxy : proxies) identifiers.push_back(proxy.applicationIdentifier);
+        return identifiers;
+    }
+    bool says(const Identifiers& prioritized, const Identifiers& paused) {
+        const std::lock_guard<Lock> held(*lock_);
+        return reports_ > 0 && prioritized_ == prioritized && paused_ == paused;
+    }
+
+    const std::unique_ptr<Lock> lock_;
+    const std::unique_ptr<Semaphore> heard_;
+    // Protected by lock_.
+    Identifiers prioritized_;
+    Identifiers paused_;
+    int reports_ = 0;
+};
+
+class RegistryObserverContract : public DeviceContract {
+  protected:
+    std::shared_ptr<ReportKeeper> observe() {
+        auto keeper = std::make_shared<ReportKeeper>(services_.queues);
+        registry_.addObserver(keeper);
+        return keeper;
+    }
+};
+
+INSTANTIATE_TEST_SUITE_P(, RegistryObserverContract, testing::ValuesIn(deviceImplementations()),
+                         nameOfDevice);
+
+TEST_P(RegistryObserverContract, AFirstReportComesEvenWhenNothingIsUnderWay) {
+    const auto keeper = observe();
+    keeper->waitFor({}, {});
+    EXPECT_EQ(keeper->reports(), 1);
+    registry_.removeObserver(keeper.get());
+}
+
+TEST_P(RegistryObserverContract, AReportNamesTheInstallsUnderWay) {
+    ASSERT_TRUE(installPackage({"com.example.installed"}));
+    ASSERT_TRUE(installPlaceholder({kA}, kInstallTypeSync));
+    ASSERT_TRUE(installPlaceholder({kB}, kInstallTypeSync));
+    const auto keeper = observe();
+    keeper->waitFor({kA, kB}, {});
+    registry_.removeObserver(keeper.get());
+}
+
+TEST_P(RegistryObserverContract, PausedInstallsStandInTheirOwnList) {
+    ASSERT_TRUE(installPlaceholder({kA}, kInstallTypeSync));
+    ASSERT_TRUE(installPlaceholder({kB}, kInstallTypeSync));
+    progress(kA)->setInstallState(kInstallStatePaused);
+    const auto keeper = observe();
+    keeper->waitFor({kB}, {kA});
+    registry_.removeObserver(keeper.get());
+}
+
+TEST_P(RegistryObserverContract, ChangesAreReported) {
+    const auto keeper = observe();
+    keeper->waitFor({}, {});
+    ASSERT_TRUE(installPlaceholder({kA}, kInstallTypeSync));
+    keeper->waitFor({kA}, {});
+    progress(kA)->setInstallState(kInstallStatePaused);
+    keeper->waitFor({}, {kA});
+    ASSERT_TRUE(installPackage({kA}));
+    keeper->waitFor({}, {});
+    registry_.removeObserver(keeper.get());
+}
+
+TEST_P(RegistryObserverContract, EveryObserverGetsItsOwnFirstReport) {
+    const auto first = observe();
+    first->waitFor({}, {});
+    const auto second = observe();
+    second->waitFor({}, {});
+    registry_.removeObserver(first.get());
+    registry_.removeObserver(second.get());
+}
+
+TEST_P(RegistryObserverContract, ARemovedObserverHearsNoMore) {
+    const auto removed = observe();
+    removed->waitFor({}, {});
+    registry_.removeObserver(removed.get());
+    const int before = removed->reports();
+    ASSERT_TRUE(installPlaceholder({kA}, kInstallTypeSync));
+    const auto other = observe();
+    other->waitFor({kA}, {});
+    EXPECT_EQ(removed->reports(), before);
+    registry_.removeObserver(other.get());
+}
+
+/// Removes itself when it is destroyed.
+class SelfRemovingObserver : public ReportKeeper {
+  public:
+    SelfRemovingObserver(AppRegistry& registry, WorkQueues& queues, Semaphore& destroyed)
+        : ReportKeeper(queues), registry_(registry), destroyed_(destroyed) {}
+    ~SelfRemovingObserver() override {
+        registry_.removeObserver(this);
+        destroyed_.signal();
+    }
+
+  private:
+    AppRegistry& registry_;
+    Semaphore& destroyed_;
+};
+
+TEST_P(RegistryObserverContract, AnObserverIsNotKeptAliveAndMayRemoveItselfAtItsEnd) {
+    const auto destroyed = services_.queues.makeSemaphore(0);
+    auto observer = std::make_shared<SelfRemovingObserver>(registry_, services_.queues, *destroyed);
+    registry_.addObserver(observer);
+    observer.reset();
+    EXPECT_TRUE(destroyed->wait());
+}
+
+}  // namespace
+}  // namespace appsync

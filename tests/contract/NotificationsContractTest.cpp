@@ -1,0 +1,98 @@
+#include <gmock/gmock.h>
+#include <gtest/gtest.h>
+
+#include <memory>
+#include <vector>
+
+#include "tests/contract/SystemUnderTest.h"
+
+namespace appsync {
+namespace {
+
+using testing::ElementsAre;
+using testing::IsEmpty;
+
+constexpr std::string_view kName = "com.example.notification";
+
+/// The observers that a callback was called with, in order.
+std::vector<void*> calledWith;
+
+void callback(void* observer) { calledWith.push_back(observer); }
+
+class NotificationsContract : public SystemContract {
+  protected:
+    NotificationsContract() { calledWith.clear(); }
+
+    void observe(const std::shared_ptr<int>& observer, std::string_view name) {
+        system_->notificationCenter().addObserver(observer, name, callback,
+                                                  NotificationCenter::SuspensionBehavior::Drop);
+    }
+};
+
+INSTANTIATE_TEST_SUITE_P(, NotificationsContract, testing::ValuesIn(systemImplementations()),
+                         nameOfSystem);
+
+TEST_P(NotificationsContract, AStateIsSeenByEverybody) {
+    NamedNotifications& notifications = system_->notifications();
+    const auto registration = notifications.registerForState(kName);
+    ASSERT_EQ(registration.status, 0U);
+    notifications.setState(registration.token, 1);
+    notifications.post(kName);
+    EXPECT_EQ(system_->notificationState(kName), 1U);
+    EXPECT_EQ(system_->notificationState("com.example.other"), 0U);
+}
+
+TEST_P(NotificationsContract, EveryRegistrationOfANameSetsTheSameState) {
+    NamedNotifications& notifications = system_->notifications();
+    const auto first = notifications.registerForState(kName);
+    const auto second = notifications.registerForState(kName);
+    notifications.setState(first.token, 1);
+    notifications.setState(second.token, 0);
+    EXPECT_EQ(system_->notificationState(kName), 0U);
+}
+
+TEST_P(NotificationsContract, TokensOfDifferentNamesAreDifferent) {
+    NamedNotifications& notifications = system_->notifications();
+    const auto one = notifications.registerForState(kName);
+    const auto other = notifications.registerForState("com.example.other");
+    notifications.setState(one.token, 5);
+    notifications.setState(other.token, 7);
+    EXPECT_EQ(system_->notificationState(kName), 5U);
+}
+
+TEST_P(NotificationsContract, AnObserverIsCalledForItsNameOnly) {
+    const auto observer = std::make_shared<int>(1);
+    observe(observer, kName);
+    system_->post("com.example.other");
+    EXPECT_THAT(calledWith, IsEmpty());
+    system_->post(kName);
+    EXPECT_THAT(calledWith, ElementsAre(observer.get()));
+}
+
+TEST_P(NotificationsContract, EveryObserverOfANameIsCalled) {
+    const auto first = std::make_shared<int>(1);
+    const auto second = std::make_shared<int>(2);
+    observe(first, kName);
+    observe(second, kName);
+    system_->post(kName);
+    EXPECT_THAT(calledWith, testing::UnorderedElementsAre(first.get(), second.get()));
+}
+
+TEST_P(NotificationsContract, ARemovedObserverIsNotCalled) {
+    const auto observer = std::make_shared<int>(1);
+    observe(observer, kName);
+    system_->notificationCenter().removeObserver(observer.get(), kName);
+    system_->post(kName);
+    EXPECT_THAT(calledWith, IsEmpty());
+}
+
+TEST_P(NotificationsContract, AnObserverThatHasGoneIsCalledAsNull) {
+    auto observer = std::make_shared<int>(1);
+    observe(observer, kName);
+    observer.reset();
+    system_->post(kName);
+    EXPECT_THAT(calledWith, ElementsAre(nullptr));
+}
+
+}  // namespace
+}  // namespace appsync

@@ -1,0 +1,112 @@
+#include <sys/stat.h>
+
+#include <algorithm>
+#include <filesystem>
+#include <stdexcept>
+
+#include "simulation/SimulatedPlatform.h"
+#include "system/PropertyListCodec.h"
+#include "system/RootedFileSystem.h"
+#include "system/SystemNotifications.h"
+#include "system/SystemWorkQueues.h"
+#include "tests/contract/SystemUnderTest.h"
+#include "tests/contract/TemporaryMachineDirectory.h"
+
+namespace appsync {
+namespace {
+
+class SimulatedSystem : public SystemUnderTest {
+  public:
+    explicit SimulatedSystem(Scheduling scheduling) : platform_(codec_, scheduling) {}
+
+    FileSystem& files() override { return platform_.files; }
+    WorkQueues& queues() override { return platform_.queues; }
+    PropertyListSerialization& propertyLists() override { return platform_.propertyLists; }
+    NamedNotifications& notifications() override { return platform_.notifications; }
+    NotificationCenter& notificationCenter() override { return platform_.notificationCenter; }
+
+    void addLink(const std::string& path, const std::string& target) override {
+        platform_.files.addLink(path, target);
+    }
+    void addPipe(const std::string& path) override { platform_.files.addPipe(path); }
+    std::vector<std::string> names(const std::string& directory) override {
+        return platform_.files.names(directory);
+    }
+    void post(std::string_view name) override {
+        platform_.notificationCenter.post(name);
+        platform_.runUntilIdle();
+    }
+    std::uint64_t notificationState(std::string_view name) override {
+        return platform_.notifications.state(std::string(name));
+    }
+    std::chrono::nanoseconds now() override { return platform_.now(); }
+
+  private:
+    SystemPropertyLists codec_;
+    SimulatedPlatform platform_;
+};
+
+/// system/: threads, and files below a directory of this machine.
+class PosixSystem : public SystemUnderTest {
+  public:
+    PosixSystem() {
+        auto opened = RootedFileSystem::open(directory_.path());
+        if (!opened) throw std::runtime_error(opened.error().description());
+        files_ = *std::move(opened);
+    }
+
+    FileSystem& files() override { return *files_; }
+    WorkQueues& queues() override { return queues_; }
+    PropertyListSerialization& propertyLists() override { return propertyLists_; }
+    NamedNotifications& notifications() override { return notifications_; }
+    NotificationCenter& notificationCenter() override { return notificationCenter_; }
+
+    void addLink(const std::string& path, const std::string& target) override {
+        std::filesystem::create_symlink(target, directory_.path() + path);
+    }
+    void addPipe(const std::string& path) override {
+        const std::string machinePath = directory_.path() + path;
+        if (::mkfifo(machinePath.c_str(), S_IRUSR | S_IWUSR) != 0) {
+            throw std::runtime_error("cannot make a pipe at " + machinePath);
+        }
+    }
+    std::vector<std::string> names(const std::string& directory) override {
+        std::vector<std::string> names;
+        for (const auto& entry :
+             std::filesystem::directory_iterator(directory_.path() + directory)) {
+            names.push_back(entry.path().filename());
+        }
+        std::sort(names.begin(), names.end());
+        return names;
+    }
+    void post(std::string_view name) override { notificationCenter_.post(name); }
+    std::uint64_t notificationState(std::string_view name) override {
+        return notifications_.stateOf(name);
+    }
+    std::chrono::nanoseconds now() override {
+        return std::chrono::steady_clock::now().time_since_epoch();
+    }
+
+  private:
+    const TemporaryMachineDirectory directory_;
+    std::unique_ptr<RootedFileSystem> files_;
+    SystemPropertyLists propertyLists_;
+    SystemNotifications notifications_;
+    SystemNotificationCenter notificationCenter_;
+    SystemWorkQueues queues_;
+};
+
+SystemImplementation simulated(const std::string& name, Scheduling scheduling) {
+    return {name, [scheduling] { return std::make_unique<SimulatedSystem>(scheduling); }};
+}
+
+}  // namespace
+
+std::vector<SystemImplementation> systemImplementations() {
+    return {simulated("Simulation", Scheduling::runToCompletion()),
+            simulated("SimulationInterleaved", Scheduling::seeded(1)),
+            simulated("SimulationInterleavedOtherwise", Scheduling::seeded(2)),
+            {"Posix", [] { return std::make_unique<PosixSystem>(); }}};
+}
+
+}  // namespace appsync

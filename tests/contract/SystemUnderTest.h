@@ -1,0 +1,75 @@
+#pragma once
+
+#include <gtest/gtest.h>
+
+#include <chrono>
+#include <cstdint>
+#include <functional>
+#include <memory>
+#include <ostream>
+#include <string>
+#include <string_view>
+#include <vector>
+
+#include "platform/FileSystem.h"
+#include "platform/Notifications.h"
+#include "platform/PropertyListSerialization.h"
+#include "platform/WorkQueues.h"
+
+namespace appsync {
+
+/// One implementation of the services that every process has, and what the contract tests need to
+/// do beside them. Made anew for each test, with an empty device root.
+///
+/// Whoever ports the plug-in writes one of these and adds it to `systemImplementations()`.
+class SystemUnderTest {
+  public:
+    virtual ~SystemUnderTest() = default;
+
+    virtual FileSystem& files() = 0;
+    virtual WorkQueues& queues() = 0;
+    virtual PropertyListSerialization& propertyLists() = 0;
+    virtual NamedNotifications& notifications() = 0;
+    virtual NotificationCenter& notificationCenter() = 0;
+
+    // What a host or another process leaves on the device.
+    virtual void addLink(const std::string& path, const std::string& target) = 0;
+    virtual void addPipe(const std::string& path) = 0;
+    /// The names in a directory of the device, sorted.
+    virtual std::vector<std::string> names(const std::string& directory) = 0;
+
+    /// Another process posts; everyone who is told of it has been told when this returns.
+    virtual void post(std::string_view name) = 0;
+    /// The state of a named notification, as another process sees it.
+    virtual std::uint64_t notificationState(std::string_view name) = 0;
+
+    /// Time by the clock that delays and timeouts go by.
+    virtual std::chrono::nanoseconds now() = 0;
+};
+
+struct SystemImplementation {
+    std::string name;
+    std::function<std::unique_ptr<SystemUnderTest>()> make;
+};
+
+inline std::ostream& operator<<(std::ostream& out, const SystemImplementation& implementation) {
+    return out << implementation.name;
+}
+
+/// Every implementation that the contract tests run over.
+std::vector<SystemImplementation> systemImplementations();
+
+/// A test of the contract of one of these services.
+class SystemContract : public testing::TestWithParam<SystemImplementation> {
+  protected:
+    SystemContract() : system_(GetParam().make()) {}
+
+    const std::unique_ptr<SystemUnderTest> system_;
+};
+
+/// The name of a parameterised test: that of the implementation.
+inline std::string nameOfSystem(const testing::TestParamInfo<SystemImplementation>& info) {
+    return info.param.name;
+}
+
+}  // namespace appsync

@@ -1,0 +1,172 @@
+#include "device/DeviceDatabase.h"
+
+#include <signal.h>
+#include <sys/wait.h>
+#include <unistd.h>
+
+#include <atomic>
+#include <filesystem>
+#include <thread>
+
+#include "device/Database.h"
+#include "device/DevicePaths.h"
+#include "tests/device/DeviceFixture.h"
+
+namespace appsync {
+namespace {
+
+class DeviceDatabaseTest : public DeviceFixture {
+  protected:
+    std::unique_ptr<DeviceDatabase> open() {
+        auto database = DeviceDatabase::open(devicePath(kDatabaseName));
+        EXPECT_TRUE(database.ok());
+        return std::move(*database);
+    }
+    static Status insert(Database& database, const std::string& identifier) {
+        return database.query("INSERT INTO restore_data (identifier) VALUES (?)")
+            .bind(identifier)
+            .run();
+    }
+    std::int64_t rows() const { return number("SELECT count(*) FROM restore_data"); }
+};
+
+TEST_F(DeviceDatabaseTest, aChangeIsSeenByEverybodyWhenTheCallReturns) {
+    const auto database = open();
+    for (const Durability durability : {Durability::OnDisk, Durability::Soon, Durability::OnDisk}) {
+        const std::int64_t before = rows();
+        ASSERT_TRUE(succeeded(database->change(
+            durability, [&](Database& writer) { return insert(writer, std::to_string(before)); })));
+        EXPECT_EQ(rows(), before + 1);
+    }
+}
+
+TEST_F(DeviceDatabaseTest, aChangeThatFailsChangesNothing) {
+    const auto database = open();
+    const Status status = database->change(Durability::OnDisk, [](Database& writer) -> Status {
+        if (Status inserted = insert(writer, "first"); !inserted) return inserted;
+        return ErrorRecord::make("test", 7, "changed its mind");
+    });
+    ASSERT_FALSE(status);
+    EXPECT_EQ(status.error().code, 7);
+    EXPECT_EQ(rows(), 0);
+    EXPECT_FALSE(database->failure()) << "a refusal is no failure of the database";
+}
+
+TEST_F(DeviceDatabaseTest, changesAtTheSameTimeAreIndependent) {
+    const auto database = open();
+    constexpr int kThreads = 10;
+    constexpr int kEach = 25;
+    std::atomic<int> unexpected{0};
+    std::vector<std::thread> threads;
+    for (int thread = 0; thread < kThreads; ++thread) {
+        threads.emplace_back([&, thread] {
+            for (int number = 0; number < kEach; ++number) {
+                const bool fails = number % 5 == 0;
+                const Status status =
+                    database->change(Durability::OnDisk, [&](Database& writer) -> Status {
+                        Status inserted = insert(writer, std::to_string(thread * kEach + number));
+                        if (!fails) return inserted;
+                        return ErrorRecord::make("test", 1, "fails");
+                    });
+                if (status.ok() == fails) ++unexpected;
+            }
+        });
+    }
+    for (std::thread& thread : threads) thread.join();
+    EXPECT_EQ(unexpected, 0);
+    EXPECT_EQ(rows(), kThreads * kEach * 4 / 5);
+}
+
+TEST_F(DeviceDatabaseTest, whatWasLeftForLaterGoesWithTheNextChange) {
+    const auto database = open();
+    database->changeLater([](Database& writer) { return insert(writer, "later"); });
+    ASSERT_TRUE(succeeded(database->change(
+        Durability::OnDisk, [](Database& writer) { return insert(writer, "now"); })));
+    EXPECT_EQ(rows(), 2);
+}
+
+TEST_F(DeviceDatabaseTest, whatWasLeftForLaterIsWrittenWithoutAnybodysHelp) {
+    const auto database = open();
+    database->changeLater([](Database& writer) { return insert(writer, "later"); });
+    while (rows() == 0) std::this_thread::yield();
+    EXPECT_EQ(rows(), 1);
+}
+
+TEST_F(DeviceDatabaseTest, closingWritesWhatWasLeftForLater) {
+    open()->changeLater([](Database& writer) { return insert(writer, "later"); });
+    EXPECT_EQ(rows(), 1);
+}
+
+TEST_F(DeviceDatabaseTest, aLaterChangeThatFailsHoldsNobodyUp) {
+    const auto database = open();
+    database->changeLater([](Database&) -> Status { return ErrorRecord::make("test", 1, "no"); });
+    database->changeLater([](Database& writer) { return insert(writer, "later"); });
+    EXPECT_TRUE(succeeded(database->flush()));
+    EXPECT_EQ(rows(), 1);
+}
+
+TEST_F(DeviceDatabaseTest, aFailureOfTheDatabaseIsRemembered) {
+    const auto database = open();
+    sql("DROP TABLE restore_data");
+    EXPECT_FALSE(
+        database->change(Durability::OnDisk, [](Database& writer) { return insert(writer, "x"); }));
+    ASSERT_TRUE(database->failure());
+    EXPECT_NE(database->failure()->description().find("restore_data"), std::string::npos);
+}
+
+TEST_F(DeviceDatabaseTest, aKilledProcessLeavesWhatItCommittedAndNothingElse) {
+    int ends[2] = {-1, -1};
+    ASSERT_EQ(::pipe(ends), 0);
+    const pid_t child = ::fork();
+    if (child == 0) {
+        auto database = DeviceDatabase::open(devicePath(kDatabaseName));
+        const bool done = database && (*database)->change(Durability::Soon, [](Database& writer) {
+            return insert(writer, "committed");
+        });
+        const Status never = (*database)->change(Durability::OnDisk, [&](Database& writer) {
+            Status inserted = insert(writer, "not committed");
+            static_cast<void>(::write(ends[1], done ? "y" : "n", 1) + 1);
+            for (;;) ::pause();
+            return inserted;
+        });
+        ::_exit(never.ok() ? 0 : 1);
+    }
+    char answer = 0;
+    ASSERT_EQ(::read(ends[0], &answer, 1), 1);
+    ::kill(child, SIGKILL);
+    ASSERT_EQ(::waitpid(child, nullptr, 0), child);
+    EXPECT_EQ(answer, 'y');
+    EXPECT_EQ(rows(), 1);
+    ::close(ends[0]);
+    ::close(ends[1]);
+}
+
+TEST_F(DeviceDatabaseTest, textsAndBytesComeBackAsTheyWere) {
+    const auto database = Database::open(path("scratch.db"), Database::Mode::Create);
+    ASSERT_TRUE(database.ok());
+    ASSERT_TRUE(succeeded((*database)->execute("CREATE TABLE t (a TEXT, b BLOB, c TEXT)")));
+    const std::string text("with\0null", 9);
+    const Bytes bytes = {0, 255, 0};
+    ASSERT_TRUE(succeeded((*database)
+                              ->query("INSERT INTO t VALUES (?, ?, ?)")
+                              .bind(text, bytes, std::optional<std::string>())
+                              .run()));
+    Query row = (*database)->query("SELECT a, b, c FROM t");
+    ASSERT_TRUE(row.next());
+    EXPECT_EQ(row.text(0), text);
+    EXPECT_EQ(row.blob(1), bytes);
+    EXPECT_EQ(row.optionalText(2), std::nullopt);
+    EXPECT_FALSE(row.next());
+}
+
+TEST_F(DeviceDatabaseTest, aWrongStatementIsAnErrorAndNotAnEmptyAnswer) {
+    const auto database = Database::open(path("scratch.db"), Database::Mode::Create);
+    Query rows = (*database)->query("SELECT nothing FROM nowhere");
+    rows.bind("a parameter");
+    EXPECT_FALSE(rows.next());
+    EXPECT_FALSE(rows.status());
+    EXPECT_FALSE((*database)->integer("SELECT nothing FROM nowhere").ok());
+}
+
+}  // namespace
+}  // namespace appsync

@@ -1,0 +1,128 @@
+#include <atomic>
+#include <cerrno>
+#include <latch>
+#include <thread>
+
+#include "device/ApplicationInstall.h"
+#include "device/Containers.h"
+#include "device/DeviceDatabase.h"
+#include "device/DevicePaths.h"
+#include "device/DurabilityBarrier.h"
+#include "device/InstallContext.h"
+#include "device/ProgressBook.h"
+#include "system/PropertyListCodec.h"
+#include "system/RootedFileSystem.h"
+#include "tests/device/DeviceFixture.h"
+
+namespace appsync {
+namespace {
+
+constexpr const char* kAtlas = "com.example.atlas";
+
+TEST(DurabilityBarrierTest, eachPassIsFollowedByASyncThatBeganAfterIt) {
+    std::atomic<int> written{0};
+    std::atomic<int> durable{0};
+    DurabilityBarrier barrier([&] {
+        const int seen = written;
+        std::this_thread::yield();
+        durable = seen;
+        return 0;
+    });
+    std::vector<std::thread> threads;
+    for (int thread = 0; thread < 8; ++thread) {
+        threads.emplace_back([&] {
+            for (int round = 0; round < 50; ++round) {
+                const int mine = ++written;
+                EXPECT_TRUE(succeeded(barrier.pass()));
+                EXPECT_GE(durable.load(), mine);
+            }
+        });
+    }
+    for (std::thread& thread : threads) thread.join();
+    EXPECT_LE(barrier.syncs(), 400U);
+}
+
+TEST(DurabilityBarrierTest, whoeverComesDuringASyncWaitsForTheNext) {
+    std::latch began(1);
+    std::latch mayEnd(1);
+    int syncs = 0;
+    DurabilityBarrier barrier([&] {
+        if (++syncs > 1) return 0;
+        began.count_down();
+        mayEnd.wait();
+        return 0;
+    });
+    std::thread first([&] { EXPECT_TRUE(succeeded(barrier.pass())); });
+    began.wait();
+    std::thread second([&] { EXPECT_TRUE(succeeded(barrier.pass())); });
+    mayEnd.count_down();
+    first.join();
+    second.join();
+    EXPECT_EQ(barrier.syncs(), 2U);
+}
+
+TEST(DurabilityBarrierTest, aFailureIsToldToThoseWhomItConcernsAndNotToLaterOnes) {
+    int answer = EIO;
+    DurabilityBarrier barrier([&] { return answer; });
+    const Status failed = barrier.pass();
+    ASSERT_FALSE(failed);
+    EXPECT_EQ(failed.error().code, EIO);
+    answer = 0;
+    EXPECT_TRUE(succeeded(barrier.pass()));
+}
+
+/// Installs on a device whose disk fails as a test wants it.
+class FailingDiskTest : public DeviceFixture {
+  protected:
+    Status installWith(DurabilityBarrier& barrier) {
+        close();
+        auto database = DeviceDatabase::open(devicePath(kDatabaseName));
+        auto files = RootedFileSystem::open(rootPath(""), {{}, std::string(kTemporaryDirectory)});
+        Containers containers(**files);
+        ProgressBook progress(**database, {});
+        SystemPropertyLists propertyLists;
+        const std::string boot;
+        const InstallContext context{**database, **files,       containers, barrier,
+                                     progress,   propertyLists, boot};
+        const std::string package = std::string(kPublicStagingDirectory) + "/package.zip";
+        write(package, packageOf(kAtlas, "2.0"));
+        return installApplication(context, kAtlas, *FileURL::fromPath(package, false), 0);
+    }
+};
+
+TEST_F(FailingDiskTest, afterAFailedSyncTheFilesAreWrittenAnew) {
+    ASSERT_TRUE(succeeded(install(kAtlas, "1.0")));
+    int syncs = 0;
+    DurabilityBarrier barrier([&] { return ++syncs == 1 ? EIO : 0; });
+    EXPECT_TRUE(succeeded(installWith(barrier)));
+    EXPECT_EQ(syncs, 2);
+    EXPECT_EQ(containers().size(), 1U);
+    EXPECT_EQ(application(kAtlas)->bundleVersion, "2.0");
+}
+
+TEST_F(FailingDiskTest, aDiskThatGoesOnFailingLeavesTheOldVersion) {
+    ASSERT_TRUE(succeeded(install(kAtlas, "1.0")));
+    const auto before = containers();
+    DurabilityBarrier barrier([] { return EIO; });
+    const Status status = installWith(barrier);
+    ASSERT_FALSE(status);
+    EXPECT_EQ(status.error().code, EIO);
+    EXPECT_EQ(containers(), before);
+    EXPECT_EQ(application(kAtlas)->bundleVersion, "1.0");
+}
+
+TEST_F(FailingDiskTest, aDatabaseThatFailsAtTheLastStepLeavesTheOldVersion) {
+    ASSERT_TRUE(succeeded(install(kAtlas, "1.0")));
+    const auto before = containers();
+    sql("CREATE TRIGGER refuse BEFORE UPDATE ON applications BEGIN"
+        " SELECT raise(ABORT, 'no'); END");
+    const Status status = install(kAtlas, "2.0");
+    sql("DROP TRIGGER refuse");
+    EXPECT_TRUE(refusedBy(status, RegistryErrorCode::DatabaseFailed));
+    EXPECT_TRUE(device().databaseFailure());
+    EXPECT_EQ(containers(), before);
+    EXPECT_EQ(application(kAtlas)->bundleVersion, "1.0");
+}
+
+}  // namespace
+}  // namespace appsync

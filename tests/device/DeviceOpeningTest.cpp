@@ -1,0 +1,162 @@
+#include <sys/stat.h>
+#include <unistd.h>
+
+#include <filesystem>
+#include <fstream>
+
+#include "device/Database.h"
+#include "tests/device/DeviceFixture.h"
+
+namespace appsync {
+namespace {
+
+namespace fs = std::filesystem;
+
+class DeviceOpeningTest : public DeviceFixture {
+  protected:
+    static Result<std::unique_ptr<Device>> openSession(const std::string& path) {
+        return Device::open(path, {.access = DeviceAccess::Session});
+    }
+
+    void scribble(std::uintmax_t offset, std::size_t bytes) const {
+        std::fstream file(devicePath("device.db"), std::ios::in | std::ios::out | std::ios::binary);
+        file.seekp(static_cast<std::streamoff>(offset));
+        file << std::string(bytes, '\xa5');
+    }
+};
+
+TEST_F(DeviceOpeningTest, anEmptyDeviceHoldsNothingAndAllowsEverything) {
+    EXPECT_TRUE(device().applications()->empty());
+    EXPECT_TRUE(device().homeScreen()->empty());
+    EXPECT_EQ(device().settings()->installation, PolicyAnswer::Unset);
+    EXPECT_FALSE(device().settings()->coordination);
+    EXPECT_FALSE(device().databaseFailure());
+    EXPECT_GT(*device().freeSpace(), 0U);
+}
+
+TEST_F(DeviceOpeningTest, creationKeepsWhatWasAskedFor) {
+    ASSERT_TRUE(succeeded(Device::create(path("other"), {.coordination = true})));
+    EXPECT_TRUE((*Device::open(path("other")))->settings()->coordination);
+    EXPECT_TRUE(fs::is_directory(path("other/log")));
+}
+
+TEST_F(DeviceOpeningTest, creationWritesAheadAndSyncsEachCommit) {
+    EXPECT_EQ(number("SELECT journal_mode = 'wal' FROM pragma_journal_mode"), 1);
+    EXPECT_EQ(number("PRAGMA user_version"), 1);
+}
+
+TEST_F(DeviceOpeningTest, creationRefusesAPathThatExists) {
+    const Status status = Device::create(devicePath());
+    ASSERT_FALSE(status);
+    EXPECT_TRUE(isDeviceError(status.error(), DeviceErrorCode::AlreadyExists));
+    EXPECT_TRUE(Device::open(devicePath()).ok());
+}
+
+TEST_F(DeviceOpeningTest, creationRefusesALinkThatLeadsNowhere) {
+    fs::create_symlink("nowhere", path("link"));
+    const Status status = Device::create(path("link"));
+    ASSERT_FALSE(status);
+    EXPECT_TRUE(isDeviceError(status.error(), DeviceErrorCode::AlreadyExists));
+}
+
+TEST_F(DeviceOpeningTest, creationWithoutAParentLeavesNothing) {
+    const Status status = Device::create(path("no/such/device"));
+    ASSERT_FALSE(status);
+    EXPECT_TRUE(isDeviceError(status.error(), DeviceErrorCode::CannotUse));
+    EXPECT_FALSE(fs::exists(path("no")));
+}
+
+TEST_F(DeviceOpeningTest, creationClearsWhatAnInterruptedOneLeft) {
+    fs::create_directories(path(".other.creating-abc123/root"));
+    ASSERT_TRUE(succeeded(Device::create(path("other/"))));
+    EXPECT_FALSE(fs::exists(path(".other.creating-abc123")));
+    EXPECT_TRUE(Device::open(path("other")).ok());
+}
+
+TEST_F(DeviceOpeningTest, missing) {
+    EXPECT_TRUE(unusable(Device::open(path("absent")), DeviceErrorCode::Missing, "create one"));
+    EXPECT_TRUE(unusable(Device::open(""), DeviceErrorCode::Missing));
+    EXPECT_TRUE(unusable(Device::open(std::string("a\0b", 3)), DeviceErrorCode::Missing));
+}
+
+TEST_F(DeviceOpeningTest, aFileIsNotADevice) {
+    std::ofstream(path("file")) << "text";
+    EXPECT_TRUE(unusable(Device::open(path("file")), DeviceErrorCode::NotADevice));
+}
+
+TEST_F(DeviceOpeningTest, anEmptyDirectoryIsNotADevice) {
+    fs::create_directory(path("empty"));
+    EXPECT_TRUE(unusable(Device::open(path("empty")), DeviceErrorCode::NotADevice, "device.db"));
+}
+
+TEST_F(DeviceOpeningTest, aPipeInPlaceOfTheDatabaseIsRefusedWithoutWaitingOnIt) {
+    fs::remove(devicePath("device.db"));
+    ASSERT_EQ(::mkfifo(devicePath("device.db").c_str(), 0600), 0);
+    EXPECT_TRUE(unusable(openSession(devicePath()), DeviceErrorCode::NotADevice));
+}
+
+TEST_F(DeviceOpeningTest, theDatabaseOfSomethingElseIsNotADevice) {
+    sql("PRAGMA application_id = 1");
+    EXPECT_TRUE(unusable(Device::open(devicePath()), DeviceErrorCode::NotADevice));
+}
+
+TEST_F(DeviceOpeningTest, halfCreated) {
+    fs::remove(devicePath("device.db"));
+    EXPECT_TRUE(unusable(Device::open(devicePath()), DeviceErrorCode::HalfCreated, "device.db"));
+    std::ofstream(devicePath("device.db")).close();
+    EXPECT_TRUE(unusable(Device::open(devicePath()), DeviceErrorCode::HalfCreated, "remove"));
+}
+
+TEST_F(DeviceOpeningTest, aDeviceWithoutItsContainersIsNotWhole) {
+    fs::remove_all(devicePath("root/var/containers"));
+    EXPECT_TRUE(unusable(openSession(devicePath()), DeviceErrorCode::HalfCreated, "containers"));
+}
+
+TEST_F(DeviceOpeningTest, aNewerSchemaIsRefusedAndLeftAlone) {
+    sql("PRAGMA user_version = 99");
+    EXPECT_TRUE(unusable(openSession(devicePath()), DeviceErrorCode::NewerSchema, "99"));
+    EXPECT_EQ(number("PRAGMA user_version"), 99);
+}
+
+TEST_F(DeviceOpeningTest, aDamagedHeader) {
+    scribble(0, 64);
+    EXPECT_TRUE(unusable(Device::open(devicePath()), DeviceErrorCode::Damaged, "damaged"));
+}
+
+TEST_F(DeviceOpeningTest, damageInTheMiddleIsFoundBeforeASessionBegins) {
+    ASSERT_TRUE(succeeded(install("com.example.atlas")));
+    close();
+    scribble(4096 * 3, 4096 * 4);
+    EXPECT_TRUE(unusable(openSession(devicePath()), DeviceErrorCode::Damaged));
+    EXPECT_EQ(containers().size(), 1U) << "nothing is removed on the word of a damaged database";
+}
+
+TEST_F(DeviceOpeningTest, aDatabaseThatWasCutOff) {
+    fs::resize_file(devicePath("device.db"), 4096 * 2 + 100);
+    EXPECT_TRUE(unusable(openSession(devicePath()), DeviceErrorCode::Damaged));
+}
+
+TEST_F(DeviceOpeningTest, theSecondSessionIsTurnedAwayAndToldWhoHoldsTheDevice) {
+    static_cast<void>(device());
+    EXPECT_TRUE(unusable(openSession(devicePath()), DeviceErrorCode::InUse,
+                         "process " + std::to_string(::getpid())));
+    close();
+    EXPECT_TRUE(openSession(devicePath()).ok());
+}
+
+TEST_F(DeviceOpeningTest, aLookWorksDuringASession) {
+    ASSERT_TRUE(succeeded(install("com.example.atlas")));
+    const std::unique_ptr<Device> other = look();
+    EXPECT_EQ(other->applications()->size(), 1U);
+    EXPECT_TRUE(succeeded(other->run("com.example.atlas")));
+    EXPECT_TRUE(device().status("com.example.atlas")->isRunning);
+}
+
+TEST_F(DeviceOpeningTest, aLookMayNotDoWhatNeedsTheSession) {
+    const std::unique_ptr<Device> other = look();
+    EXPECT_FALSE(other->demote("com.example.atlas", DemotedBy::Person));
+    EXPECT_FALSE(other->removeLeftoverSyncPlaceholders().ok());
+}
+
+}  // namespace
+}  // namespace appsync

@@ -1,0 +1,120 @@
+#include <filesystem>
+
+#include "device/DevicePaths.h"
+#include "tests/device/DeviceFixture.h"
+
+namespace appsync {
+namespace {
+
+constexpr const char* kAtlas = "com.example.atlas";
+
+class DeviceUninstallTest : public DeviceFixture {
+  protected:
+    Status uninstall(const PropertyList& options = {}) {
+        return device().registry().uninstallApplication(kAtlas, options);
+    }
+    static PropertyList placeholderOnly() {
+        return PropertyList::map({{UninstallPlaceholderOnlyKey, true}});
+    }
+    std::string makeData() {
+        std::filesystem::create_directory(rootPath(data()));
+        write(data() + "/notes", "data");
+        return data();
+    }
+    static std::string data() { return std::string(kDataDirectory) + "/" + kAtlas; }
+};
+
+TEST_F(DeviceUninstallTest, anApplicationGoesWithItsFilesAndItsData) {
+    ASSERT_TRUE(succeeded(install(kAtlas)));
+    makeData();
+    ASSERT_TRUE(succeeded(uninstall()));
+    EXPECT_FALSE(either(kAtlas));
+    EXPECT_TRUE(containers().empty());
+    EXPECT_FALSE(exists(data()));
+}
+
+TEST_F(DeviceUninstallTest, thePlaceholderGoesFirst) {
+    ASSERT_TRUE(succeeded(install(kAtlas, "1.0")));
+    ASSERT_TRUE(succeeded(installPlaceholder(kAtlas)));
+    makeData();
+    ASSERT_TRUE(succeeded(uninstall()));
+    EXPECT_EQ(either(kAtlas)->bundleVersion, "1.0");
+    EXPECT_TRUE(either(kAtlas)->state.installed);
+    EXPECT_TRUE(exists(data()));
+    ASSERT_TRUE(succeeded(uninstall()));
+    EXPECT_FALSE(either(kAtlas));
+}
+
+TEST_F(DeviceUninstallTest, placeholderOnlyNeverTouchesTheApplication) {
+    ASSERT_TRUE(succeeded(install(kAtlas)));
+    EXPECT_TRUE(refusedBy(uninstall(placeholderOnly()), RegistryErrorCode::NothingInstalled));
+    ASSERT_TRUE(succeeded(installPlaceholder(kAtlas)));
+    EXPECT_TRUE(succeeded(uninstall(placeholderOnly())));
+    EXPECT_TRUE(application(kAtlas));
+    EXPECT_EQ(containers().size(), 1U);
+}
+
+TEST_F(DeviceUninstallTest, placeholderOnlyThatIsFalseIsNoOption) {
+    ASSERT_TRUE(succeeded(install(kAtlas)));
+    EXPECT_TRUE(succeeded(uninstall(PropertyList::map({{UninstallPlaceholderOnlyKey, false}}))));
+    EXPECT_FALSE(application(kAtlas));
+}
+
+TEST_F(DeviceUninstallTest, aSyncsPlaceholderLeavesDataThatItDidNotBring) {
+    makeData();
+    ASSERT_TRUE(succeeded(installPlaceholder(kAtlas, kInstallTypeSync)));
+    ASSERT_TRUE(succeeded(uninstall()));
+    EXPECT_TRUE(exists(data()));
+}
+
+TEST_F(DeviceUninstallTest, theDataOfADemotedApplicationGoesWithItsPlaceholder) {
+    makeData();
+    ASSERT_TRUE(succeeded(installPlaceholder(kAtlas, kInstallTypeIntentionalDowngrade)));
+    ASSERT_TRUE(succeeded(uninstall()));
+    EXPECT_FALSE(exists(data()));
+}
+
+TEST_F(DeviceUninstallTest, theProgressOfARemovedPlaceholderIsCancelledAndKeepsItsValues) {
+    ASSERT_TRUE(succeeded(installPlaceholder(kAtlas)));
+    const auto record = progressOf(kAtlas);
+    record->setCompletedUnitCount(400);
+    ASSERT_TRUE(succeeded(uninstall()));
+    EXPECT_EQ(record->installState(), kInstallStateCanceled);
+    record->setCompletedUnitCount(900);
+    EXPECT_EQ(record->completedUnitCount(), 400);
+}
+
+TEST_F(DeviceUninstallTest, nothingToRemoveIsAnError) {
+    EXPECT_TRUE(refusedBy(uninstall(), RegistryErrorCode::NothingInstalled, kAtlas));
+    EXPECT_TRUE(refusedBy(device().uninstall(kAtlas), RegistryErrorCode::NothingInstalled));
+    EXPECT_TRUE(
+        refusedBy(device().uninstall("../../escape"), RegistryErrorCode::IllegalIdentifier));
+}
+
+TEST_F(DeviceUninstallTest, systemApplicationsStay) {
+    ASSERT_TRUE(succeeded(install(kAtlas)));
+    sql("UPDATE applications SET type = 'System'");
+    EXPECT_TRUE(refusedBy(uninstall(), RegistryErrorCode::SystemApplication));
+    EXPECT_TRUE(refusedBy(device().uninstall(kAtlas), RegistryErrorCode::SystemApplication));
+    EXPECT_TRUE(application(kAtlas));
+}
+
+TEST_F(DeviceUninstallTest, aPersonRemovesApplicationAndPlaceholderAtOnce) {
+    ASSERT_TRUE(succeeded(install(kAtlas)));
+    ASSERT_TRUE(succeeded(installPlaceholder(kAtlas)));
+    ASSERT_TRUE(succeeded(device().run(kAtlas)));
+    ASSERT_TRUE(succeeded(look()->uninstall(kAtlas)));
+    EXPECT_FALSE(either(kAtlas));
+    EXPECT_TRUE(containers().empty());
+    EXPECT_EQ(number("SELECT count(*) FROM running"), 0);
+    EXPECT_TRUE(device().status(kAtlas)->uninstalled);
+}
+
+TEST_F(DeviceUninstallTest, whatTheRegistryRemovesIsNotOnTheInstallersList) {
+    ASSERT_TRUE(succeeded(install(kAtlas)));
+    ASSERT_TRUE(succeeded(uninstall()));
+    EXPECT_FALSE(device().status(kAtlas)->uninstalled);
+}
+
+}  // namespace
+}  // namespace appsync

@@ -1,0 +1,98 @@
+#include "device/IconDrawing.h"
+
+#include <gtest/gtest.h>
+
+#include "tests/device/IconPng.h"
+
+namespace appsync {
+
+namespace {
+
+constexpr Color kRed = {1, 0, 0};
+constexpr std::uint32_t kOpaqueRed = 0xffff0000;
+
+TEST(IconDrawingTest, iconsGetTheirSizeAndRoundCorners) {
+    for (const int side : {1, 57, 120, 1024}) {
+        const Result<Bytes> icon = renderIcon(pngOf(side, side, kRed));
+        ASSERT_TRUE(icon.ok()) << icon.error().description();
+        EXPECT_EQ(sizeOf(*icon), "120x120");
+        EXPECT_EQ(pixelOf(*icon, 60, 60), kOpaqueRed);
+        EXPECT_EQ(pixelOf(*icon, 60, 0), kOpaqueRed);
+        EXPECT_EQ(pixelOf(*icon, 0, 0), 0U);
+        EXPECT_EQ(pixelOf(*icon, 119, 119), 0U);
+    }
+}
+
+TEST(IconDrawingTest, anImageThatIsNotSquareFillsTheIcon) {
+    const Result<Bytes> icon = renderIcon(pngOf(300, 100, kRed));
+    ASSERT_TRUE(icon.ok());
+    EXPECT_EQ(sizeOf(*icon), "120x120");
+    EXPECT_EQ(pixelOf(*icon, 0, 60), kOpaqueRed);
+    EXPECT_EQ(pixelOf(*icon, 60, 119), kOpaqueRed);
+}
+
+TEST(IconDrawingTest, whatIsNoPngIsRefused) {
+    const std::string jpeg = "\xff\xd8\xff\xe0" + std::string(1000, 'j');
+    EXPECT_FALSE(renderIcon({}).ok());
+    EXPECT_FALSE(renderIcon(Bytes(jpeg.begin(), jpeg.end())).ok());
+    EXPECT_FALSE(renderIcon(Bytes(100, 0)).ok());
+}
+
+TEST(IconDrawingTest, wherePngsAreCutOffTheyAreRefused) {
+    const Bytes whole = pngOf(8, 8, kRed);
+    for (std::size_t length = 0; length < whole.size(); ++length) {
+        EXPECT_FALSE(renderIcon(ByteView(whole).first(length)).ok()) << length;
+    }
+}
+
+TEST(IconDrawingTest, hugeClaimsAreRefusedByWhatTheySay) {
+    const Bytes png = pngOf(8, 8, kRed);
+    for (const std::uint32_t side : {4097U, 65536U, 0x7fffffffU, 0x80000000U, 0xffffffffU}) {
+        const Result<Bytes> wide = renderIcon(claimingSize(png, side, 1));
+        ASSERT_FALSE(wide.ok());
+        EXPECT_NE(wide.error().description().find(std::to_string(side)), std::string::npos);
+        EXPECT_FALSE(renderIcon(claimingSize(png, 1, side)).ok());
+    }
+}
+
+TEST(IconDrawingTest, noPixelsAreRefused) {
+    const Bytes png = pngOf(8, 8, kRed);
+    EXPECT_FALSE(renderIcon(claimingSize(png, 0, 8)).ok());
+    EXPECT_FALSE(renderIcon(claimingSize(png, 8, 0)).ok());
+}
+
+TEST(IconDrawingTest, fewerPixelsThanClaimedAreRefused) {
+    EXPECT_FALSE(renderIcon(claimingSize(pngOf(8, 8, kRed), 4096, 4096)).ok());
+}
+
+TEST(IconDrawingTest, damagedPixelsAreRefused) {
+    Bytes png = pngOf(64, 64, kRed);
+    png[png.size() / 2] ^= 0xffU;
+    EXPECT_FALSE(renderIcon(png).ok());
+}
+
+TEST(IconDrawingTest, aFileThatIsTooLargeIsRefused) {
+    Bytes png = pngOf(8, 8, kRed);
+    png.resize(kMaximumIconFileBytes + 1);
+    EXPECT_FALSE(renderIcon(png).ok());
+}
+
+TEST(IconDrawingTest, defaultIconsDifferByIdentifier) {
+    const Result<Bytes> atlas = renderDefaultIcon("com.example.atlas", "Atlas");
+    ASSERT_TRUE(atlas.ok());
+    EXPECT_EQ(sizeOf(*atlas), "120x120");
+    EXPECT_EQ(pixelOf(*atlas, 0, 0), 0U);
+    EXPECT_EQ(*atlas, *renderDefaultIcon("com.example.atlas", "Atlas"));
+    EXPECT_NE(*atlas, *renderDefaultIcon("com.example.beacon", "Atlas"));
+    EXPECT_NE(*atlas, *renderDefaultIcon("com.example.atlas", "Beacon"));
+}
+
+TEST(IconDrawingTest, defaultIconsTakeAnyName) {
+    for (const char* name : {"", "\xff", "\n", "\xf0\x9f\x98\x80", "\xc3", "1"}) {
+        EXPECT_TRUE(renderDefaultIcon("", name).ok());
+    }
+}
+
+}  // namespace
+
+}  // namespace appsync

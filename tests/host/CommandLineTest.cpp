@@ -1,0 +1,87 @@
+#include "host/CommandLine.h"
+
+#include <gmock/gmock.h>
+#include <gtest/gtest.h>
+
+#include <sstream>
+
+#include "host/Console.h"
+
+namespace appsync {
+namespace {
+
+using testing::HasSubstr;
+using testing::StartsWith;
+
+class CommandLine : public testing::Test {
+  protected:
+    int run(std::vector<std::string> arguments) {
+        return runCommandLine(std::move(arguments), console);
+    }
+
+    std::ostringstream out;
+    std::ostringstream err;
+    Console console{out, err, false, 80};
+};
+
+struct WrongUsage {
+    std::vector<std::string> arguments;
+    std::string complaint;
+};
+
+class WrongCommandLine : public CommandLine, public testing::WithParamInterface<WrongUsage> {};
+
+TEST_P(WrongCommandLine, IsRefusedWithOneLineAndStatus2) {
+    EXPECT_EQ(run(GetParam().arguments), 2);
+    EXPECT_THAT(err.str(), StartsWith("appsync: "));
+    EXPECT_THAT(err.str(), HasSubstr(GetParam().complaint));
+    EXPECT_EQ(err.str().find('\n'), err.str().size() - 1);
+    EXPECT_EQ(out.str(), "");
+}
+
+INSTANTIATE_TEST_SUITE_P(
+    Usage, WrongCommandLine,
+    testing::Values(
+        WrongUsage{{}, "subcommand"}, WrongUsage{{"dance"}, "dance"},
+        WrongUsage{{"sync", "device"}, "LIBRARY"},
+        WrongUsage{{"sync", "device", "library", "--json", "--json-lines"}, "--json"},
+        WrongUsage{{"sync", "device", "library", "--staged", "--mirror"}, "--staged"},
+        WrongUsage{{"sync", "device", "library", "--remove", "a/b"}, "--remove a/b"},
+        WrongUsage{{"create", "device", "--coordination", "on"}, "not available"},
+        WrongUsage{{"create", "device", "--coordination", "perhaps"}, "perhaps"},
+        WrongUsage{{"set", "device", "coordination=on"}, "not available"},
+        WrongUsage{{"set", "device", "installation=maybe"}, "use yes, no or unset"},
+        WrongUsage{{"set", "device", "colour=red"}, "no setting colour"},
+        WrongUsage{{"run", "device", "not/legal"}, "not an identifier"},
+        WrongUsage{{"log", "device", "--level", "loud"}, "loud"},
+        WrongUsage{{"send", "device", "com.a", "file", "--parts", "2"}, "without --restore"},
+        WrongUsage{{"send", "device", "com.a", "file", "--restore", "--parts", "4"}, "4"},
+        WrongUsage{{"coordinator", "device", "dance"}, "dance"},
+        WrongUsage{{"plist", "convert", "file", "--to", "json"}, "json"}));
+
+class EachCommand : public CommandLine, public testing::WithParamInterface<std::string> {};
+
+TEST_P(EachCommand, HasHelp) {
+    std::vector<std::string> arguments;
+    std::istringstream words(GetParam());
+    for (std::string word; words >> word;) arguments.push_back(word);
+    arguments.emplace_back("--help");
+    EXPECT_EQ(run(arguments), 0);
+    EXPECT_THAT(out.str(), HasSubstr("Usage: "));
+    EXPECT_EQ(err.str(), "");
+}
+
+INSTANTIATE_TEST_SUITE_P(Help, EachCommand,
+                         testing::Values("", "create", "sync", "plan", "apps", "screen", "why",
+                                         "inventory", "set", "run", "quit", "uninstall", "reset",
+                                         "log", "history", "coordinator", "demote", "store", "send",
+                                         "package", "package make", "package show", "plist",
+                                         "plist show", "plist convert"));
+
+TEST_F(CommandLine, ADeviceThatIsMissingIsStatus3) {
+    EXPECT_EQ(run({"apps", "/nonexistent/device"}), 3);
+    EXPECT_THAT(err.str(), HasSubstr("/nonexistent/device"));
+}
+
+}  // namespace
+}  // namespace appsync

@@ -1,0 +1,69 @@
+#include "host/PackageSender.h"
+
+#include <filesystem>
+#include <fstream>
+#include <utility>
+
+#include "host/SyncDaemon.h"
+#include "tests/host/HostFixture.h"
+
+namespace appsync {
+namespace {
+
+constexpr std::uint64_t kMebibyte = std::uint64_t{1} << 20;
+const std::string kDirectory = "/var/mobile/Media/PublicStaging";
+
+class PackageSending : public HostFixture {
+  protected:
+    PackageSending() { write(file, std::string(2 * kMebibyte + 7, 'x')); }
+
+    Result<std::uint64_t> send(const PackageSender::Progress& progress) {
+        return PackageSender(*opened).send(file, kDirectory, "com.a.zip", progress);
+    }
+
+    const std::string file = library + "/package";
+    const std::string arrived = root + kDirectory + "/com.a.zip";
+    const std::unique_ptr<Device> opened = open(DeviceAccess::Session);
+};
+
+TEST_F(PackageSending, ComesInPiecesAndWhole) {
+    std::vector<std::uint64_t> steps;
+    const Result<std::uint64_t> sent = send([&](std::uint64_t done, std::uint64_t) {
+        steps.push_back(done);
+        return true;
+    });
+    ASSERT_TRUE(sent.ok());
+    EXPECT_EQ(*sent, 2 * kMebibyte + 7);
+    EXPECT_EQ(std::filesystem::file_size(arrived), *sent);
+    EXPECT_THAT(steps, testing::ElementsAre(kMebibyte, 2 * kMebibyte, 2 * kMebibyte + 7));
+}
+
+TEST_F(PackageSending, LeavesNothingWhenItIsInterrupted) {
+    const Result<std::uint64_t> sent = send([](std::uint64_t, std::uint64_t) { return false; });
+    ASSERT_FALSE(sent.ok());
+    EXPECT_EQ(sent.error().code, kTransferInterrupted);
+    EXPECT_FALSE(std::filesystem::exists(arrived));
+}
+
+TEST_F(PackageSending, NoticesThatThePackageBecameShorter) {
+    const Result<std::uint64_t> sent = send([&](std::uint64_t, std::uint64_t) {
+        std::filesystem::resize_file(file, kMebibyte);
+        return true;
+    });
+    ASSERT_FALSE(sent.ok());
+    EXPECT_EQ(sent.error().code, kTransferCutShort);
+    EXPECT_FALSE(std::filesystem::exists(arrived));
+}
+
+TEST_F(PackageSending, ReplacesALinkInsteadOfFollowingIt) {
+    const std::string victim = directory.path() + "/victim";
+    write(victim, "precious");
+    std::filesystem::create_directories(root + kDirectory);
+    std::filesystem::create_symlink(victim, arrived);
+    ASSERT_TRUE(send([](std::uint64_t, std::uint64_t) { return true; }).ok());
+    EXPECT_EQ(std::filesystem::file_size(victim), 8U);
+    EXPECT_TRUE(std::filesystem::is_regular_file(std::filesystem::symlink_status(arrived)));
+}
+
+}  // namespace
+}  // namespace appsync

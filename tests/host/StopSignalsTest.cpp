@@ -1,0 +1,39 @@
+#include "host/StopSignals.h"
+
+#include <gtest/gtest.h>
+#include <signal.h>
+#include <unistd.h>
+
+#include <chrono>
+#include <future>
+
+namespace appsync {
+namespace {
+
+constexpr std::chrono::hours kForEver{1};
+
+TEST(StopSignals, AskForAStopOnlyWhenASignalComes) {
+    const StopSignals signals(kForEver, [] { FAIL() << "gave up"; });
+    EXPECT_FALSE(signals.stopRequested());
+}
+
+TEST(StopSignals, GiveUpWhenTheSessionDoesNotEndInTime) {
+    std::promise<void> gaveUp;
+    const StopSignals signals(std::chrono::milliseconds(0), [&] { gaveUp.set_value(); });
+    ::kill(::getpid(), SIGTERM);
+    gaveUp.get_future().wait();
+    EXPECT_TRUE(signals.stopRequested());
+}
+
+TEST(StopSignals, GiveUpAtTheSecondSignal) {
+    std::promise<void> gaveUp;
+    const StopSignals signals(kForEver, [&] { gaveUp.set_value(); });
+    ::kill(::getpid(), SIGTERM);
+    while (!signals.stopRequested()) std::this_thread::yield();
+    ::kill(::getpid(), SIGTERM);
+    gaveUp.get_future().wait();
+    SUCCEED();
+}
+
+}  // namespace
+}  // namespace appsync

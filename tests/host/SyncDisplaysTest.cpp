@@ -1,0 +1,120 @@
+#include "host/SyncDisplays.h"
+
+#include <gmock/gmock.h>
+#include <gtest/gtest.h>
+
+#include <sstream>
+
+#include "host/Console.h"
+#include "host/Text.h"
+
+namespace appsync {
+namespace {
+
+using testing::HasSubstr;
+using testing::StartsWith;
+
+constexpr std::chrono::system_clock::time_point kNextTry{std::chrono::seconds{1'700'000'000}};
+
+SyncEvent event(SyncEventKind kind, SyncState state, std::uint64_t done = 512,
+                std::string text = "") {
+    return {kind,  SyncPhase::Install, "com.example.atlas", done, 1024,
+            state, std::nullopt,       std::move(text)};
+}
+
+SyncEvent waiting() {
+    SyncEvent result = event(SyncEventKind::Waiting, SyncState::Waiting, 0, "it is running");
+    result.nextTry = kNextTry;
+    return result;
+}
+
+class SyncDisplays : public testing::Test {
+  protected:
+    std::string shown(SyncDisplayKind kind, const std::vector<SyncEvent>& events) {
+        const std::unique_ptr<SyncDisplay> display = makeSyncDisplay(kind, console);
+        for (const SyncEvent& each : events) display->show(each);
+        display->finish(summary);
+        return out.str();
+    }
+
+    std::ostringstream out;
+    std::ostringstream err;
+    Console console{out, err, false, 80};
+    SyncSummary summary;
+};
+
+TEST_F(SyncDisplays, PrintsALinePerEventWithoutATerminal) {
+    const std::string text =
+        shown(SyncDisplayKind::Text, {event(SyncEventKind::Progress, SyncState::Active)});
+    EXPECT_THAT(text, StartsWith("install com.example.atlas: 50 % (512 bytes of 1.0 KiB)\n"));
+}
+
+TEST_F(SyncDisplays, SaysWhichApplicationHoldsItUpAndWhenTheNextTryComes) {
+    EXPECT_EQ(
+        eventLine(waiting()),
+        "install com.example.atlas: waiting: it is running; next try at " + formatClock(kNextTry));
+}
+
+TEST_F(SyncDisplays, RedrawsTheBarInPlace) {
+    console.isTerminal = true;
+    const std::string text =
+        shown(SyncDisplayKind::Text, {event(SyncEventKind::Progress, SyncState::Active),
+                                      event(SyncEventKind::Ended, SyncState::Finished, 1024)});
+    EXPECT_THAT(text, HasSubstr("[##########..........]  50 %\n\x1b[1A\x1b[J"));
+    EXPECT_THAT(text, HasSubstr("[####################] 100 %\n"));
+}
+
+TEST_F(SyncDisplays, NoBarIsWiderThanTheTerminal) {
+    SyncEvent failed = event(SyncEventKind::Ended, SyncState::Failed, 0, std::string(500, 'x'));
+    failed.identifier = std::string(300, 'y');
+    EXPECT_EQ(displayWidth(eventBar(failed, 79)), 79U);
+    failed.state = SyncState::Active;
+    EXPECT_LE(displayWidth(eventBar(failed, 79)), 79U);
+}
+
+TEST_F(SyncDisplays, NothingThatATerminalObeysGetsThrough) {
+    SyncEvent hostile = event(SyncEventKind::Ended, SyncState::Failed, 0, "bad\x1b[2J\nline");
+    hostile.identifier = "com\x07.x";
+    EXPECT_EQ(eventLine(hostile), "install com?.x: failed: bad?[2J?line");
+}
+
+TEST_F(SyncDisplays, PrintsOneObjectPerEventAndTheSummaryLast) {
+    summary.requested = {"com.example.atlas"};
+    summary.failed.push_back({"com.example.atlas", "damaged"});
+    const std::string text = shown(SyncDisplayKind::JsonLines, {waiting()});
+    EXPECT_EQ(text,
+              R"({"event":"waiting","phase":"install","identifier":"com.example.atlas","done":0,)"
+              R"("total":1024,"state":"waiting","nextTry":"2023-11-14T22:13:20Z",)"
+              R"("waitsFor":"it is running"})"
+              "\n"
+              R"({"event":"summary","requested":["com.example.atlas"],"installed":[],"updated":[],)"
+              R"("removed":[],"failed":[{"identifier":"com.example.atlas","error":"damaged"}],)"
+              R"("skipped":[],"bytes":0,"seconds":0.0})"
+              "\n");
+}
+
+TEST_F(SyncDisplays, PrintsOneObjectInAll) {
+    const std::string text =
+        shown(SyncDisplayKind::Json, {event(SyncEventKind::Progress, SyncState::Active)});
+    EXPECT_THAT(text, StartsWith("{\n  \"requested\": [],"));
+}
+
+TEST_F(SyncDisplays, BrokenTextDoesNotBreakTheJson) {
+    summary.failed.push_back({"com.\xff", "bad"});
+    EXPECT_THAT(shown(SyncDisplayKind::Json, {}), HasSubstr("com.\xEF\xBF\xBD"));
+}
+
+TEST_F(SyncDisplays, SaysWhenNothingWasToDo) {
+    EXPECT_EQ(summaryText(summary), "Nothing to do: all is in step.\n");
+}
+
+TEST_F(SyncDisplays, NamesEachFailureInTheSummary) {
+    summary.requested = {"com.a"};
+    summary.failed.push_back({"com.a", "damaged"});
+    summary.skipped.push_back({"com.b", "offloaded", true});
+    EXPECT_THAT(summaryText(summary), HasSubstr("Failed com.a: damaged\n"));
+    EXPECT_THAT(summaryText(summary), HasSubstr("Skipped com.b: offloaded\n"));
+}
+
+}  // namespace
+}  // namespace appsync

@@ -1,0 +1,158 @@
+#include "host/SyncOutcome.h"
+
+#include <gmock/gmock.h>
+#include <gtest/gtest.h>
+
+#include "host/SessionFacts.h"
+#include "host/SyncPlan.h"
+
+namespace appsync {
+namespace {
+
+using testing::ElementsAre;
+using testing::HasSubstr;
+using testing::IsEmpty;
+
+class SyncOutcome : public testing::Test {
+  protected:
+    void present(const char* identifier, const char* version) {
+        ApplicationRecord record;
+        record.identifier = identifier;
+        record.version = version;
+        record.type = "User";
+        aftermath.present.push_back(record);
+    }
+
+    void planInstall(const char* identifier, const char* version) {
+        plan.install.push_back({identifier, "", "", version, 0, 0});
+    }
+
+    SyncSummary summary() const { return summarize(plan, facts, aftermath); }
+
+    SyncPlan plan;
+    SessionFacts facts;
+    SessionAftermath aftermath;
+};
+
+TEST_F(SyncOutcome, TellsInstalledUpdatedAndRemovedApart) {
+    planInstall("com.a", "1");
+    plan.update.push_back({"com.b", "", "1", "2", 0, 0});
+    plan.remove = {"com.c"};
+    facts.requested("com.a");
+    facts.installed("com.a");
+    facts.installed("com.b");
+    facts.removed("com.c");
+    present("com.a", "1");
+    present("com.b", "2");
+    EXPECT_THAT(summary().requested, ElementsAre("com.a"));
+    EXPECT_THAT(summary().installed, ElementsAre("com.a"));
+    EXPECT_THAT(summary().updated, ElementsAre("com.b"));
+    EXPECT_THAT(summary().removed, ElementsAre("com.c"));
+    EXPECT_FALSE(summary().incomplete);
+}
+
+TEST_F(SyncOutcome, NamesTheFirstCauseOfWhatIsNotThere) {
+    planInstall("com.a", "1");
+    facts.failed("com.a", "the package is damaged");
+    facts.failed("com.a", "something that followed from it");
+    ASSERT_EQ(summary().failed.size(), 1U);
+    EXPECT_EQ(summary().failed[0].error, "the package is damaged");
+    EXPECT_TRUE(summary().incomplete);
+}
+
+TEST_F(SyncOutcome, AFailureOnTheWayDoesNotCountWhenTheApplicationIsThere) {
+    planInstall("com.a", "1");
+    facts.failed("com.a", "the placeholder was refused");
+    facts.installed("com.a");
+    present("com.a", "1");
+    EXPECT_THAT(summary().failed, IsEmpty());
+    EXPECT_FALSE(summary().incomplete);
+}
+
+TEST_F(SyncOutcome, WhatTheDeviceDidNotAskForHasFailed) {
+    planInstall("com.a", "1");
+    ASSERT_EQ(summary().failed.size(), 1U);
+    EXPECT_THAT(summary().failed[0].error, HasSubstr("did not ask"));
+}
+
+TEST_F(SyncOutcome, AnOlderVersionThatStayedIsNoUpdate) {
+    plan.update.push_back({"com.b", "", "1", "2", 0, 0});
+    present("com.b", "1");
+    EXPECT_THAT(summary().updated, IsEmpty());
+    EXPECT_TRUE(summary().incomplete);
+}
+
+TEST_F(SyncOutcome, WhatPolicyForbidsIsSkippedAndMakesTheSessionIncomplete) {
+    planInstall("com.a", "1");
+    plan.remove = {"com.c"};
+    aftermath.installationAllowed = false;
+    aftermath.removalAllowed = false;
+    ASSERT_EQ(summary().skipped.size(), 2U);
+    EXPECT_THAT(summary().skipped[0].why, HasSubstr("policy"));
+    EXPECT_THAT(summary().failed, IsEmpty());
+    EXPECT_TRUE(summary().incomplete);
+}
+
+TEST_F(SyncOutcome, AnApplicationThatIsStillThereWasNotRemoved) {
+    plan.remove = {"com.c"};
+    present("com.c", "1");
+    EXPECT_THAT(summary().removed, IsEmpty());
+    ASSERT_EQ(summary().failed.size(), 1U);
+    EXPECT_EQ(summary().failed[0].error, "it is still there");
+}
+
+TEST_F(SyncOutcome, RemovalAndInstallOfOneIdentifierAreBothDone) {
+    planInstall("com.a", "1");
+    plan.remove = {"com.a"};
+    facts.removed("com.a");
+    facts.installed("com.a");
+    present("com.a", "1");
+    EXPECT_THAT(summary().removed, ElementsAre("com.a"));
+    EXPECT_THAT(summary().installed, ElementsAre("com.a"));
+    EXPECT_FALSE(summary().incomplete);
+}
+
+TEST_F(SyncOutcome, WhatIsDeliberatelyLeftAloneDoesNotMakeItIncomplete) {
+    plan.skipped.push_back({"com.a", "it is not on the device", false});
+    EXPECT_EQ(summary().skipped.size(), 1U);
+    EXPECT_FALSE(summary().incomplete);
+}
+
+TEST_F(SyncOutcome, WhatIsAskedForAndCannotBeBroughtMakesItIncomplete) {
+    plan.skipped.push_back({"com.a", "it is offloaded", true});
+    EXPECT_EQ(summary().skipped.size(), 1U);
+    EXPECT_TRUE(summary().incomplete);
+}
+
+TEST_F(SyncOutcome, WhatCannotBeReadInTheLibraryHasFailed) {
+    plan.failed.push_back({"broken.zip", "cut off"});
+    EXPECT_EQ(summary().failed.size(), 1U);
+    EXPECT_TRUE(summary().incomplete);
+}
+
+TEST_F(SyncOutcome, AnInterruptionIsNamedForEachThatIsMissing) {
+    planInstall("com.a", "1");
+    aftermath.isInterrupted = true;
+    ASSERT_EQ(summary().failed.size(), 1U);
+    EXPECT_THAT(summary().failed[0].error, HasSubstr("run the same command again"));
+}
+
+TEST_F(SyncOutcome, AFailureOfTheWholeSessionIsNamedEvenWhenNothingWasPlanned) {
+    aftermath.failure = "the database failed";
+    ASSERT_EQ(summary().failed.size(), 1U);
+    EXPECT_EQ(summary().failed[0].error, "the database failed");
+    EXPECT_TRUE(summary().incomplete);
+}
+
+TEST_F(SyncOutcome, ARequestThatWasNotPlannedAndFailedIsNamedOnce) {
+    plan.failed.push_back({"a/b", "it is not a legal identifier"});
+    for (const char* identifier : {"a/b", "com.x"}) {
+        facts.requested(identifier);
+        facts.failed(identifier, "refused");
+    }
+    ASSERT_EQ(summary().failed.size(), 2U);
+    EXPECT_EQ(summary().failed[1].identifier, "com.x");
+}
+
+}  // namespace
+}  // namespace appsync

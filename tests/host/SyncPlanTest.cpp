@@ -1,0 +1,185 @@
+#include "host/SyncPlan.h"
+
+#include <gmock/gmock.h>
+#include <gtest/gtest.h>
+
+#include "device/DeviceRecords.h"
+#include "host/Library.h"
+#include "platform/InstallProgressRecord.h"
+#include "platform/PropertyList.h"
+
+namespace appsync {
+namespace {
+
+using testing::ElementsAre;
+using testing::HasSubstr;
+using testing::IsEmpty;
+
+Library libraryOf(std::initializer_list<std::pair<const char*, const char*>> packages) {
+    Library library;
+    for (const auto& [identifier, version] : packages) {
+        library.packages.push_back({identifier, version, "Name", "file", 100, 300});
+    }
+    return library;
+}
+
+ApplicationRecord installed(const char* identifier, const char* version) {
+    ApplicationRecord record;
+    record.identifier = identifier;
+    record.version = version;
+    record.type = "User";
+    record.bytes = 50;
+    return record;
+}
+
+ApplicationRecord placeholder(const char* identifier, std::uint64_t installType) {
+    ApplicationRecord record = installed(identifier, "1");
+    record.isPlaceholder = true;
+    record.installType = installType;
+    return record;
+}
+
+std::vector<std::string> identifiersOf(const std::vector<PlannedInstall>& installs) {
+    std::vector<std::string> identifiers;
+    for (const PlannedInstall& each : installs) identifiers.push_back(each.identifier);
+    return identifiers;
+}
+
+PropertyList entry(PropertyList identifier, const char* operation) {
+    return PropertyList::map({{"identifier", std::move(identifier)}, {"operation", operation}});
+}
+
+TEST(SyncPlan, InstallsWhatIsAbsentAndUpdatesWhatDiffers) {
+    const SyncPlan plan = makePlan(libraryOf({{"com.a", "1"}, {"com.b", "2"}, {"com.c", "3"}}),
+                                   {installed("com.b", "1"), installed("com.c", "3")}, {});
+    EXPECT_THAT(identifiersOf(plan.install), ElementsAre("com.a"));
+    ASSERT_THAT(identifiersOf(plan.update), ElementsAre("com.b"));
+    EXPECT_EQ(plan.update[0].oldVersion, "1");
+    EXPECT_EQ(plan.update[0].newVersion, "2");
+    EXPECT_THAT(plan.remove, IsEmpty());
+}
+
+TEST(SyncPlan, ALowerVersionInTheLibraryIsAnUpdateToo) {
+    const SyncPlan plan = makePlan(libraryOf({{"com.a", "1"}}), {installed("com.a", "2")}, {});
+    EXPECT_THAT(identifiersOf(plan.update), ElementsAre("com.a"));
+}
+
+TEST(SyncPlan, CountsWhatTravelsAndWhatItNeeds) {
+    const SyncPlan plan =
+        makePlan(libraryOf({{"com.a", "1"}, {"com.b", "2"}}),
+                 {installed("com.b", "1"), installed("com.c", "1")}, {{"com.c"}, false});
+    EXPECT_EQ(plan.bytes(), 200U);
+    EXPECT_EQ(plan.needed(), 800U);
+    EXPECT_EQ(plan.reclaimed, 50U);
+}
+
+TEST(SyncPlan, RemovesWhatIsNamedAndDoesNotInstallItToo) {
+    const SyncPlan plan = makePlan(libraryOf({{"com.a", "2"}}), {installed("com.a", "1")},
+                                   {{"com.a", "com.a"}, false});
+    EXPECT_THAT(plan.remove, ElementsAre("com.a"));
+    EXPECT_THAT(plan.update, IsEmpty());
+}
+
+TEST(SyncPlan, SaysThatWhatIsNamedForRemovalIsNotThere) {
+    const SyncPlan plan = makePlan({}, {}, {{"com.a"}, false});
+    EXPECT_TRUE(plan.empty());
+    ASSERT_EQ(plan.skipped.size(), 1U);
+    EXPECT_EQ(plan.skipped[0].why, "it is not on the device");
+}
+
+TEST(SyncPlan, MirrorRemovesUserApplicationsThatTheLibraryLacks) {
+    ApplicationRecord system = installed("com.system", "1");
+    system.type = "System";
+    const SyncPlan plan = makePlan(libraryOf({{"com.a", "1"}}),
+                                   {installed("com.a", "1"), installed("com.b", "1"), system,
+                                    placeholder("com.offloaded", kInstallTypeIntentionalDowngrade),
+                                    placeholder("com.restoring", kInstallTypeRestore)},
+                                   {{}, true});
+    EXPECT_THAT(plan.remove, ElementsAre("com.b", "com.offloaded"));
+}
+
+TEST(SyncPlan, MirrorKeepsEverythingWhileAPackageCannotBeRead) {
+    Library library = libraryOf({{"com.a", "1"}});
+    library.faults.push_back({"broken.zip", "cut off"});
+    const SyncPlan plan = makePlan(library, {installed("com.b", "1")}, {{}, true});
+    EXPECT_THAT(plan.remove, IsEmpty());
+    ASSERT_EQ(plan.failed.size(), 1U);
+    EXPECT_EQ(plan.failed[0].identifier, "broken.zip");
+}
+
+TEST(SyncPlan, LeavesSystemAndOffloadedApplicationsAlone) {
+    ApplicationRecord system = installed("com.system", "1");
+    system.type = "System";
+    const SyncPlan plan =
+        makePlan(libraryOf({{"com.offloaded", "2"}, {"com.system", "2"}}),
+                 {placeholder("com.offloaded", kInstallTypeDowngrade), system}, {});
+    EXPECT_TRUE(plan.empty());
+    ASSERT_EQ(plan.skipped.size(), 2U);
+    EXPECT_THAT(plan.skipped[0].why, HasSubstr("offloaded"));
+    EXPECT_THAT(plan.skipped[1].why, HasSubstr("system"));
+    EXPECT_TRUE(plan.skipped[0].isUnmet && plan.skipped[1].isUnmet);
+}
+
+TEST(SyncPlan, ThePlaceholderOfAnInterruptedSyncStandsForNothing) {
+    const SyncPlan plan = makePlan(libraryOf({{"com.a", "1"}, {"com.b", "2"}}),
+                                   {placeholder("com.a", kInstallTypeSync), installed("com.b", "1"),
+                                    placeholder("com.b", kInstallTypeSync)},
+                                   {});
+    EXPECT_THAT(identifiersOf(plan.install), ElementsAre("com.a"));
+    EXPECT_THAT(identifiersOf(plan.update), ElementsAre("com.b"));
+}
+
+TEST(StagedPlan, FollowsTheTodoListOnceForEachIdentifier) {
+    const PropertyList list = PropertyList::array(
+        {entry("com.a", "install"), entry("com.a", "install"), entry("com.b", "install"),
+         entry("com.c", "remove"), entry("com.d", "remove"), entry("com.e", "INSTALLED")});
+    const SyncPlan plan = makeStagedPlan(list, libraryOf({{"com.a", "3"}}),
+                                         {installed("com.b", "1"), installed("com.c", "1")});
+    ASSERT_THAT(identifiersOf(plan.install), ElementsAre("com.a"));
+    EXPECT_EQ(plan.install[0].newVersion, "3");
+    EXPECT_THAT(identifiersOf(plan.update), ElementsAre("com.b"));
+    EXPECT_THAT(plan.remove, ElementsAre("com.c"));
+    ASSERT_EQ(plan.skipped.size(), 1U);
+    EXPECT_EQ(plan.skipped[0].identifier, "com.d");
+    EXPECT_THAT(plan.failed, IsEmpty());
+}
+
+TEST(StagedPlan, NamesEachEntryThatItCanMakeNothingOf) {
+    const std::string withNul("a\0b", 3);
+    const PropertyList list =
+        PropertyList::array({"text", PropertyList::map(), entry(7, "install"), entry("", "remove"),
+                             entry("../x", "install"), entry(std::string(300, 'x'), "install"),
+                             entry(withNul, "remove")});
+    const SyncPlan plan = makeStagedPlan(list, {}, {});
+    EXPECT_TRUE(plan.empty());
+    ASSERT_EQ(plan.failed.size(), 7U);
+    EXPECT_EQ(plan.failed[0].identifier, "entry 1 of the todo list");
+    EXPECT_EQ(plan.failed[2].error, "its identifier is not a string");
+    EXPECT_EQ(plan.failed[4].identifier, "../x");
+}
+
+TEST(StagedPlan, AListThatIsNoneAsksForNothing) {
+    EXPECT_TRUE(makeStagedPlan(PropertyList::map(), {}, {}).empty());
+    EXPECT_TRUE(makeStagedPlan(PropertyList(), {}, {}).empty());
+}
+
+TEST(StagedPlan, TakesTwoHundredThousandEntries) {
+    PropertyList list = PropertyList::array(200'000);
+    for (int number = 0; number < 200'000; ++number) {
+        list.append(entry("com.app" + std::to_string(number), "install"));
+    }
+    EXPECT_EQ(makeStagedPlan(list, {}, {}).install.size(), 200'000U);
+}
+
+TEST(SpaceCheck, SaysWhatIsNeededWhatIsFreeAndHowMuchIsMissing) {
+    const SpaceCheck space{3 * 1024, 1024, 512};
+    EXPECT_FALSE(space.fits());
+    EXPECT_EQ(space.missing(), 1536U);
+    EXPECT_THAT(space.description(), HasSubstr("needs 3.0 KiB, the device has 1.0 KiB free"));
+    EXPECT_THAT(space.description(), HasSubstr("1.5 KiB are missing"));
+}
+
+TEST(SpaceCheck, FitsWhenRemovalsMakeRoom) { EXPECT_TRUE((SpaceCheck{1000, 500, 500}).fits()); }
+
+}  // namespace
+}  // namespace appsync

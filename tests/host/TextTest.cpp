@@ -1,0 +1,51 @@
+#include "host/Text.h"
+
+#include <gtest/gtest.h>
+
+#include "host/Table.h"
+
+namespace appsync {
+namespace {
+
+TEST(FormatBytes, UsesTheUnitThatReadsWell) {
+    EXPECT_EQ(formatBytes(0), "0 bytes");
+    EXPECT_EQ(formatBytes(1), "1 byte");
+    EXPECT_EQ(formatBytes(1023), "1023 bytes");
+    EXPECT_EQ(formatBytes(1536), "1.5 KiB");
+    EXPECT_EQ(formatBytes(1024 * 1024 - 1), "1.0 MiB");
+    EXPECT_EQ(formatBytes(UINT64_MAX), "16.0 EiB");
+}
+
+TEST(FormatTime, IsIso8601InUtc) {
+    EXPECT_EQ(formatTime(std::chrono::system_clock::time_point{}), "1970-01-01T00:00:00Z");
+}
+
+TEST(Printable, KeepsTextOfAnyLanguage) {
+    EXPECT_EQ(printable("Gr\u00fc\u00dfe \u65e5\u672c \U0001F680"),
+              "Gr\u00fc\u00dfe \u65e5\u672c \U0001F680");
+}
+
+TEST(Printable, ReplacesControlCharactersAndBrokenSequences) {
+    EXPECT_EQ(printable("a\x1b[2J\n"), "a?[2J?");
+    EXPECT_EQ(printable("\xc2\x9b"), "??");  // a control character of eight bits
+    EXPECT_EQ(printable("\xe6\x97"), "??");
+    EXPECT_EQ(printable("\xff"
+                        "a"),
+              "?a");
+}
+
+TEST(Fitted, FillsUpOrCutsByCharacters) {
+    EXPECT_EQ(fitted("ab", 4), "ab  ");
+    EXPECT_EQ(fitted("abcdef", 4), "abc~");
+    EXPECT_EQ(fitted("\u00fc\u00fc\u00fc", 2), "\u00fc~");
+    EXPECT_EQ(fitted("abc", 0), "");
+}
+
+TEST(Table, MakesColumnsAsWideAsTheyMustBe) {
+    Table table({"A", "B"});
+    table.add({"long\n", "x"});
+    EXPECT_EQ(table.text(), "A      B\nlong?  x\n");
+}
+
+}  // namespace
+}  // namespace appsync

@@ -1,0 +1,39 @@
+#pragma once
+
+namespace appsync::testing {
+
+/// The system calls that can be made to fail.
+enum class Call {
+    None,
+    Fchown,
+    Flock,
+    Fsync,
+    Fstat,
+    Mkdirat,
+    Openat,
+    Openat2,
+    Read,
+    Renameat,
+    Renameat2,
+    Unlinkat,
+    RemoveDirectory,  // unlinkat of a directory
+    Utimensat,
+    Write,
+};
+
+inline constexpr int kForever = 1 << 30;
+
+/// While it lives, a system call that this thread makes fails with an errno value: after `skipped`
+/// calls that go through, `times` in a row. One at a time.
+class FailingCall {
+  public:
+    FailingCall(Call call, int error, int times = kForever, int skipped = 0);
+    FailingCall(const FailingCall&) = delete;
+    FailingCall& operator=(const FailingCall&) = delete;
+    ~FailingCall();
+
+    /// How many calls have failed.
+    [[nodiscard]] int failures() const;
+};
+
+}  // namespace appsync::testing

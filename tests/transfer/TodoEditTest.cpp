@@ -1,0 +1,90 @@
+#include <cerrno>
+
+#include "tests/client/AppsClientFixture.h"
+
+namespace appsync {
+namespace {
+
+using testing::ElementsAre;
+using testing::IsEmpty;
+
+class TodoEdit : public AppsClientFixture {
+  protected:
+    const std::string file_{kTodoListPath};
+};
+
+TEST_F(TodoEdit, ChangesTheOperationAndNothingElse) {
+    PropertyList entry = todoEntry(kA, "install");
+    entry.set("other", PropertyList::array({1, "two"}));
+    setTodoList(PropertyList::array({todoEntry(kB, "install"), entry, 7}));
+    client_->changeAssetID(kA, "DOWNLOADED");
+    entry.set("operation", "DOWNLOADED");
+    EXPECT_EQ(platform_.propertyListAt(file_),
+              PropertyList::array({todoEntry(kB, "install"), entry, 7}));
+    EXPECT_THAT(platform_.messageLines(),
+                ElementsAre("8 default Changing com.example.a from install to DOWNLOADED"));
+}
+
+TEST_F(TodoEdit, RewritesAnXmlListInTheBinaryEncoding) {
+    setTodoList(PropertyList::array({todoEntry(kA, "install")}));
+    client_->changeAssetID(kA, "SENT");
+    EXPECT_TRUE(platform_.files.text(file_)->starts_with("bplist00"));
+    EXPECT_EQ(operationOf(kA), "SENT");
+}
+
+TEST_F(TodoEdit, LeavesAListWithoutTheIdentifierUntouched) {
+    setTodoList(PropertyList::array({todoEntry(kB, "install")}));
+    client_->changeAssetID(kA, "SENT");
+    EXPECT_THAT(platform_.callsTo({"FileSystem.writeFileAtomically"}), IsEmpty());
+    EXPECT_TRUE(platform_.files.text(file_)->starts_with("<?xml"));
+    EXPECT_THAT(platform_.messages(), IsEmpty());
+}
+
+TEST_F(TodoEdit, ChangesOnlyTheFirstEntryOfAnIdentifier) {
+    setTodoList(PropertyList::array({todoEntry(kA, "install"), todoEntry(kA, "install")}));
+    client_->changeAssetID(kA, "FAILED");
+    EXPECT_EQ(platform_.propertyListAt(file_),
+              PropertyList::array({todoEntry(kA, "FAILED"), todoEntry(kA, "install")}));
+}
+
+TEST_F(TodoEdit, OverwritesWhateverWasThere) {
+    setTodoList(PropertyList::array({PropertyList::map({{"identifier", kA}})}));
+    client_->changeAssetID(kA, "INSTALLED");
+    EXPECT_TRUE(logged(LogLevel::Default, "Changing com.example.a from (null) to INSTALLED"));
+    client_->changeAssetID(kA, "FAILED");
+    EXPECT_EQ(operationOf(kA), "FAILED");
+}
+
+TEST_F(TodoEdit, DoesNothingWithoutAList) {
+    client_->changeAssetID(kA, "SENT");
+    EXPECT_THAT(platform_.messages(), IsEmpty());
+    setTodoList(PropertyList::array());
+    client_->changeAssetID(kA, "SENT");
+    EXPECT_THAT(platform_.callsTo({"FileSystem.writeFileAtomically"}), IsEmpty());
+}
+
+TEST_F(TodoEdit, WritesNothingWhenTheListCannotBeSerialised) {
+    setTodoList(PropertyList::array({todoEntry(kA, "install")}));
+    platform_.propertyLists.failNextSerialize(ErrorRecord::make(kPropertyListErrorDomain, 1, "no"));
+    client_->changeAssetID(kA, "SENT");
+    EXPECT_EQ(operationOf(kA), "install");
+}
+
+TEST_F(TodoEdit, IgnoresThatTheListCannotBeWritten) {
+    setTodoList(PropertyList::array({todoEntry(kA, "install")}));
+    platform_.files.failNext(FileOperation::WriteFileAtomically, file_, ENOSPC);
+    client_->changeAssetID(kA, "SENT");
+    EXPECT_EQ(operationOf(kA), "install");
+}
+
+TEST_F(TodoEdit, ShowsInTheOperationState) {
+    EXPECT_EQ(client_->_operationStateForIdentifier(kA), std::nullopt);
+    setTodoList(PropertyList::array({todoEntry(kA, "install"), todoEntry(kA, "remove"),
+                                     PropertyList::map({{"identifier", kB}, {"operation", 7}})}));
+    EXPECT_EQ(client_->_operationStateForIdentifier(kA), "install");
+    EXPECT_EQ(client_->_operationStateForIdentifier(kB), std::nullopt);
+    EXPECT_EQ(client_->_operationStateForIdentifier(kC), std::nullopt);
+}
+
+}  // namespace
+}  // namespace appsync
