@@ -6,7 +6,6 @@
 #include <cstdlib>
 #include <cstring>
 #include <utility>
-#include <vector>
 
 #if defined(__SANITIZE_ADDRESS__)
 #define APPSYNC_ADDRESS_SANITIZER 1
@@ -81,12 +80,6 @@ Fiber::~Fiber() {
 #ifdef APPSYNC_THREAD_SANITIZER
     if (stack_ != nullptr) __tsan_destroy_fiber(sanitizerState_);
 #endif
-}
-
-void Fiber::abandon(std::unique_ptr<Fiber> fiber) {
-    // Never destroyed: leak detection at the end of the process still finds the stacks.
-    static auto& abandoned = *new std::vector<std::unique_ptr<Fiber>>;
-    abandoned.push_back(std::move(fiber));
 }
 
 void Fiber::switchTo(Fiber& other) {

@@ -27,10 +27,6 @@ class Fiber {
     /// somebody switches back.
     void switchTo(Fiber& other);
 
-    /// Keeps a fiber for ever: one in the middle of something, whose objects can no longer be
-    /// destroyed. What they refer to stays reachable.
-    static void abandon(std::unique_ptr<Fiber> fiber);
-
   private:
     static void enter();
     void arrived();

@@ -113,6 +113,7 @@ class Scheduler {
     void switchTo(Turn& next);
     void throwFailure();
     void workerLoop(Turn& turn);
+    static void abandon(std::unique_ptr<Turn> turn);
     void checkThread() const;
     [[nodiscard]] std::string standstill(const std::string& headline) const;
     [[nodiscard]] std::uint64_t random(std::uint64_t bound);
