@@ -47,6 +47,7 @@ class BinaryWriter {
         bytes_.reserve(kBinaryMagic.size() + textBytes_ + references_.size() * referenceWidth_ +
                        objects_.size() * 16 + kBinaryTrailerSize);
         bytes_.assign(kBinaryMagic.begin(), kBinaryMagic.end());
+        offsets_.reserve(objects_.size());
         for (const Object& object : objects_) {
             offsets_.push_back(bytes_.size());
             if (!writeObject(object)) return writeError(root, object.part, problem_);
@@ -81,6 +82,23 @@ class BinaryWriter {
         return add({&value, {}, &value});
     }
 
+    /// Maps of one list mostly have the same keys, and often the same texts, at the same places:
+    /// what the map before had there is tried first. `place` counts keys and values.
+    std::size_t addTextAt(std::size_t place, std::string_view text, const void* part) {
+        if (place >= kRememberedPlaces) return addText(text, part);
+        std::size_t& before = textOfPlace_[place];
+        if (before >= objects_.size() || objects_[before].value != nullptr ||
+            objects_[before].text != text) {
+            before = addText(text, part);
+        }
+        return before;
+    }
+
+    std::size_t addValueAt(std::size_t place, const PropertyList& value) {
+        if (const std::string* text = value.asString()) return addTextAt(place, *text, &value);
+        return addValue(value);
+    }
+
     std::size_t addText(std::string_view text, const void* part) {
         const std::uint32_t hash = PropertyListKeyIndex::hashOf(text);
         const auto textAt = [this](std::size_t i) { return objects_[textObjects_[i]].text; };
@@ -97,12 +115,13 @@ class BinaryWriter {
         for (const PropertyList& element : container.elements()) {
             references_.push_back(addValue(element));
         }
+        std::size_t place = 0;
         for (const auto& [key, value] : container.entries()) {
             keyBytes_ += key.size();
-            references_.push_back(addText(key, &key));
+            references_.push_back(addTextAt(place++, key, &key));
         }
         for (const auto& [key, value] : container.entries()) {
-            references_.push_back(addValue(value));
+            references_.push_back(addValueAt(place++, value));
         }
     }
 
@@ -183,13 +202,20 @@ class BinaryWriter {
 
     /// Containers are met in the order in which their references were noted.
     void writeReferences(std::size_t count) {
-        for (; count != 0; --count) putNumber(references_[nextReference_++], referenceWidth_);
+        std::uint8_t* at = extend(count * referenceWidth_);
+        for (; count != 0; --count, at += referenceWidth_) {
+            store(at, references_[nextReference_++], referenceWidth_);
+        }
     }
 
     void writeTableAndTrailer() {
         const std::size_t table = bytes_.size();
         const std::size_t width = tightWidthOf(table);
-        for (const std::size_t offset : offsets_) putNumber(offset, width);
+        std::uint8_t* at = extend(offsets_.size() * width);
+        for (const std::size_t offset : offsets_) {
+            store(at, offset, width);
+            at += width;
+        }
         putNumber(0, 6);
         putByte(static_cast<std::uint8_t>(width));
         putByte(static_cast<std::uint8_t>(referenceWidth_));
@@ -208,18 +234,29 @@ class BinaryWriter {
     void putBytes(ByteView bytes) { bytes_.insert(bytes_.end(), bytes.begin(), bytes.end()); }
     void putBits(double value) { putNumber(std::bit_cast<std::uint64_t>(value), 8); }
 
-    void putNumber(std::uint64_t value, std::size_t width) {
-        std::array<std::uint8_t, 8> digits{};
-        for (std::size_t i = width; i != 0; --i, value >>= 8U) {
-            digits[i - 1] = static_cast<std::uint8_t>(value & 0xFFU);
-        }
-        putBytes({digits.data(), width});
+    void putNumber(std::uint64_t value, std::size_t width) { store(extend(width), value, width); }
+
+    /// Makes the output longer; where what is new begins.
+    std::uint8_t* extend(std::size_t size) {
+        const std::size_t end = bytes_.size();
+        bytes_.resize(end + size);
+        return bytes_.data() + end;
     }
+
+    /// The last `width` bytes of a number, the highest first.
+    static void store(std::uint8_t* at, std::uint64_t value, std::size_t width) {
+        for (std::size_t i = width; i != 0; --i, value >>= 8U) {
+            at[i - 1] = static_cast<std::uint8_t>(value & 0xFFU);
+        }
+    }
+
+    static constexpr std::size_t kRememberedPlaces = 16;
 
     std::vector<Object> objects_;
     std::vector<std::size_t> references_;  // of all containers, one after the other
     std::vector<std::size_t> textObjects_;
-    PropertyListKeyIndex textIndex_;  // into textObjects_
+    PropertyListKeyIndex textIndex_;                            // into textObjects_
+    std::array<std::size_t, kRememberedPlaces> textOfPlace_{};  // into objects_
     std::array<std::optional<std::size_t>, 2> booleans_;
     std::size_t textBytes_ = 0;
     std::size_t keyBytes_ = 0;

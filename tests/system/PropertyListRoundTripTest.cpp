@@ -51,6 +51,16 @@ TEST_P(PropertyListRoundTrip, KeepsLargeListsAndLargeMaps) {
     EXPECT_EQ(roundTrip(map, GetParam()), map);
 }
 
+TEST_P(PropertyListRoundTrip, KeepsMapsOfOneListApart) {
+    // Keys and values that change places, kinds and number from one map to the next.
+    const auto list = PropertyList::array(
+        {PropertyList::map({{"a", "x"}, {"b", "y"}}), PropertyList::map({{"b", "x"}, {"a", "y"}}),
+         PropertyList::map({{"a", 1}, {"b", "a"}}), PropertyList::map({{"x", "x"}}), "x",
+         PropertyList::map({{"y", PropertyList::map({{"a", "b"}, {"b", "a"}})}, {"a", true}}),
+         PropertyList::map(), PropertyList::map({{"a", "x"}, {"b", "y"}, {"c", ""}})});
+    EXPECT_EQ(roundTrip(list, GetParam()), list);
+}
+
 TEST_P(PropertyListRoundTrip, KeepsTheDeepestNesting) {
     const PropertyList deepest = nestedArrays(PropertyList::kMaximumDepth);
     EXPECT_EQ(roundTrip(deepest, GetParam()).depth(), PropertyList::kMaximumDepth);
