@@ -146,7 +146,7 @@ class Sending {
         if (!plugIn) return plugIn.error();
         Session session(*device_, **plugIn, events_, facts_, signals_.stopRequested());
         const SessionEnd end = session.deliver(parcel_);
-        const Result<SessionAftermath> aftermath = aftermathOf(*device_, end);
+        const Result<SessionAftermath> aftermath = aftermathOf(*device_, end, facts_);
         if (!aftermath) {
             finish(summarizeFailed(plan_, facts_, aftermath.error()));
             return aftermath.error();

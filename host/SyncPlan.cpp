@@ -239,6 +239,26 @@ SyncPlan makePlan(const Library& library, const std::vector<ApplicationRecord>& 
     return Planner(library, present, options).make();
 }
 
+SyncPlan allowedBy(const DeviceSettings& settings, SyncPlan plan) {
+    if (settings.removal == PolicyAnswer::No) {
+        for (std::string& identifier : plan.remove) {
+            plan.skipped.push_back({std::move(identifier), std::string(kRemovalForbidden), true});
+        }
+        plan.remove.clear();
+        plan.reclaimed = 0;
+    }
+    if (settings.installation == PolicyAnswer::No) {
+        for (auto* installs : {&plan.install, &plan.update}) {
+            for (PlannedInstall& each : *installs) {
+                plan.skipped.push_back(
+                    {std::move(each.identifier), std::string(kInstallationForbidden), true});
+            }
+            installs->clear();
+        }
+    }
+    return plan;
+}
+
 SyncPlan makeStagedPlan(const PropertyList& todoList, const Library& library,
                         const std::vector<ApplicationRecord>& present) {
     return StagedPlanner(library, present).make(todoList);

@@ -53,6 +53,17 @@ TEST_F(SyncCommand, WhatPolicyForbidsIsSkippedWithStatus1) {
     EXPECT_THAT(applications(), IsEmpty());
 }
 
+TEST_F(SyncCommand, APlanLeavesOutWhatPolicyForbids) {
+    addPackage("com.a", "1");
+    EXPECT_EQ(run({"set", device, "installation=no"}), 0);
+    EXPECT_EQ(run({"plan", device, library}), 0);
+    EXPECT_THAT(out.str(), HasSubstr("skip     com.a: device policy does not allow installing"));
+    EXPECT_THAT(out.str(), HasSubstr("Nothing to do.\n"));
+    EXPECT_EQ(sync({"--dry-run"}), 0);
+    EXPECT_THAT(out.str(), HasSubstr("\"install\": []"));
+    EXPECT_THAT(out.str(), HasSubstr("\"needed\": 0"));
+}
+
 TEST_F(SyncCommand, APlanChangesNothing) {
     addPackage("com.a", "1");
     EXPECT_EQ(run({"plan", device, library}), 0);
