@@ -36,6 +36,7 @@ std::string planText(const SyncPlan& plan, const SpaceCheck& space) {
     for (const SyncFailure& each : plan.failed) {
         text += "failed   " + printable(each.identifier) + ": " + printable(each.error) + "\n";
     }
+    for (const std::string& each : plan.notes) text += "note     " + printable(each) + "\n";
     if (plan.empty()) {
         return text + (isInStep(plan) ? "Nothing to do: all is in step.\n" : "Nothing to do.\n");
     }

@@ -145,7 +145,10 @@ class SyncRun {
         if (arguments_.display == SyncDisplayKind::Text) {
             console_.out << planText(allowed_, space_) << std::flush;
         } else {
-            console_.out << jsonText(allowed_, space_) << '\n' << std::flush;
+            const JsonLayout layout = arguments_.display == SyncDisplayKind::Json
+                                          ? JsonLayout::Indented
+                                          : JsonLayout::EventLine;
+            console_.out << jsonText(allowed_, space_, layout) << '\n' << std::flush;
         }
         if (!space_.fits()) console_.complain(space_.description());
         return space_.fits() && allowed_.failed.empty() ? kExitDone : kExitSomethingFailed;

@@ -70,6 +70,7 @@ class Planner {
         : library_(library), options_(options), present_(byIdentifier(present)) {}
 
     SyncPlan make() {
+        plan_.notes = library_.notes;
         for (const LibraryFault& fault : library_.faults) {
             plan_.failed.push_back({fault.fileName, fault.error});
         }
@@ -145,6 +146,7 @@ class StagedPlanner {
         : library_(library), present_(byIdentifier(present)) {}
 
     SyncPlan make(const PropertyList& todoList) {
+        plan_.notes = library_.notes;
         std::size_t number = 0;
         for (const PropertyList& entry : todoList.elements()) add(entry, ++number);
         return std::move(plan_);

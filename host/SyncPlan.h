@@ -58,6 +58,8 @@ struct SyncPlan {
     std::vector<PlannedSkip> skipped;
     /// What is asked for but cannot even be tried.
     std::vector<SyncFailure> failed;
+    /// For people: packages of the library that others have hidden.
+    std::vector<std::string> notes;
     /// Bytes on the device that the removals give back.
     std::uint64_t reclaimed = 0;
 
