@@ -19,7 +19,7 @@ namespace {
 
 Platform watched(const Platform& platform, SessionWatch& watch) {
     return {platform.host,          platform.log,           watch.registry(),
-            platform.installer,     platform.coordination,  platform.policy,
+            platform.installer,     platform.coordination,  watch.policy(),
             platform.backup,        watch.homeScreen(),     platform.icons,
             platform.transactions,  platform.queues,        platform.files,
             platform.propertyLists, platform.notifications, platform.notificationCenter};
@@ -60,8 +60,7 @@ Result<std::unique_ptr<PlugIn>> PlugIn::load(Device& device, SyncEvents& events,
     Status status = plugIn->openLog(device);
     if (!status) return status.error();
     const Platform platform = device.platform(plugIn->daemon_, *plugIn->log_);
-    plugIn->watch_ = std::make_unique<SessionWatch>(device, platform.registry, platform.homeScreen,
-                                                    events, facts);
+    plugIn->watch_ = std::make_unique<SessionWatch>(device, platform, events, facts);
     status = plugIn->create(watched(platform, *plugIn->watch_));
     if (!status) return status.error();
     return plugIn;

@@ -4,6 +4,7 @@
 #include <memory>
 #include <optional>
 #include <string_view>
+#include <system_error>
 #include <utility>
 
 #include "client/Paths.h"
@@ -13,6 +14,7 @@
 #include "host/Commands.h"
 #include "host/Console.h"
 #include "host/Interruption.h"
+#include "host/LibraryReader.h"
 #include "host/PlugIn.h"
 #include "host/Problem.h"
 #include "host/Session.h"
@@ -20,6 +22,7 @@
 #include "host/StagingArea.h"
 #include "host/StopSignals.h"
 #include "host/SyncOutcome.h"
+#include "host/Text.h"
 #include "platform/FileSystem.h"
 #include "platform/PropertyListSerialization.h"
 
@@ -55,28 +58,68 @@ std::optional<std::string> waitingVersion(Device& device, const std::string& ide
 
 class Sending {
   public:
-    Sending(const SendArguments& arguments, const Console& console,
-            const std::atomic<bool>& stopRequested)
+    Sending(const SendArguments& arguments, const Console& console)
         : arguments_(arguments),
           console_(console),
-          stopRequested_(stopRequested),
           display_(makeSyncDisplay(arguments.display, console)),
-          events_(*display_) {}
+          events_(*display_),
+          signals_(
+              kPatience, [this] { events_.complainSoon(stoppingNotice()); }, [this] { leave(); }) {}
+    Sending(const Sending&) = delete;
+    Sending& operator=(const Sending&) = delete;
+    // Signals must not end the process in an instant before the device is closed.
+    ~Sending() { device_.reset(); }
 
     Result<int> run() {
         Result<std::unique_ptr<Device>> device =
             Device::open(arguments_.device, {DeviceAccess::Session});
         if (!device) return unusable(device.error());
         device_ = *std::move(device);
-        Status ready = removeStaleTransfers(*device_);
+        const Result<DeviceSettings> settings = device_->settings();
+        if (!settings) return unusable(settings.error());
+        if (settings->installation == PolicyAnswer::No) return refuse(forbidden());
+        Status ready = checkSpace();
+        if (!ready) return refuse(ready.error());
+        ready = removeStaleTransfers(*device_);
         if (ready) ready = isData() ? prepareData() : preparePackage();
         if (!ready) return ready.error();
-        if (stopRequested_) return failure("interrupted before the session began", "run it again");
+        isPlanned_ = true;
+        if (signals_.stopRequested()) return finish(summarizeInterrupted(plan_, facts_));
         return hold();
     }
 
   private:
     [[nodiscard]] bool isData() const { return arguments_.parts == kAssetPartApplicationData; }
+
+    static ErrorRecord forbidden() {
+        return failure(kInstallationForbidden, "allow it with appsync set DEVICE installation=yes");
+    }
+
+    // What cannot be looked at here is told by whoever uses it.
+    Status checkSpace() const {
+        std::error_code code;
+        std::uint64_t needed = std::filesystem::file_size(arguments_.file, code);
+        const Result<std::uint64_t> free = device_->freeSpace();
+        if (code || !free) return {};
+        if (!isData()) {
+            const Result<PackageReader> package =
+                PackageReader::open(arguments_.file, device_->propertyLists());
+            if (package) needed += bytesOnDevice(package->info());
+        }
+        if (needed <= *free) return {};
+        return failure(
+            "it needs " + formatBytes(needed) + ", the device has " + formatBytes(*free) + " free",
+            "free space on the device");
+    }
+
+    // Nothing is sent.
+    int refuse(const ErrorRecord& reason) {
+        SyncSummary summary;
+        summary.failed.push_back({arguments_.identifier, reason.description()});
+        summary.incomplete = true;
+        console_.fail(reason);
+        return finish(std::move(summary));
+    }
 
     void makeAsset(const std::string& version) {
         parcel_.asset = std::make_shared<SyncAsset>();
@@ -139,25 +182,41 @@ class Sending {
     Result<int> hold() {
         Result<std::unique_ptr<PlugIn>> plugIn = PlugIn::load(*device_, events_, facts_);
         if (!plugIn) return plugIn.error();
-        Session session(*device_, **plugIn, events_, facts_, stopRequested_);
+        Session session(*device_, **plugIn, events_, facts_, signals_.stopRequested());
         const SessionEnd end = session.deliver(parcel_);
-        const Result<SessionAftermath> aftermath = aftermathOf(*device_, end);
-        if (!aftermath) return aftermath.error();
+        const Result<SessionAftermath> aftermath = aftermathOf(*device_, end, facts_);
+        if (!aftermath) {
+            finish(summarizeFailed(plan_, facts_, aftermath.error()));
+            return aftermath.error();
+        }
         SyncSummary summary = summarize(plan_, facts_, *aftermath);
         if (!plansInstall_ && summary.failed.empty()) {
             summary.skipped.push_back(
                 {arguments_.identifier, "its package waits for its data", false});
         }
-        summary.bytes = end.bytes;
+        return finish(std::move(summary));
+    }
+
+    // On the thread of the signals, whatever the session is at.
+    [[noreturn]] void leave() {
+        if (isPlanned_) events_.finishSoon(timed(summarizeInterrupted(plan_, facts_)));
+        leaveAtOnce(console_);
+    }
+
+    SyncSummary timed(SyncSummary summary) const {
         summary.seconds = std::chrono::duration<double>(Clock::now() - begin_).count();
+        return summary;
+    }
+
+    int finish(SyncSummary summary) {
+        summary = timed(std::move(summary));
         events_.finish(summary);
-        if (end.isInterrupted) console_.fail(failure("interrupted", kRunAgain));
+        if (signals_.stopRequested()) console_.fail(failure("interrupted", kRunAgain));
         return summary.incomplete ? kExitSomethingFailed : kExitDone;
     }
 
     const SendArguments& arguments_;
     const Console& console_;
-    const std::atomic<bool>& stopRequested_;
     std::unique_ptr<SyncDisplay> display_;
     SyncEvents events_;
     SessionFacts facts_;
@@ -166,6 +225,8 @@ class Sending {
     SyncPlan plan_;
     bool plansInstall_ = true;
     const Clock::time_point begin_ = Clock::now();
+    std::atomic<bool> isPlanned_ = false;  // the plan is made, and changes no more
+    const StopSignals signals_;
 };
 
 }  // namespace
@@ -173,8 +234,7 @@ class Sending {
 int runSend(const SendArguments& arguments, const Console& console) {
     const Status checked = checkArguments(arguments);
     if (!checked) return console.fail(checked.error());
-    const StopSignals signals(kPatience, [&console] { leaveAtOnce(console); });
-    const Result<int> status = Sending(arguments, console, signals.stopRequested()).run();
+    const Result<int> status = Sending(arguments, console).run();
     return status ? *status : console.fail(status.error());
 }
 

@@ -8,6 +8,8 @@
 #include <string>
 #include <vector>
 
+#include "platform/DevicePolicyService.h"
+
 namespace appsync {
 
 /// What was seen of each application in one session. Callable on any thread.
@@ -18,12 +20,17 @@ class SessionFacts {
     void installed(const std::string& identifier);
     void removed(const std::string& identifier);
     void requested(const std::string& identifier);
+    void sent(std::uint64_t bytes);
+    /// The plug-in was told whether it may; its last answer is what it went by.
+    void policyAnswered(PolicyFeature feature, PolicyAnswer answer);
 
     [[nodiscard]] std::optional<std::string> firstFailure(const std::string& identifier) const;
     [[nodiscard]] bool wasInstalled(const std::string& identifier) const;
     [[nodiscard]] bool wasRemoved(const std::string& identifier) const;
     /// In the order in which the device asked.
     [[nodiscard]] std::vector<std::string> requests() const;
+    [[nodiscard]] std::uint64_t bytesSent() const;
+    [[nodiscard]] bool wasForbidden(PolicyFeature feature) const;
 
   private:
     mutable std::mutex mutex_;
@@ -32,6 +39,8 @@ class SessionFacts {
     std::set<std::string> installed_;
     std::set<std::string> removed_;
     std::vector<std::string> requests_;
+    std::uint64_t bytesSent_ = 0;
+    std::map<PolicyFeature, PolicyAnswer> answers_;
 };
 
 }  // namespace appsync

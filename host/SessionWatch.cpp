@@ -6,6 +6,7 @@
 #include "device/Device.h"
 #include "host/SessionFacts.h"
 #include "host/SyncEvents.h"
+#include "platform/Platform.h"
 #include "platform/PropertyList.h"
 
 namespace appsync {
@@ -96,15 +97,32 @@ class WatchedHomeScreen : public HomeScreenService {
     SessionWatch& watch_;
 };
 
+class WatchedPolicy : public DevicePolicyService {
+  public:
+    WatchedPolicy(DevicePolicyService& policy, SessionFacts& facts)
+        : policy_(policy), facts_(facts) {}
+
+    PolicyAnswer effectiveValue(PolicyFeature feature) override {
+        const PolicyAnswer answer = policy_.effectiveValue(feature);
+        facts_.policyAnswered(feature, answer);
+        return answer;
+    }
+
+  private:
+    DevicePolicyService& policy_;
+    SessionFacts& facts_;
+};
+
 }  // namespace
 
-SessionWatch::SessionWatch(Device& device, AppRegistry& registry, HomeScreenService& homeScreen,
-                           SyncEvents& events, SessionFacts& facts)
+SessionWatch::SessionWatch(Device& device, const Platform& platform, SyncEvents& events,
+                           SessionFacts& facts)
     : device_(device),
       events_(events),
       facts_(facts),
-      registry_(std::make_unique<WatchedRegistry>(registry, *this)),
-      homeScreen_(std::make_unique<WatchedHomeScreen>(homeScreen, *this)),
+      registry_(std::make_unique<WatchedRegistry>(platform.registry, *this)),
+      homeScreen_(std::make_unique<WatchedHomeScreen>(platform.homeScreen, *this)),
+      policy_(std::make_unique<WatchedPolicy>(platform.policy, facts)),
       poller_([this] { poll(); }) {}
 
 SessionWatch::~SessionWatch() {

@@ -10,6 +10,7 @@
 #include <thread>
 
 #include "platform/AppRegistry.h"
+#include "platform/DevicePolicyService.h"
 #include "platform/HomeScreenService.h"
 
 namespace appsync {
@@ -17,16 +18,16 @@ namespace appsync {
 class Device;
 class SessionFacts;
 class SyncEvents;
+struct Platform;
 
-/// Sees what the plug-in does with the registry and the home screen, keeps it as facts, and reports
-/// it as events; how far installs have come it asks the device now and then. Hands everything on to
-/// the device's own services.
+/// Sees what the plug-in does with the registry and the home screen, and what policy tells it,
+/// keeps it as facts, and reports it as events; how far installs have come it asks the device now
+/// and then. Hands everything on to the device's own services.
 ///
 /// Callable on any thread. Must outlive the client; device, events and facts must outlive it.
 class SessionWatch {
   public:
-    SessionWatch(Device& device, AppRegistry& registry, HomeScreenService& homeScreen,
-                 SyncEvents& events, SessionFacts& facts);
+    SessionWatch(Device& device, const Platform& platform, SyncEvents& events, SessionFacts& facts);
     SessionWatch(const SessionWatch&) = delete;
     SessionWatch& operator=(const SessionWatch&) = delete;
     ~SessionWatch();
@@ -34,6 +35,7 @@ class SessionWatch {
     /// What the client gets in place of the device's own.
     [[nodiscard]] AppRegistry& registry() { return *registry_; }
     [[nodiscard]] HomeScreenService& homeScreen() { return *homeScreen_; }
+    [[nodiscard]] DevicePolicyService& policy() { return *policy_; }
 
     /// The number of bytes that stand for the whole install of an application.
     void setSize(const std::string& identifier, std::uint64_t bytes);
@@ -57,6 +59,7 @@ class SessionWatch {
     SessionFacts& facts_;
     std::unique_ptr<AppRegistry> registry_;
     std::unique_ptr<HomeScreenService> homeScreen_;
+    std::unique_ptr<DevicePolicyService> policy_;
     std::atomic<bool> removing_ = false;
 
     mutable std::mutex mutex_;

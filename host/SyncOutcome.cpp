@@ -6,6 +6,7 @@
 #include <utility>
 
 #include "device/Device.h"
+#include "host/Interruption.h"
 #include "host/Problem.h"
 #include "host/Session.h"
 #include "host/SessionFacts.h"
@@ -18,6 +19,8 @@ bool hasUnmet(const std::vector<PlannedSkip>& skipped) {
     return std::any_of(skipped.begin(), skipped.end(),
                        [](const PlannedSkip& skip) { return skip.isUnmet; });
 }
+
+std::string interruption() { return "interrupted: " + std::string(kRunAgain); }
 
 class Summarizer {
   public:
@@ -33,13 +36,14 @@ class Summarizer {
 
     SyncSummary make() {
         summary_.requested = facts_.requests();
+        summary_.bytes = facts_.bytesSent();
         summary_.failed = plan_.failed;
         summary_.skipped = plan_.skipped;
         for (const std::string& identifier : plan_.remove) judgeRemoval(identifier);
         for (const PlannedInstall& each : plan_.install) judge(each, summary_.installed);
         for (const PlannedInstall& each : plan_.update) judge(each, summary_.updated);
         judgeUnplanned();
-        if (aftermath_.isInterrupted && summary_.failed.empty()) addSessionFailure("interrupted");
+        if (aftermath_.isInterrupted && summary_.failed.empty()) addSessionFailure(interruption());
         if (aftermath_.failure) addSessionFailure(*aftermath_.failure);
         summary_.incomplete = !summary_.failed.empty() || hasUnmet(summary_.skipped);
         return std::move(summary_);
@@ -55,9 +59,12 @@ class Summarizer {
             fail(planned.identifier, "version " + found->second + " was installed instead of " +
                                          planned.newVersion +
                                          ": the package has changed meanwhile");
+        } else if (facts_.wasInstalled(planned.identifier)) {
+            fail(planned.identifier,
+                 "it was installed, and uninstalled on the device meanwhile: sync again to bring "
+                 "it back");
         } else {
-            undone(planned.identifier, aftermath_.installationAllowed,
-                   "device policy does not allow installing applications",
+            undone(planned.identifier, aftermath_.installationAllowed, kInstallationForbidden,
                    "the device did not ask for its package: appsync log tells why");
         }
     }
@@ -67,9 +74,11 @@ class Summarizer {
                             (!present_.contains(identifier) || installs_.contains(identifier));
         if (isGone) {
             summary_.removed.push_back(identifier);
+        } else if (!present_.contains(identifier)) {
+            summary_.skipped.push_back(
+                {identifier, "it was uninstalled on the device meanwhile", false});
         } else {
-            undone(identifier, aftermath_.removalAllowed,
-                   "device policy does not allow removing applications", "it is still there");
+            undone(identifier, aftermath_.removalAllowed, kRemovalForbidden, "it is still there");
         }
     }
 
@@ -83,16 +92,15 @@ class Summarizer {
         }
     }
 
-    void undone(const std::string& identifier, bool isAllowed, const std::string& whyForbidden,
+    void undone(const std::string& identifier, bool isAllowed, std::string_view whyForbidden,
                 const std::string& whyElse) {
         if (const auto cause = facts_.firstFailure(identifier)) return fail(identifier, *cause);
         if (aftermath_.failure) return fail(identifier, *aftermath_.failure);
         if (!isAllowed) {
-            summary_.skipped.push_back({identifier, whyForbidden, true});
+            summary_.skipped.push_back({identifier, std::string(whyForbidden), true});
             return;
         }
-        fail(identifier,
-             aftermath_.isInterrupted ? "interrupted: run the same command again" : whyElse);
+        fail(identifier, aftermath_.isInterrupted ? interruption() : whyElse);
     }
 
     void fail(const std::string& identifier, const std::string& error) {
@@ -110,17 +118,43 @@ class Summarizer {
     SyncSummary summary_;
 };
 
+SessionAftermath policyOf(const SessionFacts& facts) {
+    SessionAftermath aftermath;
+    aftermath.installationAllowed = !facts.wasForbidden(PolicyFeature::AppInstallationAllowed);
+    aftermath.removalAllowed = !facts.wasForbidden(PolicyFeature::AppRemovalAllowed);
+    return aftermath;
+}
+
+// What the device holds if everything stands that was seen to be installed.
+SessionAftermath assumedAftermath(const SyncPlan& plan, const SessionFacts& facts) {
+    SessionAftermath aftermath = policyOf(facts);
+    for (const std::string& identifier : plan.remove) {
+        if (facts.wasRemoved(identifier)) continue;
+        ApplicationRecord record;
+        record.identifier = identifier;
+        record.isPlaceholder = true;  // something of it
+        aftermath.present.push_back(std::move(record));
+    }
+    for (const auto* installs : {&plan.install, &plan.update}) {
+        for (const PlannedInstall& each : *installs) {
+            if (!facts.wasInstalled(each.identifier)) continue;
+            ApplicationRecord record;
+            record.identifier = each.identifier;
+            record.version = each.newVersion;
+            aftermath.present.push_back(std::move(record));
+        }
+    }
+    return aftermath;
+}
+
 }  // namespace
 
-Result<SessionAftermath> aftermathOf(Device& device, const SessionEnd& end) {
+Result<SessionAftermath> aftermathOf(Device& device, const SessionEnd& end,
+                                     const SessionFacts& facts) {
     Result<std::vector<ApplicationRecord>> present = device.applications();
     if (!present) return unusable(present.error());
-    const Result<DeviceSettings> settings = device.settings();
-    if (!settings) return unusable(settings.error());
-    SessionAftermath aftermath;
+    SessionAftermath aftermath = policyOf(facts);
     aftermath.present = *std::move(present);
-    aftermath.installationAllowed = settings->installation != PolicyAnswer::No;
-    aftermath.removalAllowed = settings->removal != PolicyAnswer::No;
     aftermath.isInterrupted = end.isInterrupted;
     std::optional<ErrorRecord> failure = device.databaseFailure();
     if (!failure) failure = end.error;
@@ -131,6 +165,19 @@ Result<SessionAftermath> aftermathOf(Device& device, const SessionEnd& end) {
 SyncSummary summarize(const SyncPlan& plan, const SessionFacts& facts,
                       const SessionAftermath& aftermath) {
     return Summarizer(plan, facts, aftermath).make();
+}
+
+SyncSummary summarizeInterrupted(const SyncPlan& plan, const SessionFacts& facts) {
+    SessionAftermath aftermath = assumedAftermath(plan, facts);
+    aftermath.isInterrupted = true;
+    return summarize(plan, facts, aftermath);
+}
+
+SyncSummary summarizeFailed(const SyncPlan& plan, const SessionFacts& facts,
+                            const ErrorRecord& error) {
+    SessionAftermath aftermath = assumedAftermath(plan, facts);
+    aftermath.failure = error.description();
+    return summarize(plan, facts, aftermath);
 }
 
 }  // namespace appsync

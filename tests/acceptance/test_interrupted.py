@@ -1,11 +1,15 @@
 """Syncs that are killed, stopped or run out of disk, and run again."""
 
+import fcntl
+import json
 import os
 import random
 import signal
 import sqlite3
+import struct
 import subprocess
 import sys
+import termios
 import time
 
 import pytest
@@ -88,6 +92,108 @@ def test_interrupt_while_an_application_runs_ends_soon(appsync, device, library)
     appsync("quit", device.path, "com.example.app00")
     settle(device, library)
     assert device.versions()["com.example.app00"] == "2.0"
+
+
+@pytest.fixture
+def waiting_sync(appsync, device, library):
+    """Starts a sync in which the update of a running application is all that is left to do."""
+    device.sync(library)
+    packages.make_package(library, "com.example.app00", "2.0")
+    packages.make_package(library, "com.example.new", "1.0")
+    appsync("run", device.path, "com.example.app00")
+    started = []
+
+    def start(*options):
+        sync = appsync.start("sync", device.path, library, *options)
+        started.append(sync)
+        deadline = time.monotonic() + 30
+        while time.monotonic() < deadline:
+            why = appsync.json("why", device.path, "com.example.app00")
+            if (why["waitsFor"] or {}).get("what") == "termination" and "com.example.new" in device.apps():
+                return sync
+            time.sleep(0.05)
+        raise AssertionError("nothing waits")
+
+    yield start
+    for sync in started:
+        sync.kill()
+        sync.communicate()
+
+
+@pytest.mark.parametrize("number", [signal.SIGINT, signal.SIGTERM])
+@pytest.mark.parametrize("option", ["--json", "--json-lines"])
+def test_interrupted_wait_still_prints_the_summary(waiting_sync, number, option):
+    sync = waiting_sync(option)
+    sync.send_signal(number)
+    sync.send_signal(number)
+    out, err = sync.communicate(timeout=15)
+    assert sync.returncode == 1
+    summary = json.loads(out if option == "--json" else out.splitlines()[-1])
+    assert summary["installed"] == ["com.example.new"]
+    assert [each["identifier"] for each in summary["failed"]] == ["com.example.app00"]
+    assert "interrupted: run the same command again" in summary["failed"][0]["error"]
+    assert "interrupted" in err
+
+
+def test_a_stop_is_announced_at_once(waiting_sync):
+    sync = waiting_sync()
+    sync.send_signal(signal.SIGINT)
+    line = sync.stderr.readline()
+    assert "stopping" in line and "second Ctrl-C" in line
+    assert sync.poll() is None
+    out, _ = sync.communicate(timeout=15)
+    assert "Failed com.example.app00: interrupted" in out
+    assert sync.returncode == 1
+
+
+def test_uninstalling_what_waits_wins_over_its_update(appsync, waiting_sync, device, library):
+    sync = waiting_sync("--json")
+    appsync("uninstall", device.path, "com.example.app00")
+    assert "com.example.app00" not in device.placeholders()
+    out, _ = sync.communicate(timeout=60)  # the next try comes after half a minute
+    assert sync.returncode == 1
+    failed = json.loads(out)["failed"]
+    assert [each["identifier"] for each in failed] == ["com.example.app00"]
+    assert "uninstalled on the device" in failed[0]["error"]
+    assert "com.example.app00" not in device.apps()
+    device.sync(library)
+    assert device.versions()["com.example.app00"] == "2.0"
+
+
+def test_policy_that_changes_meanwhile_is_no_reason(appsync, waiting_sync, device):
+    sync = waiting_sync("--json")
+    appsync("set", device.path, "installation=no")
+    appsync("uninstall", device.path, "com.example.new")
+    sync.send_signal(signal.SIGINT)
+    out, _ = sync.communicate(timeout=15)
+    errors = {each["identifier"]: each["error"] for each in json.loads(out)["failed"]}
+    assert "interrupted" in errors["com.example.app00"]
+    assert json.loads(out)["skipped"] == []
+
+
+def test_an_output_that_nobody_reads_does_not_hold_up_the_end(appsync, device, larger_library):
+    reading, writing = os.pipe()
+    fcntl.fcntl(writing, fcntl.F_SETPIPE_SZ, 4096)
+    sync = subprocess.Popen([appsync.program, "sync", device.path, larger_library, "--json-lines"],
+                            stdout=writing, stderr=subprocess.PIPE, text=True)
+    os.close(writing)
+    held, before = 0, -1
+    while held == 0 or held != before:  # until it is full
+        before = held
+        time.sleep(1)
+        held = struct.unpack("i", fcntl.ioctl(reading, termios.FIONREAD, bytes(4)))[0]
+    assert sync.poll() is None
+    sync.send_signal(signal.SIGINT)
+    time.sleep(0.2)
+    sync.send_signal(signal.SIGINT)
+    try:
+        _, err = sync.communicate(timeout=10)
+    finally:
+        sync.kill()
+        os.close(reading)
+    assert sync.returncode == 1
+    assert "interrupted" in err
+    settle(device, larger_library)
 
 
 FULL = """

@@ -85,6 +85,7 @@ TEST_F(SyncOutcome, AnOlderVersionThatStayedIsNoUpdate) {
 TEST_F(SyncOutcome, WhatPolicyForbidsIsSkippedAndMakesTheSessionIncomplete) {
     planInstall("com.a", "1");
     plan.remove = {"com.c"};
+    present("com.c", "1");
     aftermath.installationAllowed = false;
     aftermath.removalAllowed = false;
     ASSERT_EQ(summary().skipped.size(), 2U);
@@ -152,6 +153,69 @@ TEST_F(SyncOutcome, ARequestThatWasNotPlannedAndFailedIsNamedOnce) {
     }
     ASSERT_EQ(summary().failed.size(), 2U);
     EXPECT_EQ(summary().failed[1].identifier, "com.x");
+}
+
+TEST_F(SyncOutcome, AnInterruptionTellsWhatWasSeenToHappenWithoutTheDevice) {
+    planInstall("com.a", "1");
+    planInstall("com.b", "1");
+    planInstall("com.c", "1");
+    plan.remove = {"com.d"};
+    facts.installed("com.a");
+    facts.removed("com.d");
+    facts.failed("com.b", "refused");
+    facts.sent(12);
+    const SyncSummary interrupted = summarizeInterrupted(plan, facts);
+    EXPECT_THAT(interrupted.installed, ElementsAre("com.a"));
+    EXPECT_THAT(interrupted.removed, ElementsAre("com.d"));
+    ASSERT_EQ(interrupted.failed.size(), 2U);
+    EXPECT_EQ(interrupted.failed[0].error, "refused");
+    EXPECT_THAT(interrupted.failed[1].error, HasSubstr("interrupted: run the same command again"));
+    EXPECT_EQ(interrupted.bytes, 12U);
+    EXPECT_TRUE(interrupted.incomplete);
+}
+
+TEST_F(SyncOutcome, ADeviceThatCannotBeLookedAtAnyMoreIsNamedForEachThatIsOpen) {
+    planInstall("com.a", "1");
+    const SyncSummary failed =
+        summarizeFailed(plan, facts, ErrorRecord::make("Device", 5, "the database is damaged"));
+    ASSERT_EQ(failed.failed.size(), 2U);
+    EXPECT_EQ(failed.failed[0].identifier, "com.a");
+    EXPECT_EQ(failed.failed[0].error, "the database is damaged");
+}
+
+TEST_F(SyncOutcome, WhatWasInstalledAndThenUninstalledSaysSo) {
+    planInstall("com.a", "1");
+    facts.requested("com.a");
+    facts.installed("com.a");
+    ASSERT_EQ(summary().failed.size(), 1U);
+    EXPECT_THAT(summary().failed[0].error, HasSubstr("uninstalled on the device meanwhile"));
+}
+
+TEST_F(SyncOutcome, WhatAPersonRemovedBeforeTheSyncCouldIsLeftAlone) {
+    plan.remove = {"com.c"};
+    facts.failed("com.c", "com.c is not installed");
+    EXPECT_THAT(summary().failed, IsEmpty());
+    ASSERT_EQ(summary().skipped.size(), 1U);
+    EXPECT_THAT(summary().skipped[0].why, HasSubstr("uninstalled on the device meanwhile"));
+    EXPECT_FALSE(summary().incomplete);
+}
+
+TEST_F(SyncOutcome, AnInterruptedRemovalIsNotTakenForDone) {
+    plan.remove = {"com.c"};
+    const SyncSummary interrupted = summarizeInterrupted(plan, facts);
+    ASSERT_EQ(interrupted.failed.size(), 1U);
+    EXPECT_THAT(interrupted.failed[0].error, HasSubstr("interrupted"));
+}
+
+TEST(SessionFacts, TheLastAnswerOfPolicyIsTheOneThatCounted) {
+    SessionFacts facts;
+    EXPECT_FALSE(facts.wasForbidden(PolicyFeature::AppInstallationAllowed));
+    facts.policyAnswered(PolicyFeature::AppInstallationAllowed, PolicyAnswer::Yes);
+    facts.policyAnswered(PolicyFeature::AppInstallationAllowed, PolicyAnswer::No);
+    EXPECT_TRUE(facts.wasForbidden(PolicyFeature::AppInstallationAllowed));
+    EXPECT_FALSE(facts.wasForbidden(PolicyFeature::AppRemovalAllowed));
+    facts.policyAnswered(PolicyFeature::AppInstallationAllowed, PolicyAnswer::Unset);
+    EXPECT_FALSE(facts.wasForbidden(PolicyFeature::AppInstallationAllowed));
 }
 
 }  // namespace
