@@ -9,6 +9,11 @@
 
 namespace appsync {
 
+std::string stoppingNotice() {
+    return "stopping: what is under way gets " + std::to_string(kPatience.count()) +
+           " seconds to end; a second Ctrl-C leaves at once";
+}
+
 void leaveAtOnce(const Console& console) {
     console.err << "appsync: interrupted before every install had ended: " << kRunAgain
                 << std::endl;

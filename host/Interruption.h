@@ -1,6 +1,7 @@
 #pragma once
 
 #include <chrono>
+#include <string>
 #include <string_view>
 
 namespace appsync {
@@ -13,6 +14,9 @@ inline constexpr std::chrono::seconds kPatience{3};
 /// What a person does after an interruption.
 inline constexpr std::string_view kRunAgain =
     "run the same command again to bring the device in step";
+
+/// What is said when a session is asked to stop.
+[[nodiscard]] std::string stoppingNotice();
 
 /// Ends the process in the middle of what it does, which a device survives, and says so.
 [[noreturn]] void leaveAtOnce(const Console& console);

@@ -55,13 +55,17 @@ std::optional<std::string> waitingVersion(Device& device, const std::string& ide
 
 class Sending {
   public:
-    Sending(const SendArguments& arguments, const Console& console,
-            const std::atomic<bool>& stopRequested)
+    Sending(const SendArguments& arguments, const Console& console)
         : arguments_(arguments),
           console_(console),
-          stopRequested_(stopRequested),
           display_(makeSyncDisplay(arguments.display, console)),
-          events_(*display_) {}
+          events_(*display_),
+          signals_(
+              kPatience, [this] { events_.complainSoon(stoppingNotice()); }, [this] { leave(); }) {}
+    Sending(const Sending&) = delete;
+    Sending& operator=(const Sending&) = delete;
+    // Signals must not end the process in an instant before the device is closed.
+    ~Sending() { device_.reset(); }
 
     Result<int> run() {
         Result<std::unique_ptr<Device>> device =
@@ -71,7 +75,8 @@ class Sending {
         Status ready = removeStaleTransfers(*device_);
         if (ready) ready = isData() ? prepareData() : preparePackage();
         if (!ready) return ready.error();
-        if (stopRequested_) return failure("interrupted before the session began", "run it again");
+        isPlanned_ = true;
+        if (signals_.stopRequested()) return finish(summarizeInterrupted(plan_, facts_));
         return hold();
     }
 
@@ -139,25 +144,41 @@ class Sending {
     Result<int> hold() {
         Result<std::unique_ptr<PlugIn>> plugIn = PlugIn::load(*device_, events_, facts_);
         if (!plugIn) return plugIn.error();
-        Session session(*device_, **plugIn, events_, facts_, stopRequested_);
+        Session session(*device_, **plugIn, events_, facts_, signals_.stopRequested());
         const SessionEnd end = session.deliver(parcel_);
         const Result<SessionAftermath> aftermath = aftermathOf(*device_, end);
-        if (!aftermath) return aftermath.error();
+        if (!aftermath) {
+            finish(summarizeFailed(plan_, facts_, aftermath.error()));
+            return aftermath.error();
+        }
         SyncSummary summary = summarize(plan_, facts_, *aftermath);
         if (!plansInstall_ && summary.failed.empty()) {
             summary.skipped.push_back(
                 {arguments_.identifier, "its package waits for its data", false});
         }
-        summary.bytes = end.bytes;
+        return finish(std::move(summary));
+    }
+
+    // On the thread of the signals, whatever the session is at.
+    [[noreturn]] void leave() {
+        if (isPlanned_) events_.finishSoon(timed(summarizeInterrupted(plan_, facts_)));
+        leaveAtOnce(console_);
+    }
+
+    SyncSummary timed(SyncSummary summary) const {
         summary.seconds = std::chrono::duration<double>(Clock::now() - begin_).count();
+        return summary;
+    }
+
+    int finish(SyncSummary summary) {
+        summary = timed(std::move(summary));
         events_.finish(summary);
-        if (end.isInterrupted) console_.fail(failure("interrupted", kRunAgain));
+        if (signals_.stopRequested()) console_.fail(failure("interrupted", kRunAgain));
         return summary.incomplete ? kExitSomethingFailed : kExitDone;
     }
 
     const SendArguments& arguments_;
     const Console& console_;
-    const std::atomic<bool>& stopRequested_;
     std::unique_ptr<SyncDisplay> display_;
     SyncEvents events_;
     SessionFacts facts_;
@@ -166,6 +187,8 @@ class Sending {
     SyncPlan plan_;
     bool plansInstall_ = true;
     const Clock::time_point begin_ = Clock::now();
+    std::atomic<bool> isPlanned_ = false;  // the plan is made, and changes no more
+    const StopSignals signals_;
 };
 
 }  // namespace
@@ -173,8 +196,7 @@ class Sending {
 int runSend(const SendArguments& arguments, const Console& console) {
     const Status checked = checkArguments(arguments);
     if (!checked) return console.fail(checked.error());
-    const StopSignals signals(kPatience, [&console] { leaveAtOnce(console); });
-    const Result<int> status = Sending(arguments, console, signals.stopRequested()).run();
+    const Result<int> status = Sending(arguments, console).run();
     return status ? *status : console.fail(status.error());
 }
 

@@ -128,7 +128,7 @@ void Session::send(const Parcel& parcel) {
     const Result<std::uint64_t> sent =
         sender_.send(parcel.file, parcel.directory, parcel.name, progress);
     if (!sent) return reportFailure(asset, sent.error());
-    end_.bytes += *sent;
+    facts_.sent(*sent);
     event.kind = SyncEventKind::Ended;
     event.state = SyncState::Finished;
     events_.report(event);

@@ -30,8 +30,6 @@ struct SessionEnd {
     bool isInterrupted = false;
     /// Why nothing could be transferred at all.
     std::optional<ErrorRecord> error;
-    /// Bytes that were sent.
-    std::uint64_t bytes = 0;
 
     [[nodiscard]] bool isSuccess() const { return !isDisabled && !isInterrupted && !error; }
 };

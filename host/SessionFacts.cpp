@@ -22,6 +22,11 @@ void SessionFacts::requested(const std::string& identifier) {
     requests_.push_back(identifier);
 }
 
+void SessionFacts::sent(std::uint64_t bytes) {
+    const std::lock_guard guard(mutex_);
+    bytesSent_ += bytes;
+}
+
 std::optional<std::string> SessionFacts::firstFailure(const std::string& identifier) const {
     const std::lock_guard guard(mutex_);
     const auto found = failures_.find(identifier);
@@ -42,6 +47,11 @@ bool SessionFacts::wasRemoved(const std::string& identifier) const {
 std::vector<std::string> SessionFacts::requests() const {
     const std::lock_guard guard(mutex_);
     return requests_;
+}
+
+std::uint64_t SessionFacts::bytesSent() const {
+    const std::lock_guard guard(mutex_);
+    return bytesSent_;
 }
 
 }  // namespace appsync

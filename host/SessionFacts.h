@@ -18,12 +18,14 @@ class SessionFacts {
     void installed(const std::string& identifier);
     void removed(const std::string& identifier);
     void requested(const std::string& identifier);
+    void sent(std::uint64_t bytes);
 
     [[nodiscard]] std::optional<std::string> firstFailure(const std::string& identifier) const;
     [[nodiscard]] bool wasInstalled(const std::string& identifier) const;
     [[nodiscard]] bool wasRemoved(const std::string& identifier) const;
     /// In the order in which the device asked.
     [[nodiscard]] std::vector<std::string> requests() const;
+    [[nodiscard]] std::uint64_t bytesSent() const;
 
   private:
     mutable std::mutex mutex_;
@@ -32,6 +34,7 @@ class SessionFacts {
     std::set<std::string> installed_;
     std::set<std::string> removed_;
     std::vector<std::string> requests_;
+    std::uint64_t bytesSent_ = 0;
 };
 
 }  // namespace appsync

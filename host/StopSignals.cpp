@@ -29,8 +29,9 @@ sigset_t stopSet() {
 
 }  // namespace
 
-StopSignals::StopSignals(std::chrono::milliseconds patience, std::function<void()> giveUp)
-    : patience_(patience), giveUp_(std::move(giveUp)) {
+StopSignals::StopSignals(std::chrono::milliseconds patience, std::function<void()> stopping,
+                         std::function<void()> giveUp)
+    : patience_(patience), stopping_(std::move(stopping)), giveUp_(std::move(giveUp)) {
     const sigset_t set = stopSet();
     signals_ = ::signalfd(-1, &set, SFD_CLOEXEC);
     ended_ = ::eventfd(0, EFD_CLOEXEC);
@@ -61,9 +62,17 @@ void StopSignals::watch() {
         if (ready > 0 && sources[1].revents != 0) return;
         signalfd_siginfo info{};
         const bool hasCome = ready > 0 && ::read(signals_, &info, sizeof(info)) > 0;
-        if (requested_ || ready <= 0) return giveUp_();
+        if (requested_ || ready <= 0) return leave();
         requested_ = hasCome;
+        if (hasCome) stopping_();
     }
+}
+
+// An output that nobody reads may hold `giveUp` up for ever.
+void StopSignals::leave() {
+    const sigset_t set = stopSet();
+    ::pthread_sigmask(SIG_UNBLOCK, &set, nullptr);
+    giveUp_();
 }
 
 }  // namespace appsync

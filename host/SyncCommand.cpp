@@ -1,4 +1,5 @@
 #include <algorithm>
+#include <atomic>
 #include <chrono>
 #include <filesystem>
 #include <memory>
@@ -58,22 +59,30 @@ Result<std::string> packageFile(const Library& library, const std::string& ident
 // One run of `sync` or `plan`.
 class SyncRun {
   public:
-    SyncRun(const SyncArguments& arguments, const Console& console, const StopSignals* signals)
+    SyncRun(const SyncArguments& arguments, const Console& console)
         : arguments_(arguments),
           console_(console),
-          stopRequested_(signals != nullptr ? signals->stopRequested() : never_),
           display_(makeSyncDisplay(arguments.display, console)),
-          events_(*display_) {}
+          events_(*display_) {
+        if (arguments.isDryRun) return;
+        signals_.emplace(
+            kPatience, [this] { events_.complainSoon(stoppingNotice()); }, [this] { leave(); });
+    }
+    SyncRun(const SyncRun&) = delete;
+    SyncRun& operator=(const SyncRun&) = delete;
+    // Signals must not end the process in an instant before the device is closed.
+    ~SyncRun() { device_.reset(); }
 
     Result<int> run() {
         Status ready = prepare();
         if (!ready) return ready.error();
         if (arguments_.isDryRun) return showPlan();
+        isPlanned_ = true;
         if (mustNotRun_) return refuse(plan_.failed.back().error);
         if (!space_.fits()) return refuse(space_.description());
         ready = clearTheWay();
         if (!ready) return ready.error();
-        if (stopRequested_) return failure("interrupted before the session began", kRunAgain);
+        if (signals_->stopRequested()) return finish(summarizeInterrupted(plan_, facts_));
         return hold();
     }
 
@@ -172,31 +181,40 @@ class SyncRun {
     Result<int> hold() {
         Result<std::unique_ptr<PlugIn>> plugIn = PlugIn::load(*device_, events_, facts_);
         if (!plugIn) return plugIn.error();
-        Session session(*device_, **plugIn, events_, facts_, stopRequested_);
+        Session session(*device_, **plugIn, events_, facts_, signals_->stopRequested());
         const SessionEnd end = session.sync(
             [this](const std::string& identifier) { return packageFile(library_, identifier); });
         Result<SessionAftermath> aftermath = aftermathOf(*device_, end);
-        if (!aftermath) return aftermath.error();
-        SyncSummary summary = summarize(plan_, facts_, *aftermath);
-        summary.bytes = end.bytes;
-        return finish(std::move(summary));
+        if (aftermath) return finish(summarize(plan_, facts_, *aftermath));
+        finish(summarizeFailed(plan_, facts_, aftermath.error()));
+        return aftermath.error();
+    }
+
+    // On the thread of the signals, whatever the session is at. From here on the plan stays as it
+    // is, and the device is not asked: it may be what does not answer.
+    [[noreturn]] void leave() {
+        if (isPlanned_) events_.finishSoon(timed(summarizeInterrupted(plan_, facts_)));
+        leaveAtOnce(console_);
+    }
+
+    SyncSummary timed(SyncSummary summary) const {
+        summary.seconds = std::chrono::duration<double>(Clock::now() - begin_).count();
+        summary.incomplete = summary.incomplete || !summary.failed.empty();
+        return summary;
     }
 
     int finish(SyncSummary summary) {
-        summary.seconds = std::chrono::duration<double>(Clock::now() - begin_).count();
-        summary.incomplete = summary.incomplete || !summary.failed.empty();
+        summary = timed(std::move(summary));
         if (arguments_.display == SyncDisplayKind::Text) {
             for (const std::string& note : library_.notes) console_.out << printable(note) << '\n';
         }
         events_.finish(summary);
-        if (stopRequested_) console_.fail(failure("interrupted", kRunAgain));
+        if (signals_->stopRequested()) console_.fail(failure("interrupted", kRunAgain));
         return summary.incomplete ? kExitSomethingFailed : kExitDone;
     }
 
     const SyncArguments& arguments_;
     const Console& console_;
-    const std::atomic<bool> never_ = false;
-    const std::atomic<bool>& stopRequested_;
     std::unique_ptr<SyncDisplay> display_;
     SyncEvents events_;
     SessionFacts facts_;
@@ -206,6 +224,8 @@ class SyncRun {
     SpaceCheck space_;
     bool mustNotRun_ = false;
     const Clock::time_point begin_ = Clock::now();
+    std::atomic<bool> isPlanned_ = false;  // the plan is made, and changes no more
+    std::optional<StopSignals> signals_;   // not for a dry run
 };
 
 }  // namespace
@@ -213,9 +233,7 @@ class SyncRun {
 int runSync(const SyncArguments& arguments, const Console& console) {
     const Status checked = checkArguments(arguments);
     if (!checked) return console.fail(checked.error());
-    std::optional<StopSignals> signals;
-    if (!arguments.isDryRun) signals.emplace(kPatience, [&console] { leaveAtOnce(console); });
-    const Result<int> status = SyncRun(arguments, console, signals ? &*signals : nullptr).run();
+    const Result<int> status = SyncRun(arguments, console).run();
     return status ? *status : console.fail(status.error());
 }
 

@@ -42,10 +42,19 @@ std::string stateText(const SyncEvent& event) {
            ")";
 }
 
-// A line per event.
-class LineDisplay : public SyncDisplay {
+class ConsoleDisplay : public SyncDisplay {
   public:
-    explicit LineDisplay(const Console& console) : console_(console) {}
+    explicit ConsoleDisplay(const Console& console) : console_(console) {}
+    void complain(std::string_view text) override { console_.complain(text); }
+
+  protected:
+    const Console& console_;
+};
+
+// A line per event.
+class LineDisplay : public ConsoleDisplay {
+  public:
+    using ConsoleDisplay::ConsoleDisplay;
 
     void show(const SyncEvent& event) override {
         console_.out << eventLine(event) << '\n' << std::flush;
@@ -54,15 +63,12 @@ class LineDisplay : public SyncDisplay {
     void finish(const SyncSummary& summary) override {
         console_.out << summaryText(summary) << std::flush;
     }
-
-  private:
-    const Console& console_;
 };
 
 // What has ended scrolls up; what is under way is redrawn below it.
-class BarDisplay : public SyncDisplay {
+class BarDisplay : public ConsoleDisplay {
   public:
-    explicit BarDisplay(const Console& console) : console_(console) {}
+    using ConsoleDisplay::ConsoleDisplay;
 
     void show(const SyncEvent& event) override {
         const auto drawn = std::find_if(bars_.begin(), bars_.end(), [&](const SyncEvent& bar) {
@@ -77,6 +83,13 @@ class BarDisplay : public SyncDisplay {
         } else {
             bars_.push_back(event);
         }
+        draw();
+    }
+
+    // The error stream is most often the same terminal.
+    void complain(std::string_view text) override {
+        erase();
+        console_.complain(text);
         draw();
     }
 
@@ -100,35 +113,28 @@ class BarDisplay : public SyncDisplay {
         console_.out << std::flush;
     }
 
-    const Console& console_;
     std::vector<SyncEvent> bars_;
     std::size_t drawnLines_ = 0;
 };
 
-class JsonDisplay : public SyncDisplay {
+class JsonDisplay : public ConsoleDisplay {
   public:
-    explicit JsonDisplay(const Console& console) : console_(console) {}
+    using ConsoleDisplay::ConsoleDisplay;
     void show(const SyncEvent&) override {}
     void finish(const SyncSummary& summary) override {
         console_.out << jsonText(summary, JsonLayout::Indented) << '\n' << std::flush;
     }
-
-  private:
-    const Console& console_;
 };
 
-class JsonLinesDisplay : public SyncDisplay {
+class JsonLinesDisplay : public ConsoleDisplay {
   public:
-    explicit JsonLinesDisplay(const Console& console) : console_(console) {}
+    using ConsoleDisplay::ConsoleDisplay;
     void show(const SyncEvent& event) override {
         console_.out << jsonText(event) << '\n' << std::flush;
     }
     void finish(const SyncSummary& summary) override {
         console_.out << jsonText(summary, JsonLayout::SummaryLine) << '\n' << std::flush;
     }
-
-  private:
-    const Console& console_;
 };
 
 std::string listed(const char* title, const std::vector<std::string>& identifiers) {

@@ -1,6 +1,7 @@
 #include "host/SyncEvents.h"
 
 #include <algorithm>
+#include <thread>
 
 namespace appsync {
 
@@ -62,6 +63,7 @@ bool isNews(const SyncEvent& progress, const SyncEvent& last) {
 
 void SyncEvents::report(SyncEvent event) {
     const std::lock_guard guard(mutex_);
+    if (isFinished_) return;
     const auto [position, isFirst] = shown_.try_emplace({event.phase, event.identifier}, event);
     SyncEvent& last = position->second;
     if (!isFirst) {
@@ -76,6 +78,33 @@ void SyncEvents::report(SyncEvent event) {
 
 void SyncEvents::finish(const SyncSummary& summary) {
     const std::lock_guard guard(mutex_);
+    finishLocked(summary);
+}
+
+void SyncEvents::complainSoon(std::string_view text) {
+    const std::unique_lock lock = lockSoon();
+    if (lock && !isFinished_) display_.complain(text);
+}
+
+void SyncEvents::finishSoon(const SyncSummary& summary) {
+    const std::unique_lock lock = lockSoon();
+    if (lock) finishLocked(summary);
+}
+
+std::unique_lock<std::mutex> SyncEvents::lockSoon() {
+    constexpr int kAttempts = 50;
+    constexpr std::chrono::milliseconds kBetweenAttempts{10};
+    std::unique_lock lock(mutex_, std::try_to_lock);
+    for (int attempt = 1; !lock && attempt < kAttempts; ++attempt) {
+        std::this_thread::sleep_for(kBetweenAttempts);
+        static_cast<void>(lock.try_lock());
+    }
+    return lock;
+}
+
+void SyncEvents::finishLocked(const SyncSummary& summary) {
+    if (isFinished_) return;
+    isFinished_ = true;
     display_.finish(summary);
 }
 

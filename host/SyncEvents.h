@@ -56,6 +56,8 @@ class SyncDisplay {
   public:
     virtual ~SyncDisplay() = default;
     virtual void show(const SyncEvent& event) = 0;
+    /// Something that is no event, for the error stream.
+    virtual void complain(std::string_view text) = 0;
     /// The session is over; nothing is shown after this.
     virtual void finish(const SyncSummary& summary) = 0;
 };
@@ -67,16 +69,27 @@ class SyncEvents {
   public:
     explicit SyncEvents(SyncDisplay& display) : display_(display) {}
 
-    /// Callable on any thread.
+    // All are callable on any thread.
+
     void report(SyncEvent event);
-    /// The last call.
+    /// The session is over: whatever comes after this is dropped, another summary too.
     void finish(const SyncSummary& summary);
 
+    // For a thread that cannot wait: nothing is shown where the display has been at work for half a
+    // second, as on an output that nobody reads.
+
+    void complainSoon(std::string_view text);
+    void finishSoon(const SyncSummary& summary);
+
   private:
+    [[nodiscard]] std::unique_lock<std::mutex> lockSoon();
+    void finishLocked(const SyncSummary& summary);
+
     SyncDisplay& display_;
     std::mutex mutex_;
     // Guarded by mutex_: the last event shown, by phase and identifier.
     std::map<std::pair<SyncPhase, std::string>, SyncEvent> shown_;
+    bool isFinished_ = false;  // guarded by mutex_ too
 };
 
 /// How much of the total is done, in whole per cent, rounded down; 100 when the total is 0.

@@ -6,6 +6,7 @@
 #include <utility>
 
 #include "device/Device.h"
+#include "host/Interruption.h"
 #include "host/Problem.h"
 #include "host/Session.h"
 #include "host/SessionFacts.h"
@@ -18,6 +19,8 @@ bool hasUnmet(const std::vector<PlannedSkip>& skipped) {
     return std::any_of(skipped.begin(), skipped.end(),
                        [](const PlannedSkip& skip) { return skip.isUnmet; });
 }
+
+std::string interruption() { return "interrupted: " + std::string(kRunAgain); }
 
 class Summarizer {
   public:
@@ -33,13 +36,14 @@ class Summarizer {
 
     SyncSummary make() {
         summary_.requested = facts_.requests();
+        summary_.bytes = facts_.bytesSent();
         summary_.failed = plan_.failed;
         summary_.skipped = plan_.skipped;
         for (const std::string& identifier : plan_.remove) judgeRemoval(identifier);
         for (const PlannedInstall& each : plan_.install) judge(each, summary_.installed);
         for (const PlannedInstall& each : plan_.update) judge(each, summary_.updated);
         judgeUnplanned();
-        if (aftermath_.isInterrupted && summary_.failed.empty()) addSessionFailure("interrupted");
+        if (aftermath_.isInterrupted && summary_.failed.empty()) addSessionFailure(interruption());
         if (aftermath_.failure) addSessionFailure(*aftermath_.failure);
         summary_.incomplete = !summary_.failed.empty() || hasUnmet(summary_.skipped);
         return std::move(summary_);
@@ -91,8 +95,7 @@ class Summarizer {
             summary_.skipped.push_back({identifier, whyForbidden, true});
             return;
         }
-        fail(identifier,
-             aftermath_.isInterrupted ? "interrupted: run the same command again" : whyElse);
+        fail(identifier, aftermath_.isInterrupted ? interruption() : whyElse);
     }
 
     void fail(const std::string& identifier, const std::string& error) {
@@ -109,6 +112,21 @@ class Summarizer {
     std::set<std::string> installs_;
     SyncSummary summary_;
 };
+
+// What the device holds if everything stands that was seen to be installed.
+SessionAftermath assumedAftermath(const SyncPlan& plan, const SessionFacts& facts) {
+    SessionAftermath aftermath;
+    for (const auto* installs : {&plan.install, &plan.update}) {
+        for (const PlannedInstall& each : *installs) {
+            if (!facts.wasInstalled(each.identifier)) continue;
+            ApplicationRecord record;
+            record.identifier = each.identifier;
+            record.version = each.newVersion;
+            aftermath.present.push_back(std::move(record));
+        }
+    }
+    return aftermath;
+}
 
 }  // namespace
 
@@ -131,6 +149,19 @@ Result<SessionAftermath> aftermathOf(Device& device, const SessionEnd& end) {
 SyncSummary summarize(const SyncPlan& plan, const SessionFacts& facts,
                       const SessionAftermath& aftermath) {
     return Summarizer(plan, facts, aftermath).make();
+}
+
+SyncSummary summarizeInterrupted(const SyncPlan& plan, const SessionFacts& facts) {
+    SessionAftermath aftermath = assumedAftermath(plan, facts);
+    aftermath.isInterrupted = true;
+    return summarize(plan, facts, aftermath);
+}
+
+SyncSummary summarizeFailed(const SyncPlan& plan, const SessionFacts& facts,
+                            const ErrorRecord& error) {
+    SessionAftermath aftermath = assumedAftermath(plan, facts);
+    aftermath.failure = error.description();
+    return summarize(plan, facts, aftermath);
 }
 
 }  // namespace appsync

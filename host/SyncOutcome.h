@@ -30,9 +30,17 @@ struct SessionAftermath {
 [[nodiscard]] Result<SessionAftermath> aftermathOf(Device& device, const SessionEnd& end);
 
 /// Holds the plan against what the device holds after the session: what was asked for and did not
-/// happen is failed, with its first cause, or skipped where policy forbids it. Times and bytes are
+/// happen is failed, with its first cause, or skipped where policy forbids it. The time is
 /// the caller's to fill in.
 [[nodiscard]] SyncSummary summarize(const SyncPlan& plan, const SessionFacts& facts,
                                     const SessionAftermath& aftermath);
+
+// The same without a look at the device, from what was seen in the session alone.
+
+/// It is left in its middle, or before it began.
+[[nodiscard]] SyncSummary summarizeInterrupted(const SyncPlan& plan, const SessionFacts& facts);
+/// The device cannot be looked at any more.
+[[nodiscard]] SyncSummary summarizeFailed(const SyncPlan& plan, const SessionFacts& facts,
+                                          const ErrorRecord& error);
 
 }  // namespace appsync

@@ -1,5 +1,6 @@
 """Syncs that are killed, stopped or run out of disk, and run again."""
 
+import json
 import os
 import random
 import signal
@@ -88,6 +89,58 @@ def test_interrupt_while_an_application_runs_ends_soon(appsync, device, library)
     appsync("quit", device.path, "com.example.app00")
     settle(device, library)
     assert device.versions()["com.example.app00"] == "2.0"
+
+
+@pytest.fixture
+def waiting_sync(appsync, device, library):
+    """Starts a sync in which the update of a running application is all that is left to do."""
+    device.sync(library)
+    packages.make_package(library, "com.example.app00", "2.0")
+    packages.make_package(library, "com.example.new", "1.0")
+    appsync("run", device.path, "com.example.app00")
+    started = []
+
+    def start(*options):
+        sync = appsync.start("sync", device.path, library, *options)
+        started.append(sync)
+        deadline = time.monotonic() + 30
+        while time.monotonic() < deadline:
+            why = appsync.json("why", device.path, "com.example.app00")
+            if (why["waitsFor"] or {}).get("what") == "termination" and "com.example.new" in device.apps():
+                return sync
+            time.sleep(0.05)
+        raise AssertionError("nothing waits")
+
+    yield start
+    for sync in started:
+        sync.kill()
+        sync.communicate()
+
+
+@pytest.mark.parametrize("number", [signal.SIGINT, signal.SIGTERM])
+@pytest.mark.parametrize("option", ["--json", "--json-lines"])
+def test_interrupted_wait_still_prints_the_summary(waiting_sync, number, option):
+    sync = waiting_sync(option)
+    sync.send_signal(number)
+    sync.send_signal(number)
+    out, err = sync.communicate(timeout=15)
+    assert sync.returncode == 1
+    summary = json.loads(out if option == "--json" else out.splitlines()[-1])
+    assert summary["installed"] == ["com.example.new"]
+    assert [each["identifier"] for each in summary["failed"]] == ["com.example.app00"]
+    assert "interrupted: run the same command again" in summary["failed"][0]["error"]
+    assert "interrupted" in err
+
+
+def test_a_stop_is_announced_at_once(waiting_sync):
+    sync = waiting_sync()
+    sync.send_signal(signal.SIGINT)
+    line = sync.stderr.readline()
+    assert "stopping" in line and "second Ctrl-C" in line
+    assert sync.poll() is None
+    out, _ = sync.communicate(timeout=15)
+    assert "Failed com.example.app00: interrupted" in out
+    assert sync.returncode == 1
 
 
 FULL = """

@@ -13,13 +13,15 @@ namespace {
 constexpr std::chrono::hours kForEver{1};
 
 TEST(StopSignals, AskForAStopOnlyWhenASignalComes) {
-    const StopSignals signals(kForEver, [] { FAIL() << "gave up"; });
+    const StopSignals signals(
+        kForEver, [] { FAIL() << "stopping"; }, [] { FAIL() << "gave up"; });
     EXPECT_FALSE(signals.stopRequested());
 }
 
 TEST(StopSignals, GiveUpWhenTheSessionDoesNotEndInTime) {
     std::promise<void> gaveUp;
-    const StopSignals signals(std::chrono::milliseconds(0), [&] { gaveUp.set_value(); });
+    const StopSignals signals(
+        std::chrono::milliseconds(0), [] {}, [&] { gaveUp.set_value(); });
     ::kill(::getpid(), SIGTERM);
     gaveUp.get_future().wait();
     EXPECT_TRUE(signals.stopRequested());
@@ -27,12 +29,22 @@ TEST(StopSignals, GiveUpWhenTheSessionDoesNotEndInTime) {
 
 TEST(StopSignals, GiveUpAtTheSecondSignal) {
     std::promise<void> gaveUp;
-    const StopSignals signals(kForEver, [&] { gaveUp.set_value(); });
+    const StopSignals signals(
+        kForEver, [] {}, [&] { gaveUp.set_value(); });
     ::kill(::getpid(), SIGTERM);
     while (!signals.stopRequested()) std::this_thread::yield();
     ::kill(::getpid(), SIGTERM);
     gaveUp.get_future().wait();
     SUCCEED();
+}
+
+TEST(StopSignals, SayAtOnceThatTheSessionIsStopping) {
+    std::promise<void> stopping;
+    const StopSignals signals(
+        kForEver, [&] { stopping.set_value(); }, [] { FAIL() << "gave up"; });
+    ::kill(::getpid(), SIGTERM);
+    stopping.get_future().wait();
+    EXPECT_TRUE(signals.stopRequested());
 }
 
 }  // namespace

@@ -116,5 +116,16 @@ TEST_F(SyncDisplays, NamesEachFailureInTheSummary) {
     EXPECT_THAT(summaryText(summary), HasSubstr("Skipped com.b: offloaded\n"));
 }
 
+TEST_F(SyncDisplays, ANoticeStandsAboveTheBars) {
+    console.isTerminal = true;
+    const std::unique_ptr<SyncDisplay> display = makeSyncDisplay(SyncDisplayKind::Text, console);
+    display->show(event(SyncEventKind::Progress, SyncState::Active));
+    out.str("");
+    display->complain("stopping");
+    EXPECT_EQ(err.str(), "appsync: stopping\n");
+    EXPECT_THAT(out.str(), StartsWith("\x1b[1A\x1b[J"));
+    EXPECT_THAT(out.str(), HasSubstr("[##########..........]"));
+}
+
 }  // namespace
 }  // namespace appsync

@@ -2,6 +2,7 @@
 
 #include <gtest/gtest.h>
 
+#include <functional>
 #include <thread>
 
 namespace appsync {
@@ -9,9 +10,12 @@ namespace {
 
 class RecordingDisplay : public SyncDisplay {
   public:
+    void complain(std::string_view text) override { complaints.emplace_back(text); }
     void show(const SyncEvent& event) override { events.push_back(event); }
-    void finish(const SyncSummary&) override {}
+    void finish(const SyncSummary&) override { ++finishes; }
     std::vector<SyncEvent> events;
+    std::vector<std::string> complaints;
+    int finishes = 0;
 };
 
 SyncEvent progress(std::uint64_t done, std::uint64_t total) {
@@ -99,6 +103,37 @@ TEST(PercentOf, RoundsDownSoThatOnlyTheEndIsAHundred) {
     EXPECT_EQ(percentOf(UINT64_MAX - 1, UINT64_MAX), 99U);
     EXPECT_EQ(percentOf(3, 3), 100U);
     EXPECT_EQ(percentOf(0, 0), 100U);
+}
+
+TEST(SyncEvents, NothingIsShownAfterTheFirstSummary) {
+    RecordingDisplay display;
+    SyncEvents events(display);
+    events.complainSoon("stopping");
+    events.finishSoon({});
+    events.finish({});
+    events.report(progress(50, 100));
+    events.complainSoon("too late");
+    EXPECT_EQ(display.finishes, 1);
+    EXPECT_TRUE(display.events.empty());
+    EXPECT_EQ(display.complaints, std::vector<std::string>{"stopping"});
+}
+
+class StuckDisplay : public RecordingDisplay {
+  public:
+    explicit StuckDisplay(std::function<void()> onShow) : onShow_(std::move(onShow)) {}
+    void show(const SyncEvent&) override { onShow_(); }
+
+  private:
+    const std::function<void()> onShow_;
+};
+
+TEST(SyncEvents, WhoeverLeavesDoesNotWaitForAnOutputThatIsStuck) {
+    SyncEvents* shown = nullptr;
+    StuckDisplay display([&] { std::thread([&] { shown->finishSoon({}); }).join(); });
+    SyncEvents events(display);
+    shown = &events;
+    events.report(progress(50, 100));
+    EXPECT_EQ(display.finishes, 0);
 }
 
 }  // namespace

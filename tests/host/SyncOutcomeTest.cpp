@@ -154,5 +154,33 @@ TEST_F(SyncOutcome, ARequestThatWasNotPlannedAndFailedIsNamedOnce) {
     EXPECT_EQ(summary().failed[1].identifier, "com.x");
 }
 
+TEST_F(SyncOutcome, AnInterruptionTellsWhatWasSeenToHappenWithoutTheDevice) {
+    planInstall("com.a", "1");
+    planInstall("com.b", "1");
+    planInstall("com.c", "1");
+    plan.remove = {"com.d"};
+    facts.installed("com.a");
+    facts.removed("com.d");
+    facts.failed("com.b", "refused");
+    facts.sent(12);
+    const SyncSummary interrupted = summarizeInterrupted(plan, facts);
+    EXPECT_THAT(interrupted.installed, ElementsAre("com.a"));
+    EXPECT_THAT(interrupted.removed, ElementsAre("com.d"));
+    ASSERT_EQ(interrupted.failed.size(), 2U);
+    EXPECT_EQ(interrupted.failed[0].error, "refused");
+    EXPECT_THAT(interrupted.failed[1].error, HasSubstr("interrupted: run the same command again"));
+    EXPECT_EQ(interrupted.bytes, 12U);
+    EXPECT_TRUE(interrupted.incomplete);
+}
+
+TEST_F(SyncOutcome, ADeviceThatCannotBeLookedAtAnyMoreIsNamedForEachThatIsOpen) {
+    planInstall("com.a", "1");
+    const SyncSummary failed =
+        summarizeFailed(plan, facts, ErrorRecord::make("Device", 5, "the database is damaged"));
+    ASSERT_EQ(failed.failed.size(), 2U);
+    EXPECT_EQ(failed.failed[0].identifier, "com.a");
+    EXPECT_EQ(failed.failed[0].error, "the database is damaged");
+}
+
 }  // namespace
 }  // namespace appsync
