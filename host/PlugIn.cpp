@@ -19,7 +19,7 @@ namespace {
 
 Platform watched(const Platform& platform, SessionWatch& watch) {
     return {platform.host,          platform.log,           watch.registry(),
-            platform.installer,     platform.coordination,  platform.policy,
+            platform.installer,     watch.coordination(),   platform.policy,
             platform.backup,        watch.homeScreen(),     platform.icons,
             platform.transactions,  platform.queues,        platform.files,
             platform.propertyLists, platform.notifications, platform.notificationCenter};

@@ -8,6 +8,8 @@
 #include <string>
 #include <vector>
 
+#include "platform/InstallPromises.h"
+
 namespace appsync {
 
 /// What was seen of each application in one session. Callable on any thread.
@@ -19,9 +21,14 @@ class SessionFacts {
     void removed(const std::string& identifier);
     void requested(const std::string& identifier);
     void sent(std::uint64_t bytes);
+    /// Another client of the coordination service has the install of it in hand.
+    void heldByClient(const std::string& identifier, CoordinationClient client);
 
     [[nodiscard]] std::optional<std::string> firstFailure(const std::string& identifier) const;
     [[nodiscard]] bool wasInstalled(const std::string& identifier) const;
+    /// Everything that was.
+    [[nodiscard]] std::set<std::string> installedIdentifiers() const;
+    [[nodiscard]] std::optional<CoordinationClient> holder(const std::string& identifier) const;
     [[nodiscard]] bool wasRemoved(const std::string& identifier) const;
     /// In the order in which the device asked.
     [[nodiscard]] std::vector<std::string> requests() const;
@@ -32,6 +39,7 @@ class SessionFacts {
     // Guarded by mutex_.
     std::map<std::string, std::string> failures_;
     std::set<std::string> installed_;
+    std::map<std::string, CoordinationClient> holders_;
     std::set<std::string> removed_;
     std::vector<std::string> requests_;
     std::uint64_t bytesSent_ = 0;

@@ -12,7 +12,8 @@ struct SyncAsset;
 /// download asset that carries the identifier and the dataclass; it is only borrowed.
 class TransferService {
   public:
-    /// Called once, on a thread of the service's; `error` is null on success.
+    /// Called once, on any thread, before the operation returns or after; `error` is null on
+    /// success.
     using PrioritizeCompletion = std::function<void(const ErrorRecord* error)>;
 
     virtual ~TransferService() = default;
