@@ -8,6 +8,7 @@
 #include "device/Containers.h"
 #include "device/Database.h"
 #include "device/DeviceDatabase.h"
+#include "device/DeviceError.h"
 #include "device/DurabilityBarrier.h"
 #include "device/InstallContext.h"
 #include "device/PackageReader.h"
@@ -85,12 +86,27 @@ BundleRow rowOf(const PackageInfo& info, const NewContainer& container, std::uin
     return row;
 }
 
+// A person who uninstalls an application while its install is under way has the last word.
+Status refuseIfUninstalled(Database& database, const std::string& identifier) {
+    Query rows = database.query(
+        "SELECT 1 FROM uninstalled JOIN session ON time > started WHERE identifier = ?");
+    rows.bind(identifier);
+    const bool found = rows.next();
+    if (Status status = rows.status(); !status) return status;
+    if (!found) return {};
+    return registryError(RegistryErrorCode::Uninstalled,
+                         identifier +
+                             " was uninstalled on the device while the sync was under way; sync "
+                             "again to bring it back");
+}
+
 Status commitInstall(const InstallContext& context, const PackageInfo& info,
                      NewContainer& container, std::uint64_t installType) {
     const BundleRow row = rowOf(info, container, installType);
     FreedContainers freed;
     const Status committed = context.database.change(Durability::OnDisk, [&](Database& database) {
-        return recordInstalled(database, row, freed);
+        const Status wanted = refuseIfUninstalled(database, row.identifier);
+        return wanted ? recordInstalled(database, row, freed) : wanted;
     });
     if (!committed) return asRegistryStatus(committed);
     container.keep();

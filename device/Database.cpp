@@ -1,6 +1,12 @@
 #include "device/Database.h"
 
 #include <sqlite3.h>
+#include <sys/statvfs.h>
+#include <unistd.h>
+
+#include <cerrno>
+#include <filesystem>
+#include <utility>
 
 #include "device/DeviceError.h"
 
@@ -10,30 +16,76 @@ namespace {
 
 constexpr int kBusyTimeoutMilliseconds = 10'000;
 
+// What is known of a failure of SQLite.
+struct Failure {
+    int resultCode = 0;
+    int systemError = 0;  // errno, where the system was the cause
+    std::string reason;
+    const std::string& path;
+};
+
+// Without its shared memory file a database cannot even be read, and what failed there may hide the
+// system's reason.
+bool hasNoSpace(const Failure& failure) {
+    switch (failure.resultCode & 0xff) {
+        case SQLITE_FULL:
+            return true;
+        case SQLITE_IOERR:
+        case SQLITE_CANTOPEN: {
+            if (failure.systemError == ENOSPC || failure.systemError == EDQUOT) return true;
+            struct statvfs space = {};
+            return ::statvfs(failure.path.c_str(), &space) == 0 && space.f_blocks > 0 &&
+                   space.f_bavail == 0;
+        }
+        default:
+            return false;
+    }
+}
+
+// The files that a database needs beside it are made where it stands.
+bool isWriteProtected(const Failure& failure) {
+    const int primary = failure.resultCode & 0xff;
+    if (primary == SQLITE_READONLY || primary == SQLITE_PERM) return true;
+    if (primary != SQLITE_CANTOPEN) return false;
+    const std::string directory = std::filesystem::path(failure.path).parent_path().string();
+    return ::access(failure.path.c_str(), W_OK) != 0 || ::access(directory.c_str(), W_OK) != 0;
+}
+
 // The one place where SQLite's result codes become errors.
-ErrorRecord databaseError(int resultCode, const std::string& reason, const std::string& path) {
-    switch (resultCode & 0xff) {
+ErrorRecord databaseError(const Failure& failure) {
+    const std::string what = "the device's database " + failure.path;
+    if (hasNoSpace(failure)) {
+        return deviceError(
+            DeviceErrorCode::CannotUse,
+            what +
+                " cannot grow: the disk that it is on is full; free some space there and try "
+                "again");
+    }
+    if (isWriteProtected(failure)) {
+        return deviceError(
+            DeviceErrorCode::CannotUse,
+            what +
+                " cannot be written, which even looking at it needs; make it and its "
+                "directory writable, or use a copy of the device");
+    }
+    switch (failure.resultCode & 0xff) {
+        case SQLITE_ERROR:  // a table or a column that every device has is not there
         case SQLITE_CORRUPT:
         case SQLITE_NOTADB:
             return deviceError(DeviceErrorCode::Damaged,
-                               "the device's database " + path + " is damaged (" + reason +
+                               what + " is damaged (" + failure.reason +
                                    "); put a copy of the device in its place, or create a new "
                                    "device and sync it");
         case SQLITE_BUSY:
         case SQLITE_LOCKED:
             return deviceError(DeviceErrorCode::InUse,
-                               "the device's database " + path +
+                               what +
                                    " has been held by another process for ten seconds; try again "
                                    "when that one is done");
-        case SQLITE_FULL:
-            return deviceError(DeviceErrorCode::CannotUse,
-                               "the device's database " + path +
-                                   " cannot grow: the disk is full; free some space and try again");
         default:
-            return deviceError(DeviceErrorCode::CannotUse, "the device's database " + path +
-                                                               " cannot be used: " + reason +
-                                                               "; check the disk and who may "
-                                                               "write there");
+            return deviceError(DeviceErrorCode::CannotUse,
+                               what + " cannot be used: " + failure.reason +
+                                   "; check the disk and who may write there");
     }
 }
 
@@ -171,8 +223,10 @@ std::size_t Database::changedRows() const {
 }
 
 ErrorRecord Database::error(int resultCode) const {
-    const char* reason = handle_ == nullptr ? sqlite3_errstr(resultCode) : sqlite3_errmsg(handle_);
-    return databaseError(resultCode, reason, path_);
+    if (handle_ == nullptr)
+        return databaseError({resultCode, 0, sqlite3_errstr(resultCode), path_});
+    return databaseError(
+        {resultCode, sqlite3_system_errno(handle_), sqlite3_errmsg(handle_), path_});
 }
 
 }  // namespace appsync

@@ -32,6 +32,7 @@ enum class RegistryErrorCode : std::int64_t {
     UpdateUnderWay = 6,      // a placeholder covers the application
     InstallUnderWay = 7,     // a termination assertion is held on it
     DatabaseFailed = 8,      // the registry's own database failed
+    Uninstalled = 9,         // a person uninstalled it while its install was under way
 };
 
 [[nodiscard]] ErrorRecord deviceError(DeviceErrorCode code, std::string_view sentence);

@@ -1,6 +1,8 @@
 #include "device/DeviceSchema.h"
 
 #include <string>
+#include <string_view>
+#include <vector>
 
 #include "device/Database.h"
 #include "device/DeviceError.h"
@@ -157,6 +159,31 @@ ErrorRecord damaged(const Database& database, const std::string& what) {
                            "sync it");
 }
 
+// The names that kTables creates.
+std::vector<std::string> tableNames() {
+    constexpr std::string_view kCreates = "CREATE TABLE ";
+    const std::string_view script = kTables;
+    std::vector<std::string> names;
+    for (std::size_t at = script.find(kCreates); at != script.npos;
+         at = script.find(kCreates, at)) {
+        at += kCreates.size();
+        names.emplace_back(script.substr(at, script.find(' ', at) - at));
+    }
+    return names;
+}
+
+Status checkTables(Database& database) {
+    for (const std::string& name : tableNames()) {
+        Query rows =
+            database.query("SELECT 1 FROM sqlite_schema WHERE type = 'table' AND name = ?");
+        rows.bind(name);
+        const bool found = rows.next();
+        if (Status status = rows.status(); !status) return status;
+        if (!found) return damaged(database, "it has no table " + name);
+    }
+    return {};
+}
+
 }  // namespace
 
 Status createDeviceSchema(Database& database) {
@@ -185,6 +212,7 @@ Status checkDeviceSchema(Database& database) {
 }
 
 Status checkDeviceDatabase(Database& database) {
+    if (Status status = checkTables(database); !status) return status;
     Query lines = database.query("PRAGMA quick_check(1)");
     const std::string answer = lines.next() ? lines.text(0) : "no answer";
     if (!lines.status()) return lines.status();

@@ -22,6 +22,17 @@ constexpr const char* kFooter =
     "Exit status: 0 done; 1 something failed, each failure named; 2 wrong usage; 3 the device or\n"
     "the library cannot be used.";
 
+// The words that an option knows, with an error that names them.
+CLI::Validator oneOf(const std::vector<std::string>& words) {
+    std::string listed;
+    for (const std::string& word : words) listed += (listed.empty() ? "" : ", ") + word;
+    return {[words, listed](const std::string& given) {
+                const bool isKnown = std::find(words.begin(), words.end(), given) != words.end();
+                return isKnown ? std::string() : given + " is none of " + listed;
+            },
+            ""};
+}
+
 // Declares the commands and remembers which one was chosen. The values that options are parsed into
 // live as long as the commands' actions.
 class Commands {
@@ -191,7 +202,8 @@ class Commands {
                               return runCreate(parsed.device, parsed.other == "on", console_);
                           });
         added.add_option("--coordination", values->other, "whether installs are coordinated")
-            ->check(CLI::IsMember({"on", "off"}));
+            ->type_name("on|off")
+            ->check(oneOf({"on", "off"}));
     }
 
     void addSet() {
@@ -216,7 +228,8 @@ class Commands {
                                  console_);
             });
         added.add_option("--by", values->other, "who does it")
-            ->check(CLI::IsMember({"person", "system"}));
+            ->type_name("person|system")
+            ->check(oneOf({"person", "system"}));
     }
 
     void addJson(CLI::App& added, const std::shared_ptr<DeviceValues>& values) {
@@ -269,9 +282,12 @@ class Commands {
             [this](const LogArguments& parsed) { return runLog(parsed, console_); });
         added.add_option("DEVICE", values->device, "the device's directory")->required();
         added.add_option("--category", values->category, "only this category")->type_name("N");
-        added.add_option("--level", values->level, "only this level and those above it")
+        added
+            .add_option_function<std::string>(
+                "--level", [values](const std::string& name) { values->level = kLevels.at(name); },
+                "only this level and those above it")
             ->type_name("debug|info|default|error|fault")
-            ->transform(CLI::CheckedTransformer(kLevels).description(""));
+            ->check(oneOf({"debug", "info", "default", "error", "fault"}));
         added.add_flag("--follow", values->follows, "go on as lines come");
         added.add_flag("--json", values->asJson, "print the lines as they are kept");
     }
@@ -286,7 +302,7 @@ class Commands {
         added.add_option("DEVICE", values->device, "the device's directory")->required();
         added.add_option("ACTION", values->action, "list, create or cancel")
             ->required()
-            ->check(CLI::IsMember({"list", "create", "cancel"}));
+            ->check(oneOf({"list", "create", "cancel"}));
         added.add_option("ID", values->identifier, "the application's identifier");
         added.add_option("--client", values->client, "the client to play")->type_name("N");
         added.add_flag("--json", values->asJson, "print JSON");
@@ -362,10 +378,13 @@ class Commands {
                 return runPropertyListConvert(parsed.file, parsed.format, parsed.output, console_);
             });
         added.add_option("FILE", values->file, "the property list")->required();
-        added.add_option("--to", values->format, "the encoding to write")
+        added
+            .add_option_function<std::string>(
+                "--to", [values](const std::string& name) { values->format = kFormats.at(name); },
+                "the encoding to write")
             ->required()
             ->type_name("xml|binary")
-            ->transform(CLI::CheckedTransformer(kFormats).description(""));
+            ->check(oneOf({"xml", "binary"}));
         added.add_option("--out", values->output, "the file to write; else standard output");
     }
 

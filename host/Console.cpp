@@ -3,7 +3,6 @@
 #include <sys/ioctl.h>
 #include <unistd.h>
 
-#include <algorithm>
 #include <cstdlib>
 #include <iostream>
 #include <string_view>
@@ -14,8 +13,6 @@
 namespace appsync {
 namespace {
 
-constexpr std::size_t kNarrowest = 40;
-
 bool canRedraw() {
     const char* terminal = std::getenv("TERM");
     return ::isatty(STDOUT_FILENO) != 0 && terminal != nullptr &&
@@ -25,7 +22,7 @@ bool canRedraw() {
 std::size_t terminalWidth() {
     winsize size{};
     if (::ioctl(STDOUT_FILENO, TIOCGWINSZ, &size) != 0 || size.ws_col == 0) return 80;
-    return std::max<std::size_t>(size.ws_col, kNarrowest);
+    return size.ws_col;
 }
 
 }  // namespace

@@ -88,7 +88,7 @@ int runCreate(const std::string& device, bool coordination, const Console& conso
     if (coordination) return console.fail(noCoordination());
     const Status created = Device::create(device);
     if (!created) return console.fail(unusable(created.error()));
-    console.out << device << " is an empty device\n";
+    console.out << printable(device) << " is an empty device\n";
     return kExitDone;
 }
 
@@ -132,7 +132,7 @@ int runReset(const std::string& device, const Console& console) {
     if (!plugIn) return console.fail(plugIn.error());
     (*plugIn)->client().clearSyncData();
     if (const auto error = (*opened)->databaseFailure()) return console.fail(unusable(*error));
-    console.out << device << " has forgotten what it kept for syncing\n";
+    console.out << printable(device) << " has forgotten what it kept for syncing\n";
     return kExitDone;
 }
 

@@ -39,7 +39,8 @@ int runPackageMake(const std::string& folder, const std::string& package, bool a
     SystemPropertyLists codec;
     const Result<PackageInfo> info = writePackage(folder, package, codec);
     if (!info) return console.fail(info.error());
-    console.out << (asJson ? jsonText(*info) + "\n" : package + ": " + packageText(*info));
+    console.out << (asJson ? jsonText(*info) + "\n"
+                           : printable(package) + ": " + packageText(*info));
     return kExitDone;
 }
 

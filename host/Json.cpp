@@ -60,7 +60,7 @@ std::string jsonText(const SyncEvent& event) {
 
 std::string jsonText(const SyncSummary& summary, JsonLayout layout) {
     Json object;
-    if (layout == JsonLayout::SummaryLine) object["event"] = "summary";
+    if (layout == JsonLayout::EventLine) object["event"] = "summary";
     object["requested"] = summary.requested;
     object["installed"] = summary.installed;
     object["updated"] = summary.updated;
@@ -69,22 +69,25 @@ std::string jsonText(const SyncSummary& summary, JsonLayout layout) {
     object["skipped"] = skips(summary.skipped);
     object["bytes"] = summary.bytes;
     object["seconds"] = summary.seconds;
-    return layout == JsonLayout::SummaryLine ? dumped(object) : indented(object);
+    return layout == JsonLayout::EventLine ? dumped(object) : indented(object);
 }
 
-std::string jsonText(const SyncPlan& plan, const SpaceCheck& space) {
-    const Json object = {{"install", identifiers(plan.install)},
-                         {"update", updates(plan.update)},
-                         {"remove", plan.remove},
-                         {"skipped", skips(plan.skipped)},
-                         {"failed", failures(plan.failed)},
-                         {"bytes", plan.bytes()},
-                         {"needed", space.needed},
-                         {"free", space.free},
-                         {"reclaimed", space.reclaimed},
-                         {"missing", space.missing()},
-                         {"fits", space.fits()}};
-    return indented(object);
+std::string jsonText(const SyncPlan& plan, const SpaceCheck& space, JsonLayout layout) {
+    Json object;
+    if (layout == JsonLayout::EventLine) object["event"] = "plan";
+    object["install"] = identifiers(plan.install);
+    object["update"] = updates(plan.update);
+    object["remove"] = plan.remove;
+    object["skipped"] = skips(plan.skipped);
+    object["failed"] = failures(plan.failed);
+    object["notes"] = plan.notes;
+    object["bytes"] = plan.bytes();
+    object["needed"] = space.needed;
+    object["free"] = space.free;
+    object["reclaimed"] = space.reclaimed;
+    object["missing"] = space.missing();
+    object["fits"] = space.fits();
+    return layout == JsonLayout::EventLine ? dumped(object) : indented(object);
 }
 
 }  // namespace appsync

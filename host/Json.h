@@ -8,14 +8,15 @@
 namespace appsync {
 
 enum class JsonLayout {
-    Indented,     // for one object of a command
-    SummaryLine,  // on one line, marked as the event "summary"
+    Indented,   // for one object of a command
+    EventLine,  // on one line, marked as the event "summary" or "plan"
 };
 
 // One JSON text each, without a line end. Bytes that are not UTF-8 become U+FFFD.
 
 [[nodiscard]] std::string jsonText(const SyncEvent& event);
 [[nodiscard]] std::string jsonText(const SyncSummary& summary, JsonLayout layout);
-[[nodiscard]] std::string jsonText(const SyncPlan& plan, const SpaceCheck& space);
+[[nodiscard]] std::string jsonText(const SyncPlan& plan, const SpaceCheck& space,
+                                   JsonLayout layout);
 
 }  // namespace appsync

@@ -43,10 +43,6 @@ Result<std::vector<std::string>> packageFiles(const std::string& folder) {
     return names;
 }
 
-std::uint64_t bytesOnDevice(const PackageInfo& info) {
-    return info.unpackedBytes + info.entryCount * kBlockBytes;  // each file fills its last block
-}
-
 LibraryPackage packageOf(const PackageInfo& info, std::string file) {
     return {info.identifier, info.version,     info.displayName,
             std::move(file), info.packedBytes, bytesOnDevice(info)};
@@ -81,6 +77,10 @@ void readIconOrder(Library& library, PropertyListSerialization& propertyLists) {
 }
 
 }  // namespace
+
+std::uint64_t bytesOnDevice(const PackageInfo& info) {
+    return info.unpackedBytes + info.entryCount * kBlockBytes;  // each file fills its last block
+}
 
 Result<Library> readLibrary(const std::string& folder, PropertyListSerialization& propertyLists) {
     const Result<std::vector<std::string>> names = packageFiles(folder);

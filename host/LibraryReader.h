@@ -1,5 +1,6 @@
 #pragma once
 
+#include <cstdint>
 #include <string>
 #include <string_view>
 
@@ -9,6 +10,7 @@
 namespace appsync {
 
 class PropertyListSerialization;
+struct PackageInfo;
 
 /// The name of a library's icon layout.
 inline constexpr std::string_view kIconOrderFile = "IconOrder.plist";
@@ -17,5 +19,8 @@ inline constexpr std::string_view kIconOrderFile = "IconOrder.plist";
 /// layout that cannot be used become faults. An error only when the folder itself cannot be read.
 [[nodiscard]] Result<Library> readLibrary(const std::string& folder,
                                           PropertyListSerialization& propertyLists);
+
+/// Bytes that the application of a package takes on a device, unpacked.
+[[nodiscard]] std::uint64_t bytesOnDevice(const PackageInfo& info);
 
 }  // namespace appsync

@@ -62,8 +62,10 @@ void showLine(const std::string& text, const LogArguments& arguments, const Cons
     }
     const auto category = line.find("category");
     const std::string number = category != line.end() ? category->dump() : "-";
-    console.out << textAt(line, "time") << ' ' << fitted(textAt(line, "level"), 7) << ' '
-                << fitted(number, 2) << ' ' << printable(textAt(line, "message")) << '\n';
+    console.out << printable(textAt(line, "time")) << ' '
+                << fitted(printable(textAt(line, "level")), 7) << ' '
+                << fitted(printable(number), 2) << ' ' << printable(textAt(line, "message"))
+                << '\n';
 }
 
 // Shows the whole lines that the file has from where the stream stands.

@@ -28,12 +28,13 @@ std::string stateText(const ApplicationRecord& record) {
     return "placeholder, " + std::to_string(percent) + " %";
 }
 
-std::string applicationsTable(const std::vector<ApplicationRecord>& records) {
+std::string applicationsTable(const std::vector<ApplicationRecord>& records, bool isForTerminal) {
     Table table({"IDENTIFIER", "VERSION", "NAME", "STATE", "TYPE", "SIZE"});
     for (const ApplicationRecord& record : records) {
         table.add({record.identifier, record.version.value_or("-"), record.name.value_or("-"),
                    stateText(record), record.type, formatBytes(record.bytes)});
     }
+    if (isForTerminal) table.limit({40, 16, 24});  // a program gets all of it
     return records.empty() ? "No applications.\n" : table.text();
 }
 
@@ -110,7 +111,8 @@ int runApps(const std::string& device, bool asJson, const Console& console) {
     return lookAt(device, console, [&](Device& opened) -> Status {
         const Result<std::vector<ApplicationRecord>> records = opened.applications();
         if (!records) return unusable(records.error());
-        console.out << (asJson ? jsonText(*records) + "\n" : applicationsTable(*records));
+        console.out << (asJson ? jsonText(*records) + "\n"
+                               : applicationsTable(*records, console.isTerminal));
         return {};
     });
 }

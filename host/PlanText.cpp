@@ -1,5 +1,7 @@
 #include "host/PlanText.h"
 
+#include <algorithm>
+
 #include "host/Text.h"
 
 namespace appsync {
@@ -15,6 +17,12 @@ std::string updateLine(const PlannedInstall& each) {
            printable(each.newVersion) + " (" + formatBytes(each.bytes) + ")\n";
 }
 
+bool isInStep(const SyncPlan& plan) {
+    return plan.failed.empty() &&
+           std::none_of(plan.skipped.begin(), plan.skipped.end(),
+                        [](const PlannedSkip& skip) { return skip.isUnmet; });
+}
+
 }  // namespace
 
 std::string planText(const SyncPlan& plan, const SpaceCheck& space) {
@@ -28,7 +36,10 @@ std::string planText(const SyncPlan& plan, const SpaceCheck& space) {
     for (const SyncFailure& each : plan.failed) {
         text += "failed   " + printable(each.identifier) + ": " + printable(each.error) + "\n";
     }
-    if (plan.empty()) return text + "Nothing to do: all is in step.\n";
+    for (const std::string& each : plan.notes) text += "note     " + printable(each) + "\n";
+    if (plan.empty()) {
+        return text + (isInStep(plan) ? "Nothing to do: all is in step.\n" : "Nothing to do.\n");
+    }
     return text + counted(plan.install.size() + plan.update.size(), "package") + " to send, " +
            formatBytes(plan.bytes()) + "; needed " + formatBytes(space.needed) + ", free " +
            formatBytes(space.free) + (space.fits() ? ": it fits\n" : ": it does not fit\n");

@@ -12,14 +12,18 @@
 #include "host/HostFile.h"
 #include "host/Problem.h"
 #include "host/SessionWatch.h"
+#include "platform/Notifications.h"
 #include "system/JsonLogFacility.h"
 
 namespace appsync {
 namespace {
 
+// Says that the daemon has started up.
+constexpr std::string_view kStartupNotification = "com.korvu.trd.TRStartupCompleteNotification";
+
 Platform watched(const Platform& platform, SessionWatch& watch) {
     return {platform.host,          platform.log,           watch.registry(),
-            platform.installer,     watch.coordination(),   platform.policy,
+            platform.installer,     watch.coordination(),   watch.policy(),
             platform.backup,        watch.homeScreen(),     platform.icons,
             platform.transactions,  platform.queues,        platform.files,
             platform.propertyLists, platform.notifications, platform.notificationCenter};
@@ -28,7 +32,12 @@ Platform watched(const Platform& platform, SessionWatch& watch) {
 }  // namespace
 
 PlugIn::PlugIn() = default;
-PlugIn::~PlugIn() = default;
+
+// The device may be in the middle of telling the client something.
+PlugIn::~PlugIn() {
+    if (watch_ != nullptr) watch_->closeCoordination();
+}
+
 
 Status PlugIn::openLog(Device& device) {
     const std::string path = device.logPath();
@@ -53,9 +62,9 @@ Result<std::unique_ptr<PlugIn>> PlugIn::load(Device& device, SyncEvents& events,
     const Status status = plugIn->openLog(device);
     if (!status) return status.error();
     const Platform platform = device.platform(plugIn->daemon_, *plugIn->log_);
-    plugIn->watch_ = std::make_unique<SessionWatch>(device, platform.registry, platform.homeScreen,
-                                                    events, facts);
+    plugIn->watch_ = std::make_unique<SessionWatch>(device, platform, events, facts);
     plugIn->client_ = AppsClient::create(watched(platform, *plugIn->watch_));
+    platform.notificationCenter.post(kStartupNotification);
     return plugIn;
 }
 

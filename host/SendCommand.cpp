@@ -4,6 +4,7 @@
 #include <memory>
 #include <optional>
 #include <string_view>
+#include <system_error>
 #include <utility>
 
 #include "client/Paths.h"
@@ -13,6 +14,7 @@
 #include "host/Commands.h"
 #include "host/Console.h"
 #include "host/Interruption.h"
+#include "host/LibraryReader.h"
 #include "host/PlugIn.h"
 #include "host/Problem.h"
 #include "host/Session.h"
@@ -20,6 +22,7 @@
 #include "host/StagingArea.h"
 #include "host/StopSignals.h"
 #include "host/SyncOutcome.h"
+#include "host/Text.h"
 #include "platform/FileSystem.h"
 #include "platform/PropertyListSerialization.h"
 
@@ -72,7 +75,12 @@ class Sending {
             Device::open(arguments_.device, {DeviceAccess::Session});
         if (!device) return unusable(device.error());
         device_ = *std::move(device);
-        Status ready = removeStaleTransfers(*device_);
+        const Result<DeviceSettings> settings = device_->settings();
+        if (!settings) return unusable(settings.error());
+        if (settings->installation == PolicyAnswer::No) return refuse(forbidden());
+        Status ready = checkSpace();
+        if (!ready) return refuse(ready.error());
+        ready = removeStaleTransfers(*device_);
         if (ready) ready = isData() ? prepareData() : preparePackage();
         if (!ready) return ready.error();
         isPlanned_ = true;
@@ -82,6 +90,36 @@ class Sending {
 
   private:
     [[nodiscard]] bool isData() const { return arguments_.parts == kAssetPartApplicationData; }
+
+    static ErrorRecord forbidden() {
+        return failure(kInstallationForbidden, "allow it with appsync set DEVICE installation=yes");
+    }
+
+    // What cannot be looked at here is told by whoever uses it.
+    Status checkSpace() const {
+        std::error_code code;
+        std::uint64_t needed = std::filesystem::file_size(arguments_.file, code);
+        const Result<std::uint64_t> free = device_->freeSpace();
+        if (code || !free) return {};
+        if (!isData()) {
+            const Result<PackageReader> package =
+                PackageReader::open(arguments_.file, device_->propertyLists());
+            if (package) needed += bytesOnDevice(package->info());
+        }
+        if (needed <= *free) return {};
+        return failure(
+            "it needs " + formatBytes(needed) + ", the device has " + formatBytes(*free) + " free",
+            "free space on the device");
+    }
+
+    // Nothing is sent.
+    int refuse(const ErrorRecord& reason) {
+        SyncSummary summary;
+        summary.failed.push_back({arguments_.identifier, reason.description()});
+        summary.incomplete = true;
+        console_.fail(reason);
+        return finish(std::move(summary));
+    }
 
     void makeAsset(const std::string& version) {
         parcel_.asset = std::make_shared<SyncAsset>();
@@ -146,7 +184,7 @@ class Sending {
         if (!plugIn) return plugIn.error();
         Session session(*device_, **plugIn, events_, facts_, signals_.stopRequested());
         const SessionEnd end = session.deliver(parcel_);
-        const Result<SessionAftermath> aftermath = aftermathOf(*device_, end);
+        const Result<SessionAftermath> aftermath = aftermathOf(*device_, end, facts_);
         if (!aftermath) {
             finish(summarizeFailed(plan_, facts_, aftermath.error()));
             return aftermath.error();

@@ -70,4 +70,15 @@ std::uint64_t SessionFacts::bytesSent() const {
     return bytesSent_;
 }
 
+void SessionFacts::policyAnswered(PolicyFeature feature, PolicyAnswer answer) {
+    const std::lock_guard guard(mutex_);
+    answers_[feature] = answer;
+}
+
+bool SessionFacts::wasForbidden(PolicyFeature feature) const {
+    const std::lock_guard guard(mutex_);
+    const auto found = answers_.find(feature);
+    return found != answers_.end() && found->second == PolicyAnswer::No;
+}
+
 }  // namespace appsync

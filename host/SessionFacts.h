@@ -8,6 +8,7 @@
 #include <string>
 #include <vector>
 
+#include "platform/DevicePolicyService.h"
 #include "platform/InstallPromises.h"
 
 namespace appsync {
@@ -21,6 +22,8 @@ class SessionFacts {
     void removed(const std::string& identifier);
     void requested(const std::string& identifier);
     void sent(std::uint64_t bytes);
+    /// The plug-in was told whether it may; its last answer is what it went by.
+    void policyAnswered(PolicyFeature feature, PolicyAnswer answer);
     /// Another client of the coordination service has the install of it in hand.
     void heldByClient(const std::string& identifier, CoordinationClient client);
 
@@ -33,6 +36,7 @@ class SessionFacts {
     /// In the order in which the device asked.
     [[nodiscard]] std::vector<std::string> requests() const;
     [[nodiscard]] std::uint64_t bytesSent() const;
+    [[nodiscard]] bool wasForbidden(PolicyFeature feature) const;
 
   private:
     mutable std::mutex mutex_;
@@ -43,6 +47,7 @@ class SessionFacts {
     std::set<std::string> removed_;
     std::vector<std::string> requests_;
     std::uint64_t bytesSent_ = 0;
+    std::map<PolicyFeature, PolicyAnswer> answers_;
 };
 
 }  // namespace appsync

@@ -101,6 +101,22 @@ class WatchedHomeScreen : public HomeScreenService {
     SessionWatch& watch_;
 };
 
+class WatchedPolicy : public DevicePolicyService {
+  public:
+    WatchedPolicy(DevicePolicyService& policy, SessionFacts& facts)
+        : policy_(policy), facts_(facts) {}
+
+    PolicyAnswer effectiveValue(PolicyFeature feature) override {
+        const PolicyAnswer answer = policy_.effectiveValue(feature);
+        facts_.policyAnswered(feature, answer);
+        return answer;
+    }
+
+  private:
+    DevicePolicyService& policy_;
+    SessionFacts& facts_;
+};
+
 }  // namespace
 
 SessionWatch::SessionWatch(Device& device, const Platform& platform, SyncEvents& events,
@@ -110,6 +126,7 @@ SessionWatch::SessionWatch(Device& device, const Platform& platform, SyncEvents&
       facts_(facts),
       registry_(std::make_unique<WatchedRegistry>(platform.registry, *this)),
       homeScreen_(std::make_unique<WatchedHomeScreen>(platform.homeScreen, *this)),
+      policy_(std::make_unique<WatchedPolicy>(platform.policy, facts)),
       gate_(std::make_shared<CallGate>()),
       coordination_(watchCoordination(platform.coordination, *this, gate_)),
       poller_([this] { poll(); }) {}

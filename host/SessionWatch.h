@@ -13,6 +13,7 @@
 #include <vector>
 
 #include "platform/AppRegistry.h"
+#include "platform/DevicePolicyService.h"
 #include "platform/HomeScreenService.h"
 #include "platform/InstallCoordinatorService.h"
 
@@ -24,10 +25,10 @@ class SessionFacts;
 class SyncEvents;
 struct Platform;
 
-/// Sees what the plug-in does with the registry and the home screen, keeps it as facts, and reports
-/// it as events; how far installs have come it asks the device now and then. Of an install through
-/// the coordination service it sees the delivery, what the device tells of it and the end. Hands
-/// everything on to the device's own services.
+/// Sees what the plug-in does with the registry and the home screen, and what policy tells it,
+/// keeps it as facts, and reports it as events; how far installs have come it asks the device now
+/// and then. Of an install through the coordination service it sees the delivery, what the device
+/// tells of it and the end. Hands everything on to the device's own services.
 ///
 /// Callable on any thread. Must outlive the client; device, events and facts must outlive it.
 class SessionWatch {
@@ -40,6 +41,7 @@ class SessionWatch {
     /// What the client gets in place of the device's own.
     [[nodiscard]] AppRegistry& registry() { return *registry_; }
     [[nodiscard]] HomeScreenService& homeScreen() { return *homeScreen_; }
+    [[nodiscard]] DevicePolicyService& policy() { return *policy_; }
     [[nodiscard]] InstallCoordinatorService& coordination() { return *coordination_; }
 
     /// Nothing more of the coordination service reaches the client or this object; returns when
@@ -97,6 +99,7 @@ class SessionWatch {
     SessionFacts& facts_;
     std::unique_ptr<AppRegistry> registry_;
     std::unique_ptr<HomeScreenService> homeScreen_;
+    std::unique_ptr<DevicePolicyService> policy_;
     const std::shared_ptr<CallGate> gate_;
     std::unique_ptr<InstallCoordinatorService> coordination_;
     std::atomic<bool> removing_ = false;

@@ -136,32 +136,35 @@ class SyncRun {
         if (!free) return unusable(free.error());
         const Result<DeviceSettings> settings = device_->settings();
         if (!settings) return unusable(settings.error());
-        const bool removes = settings->removal != PolicyAnswer::No;
-        space_ = {plan_.needed(), *free, removes ? plan_.reclaimed : 0};
+        allowed_ = allowedBy(*settings, plan_);
+        space_ = {allowed_.needed(), *free, allowed_.reclaimed};
         return {};
     }
 
     int showPlan() const {
         if (arguments_.display == SyncDisplayKind::Text) {
-            console_.out << planText(plan_, space_) << std::flush;
+            console_.out << planText(allowed_, space_) << std::flush;
         } else {
-            console_.out << jsonText(plan_, space_) << '\n' << std::flush;
+            const JsonLayout layout = arguments_.display == SyncDisplayKind::Json
+                                          ? JsonLayout::Indented
+                                          : JsonLayout::EventLine;
+            console_.out << jsonText(allowed_, space_, layout) << '\n' << std::flush;
         }
         if (!space_.fits()) console_.complain(space_.description());
-        return space_.fits() && plan_.failed.empty() ? kExitDone : kExitSomethingFailed;
+        return space_.fits() && allowed_.failed.empty() ? kExitDone : kExitSomethingFailed;
     }
 
     // Nothing of the plan is done, for one reason.
     int refuse(const std::string& reason) {
         SyncSummary summary;
-        summary.failed = plan_.failed;
-        summary.skipped = plan_.skipped;
-        for (const auto* installs : {&plan_.install, &plan_.update}) {
+        summary.failed = allowed_.failed;
+        summary.skipped = allowed_.skipped;
+        for (const auto* installs : {&allowed_.install, &allowed_.update}) {
             for (const PlannedInstall& each : *installs) {
                 summary.failed.push_back({each.identifier, reason});
             }
         }
-        for (const std::string& identifier : plan_.remove) {
+        for (const std::string& identifier : allowed_.remove) {
             summary.failed.push_back({identifier, "nothing is done: " + reason});
         }
         console_.complain(reason);
@@ -184,7 +187,7 @@ class SyncRun {
         Session session(*device_, **plugIn, events_, facts_, signals_->stopRequested());
         const SessionEnd end = session.sync(
             [this](const std::string& identifier) { return packageFile(library_, identifier); });
-        Result<SessionAftermath> aftermath = aftermathOf(*device_, end);
+        Result<SessionAftermath> aftermath = aftermathOf(*device_, end, facts_);
         if (aftermath) return finish(summarize(plan_, facts_, *aftermath));
         finish(summarizeFailed(plan_, facts_, aftermath.error()));
         return aftermath.error();
@@ -221,6 +224,7 @@ class SyncRun {
     std::unique_ptr<Device> device_;
     Library library_;
     SyncPlan plan_;
+    SyncPlan allowed_;  // what of it policy lets happen
     SpaceCheck space_;
     bool mustNotRun_ = false;
     const Clock::time_point begin_ = Clock::now();

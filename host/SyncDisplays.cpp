@@ -14,7 +14,10 @@ namespace {
 
 constexpr std::size_t kPhaseWidth = 9;
 constexpr std::size_t kNameWidth = 28;
+constexpr std::size_t kShortNameWidth = 16;  // what a name is cut to before its phase goes
+constexpr std::size_t kTinyNameWidth = 4;    // what it is cut to before it goes altogether
 constexpr std::size_t kBarWidth = 20;
+constexpr std::size_t kShortBarWidth = 8;
 
 std::string percentText(const SyncEvent& event) {
     return std::to_string(percentOf(event.done, event.total)) + " %";
@@ -77,7 +80,7 @@ class BarDisplay : public ConsoleDisplay {
         erase();
         if (event.kind == SyncEventKind::Ended) {
             if (drawn != bars_.end()) bars_.erase(drawn);
-            console_.out << eventBar(event, console_.width - 1) << '\n';
+            console_.out << eventBar(event, barWidth()) << '\n';
         } else if (drawn != bars_.end()) {
             *drawn = event;
         } else {
@@ -99,6 +102,11 @@ class BarDisplay : public ConsoleDisplay {
     }
 
   private:
+    // Some terminals go on to the next line once the last column is filled.
+    [[nodiscard]] std::size_t barWidth() const {
+        return console_.width > 0 ? console_.width - 1 : 0;
+    }
+
     void erase() {
         if (drawnLines_ > 0) console_.out << "\x1b[" << drawnLines_ << "A\x1b[J";
         drawnLines_ = 0;
@@ -108,7 +116,7 @@ class BarDisplay : public ConsoleDisplay {
         constexpr std::size_t kMostBars = 12;  // more could be taller than the window
         drawnLines_ = std::min(bars_.size(), kMostBars);
         for (std::size_t index = 0; index < drawnLines_; ++index) {
-            console_.out << eventBar(bars_[index], console_.width - 1) << '\n';
+            console_.out << eventBar(bars_[index], barWidth()) << '\n';
         }
         console_.out << std::flush;
     }
@@ -133,7 +141,7 @@ class JsonLinesDisplay : public ConsoleDisplay {
         console_.out << jsonText(event) << '\n' << std::flush;
     }
     void finish(const SyncSummary& summary) override {
-        console_.out << jsonText(summary, JsonLayout::SummaryLine) << '\n' << std::flush;
+        console_.out << jsonText(summary, JsonLayout::EventLine) << '\n' << std::flush;
     }
 };
 
@@ -154,6 +162,42 @@ std::string amountLine(const SyncSummary& summary) {
     return formatBytes(summary.bytes) + " sent in " + seconds.data() + " s\n";
 }
 
+std::string bar(unsigned percent, std::size_t width) {
+    const std::size_t filled = percent * width / 100;
+    std::array<char, 8> number{};
+    std::snprintf(number.data(), number.size(), " %3u %%", percent);
+    return "[" + std::string(filled, '#') + std::string(width - filled, '.') + "]" + number.data();
+}
+
+std::string cut(const std::string& text, std::size_t width) {
+    return displayWidth(text) > width ? fitted(text, width) : text;
+}
+
+// When the next try comes is what must not be lost; which application runs, the line says already
+// where it is the one that waits.
+std::vector<std::string> waitStates(const SyncEvent& event) {
+    std::string what = printable(event.text);
+    const std::string own = printable(event.identifier) + " ";
+    if (what.starts_with(own)) what.erase(0, own.size());
+    if (!event.nextTry) return {"waiting: " + what, "waiting"};
+    const std::string time = formatClock(*event.nextTry);
+    return {"waiting: " + what + "; next try at " + time, what + "; next try " + time,
+            "next try " + time, time};
+}
+
+// What may stand behind the name, from the longest text to the shortest.
+std::vector<std::string> barStates(const SyncEvent& event, std::size_t width) {
+    if (event.state == SyncState::Waiting) return waitStates(event);
+    if (event.state == SyncState::Failed) {
+        constexpr std::size_t kBefore = kPhaseWidth + kNameWidth + 1;
+        constexpr std::size_t kFewest = 12;
+        const std::size_t room = width > kBefore + kFewest ? width - kBefore : kFewest;
+        return {cut(printable(stateText(event)), room), "failed"};
+    }
+    const unsigned percent = percentOf(event.done, event.total);
+    return {bar(percent, kBarWidth), bar(percent, kShortBarWidth), std::to_string(percent) + " %"};
+}
+
 }  // namespace
 
 std::string eventLine(const SyncEvent& event) {
@@ -162,19 +206,20 @@ std::string eventLine(const SyncEvent& event) {
 }
 
 std::string eventBar(const SyncEvent& event, std::size_t width) {
-    std::string line = fitted(nameOf(event.phase), kPhaseWidth) +
-                       fitted(printable(event.identifier), kNameWidth) + " ";
-    if (event.state == SyncState::Waiting || event.state == SyncState::Failed) {
-        line += printable(stateText(event));
-    } else {
-        const unsigned percent = percentOf(event.done, event.total);
-        const std::size_t filled = percent * kBarWidth / 100;
-        std::array<char, 8> number{};
-        std::snprintf(number.data(), number.size(), " %3u %%", percent);
-        line += "[" + std::string(filled, '#') + std::string(kBarWidth - filled, '.') + "]" +
-                number.data();
+    const std::string phase = fitted(nameOf(event.phase), kPhaseWidth);
+    const std::string name = printable(event.identifier);
+    const std::vector<std::string> states = barStates(event, width);
+    for (const std::string& state : states) {
+        const std::size_t taken = displayWidth(state) + 1;
+        if (taken + kPhaseWidth + kShortNameWidth <= width) {
+            const std::size_t room = std::min(width - taken - kPhaseWidth, kNameWidth);
+            return phase + fitted(name, room) + " " + state;
+        }
     }
-    return displayWidth(line) > width ? fitted(line, width) : line;
+    const std::string& shortest = states.back();
+    const std::size_t taken = displayWidth(shortest) + 1;
+    if (taken + kTinyNameWidth > width) return cut(shortest, width);
+    return fitted(name, std::min(width - taken, kNameWidth)) + " " + shortest;
 }
 
 std::string summaryText(const SyncSummary& summary) {

@@ -59,9 +59,12 @@ class Summarizer {
             fail(planned.identifier, "version " + found->second + " was installed instead of " +
                                          planned.newVersion +
                                          ": the package has changed meanwhile");
+        } else if (facts_.wasInstalled(planned.identifier)) {
+            fail(planned.identifier,
+                 "it was installed, and uninstalled on the device meanwhile: sync again to bring "
+                 "it back");
         } else {
-            undone(planned.identifier, aftermath_.installationAllowed,
-                   "device policy does not allow installing applications",
+            undone(planned.identifier, aftermath_.installationAllowed, kInstallationForbidden,
                    "the device did not ask for its package: appsync log tells why");
         }
     }
@@ -71,9 +74,11 @@ class Summarizer {
                             (!present_.contains(identifier) || installs_.contains(identifier));
         if (isGone) {
             summary_.removed.push_back(identifier);
+        } else if (!present_.contains(identifier)) {
+            summary_.skipped.push_back(
+                {identifier, "it was uninstalled on the device meanwhile", false});
         } else {
-            undone(identifier, aftermath_.removalAllowed,
-                   "device policy does not allow removing applications", "it is still there");
+            undone(identifier, aftermath_.removalAllowed, kRemovalForbidden, "it is still there");
         }
     }
 
@@ -87,12 +92,12 @@ class Summarizer {
         }
     }
 
-    void undone(const std::string& identifier, bool isAllowed, const std::string& whyForbidden,
+    void undone(const std::string& identifier, bool isAllowed, std::string_view whyForbidden,
                 const std::string& whyElse) {
         if (const auto cause = facts_.firstFailure(identifier)) return fail(identifier, *cause);
         if (aftermath_.failure) return fail(identifier, *aftermath_.failure);
         if (!isAllowed) {
-            summary_.skipped.push_back({identifier, whyForbidden, true});
+            summary_.skipped.push_back({identifier, std::string(whyForbidden), true});
             return;
         }
         fail(identifier, aftermath_.isInterrupted ? interruption() : whyElse);
@@ -113,9 +118,23 @@ class Summarizer {
     SyncSummary summary_;
 };
 
+SessionAftermath policyOf(const SessionFacts& facts) {
+    SessionAftermath aftermath;
+    aftermath.installationAllowed = !facts.wasForbidden(PolicyFeature::AppInstallationAllowed);
+    aftermath.removalAllowed = !facts.wasForbidden(PolicyFeature::AppRemovalAllowed);
+    return aftermath;
+}
+
 // What the device holds if everything stands that was seen to be installed.
 SessionAftermath assumedAftermath(const SyncPlan& plan, const SessionFacts& facts) {
-    SessionAftermath aftermath;
+    SessionAftermath aftermath = policyOf(facts);
+    for (const std::string& identifier : plan.remove) {
+        if (facts.wasRemoved(identifier)) continue;
+        ApplicationRecord record;
+        record.identifier = identifier;
+        record.isPlaceholder = true;  // something of it
+        aftermath.present.push_back(std::move(record));
+    }
     for (const auto* installs : {&plan.install, &plan.update}) {
         for (const PlannedInstall& each : *installs) {
             if (!facts.wasInstalled(each.identifier)) continue;
@@ -130,15 +149,12 @@ SessionAftermath assumedAftermath(const SyncPlan& plan, const SessionFacts& fact
 
 }  // namespace
 
-Result<SessionAftermath> aftermathOf(Device& device, const SessionEnd& end) {
+Result<SessionAftermath> aftermathOf(Device& device, const SessionEnd& end,
+                                     const SessionFacts& facts) {
     Result<std::vector<ApplicationRecord>> present = device.applications();
     if (!present) return unusable(present.error());
-    const Result<DeviceSettings> settings = device.settings();
-    if (!settings) return unusable(settings.error());
-    SessionAftermath aftermath;
+    SessionAftermath aftermath = policyOf(facts);
     aftermath.present = *std::move(present);
-    aftermath.installationAllowed = settings->installation != PolicyAnswer::No;
-    aftermath.removalAllowed = settings->removal != PolicyAnswer::No;
     aftermath.isInterrupted = end.isInterrupted;
     std::optional<ErrorRecord> failure = device.databaseFailure();
     if (!failure) failure = end.error;

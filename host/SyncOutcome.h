@@ -19,6 +19,7 @@ struct SyncPlan;
 struct SessionAftermath {
     /// Everything that the device holds now.
     std::vector<ApplicationRecord> present;
+    /// What the plug-in was told when it decided; policy may have changed since.
     bool installationAllowed = true;
     bool removalAllowed = true;
     bool isInterrupted = false;
@@ -27,7 +28,8 @@ struct SessionAftermath {
 };
 
 /// Asks the device what is known.
-[[nodiscard]] Result<SessionAftermath> aftermathOf(Device& device, const SessionEnd& end);
+[[nodiscard]] Result<SessionAftermath> aftermathOf(Device& device, const SessionEnd& end,
+                                                   const SessionFacts& facts);
 
 /// Holds the plan against what the device holds after the session: what was asked for and did not
 /// happen is failed, with its first cause, or skipped where policy forbids it. The time is

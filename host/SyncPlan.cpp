@@ -70,6 +70,7 @@ class Planner {
         : library_(library), options_(options), present_(byIdentifier(present)) {}
 
     SyncPlan make() {
+        plan_.notes = library_.notes;
         for (const LibraryFault& fault : library_.faults) {
             plan_.failed.push_back({fault.fileName, fault.error});
         }
@@ -145,6 +146,7 @@ class StagedPlanner {
         : library_(library), present_(byIdentifier(present)) {}
 
     SyncPlan make(const PropertyList& todoList) {
+        plan_.notes = library_.notes;
         std::size_t number = 0;
         for (const PropertyList& entry : todoList.elements()) add(entry, ++number);
         return std::move(plan_);
@@ -237,6 +239,26 @@ std::string SpaceCheck::description() const {
 SyncPlan makePlan(const Library& library, const std::vector<ApplicationRecord>& present,
                   const PlanOptions& options) {
     return Planner(library, present, options).make();
+}
+
+SyncPlan allowedBy(const DeviceSettings& settings, SyncPlan plan) {
+    if (settings.removal == PolicyAnswer::No) {
+        for (std::string& identifier : plan.remove) {
+            plan.skipped.push_back({std::move(identifier), std::string(kRemovalForbidden), true});
+        }
+        plan.remove.clear();
+        plan.reclaimed = 0;
+    }
+    if (settings.installation == PolicyAnswer::No) {
+        for (auto* installs : {&plan.install, &plan.update}) {
+            for (PlannedInstall& each : *installs) {
+                plan.skipped.push_back(
+                    {std::move(each.identifier), std::string(kInstallationForbidden), true});
+            }
+            installs->clear();
+        }
+    }
+    return plan;
 }
 
 SyncPlan makeStagedPlan(const PropertyList& todoList, const Library& library,

@@ -2,11 +2,13 @@
 
 #include <cstdint>
 #include <string>
+#include <string_view>
 #include <vector>
 
 namespace appsync {
 
 struct ApplicationRecord;
+struct DeviceSettings;
 struct Library;
 class PropertyList;
 
@@ -27,6 +29,12 @@ struct PlannedInstall {
     std::uint64_t bytes = 0;          // that travel
     std::uint64_t unpackedBytes = 0;  // that it takes when installed
 };
+
+/// Why policy keeps something from being done.
+inline constexpr std::string_view kInstallationForbidden =
+    "device policy does not allow installing applications";
+inline constexpr std::string_view kRemovalForbidden =
+    "device policy does not allow removing applications";
 
 /// Something that is left alone.
 struct PlannedSkip {
@@ -50,6 +58,8 @@ struct SyncPlan {
     std::vector<PlannedSkip> skipped;
     /// What is asked for but cannot even be tried.
     std::vector<SyncFailure> failed;
+    /// For people: packages of the library that others have hidden.
+    std::vector<std::string> notes;
     /// Bytes on the device that the removals give back.
     std::uint64_t reclaimed = 0;
 
@@ -81,6 +91,9 @@ struct SpaceCheck {
 [[nodiscard]] SyncPlan makePlan(const Library& library,
                                 const std::vector<ApplicationRecord>& present,
                                 const PlanOptions& options);
+
+/// What of the plan the device's policy lets happen; the rest is skipped.
+[[nodiscard]] SyncPlan allowedBy(const DeviceSettings& settings, SyncPlan plan);
 
 /// The plan that a todo list asks for, whatever stands in it. Entries with another operation than
 /// "install" and "remove" ask for nothing.

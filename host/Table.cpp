@@ -19,6 +19,9 @@ std::string Table::text() const {
             widths[column] = std::max(widths[column], displayWidth(row[column]));
         }
     }
+    for (std::size_t column = 0; column < std::min(widths.size(), limits_.size()); ++column) {
+        widths[column] = std::min(widths[column], limits_[column]);
+    }
     std::string result;
     for (const auto& row : rows_) {
         for (std::size_t column = 0; column + 1 < widths.size(); ++column) {

@@ -1,6 +1,8 @@
 #pragma once
 
+#include <cstddef>
 #include <string>
+#include <utility>
 #include <vector>
 
 namespace appsync {
@@ -13,11 +15,15 @@ class Table {
     /// One row, as many cells as the heading has; what no terminal should get is replaced.
     void add(std::vector<std::string> cells);
 
+    /// The most characters that the first columns may take; a longer cell is cut.
+    void limit(std::vector<std::size_t> widths) { limits_ = std::move(widths); }
+
     /// The rows, heading first, each with a line end.
     [[nodiscard]] std::string text() const;
 
   private:
     std::vector<std::vector<std::string>> rows_;
+    std::vector<std::size_t> limits_;
 };
 
 }  // namespace appsync

@@ -24,17 +24,42 @@ std::size_t sequenceLength(unsigned char lead) {
     return 0;
 }
 
-// The length of the well-formed, printable character at the start of the text; 0 when there is
-// none.
-std::size_t printableLength(std::string_view text) {
-    const auto lead = static_cast<unsigned char>(text.front());
-    const std::size_t length = sequenceLength(lead);
+// The code point of a sequence whose bytes fit together.
+char32_t decoded(std::string_view sequence) {
+    const auto lead = static_cast<unsigned char>(sequence.front());
+    if (sequence.size() == 1) return lead;
+    char32_t point = lead & (0xFFU >> (sequence.size() + 1));
+    for (const char byte : sequence.substr(1)) {
+        point = (point << 6U) | (static_cast<unsigned char>(byte) & 0x3FU);
+    }
+    return point;
+}
+
+struct Range {
+    char32_t first;
+    char32_t last;
+};
+
+// Control characters, and what reorders, hides or breaks a line of text.
+constexpr std::array kUnprintable = {
+    Range{0x00, 0x1F},     Range{0x7F, 0x9F},     Range{0x061C, 0x061C}, Range{0x200B, 0x200B},
+    Range{0x200E, 0x200F}, Range{0x2028, 0x202E}, Range{0x2060, 0x206F}, Range{0xD800, 0xDFFF},
+    Range{0xFEFF, 0xFEFF}, Range{0xFFF9, 0xFFFB}};
+
+bool isPrintable(char32_t point, std::size_t length) {
+    constexpr std::array<char32_t, 5> kSmallest = {0, 0, 0x80, 0x800, 0x10000};
+    if (point < kSmallest.at(length) || point > 0x10FFFF) return false;
+    return std::none_of(kUnprintable.begin(), kUnprintable.end(), [point](const Range& range) {
+        return point >= range.first && point <= range.last;
+    });
+}
+
+// The length of the well-formed character at the start of the text; 0 when there is none.
+std::size_t characterLength(std::string_view text) {
+    const std::size_t length = sequenceLength(static_cast<unsigned char>(text.front()));
     if (length == 0 || length > text.size()) return 0;
     const std::string_view tail = text.substr(1, length - 1);
-    if (!std::all_of(tail.begin(), tail.end(), isContinuation)) return 0;
-    if (length == 1) return lead >= 0x20 && lead != 0x7F ? 1 : 0;
-    const bool isControl = lead == 0xC2 && static_cast<unsigned char>(text[1]) < 0xA0;
-    return isControl ? 0 : length;
+    return std::all_of(tail.begin(), tail.end(), isContinuation) ? length : 0;
 }
 
 }  // namespace
@@ -68,11 +93,11 @@ std::string printable(std::string_view text) {
     std::string result;
     result.reserve(text.size());
     while (!text.empty()) {
-        const std::size_t length = printableLength(text);
-        if (length == 0) {
-            result += '?';
-        } else {
+        const std::size_t length = characterLength(text);
+        if (length != 0 && isPrintable(decoded(text.substr(0, length)), length)) {
             result += text.substr(0, length);
+        } else {
+            result += '?';
         }
         text.remove_prefix(std::max<std::size_t>(length, 1));
     }

@@ -17,8 +17,9 @@ namespace appsync {
 /// The time of day in the machine's time zone: "12:00:00".
 [[nodiscard]] std::string formatClock(std::chrono::system_clock::time_point time);
 
-/// The text with everything that a terminal could take for a command (control characters, broken
-/// UTF-8) replaced by "?".
+/// The text with everything that a terminal could take for a command or that could make it show
+/// something else (control characters, those that change the direction of text or cannot be seen,
+/// broken UTF-8) replaced by "?".
 [[nodiscard]] std::string printable(std::string_view text);
 
 /// The first `width` characters of the text, the last of them "~" when something is cut off, filled

@@ -326,3 +326,50 @@ def test_log_folder_that_is_gone_is_made_again(device, library):
     shutil.rmtree(os.path.join(device.path, "log"), ignore_errors=True)
     device.sync(library)
     assert os.path.exists(os.path.join(device.path, "log", "system.log"))
+
+
+LOOKING = (["apps"], ["why", "com.example.app00"], ["inventory"], ["history"])
+
+
+def in_own_mounts(script):
+    """Runs a shell script that may mount what only it sees."""
+    if subprocess.run(["unshare", "-m", "true"], capture_output=True).returncode != 0:
+        pytest.skip("this machine allows no mount namespace")
+    return subprocess.run(["unshare", "-m", "sh", "-c", script], capture_output=True, text=True, timeout=60)
+
+
+def look_at(appsync, path):
+    lines = ["%s %s %s %s" % (appsync.program, look[0], path, " ".join(look[1:])) for look in LOOKING]
+    return "; ".join(line + " >/dev/null; echo $?" for line in lines)
+
+
+def test_looking_on_a_full_disk_says_that_it_is_full(appsync, tmp_path):
+    script = ("mount -t tmpfs -o size=1m tmpfs {0} && {1} create {0}/d >/dev/null && "
+              "{{ cat /dev/zero >{0}/filler; {2}; }} 2>&1").format(tmp_path, appsync.program, look_at(appsync, "%s/d" % tmp_path))
+    done = in_own_mounts(script)
+    told = [line for line in done.stdout.splitlines() if line.startswith("appsync: ")]
+    assert len(told) == len(LOOKING), done.stdout
+    for line in told:
+        assert "the disk that it is on is full" in line and "%s/d/device.db" % tmp_path in line
+    assert done.stdout.splitlines().count("3") == len(LOOKING)
+
+
+def test_looking_at_a_read_only_device_says_so(appsync, device):
+    script = "mount --bind {0} {0} && mount -o remount,ro,bind {0} && {{ {1}; }} 2>&1".format(
+        device.path, look_at(appsync, device.path))
+    done = in_own_mounts(script)
+    told = [line for line in done.stdout.splitlines() if line.startswith("appsync: ")]
+    assert len(told) == len(LOOKING), done.stdout
+    for line in told:
+        assert "cannot be written" in line and "use a copy" in line
+    assert done.stdout.splitlines().count("3") == len(LOOKING)
+
+
+@pytest.mark.parametrize("table", ["applications", "placeholders", "settings", "uninstalled"])
+def test_a_database_that_lacks_a_table_is_damaged(appsync, device, library, table):
+    with sqlite3.connect(os.path.join(device.path, "device.db")) as database:
+        database.execute("DROP TABLE " + table)
+    database.close()
+    done = appsync("sync", device.path, library, expect=3)
+    assert "is damaged" in done.stderr
+    assert done.stderr.count("\n") == 1

@@ -143,6 +143,31 @@ def test_a_stop_is_announced_at_once(waiting_sync):
     assert sync.returncode == 1
 
 
+def test_uninstalling_what_waits_wins_over_its_update(appsync, waiting_sync, device, library):
+    sync = waiting_sync("--json")
+    appsync("uninstall", device.path, "com.example.app00")
+    assert "com.example.app00" not in device.placeholders()
+    out, _ = sync.communicate(timeout=60)  # the next try comes after half a minute
+    assert sync.returncode == 1
+    failed = json.loads(out)["failed"]
+    assert [each["identifier"] for each in failed] == ["com.example.app00"]
+    assert "uninstalled on the device" in failed[0]["error"]
+    assert "com.example.app00" not in device.apps()
+    device.sync(library)
+    assert device.versions()["com.example.app00"] == "2.0"
+
+
+def test_policy_that_changes_meanwhile_is_no_reason(appsync, waiting_sync, device):
+    sync = waiting_sync("--json")
+    appsync("set", device.path, "installation=no")
+    appsync("uninstall", device.path, "com.example.new")
+    sync.send_signal(signal.SIGINT)
+    out, _ = sync.communicate(timeout=15)
+    errors = {each["identifier"]: each["error"] for each in json.loads(out)["failed"]}
+    assert "interrupted" in errors["com.example.app00"]
+    assert json.loads(out)["skipped"] == []
+
+
 FULL = """
 import subprocess, sys, os
 program, library, where = sys.argv[1:]

@@ -159,6 +159,7 @@ TEST_F(DeviceInstallTest, installingTakesTheApplicationOffTheUninstalledList) {
     ASSERT_TRUE(succeeded(install(kAtlas)));
     ASSERT_TRUE(succeeded(device().uninstall(kAtlas)));
     ASSERT_TRUE(device().status(kAtlas)->uninstalled);
+    close();  // in the same session the uninstall would win
     ASSERT_TRUE(succeeded(install(kAtlas)));
     EXPECT_FALSE(device().status(kAtlas)->uninstalled);
 }

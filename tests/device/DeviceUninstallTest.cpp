@@ -110,6 +110,25 @@ TEST_F(DeviceUninstallTest, aPersonRemovesApplicationAndPlaceholderAtOnce) {
     EXPECT_TRUE(device().status(kAtlas)->uninstalled);
 }
 
+TEST_F(DeviceUninstallTest, anInstallThatIsUnderWayDoesNotBringItBack) {
+    ASSERT_TRUE(succeeded(install(kAtlas, "1.0")));
+    ASSERT_TRUE(succeeded(installPlaceholder(kAtlas)));
+    sql("UPDATE session SET started = started - 1000");
+    ASSERT_TRUE(succeeded(look()->uninstall(kAtlas)));
+    EXPECT_TRUE(refusedBy(install(kAtlas, "2.0"), RegistryErrorCode::Uninstalled, kAtlas));
+    EXPECT_FALSE(either(kAtlas));
+    EXPECT_TRUE(containers().empty());
+    EXPECT_EQ(number("SELECT count(*) FROM progress"), 0);
+    EXPECT_TRUE(device().status(kAtlas)->uninstalled);
+}
+
+TEST_F(DeviceUninstallTest, theNextSessionBringsItBack) {
+    ASSERT_TRUE(succeeded(install(kAtlas)));
+    ASSERT_TRUE(succeeded(device().uninstall(kAtlas)));
+    close();
+    EXPECT_TRUE(succeeded(install(kAtlas)));
+}
+
 TEST_F(DeviceUninstallTest, whatTheRegistryRemovesIsNotOnTheInstallersList) {
     ASSERT_TRUE(succeeded(install(kAtlas)));
     ASSERT_TRUE(succeeded(uninstall()));

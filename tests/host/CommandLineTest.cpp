@@ -57,7 +57,11 @@ INSTANTIATE_TEST_SUITE_P(
         WrongUsage{{"send", "device", "com.a", "file", "--parts", "2"}, "without --restore"},
         WrongUsage{{"send", "device", "com.a", "file", "--restore", "--parts", "4"}, "4"},
         WrongUsage{{"coordinator", "device", "dance"}, "dance"},
-        WrongUsage{{"plist", "convert", "file", "--to", "json"}, "json"}));
+        WrongUsage{{"plist", "convert", "file", "--to", "json"},
+                   "--to: json is none of xml, binary"},
+        WrongUsage{{"plist", "convert", "file", "--to", "0"}, "--to: 0 is none of xml, binary"},
+        WrongUsage{{"log", "device", "--level", "2"}, "2 is none of debug, info, default"},
+        WrongUsage{{"demote", "device", "com.a", "--by", "me"}, "me is none of person, system"}));
 
 class EachCommand : public CommandLine, public testing::WithParamInterface<std::string> {};
 

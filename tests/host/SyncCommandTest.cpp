@@ -1,6 +1,8 @@
 #include <filesystem>
 #include <fstream>
 
+#include "host/CommandLine.h"
+#include "host/Console.h"
 #include "host/Session.h"
 #include "platform/AppRegistry.h"
 #include "tests/host/HostFixture.h"
@@ -51,6 +53,61 @@ TEST_F(SyncCommand, WhatPolicyForbidsIsSkippedWithStatus1) {
     EXPECT_EQ(sync(), 1);
     EXPECT_THAT(out.str(), HasSubstr("policy"));
     EXPECT_THAT(applications(), IsEmpty());
+}
+
+TEST_F(SyncCommand, APlanLeavesOutWhatPolicyForbids) {
+    addPackage("com.a", "1");
+    EXPECT_EQ(run({"set", device, "installation=no"}), 0);
+    EXPECT_EQ(run({"plan", device, library}), 0);
+    EXPECT_THAT(out.str(), HasSubstr("skip     com.a: device policy does not allow installing"));
+    EXPECT_THAT(out.str(), HasSubstr("Nothing to do.\n"));
+    EXPECT_EQ(sync({"--dry-run"}), 0);
+    EXPECT_THAT(out.str(), HasSubstr("\"install\": []"));
+    EXPECT_THAT(out.str(), HasSubstr("\"needed\": 0"));
+}
+
+TEST_F(SyncCommand, ADryRunWithJsonLinesPrintsOneLine) {
+    addPackage("com.a", "1");
+    EXPECT_EQ(run({"sync", device, library, "--dry-run", "--json-lines"}), 0);
+    EXPECT_THAT(out.str(), testing::StartsWith("{\"event\":\"plan\",\"install\":[\"com.a\"]"));
+    EXPECT_EQ(out.str().find('\n'), out.str().size() - 1);
+}
+
+TEST_F(SyncCommand, APlanNamesThePackagesThatAreLeftOut) {
+    addPackage("com.a", "1");
+    std::filesystem::rename(library + "/com.a.zip", library + "/old.zip");
+    addPackage("com.a", "2");
+    EXPECT_EQ(run({"plan", device, library}), 0);
+    EXPECT_THAT(out.str(), HasSubstr("note     " + library + "/old.zip is left out"));
+    EXPECT_EQ(run({"plan", device, library, "--json"}), 0);
+    EXPECT_THAT(out.str(), HasSubstr("old.zip is left out"));
+}
+
+TEST_F(SyncCommand, SendingIsRefusedWhereInstallingIsForbidden) {
+    addPackage("com.a", "1");
+    EXPECT_EQ(run({"set", device, "installation=no"}), 0);
+    EXPECT_EQ(run({"send", device, "com.a", library + "/com.a.zip", "--json"}), 1);
+    EXPECT_THAT(err.str(), HasSubstr("policy does not allow installing"));
+    EXPECT_THAT(out.str(), HasSubstr("\"identifier\": \"com.a\""));
+    EXPECT_THAT(applications(), IsEmpty());
+}
+
+TEST_F(SyncCommand, SendingWhatDoesNotFitIsRefusedBeforeTheFirstByte) {
+    write(library + "/huge", "");
+    std::filesystem::resize_file(library + "/huge", std::uint64_t{1} << 42);  // a hole
+    EXPECT_EQ(run({"send", device, "com.a", library + "/huge", "--json"}), 1);
+    EXPECT_THAT(err.str(), HasSubstr("it needs 4.0 TiB, the device has "));
+    EXPECT_THAT(out.str(), HasSubstr("\"bytes\": 0"));
+}
+
+TEST_F(SyncCommand, ATerminalGetsNoCellThatBreaksTheTable) {
+    addPackage("com.a", std::string(300, '7'));
+    EXPECT_EQ(sync(), 0);
+    EXPECT_EQ(run({"apps", device}), 0);
+    EXPECT_THAT(out.str(), HasSubstr(std::string(300, '7')));
+    std::ostringstream terminal;
+    EXPECT_EQ(runCommandLine({"apps", device}, Console{terminal, err, true, 80}), 0);
+    EXPECT_THAT(terminal.str(), HasSubstr(std::string(15, '7') + "~  "));
 }
 
 TEST_F(SyncCommand, APlanChangesNothing) {

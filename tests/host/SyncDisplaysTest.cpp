@@ -127,5 +127,49 @@ TEST_F(SyncDisplays, ANoticeStandsAboveTheBars) {
     EXPECT_THAT(out.str(), HasSubstr("[##########..........]"));
 }
 
+SyncEvent waitingForItself() {
+    SyncEvent result = waiting();
+    result.text = result.identifier + " is running";
+    return result;
+}
+
+TEST_F(SyncDisplays, EightyColumnsHoldWhatRunsAndWhenTheNextTryComes) {
+    const std::string line = eventBar(waitingForItself(), 79);
+    EXPECT_LE(displayWidth(line), 79U);
+    EXPECT_THAT(line, HasSubstr("com.example.atlas"));
+    EXPECT_THAT(line, HasSubstr("is running; next try "));
+    EXPECT_THAT(line, testing::EndsWith(formatClock(kNextTry)));
+}
+
+TEST_F(SyncDisplays, TheNextTryIsTheLastThatANarrowLineLoses) {
+    for (std::size_t width = 8; width < 100; ++width) {
+        const std::string line = eventBar(waitingForItself(), width);
+        EXPECT_LE(displayWidth(line), width);
+        EXPECT_THAT(line, testing::EndsWith(formatClock(kNextTry)));
+    }
+}
+
+TEST_F(SyncDisplays, ProgressIsTheLastThatANarrowLineLoses) {
+    for (std::size_t width = 4; width < 100; ++width) {
+        const std::string line = eventBar(event(SyncEventKind::Progress, SyncState::Active), width);
+        EXPECT_LE(displayWidth(line), width);
+        EXPECT_THAT(line, testing::EndsWith("50 %"));
+    }
+}
+
+TEST_F(SyncDisplays, NoTerminalIsTooNarrow) {
+    for (const SyncEvent& each :
+         {waitingForItself(), event(SyncEventKind::Progress, SyncState::Active),
+          event(SyncEventKind::Ended, SyncState::Failed, 0, std::string(100, 'x'))}) {
+        for (std::size_t width = 0; width < 8; ++width) {
+            EXPECT_LE(displayWidth(eventBar(each, width)), width);
+        }
+    }
+    console.isTerminal = true;
+    console.width = 1;
+    EXPECT_THAT(shown(SyncDisplayKind::Text, {event(SyncEventKind::Progress, SyncState::Active)}),
+                StartsWith("\n\x1b[1A\x1b[J"));
+}
+
 }  // namespace
 }  // namespace appsync

@@ -85,6 +85,7 @@ TEST_F(SyncOutcome, AnOlderVersionThatStayedIsNoUpdate) {
 TEST_F(SyncOutcome, WhatPolicyForbidsIsSkippedAndMakesTheSessionIncomplete) {
     planInstall("com.a", "1");
     plan.remove = {"com.c"};
+    present("com.c", "1");
     aftermath.installationAllowed = false;
     aftermath.removalAllowed = false;
     ASSERT_EQ(summary().skipped.size(), 2U);
@@ -180,6 +181,41 @@ TEST_F(SyncOutcome, ADeviceThatCannotBeLookedAtAnyMoreIsNamedForEachThatIsOpen) 
     ASSERT_EQ(failed.failed.size(), 2U);
     EXPECT_EQ(failed.failed[0].identifier, "com.a");
     EXPECT_EQ(failed.failed[0].error, "the database is damaged");
+}
+
+TEST_F(SyncOutcome, WhatWasInstalledAndThenUninstalledSaysSo) {
+    planInstall("com.a", "1");
+    facts.requested("com.a");
+    facts.installed("com.a");
+    ASSERT_EQ(summary().failed.size(), 1U);
+    EXPECT_THAT(summary().failed[0].error, HasSubstr("uninstalled on the device meanwhile"));
+}
+
+TEST_F(SyncOutcome, WhatAPersonRemovedBeforeTheSyncCouldIsLeftAlone) {
+    plan.remove = {"com.c"};
+    facts.failed("com.c", "com.c is not installed");
+    EXPECT_THAT(summary().failed, IsEmpty());
+    ASSERT_EQ(summary().skipped.size(), 1U);
+    EXPECT_THAT(summary().skipped[0].why, HasSubstr("uninstalled on the device meanwhile"));
+    EXPECT_FALSE(summary().incomplete);
+}
+
+TEST_F(SyncOutcome, AnInterruptedRemovalIsNotTakenForDone) {
+    plan.remove = {"com.c"};
+    const SyncSummary interrupted = summarizeInterrupted(plan, facts);
+    ASSERT_EQ(interrupted.failed.size(), 1U);
+    EXPECT_THAT(interrupted.failed[0].error, HasSubstr("interrupted"));
+}
+
+TEST(SessionFacts, TheLastAnswerOfPolicyIsTheOneThatCounted) {
+    SessionFacts facts;
+    EXPECT_FALSE(facts.wasForbidden(PolicyFeature::AppInstallationAllowed));
+    facts.policyAnswered(PolicyFeature::AppInstallationAllowed, PolicyAnswer::Yes);
+    facts.policyAnswered(PolicyFeature::AppInstallationAllowed, PolicyAnswer::No);
+    EXPECT_TRUE(facts.wasForbidden(PolicyFeature::AppInstallationAllowed));
+    EXPECT_FALSE(facts.wasForbidden(PolicyFeature::AppRemovalAllowed));
+    facts.policyAnswered(PolicyFeature::AppInstallationAllowed, PolicyAnswer::Unset);
+    EXPECT_FALSE(facts.wasForbidden(PolicyFeature::AppInstallationAllowed));
 }
 
 }  // namespace

@@ -129,6 +129,25 @@ TEST(SyncPlan, ThePlaceholderOfAnInterruptedSyncStandsForNothing) {
     EXPECT_THAT(identifiersOf(plan.update), ElementsAre("com.b"));
 }
 
+TEST(SyncPlan, WhatPolicyForbidsIsSkippedAndNeedsNothing) {
+    const SyncPlan plan = makePlan(libraryOf({{"com.a", "1"}, {"com.b", "2"}}),
+                                   {installed("com.b", "1"), installed("com.c", "1")}, {{}, true});
+    DeviceSettings settings;
+    settings.installation = PolicyAnswer::No;
+    const SyncPlan removes = allowedBy(settings, plan);
+    EXPECT_EQ(removes.needed(), 0U);
+    EXPECT_THAT(removes.remove, ElementsAre("com.c"));
+    ASSERT_EQ(removes.skipped.size(), 2U);
+    EXPECT_EQ(removes.skipped[0].identifier, "com.a");
+    EXPECT_EQ(removes.skipped[0].why, kInstallationForbidden);
+    EXPECT_TRUE(removes.skipped[0].isUnmet);
+    settings.removal = PolicyAnswer::No;
+    const SyncPlan nothing = allowedBy(settings, plan);
+    EXPECT_TRUE(nothing.empty());
+    EXPECT_EQ(nothing.reclaimed, 0U);
+    EXPECT_EQ(nothing.skipped[0].why, kRemovalForbidden);
+}
+
 TEST(StagedPlan, FollowsTheTodoListOnceForEachIdentifier) {
     const PropertyList list = PropertyList::array(
         {entry("com.a", "install"), entry("com.a", "install"), entry("com.b", "install"),

@@ -27,7 +27,7 @@ TEST(Printable, KeepsTextOfAnyLanguage) {
 
 TEST(Printable, ReplacesControlCharactersAndBrokenSequences) {
     EXPECT_EQ(printable("a\x1b[2J\n"), "a?[2J?");
-    EXPECT_EQ(printable("\xc2\x9b"), "??");  // a control character of eight bits
+    EXPECT_EQ(printable("\xc2\x9b"), "?");  // a control character of eight bits
     EXPECT_EQ(printable("\xe6\x97"), "??");
     EXPECT_EQ(printable("\xff"
                         "a"),
@@ -45,6 +45,27 @@ TEST(Table, MakesColumnsAsWideAsTheyMustBe) {
     Table table({"A", "B"});
     table.add({"long\n", "x"});
     EXPECT_EQ(table.text(), "A      B\nlong?  x\n");
+}
+
+TEST(Printable, ReplacesWhatReordersText) {
+    for (const char* mark : {"\u200E", "\u200F", "\u202A", "\u202B", "\u202C", "\u202D", "\u202E",
+                             "\u2066", "\u2067", "\u2068", "\u2069", "\u061C", "\u2028"}) {
+        EXPECT_EQ(printable(std::string("a") + mark + "b"), "a?b");
+    }
+    EXPECT_EQ(printable("\u0645\u06CC\u200C\u062E"), "\u0645\u06CC\u200C\u062E");  // joins letters
+}
+
+TEST(Printable, ReplacesWhatIsNoCharacter) {
+    EXPECT_EQ(printable("\xe0\x80\x9b"), "?");      // longer than it need be
+    EXPECT_EQ(printable("\xed\xa0\x80"), "?");      // half of a pair
+    EXPECT_EQ(printable("\xf4\x90\x80\x80"), "?");  // behind the last one
+}
+
+TEST(Table, CutsAColumnThatHasALimit) {
+    Table table({"A", "B"});
+    table.add({std::string(300, 'x'), "y"});
+    table.limit({4});
+    EXPECT_EQ(table.text(), "A     B\nxxx~  y\n");
 }
 
 }  // namespace
