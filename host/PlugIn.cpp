@@ -38,7 +38,6 @@ PlugIn::~PlugIn() {
     if (watch_ != nullptr) watch_->closeCoordination();
 }
 
-
 Status PlugIn::openLog(Device& device) {
     const std::string path = device.logPath();
     ::mkdir(path.substr(0, path.rfind('/')).c_str(), 0755);  // it may have been tidied away

@@ -29,6 +29,7 @@ class PlugIn {
     [[nodiscard]] SyncClient& client();
     /// Only of one that was loaded with a watch.
     [[nodiscard]] SessionWatch& watch() { return *watch_; }
+    [[nodiscard]] const SyncHost& host() const { return daemon_; }
     /// What the device may stop or bring forward.
     [[nodiscard]] TransferQueue& transfers() { return daemon_.transfers(); }
 

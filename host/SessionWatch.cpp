@@ -229,9 +229,10 @@ void SessionWatch::installCancelled(const std::string& identifier, const ErrorRe
                                     CoordinationClient client) {
     // The plug-in's own cancels follow from something that is known here already.
     if (client != SyncClientID) {
-        facts_.failed(identifier, reason.withContext("client " + std::to_string(client) +
-                                                     " cancelled its install")
-                                      .description());
+        facts_.failed(
+            identifier,
+            reason.withContext("client " + std::to_string(client) + " cancelled its install")
+                .description());
     }
     bool wasDelivered = false;
     {

@@ -212,15 +212,15 @@ class WatchedCoordination : public InstallCoordinatorService {
     }
     void uninstallApp(const std::string& identifier, UninstallCompletion completion) override {
         watch_.uninstallBegins();
-        service_.uninstallApp(identifier, [gate = gate_, &watch = watch_, identifier,
-                                           completion = std::move(completion)](
-                                              const ErrorRecord* error) {
-            const Passage passage(*gate);
-            if (!passage.isOpen()) return;
-            if (completion) completion(error);
-            watch.coordinatedUninstallEnded(identifier, error != nullptr ? Status(*error)
-                                                                         : Status());
-        });
+        service_.uninstallApp(identifier,
+                              [gate = gate_, &watch = watch_, identifier,
+                               completion = std::move(completion)](const ErrorRecord* error) {
+                                  const Passage passage(*gate);
+                                  if (!passage.isOpen()) return;
+                                  if (completion) completion(error);
+                                  watch.coordinatedUninstallEnded(
+                                      identifier, error != nullptr ? Status(*error) : Status());
+                              });
     }
     ErrorRecord userPresentableError(std::int64_t code,
                                      const std::optional<ErrorRecord>& underlying) override {
