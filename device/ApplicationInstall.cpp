@@ -86,11 +86,13 @@ BundleRow rowOf(const PackageInfo& info, const NewContainer& container, std::uin
 }
 
 Status commitInstall(const InstallContext& context, const PackageInfo& info,
-                     NewContainer& container, std::uint64_t installType) {
+                     NewContainer& container, std::uint64_t installType,
+                     const AlsoCommitted& alsoCommitted) {
     const BundleRow row = rowOf(info, container, installType);
     FreedContainers freed;
     const Status committed = context.database.change(Durability::OnDisk, [&](Database& database) {
-        return recordInstalled(database, row, freed);
+        const Status recorded = recordInstalled(database, row, freed);
+        return recorded && alsoCommitted ? alsoCommitted(database) : recorded;
     });
     if (!committed) return asRegistryStatus(committed);
     container.keep();
@@ -100,20 +102,21 @@ Status commitInstall(const InstallContext& context, const PackageInfo& info,
     return {};
 }
 
-Status install(const InstallContext& context, const std::string& identifier, const FileURL& package,
-               std::uint64_t installType) {
+}  // namespace
+
+Status installApplicationWith(const InstallContext& context, const std::string& identifier,
+                              const FileURL& package, std::uint64_t installType,
+                              const AlsoCommitted& alsoCommitted) {
     Result<PackageReader> reader = openPackage(context, identifier, package);
     if (!reader) return reader.error();
     Result<NewContainer> container = unpackDurably(context, identifier, *reader);
     if (!container) return container.error();
-    return commitInstall(context, reader->info(), *container, installType);
+    return commitInstall(context, reader->info(), *container, installType, alsoCommitted);
 }
-
-}  // namespace
 
 Status installApplication(const InstallContext& context, const std::string& identifier,
                           const FileURL& package, std::uint64_t installType) {
-    Status status = install(context, identifier, package, installType);
+    Status status = installApplicationWith(context, identifier, package, installType, {});
     if (status) return status;
     rememberFailure(context, identifier, status.error());
     if (const auto record = context.progress.record(identifier)) {
