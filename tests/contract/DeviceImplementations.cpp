@@ -152,7 +152,8 @@ std::vector<DeviceImplementation> deviceImplementations() {
 std::vector<DeviceImplementation> coordinatingDeviceImplementations() {
     return {simulated("Simulation", Scheduling::runToCompletion()),
             simulated("SimulationInterleaved", Scheduling::seeded(1)),
-            simulated("SimulationInterleavedOtherwise", Scheduling::seeded(2))};
+            simulated("SimulationInterleavedOtherwise", Scheduling::seeded(2)),
+            {"Reference", [] { return std::make_unique<ReferenceDevice>(); }}};
 }
 
 }  // namespace appsync
