@@ -228,12 +228,7 @@ void SessionWatch::coordinatorIsOf(const std::string& identifier, CoordinationCl
 void SessionWatch::installCancelled(const std::string& identifier, const ErrorRecord& reason,
                                     CoordinationClient client) {
     // The plug-in's own cancels follow from something that is known here already.
-    if (client != SyncClientID) {
-        facts_.failed(
-            identifier,
-            reason.withContext("client " + std::to_string(client) + " cancelled its install")
-                .description());
-    }
+    if (client != SyncClientID) facts_.failed(identifier, reason.description());
     bool wasDelivered = false;
     {
         const std::lock_guard guard(mutex_);
