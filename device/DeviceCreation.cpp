@@ -15,6 +15,7 @@
 #include "device/DeviceError.h"
 #include "device/DevicePaths.h"
 #include "device/DeviceSchema.h"
+#include "device/PackageError.h"
 #include "system/PosixError.h"
 #include "system/UniqueFd.h"
 
@@ -32,6 +33,32 @@ ErrorRecord cannotCreate(const fs::path& device, const ErrorRecord& cause) {
     return deviceError(
         DeviceErrorCode::CannotUse,
         "cannot create the device " + displayPath(device.string()) + ": " + cause.description());
+}
+
+ErrorRecord noPath(const std::string& path) {
+    return deviceError(DeviceErrorCode::CannotUse,
+                       "cannot create a device at " + quotedName(path) +
+                           ": it is no path of a directory; give that of a new one");
+}
+
+// Why nothing can be made in the directory that the device is to stand in.
+ErrorRecord parentRefuses(const fs::path& device, int error) {
+    const ErrorRecord refused = posixError(error, "create", device.string());
+    const char* advice = nullptr;
+    switch (error) {
+        case ENOENT:
+        case ENOTDIR:
+            advice = "; its parent is no directory: create that first, or give another path";
+            break;
+        case EACCES:
+        case EPERM:
+        case EROFS:
+            advice = "; its parent cannot be written: make it writable, or give another path";
+            break;
+        default:
+            return refused;
+    }
+    return ErrorRecord::make(refused.domain, refused.code, refused.description() + advice);
 }
 
 ErrorRecord alreadyExists(const fs::path& device) {
@@ -54,7 +81,7 @@ class Scaffold {
         clearStale();
         std::string pattern = (device_.parent_path() / (prefix_ + "XXXXXX")).string();
         if (::mkdtemp(pattern.data()) == nullptr) {
-            return posixError(errno, "create", device_.string());
+            return parentRefuses(device_, errno);
         }
         path_ = pattern;
         lock_ = openDirectory(path_);
@@ -148,7 +175,7 @@ Status createDevice(const std::string& path, bool coordination) {
     fs::path device = fs::absolute(path, error).lexically_normal();
     if (device.filename().empty()) device = device.parent_path();
     if (path.empty() || path.find('\0') != path.npos || error || device.filename().empty()) {
-        return cannotCreate(path, posixError(EINVAL, "use", path, "it is no path of a directory"));
+        return noPath(path);
     }
     if (fs::symlink_status(device, error).type() != fs::file_type::not_found && !error) {
         return alreadyExists(device);

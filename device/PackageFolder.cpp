@@ -87,6 +87,12 @@ Result<std::vector<PackageItem>> listPackageFolder(const std::string& folder,
                                                    const PackageLimits& limits) {
     std::error_code error;
     const fs::path path = fs::canonical(folder, error);
+    if (!error && !fs::is_directory(path, error))
+        error = std::make_error_code(std::errc::not_a_directory);
+    if (folder.empty() || error.value() == ENOENT || error.value() == ENOTDIR) {
+        return posixError(folder.empty() ? ENOENT : error.value(), "pack", quotedName(folder),
+                          "there is no such folder; name the one that holds <Name>.app");
+    }
     if (error) return posixError(error.value(), "open", folder);
     FolderListing listing(limits);
     Status status = path.extension() == ".app" ? listing.add(path, path.filename().native())

@@ -5,6 +5,7 @@
 #include <unistd.h>
 #include <zip.h>
 
+#include <algorithm>
 #include <cerrno>
 #include <cstddef>
 #include <cstdio>
@@ -182,6 +183,21 @@ class UnfinishedPackage {
     std::string path_;
 };
 
+/// Without a directory to write to, libzip would name the temporary file.
+Status checkDirectory(const std::string& package) {
+    const std::size_t slash = package.rfind('/');
+    const std::string directory =
+        slash == package.npos ? "." : package.substr(0, std::max<std::size_t>(slash, 1));
+    if (package.empty() || slash + 1 == package.size()) {
+        return packageError(PackageErrorCode::NotARegularFile,
+                            "cannot write " + quotedName(package) +
+                                ": it is no name of a file; name the package to write");
+    }
+    if (::access(directory.c_str(), W_OK | X_OK) == 0) return {};
+    return posixError(errno, "write to the directory", directory,
+                      "it is missing or cannot be written; create it, or choose another");
+}
+
 /// Renaming would replace a device, or the link instead of what it leads to.
 Status checkReplaceable(const std::string& package) {
     struct stat status = {};
@@ -203,6 +219,7 @@ Result<PackageInfo> checkPackage(int descriptor, const std::string& name,
 
 Result<PackageInfo> writePackage(const std::string& folder, const std::string& package,
                                  PropertyListSerialization& propertyLists) {
+    if (Status status = checkDirectory(package); !status) return status.error();
     if (Status status = checkReplaceable(package); !status) return status.error();
     const Result<std::vector<PackageItem>> items = listPackageFolder(folder, PackageLimits());
     if (!items) return items.error();

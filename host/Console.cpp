@@ -37,6 +37,9 @@ int Console::fail(const ErrorRecord& error) const {
     return exitStatusOf(error);
 }
 
-Console processConsole() { return {std::cout, std::cerr, canRedraw(), terminalWidth()}; }
+Console processConsole() {
+    std::cerr.tie(nullptr);  // a complaint must not wait for an output that nobody reads
+    return {std::cout, std::cerr, canRedraw(), terminalWidth()};
+}
 
 }  // namespace appsync

@@ -178,7 +178,7 @@ std::string cut(const std::string& text, std::size_t width) {
 std::vector<std::string> waitStates(const SyncEvent& event) {
     std::string what = printable(event.text);
     const std::string own = printable(event.identifier) + " ";
-    if (what.starts_with(own)) what.erase(0, own.size());
+    if (what.starts_with(own)) what.replace(0, own.size(), "it ");
     if (!event.nextTry) return {"waiting: " + what, "waiting"};
     const std::string time = formatClock(*event.nextTry);
     return {"waiting: " + what + "; next try at " + time, what + "; next try " + time,

@@ -1,12 +1,15 @@
 """Syncs that are killed, stopped or run out of disk, and run again."""
 
+import fcntl
 import json
 import os
 import random
 import signal
 import sqlite3
+import struct
 import subprocess
 import sys
+import termios
 import time
 
 import pytest
@@ -166,6 +169,31 @@ def test_policy_that_changes_meanwhile_is_no_reason(appsync, waiting_sync, devic
     errors = {each["identifier"]: each["error"] for each in json.loads(out)["failed"]}
     assert "interrupted" in errors["com.example.app00"]
     assert json.loads(out)["skipped"] == []
+
+
+def test_an_output_that_nobody_reads_does_not_hold_up_the_end(appsync, device, larger_library):
+    reading, writing = os.pipe()
+    fcntl.fcntl(writing, fcntl.F_SETPIPE_SZ, 4096)
+    sync = subprocess.Popen([appsync.program, "sync", device.path, larger_library, "--json-lines"],
+                            stdout=writing, stderr=subprocess.PIPE, text=True)
+    os.close(writing)
+    held, before = 0, -1
+    while held == 0 or held != before:  # until it is full
+        before = held
+        time.sleep(1)
+        held = struct.unpack("i", fcntl.ioctl(reading, termios.FIONREAD, bytes(4)))[0]
+    assert sync.poll() is None
+    sync.send_signal(signal.SIGINT)
+    time.sleep(0.2)
+    sync.send_signal(signal.SIGINT)
+    try:
+        _, err = sync.communicate(timeout=10)
+    finally:
+        sync.kill()
+        os.close(reading)
+    assert sync.returncode == 1
+    assert "interrupted" in err
+    settle(device, larger_library)
 
 
 FULL = """

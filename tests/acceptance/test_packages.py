@@ -135,3 +135,26 @@ def test_memory_does_not_grow_with_the_package(appsync, device, tmp_path):
     status, kilobytes = map(int, out.split())
     assert status == 0
     assert kilobytes < 64 * 1024
+
+
+def refusal(appsync, *arguments, expect):
+    done = appsync(*arguments, expect=expect)
+    assert done.stdout == ""
+    assert done.stderr.count("\n") == 1
+    return done.stderr
+
+
+def test_what_cannot_be_made_says_what_where_and_what_to_do(appsync, tmp_path):
+    good = tmp_path / "good"
+    (good / "A.app").mkdir(parents=True)
+    (good / "A.app" / "Info.plist").write_bytes(plistlib.dumps({"BundleIdentifier": "com.a"}))
+    missing = str(tmp_path / "missing")
+    told = refusal(appsync, "package", "make", missing, tmp_path / "out.zip", expect=1)
+    assert missing in told and "name the one that holds <Name>.app" in told
+    told = refusal(appsync, "package", "make", good, missing + "/out.zip", expect=1)
+    assert missing in told and "create it" in told
+    assert "name the package to write" in refusal(appsync, "package", "make", good, "", expect=1)
+    told = refusal(appsync, "create", missing + "/device", expect=3)
+    assert missing + "/device" in told and "create that first" in told
+    assert "give that of a new one" in refusal(appsync, "create", "", expect=3)
+    assert os.listdir(tmp_path) == ["good"]

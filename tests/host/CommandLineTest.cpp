@@ -53,6 +53,7 @@ INSTANTIATE_TEST_SUITE_P(
         WrongUsage{{"set", "device", "installation=maybe"}, "use yes, no or unset"},
         WrongUsage{{"set", "device", "colour=red"}, "no setting colour"},
         WrongUsage{{"run", "device", "not/legal"}, "not an identifier"},
+        WrongUsage{{"why", "device", "../x"}, "../x is not an identifier"},
         WrongUsage{{"log", "device", "--level", "loud"}, "loud"},
         WrongUsage{{"send", "device", "com.a", "file", "--parts", "2"}, "without --restore"},
         WrongUsage{{"send", "device", "com.a", "file", "--restore", "--parts", "4"}, "4"},
