@@ -71,7 +71,7 @@ SessionEnd Session::sync(const Order& order) {
     end_.isDisabled =
         !owns(client_, kDataclass) || (disabled && disabled->contains(std::string(kDataclass)));
     if (end_.isDisabled) return end_;
-    watch_.takeUpDelivered();
+    takeUpDelivered(order);
     const std::vector<std::string> known =
         order.takesInventory ? std::vector<std::string>() : readLastSyncState(device_);
     if (!reconcile()) return end(false, {});
@@ -84,6 +84,13 @@ SessionEnd Session::sync(const Order& order) {
     }
     transferAll(assets, order.packages);
     return end(!stopRequested_, known);
+}
+
+// What an interrupted session has delivered, except where this one begins anew.
+void Session::takeUpDelivered(const Order& order) {
+    for (const std::string& identifier : device_.coordinatedInstallsUnderWay()) {
+        if (!order.sends(identifier)) watch_.takeUpDelivered(identifier);
+    }
 }
 
 // Ends when every removal has, also those that the plug-in does not wait for: an application that
@@ -136,7 +143,7 @@ Result<std::string> Session::packageOf(const SyncAsset& asset, const PackageSour
 }
 
 void Session::transfer(const SyncAssetPointer& asset, const PackageSource& packages) {
-    if (transfers_.isCancelled()) return reportFailure(asset, cancelledByDevice());
+    if (isCancelled(asset->identifier)) return reportFailure(asset, cancelledByDevice());
     Result<std::string> file = packageOf(*asset, packages);
     if (file) {
         send({asset, *std::move(file), std::string(kPublicStaging), asset->identifier + ".zip"});
@@ -163,7 +170,7 @@ void Session::send(const Parcel& parcel) {
         events_.report(event);
         asset->downloadProgress = static_cast<double>(done) / static_cast<double>(total);
         client_.assetTransferUpdatedProgress(asset, asset->downloadProgress);
-        return !stopRequested_ && !transfers_.isCancelled();
+        return !stopRequested_ && !isCancelled(asset->identifier);
     };
     const Result<std::uint64_t> sent =
         sender_.send(parcel.file, parcel.directory, parcel.name, progress);
@@ -176,6 +183,17 @@ void Session::send(const Parcel& parcel) {
     if (!parcel.keepsPath) asset->path = parcel.name;
     if (watch_.isCoordinated()) watch_.packageDelivered(asset->identifier);
     client_.assetTransferSucceeded(asset, true, nullptr);
+}
+
+// A cancel may be of an earlier coordinator of the same application, of which the device tells
+// late.
+bool Session::isCancelled(const std::string& identifier) {
+    if (!transfers_.isCancelled()) return false;
+    const Result<ApplicationStatus> status = device_.status(identifier);
+    const bool stands =
+        status && status->coordinator && status->coordinator->client == SyncClientID;
+    if (stands) transfers_.dismissCancel();
+    return !stands;
 }
 
 // A transfer that stops may do so because the device wants it no more.

@@ -72,7 +72,9 @@ class Session {
     [[nodiscard]] SessionEnd deliver(const Parcel& parcel);
 
   private:
+    void takeUpDelivered(const Order& order);
     [[nodiscard]] bool reconcile();
+    [[nodiscard]] bool isCancelled(const std::string& identifier);
     void transferAll(const std::vector<SyncAssetPointer>& assets, const PackageSource& packages);
     void transfer(const SyncAssetPointer& asset, const PackageSource& packages);
     Result<std::string> packageOf(const SyncAsset& asset, const PackageSource& packages);

@@ -15,7 +15,7 @@ import time
 import pytest
 
 import packages
-from conftest import Device
+from conftest import ON_ONE_PATH, Device
 
 
 @pytest.fixture
@@ -54,10 +54,11 @@ def duration_of(appsync, library, path, coordination):
 
 @pytest.mark.parametrize("number", [signal.SIGKILL, signal.SIGINT, signal.SIGTERM])
 def test_stopped_at_random_moments_and_run_again(appsync, larger_library, tmp_path, number, coordination):
-    """Twenty kills (ten for each polite signal), at moments from a fixed seed over the whole run."""
+    """Twenty kills (fewer for each polite signal), at moments from a fixed seed over the whole run."""
     whole = duration_of(appsync, larger_library, tmp_path / "whole", coordination)
     choose = random.Random(int(number))
-    for attempt in range(20 if number == signal.SIGKILL else 10):
+    polite = 5 if coordination == "on" else 10
+    for attempt in range(20 if number == signal.SIGKILL else polite):
         device = Device(appsync, tmp_path / ("device%d" % attempt), coordination)
         sync = appsync.start("sync", device.path, larger_library)
         time.sleep(choose.uniform(0, whole))
@@ -182,6 +183,7 @@ def test_policy_that_changes_meanwhile_is_no_reason(appsync, waiting_sync, devic
     assert json.loads(out)["skipped"] == []
 
 
+@ON_ONE_PATH
 def test_an_output_that_nobody_reads_does_not_hold_up_the_end(appsync, device, larger_library):
     reading, writing = os.pipe()
     fcntl.fcntl(writing, fcntl.F_SETPIPE_SZ, 4096)

@@ -6,7 +6,7 @@ import plistlib
 import pytest
 
 import packages
-from conftest import names_of
+from conftest import ON_ONE_PATH, names_of
 from staging import AREA, install, remove, stage
 
 A, B = "com.example.app00", "com.example.app01"
@@ -122,6 +122,7 @@ def test_two_hundred_thousand_entries_that_ask_for_nothing(device, library):
     assert sorted(device.apps()) == [A]
 
 
+@ON_ONE_PATH
 def test_two_hundred_thousand_installs_are_refused_and_stay(device, library):
     device.sync(library)
     todo = [install("com.example.x%06d" % n) for n in range(200_000)]
