@@ -185,23 +185,29 @@ Result<StoredCoordinator> CoordinationBook::findOrInsert(CoordinatorKind kind,
 
 // Beside a session, others may change what was read at any time, so nothing is kept.
 CoordinationBook::Coordinator CoordinationBook::adopt(const StoredCoordinator& stored) {
-    Coordinator former;
+    if (access_ == Access::Look) return std::make_shared<LiveCoordinator>(stored);
+    // Whoever ended the former one tells of it; if that was somebody else, while it is still known.
+    if (knowsAnother(stored)) hearOfOthers();
     Coordinator made;
     {
         const std::lock_guard lock(mutex_);
         Coordinator& known = coordinators_[stored.identifier];
         if (known != nullptr && known->id == stored.id) return known;
         made = std::make_shared<LiveCoordinator>(stored);
-        if (access_ == Access::Look) return made;
-        former = std::exchange(known, made);
-    }
-    if (former != nullptr) (void)retire(former, coordinationError(CoordinationErrorCode::Over, ""));
-    for (const auto& [role, promise] : made->promisesByRole()) {
-        (void)promise->attach(listener(made, role, promise));
+        for (const auto& [role, promise] : made->promisesByRole()) {
+            (void)promise->attach(listener(made, role, promise));
+        }
+        known = made;
     }
     const auto asset = made->promise(PromiseRole::Asset);
     if (asset != nullptr && asset->isComplete()) noteDelivery(*made);
     return made;
+}
+
+bool CoordinationBook::knowsAnother(const StoredCoordinator& stored) const {
+    const std::lock_guard lock(mutex_);
+    const auto known = coordinators_.find(stored.identifier);
+    return known != coordinators_.end() && known->second->id != stored.id;
 }
 
 std::shared_ptr<InstallCoordinator> CoordinationBook::handle(const Coordinator& coordinator) {
@@ -372,7 +378,8 @@ void CoordinationBook::tellCancellation(const Coordinator& coordinator, const Er
 void CoordinationBook::noteDelivery(const LiveCoordinator& coordinator) {
     if (coordinator.client != SyncClientID) return;
     const std::lock_guard lock(mutex_);
-    underWay_[coordinator.identifier] = coordinator.id;
+    // Of one that has ended, the last that is told of it may have been told already.
+    if (!coordinator.hasEnded()) underWay_[coordinator.identifier] = coordinator.id;
 }
 
 std::vector<std::string> CoordinationBook::installsUnderWay() {
