@@ -412,10 +412,11 @@ class AppsClient final : public SyncClient,
     std::unique_ptr<SerialQueue> _accessQueue;               // guards itself
     std::unique_ptr<SerialQueue> _restoreQueue;              // guards itself
     bool _finishedWaitingForPlaceHolderInstalls = false;     // only on _restoreQueue
-    bool _useInstallCoordinator = false;                     // never changes once set
-    std::int64_t _restoringPlaceholderCount = 0;             // changed only on _restoreQueue
-    std::set<std::string> _updatingApps;                     // only on _accessQueue
-    std::set<std::string> _userCancelledApps;                // only on _accessQueue
+    // Never changes once `create` has set it; the registry may ask a little earlier.
+    std::atomic<bool> _useInstallCoordinator{false};
+    std::int64_t _restoringPlaceholderCount = 0;  // changed only on _restoreQueue
+    std::set<std::string> _updatingApps;          // only on _accessQueue
+    std::set<std::string> _userCancelledApps;     // only on _accessQueue
     std::optional<std::vector<std::string>> _uninstalledApps;
     std::shared_ptr<AppInstallObserver> _appInstallObserver;  // see isAppInstallObserverSetUp_
     std::atomic<std::uint32_t> _numAppInstallsAttempted{0};
