@@ -16,7 +16,7 @@ namespace {
 
 constexpr std::chrono::milliseconds kPollInterval{100};
 // Denials are looked for in the device's database, so less often.
-constexpr int kPollsForDenials = 5;
+constexpr int kPollsForDenials = 2;
 constexpr std::chrono::seconds kUsualRetryInterval{30};
 
 std::string identifierOf(const PropertyList& options) {
