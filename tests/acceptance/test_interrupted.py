@@ -211,10 +211,10 @@ def test_an_output_that_nobody_reads_does_not_hold_up_the_end(appsync, device, l
 
 FULL = """
 import subprocess, sys, os
-program, library, where = sys.argv[1:]
+program, library, where, coordination = sys.argv[1:]
 run = lambda *a: subprocess.run([program, *a], capture_output=True, text=True, timeout=120)
 subprocess.run(["mount", "-t", "tmpfs", "-o", "size=1m", "tmpfs", where], check=True)
-done = run("create", where + "/device")
+done = run("create", where + "/device", "--coordination", coordination)
 assert done.returncode == 0, done.stderr
 fitted = False
 for kib in range(1024, 16384, 256):
@@ -222,7 +222,7 @@ for kib in range(1024, 16384, 256):
     done = run("sync", where + "/device", library)
     assert done.returncode in (0, 1), (kib, done.returncode, done.stderr)
     if done.returncode == 1:
-        assert done.stderr.strip(), kib
+        assert done.stderr.strip() or "Failed " in done.stdout, kib
     again = run("apps", where + "/device")
     assert again.returncode == 0, again.stderr
     if done.returncode == 0:
@@ -233,14 +233,14 @@ print("fits at", kib, "KiB")
 """
 
 
-def test_full_disk_at_every_size_leaves_the_device_usable(appsync, library, tmp_path):
+def test_full_disk_at_every_size_leaves_the_device_usable(appsync, library, tmp_path, coordination):
     where = tmp_path / "small"
     where.mkdir()
     able = subprocess.run(["unshare", "-m", "true"], capture_output=True)
     if able.returncode != 0:
         pytest.skip("this machine allows no mount namespace")
-    done = subprocess.run(["unshare", "-m", sys.executable, "-c", FULL, appsync.program, library, str(where)],
-                          capture_output=True, text=True, timeout=300)
+    done = subprocess.run(["unshare", "-m", sys.executable, "-c", FULL, appsync.program, library, str(where),
+                           coordination], capture_output=True, text=True, timeout=300)
     assert done.returncode == 0, done.stderr
     assert "fits at" in done.stdout
 
