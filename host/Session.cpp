@@ -89,7 +89,9 @@ SessionEnd Session::sync(const Order& order) {
 // What an interrupted session has delivered, except where this one begins anew.
 void Session::takeUpDelivered(const Order& order) {
     for (const std::string& identifier : device_.coordinatedInstallsUnderWay()) {
-        if (!order.sends(identifier)) watch_.takeUpDelivered(identifier);
+        if (order.sends(identifier)) continue;
+        watch_.takeUpDelivered(identifier);
+        takenUp_.insert(identifier);
     }
 }
 
@@ -214,8 +216,13 @@ void Session::reportFailure(const SyncAssetPointer& asset, const ErrorRecord& er
 const SessionEnd& Session::end(bool transfersSucceeded, const std::vector<std::string>& known) {
     client_.assetTransferEndedWithSuccess(transfersSucceeded);
     if (watch_.isCoordinated()) {
-        cancelGivenUp();
+        cancelWhere([this](const CoordinatorRecord& each) {
+            return std::find(givenUp_.begin(), givenUp_.end(), each.identifier) != givenUp_.end();
+        });
         awaitCoordinatedInstalls();
+        cancelWhere([this](const CoordinatorRecord& each) {
+            return takenUp_.contains(each.identifier) && !each.isComplete;
+        });
     }
     end_.isInterrupted = stopRequested_;
     const bool isSuccess = end_.isSuccess();
@@ -226,17 +233,21 @@ const SessionEnd& Session::end(bool transfersSucceeded, const std::vector<std::s
     return end_;
 }
 
-// The plug-in looks for something on the device before it cancels the coordinator of a package that
-// does not come; the placeholder may have come to stand there after it looked.
-void Session::cancelGivenUp() {
-    if (givenUp_.empty()) return;
-    const std::set<std::string> givenUp(givenUp_.begin(), givenUp_.end());
+// Cancels coordinators of the sync client to which no package will come in this session:
+//
+// - The plug-in looks for something on the device before it cancels the coordinator of a package
+//   that does not come; the placeholder may have come to stand there after it looked.
+// - It may see the placeholder of an install that was taken up in its last moment, and prepare
+//   another coordinator for it.
+void Session::cancelWhere(const std::function<bool(const CoordinatorRecord&)>& isToGo) {
+    if (givenUp_.empty() && takenUp_.empty()) return;
     const Result<std::vector<CoordinatorRecord>> coordinators = device_.coordinators();
     if (!coordinators) return;  // the session's end finds the same failure
     StandingInstalls standing;
     for (const CoordinatorRecord& each : *coordinators) {
-        const bool isOurs = each.client == SyncClientID && givenUp.contains(each.identifier);
-        if (isOurs) standing.obsolete.push_back(each.identifier);
+        if (each.client == SyncClientID && isToGo(each)) {
+            standing.obsolete.push_back(each.identifier);
+        }
     }
     const Status cancelled = cancelObsolete(device_, standing);
     if (!cancelled && !end_.error) end_.error = cancelled.error();

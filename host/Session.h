@@ -5,6 +5,7 @@
 #include <functional>
 #include <memory>
 #include <optional>
+#include <set>
 #include <string>
 #include <vector>
 
@@ -17,6 +18,7 @@ namespace appsync {
 
 class Device;
 class PlugIn;
+struct CoordinatorRecord;
 class SessionFacts;
 class SessionWatch;
 class SyncClient;
@@ -82,7 +84,7 @@ class Session {
     [[nodiscard]] ErrorRecord causeOf(const ErrorRecord& error) const;
     void reportFailure(const SyncAssetPointer& asset, const ErrorRecord& error);
     void awaitCoordinatedInstalls();
-    void cancelGivenUp();
+    void cancelWhere(const std::function<bool(const CoordinatorRecord&)>& isToGo);
     // `known`: the applications that the last session saw, where this one does not look.
     const SessionEnd& end(bool transfersSucceeded, const std::vector<std::string>& known);
 
@@ -96,6 +98,7 @@ class Session {
     const std::atomic<bool>& stopRequested_;
     PackageSender sender_;
     std::vector<std::string> givenUp_;  // whose transfers have failed for good
+    std::set<std::string> takenUp_;     // whose packages an earlier session has delivered
     SessionEnd end_;
 };
 
