@@ -115,6 +115,7 @@ def test_remove_and_install_of_one_identifier(device, library):
     assert device.versions()[A] == "2.0"
 
 
+@ON_ONE_PATH
 def test_two_hundred_thousand_entries_that_ask_for_nothing(device, library):
     todo = [{"identifier": "com.example.x%06d" % n, "operation": "INSTALLED"} for n in range(200_000)]
     stage(device, plistlib.dumps(todo + [install(A)], fmt=plistlib.FMT_BINARY), side_files=[A])
