@@ -101,12 +101,14 @@ Status refuseIfUninstalled(Database& database, const std::string& identifier) {
 }
 
 Status commitInstall(const InstallContext& context, const PackageInfo& info,
-                     NewContainer& container, std::uint64_t installType) {
+                     NewContainer& container, std::uint64_t installType,
+                     const AlsoCommitted& alsoCommitted) {
     const BundleRow row = rowOf(info, container, installType);
     FreedContainers freed;
     const Status committed = context.database.change(Durability::OnDisk, [&](Database& database) {
-        const Status wanted = refuseIfUninstalled(database, row.identifier);
-        return wanted ? recordInstalled(database, row, freed) : wanted;
+        Status committing = refuseIfUninstalled(database, row.identifier);
+        if (committing) committing = recordInstalled(database, row, freed);
+        return committing && alsoCommitted ? alsoCommitted(database) : committing;
     });
     if (!committed) return asRegistryStatus(committed);
     container.keep();
@@ -116,20 +118,21 @@ Status commitInstall(const InstallContext& context, const PackageInfo& info,
     return {};
 }
 
-Status install(const InstallContext& context, const std::string& identifier, const FileURL& package,
-               std::uint64_t installType) {
+}  // namespace
+
+Status installApplicationWith(const InstallContext& context, const std::string& identifier,
+                              const FileURL& package, std::uint64_t installType,
+                              const AlsoCommitted& alsoCommitted) {
     Result<PackageReader> reader = openPackage(context, identifier, package);
     if (!reader) return reader.error();
     Result<NewContainer> container = unpackDurably(context, identifier, *reader);
     if (!container) return container.error();
-    return commitInstall(context, reader->info(), *container, installType);
+    return commitInstall(context, reader->info(), *container, installType, alsoCommitted);
 }
-
-}  // namespace
 
 Status installApplication(const InstallContext& context, const std::string& identifier,
                           const FileURL& package, std::uint64_t installType) {
-    Status status = install(context, identifier, package, installType);
+    Status status = installApplicationWith(context, identifier, package, installType, {});
     if (status) return status;
     rememberFailure(context, identifier, status.error());
     if (const auto record = context.progress.record(identifier)) {

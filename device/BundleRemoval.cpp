@@ -1,6 +1,7 @@
 #include "device/BundleRemoval.h"
 
 #include "device/Containers.h"
+#include "device/CoordinationTables.h"
 #include "device/Database.h"
 #include "device/DeviceDatabase.h"
 #include "device/DeviceError.h"
@@ -82,6 +83,8 @@ Status forget(Database& database, const std::string& identifier, Outcome& outcom
         status = forgetBundle(database, BundleTable::Applications, identifier,
                               outcome.freed.application);
     }
+    // An install that was to put something here is over, too.
+    if (status) status = cancelForRemoval(database, identifier);
     if (!status || !outcome.nothingRemains()) return status;
     status = runFor(database, "DELETE FROM denials WHERE identifier = ?", identifier);
     if (!status) return status;
@@ -122,7 +125,8 @@ Result<std::vector<std::string>> removeSyncPlaceholders(const InstallContext& co
     std::vector<std::string> containers;
     const Status committed = context.database.change(Durability::OnDisk, [&](Database& database) {
         Query rows = database.query(
-            "DELETE FROM placeholders WHERE install_type = ? RETURNING identifier, container");
+            "DELETE FROM placeholders WHERE install_type = ? AND identifier NOT IN"
+            " (SELECT identifier FROM coordinators) RETURNING identifier, container");
         rows.bind(static_cast<std::uint64_t>(kInstallTypeSync));
         while (rows.next()) {
             identifiers.push_back(rows.text(0));

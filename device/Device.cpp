@@ -11,6 +11,8 @@
 #include "device/BundleRemoval.h"
 #include "device/CairoIconRenderer.h"
 #include "device/Containers.h"
+#include "device/CoordinationService.h"
+#include "device/CoordinationTables.h"
 #include "device/Database.h"
 #include "device/DeviceCreation.h"
 #include "device/DeviceDatabase.h"
@@ -67,12 +69,13 @@ struct Device::State {
           progress(*database, [this] { registry.touch(); }),
           registry(context),
           policy(*database),
-          coordination(policy),
           installer(*database),
           backup(*database),
           history(*database),
           homeScreen(*database, propertyLists, options.retryInterval),
-          icons(files->root(), propertyLists) {}
+          icons(files->root(), propertyLists),
+          coordination(context, policy, homeScreen, options.retryInterval,
+                       lock ? CoordinationBook::Access::Session : CoordinationBook::Access::Look) {}
 
     const DeviceOpenOptions options;
     const std::string path;
@@ -89,12 +92,12 @@ struct Device::State {
                                  progress,  propertyLists, boot};
     DeviceRegistry registry;
     DevicePolicy policy;
-    DeviceCoordination coordination;
     DeviceInstaller installer;
     DeviceBackup backup;
     DeviceHistory history;
     DeviceHomeScreen homeScreen;
     CairoIconRenderer icons;
+    CoordinationService coordination;
     SystemNotifications notifications;
     SystemNotificationCenter notificationCenter;
     SystemWorkQueues queues;
@@ -122,6 +125,7 @@ Result<std::unique_ptr<Device>> Device::open(const std::string& path,
 Device::Device(std::unique_ptr<State> state) : state_(std::move(state)) {}
 
 Device::~Device() {
+    state_->coordination.close();
     state_->database->flush().ignore();
     if (state_->lock) endSession(state_->context).ignore();
 }
@@ -198,6 +202,32 @@ Result<std::vector<HistoryRecord>> Device::history(std::size_t limit) {
 Result<DeviceSettings> Device::settings() { return state_->policy.settings(); }
 
 Status Device::change(const DeviceSettingsChange& change) { return state_->policy.change(change); }
+
+Result<std::vector<CoordinatorRecord>> Device::coordinators() {
+    return listCoordinators(*state_->database);
+}
+
+Status Device::createCoordinator(const std::string& identifier, CoordinationClient client) {
+    return state_->coordination.create(identifier, client);
+}
+
+Status Device::cancelCoordinator(const std::string& identifier, CoordinationClient client) {
+    return state_->coordination.cancel(identifier, client);
+}
+
+Status Device::startCoordination() {
+    if (Status status = requireSession(); !status) return status;
+    state_->coordination.start();
+    return {};
+}
+
+std::vector<std::string> Device::coordinatedInstallsUnderWay() {
+    return state_->coordination.installsUnderWay();
+}
+
+bool Device::waitForCoordinatedInstalls(std::chrono::milliseconds longest) {
+    return state_->coordination.waitForInstalls(longest);
+}
 
 Status Device::run(const std::string& identifier) {
     const bool stale = !SessionLock::isHeld(state_->path);

@@ -31,8 +31,8 @@ struct DeviceCreateOptions {
 
 struct DeviceOpenOptions {
     DeviceAccess access = DeviceAccess::Look;
-    /// When a denied termination is asked for again; only told to people, as the plug-in keeps the
-    /// time.
+    /// When a denied termination is asked for again: by the coordination service. On the direct
+    /// path it is only told to people, as the plug-in keeps the time.
     std::chrono::seconds retryInterval{30};
 };
 
@@ -104,6 +104,27 @@ class Device {
     [[nodiscard]] Result<DeviceSettings> settings();
     /// Takes effect at once, also for a session that is under way (coordination: for the next).
     Status change(const DeviceSettingsChange& change);
+
+    // Coordinated installs.
+
+    /// The coordinators that stand, of every client, ordered by identifier.
+    [[nodiscard]] Result<std::vector<CoordinatorRecord>> coordinators();
+    /// Creates a coordinator as the client: updating when the application is installed, initiating
+    /// else. Refused where one stands, and on a device whose installs are not coordinated.
+    Status createCoordinator(const std::string& identifier, CoordinationClient client);
+    /// Cancels the coordinator as the client: its placeholder goes, an installed version stays.
+    /// Refused when there is none.
+    Status cancelCoordinator(const std::string& identifier, CoordinationClient client);
+
+    /// The coordination service begins to work, if it does not yet: what is complete is installed.
+    /// A client that attaches to the service has the same effect. Only with DeviceAccess::Session.
+    Status startCoordination();
+    /// The applications whose package the sync client has delivered to the service and whose
+    /// install has not ended, observers included; ordered. Those that wait for a running
+    /// application to end are among them: `status` tells of the denial.
+    [[nodiscard]] std::vector<std::string> coordinatedInstallsUnderWay();
+    /// Waits until there are no such applications. False when the time is over before that.
+    [[nodiscard]] bool waitForCoordinatedInstalls(std::chrono::milliseconds longest);
 
     // What a person does on the device. An identifier under which there is nothing is refused.
 

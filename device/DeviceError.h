@@ -35,6 +35,23 @@ enum class RegistryErrorCode : std::int64_t {
     Uninstalled = 9,         // a person uninstalled it while its install was under way
 };
 
+/// Domain of errors of a device's coordination service.
+inline constexpr std::string_view kCoordinationErrorDomain = "InstallCoordination";
+
+/// The codes of `kCoordinationErrorDomain`. 1 to 9 are those of `userPresentableError`.
+enum class CoordinationErrorCode : std::int64_t {
+    OtherKind = 10,      // a coordinator of another kind stands in the way
+    AlreadyExists = 11,  // a coordinator stands already
+    NotInstalled = 12,   // an update of what is not installed
+    NoCoordinator = 13,  // there is none
+    NotEnabled = 14,     // the device's installs are not coordinated
+    AlreadySet = 15,     // the piece is there already
+    Refused = 16,        // a piece that cannot be used
+    Over = 17,           // the coordinator is done or cancelled, or the service is closed
+    Cancelled = 18,      // somebody cancelled the install
+};
+
+[[nodiscard]] ErrorRecord coordinationError(CoordinationErrorCode code, std::string_view sentence);
 [[nodiscard]] ErrorRecord deviceError(DeviceErrorCode code, std::string_view sentence);
 [[nodiscard]] ErrorRecord registryError(RegistryErrorCode code, std::string_view sentence);
 [[nodiscard]] bool isDeviceError(const ErrorRecord& error, DeviceErrorCode code) noexcept;

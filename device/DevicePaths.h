@@ -12,6 +12,8 @@ inline constexpr std::string_view kLogName = "log/system.log";
 
 // Device paths.
 inline constexpr std::string_view kTemporaryDirectory = "/var/mobile/tmp";
+// Where the plug-in makes the files of placeholders, one directory <identifier>.app each.
+inline constexpr std::string_view kPlaceholderFilesDirectory = "/var/mobile/tmp/com.korvu.trd.Apps";
 inline constexpr std::string_view kWorkAreaDirectory = "/var/mobile/Library/ApplicationSync";
 inline constexpr std::string_view kPublicStagingDirectory = "/var/mobile/Media/PublicStaging";
 inline constexpr std::string_view kDataDirectory = "/var/mobile/Containers/Data";

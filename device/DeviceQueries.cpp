@@ -4,6 +4,7 @@
 #include <functional>
 #include <unordered_map>
 
+#include "device/CoordinationTables.h"
 #include "device/Database.h"
 #include "device/DeviceDatabase.h"
 #include "device/IconDrawing.h"
@@ -102,6 +103,21 @@ Status findEvents(Database& database, const std::string& identifier, Application
                    [&](const Query& row) { status.uninstalled = wallTime(row.integer(0)); });
 }
 
+Status addLastFailure(Database& database, CoordinatorRecord& record) {
+    return withRow(
+        database, "SELECT time, domain, code, description FROM failures WHERE identifier = ?",
+        record.identifier, [&](const Query& row) { record.error = failureOf(row).error; });
+}
+
+Status findCoordination(Database& database, const std::string& identifier,
+                        ApplicationStatus& status) {
+    const auto coordinator = findCoordinator(database, identifier);
+    if (!coordinator) return coordinator.error();
+    if (!*coordinator) return {};
+    status.coordinator = recordOf(**coordinator);
+    return addLastFailure(database, *status.coordinator);
+}
+
 Bytes iconOf(const ApplicationRecord& record, const RootDirectory& root) {
     const Result<RegularFile> file = root.openRegularFile(record.bundle + "/" + record.iconFile);
     if (!file) return {};
@@ -139,6 +155,22 @@ Result<std::vector<ApplicationRecord>> listApplications(DeviceDatabase& database
     return records;
 }
 
+Result<std::vector<CoordinatorRecord>> listCoordinators(DeviceDatabase& database) {
+    database.flush().ignore();
+    std::vector<CoordinatorRecord> records;
+    const Status status = database.read([&](Database& connection) -> Status {
+        const auto coordinators = allCoordinators(connection);
+        if (!coordinators) return coordinators.error();
+        for (const StoredCoordinator& coordinator : *coordinators) {
+            records.push_back(recordOf(coordinator));
+            if (Status added = addLastFailure(connection, records.back()); !added) return added;
+        }
+        return {};
+    });
+    if (!status) return status.error();
+    return records;
+}
+
 std::optional<InstallProgress> storedProgress(DeviceDatabase& database,
                                               const std::string& identifier) {
     std::optional<InstallProgress> progress;
@@ -160,7 +192,8 @@ Result<ApplicationStatus> applicationStatus(DeviceDatabase& database,
     const Status read = database.read([&](Database& connection) {
         Status found = findRecords(connection, identifier, status);
         if (found) found = findMarks(connection, identifier, status);
-        return found ? findEvents(connection, identifier, status) : found;
+        if (found) found = findEvents(connection, identifier, status);
+        return found ? findCoordination(connection, identifier, status) : found;
     });
     if (!read) return read.error();
     return status;

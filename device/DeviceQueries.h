@@ -17,6 +17,9 @@ class RootDirectory;
 /// See Device::applications.
 [[nodiscard]] Result<std::vector<ApplicationRecord>> listApplications(DeviceDatabase& database);
 
+/// See Device::coordinators.
+[[nodiscard]] Result<std::vector<CoordinatorRecord>> listCoordinators(DeviceDatabase& database);
+
 /// How far an install has come, as the database knows it; nothing when none is under way.
 [[nodiscard]] std::optional<InstallProgress> storedProgress(DeviceDatabase& database,
                                                             const std::string& identifier);

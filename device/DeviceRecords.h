@@ -4,9 +4,11 @@
 #include <cstdint>
 #include <optional>
 #include <string>
+#include <vector>
 
 #include "platform/DevicePolicyService.h"
 #include "platform/Error.h"
+#include "platform/InstallPromises.h"
 
 namespace appsync {
 
@@ -78,6 +80,36 @@ struct TerminationDenial {
     WallTime nextTry;
 };
 
+/// One piece of a coordinated install that a client has promised.
+struct PromiseRecord {
+    std::string name;
+    bool complete = false;
+    double percent = 0;             // from 0 to 1
+    CoordinationClient client = 0;  // who has to keep it
+    /// Its keeper gave it up: nobody waits for it.
+    bool cancelled = false;
+};
+
+/// One install as the device's coordination service has it.
+struct CoordinatorRecord {
+    std::string identifier;
+    std::string kind;               // "initiating", "updating", "restoring", "restoring demoted"
+    CoordinationClient client = 0;  // who created it
+    /// In this order, as far as they are there: the package, the user data, the initial assets.
+    std::vector<PromiseRecord> promises;
+    /// Whether the client has handed in a placeholder, and whether that stands on the home screen.
+    bool hasPlaceholder = false;
+    bool placeholderStands = false;
+    /// Whether everything is there: the device installs it, or does once nothing is in its way.
+    bool isComplete = false;
+    /// One sentence on the first piece that is missing; empty when the coordinator is complete.
+    std::string waitsFor;
+    /// Whose task that piece is, where that is known.
+    std::optional<CoordinationClient> waitsForClient;
+    /// The last failure of an install of this application, if there was one.
+    std::optional<ErrorRecord> error;
+};
+
 /// The last failure of an install. A later success takes it away.
 struct InstallFailure {
     WallTime when;
@@ -96,6 +128,8 @@ struct ApplicationStatus {
     /// Present while an install waits for the application to end.
     std::optional<TerminationDenial> denial;
     std::optional<InstallFailure> lastFailure;
+    /// The install that is being coordinated, if one is.
+    std::optional<CoordinatorRecord> coordinator;
     /// Data to restore is yet to come.
     bool awaitsRestoreData = false;
     /// When a person removed it from the device, if the host has not taken note of that yet.

@@ -60,18 +60,39 @@ CREATE TABLE uninstalled (
 ) STRICT;
 
 CREATE TABLE coordinators (
-    identifier TEXT PRIMARY KEY,
+    id INTEGER PRIMARY KEY AUTOINCREMENT,
+    identifier TEXT NOT NULL UNIQUE,
     kind INTEGER NOT NULL,
     client INTEGER NOT NULL,
-    created INTEGER NOT NULL
+    created INTEGER NOT NULL,
+    responsible INTEGER,
+    options BLOB,
+    initial_assets INTEGER NOT NULL DEFAULT 0,
+    placeholder INTEGER NOT NULL DEFAULT 0
 ) STRICT;
 
 CREATE TABLE promises (
-    identifier TEXT NOT NULL REFERENCES coordinators (identifier) ON DELETE CASCADE,
+    coordinator INTEGER NOT NULL REFERENCES coordinators (id) ON DELETE CASCADE,
+    role INTEGER NOT NULL,
+    position INTEGER NOT NULL,
     name TEXT NOT NULL,
-    complete INTEGER NOT NULL DEFAULT 0,
-    percent REAL NOT NULL DEFAULT 0,
-    PRIMARY KEY (identifier, name)
+    client INTEGER NOT NULL,
+    path TEXT,
+    space INTEGER NOT NULL,
+    percent INTEGER NOT NULL,
+    complete INTEGER NOT NULL,
+    cancelled INTEGER NOT NULL,
+    PRIMARY KEY (coordinator, role, position)
+) STRICT, WITHOUT ROWID;
+
+CREATE TABLE cancellations (
+    id INTEGER PRIMARY KEY AUTOINCREMENT,
+    coordinator INTEGER NOT NULL,
+    identifier TEXT NOT NULL,
+    client INTEGER NOT NULL,
+    domain TEXT NOT NULL,
+    code INTEGER NOT NULL,
+    description TEXT NOT NULL
 ) STRICT;
 
 CREATE TABLE settings (

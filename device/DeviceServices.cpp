@@ -142,11 +142,6 @@ Status DevicePolicy::change(const DeviceSettingsChange& change) {
     });
 }
 
-bool DeviceCoordination::isCoordinationEnabled() {
-    const Result<DeviceSettings> settings = policy_.settings();
-    return settings && settings->coordination;
-}
-
 std::unique_ptr<BackupManager> DeviceBackup::makeManager() {
     return std::make_unique<Manager>(database_, *this);
 }

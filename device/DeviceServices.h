@@ -3,7 +3,6 @@
 #include "device/DeviceRecords.h"
 #include "platform/BackupService.h"
 #include "platform/DevicePolicyService.h"
-#include "platform/InstallCoordinatorService.h"
 #include "platform/InstallTransactionLog.h"
 #include "platform/InstallerService.h"
 #include "platform/Result.h"
@@ -41,17 +40,6 @@ class DevicePolicy final : public DevicePolicyService {
 
   private:
     DeviceDatabase& database_;
-};
-
-/// Answers what is set on the device.
-class DeviceCoordination final : public InstallCoordinatorService {
-  public:
-    explicit DeviceCoordination(DevicePolicy& policy) : policy_(policy) {}
-
-    [[nodiscard]] bool isCoordinationEnabled() override;
-
-  private:
-    DevicePolicy& policy_;
 };
 
 /// Knows for which applications data to restore is yet to come.

@@ -31,6 +31,8 @@ constexpr std::string_view kInfoName = "Info.plist";
 constexpr std::string_view kMetadataName = "VessikMetadata.plist";
 constexpr std::string_view kDefaultIconName = "Icon.png";
 
+using AlsoCommitted = std::function<Status(Database&)>;
+
 /// A placeholder bundle as it was read.
 struct Bundle {
     std::string directoryName;
@@ -155,14 +157,10 @@ BundleRow rowOf(const Bundle& bundle, const PlaceholderSource& source,
     return row;
 }
 
-bool isDemoted(std::uint64_t installType) {
-    return installType == kInstallTypeDowngrade || installType == kInstallTypeIntentionalDowngrade;
-}
-
 Status beginProgress(Database& database, const BundleRow& row) {
     Query remove = database.query("DELETE FROM progress WHERE identifier = ?");
     if (Status status = remove.bind(row.identifier).run(); !status) return status;
-    if (isDemoted(row.installType)) return {};
+    if (isDemotedType(row.installType)) return {};
     return database
         .query(
             "INSERT INTO progress (identifier, state, phase, total, completed)"
@@ -186,13 +184,15 @@ bool mayBeLost(const InstallContext& context, const PlaceholderSource& source) {
 }
 
 Status commitPlaceholder(const InstallContext& context, const BundleRow& row,
-                         const PlaceholderExtras& extras, NewContainer& container) {
+                         const PlaceholderExtras& extras, NewContainer& container,
+                         const AlsoCommitted& alsoCommitted) {
     FreedContainers freed;
     context.progress.forget(row.identifier);
     const Durability durability = extras.unsyncedBoot ? Durability::Soon : Durability::OnDisk;
     const Status committed = context.database.change(durability, [&](Database& database) {
-        const Status status = recordPlaceholder(database, row, extras, freed);
-        return status ? beginProgress(database, row) : status;
+        Status status = recordPlaceholder(database, row, extras, freed);
+        if (status) status = beginProgress(database, row);
+        return status && alsoCommitted ? alsoCommitted(database) : status;
     });
     if (!committed) return asRegistryStatus(committed);
     container.keep();
@@ -201,10 +201,9 @@ Status commitPlaceholder(const InstallContext& context, const BundleRow& row,
     return {};
 }
 
-Status install(const InstallContext& context, const PlaceholderSource& source) {
-    const Result<Bundle> bundle = readBundle(context, source);
-    if (!bundle) return bundle.error();
-    Result<NewContainer> container = writeContainer(context, *bundle, source);
+Status installBundle(const InstallContext& context, const Bundle& bundle,
+                     const PlaceholderSource& source, const AlsoCommitted& alsoCommitted) {
+    Result<NewContainer> container = writeContainer(context, bundle, source);
     if (!container) return container.error();
     PlaceholderExtras extras{source.sinf, std::nullopt};
     if (mayBeLost(context, source)) {
@@ -212,7 +211,30 @@ Status install(const InstallContext& context, const PlaceholderSource& source) {
     } else if (Status status = context.barrier.pass(); !status) {
         return status;
     }
-    return commitPlaceholder(context, rowOf(*bundle, source, *container), extras, *container);
+    return commitPlaceholder(context, rowOf(bundle, source, *container), extras, *container,
+                             alsoCommitted);
+}
+
+Status install(const InstallContext& context, const PlaceholderSource& source) {
+    const Result<Bundle> bundle = readBundle(context, source);
+    if (!bundle) return bundle.error();
+    return installBundle(context, *bundle, source, {});
+}
+
+Result<Bundle> makeBundle(const InstallContext& context, const PlaceholderContents& contents) {
+    Result<Bytes> info = context.propertyLists.serialize(contents.info, PropertyListFormat::Binary);
+    if (!info) return refused(contents.identifier, info.error().description()).error();
+    Bundle bundle;
+    // Alone in its container, so a name that had to be cut is as good.
+    bundle.directoryName = contents.identifier.substr(0, 251) + ".app";
+    bundle.version = textAt(contents.info, BundleVersionKey);
+    bundle.name = textAt(contents.info, BundleDisplayNameKey);
+    bundle.iconName = kDefaultIconName;
+    bundle.info = std::move(*info);
+    if (!contents.iconFile) return bundle;
+    Result<Bytes> icon = readLimited(context, *contents.iconFile, kMaximumIconFileBytes);
+    if (icon) bundle.icon = std::move(*icon);
+    return bundle;
 }
 
 Result<BundleRow> findDemotable(const InstallContext& context, const std::string& identifier) {
@@ -258,6 +280,22 @@ Status installPlaceholder(const InstallContext& context, const PlaceholderSource
     Status status = install(context, source);
     if (!status) rememberFailure(context, source.identifier, status.error());
     return status;
+}
+
+Status installPlaceholderWith(const InstallContext& context, const PlaceholderContents& contents,
+                              const std::function<Status(Database&)>& alsoCommitted) {
+    const Result<Bundle> bundle = makeBundle(context, contents);
+    if (!bundle) return bundle.error();
+    PlaceholderSource source;
+    source.identifier = contents.identifier;
+    source.installType = contents.installType;
+    source.storeMetadata = contents.storeMetadata;
+    source.sinf = contents.sinf;
+    return installBundle(context, *bundle, source, alsoCommitted);
+}
+
+bool isDemotedType(std::uint64_t installType) noexcept {
+    return installType == kInstallTypeDowngrade || installType == kInstallTypeIntentionalDowngrade;
 }
 
 Status demoteApplication(const InstallContext& context, const std::string& identifier,

@@ -6,6 +6,7 @@
 #include <unordered_set>
 
 #include "device/Containers.h"
+#include "device/CoordinationRecovery.h"
 #include "device/Database.h"
 #include "device/DeviceDatabase.h"
 #include "device/DevicePaths.h"
@@ -181,14 +182,17 @@ std::unordered_set<std::string> identifiersWithRestoreData(const InstallContext&
     return identifiers;
 }
 
-// A package whose data is yet to come waits for it where it lies; any other is sent again.
+// A package that was delivered to a coordinator, or whose data is yet to come, waits where it lies;
+// any other is sent again.
 void clearPackages(const InstallContext& context) {
     const std::unordered_set<std::string> waiting = identifiersWithRestoreData(context);
+    const std::unordered_set<std::string> delivered = deliveredFiles(context);
     for (const std::string& name : namesAt(context, kPublicStagingDirectory)) {
         if (!name.ends_with(kPackageSuffix)) continue;
         const std::string identifier = name.substr(0, name.size() - kPackageSuffix.size());
         if (!isLegalIdentifier(identifier) || waiting.contains(identifier)) continue;
-        context.files.removeItem(std::string(kPublicStagingDirectory) + "/" + name).ignore();
+        const std::string path = std::string(kPublicStagingDirectory) + "/" + name;
+        if (!delivered.contains(path)) context.files.removeItem(path).ignore();
     }
 }
 
@@ -209,6 +213,7 @@ Result<std::vector<std::string>> reconcileDevice(const InstallContext& context) 
     if (!tidied) return tidied.error();
     Comparison comparison(context);
     if (Status status = comparison.run(); !status) return status.error();
+    if (Status status = reconcileCoordinators(context); !status) return status.error();
     clearPackages(context);
     clearTemporaries(context);
     return comparison.takeNotes();

@@ -304,8 +304,12 @@ class Commands {
             ->required()
             ->check(oneOf({"list", "create", "cancel"}));
         added.add_option("ID", values->identifier, "the application's identifier");
-        added.add_option("--client", values->client, "the client to play")->type_name("N");
-        added.add_flag("--json", values->asJson, "print JSON");
+        added
+            .add_option("--client", values->client,
+                        "the client to play: 1 is the app store, 3 the sync client (default 2)")
+            ->type_name("N")
+            ->check(CLI::Range(1U, 1'000'000U).description(""));
+        added.add_flag("--json", values->asJson, "print what stands afterwards as JSON");
         addStore();
     }
 

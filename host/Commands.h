@@ -85,7 +85,8 @@ struct CoordinatorArguments {
     std::string device;
     std::string action;  // "list", "create" or "cancel"
     std::string identifier;
-    int client = 1;
+    /// Who does it; 3 is the sync client itself.
+    CoordinationClient client = 2;
     bool asJson = false;
 };
 [[nodiscard]] int runCoordinator(const CoordinatorArguments& arguments, const Console& console);

@@ -17,11 +17,6 @@
 namespace appsync {
 namespace {
 
-ErrorRecord noCoordination() {
-    return wrongUsage("installs through coordinators are not available in this version",
-                      "leave coordination off");
-}
-
 Status checkIdentifier(const std::string& identifier) {
     if (isLegalIdentifier(identifier)) return {};
     return wrongUsage(printable(identifier) + " is not an identifier",
@@ -50,11 +45,10 @@ Result<PolicyAnswer> parsePolicy(const std::string& name, std::string_view value
 }
 
 Status addCoordination(DeviceSettingsChange& change, std::string_view value) {
-    if (value == "on") return noCoordination();
-    if (value != "off") {
-        return wrongUsage("coordination cannot be " + printable(value), "use off");
+    if (value != "on" && value != "off") {
+        return wrongUsage("coordination cannot be " + printable(value), "use on or off");
     }
-    change.coordination = false;
+    change.coordination = value == "on";
     return {};
 }
 
@@ -85,8 +79,7 @@ Result<DeviceSettingsChange> parseAssignments(const std::vector<std::string>& as
 }  // namespace
 
 int runCreate(const std::string& device, bool coordination, const Console& console) {
-    if (coordination) return console.fail(noCoordination());
-    const Status created = Device::create(device);
+    const Status created = Device::create(device, {coordination});
     if (!created) return console.fail(unusable(created.error()));
     console.out << printable(device) << " is an empty device\n";
     return kExitDone;

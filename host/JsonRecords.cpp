@@ -49,6 +49,20 @@ Json jsonOf(const HistoryRecord& record) {
     return object;
 }
 
+Json jsonOf(const PromiseRecord& record) {
+    return {{"name", record.name}, {"complete", record.complete}, {"percent", record.percent}};
+}
+
+Json jsonOf(const CoordinatorRecord& record) {
+    Json promises = Json::array();
+    for (const PromiseRecord& promise : record.promises) promises.push_back(jsonOf(promise));
+    return {{"identifier", record.identifier},
+            {"kind", record.kind},
+            {"client", record.client},
+            {"promises", std::move(promises)},
+            {"placeholder", record.placeholderStands}};
+}
+
 template <typename Record>
 std::string listText(const std::vector<Record>& records) {
     Json list = Json::array();
@@ -108,6 +122,8 @@ std::string jsonText(const std::vector<ApplicationRecord>& records) { return lis
 
 std::string jsonText(const std::vector<HistoryRecord>& records) { return listText(records); }
 
+std::string jsonText(const std::vector<CoordinatorRecord>& records) { return listText(records); }
+
 std::string jsonText(const Inventory& inventory) {
     Json accounts = Json::array();
     for (const SyncAccountInfo& account : inventory.accounts) accounts.push_back(jsonOf(account));
@@ -125,6 +141,7 @@ std::string jsonText(const WhyAnswer& answer) {
         waitsFor = {{"what", answer.waitsFor->what}, {"who", answer.waitsFor->who}};
         waitsFor["nextTry"] =
             answer.waitsFor->nextTry ? Json(formatTime(*answer.waitsFor->nextTry)) : Json();
+        waitsFor["promise"] = orNull(answer.waitsFor->promise);
     }
     return indented({{"identifier", answer.identifier},
                      {"state", answer.state},

@@ -29,6 +29,7 @@ struct Inventory {
 
 [[nodiscard]] std::string jsonText(const std::vector<ApplicationRecord>& records);
 [[nodiscard]] std::string jsonText(const std::vector<HistoryRecord>& records);
+[[nodiscard]] std::string jsonText(const std::vector<CoordinatorRecord>& records);
 [[nodiscard]] std::string jsonText(const Inventory& inventory);
 [[nodiscard]] std::string jsonText(const WhyAnswer& answer);
 [[nodiscard]] std::string jsonText(const PackageInfo& info);

@@ -126,7 +126,9 @@ int runWhy(const std::string& device, const std::string& identifier, bool asJson
     return lookAt(device, console, [&](Device& opened) -> Status {
         const Result<ApplicationStatus> status = opened.status(identifier);
         if (!status) return status.error();
-        const WhyAnswer answer = explain(identifier, *status);
+        const Result<DeviceSettings> settings = opened.settings();
+        if (!settings) return unusable(settings.error());
+        const WhyAnswer answer = explain(identifier, *status, *settings);
         const bool isUnknown = answer.state == "absent" && !answer.lastError && !answer.waitsFor &&
                                !status->uninstalled;
         if (isUnknown) {

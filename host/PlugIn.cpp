@@ -4,7 +4,6 @@
 #include <sys/stat.h>
 
 #include <cerrno>
-#include <optional>
 #include <utility>
 
 #include "client/AppsClient.h"
@@ -12,14 +11,18 @@
 #include "host/HostFile.h"
 #include "host/Problem.h"
 #include "host/SessionWatch.h"
+#include "platform/Notifications.h"
 #include "system/JsonLogFacility.h"
 
 namespace appsync {
 namespace {
 
+// Says that the daemon has started up.
+constexpr std::string_view kStartupNotification = "com.korvu.trd.TRStartupCompleteNotification";
+
 Platform watched(const Platform& platform, SessionWatch& watch) {
     return {platform.host,          platform.log,           watch.registry(),
-            platform.installer,     platform.coordination,  watch.policy(),
+            platform.installer,     watch.coordination(),   watch.policy(),
             platform.backup,        watch.homeScreen(),     platform.icons,
             platform.transactions,  platform.queues,        platform.files,
             platform.propertyLists, platform.notifications, platform.notificationCenter};
@@ -28,7 +31,11 @@ Platform watched(const Platform& platform, SessionWatch& watch) {
 }  // namespace
 
 PlugIn::PlugIn() = default;
-PlugIn::~PlugIn() = default;
+
+// The device may be in the middle of telling the client something.
+PlugIn::~PlugIn() {
+    if (watch_ != nullptr) watch_->closeCoordination();
+}
 
 Status PlugIn::openLog(Device& device) {
     const std::string path = device.logPath();
@@ -39,30 +46,23 @@ Status PlugIn::openLog(Device& device) {
     return {};
 }
 
-Status PlugIn::create(const Platform& platform) {
-    std::optional<ErrorRecord> error;
-    client_ = AppsClient::create(platform, &error);
-    if (client_ != nullptr) return {};
-    return error ? unusable(*error) : unusable("the plug-in cannot be loaded", "see appsync log");
-}
-
 Result<std::unique_ptr<PlugIn>> PlugIn::load(Device& device) {
     std::unique_ptr<PlugIn> plugIn(new PlugIn());
-    Status status = plugIn->openLog(device);
-    if (status) status = plugIn->create(device.platform(plugIn->daemon_, *plugIn->log_));
+    const Status status = plugIn->openLog(device);
     if (!status) return status.error();
+    plugIn->client_ = AppsClient::create(device.platform(plugIn->daemon_, *plugIn->log_));
     return plugIn;
 }
 
 Result<std::unique_ptr<PlugIn>> PlugIn::load(Device& device, SyncEvents& events,
                                              SessionFacts& facts) {
     std::unique_ptr<PlugIn> plugIn(new PlugIn());
-    Status status = plugIn->openLog(device);
+    const Status status = plugIn->openLog(device);
     if (!status) return status.error();
     const Platform platform = device.platform(plugIn->daemon_, *plugIn->log_);
     plugIn->watch_ = std::make_unique<SessionWatch>(device, platform, events, facts);
-    status = plugIn->create(watched(platform, *plugIn->watch_));
-    if (!status) return status.error();
+    plugIn->client_ = AppsClient::create(watched(platform, *plugIn->watch_));
+    platform.notificationCenter.post(kStartupNotification);
     return plugIn;
 }
 

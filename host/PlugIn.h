@@ -10,7 +10,6 @@ namespace appsync {
 class AppsClient;
 class Device;
 class JsonLogFacility;
-struct Platform;
 class SessionFacts;
 class SessionWatch;
 class SyncClient;
@@ -21,7 +20,8 @@ class SyncEvents;
 class PlugIn {
   public:
     [[nodiscard]] static Result<std::unique_ptr<PlugIn>> load(Device& device);
-    /// With a watch between plug-in and device. Events and facts must outlive the plug-in.
+    /// For a session: with a watch between plug-in and device, and told that the daemon has started
+    /// up, upon which it attaches to the coordination service. Events and facts must outlive it.
     [[nodiscard]] static Result<std::unique_ptr<PlugIn>> load(Device& device, SyncEvents& events,
                                                               SessionFacts& facts);
     ~PlugIn();
@@ -29,11 +29,13 @@ class PlugIn {
     [[nodiscard]] SyncClient& client();
     /// Only of one that was loaded with a watch.
     [[nodiscard]] SessionWatch& watch() { return *watch_; }
+    [[nodiscard]] const SyncHost& host() const { return daemon_; }
+    /// What the device may stop or bring forward.
+    [[nodiscard]] TransferQueue& transfers() { return daemon_.transfers(); }
 
   private:
     PlugIn();
     Status openLog(Device& device);
-    Status create(const Platform& platform);
 
     SyncDaemon daemon_;
     std::unique_ptr<JsonLogFacility> log_;

@@ -14,12 +14,14 @@
 #include "host/Commands.h"
 #include "host/Console.h"
 #include "host/Interruption.h"
+#include "host/Library.h"
 #include "host/LibraryReader.h"
 #include "host/PlugIn.h"
 #include "host/Problem.h"
 #include "host/Session.h"
 #include "host/SessionFacts.h"
 #include "host/StagingArea.h"
+#include "host/StandingInstalls.h"
 #include "host/StopSignals.h"
 #include "host/SyncOutcome.h"
 #include "host/Text.h"
@@ -80,8 +82,11 @@ class Sending {
         if (settings->installation == PolicyAnswer::No) return refuse(forbidden());
         Status ready = checkSpace();
         if (!ready) return refuse(ready.error());
-        ready = removeStaleTransfers(*device_);
-        if (ready) ready = isData() ? prepareData() : preparePackage();
+        isCoordinated_ = settings->coordination;
+        if (isCoordinated_) ready = checkCoordinated();
+        if (!ready) return ready.error();
+        ready = isData() ? prepareData() : preparePackage();
+        if (ready) ready = clearTheWay();
         if (!ready) return ready.error();
         isPlanned_ = true;
         if (signals_.stopRequested()) return finish(summarizeInterrupted(plan_, facts_));
@@ -90,6 +95,48 @@ class Sending {
 
   private:
     [[nodiscard]] bool isData() const { return arguments_.parts == kAssetPartApplicationData; }
+
+    // A plug-in that coordinates its installs takes only what it has asked for: the package travels
+    // in a session with a staging area of its own.
+    Status checkCoordinated() const {
+        if (arguments_.isRestore) {
+            return failure(
+                "the installs of this device are coordinated, and restored packages "
+                "are the store's to bring",
+                "see appsync store, or turn coordination off");
+        }
+        if (!device_->files().itemExists(std::string(kStagingArea))) return {};
+        return failure("a host has left a staging area on the device",
+                       "take it over first with appsync sync --staged");
+    }
+
+    // Only what an earlier session has left of this application; the others go on.
+    Status clearTheWay() {
+        const Result<std::vector<ApplicationRecord>> present = device_->applications();
+        if (!present) return unusable(present.error());
+        const Result<std::vector<CoordinatorRecord>> coordinators = device_->coordinators();
+        if (!coordinators) return unusable(coordinators.error());
+        standing_ = takeUp(plan_, *coordinators, *present);
+        std::erase_if(standing_.obsolete, [this](const std::string& identifier) {
+            return identifier != arguments_.identifier;
+        });
+        Status status = cancelObsolete(*device_, standing_);
+        if (!status) return unusable(status.error());
+        status = removeStaleTransfers(*device_, standing_.arrived);
+        if (status && isCoordinated_) status = writeStagingArea(*device_, plan_, library_);
+        return status;
+    }
+
+    SessionEnd holdSession(Session& session) {
+        if (!isCoordinated_) return session.deliver(parcel_);
+        return session.sync(
+            {[this](const std::string&) { return Result<std::string>(arguments_.file); },
+             [this](const std::string& identifier) {
+                 return identifier == arguments_.identifier &&
+                        !standing_.arrived.contains(identifier);
+             },
+             false});
+    }
 
     static ErrorRecord forbidden() {
         return failure(kInstallationForbidden, "allow it with appsync set DEVICE installation=yes");
@@ -142,6 +189,11 @@ class Sending {
         parcel_.name = arguments_.identifier + ".zip";
         PlannedInstall planned{arguments_.identifier, {}, {}, {}, 0, 0};
         if (package) planned.newVersion = version;
+        if (package && package->info().identifier == arguments_.identifier) {
+            library_.packages.push_back({arguments_.identifier, version,
+                                         package->info().displayName, arguments_.file,
+                                         package->info().packedBytes, 0});
+        }
         if (arguments_.isRestore && arguments_.parts == kAssetPartApplication) {
             plansInstall_ = false;  // it waits for the data that is still to come
         }
@@ -183,7 +235,7 @@ class Sending {
         Result<std::unique_ptr<PlugIn>> plugIn = PlugIn::load(*device_, events_, facts_);
         if (!plugIn) return plugIn.error();
         Session session(*device_, **plugIn, events_, facts_, signals_.stopRequested());
-        const SessionEnd end = session.deliver(parcel_);
+        const SessionEnd end = holdSession(session);
         const Result<SessionAftermath> aftermath = aftermathOf(*device_, end, facts_);
         if (!aftermath) {
             finish(summarizeFailed(plan_, facts_, aftermath.error()));
@@ -223,6 +275,9 @@ class Sending {
     std::unique_ptr<Device> device_;
     Session::Parcel parcel_;
     SyncPlan plan_;
+    Library library_;  // the one package
+    StandingInstalls standing_;
+    bool isCoordinated_ = false;
     bool plansInstall_ = true;
     const Clock::time_point begin_ = Clock::now();
     std::atomic<bool> isPlanned_ = false;  // the plan is made, and changes no more

@@ -2,6 +2,7 @@
 
 #include <algorithm>
 #include <cerrno>
+#include <chrono>
 #include <set>
 #include <string_view>
 #include <utility>
@@ -12,8 +13,10 @@
 #include "host/PlugIn.h"
 #include "host/SessionFacts.h"
 #include "host/SessionWatch.h"
+#include "host/StandingInstalls.h"
 #include "host/SyncDaemon.h"
 #include "host/SyncEvents.h"
+#include "host/TransferQueue.h"
 #include "platform/AppRegistry.h"
 #include "platform/FileSystem.h"
 #include "platform/PropertyListSerialization.h"
@@ -23,6 +26,9 @@ namespace appsync {
 namespace {
 
 constexpr std::string_view kDataclass = "Application";
+
+// How often a wait looks whether it is to stop.
+constexpr std::chrono::milliseconds kStopInterval{50};
 
 void ignoreProgress(double) {}
 
@@ -34,6 +40,11 @@ bool owns(SyncClient& client, std::string_view dataclass) {
 ErrorRecord illegalIdentifier() {
     return ErrorRecord::make(kTransferErrorDomain, kTransferIllegalName,
                              "it is not a legal identifier: take it off the todo list");
+}
+
+ErrorRecord cancelledByDevice() {
+    return ErrorRecord::make(kTransferErrorDomain, kTransferCancelled,
+                             "the device cancelled its install: run the command again to have it");
 }
 
 bool isUserApplication(const ApplicationRecord& record) {
@@ -48,33 +59,67 @@ Session::Session(Device& device, PlugIn& plugIn, SyncEvents& events, SessionFact
     : device_(device),
       client_(plugIn.client()),
       watch_(plugIn.watch()),
+      transfers_(plugIn.transfers()),
+      host_(plugIn.host()),
       events_(events),
       facts_(facts),
       stopRequested_(stopRequested),
       sender_(device) {}
 
-SessionEnd Session::sync(const PackageSource& packages) {
+SessionEnd Session::sync(const Order& order) {
     const auto disabled = client_.disabledAssetTypes();
     end_.isDisabled =
         !owns(client_, kDataclass) || (disabled && disabled->contains(std::string(kDataclass)));
     if (end_.isDisabled) return end_;
+    takeUpDelivered(order);
+    const std::vector<std::string> known =
+        order.takesInventory ? std::vector<std::string>() : readLastSyncState(device_);
+    if (!reconcile()) return end(false, {});
+    if (order.takesInventory) static_cast<void>(client_.installedAssets());
+    std::vector<SyncAssetPointer> assets;
+    for (SyncAssetPointer& asset : client_.outstandingAssetTransfers()) {
+        if (!order.sends(asset->identifier)) continue;
+        facts_.requested(asset->identifier);
+        assets.push_back(std::move(asset));
+    }
+    transferAll(assets, order.packages);
+    return end(!stopRequested_, known);
+}
+
+// What an interrupted session has delivered, except where this one begins anew.
+void Session::takeUpDelivered(const Order& order) {
+    for (const std::string& identifier : device_.coordinatedInstallsUnderWay()) {
+        if (order.sends(identifier)) continue;
+        watch_.takeUpDelivered(identifier);
+        takenUp_.insert(identifier);
+    }
+}
+
+// Ends when every removal has, also those that the plug-in does not wait for: an application that
+// is removed and comes anew must be gone before the device is asked what it wants.
+bool Session::reconcile() {
     const std::string anchor = client_.currentSyncAnchor();
     client_.prepareForSyncWithHostAnchor(anchor, ignoreProgress, nullptr);
     std::optional<ErrorRecord> error;
     watch_.setRemoving(true);
     const bool reconciled =
         client_.reconcileSync(PropertyList::map(), anchor, ignoreProgress, &error);
+    watch_.waitForUninstalls(stopRequested_);
     watch_.setRemoving(false);
-    if (!reconciled) {
-        end_.error = error.value_or(ErrorRecord::make(kPosixErrorDomain, EIO, "it cannot begin"));
-        return end(false, {});
+    if (reconciled) return true;
+    end_.error = error.value_or(ErrorRecord::make(kPosixErrorDomain, EIO, "it cannot begin"));
+    return false;
+}
+
+void Session::transferAll(const std::vector<SyncAssetPointer>& assets,
+                          const PackageSource& packages) {
+    transfers_.fill(assets);
+    while (!stopRequested_) {
+        const SyncAssetPointer asset = transfers_.next();
+        if (asset == nullptr) return;
+        transfer(asset, packages);
+        transfers_.finish();
     }
-    static_cast<void>(client_.installedAssets());
-    for (const SyncAssetPointer& asset : client_.outstandingAssetTransfers()) {
-        facts_.requested(asset->identifier);
-        if (!stopRequested_) transfer(asset, packages);
-    }
-    return end(!stopRequested_, {});
 }
 
 SessionEnd Session::deliver(const Parcel& parcel) {
@@ -87,7 +132,10 @@ SessionEnd Session::deliver(const Parcel& parcel) {
     }
     client_.prepareForSyncWithHostAnchor(client_.currentSyncAnchor(), ignoreProgress, nullptr);
     facts_.requested(parcel.asset->identifier);
+    transfers_.fill({parcel.asset});
+    static_cast<void>(transfers_.next());
     send(parcel);
+    transfers_.finish();
     return end(!stopRequested_, known);
 }
 
@@ -97,6 +145,7 @@ Result<std::string> Session::packageOf(const SyncAsset& asset, const PackageSour
 }
 
 void Session::transfer(const SyncAssetPointer& asset, const PackageSource& packages) {
+    if (isCancelled(asset->identifier)) return reportFailure(asset, cancelledByDevice());
     Result<std::string> file = packageOf(*asset, packages);
     if (file) {
         send({asset, *std::move(file), std::string(kPublicStaging), asset->identifier + ".zip"});
@@ -123,29 +172,58 @@ void Session::send(const Parcel& parcel) {
         events_.report(event);
         asset->downloadProgress = static_cast<double>(done) / static_cast<double>(total);
         client_.assetTransferUpdatedProgress(asset, asset->downloadProgress);
-        return !stopRequested_;
+        return !stopRequested_ && !isCancelled(asset->identifier);
     };
     const Result<std::uint64_t> sent =
         sender_.send(parcel.file, parcel.directory, parcel.name, progress);
-    if (!sent) return reportFailure(asset, sent.error());
+    if (!sent) return reportFailure(asset, causeOf(sent.error()));
     facts_.sent(*sent);
     event.kind = SyncEventKind::Ended;
     event.state = SyncState::Finished;
     events_.report(event);
     watch_.setSize(asset->identifier, *sent);
     if (!parcel.keepsPath) asset->path = parcel.name;
+    if (watch_.isCoordinated()) watch_.packageDelivered(asset->identifier);
     client_.assetTransferSucceeded(asset, true, nullptr);
 }
 
+// A cancel may be of an earlier coordinator of the same application, of which the device tells
+// late.
+bool Session::isCancelled(const std::string& identifier) {
+    if (!transfers_.isCancelled()) return false;
+    const Result<ApplicationStatus> status = device_.status(identifier);
+    const bool stands =
+        status && status->coordinator && status->coordinator->client == SyncClientID;
+    if (stands) transfers_.dismissCancel();
+    return !stands;
+}
+
+// A transfer that stops may do so because the device wants it no more.
+ErrorRecord Session::causeOf(const ErrorRecord& error) const {
+    return transfers_.isCancelled() && !stopRequested_ ? cancelledByDevice() : error;
+}
+
 void Session::reportFailure(const SyncAssetPointer& asset, const ErrorRecord& error) {
-    facts_.failed(asset->identifier, error.description());
-    events_.report({SyncEventKind::Ended, SyncPhase::Transfer, asset->identifier, 0, 0,
-                    SyncState::Failed, std::nullopt, error.description()});
+    const std::string& identifier = asset->identifier;
+    facts_.failed(identifier, error.description());
+    const std::string cause = facts_.firstFailure(identifier).value_or(error.description());
+    events_.report({SyncEventKind::Ended, SyncPhase::Transfer, identifier, 0, 0, SyncState::Failed,
+                    std::nullopt, cause});
+    if (!host_.isRecoverableError(error)) givenUp_.push_back(identifier);
     client_.assetTransferSucceeded(asset, false, &error);
 }
 
 const SessionEnd& Session::end(bool transfersSucceeded, const std::vector<std::string>& known) {
     client_.assetTransferEndedWithSuccess(transfersSucceeded);
+    if (watch_.isCoordinated()) {
+        cancelWhere([this](const CoordinatorRecord& each) {
+            return std::find(givenUp_.begin(), givenUp_.end(), each.identifier) != givenUp_.end();
+        });
+        awaitCoordinatedInstalls();
+        cancelWhere([this](const CoordinatorRecord& each) {
+            return takenUp_.contains(each.identifier) && !each.isComplete;
+        });
+    }
     end_.isInterrupted = stopRequested_;
     const bool isSuccess = end_.isSuccess();
     client_.syncEndedWithSuccess(isSuccess);
@@ -153,6 +231,36 @@ const SessionEnd& Session::end(bool transfersSucceeded, const std::vector<std::s
     const Status written = writeLastSyncState(device_, known);
     if (!written) end_.error = written.error();
     return end_;
+}
+
+// Cancels coordinators of the sync client to which no package will come in this session:
+//
+// - The plug-in looks for something on the device before it cancels the coordinator of a package
+//   that does not come; the placeholder may have come to stand there after it looked.
+// - It may see the placeholder of an install that was taken up in its last moment, and prepare
+//   another coordinator for it.
+void Session::cancelWhere(const std::function<bool(const CoordinatorRecord&)>& isToGo) {
+    if (givenUp_.empty() && takenUp_.empty()) return;
+    const Result<std::vector<CoordinatorRecord>> coordinators = device_.coordinators();
+    if (!coordinators) return;  // the session's end finds the same failure
+    StandingInstalls standing;
+    for (const CoordinatorRecord& each : *coordinators) {
+        if (each.client == SyncClientID && isToGo(each)) {
+            standing.obsolete.push_back(each.identifier);
+        }
+    }
+    const Status cancelled = cancelObsolete(device_, standing);
+    if (!cancelled && !end_.error) end_.error = cancelled.error();
+}
+
+// The plug-in has done its part when the transfers have; what the coordination service does with
+// the packages belongs to the session all the same: its end says that the device is in step.
+void Session::awaitCoordinatedInstalls() {
+    while (!stopRequested_) {
+        if (!device_.waitForCoordinatedInstalls(kStopInterval)) continue;
+        watch_.settleDelivered();
+        return;
+    }
 }
 
 std::vector<std::string> readLastSyncState(Device& device) {

@@ -5,6 +5,7 @@
 #include <functional>
 #include <memory>
 #include <optional>
+#include <set>
 #include <string>
 #include <vector>
 
@@ -17,10 +18,13 @@ namespace appsync {
 
 class Device;
 class PlugIn;
+struct CoordinatorRecord;
 class SessionFacts;
 class SessionWatch;
 class SyncClient;
 class SyncEvents;
+class SyncHost;
+class TransferQueue;
 
 /// How a session ended.
 struct SessionEnd {
@@ -46,8 +50,17 @@ class Session {
     Session(Device& device, PlugIn& plugIn, SyncEvents& events, SessionFacts& facts,
             const std::atomic<bool>& stopRequested);
 
-    /// A whole sync with what stands in the staging area. Returns when every install has ended.
-    [[nodiscard]] SessionEnd sync(const PackageSource& packages);
+    /// What a sync is to do with what the device asks for.
+    struct Order {
+        PackageSource packages;
+        /// Whether this session sends the application's package at all.
+        std::function<bool(const std::string& identifier)> sends;
+        /// Whether the host takes note of what was uninstalled on the device.
+        bool takesInventory = true;
+    };
+    /// A whole sync with what stands in the staging area. Returns when every install has ended, on
+    /// the device's own path or through its coordination service.
+    [[nodiscard]] SessionEnd sync(const Order& order);
 
     /// A session that brings one asset that the device has not asked for. The asset's path is set
     /// from where the file was put: `directory`/`name` of the device; not when `keepsPath`.
@@ -61,20 +74,31 @@ class Session {
     [[nodiscard]] SessionEnd deliver(const Parcel& parcel);
 
   private:
+    void takeUpDelivered(const Order& order);
+    [[nodiscard]] bool reconcile();
+    [[nodiscard]] bool isCancelled(const std::string& identifier);
+    void transferAll(const std::vector<SyncAssetPointer>& assets, const PackageSource& packages);
     void transfer(const SyncAssetPointer& asset, const PackageSource& packages);
     Result<std::string> packageOf(const SyncAsset& asset, const PackageSource& packages);
     void send(const Parcel& parcel);
+    [[nodiscard]] ErrorRecord causeOf(const ErrorRecord& error) const;
     void reportFailure(const SyncAssetPointer& asset, const ErrorRecord& error);
+    void awaitCoordinatedInstalls();
+    void cancelWhere(const std::function<bool(const CoordinatorRecord&)>& isToGo);
     // `known`: the applications that the last session saw, where this one does not look.
     const SessionEnd& end(bool transfersSucceeded, const std::vector<std::string>& known);
 
     Device& device_;
     SyncClient& client_;
     SessionWatch& watch_;
+    TransferQueue& transfers_;
+    const SyncHost& host_;
     SyncEvents& events_;
     SessionFacts& facts_;
     const std::atomic<bool>& stopRequested_;
     PackageSender sender_;
+    std::vector<std::string> givenUp_;  // whose transfers have failed for good
+    std::set<std::string> takenUp_;     // whose packages an earlier session has delivered
     SessionEnd end_;
 };
 

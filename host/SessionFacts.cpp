@@ -34,6 +34,22 @@ std::optional<std::string> SessionFacts::firstFailure(const std::string& identif
     return found->second;
 }
 
+void SessionFacts::heldByClient(const std::string& identifier, CoordinationClient client) {
+    const std::lock_guard guard(mutex_);
+    holders_[identifier] = client;
+}
+
+std::optional<CoordinationClient> SessionFacts::holder(const std::string& identifier) const {
+    const std::lock_guard guard(mutex_);
+    const auto found = holders_.find(identifier);
+    return found != holders_.end() ? std::optional(found->second) : std::nullopt;
+}
+
+std::set<std::string> SessionFacts::installedIdentifiers() const {
+    const std::lock_guard guard(mutex_);
+    return installed_;
+}
+
 bool SessionFacts::wasInstalled(const std::string& identifier) const {
     const std::lock_guard guard(mutex_);
     return installed_.contains(identifier);

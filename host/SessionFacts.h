@@ -9,6 +9,7 @@
 #include <vector>
 
 #include "platform/DevicePolicyService.h"
+#include "platform/InstallPromises.h"
 
 namespace appsync {
 
@@ -23,9 +24,14 @@ class SessionFacts {
     void sent(std::uint64_t bytes);
     /// The plug-in was told whether it may; its last answer is what it went by.
     void policyAnswered(PolicyFeature feature, PolicyAnswer answer);
+    /// Another client of the coordination service has the install of it in hand.
+    void heldByClient(const std::string& identifier, CoordinationClient client);
 
     [[nodiscard]] std::optional<std::string> firstFailure(const std::string& identifier) const;
     [[nodiscard]] bool wasInstalled(const std::string& identifier) const;
+    /// Everything that was.
+    [[nodiscard]] std::set<std::string> installedIdentifiers() const;
+    [[nodiscard]] std::optional<CoordinationClient> holder(const std::string& identifier) const;
     [[nodiscard]] bool wasRemoved(const std::string& identifier) const;
     /// In the order in which the device asked.
     [[nodiscard]] std::vector<std::string> requests() const;
@@ -37,6 +43,7 @@ class SessionFacts {
     // Guarded by mutex_.
     std::map<std::string, std::string> failures_;
     std::set<std::string> installed_;
+    std::map<std::string, CoordinationClient> holders_;
     std::set<std::string> removed_;
     std::vector<std::string> requests_;
     std::uint64_t bytesSent_ = 0;

@@ -5,7 +5,9 @@
 
 #include "device/Device.h"
 #include "host/SessionFacts.h"
+#include "host/SyncDaemon.h"
 #include "host/SyncEvents.h"
+#include "host/WatchedCoordination.h"
 #include "platform/Platform.h"
 #include "platform/PropertyList.h"
 
@@ -13,6 +15,8 @@ namespace appsync {
 namespace {
 
 constexpr std::chrono::milliseconds kPollInterval{100};
+// Denials are looked for in the device's database, so less often.
+constexpr int kPollsForDenials = 2;
 constexpr std::chrono::seconds kUsualRetryInterval{30};
 
 std::string identifierOf(const PropertyList& options) {
@@ -123,9 +127,14 @@ SessionWatch::SessionWatch(Device& device, const Platform& platform, SyncEvents&
       registry_(std::make_unique<WatchedRegistry>(platform.registry, *this)),
       homeScreen_(std::make_unique<WatchedHomeScreen>(platform.homeScreen, *this)),
       policy_(std::make_unique<WatchedPolicy>(platform.policy, facts)),
+      gate_(std::make_shared<CallGate>()),
+      coordination_(watchCoordination(platform.coordination, *this, gate_)),
       poller_([this] { poll(); }) {}
 
+void SessionWatch::closeCoordination() { gate_->close(); }
+
 SessionWatch::~SessionWatch() {
+    closeCoordination();
     {
         const std::lock_guard guard(mutex_);
         isOver_ = true;
@@ -154,24 +163,38 @@ void SessionWatch::terminationDenied(const std::string& identifier) {
     const bool isKnown = status && status->denial;
     const auto nextTry =
         isKnown ? status->denial->nextTry : std::chrono::system_clock::now() + kUsualRetryInterval;
+    reportWaiting(identifier, nextTry);
+}
+
+void SessionWatch::reportWaiting(const std::string& identifier,
+                                 std::chrono::system_clock::time_point nextTry) {
     events_.report({SyncEventKind::Waiting, SyncPhase::Install, identifier, 0, sizeOf(identifier),
                     SyncState::Waiting, nextTry, identifier + " is running"});
 }
 
 void SessionWatch::installBegins(const std::string& identifier) {
     const std::uint64_t size = sizeOf(identifier);
-    events_.report({SyncEventKind::Started, SyncPhase::Install, identifier, 0, size,
-                    SyncState::Active, std::nullopt, ""});
+    reportBegin(identifier, size);
     const std::lock_guard guard(mutex_);
     installing_[identifier] = size;
+    concluded_.erase(identifier);
+}
+
+void SessionWatch::reportBegin(const std::string& identifier, std::uint64_t size) {
+    events_.report({SyncEventKind::Started, SyncPhase::Install, identifier, 0, size,
+                    SyncState::Active, std::nullopt, ""});
 }
 
 void SessionWatch::installEnded(const std::string& identifier, const Status& status) {
     const std::uint64_t size = sizeOf(identifier);
+    bool hasBegun = false;
     {
         const std::lock_guard guard(mutex_);
-        installing_.erase(identifier);
+        hasBegun = installing_.erase(identifier) > 0;
+        delivered_.erase(identifier);
+        concluded_.insert(identifier);
     }
+    if (!hasBegun) reportBegin(identifier, size);
     if (status) {
         facts_.installed(identifier);
     } else {
@@ -194,13 +217,105 @@ void SessionWatch::uninstallEnded(const std::string& identifier, const Status& s
                     status ? "" : status.error().description()});
 }
 
+void SessionWatch::packageDelivered(const std::string& identifier) {
+    {
+        const std::lock_guard guard(mutex_);
+        delivered_.try_emplace(identifier);
+    }
+    installBegins(identifier);
+}
+
+void SessionWatch::takeUpDelivered(const std::string& identifier) {
+    const std::uint64_t size = sizeOf(identifier);
+    const std::lock_guard guard(mutex_);
+    if (concluded_.contains(identifier)) return;  // meanwhile
+    if (!delivered_.try_emplace(identifier).second) return;
+    installing_[identifier] = size;
+    reportBegin(identifier, size);  // before anything else is told of it
+}
+
+void SessionWatch::coordinatorRefused(const std::string& identifier, const ErrorRecord& error) {
+    facts_.failed(identifier, error.description());
+}
+
+void SessionWatch::coordinatorIsOf(const std::string& identifier, CoordinationClient client) {
+    facts_.heldByClient(identifier, client);
+}
+
+void SessionWatch::installCancelled(const std::string& identifier, const ErrorRecord& reason,
+                                    CoordinationClient client) {
+    // The plug-in's own cancels follow from something that is known here already.
+    if (client != SyncClientID) facts_.failed(identifier, reason.description());
+    bool wasDelivered = false;
+    {
+        const std::lock_guard guard(mutex_);
+        wasDelivered = delivered_.contains(identifier);
+    }
+    if (wasDelivered) installEnded(identifier, reason);
+}
+
+void SessionWatch::settleDelivered() {
+    for (const std::string& identifier : deliveredIdentifiers()) {
+        installEnded(identifier, ErrorRecord::make(kTransferErrorDomain, kTransferNotTaken,
+                                                   "the device did not take its package: appsync "
+                                                   "log tells why"));
+    }
+}
+
+std::vector<std::string> SessionWatch::deliveredIdentifiers() const {
+    const std::lock_guard guard(mutex_);
+    std::vector<std::string> identifiers;
+    identifiers.reserve(delivered_.size());
+    for (const auto& [identifier, told] : delivered_) identifiers.push_back(identifier);
+    return identifiers;
+}
+
+void SessionWatch::uninstallBegins() {
+    const std::lock_guard guard(mutex_);
+    ++uninstalls_;
+}
+
+void SessionWatch::coordinatedUninstallEnded(const std::string& identifier, const Status& status) {
+    uninstallEnded(identifier, status);
+    {
+        const std::lock_guard guard(mutex_);
+        --uninstalls_;
+    }
+    ended_.notify_all();
+}
+
+void SessionWatch::waitForUninstalls(const std::atomic<bool>& stopRequested) {
+    std::unique_lock lock(mutex_);
+    while (!stopRequested &&
+           !ended_.wait_for(lock, kPollInterval, [this] { return uninstalls_ == 0; })) {
+    }
+}
+
 void SessionWatch::poll() {
+    int polls = 0;
     std::unique_lock lock(mutex_);
     while (!ended_.wait_for(lock, kPollInterval, [this] { return isOver_; })) {
         lock.unlock();
         reportProgress();
+        if (++polls % kPollsForDenials == 0) reportDenials();
         lock.lock();
     }
+}
+
+void SessionWatch::reportDenials() {
+    for (const std::string& identifier : deliveredIdentifiers()) reportDenial(identifier);
+}
+
+void SessionWatch::reportDenial(const std::string& identifier) {
+    const Result<ApplicationStatus> status = device_.status(identifier);
+    if (!status || !status->denial) return;
+    {
+        const std::lock_guard guard(mutex_);
+        const auto found = delivered_.find(identifier);
+        if (found == delivered_.end() || found->second.toldTry == status->denial->nextTry) return;
+        found->second.toldTry = status->denial->nextTry;
+    }
+    reportWaiting(identifier, status->denial->nextTry);
 }
 
 void SessionWatch::reportProgress() {

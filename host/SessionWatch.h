@@ -1,20 +1,26 @@
 #pragma once
 
 #include <atomic>
+#include <chrono>
 #include <condition_variable>
 #include <cstdint>
 #include <map>
 #include <memory>
 #include <mutex>
+#include <optional>
+#include <set>
 #include <string>
 #include <thread>
+#include <vector>
 
 #include "platform/AppRegistry.h"
 #include "platform/DevicePolicyService.h"
 #include "platform/HomeScreenService.h"
+#include "platform/InstallCoordinatorService.h"
 
 namespace appsync {
 
+class CallGate;
 class Device;
 class SessionFacts;
 class SyncEvents;
@@ -22,7 +28,8 @@ struct Platform;
 
 /// Sees what the plug-in does with the registry and the home screen, and what policy tells it,
 /// keeps it as facts, and reports it as events; how far installs have come it asks the device now
-/// and then. Hands everything on to the device's own services.
+/// and then. Of an install through the coordination service it sees the delivery, what the device
+/// tells of it and the end. Hands everything on to the device's own services.
 ///
 /// Callable on any thread. Must outlive the client; device, events and facts must outlive it.
 class SessionWatch {
@@ -36,11 +43,28 @@ class SessionWatch {
     [[nodiscard]] AppRegistry& registry() { return *registry_; }
     [[nodiscard]] HomeScreenService& homeScreen() { return *homeScreen_; }
     [[nodiscard]] DevicePolicyService& policy() { return *policy_; }
+    [[nodiscard]] InstallCoordinatorService& coordination() { return *coordination_; }
+
+    /// Nothing more of the coordination service reaches the client or this object; returns when
+    /// what was under way has. To be called before the client goes.
+    void closeCoordination();
 
     /// The number of bytes that stand for the whole install of an application.
     void setSize(const std::string& identifier, std::uint64_t bytes);
     /// While removing, an uninstall is one that the host has asked for.
     void setRemoving(bool removing) { removing_ = removing; }
+
+    /// Whether the client installs through coordinators.
+    [[nodiscard]] bool isCoordinated() const { return isCoordinated_; }
+    /// The package of an application is the coordination service's to install from now on.
+    void packageDelivered(const std::string& identifier);
+    /// The same for one whose package an earlier session has delivered.
+    void takeUpDelivered(const std::string& identifier);
+    /// Waits until the uninstalls that the client has handed to the coordination service have
+    /// ended, or a stop is requested.
+    void waitForUninstalls(const std::atomic<bool>& stopRequested);
+    /// No install is under way any more: what was delivered and never heard of again has failed.
+    void settleDelivered();
 
     // From the services.
     void placeholderRefused(const std::string& identifier, const ErrorRecord& error);
@@ -49,9 +73,29 @@ class SessionWatch {
     void installEnded(const std::string& identifier, const Status& status);
     void uninstallEnded(const std::string& identifier, const Status& status);
 
+    // From the coordination service.
+    void setCoordinated(bool isCoordinated) { isCoordinated_ = isCoordinated; }
+    void coordinatorRefused(const std::string& identifier, const ErrorRecord& error);
+    void coordinatorIsOf(const std::string& identifier, CoordinationClient client);
+    void installCancelled(const std::string& identifier, const ErrorRecord& reason,
+                          CoordinationClient client);
+    void uninstallBegins();
+    void coordinatedUninstallEnded(const std::string& identifier, const Status& status);
+
   private:
+    // An install of the coordination service's.
+    struct Delivered {
+        std::optional<std::chrono::system_clock::time_point> toldTry;
+    };
+
     void poll();
     void reportProgress();
+    void reportBegin(const std::string& identifier, std::uint64_t size);
+    void reportDenials();
+    void reportDenial(const std::string& identifier);
+    void reportWaiting(const std::string& identifier,
+                       std::chrono::system_clock::time_point nextTry);
+    [[nodiscard]] std::vector<std::string> deliveredIdentifiers() const;
     std::uint64_t sizeOf(const std::string& identifier) const;
 
     Device& device_;
@@ -60,13 +104,19 @@ class SessionWatch {
     std::unique_ptr<AppRegistry> registry_;
     std::unique_ptr<HomeScreenService> homeScreen_;
     std::unique_ptr<DevicePolicyService> policy_;
+    const std::shared_ptr<CallGate> gate_;
+    std::unique_ptr<InstallCoordinatorService> coordination_;
     std::atomic<bool> removing_ = false;
+    std::atomic<bool> isCoordinated_ = false;
 
     mutable std::mutex mutex_;
     std::condition_variable ended_;
     // Guarded by mutex_.
     std::map<std::string, std::uint64_t> sizes_;
     std::map<std::string, std::uint64_t> installing_;  // to their sizes
+    std::map<std::string, Delivered> delivered_;       // through coordinators
+    std::set<std::string> concluded_;                  // what was installed, or failed
+    std::size_t uninstalls_ = 0;                       // of the coordination service's, under way
     bool isOver_ = false;
 
     std::thread poller_;

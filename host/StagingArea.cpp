@@ -37,7 +37,9 @@ PropertyList todoEntry(std::string_view identifier, std::string_view operation) 
 }
 
 PropertyList installEntry(const PlannedInstall& planned) {
-    PropertyList entry = todoEntry(planned.identifier, "install");
+    // What has arrived is not asked for; the device notes in the same entry what becomes of it.
+    PropertyList entry =
+        todoEntry(planned.identifier, planned.isInstalledUnasked ? "DOWNLOADED" : "install");
     if (!planned.newVersion.empty()) entry.set("version", planned.newVersion);
     if (!planned.name.empty()) entry.set("name", planned.name);
     return entry;
@@ -207,8 +209,12 @@ StagedTodoList readStagedTodoList(Device& device) {
     return staged;
 }
 
-Status removeStaleTransfers(Device& device) {
-    const std::set<std::string> waiting = packagesThatWait(device);
+Status removeStaleTransfers(Device& device, const std::set<std::string>& arrived) {
+    std::set<std::string> waiting = packagesThatWait(device);
+    for (const std::string& identifier : arrived) {
+        waiting.insert(std::string(kPublicStaging) + "/" + identifier +
+                       std::string(kPackageSuffix));
+    }
     device.files().removeItem(std::string(kUnfinishedStagingArea)).ignore();
     for (const std::string& name : namesIn(device.root(), kPublicStaging)) {
         const std::string path = std::string(kPublicStaging) + "/" + name;

@@ -1,6 +1,7 @@
 #pragma once
 
 #include <optional>
+#include <set>
 #include <string>
 #include <string_view>
 
@@ -34,7 +35,8 @@ struct StagedTodoList {
 [[nodiscard]] StagedTodoList readStagedTodoList(Device& device);
 
 /// Removes what an interrupted session left among the received files: packages, but not those that
-/// wait for their application's data, and a staging area that was not finished.
-Status removeStaleTransfers(Device& device);
+/// wait for their application's data nor those of the applications that have `arrived`, which are
+/// the coordination service's; and a staging area that was not finished.
+Status removeStaleTransfers(Device& device, const std::set<std::string>& arrived);
 
 }  // namespace appsync

@@ -22,6 +22,7 @@
 #include "host/SessionFacts.h"
 #include "host/SessionWatch.h"
 #include "host/StagingArea.h"
+#include "host/StandingInstalls.h"
 #include "host/StopSignals.h"
 #include "host/SyncOutcome.h"
 #include "host/Text.h"
@@ -114,12 +115,20 @@ class SyncRun {
     Status makeThePlan() {
         const Result<std::vector<ApplicationRecord>> present = device_->applications();
         if (!present) return unusable(present.error());
-        if (!arguments_.isStaged) {
+        if (arguments_.isStaged) {
+            planStaged(*present);
+        } else {
             plan_ = makePlan(library_, *present, arguments_.plan);
-            return {};
         }
+        const Result<std::vector<CoordinatorRecord>> coordinators = device_->coordinators();
+        if (!coordinators) return unusable(coordinators.error());
+        standing_ = takeUp(plan_, *coordinators, *present);
+        return {};
+    }
+
+    void planStaged(const std::vector<ApplicationRecord>& present) {
         const StagedTodoList staged = readStagedTodoList(*device_);
-        plan_ = makeStagedPlan(staged.list, library_, *present);
+        plan_ = makeStagedPlan(staged.list, library_, present);
         mustNotRun_ = staged.isTooLarge;
         if (staged.error) {
             plan_.failed.push_back(
@@ -128,7 +137,6 @@ class SyncRun {
                      (mustNotRun_ ? "; split it, nothing was done"
                                   : "; write the staging area anew")});
         }
-        return {};
     }
 
     Status checkSpace() {
@@ -172,10 +180,12 @@ class SyncRun {
     }
 
     Status clearTheWay() {
+        Status status = cancelObsolete(*device_, standing_);
+        if (!status) return unusable(status.error());
         const Result<std::vector<std::string>> placeholders =
             device_->removeLeftoverSyncPlaceholders();
         if (!placeholders) return unusable(placeholders.error());
-        Status status = removeStaleTransfers(*device_);
+        status = removeStaleTransfers(*device_, standing_.arrived);
         if (status && !arguments_.isStaged) status = writeStagingArea(*device_, plan_, library_);
         if (!status) return status.error().withContext("cannot prepare the device for the sync");
         return {};
@@ -184,9 +194,17 @@ class SyncRun {
     Result<int> hold() {
         Result<std::unique_ptr<PlugIn>> plugIn = PlugIn::load(*device_, events_, facts_);
         if (!plugIn) return plugIn.error();
+        for (const auto* installs : {&plan_.install, &plan_.update}) {
+            for (const PlannedInstall& each : *installs) {
+                if (each.hasArrived) (*plugIn)->watch().setSize(each.identifier, each.bytes);
+            }
+        }
         Session session(*device_, **plugIn, events_, facts_, signals_->stopRequested());
         const SessionEnd end = session.sync(
-            [this](const std::string& identifier) { return packageFile(library_, identifier); });
+            {[this](const std::string& identifier) { return packageFile(library_, identifier); },
+             [this](const std::string& identifier) {
+                 return !standing_.arrived.contains(identifier);
+             }});
         Result<SessionAftermath> aftermath = aftermathOf(*device_, end, facts_);
         if (aftermath) return finish(summarize(plan_, facts_, *aftermath));
         finish(summarizeFailed(plan_, facts_, aftermath.error()));
@@ -225,6 +243,7 @@ class SyncRun {
     Library library_;
     SyncPlan plan_;
     SyncPlan allowed_;  // what of it policy lets happen
+    StandingInstalls standing_;
     SpaceCheck space_;
     bool mustNotRun_ = false;
     const Clock::time_point begin_ = Clock::now();

@@ -3,6 +3,7 @@
 #include <string>
 #include <string_view>
 
+#include "host/TransferQueue.h"
 #include "platform/SyncHost.h"
 
 namespace appsync {
@@ -16,6 +17,9 @@ enum TransferErrorCode : int {
     kTransferNoPackage = 2,    // the library has no package of that identifier
     kTransferIllegalName = 3,  // no legal identifier
     kTransferCutShort = 4,     // the package became shorter while it was sent: recoverable
+    kTransferCancelled = 5,    // the device wants it no more
+    kTransferNotUnderWay = 6,  // what the device speaks of is not to be sent
+    kTransferNotTaken = 7,     // the device made nothing of what it was sent
 };
 
 /// The sync daemon that loads the plug-in.
@@ -31,6 +35,13 @@ class SyncDaemon : public SyncHost {
     /// more memory or descriptors, a call that was interrupted or timed out). Everything else is
     /// not: a package that is missing or refused stays so.
     [[nodiscard]] bool isRecoverableError(const ErrorRecord& error) const override;
+
+    [[nodiscard]] TransferService* transferService() override { return &transfers_; }
+    /// The same, for the session whose transfers they are.
+    [[nodiscard]] TransferQueue& transfers() { return transfers_; }
+
+  private:
+    TransferQueue transfers_;
 };
 
 }  // namespace appsync

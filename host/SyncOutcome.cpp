@@ -10,6 +10,7 @@
 #include "host/Problem.h"
 #include "host/Session.h"
 #include "host/SessionFacts.h"
+#include "host/StandingInstalls.h"
 #include "host/SyncPlan.h"
 
 namespace appsync {
@@ -43,6 +44,7 @@ class Summarizer {
         for (const PlannedInstall& each : plan_.install) judge(each, summary_.installed);
         for (const PlannedInstall& each : plan_.update) judge(each, summary_.updated);
         judgeUnplanned();
+        addUnplannedInstalls();
         if (aftermath_.isInterrupted && summary_.failed.empty()) addSessionFailure(interruption());
         if (aftermath_.failure) addSessionFailure(*aftermath_.failure);
         summary_.incomplete = !summary_.failed.empty() || hasUnmet(summary_.skipped);
@@ -92,10 +94,22 @@ class Summarizer {
         }
     }
 
+    // What an interrupted session had brought, and nobody asks for any more.
+    void addUnplannedInstalls() {
+        for (const std::string& identifier : facts_.installedIdentifiers()) {
+            const bool isThere = versions_.contains(identifier) && !installs_.contains(identifier);
+            if (isThere) summary_.installed.push_back(identifier);
+        }
+    }
+
     void undone(const std::string& identifier, bool isAllowed, std::string_view whyForbidden,
                 const std::string& whyElse) {
         if (const auto cause = facts_.firstFailure(identifier)) return fail(identifier, *cause);
         if (aftermath_.failure) return fail(identifier, *aftermath_.failure);
+        if (const auto client = facts_.holder(identifier)) {
+            summary_.skipped.push_back({identifier, heldSentence(*client), true});
+            return;
+        }
         if (!isAllowed) {
             summary_.skipped.push_back({identifier, std::string(whyForbidden), true});
             return;

@@ -218,11 +218,12 @@ std::uint64_t total(const SyncPlan& plan, Number number) {
 }  // namespace
 
 std::uint64_t SyncPlan::bytes() const {
-    return total(*this, [](const PlannedInstall& each) { return each.bytes; });
+    return total(*this,
+                 [](const PlannedInstall& each) { return each.hasArrived ? 0 : each.bytes; });
 }
 
 std::uint64_t SyncPlan::needed() const {
-    return total(*this, [](const PlannedInstall& each) { return each.bytes + each.unpackedBytes; });
+    return bytes() + total(*this, [](const PlannedInstall& each) { return each.unpackedBytes; });
 }
 
 std::string SpaceCheck::description() const {

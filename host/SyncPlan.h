@@ -28,6 +28,8 @@ struct PlannedInstall {
     std::string newVersion;
     std::uint64_t bytes = 0;          // that travel
     std::uint64_t unpackedBytes = 0;  // that it takes when installed
+    bool hasArrived = false;          // its package is on the device already, and travels no more
+    bool isInstalledUnasked = false;  // the device installs it with nothing more being done
 };
 
 /// Why policy keeps something from being done.
@@ -64,7 +66,7 @@ struct SyncPlan {
     std::uint64_t reclaimed = 0;
 
     [[nodiscard]] bool empty() const { return install.empty() && update.empty() && remove.empty(); }
-    /// Bytes of all packages that travel.
+    /// Bytes of all packages that are still to travel.
     [[nodiscard]] std::uint64_t bytes() const;
     /// Bytes that the device must have free: every package, and every application unpacked. An
     /// update too is unpacked beside the version that it replaces.

@@ -8,7 +8,53 @@ namespace appsync {
 namespace {
 
 AwaitedThing awaited(std::string what, std::string who, std::string sentence) {
-    return {std::move(what), std::move(who), std::nullopt, std::move(sentence)};
+    return {std::move(what), std::move(who), std::nullopt, std::nullopt, std::move(sentence)};
+}
+
+AwaitedThing awaitedOfPolicy() {
+    return awaited("policy", "device",
+                   "for device policy, which does not allow installing applications: allow it "
+                   "(appsync set DEVICE installation=yes)");
+}
+
+bool isOfRestore(const CoordinatorRecord& coordinator) {
+    return coordinator.kind.starts_with("restoring");
+}
+
+std::optional<std::string> missingPromise(const CoordinatorRecord& coordinator) {
+    for (const PromiseRecord& promise : coordinator.promises) {
+        if (!promise.complete && !promise.cancelled) return promise.name;
+    }
+    return std::nullopt;
+}
+
+AwaitedThing awaitedOfComplete(bool sessionUnderWay) {
+    if (sessionUnderWay) return awaited("install", "device", "for its install, which is under way");
+    return awaited("sync", "host",
+                   "for the next session, in which the device installs it, as everything is "
+                   "there: run appsync sync");
+}
+
+AwaitedThing awaitedOfClient(const CoordinatorRecord& coordinator, bool sessionUnderWay) {
+    const std::string what = coordinator.waitsFor;
+    const auto client = coordinator.waitsForClient;
+    if (!client) return awaited("promise", "client", "as " + what);
+    if (*client == AppStoreClientID) {
+        return awaited("store", "store", "for the store: " + what + " (appsync store)");
+    }
+    if (*client != SyncClientID) {
+        return awaited("promise", "client " + std::to_string(*client),
+                       "as " + what + ": wait, or cancel it (appsync coordinator)");
+    }
+    if (sessionUnderWay) return awaited("transfer", "host", "for the host: " + what);
+    return awaited("sync", "host", "for the next sync: " + what + ": run appsync sync again");
+}
+
+AwaitedThing awaitedOfCoordinator(const CoordinatorRecord& coordinator, bool sessionUnderWay) {
+    if (coordinator.isComplete) return awaitedOfComplete(sessionUnderWay);
+    AwaitedThing thing = awaitedOfClient(coordinator, sessionUnderWay);
+    thing.promise = missingPromise(coordinator);
+    return thing;
 }
 
 AwaitedThing awaitedOfSync(const ApplicationRecord& placeholder, bool sessionUnderWay) {
@@ -35,8 +81,19 @@ std::optional<AwaitedThing> awaitedOfPlaceholder(const ApplicationRecord& placeh
     }
 }
 
+// Whether what it waits for is something that policy keeps from happening.
+bool isForbidden(const ApplicationStatus& status, const DeviceSettings& settings) {
+    if (settings.installation != PolicyAnswer::No) return false;
+    if (status.coordinator) {
+        return !isOfRestore(*status.coordinator) && !status.coordinator->isComplete;
+    }
+    if (status.placeholder) return status.placeholder->installType == kInstallTypeSync;
+    return !status.installed;
+}
+
 std::optional<AwaitedThing> awaitedThing(const std::string& identifier,
-                                         const ApplicationStatus& status) {
+                                         const ApplicationStatus& status,
+                                         const DeviceSettings& settings) {
     if (status.denial) {
         AwaitedThing thing =
             awaited("termination", identifier,
@@ -48,6 +105,10 @@ std::optional<AwaitedThing> awaitedThing(const std::string& identifier,
     if (status.awaitsRestoreData) {
         return awaited("restore data", "host",
                        "for its data: send it (appsync send --restore --parts 2)");
+    }
+    if (isForbidden(status, settings)) return awaitedOfPolicy();
+    if (status.coordinator) {
+        return awaitedOfCoordinator(*status.coordinator, status.sessionUnderWay);
     }
     if (!status.placeholder) return std::nullopt;
     return awaitedOfPlaceholder(*status.placeholder, status.sessionUnderWay);
@@ -73,12 +134,17 @@ std::string stateSentence(const ApplicationStatus& status) {
 
 }  // namespace
 
-WhyAnswer explain(const std::string& identifier, const ApplicationStatus& status) {
+WhyAnswer explain(const std::string& identifier, const ApplicationStatus& status,
+                  const DeviceSettings& settings) {
     WhyAnswer answer;
     answer.identifier = identifier;
     answer.state = status.installed ? "installed" : status.placeholder ? "placeholder" : "absent";
-    answer.waitsFor = awaitedThing(identifier, status);
-    if (status.lastFailure) answer.lastError = status.lastFailure->error.description();
+    answer.waitsFor = awaitedThing(identifier, status, settings);
+    if (status.lastFailure) {
+        answer.lastError = status.lastFailure->error.description();
+    } else if (status.coordinator && status.coordinator->error) {
+        answer.lastError = status.coordinator->error->description();
+    }
     answer.sentence = stateSentence(status);
     return answer;
 }

@@ -7,13 +7,18 @@
 namespace appsync {
 
 struct ApplicationStatus;
+struct DeviceSettings;
 
 /// What an application waits for.
 struct AwaitedThing {
-    /// "termination", "transfer", "install", "sync", "restore data" or "store".
+    /// "termination", "policy", "transfer", "install", "sync", "restore data", "store" or
+    /// "promise".
     std::string what;
-    /// Who has to do something: an identifier, "host", "device" or "store".
+    /// Who has to do something: an identifier, "host", "device", "store", or "client N" of the
+    /// coordination service.
     std::string who;
+    /// The promise of a coordinated install that is not kept yet, where it is one that is missing.
+    std::optional<std::string> promise;
     std::optional<std::chrono::system_clock::time_point> nextTry;
     /// The same as a sentence, with what a person can do.
     std::string sentence;
@@ -30,7 +35,8 @@ struct WhyAnswer {
     std::string sentence;
 };
 
-[[nodiscard]] WhyAnswer explain(const std::string& identifier, const ApplicationStatus& status);
+[[nodiscard]] WhyAnswer explain(const std::string& identifier, const ApplicationStatus& status,
+                                const DeviceSettings& settings);
 
 /// The answer for people; ends with a line end.
 [[nodiscard]] std::string whyText(const WhyAnswer& answer);

@@ -38,6 +38,10 @@ class NotificationCenter {
                              SuspensionBehavior behavior) = 0;
     /// Ends that. The observer is known by its address: it may be in its destructor.
     virtual void removeObserver(const void* observer, std::string_view name) = 0;
+
+    /// Calls every observer of the name. For the process that hosts the plug-in: it says so that it
+    /// has started up.
+    virtual void post(std::string_view name) = 0;
 };
 
 }  // namespace appsync

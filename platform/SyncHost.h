@@ -5,6 +5,7 @@
 namespace appsync {
 
 struct ErrorRecord;
+class TransferService;
 
 /// What the process that loaded the plug-in answers. Callable on any thread; never fails.
 class SyncHost {
@@ -20,6 +21,9 @@ class SyncHost {
     /// The host's recoverable-error test: true when the same operation may succeed if it is tried
     /// again (a transport that broke, for instance).
     [[nodiscard]] virtual bool isRecoverableError(const ErrorRecord& error) const = 0;
+
+    /// The host's device service; null where there is none. It lives as long as the host.
+    [[nodiscard]] virtual TransferService* transferService() { return nullptr; }
 };
 
 }  // namespace appsync

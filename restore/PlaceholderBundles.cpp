@@ -5,6 +5,7 @@
 #include "client/PropertyListFile.h"
 #include "platform/IconRenderer.h"
 #include "platform/InstallTransactionLog.h"
+#include "restore/PlaceholderBundle.h"
 
 namespace appsync {
 
@@ -13,12 +14,9 @@ namespace {
 // The directory, below that for temporary files, in which placeholder bundles are built.
 constexpr std::string_view kPlaceholderDirectory = "com.korvu.trd.Apps";
 constexpr std::string_view kBundleExtension = ".app";
-constexpr std::string_view kOwner = "mobile";
-constexpr std::string_view kIconFile = "Icon.png";
 constexpr std::string_view kInfoFile = "Info.plist";
 
 constexpr std::string_view kPresselKey = "VKPresselApp";
-constexpr std::string_view kLaunchProhibitedKey = "RGApplicationLaunchProhibited";
 
 constexpr std::string_view kRestoreScenario = "Vessik App Restore";
 constexpr std::string_view kDirectoryFailed = "Failed to create app directory";
@@ -27,13 +25,6 @@ constexpr std::string_view kPlaceholderInstalled = "Installed placeholder";
 constexpr std::string_view kPlaceholderFailed = "Failed to install placeholder";
 
 constexpr std::string_view kPngType = "public.png";
-
-FileAttributes mobileAttributes() { return {std::string(kOwner), std::string(kOwner)}; }
-
-bool flagAt(const PropertyList& map, std::string_view key) {
-    const PropertyList* flag = map.find(key);
-    return flag != nullptr && flag->booleanConversion().value_or(false);
-}
 
 /// The info dictionary that came with the asset; empty when there is none.
 PropertyList infoOf(const Platform& platform, const SyncAsset& asset) {
@@ -48,7 +39,7 @@ PropertyList placeholderInfo(const SyncAsset& asset, const PropertyList& assetIn
     // The same string on purpose: a placeholder has no executable.
     info.set(BundleExecutableKey, *asset.prettyName);
     info.set(BundleDisplayNameKey, *asset.prettyName);
-    info.set(BundleIconFileKey, kIconFile);
+    info.set(BundleIconFileKey, kPlaceholderIconFile);
     info.set(kPresselKey, flagAt(assetInfo, kPresselKey));
     info.set(kLaunchProhibitedKey, flagAt(assetInfo, kLaunchProhibitedKey));
     return info;
@@ -150,7 +141,7 @@ void AppsClient::_createPlaceHolderApplication(const SyncAsset& asset) {
     if (asset.prettyName.value_or("").empty() || asset.identifier.empty()) return;
 
     const std::string directory = placeholderAppPathForBundleIdentifier(asset.identifier);
-    if (!createPlaceHolderPath(directory, asset.identifier, mobileAttributes())) return;
+    if (!createPlaceHolderPath(directory, asset.identifier, placeholderFileAttributes())) return;
     copyIcon(asset, directory);
     const PropertyList info = placeholderInfo(asset, assetInfo);
     const Status written =
@@ -163,7 +154,8 @@ void AppsClient::_createPlaceHolderApplication(const SyncAsset& asset) {
 void AppsClient::copyIcon(const SyncAsset& asset, const std::string& directory) const {
     if (!asset.icon) return;
     const std::string& source = asset.icon->path();
-    const std::string destination = formatPath(kInDirectoryFormat, {directory, kIconFile});
+    const std::string destination =
+        formatPath(kInDirectoryFormat, {directory, kPlaceholderIconFile});
     const Status copied = platform_.files.copyItem(source, destination);
     if (copied) return;
     log_(Level::Error, "%s|Copying icon from %{public}@ to %{public}@ failed: %{public}@", source,

@@ -11,8 +11,43 @@ namespace {
 
 using Methods = std::set<std::string, std::less<>>;
 
-const std::map<std::string, Methods, std::less<>>& knownCalls() {
-    static const std::map<std::string, Methods, std::less<>> calls{
+/// The methods of each service.
+using Calls = std::map<std::string, Methods, std::less<>>;
+
+const Calls& coordinationCalls() {
+    static const Calls calls{
+        {"InstallCoordinator",
+         {"bundleIdentifier", "creatorIdentifier", "error", "setObserver", "hasInstallOptions",
+          "setInstallOptions", "hasInitialODRAssetPromises", "setInitialODRAssetPromises",
+          "appAssetPromise", "setAppAssetPromise", "appAssetPromiseResponsibleClient",
+          "setAppAssetPromiseResponsibleClient", "hasUserDataPromise", "setUserDataPromise",
+          "hasPlaceholderPromise", "setPlaceholderPromise", "cancelForReason"}},
+        {"InstallCoordinatorObserver",
+         {"promiseDidBeginFulfillmentWithIdentifier", "coordinatorDidInstallPlaceholder",
+          "coordinatorDidCompleteSuccessfully", "coordinatorCanceledWithReason",
+          "coordinatorShouldPrioritize"}},
+        {"InstallCoordinatorService",
+         {"isCoordinationEnabled", "coordinator", "existingCoordinator", "makePathTransferPromise",
+          "makeOutOfBandPromise", "makeAppPlaceholder", "uninstallApp", "userPresentableError",
+          "makeAppInstallObserver"}},
+        {"InstallPlaceholder",
+         {"setIconPromise", "setAttributes", "setMetadata", "setSinf", "setConfigurationComplete",
+          "cancelForReason"}},
+        {"OutOfBandPromise",
+         {"name", "clientIdentifier", "percentComplete", "setPercentComplete", "isComplete",
+          "setComplete", "cancelForReason"}},
+        {"PathTransferPromise",
+         {"name", "clientIdentifier", "percentComplete", "setPercentComplete", "isComplete",
+          "setComplete", "cancelForReason", "transferPath", "setTransferPath"}},
+        {"TransferService",
+         {"canCancelTransfers", "cancelTransferForFailedAsset", "canPrioritizeAssets",
+          "prioritizeAsset"}},
+    };
+    return calls;
+}
+
+const Calls& otherCalls() {
+    static const Calls calls{
         {"AppRegistry",
          {"proxyForIdentifier", "isApplicationInstalled", "enumerateBundles", "installProgress",
           "finishInstallPhase", "installPackage", "installPlaceholderBundle",
@@ -29,7 +64,6 @@ const std::map<std::string, Methods, std::less<>>& knownCalls() {
         {"HomeScreenService", {"blockableConnection", "takeTerminationAssertion"}},
         {"IconRenderer", {"openBundle", "homeScreenIcon", "createImageDestination"}},
         {"ImageDestination", {"addImage", "finalize"}},
-        {"InstallCoordinatorService", {"isCoordinationEnabled"}},
         {"InstallProgressRecord",
          {"installState", "setInstallState", "installPhase", "setInstallPhase", "totalUnitCount",
           "setTotalUnitCount", "completedUnitCount", "setCompletedUnitCount", "cancel",
@@ -45,7 +79,7 @@ const std::map<std::string, Methods, std::less<>>& knownCalls() {
         {"PropertyListSerialization", {"parse", "serialize"}},
         {"Semaphore", {"signal", "wait"}},
         {"SerialQueue", {"sync"}},
-        {"SyncHost", {"mainBundleIdentifier", "isRecoverableError"}},
+        {"SyncHost", {"mainBundleIdentifier", "isRecoverableError", "transferService"}},
         {"TerminationAssertion", {"release"}},
         {"WaitGroup", {"enter", "leave", "wait", "waitFor"}},
         {"WorkQueues",
@@ -57,8 +91,11 @@ const std::map<std::string, Methods, std::less<>>& knownCalls() {
 
 /// Null when there is no such service.
 const Methods* methodsOf(std::string_view service) {
-    const auto found = knownCalls().find(withoutNumber(service));
-    return found == knownCalls().end() ? nullptr : &found->second;
+    for (const Calls* calls : {&coordinationCalls(), &otherCalls()}) {
+        const auto found = calls->find(withoutNumber(service));
+        if (found != calls->end()) return &found->second;
+    }
+    return nullptr;
 }
 
 }  // namespace

@@ -23,12 +23,6 @@ bool isLegalCharacter(char c) {
            c == '-' || c == '_';
 }
 
-bool isLegalIdentifier(std::string_view identifier) {
-    return !identifier.empty() && identifier.size() <= kLongestIdentifier && identifier != "." &&
-           identifier != ".." &&
-           std::all_of(identifier.begin(), identifier.end(), isLegalCharacter);
-}
-
 ErrorRecord refused(const std::string& why) {
     return ErrorRecord::make(kRegistryErrorDomain, kRefused, why);
 }
@@ -45,7 +39,8 @@ Result<std::string> checkedIdentifier(const PropertyList& options, std::string_v
     }
     const std::string* identifier = options.findString(BundleIdentifierKey);
     if (identifier == nullptr) return refused("the options name no bundle identifier");
-    if (!isLegalIdentifier(*identifier)) return refused("'" + *identifier + "' is no identifier");
+    if (!SimulatedAppRegistry::isLegalIdentifier(*identifier))
+        return refused("'" + *identifier + "' is no identifier");
     return *identifier;
 }
 
@@ -172,16 +167,20 @@ Status SimulatedAppRegistry::installPackageNow(const FileURL& package,
                                                const PropertyList& options) {
     const Result<std::string> identifier = checkedIdentifier(options, PackageTypeCustomer);
     if (!identifier) return identifier.error();
+    return install(*identifier, package.path());
+}
+
+Status SimulatedAppRegistry::install(const std::string& identifier, const std::string& path) {
     if (installDuration_ > SimulatedTime::zero()) {
-        recorder_.scheduler().waitFor("the install of " + *identifier, installDuration_,
+        recorder_.scheduler().waitFor("the install of " + identifier, installDuration_,
                                       [] { return false; });
     }
-    Status status = takeFailure(installFailures_, *identifier);
-    if (status) status = checkPackage(*identifier, package.path());
+    Status status = takeFailure(installFailures_, identifier);
+    if (status) status = checkPackage(identifier, path);
     if (status) {
-        commitPackage(*identifier);
+        commitPackage(identifier);
     } else {
-        markFailed(*identifier);
+        markFailed(identifier);
     }
     return status;
 }
@@ -326,14 +325,15 @@ void SimulatedAppRegistry::startProgress(const std::string& identifier, Applicat
     if (application.progress != nullptr) return;
     application.progress = std::make_shared<SimulatedProgressRecord>(recorder_, identifier,
                                                                      [this] { reportChange(); });
-    installOrder_.push_back(identifier);
+    application.installNumber = ++installsBegun_;
+    installs_.emplace(application.installNumber, identifier);
     reportChange();
 }
 
 void SimulatedAppRegistry::endProgress(Application& application, std::uint64_t state) {
     if (application.progress == nullptr) return;
     application.progress->end(state);
-    std::erase(installOrder_, application.progress->identifier());
+    installs_.erase(application.installNumber);
     application.progress.reset();
     reportChange();
 }
@@ -411,7 +411,7 @@ void SimulatedAppRegistry::deliverCancel(Subscription& subscription,
 SimulatedAppRegistry::Report SimulatedAppRegistry::report() const {
     if (scriptedReport_) return *scriptedReport_;
     Report result;
-    for (const std::string& identifier : installOrder_) {
+    for (const auto& [number, identifier] : installs_) {
         const Application* application = find(identifier);
         if (application == nullptr || application->progress == nullptr) continue;
         const std::uint64_t state = application->progress->values().state;
@@ -463,6 +463,40 @@ void SimulatedAppRegistry::cancelInstalls(const std::vector<std::string>& identi
     }
     reportChange();
     reportCancel(cancelled);
+}
+
+// Other services.
+
+bool SimulatedAppRegistry::isLegalIdentifier(std::string_view identifier) {
+    return !identifier.empty() && identifier.size() <= kLongestIdentifier && identifier != "." &&
+           identifier != ".." &&
+           std::all_of(identifier.begin(), identifier.end(), isLegalCharacter);
+}
+
+Status SimulatedAppRegistry::showPlaceholder(AppProxy proxy) {
+    const std::string identifier = proxy.applicationIdentifier;
+    if (Status failure = takeFailure(placeholderFailures_, identifier); !failure) return failure;
+    const AppProxy usual = proxyWithUsualPaths(identifier, true);
+    proxy.bundlePath = usual.bundlePath;
+    proxy.bundleContainerPath = usual.bundleContainerPath;
+    proxy.state = usual.state;
+    if (const auto application = installed(identifier)) {
+        proxy.applicationType = application->applicationType;
+    }
+    add(std::move(proxy));
+    startProgress(identifier, applications_[identifier]);
+    return {};
+}
+
+void SimulatedAppRegistry::hidePlaceholder(const std::string& identifier) {
+    Application* application = find(identifier);
+    if (application == nullptr || !application->placeholder) return;
+    removePlaceholder(*application, kInstallStateCanceled);
+    dropIfEmpty(identifier);
+}
+
+Status SimulatedAppRegistry::uninstall(const std::string& identifier) {
+    return uninstallNow(identifier, {});
 }
 
 // The test's side.

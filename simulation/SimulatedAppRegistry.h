@@ -80,6 +80,18 @@ class SimulatedAppRegistry : public AppRegistry {
     [[nodiscard]] std::vector<std::string> placeholderIdentifiers() const;
     [[nodiscard]] std::size_t observers() const { return subscriptions_.size(); }
 
+    // What other services of the device do with it.
+    [[nodiscard]] static bool isLegalIdentifier(std::string_view identifier);
+    /// Installs the file at a path as the package of the identifier; fails as `installPackage`
+    /// does.
+    Status install(const std::string& identifier, const std::string& path);
+    /// Shows the placeholder with the usual paths; fails as `failNextPlaceholderInstall` says.
+    Status showPlaceholder(AppProxy proxy);
+    /// Takes away the placeholder, if there is one: its install was cancelled or has failed.
+    void hidePlaceholder(const std::string& identifier);
+    /// Fails as `uninstallApplication` does.
+    Status uninstall(const std::string& identifier);
+
     // Answers. Each identifier's failures are used up one by one, in the order given.
     void failNextInstall(const std::string& identifier, ErrorRecord error);
     void failNextPlaceholderInstall(const std::string& identifier, ErrorRecord error);
@@ -99,6 +111,7 @@ class SimulatedAppRegistry : public AppRegistry {
         std::optional<AppProxy> installed;
         std::optional<AppProxy> placeholder;
         std::shared_ptr<SimulatedProgressRecord> progress;
+        std::uint64_t installNumber = 0;  // of the install that `progress` is of
     };
     struct Report {
         std::vector<AppProxy> prioritized;
@@ -140,7 +153,8 @@ class SimulatedAppRegistry : public AppRegistry {
     SimulatedFileSystem& files_;
     PropertyListSerialization& codec_;
     std::map<std::string, Application> applications_;
-    std::vector<std::string> installOrder_;  // of the installs under way
+    std::map<std::uint64_t, std::string> installs_;  // those under way, by their numbers
+    std::uint64_t installsBegun_ = 0;
     std::map<std::string, PackageContents> packages_;
     Failures installFailures_;
     Failures placeholderFailures_;

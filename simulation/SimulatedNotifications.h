@@ -50,7 +50,7 @@ class SimulatedNotificationCenter : public NotificationCenter {
 
     // The test's side; not recorded.
     /// Somebody posts: everyone who observes the name will be called.
-    void post(std::string_view name);
+    void post(std::string_view name) override;
     [[nodiscard]] std::size_t observers(std::string_view name) const;
 
   private:

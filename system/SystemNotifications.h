@@ -58,7 +58,7 @@ class SystemNotificationCenter : public NotificationCenter {
     void removeObserver(const void* observer, std::string_view name) override;
 
     /// Calls every observer of the name, on this thread, in the order in which they were added.
-    void post(std::string_view name);
+    void post(std::string_view name) override;
 
   private:
     struct Registration {

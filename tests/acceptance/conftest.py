@@ -41,10 +41,12 @@ class Command:
 class Device:
     """A device directory and what the command says of it."""
 
-    def __init__(self, appsync, path):
+    def __init__(self, appsync, path, coordination="off"):
         self.appsync = appsync
         self.path = str(path)
-        appsync("create", self.path)
+        self.coordination = coordination
+        self.is_coordinated = coordination == "on"
+        appsync("create", self.path, "--coordination", coordination)
 
     def apps(self):
         return {app["identifier"]: app for app in self.appsync.json("apps", self.path)
@@ -83,9 +85,19 @@ def appsync():
     return Command(os.path.abspath(program))
 
 
+@pytest.fixture(params=["off", "on"])
+def coordination(request):
+    """Every scenario runs on both paths: direct, and through coordinators."""
+    return request.param
+
+
+# For what is the same on both paths, and takes long.
+ON_ONE_PATH = pytest.mark.parametrize("coordination", ["off"], indirect=True)
+
+
 @pytest.fixture
-def device(appsync, tmp_path):
-    return Device(appsync, tmp_path / "device")
+def device(appsync, tmp_path, coordination):
+    return Device(appsync, tmp_path / "device", coordination)
 
 
 @pytest.fixture

@@ -3,6 +3,7 @@
 #include <array>
 
 #include "platform/FileSystem.h"
+#include "platform/InstallCoordinatorService.h"
 #include "tests/device/DevicePlatformFixture.h"
 
 namespace appsync {

@@ -23,7 +23,7 @@ ApplicationRecord application(bool isPlaceholder, std::uint64_t installType) {
 TEST(WhyAnswer, AnInstalledApplicationWaitsForNothing) {
     ApplicationStatus status;
     status.installed = application(false, kInstallTypeSync);
-    const WhyAnswer answer = explain("com.a", status);
+    const WhyAnswer answer = explain("com.a", status, {});
     EXPECT_EQ(answer.state, "installed");
     EXPECT_FALSE(answer.waitsFor);
     EXPECT_EQ(whyText(answer), "com.a is installed 2.\nIt waits for nothing.\n");
@@ -35,7 +35,7 @@ TEST(WhyAnswer, NamesTheRunningApplicationAndTheNextTry) {
     status.placeholder = application(true, kInstallTypeSync);
     status.isRunning = true;
     status.denial = TerminationDenial{{}, WallTime{std::chrono::seconds{30}}};
-    const WhyAnswer answer = explain("com.a", status);
+    const WhyAnswer answer = explain("com.a", status, {});
     ASSERT_TRUE(answer.waitsFor);
     EXPECT_EQ(answer.waitsFor->what, "termination");
     EXPECT_EQ(answer.waitsFor->who, "com.a");
@@ -45,32 +45,92 @@ TEST(WhyAnswer, NamesTheRunningApplicationAndTheNextTry) {
 TEST(WhyAnswer, APlaceholderOfASyncWaitsForTheHost) {
     ApplicationStatus status;
     status.placeholder = application(true, kInstallTypeSync);
-    EXPECT_EQ(explain("com.a", status).waitsFor->what, "sync");
+    EXPECT_EQ(explain("com.a", status, {}).waitsFor->what, "sync");
     status.sessionUnderWay = true;
-    EXPECT_EQ(explain("com.a", status).waitsFor->what, "transfer");
+    EXPECT_EQ(explain("com.a", status, {}).waitsFor->what, "transfer");
     status.placeholder->progress = InstallProgress{};
     status.placeholder->progress->phase = kInstallPhaseInstalling;
-    EXPECT_EQ(explain("com.a", status).waitsFor->what, "install");
+    EXPECT_EQ(explain("com.a", status, {}).waitsFor->what, "install");
 }
 
 TEST(WhyAnswer, AnOffloadedApplicationWaitsForTheStore) {
     ApplicationStatus status;
     status.placeholder = application(true, kInstallTypeIntentionalDowngrade);
-    EXPECT_EQ(explain("com.a", status).state, "placeholder");
-    EXPECT_EQ(explain("com.a", status).waitsFor->who, "store");
+    EXPECT_EQ(explain("com.a", status, {}).state, "placeholder");
+    EXPECT_EQ(explain("com.a", status, {}).waitsFor->who, "store");
 }
 
 TEST(WhyAnswer, ARestoreWaitsForItsData) {
     ApplicationStatus status;
     status.awaitsRestoreData = true;
-    EXPECT_EQ(explain("com.a", status).waitsFor->what, "restore data");
+    EXPECT_EQ(explain("com.a", status, {}).waitsFor->what, "restore data");
+}
+
+CoordinatorRecord coordinator(CoordinationClient missing) {
+    CoordinatorRecord record;
+    record.identifier = "com.a";
+    record.kind = "initiating";
+    record.client = SyncClientID;
+    record.promises = {{"com.a-Asset", false, 0.5, missing, false}};
+    record.waitsFor = "client N has yet to deliver the package";
+    record.waitsForClient = missing;
+    return record;
+}
+
+TEST(WhyAnswer, NamesThePromiseOfTheHostThatIsMissing) {
+    ApplicationStatus status;
+    status.coordinator = coordinator(SyncClientID);
+    EXPECT_EQ(explain("com.a", status, {}).waitsFor->what, "sync");
+    status.sessionUnderWay = true;
+    const WhyAnswer answer = explain("com.a", status, {});
+    EXPECT_EQ(answer.waitsFor->what, "transfer");
+    EXPECT_EQ(answer.waitsFor->who, "host");
+    EXPECT_EQ(answer.waitsFor->promise, "com.a-Asset");
+    EXPECT_THAT(whyText(answer), HasSubstr("has yet to deliver the package"));
+}
+
+TEST(WhyAnswer, NamesAnotherClientAndTheStore) {
+    ApplicationStatus status;
+    status.coordinator = coordinator(7);
+    EXPECT_EQ(explain("com.a", status, {}).waitsFor->who, "client 7");
+    status.coordinator = coordinator(AppStoreClientID);
+    EXPECT_EQ(explain("com.a", status, {}).waitsFor->who, "store");
+}
+
+TEST(WhyAnswer, ACompleteCoordinatorWaitsForASessionOrItsInstall) {
+    ApplicationStatus status;
+    status.coordinator = coordinator(SyncClientID);
+    status.coordinator->isComplete = true;
+    EXPECT_EQ(explain("com.a", status, {}).waitsFor->what, "sync");
+    status.sessionUnderWay = true;
+    EXPECT_EQ(explain("com.a", status, {}).waitsFor->what, "install");
+    EXPECT_FALSE(explain("com.a", status, {}).waitsFor->promise);
+}
+
+TEST(WhyAnswer, NamesThePolicyThatForbids) {
+    DeviceSettings settings;
+    settings.installation = PolicyAnswer::No;
+    ApplicationStatus status;
+    EXPECT_EQ(explain("com.a", status, settings).waitsFor->what, "policy");
+    status.coordinator = coordinator(SyncClientID);
+    EXPECT_EQ(explain("com.a", status, settings).waitsFor->what, "policy");
+    status.coordinator.reset();
+    status.installed = application(false, kInstallTypeSync);
+    EXPECT_FALSE(explain("com.a", status, settings).waitsFor);
+}
+
+TEST(WhyAnswer, TellsTheErrorOfTheCoordinator) {
+    ApplicationStatus status;
+    status.coordinator = coordinator(SyncClientID);
+    status.coordinator->error = ErrorRecord::make(kInstallerErrorDomain, 6, "a file is damaged");
+    EXPECT_EQ(explain("com.a", status, {}).lastError, "a file is damaged");
 }
 
 TEST(WhyAnswer, TellsTheLastError) {
     ApplicationStatus status;
     status.lastFailure =
         InstallFailure{{}, ErrorRecord::make(kInstallerErrorDomain, 6, "a file is damaged")};
-    const WhyAnswer answer = explain("com.a", status);
+    const WhyAnswer answer = explain("com.a", status, {});
     EXPECT_EQ(answer.state, "absent");
     EXPECT_EQ(answer.lastError, "a file is damaged");
     EXPECT_THAT(whyText(answer), HasSubstr("Its last error: a file is damaged"));

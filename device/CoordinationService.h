@@ -1,0 +1,77 @@
+#pragma once
+
+#include <chrono>
+#include <memory>
+#include <set>
+#include <string>
+#include <vector>
+
+#include "device/CoordinatedInstaller.h"
+#include "device/CoordinationBook.h"
+#include "device/CoordinationHerald.h"
+#include "device/InstallContext.h"
+#include "platform/InstallCoordinatorService.h"
+
+namespace appsync {
+
+class DeviceHomeScreen;
+class DevicePolicy;
+
+/// A device's install-coordination service: its coordinators stand in the database and outlive the
+/// process, its installs run on threads of its own.
+///
+/// What earlier sessions left is gone on with when somebody starts it or observes a client.
+/// Observers are called one after the other, on one thread.
+class CoordinationService final : public InstallCoordinatorService {
+  public:
+    /// Everything outlives it. Beside a session (`Look`) it does no more than create and cancel.
+    CoordinationService(const InstallContext& context, DevicePolicy& policy,
+                        DeviceHomeScreen& homeScreen, std::chrono::seconds retryInterval,
+                        CoordinationBook::Access access);
+    ~CoordinationService() override;
+
+    [[nodiscard]] bool isCoordinationEnabled() override;
+    [[nodiscard]] Coordinator coordinator(CoordinatorKind kind, const std::string& identifier,
+                                          CoordinationClient client, Creation creation) override;
+    [[nodiscard]] std::shared_ptr<InstallCoordinator> existingCoordinator(
+        const std::string& identifier, CoordinationClient client) override;
+    [[nodiscard]] std::shared_ptr<PathTransferPromise> makePathTransferPromise(
+        const std::string& name, CoordinationClient client, const std::optional<FileURL>& path,
+        std::uint64_t diskSpaceNeeded) override;
+    [[nodiscard]] std::shared_ptr<OutOfBandPromise> makeOutOfBandPromise(
+        const std::string& name, CoordinationClient client, std::uint64_t diskSpaceNeeded) override;
+    /// Null when the identifier is not a legal one.
+    [[nodiscard]] std::shared_ptr<InstallPlaceholder> makeAppPlaceholder(
+        const std::string& name, const std::string& identifier, std::uint64_t installType,
+        CoordinationClient client) override;
+    void uninstallApp(const std::string& identifier, UninstallCompletion completion) override;
+    /// The underlying error stands under "UnderlyingError": "Domain", "Code", "Description".
+    [[nodiscard]] ErrorRecord userPresentableError(
+        std::int64_t code, const std::optional<ErrorRecord>& underlying) override;
+    [[nodiscard]] std::shared_ptr<AppInstallObserver> makeAppInstallObserver(
+        const std::string& serviceName, const std::set<CoordinationClient>& clients,
+        std::weak_ptr<InstallCoordinatorObserver> delegate) override;
+
+    // See Device.
+
+    void start();
+    Status create(const std::string& identifier, CoordinationClient client);
+    Status cancel(const std::string& identifier, CoordinationClient client);
+    [[nodiscard]] std::vector<std::string> installsUnderWay();
+    [[nodiscard]] bool waitForInstalls(std::chrono::milliseconds longest);
+
+    /// No call of an observer begins any more, and no thread is left.
+    void close();
+
+  private:
+    [[nodiscard]] Status uninstall(const std::string& identifier);
+
+    const InstallContext context_;
+    DevicePolicy& policy_;
+    const CoordinationBook::Access access_;
+    CoordinationHerald herald_;
+    const std::shared_ptr<CoordinationBook> book_;
+    CoordinatedInstaller installer_;
+};
+
+}  // namespace appsync

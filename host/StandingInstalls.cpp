@@ -1,0 +1,117 @@
+#include "host/StandingInstalls.h"
+
+#include <algorithm>
+#include <map>
+#include <string_view>
+
+#include "device/Device.h"
+#include "device/DeviceError.h"
+#include "host/SyncPlan.h"
+#include "platform/InstallProgressRecord.h"
+
+namespace appsync {
+namespace {
+
+constexpr std::string_view kPackagePromiseSuffix = "-Asset";
+constexpr std::string_view kInitiating = "initiating";
+constexpr std::string_view kUpdating = "updating";
+
+bool hasPackage(const CoordinatorRecord& coordinator) {
+    return std::any_of(coordinator.promises.begin(), coordinator.promises.end(),
+                       [](const PromiseRecord& promise) {
+                           return promise.complete && !promise.cancelled &&
+                                  promise.name.ends_with(kPackagePromiseSuffix);
+                       });
+}
+
+class TakingUp {
+  public:
+    TakingUp(SyncPlan& plan, const std::vector<ApplicationRecord>& present) : plan_(plan) {
+        for (const ApplicationRecord& record : present) {
+            if (!record.isPlaceholder) installed_.insert(record.identifier);
+            if (record.isPlaceholder && record.installType == kInstallTypeSync) {
+                expectedVersions_[record.identifier] = record.version.value_or("");
+            }
+        }
+    }
+
+    void add(const CoordinatorRecord& coordinator) {
+        if (coordinator.client != SyncClientID) return leaveTo(coordinator);
+        if (coordinator.kind != kInitiating && coordinator.kind != kUpdating) return;
+        if (!goesOn(coordinator)) {
+            standing_.obsolete.push_back(coordinator.identifier);
+        } else if (hasPackage(coordinator)) {
+            standing_.arrived.insert(coordinator.identifier);
+            if (PlannedInstall* planned = find(coordinator.identifier)) {
+                planned->hasArrived = true;
+                planned->isInstalledUnasked = coordinator.isComplete;
+            }
+        }
+    }
+
+    StandingInstalls take() { return std::move(standing_); }
+
+  private:
+    PlannedInstall* find(const std::string& identifier) {
+        for (auto* installs : {&plan_.install, &plan_.update}) {
+            const auto found = std::find_if(
+                installs->begin(), installs->end(),
+                [&](const PlannedInstall& each) { return each.identifier == identifier; });
+            if (found != installs->end()) return &*found;
+        }
+        return nullptr;
+    }
+
+    bool goesOn(const CoordinatorRecord& coordinator) {
+        const std::string& identifier = coordinator.identifier;
+        const bool isUpdate = installed_.contains(identifier);
+        if (isUpdate != (coordinator.kind == kUpdating)) return false;
+        const bool isRemoved =
+            std::find(plan_.remove.begin(), plan_.remove.end(), identifier) != plan_.remove.end();
+        if (isRemoved) return false;
+        const PlannedInstall* planned = find(identifier);
+        if (!hasPackage(coordinator)) return planned != nullptr;
+        return planned == nullptr || planned->newVersion.empty() ||
+               expectedVersions_[identifier] == planned->newVersion;
+    }
+
+    void leaveTo(const CoordinatorRecord& coordinator) {
+        if (find(coordinator.identifier) == nullptr) return;
+        for (auto* installs : {&plan_.install, &plan_.update}) {
+            std::erase_if(*installs, [&](const PlannedInstall& each) {
+                return each.identifier == coordinator.identifier;
+            });
+        }
+        plan_.skipped.push_back({coordinator.identifier, heldSentence(coordinator.client), true});
+    }
+
+    SyncPlan& plan_;
+    std::set<std::string> installed_;
+    std::map<std::string, std::string> expectedVersions_;  // of what is to come
+    StandingInstalls standing_;
+};
+
+}  // namespace
+
+std::string heldSentence(CoordinationClient client) {
+    return "client " + std::to_string(client) +
+           " of the coordination service has its install in hand: wait for that, or cancel it "
+           "with appsync coordinator";
+}
+
+StandingInstalls takeUp(SyncPlan& plan, const std::vector<CoordinatorRecord>& coordinators,
+                        const std::vector<ApplicationRecord>& present) {
+    TakingUp takingUp(plan, present);
+    for (const CoordinatorRecord& coordinator : coordinators) takingUp.add(coordinator);
+    return takingUp.take();
+}
+
+Status cancelObsolete(Device& device, const StandingInstalls& standing) {
+    for (const std::string& identifier : standing.obsolete) {
+        Status cancelled = device.cancelCoordinator(identifier, SyncClientID);
+        if (!cancelled && cancelled.error().domain == kDeviceErrorDomain) return cancelled;
+    }
+    return {};
+}
+
+}  // namespace appsync

@@ -1,0 +1,43 @@
+#pragma once
+
+#include <set>
+#include <string>
+#include <vector>
+
+#include "platform/InstallPromises.h"
+#include "platform/Result.h"
+
+namespace appsync {
+
+class Device;
+struct ApplicationRecord;
+struct CoordinatorRecord;
+struct SyncPlan;
+
+/// What an earlier session, or somebody else, has left with the device's coordination service.
+struct StandingInstalls {
+    /// Applications whose packages an interrupted session has brought whole. They are not sent
+    /// again: the device installs them as soon as the session begins.
+    std::set<std::string> arrived;
+    /// Applications whose coordinators lead nowhere any more: to be cancelled before the session.
+    std::vector<std::string> obsolete;
+};
+
+/// Why an application is left to another client.
+[[nodiscard]] std::string heldSentence(CoordinationClient client);
+
+/// Holds the plan against the coordinators that stand. Marks in it what has arrived, and skips what
+/// another client has in hand. `present` is everything that the device holds.
+///
+/// A coordinator of the sync client goes on where the plan still asks for the same version of the
+/// same application; one whose package has arrived also where the plan asks for nothing, as the
+/// device has promised the install to whoever looks at its home screen. Everything else of the sync
+/// client's is obsolete. Coordinators of a restore are nobody's business here.
+[[nodiscard]] StandingInstalls takeUp(SyncPlan& plan,
+                                      const std::vector<CoordinatorRecord>& coordinators,
+                                      const std::vector<ApplicationRecord>& present);
+
+/// Cancels what is obsolete. One that has gone meanwhile is no failure.
+Status cancelObsolete(Device& device, const StandingInstalls& standing);
+
+}  // namespace appsync
