@@ -1,0 +1,36 @@
+#pragma once
+
+#include <string>
+#include <string_view>
+
+#include "platform/FileSystem.h"
+#include "platform/PropertyList.h"
+
+namespace appsync {
+
+// The names of the files in a placeholder bundle.
+inline constexpr std::string_view kPlaceholderIconFile = "Icon.png";
+inline constexpr std::string_view kPlaceholderInfoFile = "Info.plist";
+
+/// Key of an info dictionary (boolean): the application may not be started.
+inline constexpr std::string_view kLaunchProhibitedKey = "RGApplicationLaunchProhibited";
+/// Another (boolean).
+inline constexpr std::string_view kPresselKey = "VKPresselApp";
+
+// What the transaction log says of placeholders. The scenario is that of a restored application;
+// the directory's failure counts as one of its steps whoever asked for the directory.
+inline constexpr std::string_view kAppRestoreScenario = "Vessik App Restore";
+inline constexpr std::string_view kPlaceholderDirectoryFailed = "Failed to create app directory";
+inline constexpr std::string_view kPlaceholderInstalled = "Installed placeholder";
+inline constexpr std::string_view kPlaceholderNotInstalled = "Failed to install placeholder";
+
+/// Whom a placeholder bundle and what is in it belong to.
+[[nodiscard]] inline FileAttributes placeholderFileAttributes() { return {"mobile", "mobile"}; }
+
+/// The boolean at the key. What is absent or answers to no boolean conversion is false.
+[[nodiscard]] inline bool flagAt(const PropertyList& map, std::string_view key) {
+    const PropertyList* flag = map.find(key);
+    return flag != nullptr && flag->booleanConversion().value_or(false);
+}
+
+}  // namespace appsync
