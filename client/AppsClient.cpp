@@ -2,6 +2,7 @@
 
 #include <cstddef>
 
+#include "client/Dataclass.h"
 #include "platform/BackupService.h"
 #include "platform/DevicePolicyService.h"
 #include "platform/InstallCoordinatorService.h"
@@ -13,7 +14,6 @@ namespace appsync {
 
 namespace {
 
-constexpr std::string_view kDataclass = "Application";
 constexpr std::string_view kSyncAnchor = "NO_APP_SYNC_ANCHOR";
 constexpr std::string_view kDaemonIdentifier = "com.korvu.trd";
 constexpr std::string_view kStartupNotification = "com.korvu.trd.TRStartupCompleteNotification";
@@ -26,15 +26,11 @@ constexpr std::size_t kConcurrentInstalls = 10;
 /// How messages name the client.
 constexpr std::string_view kSelf = "<AppsClient>";
 
-/// "Not supported" in the POSIX domain.
-constexpr std::int64_t kPosixNotSupported = 95;
-constexpr std::string_view kCoordinationRefused =
-    "the device coordinates its installs, and this plug-in only installs directly; turn install "
-    "coordination off on the device";
-
-/// Called when the daemon has finished starting. The coordination observer is set up here once
-/// installs can be coordinated; until then there is nothing to do.
-void startupDidComplete(void* /*observer*/) {}
+/// Called when the daemon has finished starting. The center keeps the observer meanwhile.
+void startupDidComplete(void* observer) {
+    if (observer == nullptr) return;
+    static_cast<AppsClient*>(observer)->setupInstallCoordinatorObserver();
+}
 
 bool isAllowed(DevicePolicyService& policy, PolicyFeature feature) {
     return policy.effectiveValue(feature) != PolicyAnswer::No;
@@ -44,14 +40,10 @@ bool isAllowed(DevicePolicyService& policy, PolicyFeature feature) {
 
 AppsClient::AppsClient(const Platform& platform) : platform_(platform), log_(platform) {}
 
-std::shared_ptr<AppsClient> AppsClient::create(const Platform& platform, ErrorOut error) {
+std::shared_ptr<AppsClient> AppsClient::create(const Platform& platform) {
     std::shared_ptr<AppsClient> client(new AppsClient(platform));
     client->initialize();
-    if (!client->_useInstallCoordinator) return client;
-    if (error != nullptr) {
-        *error = ErrorRecord::make(kPosixErrorDomain, kPosixNotSupported, kCoordinationRefused);
-    }
-    return nullptr;
+    return client;
 }
 
 void AppsClient::initialize() {

@@ -14,6 +14,7 @@
 #include "client/SharedIdentifierSet.h"
 #include "platform/AppRegistry.h"
 #include "platform/FileSystem.h"
+#include "platform/InstallCoordinator.h"
 #include "platform/Platform.h"
 #include "platform/SyncClient.h"
 #include "platform/WorkQueues.h"
@@ -36,15 +37,14 @@ struct TransferItem;
 /// The declarations stand in groups, one for each file that defines them.
 class AppsClient final : public SyncClient,
                          public AppRegistryObserver,
+                         public InstallCoordinatorObserver,
                          public std::enable_shared_from_this<AppsClient> {
   public:
     // client/AppsClient.cpp: the object and the entry to a session.
 
-    /// `init`: a new client. Null, and an error that says why, on a device whose installs are
-    /// coordinated: this plug-in installs directly only. The platform must outlive the client and
-    /// what it has queued.
-    [[nodiscard]] static std::shared_ptr<AppsClient> create(const Platform& platform,
-                                                            ErrorOut error = nullptr);
+    /// `init`: a new client. Whether it installs directly or through coordinators is asked here,
+    /// for its whole life. The platform must outlive the client and what it has queued.
+    [[nodiscard]] static std::shared_ptr<AppsClient> create(const Platform& platform);
 
     /// `dealloc`: warns of what is still outstanding, and stops listening. Runs on whatever thread
     /// lets the client go, an install's for instance.
@@ -115,7 +115,8 @@ class AppsClient final : public SyncClient,
 
     // transfer/OutstandingTransfers.cpp: which packages to ask for.
 
-    /// `outstandingAssetTransfers`: installs a placeholder for each application that it asks for.
+    /// `outstandingAssetTransfers`: installs a placeholder for each application that it asks for,
+    /// or prepares its coordinator.
     [[nodiscard]] std::vector<SyncAssetPointer> outstandingAssetTransfers() override;
 
     // transfer/TransferEvents.cpp: what happens while packages arrive, and then.
@@ -132,7 +133,8 @@ class AppsClient final : public SyncClient,
     /// `applicationInstallsArePrioritized:arePaused:`: only InProgressAssetQuery needs these lists.
     void applicationInstallsArePrioritized(const std::vector<AppProxy>& prioritized,
                                            const std::vector<AppProxy>& paused) override;
-    /// `applicationInstallsDidCancel:`: a cancelled restore is a transfer that failed.
+    /// `applicationInstallsDidCancel:`: a cancelled restore is a transfer that failed. Only logged
+    /// where installs are coordinated: there the coordinators tell of it.
     void applicationInstallsDidCancel(const std::vector<AppProxy>& cancelled) override;
 
     // transfer/InstallQueue.cpp: installing what has arrived.
@@ -147,9 +149,11 @@ class AppsClient final : public SyncClient,
     /// `assetInstallFailed:withError:`
     void assetInstallFailed(const SyncAssetPointer& asset, const ErrorRecord& error) override;
     /// `_isRecoverableError:`: whether the same operation may succeed later. `error` may be null:
-    /// what failed without saying why is not recoverable.
+    /// what failed without saying why is not recoverable. Nor is anything where installs are
+    /// coordinated.
     [[nodiscard]] bool _isRecoverableError(const ErrorRecord* error) const;
-    /// `_progressForAssetIdentifier:`: null when no install is under way for it.
+    /// `_progressForAssetIdentifier:`: null when no install is under way for it, and where installs
+    /// are coordinated.
     [[nodiscard]] std::shared_ptr<InstallProgressRecord> _progressForAssetIdentifier(
         const std::string& identifier) const;
     /// `_operationStateForIdentifier:`: the operation of its first entry in the todo list.
@@ -170,6 +174,110 @@ class AppsClient final : public SyncClient,
     void cleanRestoreStateForIdentifier(const std::string& identifier);
     /// `changeAssetID:toDo:`: rewrites the operation of the first entry with the identifier.
     void changeAssetID(const std::string& identifier, std::string_view toDo);
+
+    // coordination/Coordinators.cpp: what an install is coordinated with. Each makes one object, in
+    // the plug-in's name (SyncClientID), and gives null when it cannot. Any thread.
+
+    /// `_initiatingOrUpdatingAppInstallCoordinatorForBundleIdentifier:existingApp:createIfNotExisting:error:`:
+    /// the coordinator of an update (`existingApp`) or of a first install. Null, without an error,
+    /// also for one that another client has created. `error` gets the service's answer in any case:
+    /// its error, or nothing.
+    [[nodiscard]] std::shared_ptr<InstallCoordinator>
+    _initiatingOrUpdatingAppInstallCoordinatorForBundleIdentifier(const std::string& identifier,
+                                                                  bool existingApp,
+                                                                  bool createIfNotExisting,
+                                                                  ErrorOut error);
+    /// `_placeHolderForBundleIdentifier:name:installType:`: one that no coordinator has yet.
+    [[nodiscard]] std::shared_ptr<InstallPlaceholder> _placeHolderForBundleIdentifier(
+        const std::string& identifier, const std::string& name, std::uint64_t installType);
+    /// `_createAppAssetPromiseForBundleIdentifier:atPath:andAddToCoordinatinator:`: without a path
+    /// a promise of a package that is still to come. `coordinator` may be null. `error` is set when
+    /// the coordinator refuses the promise; that is then cancelled.
+    std::shared_ptr<PathTransferPromise> _createAppAssetPromiseForBundleIdentifier(
+        const std::string& identifier, const std::optional<std::string>& path,
+        InstallCoordinator* coordinator, ErrorOut error = nullptr);
+    /// `_createIconPromiseForBundleIdentifier:transferPath:diskSpaceNeeded:andAddToPlaceHolder:forAppInstall:`:
+    /// a promise already kept with the file at `path`. `placeholder` may be null. `error` is set
+    /// when the placeholder refuses the promise; that is then cancelled.
+    std::shared_ptr<PathTransferPromise> _createIconPromiseForBundleIdentifier(
+        const std::string& identifier, const std::string& path, std::uint64_t diskSpaceNeeded,
+        InstallPlaceholder* placeholder, bool forAppInstall, ErrorOut error = nullptr);
+    /// `_userDataPromiseForBundleIdentifier:`: a promise already kept, attached to nothing yet.
+    [[nodiscard]] std::shared_ptr<OutOfBandPromise> _userDataPromiseForBundleIdentifier(
+        const std::string& identifier);
+
+    // coordination/CoordinatedInstall.cpp: `AppInstallUsingCoordination`, the beginning and the
+    // undoing of an install.
+
+    /// `prepareAppForInstallUsingCoordination:existingApp:`: sets up the application's coordinator,
+    /// whose placeholder then stands on the home screen until the package comes. Adds only what the
+    /// coordinator lacks, so that it may be called again. False when the install cannot go on; the
+    /// coordinator is cancelled then.
+    bool prepareAppForInstallUsingCoordination(const SyncAsset& asset, bool existingApp);
+    /// `uninstallAppUsingCoordination:`: returns at once. The outcome is only logged.
+    void uninstallAppUsingCoordination(const std::string& identifier);
+
+    // coordination/CoordinatedProgress.cpp: `AppInstallUsingCoordination`, the package on its way;
+    // and what the coordination service tells, on threads of its own.
+
+    /// `updateTransferProgressForApp:existingApp:`: whether the promise of the package was updated.
+    bool updateTransferProgressForApp(const SyncAsset& asset, bool existingApp);
+    /// `transferCompleteForApp:withError:isExistingApp:`: the package is there, its path absolute;
+    /// or, with an error, it never will be, and the coordinator is cancelled.
+    void transferCompleteForApp(const SyncAsset& asset, const ErrorRecord* error,
+                                bool isExistingApp);
+    /// `assetSyncFinishedWithStatus:outstandingItems:`: after a sync that failed, cancels the
+    /// coordinators of what has not come.
+    void assetSyncFinishedWithStatus(bool status, const std::set<std::string>& outstandingItems);
+
+    /// `promiseDidBeginFulfillmentWithIdentifier:`
+    void promiseDidBeginFulfillmentWithIdentifier(std::uint64_t promise) override;
+    /// `coordinatorDidInstallPlaceholder:`
+    void coordinatorDidInstallPlaceholder(
+        const std::shared_ptr<InstallCoordinator>& coordinator) override;
+    /// `coordinatorDidCompleteSuccessfully:`: marks the todo entry as installed or failed.
+    void coordinatorDidCompleteSuccessfully(
+        const std::shared_ptr<InstallCoordinator>& coordinator) override;
+    /// `coordinator:canceledWithReason:client:`: has the host stop the transfer, once.
+    void coordinatorCanceledWithReason(const std::shared_ptr<InstallCoordinator>& coordinator,
+                                       const ErrorRecord& reason,
+                                       CoordinationClient client) override;
+    /// `coordinatorShouldPrioritize:`: has the host send this application before the others.
+    void coordinatorShouldPrioritize(
+        const std::shared_ptr<InstallCoordinator>& coordinator) override;
+
+    /// `setupInstallCoordinatorObserver`: from the first call on the client hears of every
+    /// coordinator of the plug-in's. Any thread.
+    void setupInstallCoordinatorObserver();
+
+    // coordination/CoordinatedRestore.cpp: `AppInstallUsingCoordination`, an application that a
+    // backup brings back.
+
+    /// `prepareAppForRestoreUsingCoordination:VessikMetadata:sinfData:iconData:demotionStatus:`:
+    /// sets up the application's restoring coordinator. Adds only what that lacks. `sinfData` and
+    /// `iconData` may be null; any demotion status but 0 is a demoted application's. False when it
+    /// cannot be restored; the coordinator is cancelled then.
+    bool prepareAppForRestoreUsingCoordination(const std::string& identifier,
+                                               const Bytes& vessikMetadata, const Bytes* sinfData,
+                                               const Bytes* iconData, std::uint64_t demotionStatus);
+    /// `_prepareDemotedAppForRestoreWithBundleId:VessikMetadata:sinfData:iconData:demotionStatus:`
+    bool _prepareDemotedAppForRestoreWithBundleId(const std::string& identifier,
+                                                  const Bytes& vessikMetadata,
+                                                  const Bytes* sinfData, const Bytes* iconData,
+                                                  std::uint64_t demotionStatus);
+    /// `_prepareNonDemotedAppForRestoreWithBundleId:VessikMetadata:sinfData:iconData:`: the app
+    /// store becomes responsible for the package.
+    bool _prepareNonDemotedAppForRestoreWithBundleId(const std::string& identifier,
+                                                     const Bytes& vessikMetadata,
+                                                     const Bytes* sinfData, const Bytes* iconData);
+    /// `_placeHolderForBundleIdentifier:withVessikMetadata:sinfData:iconData:demotionStatus:`: a
+    /// placeholder whose configuration is complete. `vessikMetadata` is a map. Null when it cannot
+    /// be made; what there is of it is cancelled then.
+    [[nodiscard]] std::shared_ptr<InstallPlaceholder>
+    _placeHolderForBundleIdentifierWithVessikMetadata(const std::string& identifier,
+                                                      const PropertyList& vessikMetadata,
+                                                      const Bytes* sinfData, const Bytes* iconData,
+                                                      std::uint64_t demotionStatus);
 
     // restore/PlaceholderBundles.cpp: placeholder applications.
 
@@ -220,34 +328,18 @@ class AppsClient final : public SyncClient,
                                                                            std::string_view path,
                                                                            ErrorOut error);
 
-    // coordination/CoordinatedRestore.cpp: `AppInstallUsingCoordination`, an application that a
-    // backup brings back.
+    // restore/RestoringPlaceholders.cpp: the book of the placeholders that a restore waits for. An
+    // identifier is in the set exactly when the wait group holds one entry for it and the count
+    // includes it. Any thread; each runs synchronously on _restoreQueue, so never call one from
+    // there.
 
-    /// `prepareAppForRestoreUsingCoordination:VessikMetadata:sinfData:iconData:demotionStatus:`:
-    /// sets up the application's restoring coordinator. Adds only what that lacks. `sinfData` and
-    /// `iconData` may be null; any demotion status but 0 is a demoted application's. False when it
-    /// cannot be restored; the coordinator is cancelled then.
-    bool prepareAppForRestoreUsingCoordination(const std::string& identifier,
-                                               const Bytes& vessikMetadata, const Bytes* sinfData,
-                                               const Bytes* iconData, std::uint64_t demotionStatus);
-    /// `_prepareDemotedAppForRestoreWithBundleId:VessikMetadata:sinfData:iconData:demotionStatus:`
-    bool _prepareDemotedAppForRestoreWithBundleId(const std::string& identifier,
-                                                  const Bytes& vessikMetadata,
-                                                  const Bytes* sinfData, const Bytes* iconData,
-                                                  std::uint64_t demotionStatus);
-    /// `_prepareNonDemotedAppForRestoreWithBundleId:VessikMetadata:sinfData:iconData:`: the app
-    /// store becomes responsible for the package.
-    bool _prepareNonDemotedAppForRestoreWithBundleId(const std::string& identifier,
-                                                     const Bytes& vessikMetadata,
-                                                     const Bytes* sinfData, const Bytes* iconData);
-    /// `_placeHolderForBundleIdentifier:withVessikMetadata:sinfData:iconData:demotionStatus:`: a
-    /// placeholder whose configuration is complete. `vessikMetadata` is a map. Null when it cannot
-    /// be made; what there is of it is cancelled then.
-    [[nodiscard]] std::shared_ptr<InstallPlaceholder>
-    _placeHolderForBundleIdentifierWithVessikMetadata(const std::string& identifier,
-                                                      const PropertyList& vessikMetadata,
-                                                      const Bytes* sinfData, const Bytes* iconData,
-                                                      std::uint64_t demotionStatus);
+    /// `relocantSetPlaceHolderPromiseForRestoreAppBundle:`: its placeholder is awaited from now on.
+    void relocantSetPlaceHolderPromiseForRestoreAppBundle(const std::string& identifier);
+    /// `relocantCancelledCoordinatorForRestoreAppBundle:`: it is no longer awaited.
+    void relocantCancelledCoordinatorForRestoreAppBundle(const std::string& identifier);
+    /// `tsDidInstallPlaceHolderForAppBundle:`: it has come. Changes nothing once the restore has
+    /// stopped waiting.
+    void tsDidInstallPlaceHolderForAppBundle(const std::string& identifier);
 
   private:
     friend struct AppsClientTestAccess;
@@ -283,19 +375,31 @@ class AppsClient final : public SyncClient,
     [[nodiscard]] SyncAssetPointer prepareAsset(const PropertyList& itemMap, const Wants& wants,
                                                 const RestoreState& restoreState);
     [[nodiscard]] bool isSkipped(const TransferItem& item, const Wants& wants) const;
+    [[nodiscard]] bool isSkippedRestore(const TransferItem& item) const;
+    [[nodiscard]] bool isSkippedSystemApp(const TransferItem& item, const Wants& wants) const;
+    [[nodiscard]] bool isSkippedDemotedApp(const TransferItem& item, const Wants& wants) const;
     [[nodiscard]] SyncAssetPointer makeAsset(const TransferItem& item,
                                              const RestoreState& restoreState) const;
     [[nodiscard]] unsigned assetPartsFor(const TransferItem& item,
                                          const RestoreState& restoreState) const;
+    bool createMissingPlaceholder(const SyncAsset& asset, const Wants& wants);
+    bool prepareCoordinator(const SyncAsset& asset);
+    [[nodiscard]] bool isExistingApp(const std::string& identifier) const;
 
     // transfer/TransferEvents.cpp
-    void transferDidSucceed(const SyncAssetPointer& asset, InstallProgressRecord* progress);
+    struct TransferEnd;
+    void updateProgressRecord(const std::string& identifier, double fraction) const;
+    void transferDidSucceed(const TransferEnd& end);
+    void finishLoading(const TransferEnd& end) const;
     void resolvePath(SyncAsset& asset) const;
-    void packageDidArrive(const SyncAssetPointer& asset, InstallProgressRecord* progress);
-    void restorePackageDidArrive(const SyncAssetPointer& asset, InstallProgressRecord* progress);
-    void transferDidFail(const SyncAsset& asset, const ErrorRecord* error,
-                         InstallProgressRecord* progress);
-    void removePlaceholder(const SyncAsset& asset, InstallProgressRecord* progress);
+    void packageDidArrive(const TransferEnd& end);
+    void syncedPackageDidArrive(const TransferEnd& end);
+    void restorePackageDidArrive(const TransferEnd& end);
+    void restoreDataDidArrive(const TransferEnd& end);
+    void transferDidFail(const TransferEnd& end, const ErrorRecord* error);
+    void giveUpInstall(const TransferEnd& end, const ErrorRecord* error);
+    void giveUpRestore(const std::string& identifier) const;
+    void removePlaceholder(const std::string& identifier) const;
     void closeOutstandingTransfers(const std::set<std::string>& outstanding, bool success);
 
     // transfer/InstallQueue.cpp
@@ -305,8 +409,38 @@ class AppsClient final : public SyncClient,
     void scheduleRetry(const SyncAssetPointer& asset);
     void reenqueue(const SyncAssetPointer& asset);
     void installDidFailUnrecoverably(const SyncAsset& asset, const ErrorRecord& error);
+    void giveUpFailedRestore(const std::string& identifier) const;
+    void removeFailedInstall(const SyncAsset& asset);
+    void uninstallFailedInstall(const std::string& identifier);
     void recordInstall(bool success, const std::string& identifier, std::string_view description);
     void recordRestore(bool success, const std::string& identifier, std::string_view description);
+
+    // coordination/CoordinatedInstall.cpp
+    struct Preparation;
+    bool prepare(Preparation& preparation);
+    bool addInstallOptions(Preparation& preparation);
+    bool addODRAssetPromises(Preparation& preparation);
+    bool addAppAssetPromise(Preparation& preparation);
+    bool addPlaceholderPromise(Preparation& preparation);
+    void makePlaceholder(Preparation& preparation);
+    void configurePlaceholder(Preparation& preparation);
+    [[nodiscard]] std::uint64_t copyIconForPlaceholder(Preparation& preparation,
+                                                       const std::string& iconPath);
+    bool addIconPromise(Preparation& preparation, const std::string& iconPath, std::uint64_t size);
+    bool setPlaceholderAttributes(Preparation& preparation);
+    bool setPlaceholderMetadata(Preparation& preparation);
+    void setPlaceholderComplete(Preparation& preparation);
+    void cancelPreparation(const Preparation& preparation);
+
+    // coordination/CoordinatedProgress.cpp
+    [[nodiscard]] std::shared_ptr<InstallCoordinator> coordinatorUnderWay(
+        const std::string& identifier, bool existingApp);
+    void cancelForFailedTransfer(InstallCoordinator& coordinator, const ErrorRecord& error);
+    void keepAppAssetPromise(const SyncAsset& asset, InstallCoordinator& coordinator);
+    void prioritizeTransfer(const std::string& identifier);
+
+    // restore/RestoringPlaceholders.cpp
+    void stopAwaitingPlaceholder(const std::string& identifier);
 
     // restore/PlaceholderBundles.cpp
     void willCreatePlaceholder(const std::string& identifier, const PropertyList& info) const;
@@ -354,22 +488,26 @@ class AppsClient final : public SyncClient,
     // guards itself, with a mutex that is never held across a call of the platform.
     SharedIdentifierSet _outstandingHFTTransfers;
     std::set<std::string> _kolmAppsToIgnore;
-    std::set<std::string> _placeholdersForRestoringApps;      // only on _restoreQueue
-    std::unique_ptr<OperationQueue> _installOperationQueue;   // guards itself
-    std::unique_ptr<BackupManager> _backupManager;            // guards itself
-    std::unique_ptr<SerialQueue> _accessQueue;                // guards itself
-    std::unique_ptr<SerialQueue> _restoreQueue;               // guards itself
-    bool _finishedWaitingForPlaceHolderInstalls = false;      // only on _restoreQueue
-    bool _useInstallCoordinator = false;                      // never changes once set
-    std::atomic<std::int64_t> _restoringPlaceholderCount{0};  // changed only on _restoreQueue
-    std::set<std::string> _updatingApps;                      // only on _accessQueue
-    std::set<std::string> _userCancelledApps;                 // only on _accessQueue
+    std::set<std::string> _placeholdersForRestoringApps;     // only on _restoreQueue
+    std::unique_ptr<OperationQueue> _installOperationQueue;  // guards itself
+    std::unique_ptr<BackupManager> _backupManager;           // guards itself
+    std::unique_ptr<SerialQueue> _accessQueue;               // guards itself
+    std::unique_ptr<SerialQueue> _restoreQueue;              // guards itself
+    bool _finishedWaitingForPlaceHolderInstalls = false;     // only on _restoreQueue
+    bool _useInstallCoordinator = false;                     // never changes once set
+    // Changed only on _restoreQueue; whoever waits reads it once without the queue.
+    std::atomic<std::int64_t> _restoringPlaceholderCount{0};
+    std::set<std::string> _updatingApps;       // only on _accessQueue
+    std::set<std::string> _userCancelledApps;  // only on _accessQueue
     std::optional<std::vector<std::string>> _uninstalledApps;
-    std::shared_ptr<AppInstallObserver> _appInstallObserver;
+    std::shared_ptr<AppInstallObserver> _appInstallObserver;  // see isAppInstallObserverSetUp_
     std::atomic<std::uint32_t> _numAppInstallsAttempted{0};
 
     const Platform platform_;
     const Log log_;
+
+    // Who turns it to true makes the observer; nobody else touches that before the destructor.
+    std::atomic<bool> isAppInstallObserverSetUp_{false};
 
     // Each held across a whole edit of its file (read, change, write), so that edits on several
     // threads lose nothing; the first also while the directory of the todo list is replaced. Who

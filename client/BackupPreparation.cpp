@@ -1,6 +1,6 @@
 #include "client/AppsClient.h"
 #include "client/PropertyListFile.h"
-#include "client/StoreMetadata.h"
+#include "client/StoreMetadataFile.h"
 
 namespace appsync {
 

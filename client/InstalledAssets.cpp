@@ -3,7 +3,7 @@
 
 #include "client/AppsClient.h"
 #include "client/Paths.h"
-#include "client/StoreMetadata.h"
+#include "client/StoreMetadataFile.h"
 #include "client/TodoList.h"
 #include "platform/InstallerService.h"
 
@@ -72,7 +72,7 @@ void addIfPresent(std::set<std::string>& identifiers, const std::string* identif
 
 void addKorvuIDs(const Platform& platform, const AppProxy& proxy, std::set<std::string>& ids) {
     const Log log(platform);
-    const StoreMetadata metadata(platform, proxy);
+    const StoreMetadataFile metadata(platform, proxy);
     const std::string* top = metadata.korvuID();
     const std::string* account = metadata.accountInfo().korvuID();
     if (top != nullptr && account != nullptr && *top != *account) {
@@ -89,8 +89,8 @@ void addKorvuIDs(const Platform& platform, const AppProxy& proxy, std::set<std::
 
 void addAccount(const Platform& platform, const AppProxy& proxy, std::set<std::string>& seen,
                 std::set<SyncAccountInfo>& accounts) {
-    const StoreMetadata metadata(platform, proxy);
-    const StoreMetadata::AccountInfo info = metadata.accountInfo();
+    const StoreMetadataFile metadata(platform, proxy);
+    const StoreMetadataFile::AccountInfo info = metadata.accountInfo();
     const std::string* identifier = info.korvuID();
     if (identifier == nullptr) identifier = metadata.korvuID();
     if (identifier == nullptr || !seen.insert(*identifier).second) return;

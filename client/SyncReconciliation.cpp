@@ -127,6 +127,10 @@ void AppsClient::performDeletions(const PropertyList& todoList) {
 }
 
 void AppsClient::deleteApplication(const std::string& identifier) {
+    if (_useInstallCoordinator) {
+        uninstallAppUsingCoordination(identifier);
+        return;
+    }
     const Status uninstalled = platform_.registry.uninstallApplication(identifier, {});
     if (!uninstalled) log_(Level::Error, "%s|Uninstall of %{public}@ failed.", identifier);
     platform_.transactions.logScenario(kSyncScenario, 0, uninstalled.ok(), identifier,

@@ -39,31 +39,23 @@ Status PlugIn::openLog(Device& device) {
     return {};
 }
 
-Status PlugIn::create(const Platform& platform) {
-    std::optional<ErrorRecord> error;
-    client_ = AppsClient::create(platform, &error);
-    if (client_ != nullptr) return {};
-    return error ? unusable(*error) : unusable("the plug-in cannot be loaded", "see appsync log");
-}
-
 Result<std::unique_ptr<PlugIn>> PlugIn::load(Device& device) {
     std::unique_ptr<PlugIn> plugIn(new PlugIn());
-    Status status = plugIn->openLog(device);
-    if (status) status = plugIn->create(device.platform(plugIn->daemon_, *plugIn->log_));
+    const Status status = plugIn->openLog(device);
     if (!status) return status.error();
+    plugIn->client_ = AppsClient::create(device.platform(plugIn->daemon_, *plugIn->log_));
     return plugIn;
 }
 
 Result<std::unique_ptr<PlugIn>> PlugIn::load(Device& device, SyncEvents& events,
                                              SessionFacts& facts) {
     std::unique_ptr<PlugIn> plugIn(new PlugIn());
-    Status status = plugIn->openLog(device);
+    const Status status = plugIn->openLog(device);
     if (!status) return status.error();
     const Platform platform = device.platform(plugIn->daemon_, *plugIn->log_);
     plugIn->watch_ = std::make_unique<SessionWatch>(device, platform.registry, platform.homeScreen,
                                                     events, facts);
-    status = plugIn->create(watched(platform, *plugIn->watch_));
-    if (!status) return status.error();
+    plugIn->client_ = AppsClient::create(watched(platform, *plugIn->watch_));
     return plugIn;
 }
 

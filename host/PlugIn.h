@@ -10,7 +10,6 @@ namespace appsync {
 class AppsClient;
 class Device;
 class JsonLogFacility;
-struct Platform;
 class SessionFacts;
 class SessionWatch;
 class SyncClient;
@@ -33,7 +32,6 @@ class PlugIn {
   private:
     PlugIn();
     Status openLog(Device& device);
-    Status create(const Platform& platform);
 
     SyncDaemon daemon_;
     std::unique_ptr<JsonLogFacility> log_;

@@ -1,8 +1,19 @@
 #include "simulation/RecordedCall.h"
 
+#include <array>
+#include <cstdio>
+
+#include "platform/InstallCoordinator.h"
 #include "platform/LogRendering.h"
+#include "platform/SyncAsset.h"
 
 namespace appsync {
+
+std::string callText(double value) {
+    std::array<char, 32> text{};
+    std::snprintf(text.data(), text.size(), "%g", value);
+    return text.data();
+}
 
 std::string callText(ByteView value) { return "<" + std::to_string(value.size()) + " bytes>"; }
 std::string callText(const Bytes& value) { return callText(ByteView(value)); }
@@ -29,6 +40,24 @@ std::string callText(const std::vector<AppProxy>& value) {
         text += callText(proxy);
     }
     return text + "]";
+}
+
+std::string callText(const SyncAsset& value) {
+    return value.identifier + ", " + value.dataclass +
+           (value.isDownload ? ", download" : ", upload");
+}
+
+std::string callText(const StoreMetadata& value) { return callText(value.metadata); }
+
+std::string callText(const InstallOptions& value) {
+    return callText(value.storeMetadata) + ", type " + callText(value.installType) + ", target " +
+           callText(value.installTargetType);
+}
+
+std::string callText(const PlaceholderAttributes& value) {
+    return callText(value.info) +
+           (value.launchProhibited ? ", launch prohibited, version " : ", version ") +
+           callText(value.bundleVersion);
 }
 
 std::string callText(const Status& value) { return value ? "ok" : callText(value.error()); }

@@ -17,6 +17,11 @@
 
 namespace appsync {
 
+struct InstallOptions;
+struct PlaceholderAttributes;
+struct StoreMetadata;
+struct SyncAsset;
+
 // How arguments and results read in a recorded call.
 inline std::string callText(bool value) { return value ? "yes" : "no"; }
 inline std::string callText(std::string_view value) { return std::string(value); }
@@ -26,6 +31,7 @@ template <std::integral Integer>
 std::string callText(Integer value) {
     return std::to_string(value);
 }
+std::string callText(double value);
 std::string callText(ByteView value);
 std::string callText(const Bytes& value);
 std::string callText(const PropertyList& value);
@@ -36,6 +42,11 @@ std::string callText(const FileAttributes& value);
 /// "com.example.a", or "com.example.a (placeholder)".
 std::string callText(const AppProxy& value);
 std::string callText(const std::vector<AppProxy>& value);
+/// "com.example.a, Application, download".
+std::string callText(const SyncAsset& value);
+std::string callText(const StoreMetadata& value);
+std::string callText(const InstallOptions& value);
+std::string callText(const PlaceholderAttributes& value);
 /// "ok", or the error.
 std::string callText(const Status& value);
 

@@ -23,12 +23,6 @@ bool isLegalCharacter(char c) {
            c == '-' || c == '_';
 }
 
-bool isLegalIdentifier(std::string_view identifier) {
-    return !identifier.empty() && identifier.size() <= kLongestIdentifier && identifier != "." &&
-           identifier != ".." &&
-           std::all_of(identifier.begin(), identifier.end(), isLegalCharacter);
-}
-
 ErrorRecord refused(const std::string& why) {
     return ErrorRecord::make(kRegistryErrorDomain, kRefused, why);
 }
@@ -45,7 +39,8 @@ Result<std::string> checkedIdentifier(const PropertyList& options, std::string_v
     }
     const std::string* identifier = options.findString(BundleIdentifierKey);
     if (identifier == nullptr) return refused("the options name no bundle identifier");
-    if (!isLegalIdentifier(*identifier)) return refused("'" + *identifier + "' is no identifier");
+    if (!SimulatedAppRegistry::isLegalIdentifier(*identifier))
+        return refused("'" + *identifier + "' is no identifier");
     return *identifier;
 }
 
@@ -172,16 +167,20 @@ Status SimulatedAppRegistry::installPackageNow(const FileURL& package,
                                                const PropertyList& options) {
     const Result<std::string> identifier = checkedIdentifier(options, PackageTypeCustomer);
     if (!identifier) return identifier.error();
+    return install(*identifier, package.path());
+}
+
+Status SimulatedAppRegistry::install(const std::string& identifier, const std::string& path) {
     if (installDuration_ > SimulatedTime::zero()) {
-        recorder_.scheduler().waitFor("the install of " + *identifier, installDuration_,
+        recorder_.scheduler().waitFor("the install of " + identifier, installDuration_,
                                       [] { return false; });
     }
-    Status status = takeFailure(installFailures_, *identifier);
-    if (status) status = checkPackage(*identifier, package.path());
+    Status status = takeFailure(installFailures_, identifier);
+    if (status) status = checkPackage(identifier, path);
     if (status) {
-        commitPackage(*identifier);
+        commitPackage(identifier);
     } else {
-        markFailed(*identifier);
+        markFailed(identifier);
     }
     return status;
 }
@@ -463,6 +462,40 @@ void SimulatedAppRegistry::cancelInstalls(const std::vector<std::string>& identi
     }
     reportChange();
     reportCancel(cancelled);
+}
+
+// Other services.
+
+bool SimulatedAppRegistry::isLegalIdentifier(std::string_view identifier) {
+    return !identifier.empty() && identifier.size() <= kLongestIdentifier && identifier != "." &&
+           identifier != ".." &&
+           std::all_of(identifier.begin(), identifier.end(), isLegalCharacter);
+}
+
+Status SimulatedAppRegistry::showPlaceholder(AppProxy proxy) {
+    const std::string identifier = proxy.applicationIdentifier;
+    if (Status failure = takeFailure(placeholderFailures_, identifier); !failure) return failure;
+    const AppProxy usual = proxyWithUsualPaths(identifier, true);
+    proxy.bundlePath = usual.bundlePath;
+    proxy.bundleContainerPath = usual.bundleContainerPath;
+    proxy.state = usual.state;
+    if (const auto application = installed(identifier)) {
+        proxy.applicationType = application->applicationType;
+    }
+    add(std::move(proxy));
+    startProgress(identifier, applications_[identifier]);
+    return {};
+}
+
+void SimulatedAppRegistry::hidePlaceholder(const std::string& identifier) {
+    Application* application = find(identifier);
+    if (application == nullptr || !application->placeholder) return;
+    removePlaceholder(*application, kInstallStateCanceled);
+    dropIfEmpty(identifier);
+}
+
+Status SimulatedAppRegistry::uninstall(const std::string& identifier) {
+    return uninstallNow(identifier, {});
 }
 
 // The test's side.

@@ -80,6 +80,18 @@ class SimulatedAppRegistry : public AppRegistry {
     [[nodiscard]] std::vector<std::string> placeholderIdentifiers() const;
     [[nodiscard]] std::size_t observers() const { return subscriptions_.size(); }
 
+    // What other services of the device do with it.
+    [[nodiscard]] static bool isLegalIdentifier(std::string_view identifier);
+    /// Installs the file at a path as the package of the identifier; fails as `installPackage`
+    /// does.
+    Status install(const std::string& identifier, const std::string& path);
+    /// Shows the placeholder with the usual paths; fails as `failNextPlaceholderInstall` says.
+    Status showPlaceholder(AppProxy proxy);
+    /// Takes away the placeholder, if there is one: its install was cancelled or has failed.
+    void hidePlaceholder(const std::string& identifier);
+    /// Fails as `uninstallApplication` does.
+    Status uninstall(const std::string& identifier);
+
     // Answers. Each identifier's failures are used up one by one, in the order given.
     void failNextInstall(const std::string& identifier, ErrorRecord error);
     void failNextPlaceholderInstall(const std::string& identifier, ErrorRecord error);

@@ -14,11 +14,6 @@ PolicyAnswer SimulatedDevicePolicy::effectiveValue(PolicyFeature feature) {
     return call.result(answer, std::to_string(static_cast<int>(answer)));
 }
 
-bool SimulatedCoordination::isCoordinationEnabled() {
-    RecordedCall call(recorder_, "InstallCoordinatorService", "isCoordinationEnabled");
-    return call.result(enabled_);
-}
-
 class SimulatedBackupService::Manager : public BackupManager {
   public:
     explicit Manager(SimulatedBackupService& service) : service_(service) {}

@@ -9,7 +9,6 @@
 
 #include "platform/BackupService.h"
 #include "platform/DevicePolicyService.h"
-#include "platform/InstallCoordinatorService.h"
 #include "platform/InstallTransactionLog.h"
 #include "platform/InstallerService.h"
 #include "simulation/Recorder.h"
@@ -30,19 +29,6 @@ class SimulatedDevicePolicy : public DevicePolicyService {
   private:
     Recorder& recorder_;
     std::map<PolicyFeature, PolicyAnswer> answers_;
-};
-
-/// Coordination is off until the test turns it on.
-class SimulatedCoordination : public InstallCoordinatorService {
-  public:
-    explicit SimulatedCoordination(Recorder& recorder) : recorder_(recorder) {}
-    [[nodiscard]] bool isCoordinationEnabled() override;
-
-    void setEnabled(bool enabled) { enabled_ = enabled; }
-
-  private:
-    Recorder& recorder_;
-    bool enabled_ = false;
 };
 
 /// Holds no restore data until the test adds some.

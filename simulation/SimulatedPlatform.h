@@ -13,6 +13,7 @@
 #include "simulation/Recorder.h"
 #include "simulation/Scheduler.h"
 #include "simulation/SimulatedAppRegistry.h"
+#include "simulation/SimulatedCoordination.h"
 #include "simulation/SimulatedDeviceServices.h"
 #include "simulation/SimulatedFileSystem.h"
 #include "simulation/SimulatedHomeScreen.h"
@@ -21,6 +22,7 @@
 #include "simulation/SimulatedNotifications.h"
 #include "simulation/SimulatedPropertyLists.h"
 #include "simulation/SimulatedSyncHost.h"
+#include "simulation/SimulatedTransferService.h"
 #include "simulation/SimulatedWorkQueues.h"
 
 namespace appsync {
@@ -100,6 +102,7 @@ class SimulatedPlatform {
 
     Scheduler scheduler;
     Recorder recorder;
+    SimulatedTransferService transfers;  // the host's
     SimulatedSyncHost host;
     SimulatedLogFacility log;
     SimulatedWorkQueues queues;

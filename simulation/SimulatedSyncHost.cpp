@@ -22,4 +22,9 @@ bool SimulatedSyncHost::isRecoverableError(const ErrorRecord& error) const {
     return call.result(recoverable_(error));
 }
 
+TransferService* SimulatedSyncHost::transferService() {
+    RecordedCall call(recorder_, kService, "transferService");
+    return call.result(transfers_, transfers_ != nullptr ? "a service" : "(null)");
+}
+
 }  // namespace appsync

@@ -163,8 +163,35 @@ void AppsClient::installDidFailUnrecoverably(const SyncAsset& asset, const Error
     log_(Level::Default, "%s|%{public}@ install failed unrecoverably: %{public}@", identifier,
          error);
     changeAssetID(identifier, kTodoFailed);
-    // No restore comes here today; one that did would have its restore given up.
-    if (asset.isRestore) _backupManager->cancelApplicationRestore(identifier);
+    if (asset.isRestore) giveUpFailedRestore(identifier);
+    removeFailedInstall(asset);
+}
+
+// No restore comes here today; one that did would have its restore given up.
+void AppsClient::giveUpFailedRestore(const std::string& identifier) const {
+    if (_useInstallCoordinator) {
+        log_(Level::Default,
+             "%s|not asking backup manager to cancel app restore for %{public}@ as install "
+             "coordination is enabled",
+             identifier);
+        return;
+    }
+    _backupManager->cancelApplicationRestore(identifier);
+}
+
+void AppsClient::removeFailedInstall(const SyncAsset& asset) {
+    if (!_useInstallCoordinator) {
+        uninstallFailedInstall(asset.identifier);
+    } else if (!asset.isRestore) {
+        uninstallAppUsingCoordination(asset.identifier);
+    } else {
+        log_(Level::Default,
+             "%s|not uninstalling restore asset %{public}@ as install coordination is enabled",
+             asset.identifier);
+    }
+}
+
+void AppsClient::uninstallFailedInstall(const std::string& identifier) {
     const Status uninstalled = platform_.registry.uninstallApplication(identifier, {});
     if (!uninstalled) log_(Level::Error, "%s|Uninstall of %{public}@ failed.", identifier);
     recordRestore(uninstalled.ok(), identifier,
@@ -172,12 +199,22 @@ void AppsClient::installDidFailUnrecoverably(const SyncAsset& asset, const Error
 }
 
 bool AppsClient::_isRecoverableError(const ErrorRecord* error) const {
+    if (_useInstallCoordinator) {
+        log_(Level::Default,
+             "%s|Tessarin is enabled - treating error %{public}@ as non recoverable", error);
+        return false;
+    }
     if (error == nullptr || !platform_.host.isRecoverableError(*error)) return false;
     return error->domain != kInstallerErrorDomain && error->domain != kRegistryErrorDomain;
 }
 
 std::shared_ptr<InstallProgressRecord> AppsClient::_progressForAssetIdentifier(
     const std::string& identifier) const {
+    if (_useInstallCoordinator) {
+        log_(Level::Default, "%s|Not returning XOProgress * for %{public}@ as tessarin is enabled",
+             identifier);
+        return nullptr;
+    }
     const auto proxy =
         platform_.registry.proxyForIdentifier(identifier, AppRegistry::Placeholders::Included);
     auto progress = proxy ? platform_.registry.installProgress(*proxy, kWholeInstall) : nullptr;

@@ -3,6 +3,7 @@
 #include <utility>
 
 #include "client/AppsClient.h"
+#include "client/Dataclass.h"
 #include "client/Paths.h"
 #include "client/PropertyListFile.h"
 #include "client/SafeIdentifier.h"
@@ -25,7 +26,6 @@ struct AppsClient::Wants {
 
 namespace {
 
-constexpr std::string_view kDataclass = "Application";
 constexpr std::string_view kAssetPartsKey = "AssetParts";
 constexpr std::string_view kVersionKey = "Version";
 constexpr std::size_t kInitialCapacity = 16;
@@ -159,14 +159,9 @@ SyncAssetPointer AppsClient::prepareAsset(const PropertyList& itemMap, const Wan
     item.displayName = displayNameOfBundle(platform_, item.bundlePath);
     if (isSkipped(item, wants)) return nullptr;
     SyncAssetPointer asset = makeAsset(item, restoreState);
-    if (wants.placeholders.contains(item.identifier)) {
-        log_(Level::Default,
-             "%s|Not creating a placeholder app for %{public}@ because we already have one",
-             item.identifier);
-        return nullptr;
-    }
-    _createPlaceHolderApplication(*asset);
-    return asset;
+    const bool isWanted = _useInstallCoordinator ? prepareCoordinator(*asset)
+                                                 : createMissingPlaceholder(*asset, wants);
+    return isWanted ? asset : nullptr;
 }
 
 bool AppsClient::isSkipped(const TransferItem& item, const Wants& wants) const {
@@ -176,17 +171,88 @@ bool AppsClient::isSkipped(const TransferItem& item, const Wants& wants) const {
              item.identifier);
         return true;
     }
-    if (item.isRestore && _kolmAppsToIgnore.contains(item.identifier)) {
+    return isSkippedRestore(item) || isSkippedSystemApp(item, wants) ||
+           isSkippedDemotedApp(item, wants);
+}
+
+bool AppsClient::isSkippedRestore(const TransferItem& item) const {
+    if (!item.isRestore) return false;
+    if (_kolmAppsToIgnore.contains(item.identifier)) {
         log_(Level::Default,
              "%s|%{public}@ is currenlty marked as to be ignored for download - skipping",
              item.identifier);
         return true;
     }
-    if (wants.systemAppPlaceholders.contains(item.identifier)) {
-        log_(Level::Default, "%s|%{public}@ is system app placeholder - skipping", item.identifier);
+    if (!_useInstallCoordinator) return false;
+    log_(Level::Default,
+         "%s|%{public}@ is currenlty marked to be restored and will be handled by bazaard - "
+         "skipping",
+         item.identifier);
+    return true;
+}
+
+bool AppsClient::isSkippedSystemApp(const TransferItem& item, const Wants& wants) const {
+    if (item.isSystemApp && _useInstallCoordinator) {
+        log_(Level::Default,
+             "%s|%{public}@ is auto demoted: %d, manual demoted: %d, system app:%d - skipping",
+             item.identifier, item.isAutomaticallyDemoted, item.isIntentionallyDemoted,
+             item.isSystemApp);
         return true;
     }
-    return false;
+    if (!wants.systemAppPlaceholders.contains(item.identifier)) return false;
+    log_(Level::Default, "%s|%{public}@ is system app placeholder - skipping", item.identifier);
+    return true;
+}
+
+bool AppsClient::isSkippedDemotedApp(const TransferItem& item, const Wants& wants) const {
+    const bool isDemoted = item.isAutomaticallyDemoted || item.isIntentionallyDemoted;
+    if (!isDemoted || !_useInstallCoordinator) return false;
+    // The numbers stand in the reverse order of their labels on purpose.
+    if (wants.requestedIdentifiers.contains(item.identifier)) {
+        log_(Level::Default,
+             "%s|%{public}@ is currenlty demoted (manual:%d, auto:%d) - but will be installed as "
+             "it's requested by client",
+             item.identifier, item.isAutomaticallyDemoted, item.isIntentionallyDemoted);
+        return false;
+    }
+    log_(Level::Default, "%s|%{public}@ is currenlty demoted (manual:%d, auto:%d) - skipping",
+         item.identifier, item.isAutomaticallyDemoted, item.isIntentionallyDemoted);
+    return true;
+}
+
+bool AppsClient::createMissingPlaceholder(const SyncAsset& asset, const Wants& wants) {
+    if (wants.placeholders.contains(asset.identifier)) {
+        log_(Level::Default,
+             "%s|Not creating a placeholder app for %{public}@ because we already have one",
+             asset.identifier);
+        return false;
+    }
+    _createPlaceHolderApplication(asset);
+    return true;
+}
+
+bool AppsClient::prepareCoordinator(const SyncAsset& asset) {
+    const std::string& identifier = asset.identifier;
+    const bool existingApp = isExistingApp(identifier);
+    if (existingApp) {
+        log_(Level::Default, "%s|App %{public}@ is already installed and will be updated.",
+             identifier);
+    }
+    if (!prepareAppForInstallUsingCoordination(asset, existingApp)) {
+        log_(Level::Error, "%s|Not requesting app asset for %{public}@", identifier);
+        changeAssetID(identifier, kTodoFailed);
+        return false;
+    }
+    _accessQueue->sync([&] {
+        if (existingApp) _updatingApps.insert(identifier);
+    });
+    return true;
+}
+
+bool AppsClient::isExistingApp(const std::string& identifier) const {
+    const auto proxy =
+        platform_.registry.proxyForIdentifier(identifier, AppRegistry::Placeholders::Excluded);
+    return proxy && proxy->state.installed && !proxy->state.placeholder;
 }
 
 SyncAssetPointer AppsClient::makeAsset(const TransferItem& item,

@@ -7,19 +7,26 @@
 #include "client/Paths.h"
 #include "client/SafeIdentifier.h"
 #include "client/TodoList.h"
+#include "coordination/InstallErrors.h"
 #include "platform/BackupService.h"
+#include "transfer/DownloadAsset.h"
 #include "transfer/InstallNames.h"
 #include "transfer/RestoreState.h"
 
 namespace appsync {
 
+/// What is known when a transfer ends.
+struct AppsClient::TransferEnd {
+    SyncAssetPointer asset;
+    bool isExistingApp = false;
+    bool isUserCancelled = false;
+    // Null where there is none.
+    std::shared_ptr<InstallProgressRecord> progress;
+};
+
 namespace {
 
-constexpr std::string_view kDataclass = "Application";
 constexpr std::int64_t kTotalUnits = 1000;
-
-/// The code, in `kSyncErrorDomain`, of a transfer whose install was cancelled on the device.
-constexpr std::int64_t kInstallCancelled = 2;
 
 /// The fraction in thousandths, truncated toward zero. What is no number is none.
 std::int64_t thousandths(double fraction) {
@@ -27,15 +34,6 @@ std::int64_t thousandths(double fraction) {
     const double scaled = fraction * static_cast<double>(kTotalUnits);
     if (std::isnan(scaled)) return 0;
     return static_cast<std::int64_t>(std::clamp(scaled, -most, most));
-}
-
-/// The asset as the host knows it by its application alone.
-SyncAssetPointer downloadAsset(const std::string& identifier) {
-    auto asset = std::make_shared<SyncAsset>();
-    asset->identifier = identifier;
-    asset->dataclass = kDataclass;
-    asset->isDownload = true;
-    return asset;
 }
 
 bool isCancellable(const InstallProgressRecord& progress) {
@@ -47,52 +45,72 @@ bool isCancellable(const InstallProgressRecord& progress) {
 void AppsClient::assetTransferUpdatedProgress(const SyncAssetPointer& asset, double progress) {
     const std::string& identifier = asset->identifier;
     log_(Level::Default, "%s|finished transferring %lf for %{public}@", progress, identifier);
-    const std::int64_t completed = thousandths(progress);
-    if (const auto record = _progressForAssetIdentifier(identifier)) {
-        record->setInstallState(kInstallStateActive);
-        if (record->totalUnitCount() != kTotalUnits) record->setTotalUnitCount(kTotalUnits);
-        record->setCompletedUnitCount(completed);
+    if (_useInstallCoordinator) {
+        bool isExistingApp = false;
+        _accessQueue->sync([&] { isExistingApp = _updatingApps.contains(identifier); });
+        updateTransferProgressForApp(*asset, isExistingApp);
+    } else {
+        updateProgressRecord(identifier, progress);
     }
     _outstandingHFTTransfers.insert(identifier);
+}
+
+void AppsClient::updateProgressRecord(const std::string& identifier, double fraction) const {
+    const std::int64_t completed = thousandths(fraction);
+    const auto record = _progressForAssetIdentifier(identifier);
+    if (record == nullptr) return;
+    record->setInstallState(kInstallStateActive);
+    if (record->totalUnitCount() != kTotalUnits) record->setTotalUnitCount(kTotalUnits);
+    record->setCompletedUnitCount(completed);
 }
 
 void AppsClient::assetTransferSucceeded(const SyncAssetPointer& asset, bool succeeded,
                                         const ErrorRecord* error) {
     const std::string& identifier = asset->identifier;
-    bool isExistingApp = false;
+    TransferEnd end{asset, false, false, nullptr};
     _accessQueue->sync([&] {
-        isExistingApp = _updatingApps.erase(identifier) != 0;
-        _userCancelledApps.erase(identifier);
+        end.isExistingApp = _updatingApps.erase(identifier) != 0;
+        end.isUserCancelled = _userCancelledApps.erase(identifier) != 0;
     });
     _outstandingHFTTransfers.erase(identifier);
     log_(Level::Default,
          "%s|transfer for asset %{public}@ ended with success %c error %{public}@ existingApp:%d",
-         identifier, yesOrNo(succeeded), error, isExistingApp);
-    const auto progress = _progressForAssetIdentifier(identifier);
+         identifier, yesOrNo(succeeded), error, end.isExistingApp);
+    end.progress = _progressForAssetIdentifier(identifier);
     if (succeeded) {
-        transferDidSucceed(asset, progress.get());
+        transferDidSucceed(end);
     } else {
-        transferDidFail(*asset, error, progress.get());
+        transferDidFail(end, error);
     }
 }
 
-void AppsClient::transferDidSucceed(const SyncAssetPointer& asset,
-                                    InstallProgressRecord* progress) {
-    const std::string& identifier = asset->identifier;
-    log_(Level::Default, "%s|asset transfer succeeded for %{public}@", identifier);
-    if (progress != nullptr) platform_.registry.finishInstallPhase(*progress);
-    resolvePath(*asset);
-    if (!isSafe(asset->path)) {
-        log_(Level::Default, "%s|Ignoring invalid path: %{public}@", asset->path);
+void AppsClient::transferDidSucceed(const TransferEnd& end) {
+    SyncAsset& asset = *end.asset;
+    log_(Level::Default, "%s|asset transfer succeeded for %{public}@", asset.identifier);
+    finishLoading(end);
+    resolvePath(asset);
+    if (!isSafe(asset.path)) {
+        log_(Level::Default, "%s|Ignoring invalid path: %{public}@", asset.path);
         return;
     }
-    if (!asset->isDownload) {
-        changeAssetID(identifier, kTodoSent);
+    if (!asset.isDownload) {
+        changeAssetID(asset.identifier, kTodoSent);
         return;
     }
-    log_(Level::Default, "%s|Received file at %{public}@", asset->path);
-    changeAssetID(identifier, kTodoDownloaded);
-    packageDidArrive(asset, progress);
+    log_(Level::Default, "%s|Received file at %{public}@", asset.path);
+    changeAssetID(asset.identifier, kTodoDownloaded);
+    packageDidArrive(end);
+}
+
+void AppsClient::finishLoading(const TransferEnd& end) const {
+    if (end.progress == nullptr) return;
+    if (_useInstallCoordinator) {
+        log_(Level::Default,
+             "%s|not setting install phase finished for %{public}@ as coordination is enabled",
+             end.asset->identifier);
+        return;
+    }
+    platform_.registry.finishInstallPhase(*end.progress);
 }
 
 void AppsClient::resolvePath(SyncAsset& asset) const {
@@ -106,51 +124,96 @@ void AppsClient::resolvePath(SyncAsset& asset) const {
     if (recorded && recorded->isString()) asset.path = *recorded->asString();
 }
 
-void AppsClient::packageDidArrive(const SyncAssetPointer& asset, InstallProgressRecord* progress) {
-    if (!asset->isRestore) {
-        log_(Level::Default, "%s|Installing synced asset %{public}@", asset->identifier);
-        _enqueueAssetInstall(asset);
-    } else if (asset->completedParts != kAssetPartApplicationData) {
-        restorePackageDidArrive(asset, progress);
+void AppsClient::packageDidArrive(const TransferEnd& end) {
+    if (!end.asset->isRestore) {
+        syncedPackageDidArrive(end);
+    } else if (end.asset->completedParts != kAssetPartApplicationData) {
+        restorePackageDidArrive(end);
     } else {
-        _enqueueAssetInstall(asset);
+        restoreDataDidArrive(end);
     }
 }
 
-void AppsClient::restorePackageDidArrive(const SyncAssetPointer& asset,
-                                         InstallProgressRecord* progress) {
-    const std::string& identifier = asset->identifier;
-    if (!_backupManager->restoreDataExists(identifier)) {
-        log_(Level::Default, "%s|No restore data exists for %{public}@", identifier);
-        _enqueueAssetInstall(asset);
+void AppsClient::syncedPackageDidArrive(const TransferEnd& end) {
+    log_(Level::Default, "%s|Installing synced asset %{public}@", end.asset->identifier);
+    if (_useInstallCoordinator) {
+        transferCompleteForApp(*end.asset, nullptr, end.isExistingApp);
+    } else {
+        _enqueueAssetInstall(end.asset);
+    }
+}
+
+void AppsClient::restorePackageDidArrive(const TransferEnd& end) {
+    const SyncAsset& asset = *end.asset;
+    if (_useInstallCoordinator) {
+        log_(Level::Default,
+             "%s|Not processing restore asset %{public}@ as coordination is enabled",
+             asset.identifier);
         return;
     }
-    log_(Level::Default, "%s|Restore data exists for %{public}@", identifier);
-    if (progress != nullptr) progress->setInstallPhase(kInstallPhaseRestoringData);
-    _setRestoreStatePropertyValue(*asset->path, kRestoreStatePathKey, identifier, asset->version());
+    if (!_backupManager->restoreDataExists(asset.identifier)) {
+        log_(Level::Default, "%s|No restore data exists for %{public}@", asset.identifier);
+        _enqueueAssetInstall(end.asset);
+        return;
+    }
+    log_(Level::Default, "%s|Restore data exists for %{public}@", asset.identifier);
+    if (end.progress != nullptr) end.progress->setInstallPhase(kInstallPhaseRestoringData);
+    _setRestoreStatePropertyValue(*asset.path, kRestoreStatePathKey, asset.identifier,
+                                  asset.version());
 }
 
-void AppsClient::transferDidFail(const SyncAsset& asset, const ErrorRecord* error,
-                                 InstallProgressRecord* progress) {
-    const std::string& identifier = asset.identifier;
+void AppsClient::restoreDataDidArrive(const TransferEnd& end) {
+    if (_useInstallCoordinator) {
+        log_(Level::Default,
+             "%s|Not processing kTRAssetPartApplicationData for restore asset %{public}@ as "
+             "coordination is enabled",
+             end.asset->identifier);
+        return;
+    }
+    _enqueueAssetInstall(end.asset);
+}
+
+void AppsClient::transferDidFail(const TransferEnd& end, const ErrorRecord* error) {
+    const std::string& identifier = end.asset->identifier;
     const bool recoverable = _isRecoverableError(error);
     log_(Level::Default, "%s|failed to transfer asset %{public}@. err=%{public}@, recoverable=%d",
          identifier, error, recoverable);
     if (recoverable) {
-        if (progress != nullptr) progress->setInstallState(kInstallStateFailed);
+        if (end.progress != nullptr) end.progress->setInstallState(kInstallStateFailed);
         return;
     }
     if (!platform_.registry.isApplicationInstalled(identifier)) return;
-    if (asset.isRestore) return;
-    removePlaceholder(asset, progress);
+    if (end.asset->isRestore) return;
+    giveUpInstall(end, error);
 }
 
-void AppsClient::removePlaceholder(const SyncAsset& asset, InstallProgressRecord* progress) {
-    const std::string& identifier = asset.identifier;
-    if (progress != nullptr && isCancellable(*progress)) progress->cancel();
-    log_(Level::Default, "%s|Uninstalling placeholder %{public}@", identifier);
-    // No restore comes here today; one that did would have its restore given up.
-    if (asset.isRestore) _backupManager->cancelApplicationRestore(identifier);
+void AppsClient::giveUpInstall(const TransferEnd& end, const ErrorRecord* error) {
+    const SyncAsset& asset = *end.asset;
+    if (end.progress != nullptr && isCancellable(*end.progress)) end.progress->cancel();
+    log_(Level::Default, "%s|Uninstalling placeholder %{public}@", asset.identifier);
+    if (asset.isRestore) giveUpRestore(asset.identifier);
+    if (!_useInstallCoordinator) {
+        removePlaceholder(asset.identifier);
+    } else if (!end.isUserCancelled) {
+        // Without an error the coordinator would take the transfer for complete.
+        const ErrorRecord unexplained = makeInstallError(InstallError::InstallFailed);
+        transferCompleteForApp(asset, error != nullptr ? error : &unexplained, end.isExistingApp);
+    }
+}
+
+// No restore comes here today; one that did would have its restore given up.
+void AppsClient::giveUpRestore(const std::string& identifier) const {
+    if (_useInstallCoordinator) {
+        log_(Level::Default,
+             "%s|Install coordination is enabled - not calling "
+             "cancelApplicationRestoreWithBundleID for %{public}@",
+             identifier);
+        return;
+    }
+    _backupManager->cancelApplicationRestore(identifier);
+}
+
+void AppsClient::removePlaceholder(const std::string& identifier) const {
     const Status uninstalled = platform_.registry.uninstallApplication(
         identifier, PropertyList::map({{UninstallPlaceholderOnlyKey, true}}));
     log_(Level::Default, "%s|Uninstalling app using RG %{public}@ %s", identifier,
@@ -165,7 +228,11 @@ void AppsClient::assetTransferEndedWithSuccess(bool success) {
     const std::set<std::string> outstanding = _outstandingHFTTransfers.contents();
     if (outstanding.empty()) return;
 
-    closeOutstandingTransfers(outstanding, success);
+    if (_useInstallCoordinator) {
+        assetSyncFinishedWithStatus(success, outstanding);
+    } else {
+        closeOutstandingTransfers(outstanding, success);
+    }
     if (success) {
         log_(Level::Error, "%s|Called with success == YES but with %lu outstanding HFT transfers!",
              outstanding.size());
@@ -195,10 +262,16 @@ void AppsClient::applicationInstallsArePrioritized(const std::vector<AppProxy>& 
                                                    const std::vector<AppProxy>& /*paused*/) {}
 
 void AppsClient::applicationInstallsDidCancel(const std::vector<AppProxy>& cancelled) {
+    if (_useInstallCoordinator) {
+        log_(Level::Default,
+             "%s|not handling applicationInstallsDidCancel because install coordination is "
+             "enabled.");
+        return;
+    }
     for (const AppProxy& proxy : cancelled) {
         if (proxy.installType != kInstallTypeRestore) continue;
-        const ErrorRecord error{std::string(kSyncErrorDomain), kInstallCancelled, {}};
-        assetTransferSucceeded(downloadAsset(proxy.applicationIdentifier), false, &error);
+        const ErrorRecord error = makeInstallError(InstallError::InstallCancelled);
+        assetTransferSucceeded(makeDownloadAsset(proxy.applicationIdentifier), false, &error);
     }
 }
 

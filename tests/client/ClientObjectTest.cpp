@@ -53,7 +53,9 @@ TEST_F(ClientObject, InsideTheDaemonListensForItsStart) {
     platform_.notificationCenter.post(kStartup);
     platform_.runUntilIdle();
     EXPECT_THAT(platform_.lines(),
-                ElementsAre("NotificationCenterObserver.callback(" + std::string(kStartup) + ")"));
+                ElementsAre("NotificationCenterObserver.callback(" + std::string(kStartup) + ")",
+                            "InstallCoordinatorService.makeAppInstallObserver(com.korvu.trd.rlink."
+                            "tsappobserverdelegate, 3) -> an observer"));
 }
 
 TEST_F(ClientObject, StopsListeningWhenItIsDestroyed) {
@@ -82,24 +84,20 @@ TEST_F(ClientObject, WarnsOfAwaitedPlaceholdersWhenItIsDestroyed) {
                        "placeholder install complete notifications"));
 }
 
-TEST_F(ClientObject, IsRefusedOnADeviceThatCoordinatesItsInstalls) {
-    client_.reset();
-    platform_.clearRecording();
-    platform_.coordination.setEnabled(true);
-    std::optional<ErrorRecord> error;
-    EXPECT_EQ(AppsClient::create(platform_.services(), &error), nullptr);
-    ASSERT_TRUE(error);
-    EXPECT_EQ(error->domain, kPosixErrorDomain);
-    EXPECT_THAT(error->description(), testing::HasSubstr("turn install coordination off"));
-    EXPECT_EQ(AppsClient::create(platform_.services()), nullptr);
-    EXPECT_THAT(platform_.callsTo({"InstallCoordinatorService"}), testing::SizeIs(2));
-    EXPECT_EQ(platform_.registry.observers(), 0U);
-}
-
 TEST_F(ClientObject, AsksOnceWhetherInstallsAreCoordinated) {
     platform_.coordination.setEnabled(true);
     client_->assetTransferUpdatedProgress(receivedAsset(kA), 0.5);
     EXPECT_THAT(client_->outstandingAssetTransfers(), testing::IsEmpty());
+    EXPECT_THAT(platform_.callsTo({"InstallCoordinatorService"}), testing::IsEmpty());
+}
+
+TEST_F(ClientObject, KeepsToCoordinationForItsWholeLife) {
+    platform_.coordination.setEnabled(true);
+    makeClient();
+    platform_.coordination.setEnabled(false);
+    EXPECT_EQ(client_->_progressForAssetIdentifier(kA), nullptr);
+    EXPECT_THAT(platform_.messages(),
+                ElementsAre("Not returning XOProgress * for com.example.a as tessarin is enabled"));
     EXPECT_THAT(platform_.callsTo({"InstallCoordinatorService"}), testing::IsEmpty());
 }
 

@@ -1,4 +1,4 @@
-#include "client/StoreMetadata.h"
+#include "client/StoreMetadataFile.h"
 
 #include <string_view>
 
@@ -44,30 +44,30 @@ std::string storeMetadataPath(const AppProxy& proxy) {
     return formatPath(kStoreMetadataFormat, {proxy.bundleContainerPath});
 }
 
-StoreMetadata::StoreMetadata(const Platform& platform, const AppProxy& proxy)
+StoreMetadataFile::StoreMetadataFile(const Platform& platform, const AppProxy& proxy)
     : log_(platform),
       map_(readMapFile(platform, storeMetadataPath(proxy)).value_or(PropertyList())) {}
 
-const std::string* StoreMetadata::korvuID() const {
+const std::string* StoreMetadataFile::korvuID() const {
     return typedString(log_, &map_, kKorvuIdKey, kKorvuIdName);
 }
 
-StoreMetadata::AccountInfo StoreMetadata::accountInfo() const {
+StoreMetadataFile::AccountInfo StoreMetadataFile::accountInfo() const {
     const PropertyList* downloadInfo =
         typedValue(log_, &map_, kDownloadInfoKey, kDownloadInfoName, isMap);
     return {log_, typedValue(log_, downloadInfo, kAccountInfoKey, kAccountInfoKey, isMap)};
 }
 
-const std::string* StoreMetadata::AccountInfo::korvuID() const {
+const std::string* StoreMetadataFile::AccountInfo::korvuID() const {
     return typedString(log_, map_, kAccountKorvuIdKey, kAccountKorvuIdKey);
 }
 
-std::optional<std::int64_t> StoreMetadata::AccountInfo::personID() const {
+std::optional<std::int64_t> StoreMetadataFile::AccountInfo::personID() const {
     const PropertyList* value = typedValue(log_, map_, kPersonIdKey, kPersonIdKey, isNumber);
     return value != nullptr ? value->asInteger() : std::nullopt;
 }
 
-const std::string* StoreMetadata::AccountInfo::alternatePersonID() const {
+const std::string* StoreMetadataFile::AccountInfo::alternatePersonID() const {
     return typedString(log_, map_, kAlternatePersonIdKey, kAlternatePersonIdKey);
 }
 

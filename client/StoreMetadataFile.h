@@ -15,12 +15,12 @@ struct Platform;
 /// Where an application's store metadata lies: in the root of its bundle container.
 [[nodiscard]] std::string storeMetadataPath(const AppProxy& proxy);
 
-/// An application's store metadata, as far as it tells who bought it. A value of another type than
-/// expected is logged and counts as absent. A number is an integer that 64 bits hold, signed.
-class StoreMetadata {
+/// An application's store metadata file, as far as it tells who bought it. A value of another type
+/// than expected is logged and counts as absent. A number is an integer that 64 bits hold, signed.
+class StoreMetadataFile {
   public:
     /// Reads the file; one that is missing or damaged holds nothing.
-    StoreMetadata(const Platform& platform, const AppProxy& proxy);
+    StoreMetadataFile(const Platform& platform, const AppProxy& proxy);
 
     /// The account identifier at the top level. Each call looks, and logs, again.
     [[nodiscard]] const std::string* korvuID() const;
@@ -34,11 +34,11 @@ class StoreMetadata {
         [[nodiscard]] const std::string* alternatePersonID() const;
 
       private:
-        friend class StoreMetadata;
+        friend class StoreMetadataFile;
         AccountInfo(const Log& log, const PropertyList* map) : log_(log), map_(map) {}
 
         Log log_;
-        const PropertyList* map_;  // belongs to the StoreMetadata; null when there is none
+        const PropertyList* map_;  // belongs to the file; null when there is none
     };
     /// Lives no longer than this object.
     [[nodiscard]] AccountInfo accountInfo() const;

@@ -1,0 +1,80 @@
+#include "simulation/SimulatedPromises.h"
+
+#include <type_traits>
+
+#include "simulation/RecordedCall.h"
+#include "simulation/SimulatedCoordination.h"
+
+namespace appsync {
+namespace {
+
+constexpr std::string_view kPathTransferPromise = "PathTransferPromise";
+template <typename Interface>
+constexpr std::string_view kService = std::is_same_v<Interface, PathTransferPromise>
+                                          ? kPathTransferPromise
+                                          : std::string_view("OutOfBandPromise");
+
+}  // namespace
+
+template <typename Interface>
+std::string SimulatedPromise<Interface>::name() const {
+    RecordedCall call(service_.recorder_, kService<Interface>, "name", state_->name);
+    return call.result(state_->name);
+}
+
+template <typename Interface>
+CoordinationClient SimulatedPromise<Interface>::clientIdentifier() const {
+    RecordedCall call(service_.recorder_, kService<Interface>, "clientIdentifier", state_->name);
+    return call.result(state_->client);
+}
+
+template <typename Interface>
+double SimulatedPromise<Interface>::percentComplete() const {
+    RecordedCall call(service_.recorder_, kService<Interface>, "percentComplete", state_->name);
+    return call.result(state_->percent);
+}
+
+template <typename Interface>
+void SimulatedPromise<Interface>::setPercentComplete(double percent) {
+    const RecordedCall call(service_.recorder_, kService<Interface>, "setPercentComplete",
+                            state_->name, percent);
+    if (!state_->over) state_->percent = percent;
+}
+
+template <typename Interface>
+bool SimulatedPromise<Interface>::isComplete() const {
+    RecordedCall call(service_.recorder_, kService<Interface>, "isComplete", state_->name);
+    return call.result(state_->complete);
+}
+
+template <typename Interface>
+void SimulatedPromise<Interface>::setComplete() {
+    const RecordedCall call(service_.recorder_, kService<Interface>, "setComplete", state_->name);
+    if (state_->over || !state_->isAwaited()) return;
+    state_->complete = true;
+    if (const auto coordinator = state_->coordinator.lock()) service_.advance(coordinator);
+}
+
+template <typename Interface>
+void SimulatedPromise<Interface>::cancelForReason(const ErrorRecord& reason,
+                                                  CoordinationClient client) {
+    const RecordedCall call(service_.recorder_, kService<Interface>, "cancelForReason",
+                            state_->name, reason, client);
+    service_.cancelPromise(*state_, reason, client);
+}
+
+template class SimulatedPromise<PathTransferPromise>;
+template class SimulatedPromise<OutOfBandPromise>;
+
+std::optional<FileURL> SimulatedPathTransferPromise::transferPath() const {
+    RecordedCall call(service_.recorder_, kPathTransferPromise, "transferPath", state_->name);
+    return call.result(state_->path);
+}
+
+void SimulatedPathTransferPromise::setTransferPath(const FileURL& path) {
+    const RecordedCall call(service_.recorder_, kPathTransferPromise, "setTransferPath",
+                            state_->name, path);
+    if (!state_->over) state_->path = path;
+}
+
+}  // namespace appsync
