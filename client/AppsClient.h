@@ -24,6 +24,7 @@ namespace appsync {
 class AppInstallObserver;
 class BackupManager;
 class RestoreState;
+enum class CoordinatorKind;
 struct RestoredApp;
 struct TransferItem;
 
