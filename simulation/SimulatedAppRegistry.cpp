@@ -325,14 +325,15 @@ void SimulatedAppRegistry::startProgress(const std::string& identifier, Applicat
     if (application.progress != nullptr) return;
     application.progress = std::make_shared<SimulatedProgressRecord>(recorder_, identifier,
                                                                      [this] { reportChange(); });
-    installOrder_.push_back(identifier);
+    application.installNumber = ++installsBegun_;
+    installs_.emplace(application.installNumber, identifier);
     reportChange();
 }
 
 void SimulatedAppRegistry::endProgress(Application& application, std::uint64_t state) {
     if (application.progress == nullptr) return;
     application.progress->end(state);
-    std::erase(installOrder_, application.progress->identifier());
+    installs_.erase(application.installNumber);
     application.progress.reset();
     reportChange();
 }
@@ -410,7 +411,7 @@ void SimulatedAppRegistry::deliverCancel(Subscription& subscription,
 SimulatedAppRegistry::Report SimulatedAppRegistry::report() const {
     if (scriptedReport_) return *scriptedReport_;
     Report result;
-    for (const std::string& identifier : installOrder_) {
+    for (const auto& [number, identifier] : installs_) {
         const Application* application = find(identifier);
         if (application == nullptr || application->progress == nullptr) continue;
         const std::uint64_t state = application->progress->values().state;

@@ -111,6 +111,7 @@ class SimulatedAppRegistry : public AppRegistry {
         std::optional<AppProxy> installed;
         std::optional<AppProxy> placeholder;
         std::shared_ptr<SimulatedProgressRecord> progress;
+        std::uint64_t installNumber = 0;  // of the install that `progress` is of
     };
     struct Report {
         std::vector<AppProxy> prioritized;
@@ -152,7 +153,8 @@ class SimulatedAppRegistry : public AppRegistry {
     SimulatedFileSystem& files_;
     PropertyListSerialization& codec_;
     std::map<std::string, Application> applications_;
-    std::vector<std::string> installOrder_;  // of the installs under way
+    std::map<std::uint64_t, std::string> installs_;  // those under way, by their numbers
+    std::uint64_t installsBegun_ = 0;
     std::map<std::string, PackageContents> packages_;
     Failures installFailures_;
     Failures placeholderFailures_;

@@ -149,4 +149,10 @@ std::vector<DeviceImplementation> deviceImplementations() {
             {"Reference", [] { return std::make_unique<ReferenceDevice>(); }}};
 }
 
+std::vector<DeviceImplementation> coordinatingDeviceImplementations() {
+    return {simulated("Simulation", Scheduling::runToCompletion()),
+            simulated("SimulationInterleaved", Scheduling::seeded(1)),
+            simulated("SimulationInterleavedOtherwise", Scheduling::seeded(2))};
+}
+
 }  // namespace appsync

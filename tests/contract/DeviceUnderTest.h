@@ -68,6 +68,9 @@ inline std::ostream& operator<<(std::ostream& out, const DeviceImplementation& i
 /// Every implementation that the contract tests run over.
 std::vector<DeviceImplementation> deviceImplementations();
 
+/// Those of them that can coordinate installs.
+std::vector<DeviceImplementation> coordinatingDeviceImplementations();
+
 /// The name of a parameterised test: that of the implementation.
 inline std::string nameOfDevice(const testing::TestParamInfo<DeviceImplementation>& info) {
     return info.param.name;

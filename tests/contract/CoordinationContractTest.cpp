@@ -1,0 +1,557 @@
+#include <gmock/gmock.h>
+#include <gtest/gtest.h>
+
+#include <memory>
+#include <mutex>
+#include <optional>
+#include <string>
+#include <utility>
+#include <vector>
+
+#include "platform/InstallCoordinator.h"
+#include "platform/InstallPlaceholder.h"
+#include "platform/InstallPromises.h"
+#include "platform/LogRendering.h"
+#include "tests/contract/DeviceUnderTest.h"
+
+namespace appsync {
+namespace {
+
+using testing::ElementsAre;
+using testing::HasSubstr;
+using testing::IsEmpty;
+
+using Creation = InstallCoordinatorService::Creation;
+using Kind = CoordinatorKind;
+
+constexpr const char* kA = "com.example.a";
+constexpr const char* kB = "com.example.b";
+constexpr CoordinationClient kOtherClient = 7;
+
+ErrorRecord reason(std::int64_t code = 30) { return {std::string(kSyncErrorDomain), code, {}}; }
+
+/// Keeps what it hears: "placeholder com.example.a", "complete com.example.a, failed", "cancelled
+/// com.example.a, 30, client 7".
+class HearingObserver : public InstallCoordinatorObserver {
+  public:
+    explicit HearingObserver(WorkQueues& queues) : heardOne_(queues.makeSemaphore(0)) {}
+
+    void promiseDidBeginFulfillmentWithIdentifier(std::uint64_t) override {}
+    void coordinatorDidInstallPlaceholder(
+        const std::shared_ptr<InstallCoordinator>& coordinator) override {
+        hear("placeholder " + outcome(*coordinator));
+    }
+    void coordinatorDidCompleteSuccessfully(
+        const std::shared_ptr<InstallCoordinator>& coordinator) override {
+        hear("complete " + outcome(*coordinator));
+    }
+    void coordinatorCanceledWithReason(const std::shared_ptr<InstallCoordinator>& coordinator,
+                                       const ErrorRecord& reason,
+                                       CoordinationClient client) override {
+        hear("cancelled " + coordinator->bundleIdentifier().value_or("?") + ", " +
+             std::to_string(reason.code) + ", client " + std::to_string(client));
+    }
+    void coordinatorShouldPrioritize(const std::shared_ptr<InstallCoordinator>&) override {}
+
+    /// Waits until one more thing has been heard than at the last wait.
+    void waitForOne() { EXPECT_TRUE(heardOne_->wait()); }
+    [[nodiscard]] std::vector<std::string> heard() {
+        const std::lock_guard lock(mutex_);
+        return heard_;
+    }
+
+  private:
+    static std::string outcome(const InstallCoordinator& coordinator) {
+        return coordinator.bundleIdentifier().value_or("?") +
+               (coordinator.error() ? ", failed" : "");
+    }
+    void hear(std::string what) {
+        {
+            const std::lock_guard lock(mutex_);
+            heard_.push_back(std::move(what));
+        }
+        heardOne_->signal();
+    }
+
+    const std::unique_ptr<Semaphore> heardOne_;
+    std::mutex mutex_;
+    std::vector<std::string> heard_;
+};
+
+class CoordinationContract : public DeviceContract {
+  protected:
+    [[nodiscard]] std::shared_ptr<InstallCoordinator> create(
+        Kind kind, const std::string& identifier, CoordinationClient client = SyncClientID) {
+        const auto result =
+            service_.coordinator(kind, identifier, client, Creation::CreateIfNotExisting);
+        EXPECT_TRUE(result.wasCreated);
+        EXPECT_NE(result.coordinator, nullptr);
+        if (result.coordinator != nullptr) result.coordinator->setObserver(observer_);
+        return result.coordinator;
+    }
+    [[nodiscard]] InstallCoordinatorService::Coordinator existing(Kind kind,
+                                                                  const std::string& identifier) {
+        return service_.coordinator(kind, identifier, SyncClientID, Creation::OnlyExisting);
+    }
+    [[nodiscard]] std::shared_ptr<PathTransferPromise> assetPromise(
+        const std::string& identifier, const std::optional<std::string>& path = std::nullopt) {
+        const auto url = path ? FileURL::fromPath(*path, false) : std::nullopt;
+        return service_.makePathTransferPromise(identifier + "-Asset", SyncClientID, url, 0);
+    }
+    [[nodiscard]] std::shared_ptr<OutOfBandPromise> dataPromise(const std::string& identifier) {
+        return service_.makeOutOfBandPromise(identifier + "-UserData", SyncClientID, 0);
+    }
+    /// A placeholder whose configuration is complete.
+    [[nodiscard]] std::shared_ptr<InstallPlaceholder> placeholder(const std::string& identifier) {
+        auto placeholder =
+            service_.makeAppPlaceholder("Atlas", identifier, kInstallTypeSync, SyncClientID);
+        PlaceholderAttributes attributes;
+        attributes.bundleVersion = "2.5";
+        EXPECT_TRUE(placeholder->setAttributes(attributes));
+        EXPECT_TRUE(placeholder->setMetadata(StoreMetadata{}));
+        EXPECT_TRUE(placeholder->setConfigurationComplete());
+        return placeholder;
+    }
+    static InstallOptions options() { return {StoreMetadata{}, kInstallTypeSync, 1}; }
+
+    /// A coordinator with everything but the package, once its placeholder is shown.
+    std::shared_ptr<InstallCoordinator> prepared(Kind kind, const std::string& identifier) {
+        const auto coordinator = create(kind, identifier);
+        EXPECT_TRUE(coordinator->setInstallOptions(options()));
+        EXPECT_TRUE(coordinator->setInitialODRAssetPromises({}));
+        EXPECT_TRUE(coordinator->setAppAssetPromise(assetPromise(identifier)));
+        EXPECT_TRUE(coordinator->setPlaceholderPromise(placeholder(identifier)));
+        observer_->waitForOne();
+        return coordinator;
+    }
+    /// Keeps the promise of the package.
+    static void keepAsset(const InstallCoordinator& coordinator, const std::string& path) {
+        const auto promise = coordinator.appAssetPromise();
+        promise->setTransferPath(FileURL::fromPath(path, false).value());
+        promise->setPercentComplete(1.0);
+        promise->setComplete();
+    }
+    /// Waits until the service has done what was begun before this, as far as it reports it.
+    void waitForReportOfB() {
+        create(Kind::Initiating, kB)->cancelForReason(reason(), SyncClientID);
+        observer_->waitForOne();
+    }
+    /// Uninstalls and waits for the completion: "ok", or "error".
+    std::string uninstall(const std::string& identifier) {
+        const std::shared_ptr<Semaphore> done = services_.queues.makeSemaphore(0);
+        const auto outcome = std::make_shared<std::string>();
+        service_.uninstallApp(identifier, [done, outcome](const ErrorRecord* error) {
+            *outcome += error == nullptr ? "ok" : "error";
+            done->signal();
+        });
+        EXPECT_TRUE(done->wait());
+        waitForReportOfB();
+        return *outcome;
+    }
+
+    InstallCoordinatorService& service_ = services_.coordination;
+    const std::shared_ptr<HearingObserver> observer_ =
+        std::make_shared<HearingObserver>(services_.queues);
+};
+
+INSTANTIATE_TEST_SUITE_P(, CoordinationContract,
+                         testing::ValuesIn(coordinatingDeviceImplementations()), nameOfDevice);
+
+TEST_P(CoordinationContract, NothingIsThereUntilItIsCreated) {
+    const auto result = existing(Kind::Initiating, kA);
+    EXPECT_EQ(result.coordinator, nullptr);
+    EXPECT_FALSE(result.error);
+    EXPECT_EQ(service_.existingCoordinator(kA, SyncClientID), nullptr);
+}
+
+TEST_P(CoordinationContract, ACoordinatorIsCreatedOnceAndKeepsItsCreator) {
+    const auto coordinator = create(Kind::Initiating, kA, kOtherClient);
+    EXPECT_EQ(coordinator->bundleIdentifier(), kA);
+    EXPECT_EQ(coordinator->creatorIdentifier(), kOtherClient);
+    EXPECT_FALSE(coordinator->error());
+    const auto again =
+        service_.coordinator(Kind::Initiating, kA, SyncClientID, Creation::CreateIfNotExisting);
+    ASSERT_NE(again.coordinator, nullptr);
+    EXPECT_FALSE(again.wasCreated);
+    EXPECT_FALSE(again.error);
+    EXPECT_EQ(again.coordinator->creatorIdentifier(), kOtherClient);
+}
+
+TEST_P(CoordinationContract, ACoordinatorIsFoundWhateverItsKindAndClient) {
+    (void)create(Kind::Restoring, kA, kOtherClient);
+    const auto found = service_.existingCoordinator(kA, SyncClientID);
+    ASSERT_NE(found, nullptr);
+    EXPECT_EQ(found->bundleIdentifier(), kA);
+    EXPECT_EQ(service_.existingCoordinator(kB, SyncClientID), nullptr);
+}
+
+TEST_P(CoordinationContract, AnotherKindStandsInTheWay) {
+    (void)create(Kind::Restoring, kA);
+    for (const Creation creation : {Creation::OnlyExisting, Creation::CreateIfNotExisting}) {
+        const auto result = service_.coordinator(Kind::Initiating, kA, SyncClientID, creation);
+        EXPECT_EQ(result.coordinator, nullptr);
+        EXPECT_FALSE(result.wasCreated);
+        EXPECT_TRUE(result.error);
+    }
+    EXPECT_NE(existing(Kind::Restoring, kA).coordinator, nullptr);
+}
+
+TEST_P(CoordinationContract, OnlyWhatIsInstalledCanBeUpdated) {
+    const auto refused =
+        service_.coordinator(Kind::Updating, kA, SyncClientID, Creation::CreateIfNotExisting);
+    EXPECT_EQ(refused.coordinator, nullptr);
+    EXPECT_TRUE(refused.error);
+    EXPECT_EQ(service_.existingCoordinator(kA, SyncClientID), nullptr);
+    ASSERT_TRUE(installPackage({kA}));
+    EXPECT_NE(create(Kind::Updating, kA), nullptr);
+}
+
+TEST_P(CoordinationContract, IllegalIdentifiersAreRefused) {
+    using std::string_literals::operator""s;
+    for (const std::string& identifier :
+         {""s, "."s, ".."s, "a/b"s, "a b"s, "a\0b"s, "a\nb"s, "\u00e4"s, std::string(256, 'x')}) {
+        const auto result = service_.coordinator(Kind::Initiating, identifier, SyncClientID,
+                                                 Creation::CreateIfNotExisting);
+        EXPECT_EQ(result.coordinator, nullptr);
+        EXPECT_TRUE(result.error);
+        EXPECT_EQ(service_.existingCoordinator(identifier, SyncClientID), nullptr);
+        EXPECT_EQ(uninstall(identifier), "error");
+    }
+}
+
+TEST_P(CoordinationContract, PiecesAreThereOnceTheyAreSet) {
+    const auto coordinator = create(Kind::Initiating, kA);
+    EXPECT_FALSE(coordinator->hasInstallOptions());
+    EXPECT_FALSE(coordinator->hasInitialODRAssetPromises());
+    EXPECT_EQ(coordinator->appAssetPromise(), nullptr);
+    EXPECT_FALSE(coordinator->appAssetPromiseResponsibleClient());
+    EXPECT_FALSE(coordinator->hasUserDataPromise());
+    EXPECT_FALSE(coordinator->hasPlaceholderPromise());
+    ASSERT_TRUE(coordinator->setInstallOptions(options()));
+    ASSERT_TRUE(coordinator->setInitialODRAssetPromises({}));
+    ASSERT_TRUE(coordinator->setAppAssetPromise(assetPromise(kA)));
+    ASSERT_TRUE(coordinator->setAppAssetPromiseResponsibleClient(AppStoreClientID));
+    ASSERT_TRUE(coordinator->setUserDataPromise(dataPromise(kA)));
+    ASSERT_TRUE(coordinator->setPlaceholderPromise(
+        service_.makeAppPlaceholder("Atlas", kA, kInstallTypeSync, SyncClientID)));
+    const auto other = service_.existingCoordinator(kA, SyncClientID);
+    EXPECT_TRUE(other->hasInstallOptions());
+    EXPECT_TRUE(other->hasInitialODRAssetPromises());
+    ASSERT_NE(other->appAssetPromise(), nullptr);
+    EXPECT_EQ(other->appAssetPromise()->name(), "com.example.a-Asset");
+    EXPECT_EQ(other->appAssetPromiseResponsibleClient(), AppStoreClientID);
+    EXPECT_TRUE(other->hasUserDataPromise());
+    EXPECT_TRUE(other->hasPlaceholderPromise());
+}
+
+TEST_P(CoordinationContract, ASecondSetIsRefusedAndTheFirstStands) {
+    const auto coordinator = prepared(Kind::Initiating, kA);
+    ASSERT_TRUE(coordinator->setAppAssetPromiseResponsibleClient(AppStoreClientID));
+    ASSERT_TRUE(coordinator->setUserDataPromise(dataPromise(kA)));
+    EXPECT_FALSE(coordinator->setInstallOptions(options()));
+    EXPECT_FALSE(coordinator->setInitialODRAssetPromises({}));
+    EXPECT_FALSE(coordinator->setAppAssetPromise(assetPromise(kB)));
+    EXPECT_FALSE(coordinator->setAppAssetPromiseResponsibleClient(kOtherClient));
+    EXPECT_FALSE(coordinator->setUserDataPromise(dataPromise(kA)));
+    EXPECT_FALSE(coordinator->setPlaceholderPromise(placeholder(kA)));
+    EXPECT_EQ(coordinator->appAssetPromise()->name(), "com.example.a-Asset");
+    EXPECT_EQ(coordinator->appAssetPromiseResponsibleClient(), AppStoreClientID);
+}
+
+TEST_P(CoordinationContract, APromiseSaysWhatItWasMadeWith) {
+    const auto promise = assetPromise(kA);
+    EXPECT_EQ(promise->name(), "com.example.a-Asset");
+    EXPECT_EQ(promise->clientIdentifier(), SyncClientID);
+    EXPECT_FALSE(promise->transferPath());
+    EXPECT_EQ(promise->percentComplete(), 0.0);
+    EXPECT_FALSE(promise->isComplete());
+    EXPECT_EQ(assetPromise(kA, "/a.zip")->transferPath(), FileURL::fromPath("/a.zip", false));
+}
+
+TEST_P(CoordinationContract, TwoHandlesOnOnePromiseShowTheSame) {
+    const auto coordinator = create(Kind::Initiating, kA);
+    const auto mine = assetPromise(kA);
+    mine->setPercentComplete(0.25);
+    ASSERT_TRUE(coordinator->setAppAssetPromise(mine));
+    const auto other = service_.existingCoordinator(kA, SyncClientID)->appAssetPromise();
+    EXPECT_EQ(other->percentComplete(), 0.25);
+    other->setPercentComplete(0.5);
+    EXPECT_EQ(mine->percentComplete(), 0.5);
+    mine->setTransferPath(FileURL::fromPath("/a.zip", false).value());
+    EXPECT_EQ(other->transferPath(), FileURL::fromPath("/a.zip", false));
+    mine->setComplete();
+    EXPECT_TRUE(other->isComplete());
+}
+
+TEST_P(CoordinationContract, ACompletePlaceholderIsShown) {
+    (void)prepared(Kind::Initiating, kA);
+    EXPECT_THAT(observer_->heard(), ElementsAre("placeholder com.example.a"));
+    const std::optional<AppProxy> proxy = preferred(kA);
+    ASSERT_TRUE(proxy);
+    EXPECT_TRUE(proxy->state.placeholder);
+    EXPECT_EQ(proxy->installType, kInstallTypeSync);
+    EXPECT_EQ(proxy->displayName, "Atlas");
+    EXPECT_EQ(proxy->bundleVersion, "2.5");
+    EXPECT_NE(progress(kA), nullptr);
+    EXPECT_FALSE(application(kA));
+}
+
+TEST_P(CoordinationContract, APlaceholderThatIsNotCompleteIsKeptAndNotShown) {
+    const auto coordinator = create(Kind::Initiating, kA);
+    ASSERT_TRUE(coordinator->setPlaceholderPromise(
+        service_.makeAppPlaceholder("Atlas", kA, kInstallTypeSync, SyncClientID)));
+    waitForReportOfB();
+    EXPECT_TRUE(coordinator->hasPlaceholderPromise());
+    EXPECT_THAT(observer_->heard(), ElementsAre("cancelled com.example.b, 30, client 3"));
+    EXPECT_FALSE(preferred(kA));
+}
+
+TEST_P(CoordinationContract, NoPlaceholderIsRefused) {
+    const auto coordinator = create(Kind::Initiating, kA);
+    EXPECT_FALSE(coordinator->setPlaceholderPromise(nullptr));
+    EXPECT_FALSE(coordinator->hasPlaceholderPromise());
+}
+
+TEST_P(CoordinationContract, ACompletePlaceholderTakesNoMore) {
+    const auto placeholder =
+        service_.makeAppPlaceholder("Atlas", kA, kInstallTypeSync, SyncClientID);
+    EXPECT_TRUE(placeholder->setAttributes({}));
+    EXPECT_TRUE(placeholder->setAttributes({}));
+    EXPECT_TRUE(placeholder->setMetadata(std::nullopt));
+    EXPECT_TRUE(placeholder->setSinf(Bytes{1, 2}));
+    EXPECT_TRUE(placeholder->setConfigurationComplete());
+    EXPECT_FALSE(placeholder->setAttributes({}));
+    EXPECT_FALSE(placeholder->setMetadata(std::nullopt));
+    EXPECT_FALSE(placeholder->setSinf(Bytes{1, 2}));
+    EXPECT_FALSE(placeholder->setIconPromise(assetPromise(kA)));
+    EXPECT_FALSE(placeholder->setConfigurationComplete());
+}
+
+TEST_P(CoordinationContract, ThePackageIsInstalledWhenItsPromiseIsKept) {
+    const auto coordinator = prepared(Kind::Initiating, kA);
+    const std::string path = device_->addPackage({kA, "2.5", "Atlas"});
+    keepAsset(*coordinator, path);
+    observer_->waitForOne();
+    EXPECT_THAT(observer_->heard(),
+                ElementsAre("placeholder com.example.a", "complete com.example.a"));
+    ASSERT_TRUE(application(kA));
+    EXPECT_EQ(application(kA)->bundleVersion, "2.5");
+    EXPECT_THAT(bundles(AppRegistry::kEveryBundle), ElementsAre(kA));
+    EXPECT_FALSE(coordinator->error());
+    EXPECT_EQ(service_.existingCoordinator(kA, SyncClientID), nullptr);
+    EXPECT_FALSE(services_.files.itemExists(path));
+}
+
+TEST_P(CoordinationContract, AnUpdateReplacesTheVersion) {
+    ASSERT_TRUE(installPackage({kA, "1.0"}));
+    const auto coordinator = prepared(Kind::Updating, kA);
+    EXPECT_EQ(application(kA)->bundleVersion, "1.0");
+    keepAsset(*coordinator, device_->addPackage({kA, "2.0"}));
+    observer_->waitForOne();
+    EXPECT_EQ(application(kA)->bundleVersion, "2.0");
+    EXPECT_THAT(bundles(AppRegistry::kEveryBundle), ElementsAre(kA));
+}
+
+TEST_P(CoordinationContract, TheInstallWaitsForEveryPromise) {
+    const auto coordinator = prepared(Kind::Initiating, kA);
+    const auto data = dataPromise(kA);
+    ASSERT_TRUE(coordinator->setUserDataPromise(data));
+    keepAsset(*coordinator, device_->addPackage({kA}));
+    waitForReportOfB();
+    EXPECT_FALSE(application(kA));
+    data->setComplete();
+    observer_->waitForOne();
+    EXPECT_TRUE(application(kA));
+}
+
+TEST_P(CoordinationContract, APromiseThatIsGivenUpIsNotWaitedFor) {
+    const auto coordinator = prepared(Kind::Initiating, kA);
+    const auto data = dataPromise(kA);
+    ASSERT_TRUE(coordinator->setUserDataPromise(data));
+    keepAsset(*coordinator, device_->addPackage({kA}));
+    data->cancelForReason(reason(), SyncClientID);
+    observer_->waitForOne();
+    EXPECT_TRUE(application(kA));
+}
+
+TEST_P(CoordinationContract, AFailedInstallKeepsTheOldVersionAndTakesThePlaceholder) {
+    ASSERT_TRUE(installPackage({kA, "1.0"}));
+    const auto coordinator = prepared(Kind::Updating, kA);
+    keepAsset(*coordinator, "/var/mobile/missing.zip");
+    observer_->waitForOne();
+    EXPECT_THAT(observer_->heard(),
+                ElementsAre("placeholder com.example.a", "complete com.example.a, failed"));
+    EXPECT_TRUE(coordinator->error());
+    EXPECT_EQ(application(kA)->bundleVersion, "1.0");
+    EXPECT_THAT(bundles(AppRegistry::kEveryBundle), ElementsAre(kA));
+    EXPECT_EQ(service_.existingCoordinator(kA, SyncClientID), nullptr);
+}
+
+TEST_P(CoordinationContract, APackageOfAnotherApplicationIsNotInstalled) {
+    const auto coordinator = prepared(Kind::Initiating, kA);
+    keepAsset(*coordinator, device_->addPackage({kB}));
+    observer_->waitForOne();
+    EXPECT_TRUE(coordinator->error());
+    EXPECT_THAT(bundles(AppRegistry::kEveryBundle), IsEmpty());
+}
+
+TEST_P(CoordinationContract, ARestoredApplicationIsInstalledFromTheStoresPromise) {
+    const auto coordinator = create(Kind::Restoring, kA);
+    const auto data = dataPromise(kA);
+    data->setComplete();
+    ASSERT_TRUE(coordinator->setUserDataPromise(data));
+    ASSERT_TRUE(coordinator->setPlaceholderPromise(placeholder(kA)));
+    ASSERT_TRUE(coordinator->setAppAssetPromiseResponsibleClient(AppStoreClientID));
+    observer_->waitForOne();
+    const auto theirs = service_.existingCoordinator(kA, AppStoreClientID);
+    ASSERT_TRUE(theirs->setAppAssetPromise(assetPromise(kA)));
+    keepAsset(*theirs, device_->addPackage({kA}));
+    observer_->waitForOne();
+    EXPECT_THAT(observer_->heard(),
+                ElementsAre("placeholder com.example.a", "complete com.example.a"));
+    EXPECT_TRUE(application(kA));
+}
+
+TEST_P(CoordinationContract, ACancelTakesThePlaceholderAndKeepsTheVersion) {
+    ASSERT_TRUE(installPackage({kA, "1.0"}));
+    const auto coordinator = prepared(Kind::Updating, kA);
+    coordinator->cancelForReason(reason(), kOtherClient);
+    observer_->waitForOne();
+    EXPECT_THAT(observer_->heard(),
+                ElementsAre("placeholder com.example.a", "cancelled com.example.a, 30, client 7"));
+    EXPECT_THAT(bundles(AppRegistry::kEveryBundle), ElementsAre(kA));
+    EXPECT_EQ(application(kA)->bundleVersion, "1.0");
+    EXPECT_EQ(coordinator->error(), reason());
+    EXPECT_EQ(service_.existingCoordinator(kA, SyncClientID), nullptr);
+}
+
+TEST_P(CoordinationContract, ACancelledCoordinatorAnswersAsBeforeAndTakesNoMore) {
+    const auto coordinator = create(Kind::Initiating, kA);
+    ASSERT_TRUE(coordinator->setInstallOptions(options()));
+    coordinator->cancelForReason(reason(), SyncClientID);
+    EXPECT_TRUE(coordinator->hasInstallOptions());
+    EXPECT_FALSE(coordinator->setInitialODRAssetPromises({}));
+    EXPECT_FALSE(coordinator->setAppAssetPromise(assetPromise(kA)));
+    EXPECT_FALSE(coordinator->setAppAssetPromiseResponsibleClient(AppStoreClientID));
+    EXPECT_FALSE(coordinator->setUserDataPromise(dataPromise(kA)));
+    EXPECT_FALSE(coordinator->setPlaceholderPromise(placeholder(kA)));
+    EXPECT_FALSE(coordinator->hasInitialODRAssetPromises());
+    EXPECT_FALSE(coordinator->hasPlaceholderPromise());
+}
+
+TEST_P(CoordinationContract, ASecondCancelDoesNothing) {
+    const auto coordinator = create(Kind::Initiating, kA);
+    const auto other = service_.existingCoordinator(kA, SyncClientID);
+    coordinator->cancelForReason(reason(1), SyncClientID);
+    observer_->waitForOne();
+    other->cancelForReason(reason(2), kOtherClient);
+    coordinator->cancelForReason(reason(2), kOtherClient);
+    waitForReportOfB();
+    EXPECT_EQ(other->error(), reason(1));
+    EXPECT_THAT(observer_->heard(), ElementsAre("cancelled com.example.a, 1, client 3",
+                                                "cancelled com.example.b, 30, client 3"));
+}
+
+TEST_P(CoordinationContract, ACancelledIdentifierCanBeginAnew) {
+    const auto old = prepared(Kind::Initiating, kA);
+    old->cancelForReason(reason(), SyncClientID);
+    observer_->waitForOne();
+    const auto coordinator = prepared(Kind::Initiating, kA);
+    old->cancelForReason(reason(), SyncClientID);
+    keepAsset(*coordinator, device_->addPackage({kA}));
+    observer_->waitForOne();
+    EXPECT_EQ(observer_->heard().back(), "complete com.example.a");
+    EXPECT_TRUE(application(kA));
+}
+
+TEST_P(CoordinationContract, PromisesOfWhatHasEndedDoNotChange) {
+    const auto coordinator = prepared(Kind::Initiating, kA);
+    const auto promise = coordinator->appAssetPromise();
+    promise->setPercentComplete(0.5);
+    coordinator->cancelForReason(reason(), SyncClientID);
+    promise->setPercentComplete(1.0);
+    promise->setTransferPath(FileURL::fromPath(device_->addPackage({kA}), false).value());
+    promise->setComplete();
+    observer_->waitForOne();
+    waitForReportOfB();
+    EXPECT_EQ(promise->percentComplete(), 0.5);
+    EXPECT_FALSE(promise->transferPath());
+    EXPECT_FALSE(promise->isComplete());
+    EXPECT_FALSE(application(kA));
+}
+
+TEST_P(CoordinationContract, ObserversAreHeldWeakly) {
+    const auto coordinator = create(Kind::Initiating, kA);
+    auto observer = std::make_shared<HearingObserver>(services_.queues);
+    const std::weak_ptr<HearingObserver> weak = observer;
+    coordinator->setObserver(observer);
+    observer.reset();
+    EXPECT_TRUE(weak.expired());
+    coordinator->cancelForReason(reason(), SyncClientID);
+    waitForReportOfB();
+    EXPECT_THAT(observer_->heard(), ElementsAre("cancelled com.example.b, 30, client 3"));
+}
+
+TEST_P(CoordinationContract, ALaterObserverTakesThePlaceOfTheEarlier) {
+    (void)create(Kind::Initiating, kA);
+    const auto later = std::make_shared<HearingObserver>(services_.queues);
+    const auto other = service_.existingCoordinator(kA, SyncClientID);
+    other->setObserver(later);
+    other->cancelForReason(reason(), SyncClientID);
+    later->waitForOne();
+    EXPECT_THAT(later->heard(), ElementsAre("cancelled com.example.a, 30, client 3"));
+    EXPECT_THAT(observer_->heard(), IsEmpty());
+}
+
+TEST_P(CoordinationContract, ADelegateHearsOfItsClientsCoordinatorsThatNobodyObserves) {
+    const auto delegate = std::make_shared<HearingObserver>(services_.queues);
+    const auto registration =
+        service_.makeAppInstallObserver("com.example.observer", {SyncClientID}, delegate);
+    const auto cancel = [&](const std::string& identifier, CoordinationClient client) {
+        service_.coordinator(Kind::Initiating, identifier, client, Creation::CreateIfNotExisting)
+            .coordinator->cancelForReason(reason(), kOtherClient);
+    };
+    cancel("com.example.c", kOtherClient);
+    create(Kind::Initiating, kB)->cancelForReason(reason(), SyncClientID);
+    observer_->waitForOne();
+    cancel(kA, SyncClientID);
+    delegate->waitForOne();
+    EXPECT_THAT(delegate->heard(), ElementsAre("cancelled com.example.a, 30, client 7"));
+}
+
+TEST_P(CoordinationContract, ADelegateHearsNothingOnceItsRegistrationHasEnded) {
+    const auto delegate = std::make_shared<HearingObserver>(services_.queues);
+    auto registration =
+        service_.makeAppInstallObserver("com.example.observer", {SyncClientID}, delegate);
+    registration.reset();
+    const auto coordinator = create(Kind::Initiating, kA);
+    coordinator->setObserver({});
+    coordinator->cancelForReason(reason(), SyncClientID);
+    waitForReportOfB();
+    EXPECT_THAT(delegate->heard(), IsEmpty());
+}
+
+TEST_P(CoordinationContract, AnUninstallIsReportedOnce) {
+    ASSERT_TRUE(installPackage({kA}));
+    EXPECT_EQ(uninstall(kA), "ok");
+    EXPECT_THAT(bundles(AppRegistry::kEveryBundle), IsEmpty());
+    EXPECT_EQ(uninstall(kA), "error");
+}
+
+TEST_P(CoordinationContract, AnUninstallTakesThePlaceholderFirst) {
+    ASSERT_TRUE(installPackage({kA}));
+    ASSERT_TRUE(installPlaceholder({kA}, kInstallTypeSync));
+    EXPECT_EQ(uninstall(kA), "ok");
+    EXPECT_THAT(bundles(AppRegistry::kEveryBundle), ElementsAre(kA));
+}
+
+TEST_P(CoordinationContract, APersonsErrorHoldsTheUnderlyingOne) {
+    const ErrorRecord underlying = ErrorRecord::make("Transport", 77, "the cable is out");
+    const ErrorRecord error = service_.userPresentableError(1, underlying);
+    EXPECT_EQ(error.code, 1);
+    EXPECT_THAT(describe(error.userInfo), HasSubstr("the cable is out"));
+    EXPECT_EQ(service_.userPresentableError(1, std::nullopt).code, 1);
+}
+
+}  // namespace
+}  // namespace appsync
