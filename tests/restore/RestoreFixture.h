@@ -17,6 +17,7 @@ class RestoreFixture : public AppsClientFixture {
     explicit RestoreFixture(Scheduling scheduling = Scheduling::runToCompletion())
         : AppsClientFixture(scheduling) {
         platform_.files.addDirectory("/var/mobile/Library/Logs/MediaServices");
+        client_.reset();
         platform_.host.setMainBundleIdentifier("com.example.other");
         makeClient();
     }

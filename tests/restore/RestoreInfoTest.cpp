@@ -1,4 +1,5 @@
 #include <cerrno>
+#include <ostream>
 
 #include "tests/restore/RestoreFixture.h"
 
@@ -247,7 +248,10 @@ TEST_F(RestoreInfo, OfTenThousandApplicationsIsAllRestored) {
 
 struct Hostile {
     std::string identifier;
-    std::string message;  // contains
+    std::string message;  // begins so
+    friend void PrintTo(const Hostile& hostile, std::ostream* out) {
+        *out << testing::PrintToString(hostile.identifier);
+    }
 };
 
 class HostileIdentifier : public RestoreInfo, public testing::WithParamInterface<Hostile> {};

@@ -13,6 +13,8 @@ using testing::IsEmpty;
 // How long a restore waits for placeholders.
 class RestoreWait : public RestoreFixture {
   protected:
+    using RestoreFixture::RestoreFixture;
+
     void promiseThree() {
         for (const char* identifier : {kA, kB, kC}) {
             client_->relocantSetPlaceHolderPromiseForRestoreAppBundle(identifier);
@@ -74,7 +76,7 @@ TEST_F(RestoreWait, GoesOnForTheOnesThatDoNotCome) {
 TEST_F(RestoreWait, IsNoneWithoutPlaceholders) {
     EXPECT_EQ(restoreNothing(), 0s);
     EXPECT_THAT(platform_.callsTo({"WaitGroup.waitFor"}),
-                ElementsAre("WaitGroup#2.waitFor(0) -> yes"));
+                ElementsAre("WaitGroup#4.waitFor(0 ms) -> yes"));
 }
 
 TEST_F(RestoreWait, IsNoneWhereTheServiceIsQuick) {
@@ -85,6 +87,7 @@ TEST_F(RestoreWait, IsNoneWhereTheServiceIsQuick) {
 }
 
 TEST_F(RestoreWait, LastsItsWholeTimeInsideTheDaemon) {
+    client_.reset();
     platform_.host.setMainBundleIdentifier("com.korvu.trd");
     coordinate();
     EXPECT_EQ(restoreThree(), 15s);
@@ -93,6 +96,28 @@ TEST_F(RestoreWait, LastsItsWholeTimeInsideTheDaemon) {
     EXPECT_THAT(platform_.messages(),
                 Contains("coordinatorDidInstallPlaceholder for com.example.a with error (null)"));
 }
+
+/// Restores in which the service's threads and the host's come in any order.
+class InterleavedRestore : public RestoreWait, public testing::WithParamInterface<unsigned> {
+  protected:
+    InterleavedRestore() : RestoreWait(Scheduling::seeded(GetParam())) { coordinate(); }
+};
+
+TEST_P(InterleavedRestore, ShowsEveryPlaceholderAndEndsInTime) {
+    setDemotedApps(PropertyList::map({{"AutomaticDowngrades", PropertyList::array({kB})}}));
+    // A placeholder that comes before it is awaited is waited for in vain.
+    EXPECT_LE(restoreThree(), 15s + 1s);
+    platform_.runUntilIdle();
+    EXPECT_THAT(platform_.registry.placeholderIdentifiers(), ElementsAre(kA, kB, kC));
+    expectInfoMovedOnce();
+    for (const std::string& identifier : awaited()) {
+        EXPECT_TRUE(
+            logged(LogLevel::Error,
+                   "Ignoring notification from TS about installing placeholder for " + identifier));
+    }
+}
+
+INSTANTIATE_TEST_SUITE_P(Seeds, InterleavedRestore, testing::Range(0U, 50U));
 
 }  // namespace
 }  // namespace appsync

@@ -71,8 +71,8 @@ AppRegistry.installPlaceholderBundle(APPS/B.app, {PackageType = Placeholder; Bun
 8 default Installed Placeholder app from path APPS/B.app: Shown [B 1.0] [isPressel: 0]
 InstallTransactionLog.logScenario(Vessik App Restore, 0, yes, B, Installed placeholder)
 8 default Will wait for 0 seconds for 0 placeholders to install
-WaitGroup#2.waitFor(0)
-SerialQueue#2.sync()
+WaitGroup#4.waitFor(0 ms)
+SerialQueue#4.sync()
 8 default Finished waiting for placeholder installs
 FileSystem.removeItem(MOVED)
 FileSystem.moveItem(INFO, MOVED)
@@ -91,6 +91,14 @@ TEST_F(RestoredAppPlaceholder, IsOfARestoreWhetherDemotedOrNot) {
     restore();
     EXPECT_EQ(platform_.registry.placeholder(kA)->installType, kInstallTypeRestore);
     EXPECT_EQ(platform_.registry.placeholder(kB)->installType, kInstallTypeRestore);
+}
+
+TEST_F(RestoredAppPlaceholder, GetsMetadataAndSinfDataAsTheyCame) {
+    const Bytes metadata = bytesOf(storeMetadata());
+    EXPECT_TRUE(processData(metadata));
+    EXPECT_THAT(platform_.callsTo({"AppRegistry.installPlaceholderBundle"}),
+                ElementsAre(HasSubstr("StoreMetadata = <" + std::to_string(metadata.size()) +
+                                      " bytes>; ApplicationSINF = <3 bytes>;")));
 }
 
 TEST_F(RestoredAppPlaceholder, IsFoundByTheTransfersThatFollow) {
