@@ -18,12 +18,18 @@ namespace {
 constexpr std::string_view kService = "InstallCoordinatorService";
 constexpr std::string_view kObserver = "InstallCoordinatorObserver";
 constexpr std::string_view kDomain = "InstallCoordination";
-constexpr std::int64_t kRefused = 1;
-constexpr std::int64_t kOtherKind = 2;
-constexpr std::int64_t kNotInstalled = 3;
-constexpr std::int64_t kNoPackage = 4;
+// 1 to 9 are codes of errors that a person may see.
+constexpr std::int64_t kOtherKind = 10;
+constexpr std::int64_t kNotInstalled = 12;
+constexpr std::int64_t kAlreadySet = 15;
+constexpr std::int64_t kRefused = 16;
+constexpr std::int64_t kOver = 17;
 
-ErrorRecord refused(const std::string& why) { return ErrorRecord::make(kDomain, kRefused, why); }
+ErrorRecord failureOf(std::int64_t code, const std::string& why) {
+    return ErrorRecord::make(kDomain, code, why);
+}
+
+ErrorRecord refused(const std::string& why) { return failureOf(kRefused, why); }
 
 std::string_view kindName(CoordinatorKind kind) {
     constexpr std::array<std::string_view, 4> kNames{"initiating", "updating", "restoring",
@@ -46,27 +52,27 @@ std::string clientsText(const std::set<CoordinationClient>& clients) {
     return text + "}";
 }
 
-/// Whether it has the pieces that its kind needs, and waits for none.
-bool isReady(const SimulatedCoordinatorState& state) {
-    if (state.placeholder == nullptr) return false;
-    if (state.placeholder->configurationComplete && !state.placeholder->cancelled &&
-        !state.placeholderShown) {
-        return false;
-    }
-    if (state.userData != nullptr && state.userData->isAwaited()) return false;
-    if (state.initialODRAssets &&
-        std::any_of(state.initialODRAssets->begin(), state.initialODRAssets->end(),
-                    [](const auto& promise) { return promise->isAwaited(); })) {
-        return false;
-    }
-    if (state.kind == CoordinatorKind::RestoringDemoted) return state.placeholderShown;
-    if (state.appAsset == nullptr || !state.appAsset->complete) return false;
-    return state.kind == CoordinatorKind::Restoring || state.installOptions.has_value();
-}
-
+/// Whether its placeholder is to be shown and is not yet.
 bool wantsPlaceholder(const SimulatedCoordinatorState& state) {
     return state.placeholder != nullptr && state.placeholder->configurationComplete &&
            !state.placeholder->cancelled && !state.placeholderShown;
+}
+
+bool awaitsInitialAssets(const SimulatedCoordinatorState& state) {
+    return state.initialODRAssets &&
+           std::any_of(state.initialODRAssets->begin(), state.initialODRAssets->end(),
+                       [](const auto& promise) { return promise->isAwaited(); });
+}
+
+/// Whether it has the pieces that its kind needs, and waits for none.
+bool isReady(const SimulatedCoordinatorState& state) {
+    if (state.placeholder == nullptr || wantsPlaceholder(state)) return false;
+    if (state.userData != nullptr && state.userData->isAwaited()) return false;
+    if (awaitsInitialAssets(state)) return false;
+    if (state.kind == CoordinatorKind::RestoringDemoted) return state.placeholderShown;
+    if (state.appAsset == nullptr || !state.appAsset->complete) return false;
+    if (state.kind == CoordinatorKind::Restoring) return true;
+    return state.installOptions.has_value() && state.initialODRAssets.has_value();
 }
 
 AppProxy proxyOf(const SimulatedPlaceholderState& placeholder) {
@@ -167,8 +173,7 @@ SimulatedCoordination::Coordinator SimulatedCoordination::lookUp(CoordinatorKind
     }
     if (creation == Creation::OnlyExisting) return {};
     if (kind == CoordinatorKind::Updating && !registry_.installed(identifier)) {
-        return failure(
-            ErrorRecord::make(kDomain, kNotInstalled, "'" + identifier + "' is not installed"));
+        return failure(failureOf(kNotInstalled, "'" + identifier + "' is not installed"));
     }
     return {handle(create(kind, identifier, client)), true, std::nullopt};
 }
@@ -304,8 +309,8 @@ Status SimulatedCoordination::checkSet(CoordinationStep piece,
     if (Status failure = takeFailure(piece, state.identifier.value_or("")); !failure) {
         return failure;
     }
-    if (state.ended) return refused("the coordinator has ended");
-    if (there) return refused("the coordinator has this piece already");
+    if (state.ended) return failureOf(kOver, "the coordinator has ended");
+    if (there) return failureOf(kAlreadySet, "the coordinator has this piece already");
     return {};
 }
 
@@ -314,6 +319,15 @@ Status SimulatedCoordination::checkChange(CoordinationStep piece,
     if (Status failure = takeFailure(piece, state.identifier); !failure) return failure;
     if (state.cancelled) return refused("the placeholder was cancelled");
     if (state.configurationComplete) return refused("the placeholder's configuration is complete");
+    return {};
+}
+
+Status SimulatedCoordination::checkPlaceholder(const SimulatedCoordinatorState& state,
+                                               const SimulatedPlaceholderState* placeholder) {
+    if (placeholder == nullptr) return nothingGiven();
+    if (placeholder->identifier != state.identifier) {
+        return refused("the placeholder is that of '" + placeholder->identifier + "'");
+    }
     return {};
 }
 
@@ -386,7 +400,7 @@ void SimulatedCoordination::install(const State& state) {
 
 Status SimulatedCoordination::installPackage(const SimulatedCoordinatorState& state) {
     if (!state.appAsset->path) {
-        return ErrorRecord::make(kDomain, kNoPackage, "the package has no path");
+        return refused("the package has no path");
     }
     return registry_.install(*state.identifier, state.appAsset->path->path());
 }

@@ -50,10 +50,12 @@ enum class CoordinationObject {
 /// installs through the simulated registry, whose failures (`failNextInstall`,
 /// `failNextPlaceholderInstall`, `failNextUninstall`) and contents are the service's too.
 ///
-/// An install or update needs its install options, its placeholder and its app asset; the restore
-/// of an application its placeholder and its app asset; that of a demoted one its placeholder
-/// alone, which stays when the coordinator is done. Every other promise that was set must be
-/// complete or given up. A placeholder that cannot be shown ends its coordinator.
+/// An install or update needs its install options, the list of its initial assets, its placeholder
+/// and its app asset; the restore of an application its placeholder and its app asset; that of a
+/// demoted one its placeholder alone, which stays when the coordinator is done. Every other promise
+/// that was set must be complete or given up. A placeholder whose configuration is not complete is
+/// waited for by a demoted application only. One that cannot be shown ends its coordinator. A
+/// coordinator is gone, with the file of its package, before its completion is reported.
 ///
 /// What the service does by itself, observers' callbacks included, is done by tasks named
 /// "coordination", at most `kThreads` at once; of one coordinator the placeholder is reported
@@ -164,6 +166,9 @@ class SimulatedCoordination : public InstallCoordinatorService {
     /// The same for a piece of a placeholder.
     [[nodiscard]] Status checkChange(CoordinationStep piece,
                                      const SimulatedPlaceholderState& state);
+    /// Refuses null, and the placeholder of another application.
+    [[nodiscard]] static Status checkPlaceholder(const SimulatedCoordinatorState& state,
+                                                 const SimulatedPlaceholderState* placeholder);
     /// The error of a set that was given null.
     [[nodiscard]] static ErrorRecord nothingGiven();
     void cancelNow(const State& state, const ErrorRecord& reason, CoordinationClient client);

@@ -175,7 +175,7 @@ Status SimulatedCoordinator::setPlaceholderPromise(
     RecordedCall call(service_.recorder_, kService, "setPlaceholderPromise", name(), nameOf(given));
     Status status = service_.checkSet(CoordinationStep::PlaceholderPromise, *state_,
                                       state_->placeholder != nullptr);
-    if (status && given == nullptr) status = SimulatedCoordination::nothingGiven();
+    if (status) status = SimulatedCoordination::checkPlaceholder(*state_, given.get());
     if (!status) return call.result(status);
     given->coordinator = state_;
     state_->placeholder = given;

@@ -36,8 +36,8 @@ double SimulatedPromise<Interface>::percentComplete() const {
 
 template <typename Interface>
 void SimulatedPromise<Interface>::setPercentComplete(double percent) {
-    const RecordedCall call(service_.recorder_, kService<Interface>, "setPercentComplete",
-                            state_->name, percent);
+    [[maybe_unused]] const RecordedCall call(service_.recorder_, kService<Interface>,
+                                             "setPercentComplete", state_->name, percent);
     if (!state_->over) state_->percent = percent;
 }
 
@@ -49,7 +49,8 @@ bool SimulatedPromise<Interface>::isComplete() const {
 
 template <typename Interface>
 void SimulatedPromise<Interface>::setComplete() {
-    const RecordedCall call(service_.recorder_, kService<Interface>, "setComplete", state_->name);
+    [[maybe_unused]] const RecordedCall call(service_.recorder_, kService<Interface>, "setComplete",
+                                             state_->name);
     if (state_->over || !state_->isAwaited()) return;
     state_->complete = true;
     if (const auto coordinator = state_->coordinator.lock()) service_.advance(coordinator);
@@ -58,8 +59,8 @@ void SimulatedPromise<Interface>::setComplete() {
 template <typename Interface>
 void SimulatedPromise<Interface>::cancelForReason(const ErrorRecord& reason,
                                                   CoordinationClient client) {
-    const RecordedCall call(service_.recorder_, kService<Interface>, "cancelForReason",
-                            state_->name, reason, client);
+    [[maybe_unused]] const RecordedCall call(service_.recorder_, kService<Interface>,
+                                             "cancelForReason", state_->name, reason, client);
     service_.cancelPromise(*state_, reason, client);
 }
 

@@ -44,6 +44,12 @@ class AppsClientFixture : public testing::Test {
         platform_.clearRecording();
     }
 
+    /// Makes a new client, on a device whose installs are coordinated.
+    void makeCoordinatedClient() {
+        platform_.coordination.setEnabled(true);
+        makeClient();
+    }
+
     /// What the host leaves for the next session.
     void stage(const PropertyList& todoList) {
         platform_.addPropertyList(std::string(kStagingArea) + "/ApplicationsSync.plist", todoList);

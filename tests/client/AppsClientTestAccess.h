@@ -23,11 +23,20 @@ struct AppsClientTestAccess {
     static std::set<std::string> outstandingHFTTransfers(const AppsClient& client) {
         return client._outstandingHFTTransfers.contents();
     }
-    static bool finishedWaitingForPlaceHolderInstalls(const AppsClient& client) {
+    static bool& finishedWaitingForPlaceHolderInstalls(AppsClient& client) {
         return client._finishedWaitingForPlaceHolderInstalls;
     }
     static void setUseInstallCoordinator(AppsClient& client, bool use) {
         client._useInstallCoordinator = use;
+    }
+    static std::int64_t restoringPlaceholderCount(const AppsClient& client) {
+        return client._restoringPlaceholderCount;
+    }
+    static WaitGroup& restorePlaceHoldersWaitGroup(AppsClient& client) {
+        return *client._restorePlaceHoldersWaitGroup;
+    }
+    static bool hasAppInstallObserver(const AppsClient& client) {
+        return client._appInstallObserver != nullptr;
     }
     static bool hasUninstalledApps(const AppsClient& client) {
         return client._uninstalledApps.has_value();

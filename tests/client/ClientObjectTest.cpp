@@ -55,7 +55,17 @@ TEST_F(ClientObject, InsideTheDaemonListensForItsStart) {
     EXPECT_THAT(platform_.lines(),
                 ElementsAre("NotificationCenterObserver.callback(" + std::string(kStartup) + ")",
                             "InstallCoordinatorService.makeAppInstallObserver(com.korvu.trd.rlink."
-                            "tsappobserverdelegate, 3) -> an observer"));
+                            "tsappobserverdelegate, {3}) -> an observer"));
+}
+
+TEST_F(ClientObject, ObservesItsCoordinatorsOnceHoweverOftenTheDaemonStarts) {
+    platform_.notificationCenter.post(kStartup);
+    platform_.notificationCenter.post(kStartup);
+    platform_.runUntilIdle();
+    EXPECT_TRUE(Access::hasAppInstallObserver(*client_));
+    EXPECT_THAT(platform_.callsTo({"InstallCoordinatorService"}), testing::SizeIs(1));
+    client_.reset();
+    EXPECT_THAT(platform_.coordination.appInstallObservers(), testing::IsEmpty());
 }
 
 TEST_F(ClientObject, StopsListeningWhenItIsDestroyed) {

@@ -79,6 +79,22 @@ TEST_F(SyncReconciliation, MovesTheStagingAreaAsItIs) {
     EXPECT_EQ(platform_.files.text(kTodo + "/com.example.a/Info.plist"), "info");
 }
 
+TEST_F(SyncReconciliation, RemovesThroughTheServiceWhereInstallsAreCoordinated) {
+    makeCoordinatedClient();
+    platform_.registry.addApplication(kA);
+    platform_.registry.addApplication(kB);
+    platform_.registry.failNextUninstall(kB, ErrorRecord::make(kRegistryErrorDomain, 1, "busy"));
+    stage(PropertyList::array({todoEntry(kB, "remove"), todoEntry(kA, "remove")}));
+    EXPECT_TRUE(reconcile());
+    EXPECT_THAT(platform_.callsTo({"InstallCoordinatorService", "AppRegistry"}),
+                ElementsAre("InstallCoordinatorService.uninstallApp(com.example.b)",
+                            "InstallCoordinatorService.uninstallApp(com.example.a)"));
+    platform_.runUntilIdle();
+    EXPECT_THAT(platform_.registry.installedIdentifiers(), ElementsAre(kB));
+    EXPECT_THAT(platform_.transactions.scenarios(), IsEmpty());
+    EXPECT_THAT(platform_.transactions.records(), testing::SizeIs(4));
+}
+
 TEST_F(SyncReconciliation, RemovesWhatTheHostAsksToRemoveInItsOrder) {
     platform_.registry.addApplication(kA);
     platform_.registry.addApplication(kB);

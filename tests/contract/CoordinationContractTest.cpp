@@ -312,6 +312,13 @@ TEST_P(CoordinationContract, NoPlaceholderIsRefused) {
     EXPECT_FALSE(coordinator->hasPlaceholderPromise());
 }
 
+TEST_P(CoordinationContract, APlaceholderOfAnotherApplicationIsRefused) {
+    const auto coordinator = create(Kind::Initiating, kA);
+    EXPECT_FALSE(coordinator->setPlaceholderPromise(placeholder(kB)));
+    EXPECT_FALSE(coordinator->hasPlaceholderPromise());
+    EXPECT_FALSE(preferred(kB));
+}
+
 TEST_P(CoordinationContract, ACompletePlaceholderTakesNoMore) {
     const auto placeholder =
         service_.makeAppPlaceholder("Atlas", kA, kInstallTypeSync, SyncClientID);

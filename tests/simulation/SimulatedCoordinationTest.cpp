@@ -103,6 +103,7 @@ class SimulatedCoordinationTest : public SimulationFixture {
         auto coordinator = create(Kind::Initiating, identifier);
         coordinator->setObserver(observer_);
         EXPECT_TRUE(coordinator->setInstallOptions({}));
+        EXPECT_TRUE(coordinator->setInitialODRAssetPromises({}));
         EXPECT_TRUE(coordinator->setAppAssetPromise(promise(identifier + "-Asset")));
         EXPECT_TRUE(coordinator->setPlaceholderPromise(completePlaceholder(identifier)));
         return coordinator;
@@ -339,6 +340,21 @@ TEST_F(SimulatedCoordinationTest, AnInstallFailsAsTheRegistrySays) {
                                      "12"));
     EXPECT_FALSE(platform_.registry.placeholder(kA));
     EXPECT_FALSE(platform_.files.exists(kPackage));
+}
+
+TEST_F(SimulatedCoordinationTest, AnInstallWaitsForWhatItsKindNeeds) {
+    const auto coordinator = create(Kind::Initiating, kA);
+    coordinator->setObserver(observer_);
+    EXPECT_TRUE(coordinator->setAppAssetPromise(promise("asset")));
+    keepAsset(*coordinator);
+    EXPECT_TRUE(coordinator->setPlaceholderPromise(placeholder(kA)));
+    EXPECT_TRUE(coordinator->setInstallOptions({}));
+    EXPECT_THAT(heard(), IsEmpty());
+    const auto initial = promise("initial");
+    EXPECT_TRUE(coordinator->setInitialODRAssetPromises({initial}));
+    EXPECT_THAT(heard(), IsEmpty());
+    initial->setComplete();
+    EXPECT_THAT(heard(), ElementsAre("complete com.example.a"));
 }
 
 TEST_F(SimulatedCoordinationTest, APackageWithoutAPathCannotBeInstalled) {

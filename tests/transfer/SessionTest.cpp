@@ -1,6 +1,5 @@
-#include <regex>
-
 #include "tests/client/AppsClientFixture.h"
+#include "tests/transfer/GoldenRecording.h"
 
 namespace appsync {
 namespace {
@@ -8,9 +7,7 @@ namespace {
 using testing::ElementsAre;
 using testing::IsEmpty;
 
-// The recording of a session, with "AREA" for the work area, "TODO" for the todo directory, "MEDIA"
-// for the public staging directory, "A" and "B" for two applications, and "ENTRIES" for the todo
-// list. Results of calls, sizes and the encoding of property lists are left out.
+// The recording of a session, see abbreviatedRecording.
 constexpr std::string_view kWholeSession = R"(
 8 default starting to reconcile sync with new anchor anchor 1
 Lock#1.lock()
@@ -151,21 +148,6 @@ InstallerService.clearUninstalled()
 FileSystem.removeItem(AREA/LastSyncAppState.plist)
 )";
 
-std::string abbreviated(std::string line) {
-    const std::vector<std::pair<const char*, const char*>> names{
-        {R"(/var/mobile/Library/ApplicationSync/VessikStuff)", "TODO"},
-        {R"(/var/mobile/Library/ApplicationSync)", "AREA"},
-        {R"(/var/mobile/Media/PublicStaging)", "MEDIA"},
-        {R"(com\.example\.a)", "A"},
-        {R"(com\.example\.b)", "B"},
-        {R"(\(\{identifier.*?\}\))", "ENTRIES"},
-        {R"(,? ?<\d+ bytes>)", ""}};
-    for (const auto& [name, abbreviation] : names) {
-        line = std::regex_replace(line, std::regex(name), abbreviation);
-    }
-    return line;
-}
-
 class Session : public AppsClientFixture {
   protected:
     /// A session that installs one application and removes another.
@@ -195,21 +177,12 @@ class Session : public AppsClientFixture {
         client_->syncEndedWithSuccess(true);
         return assets.size();
     }
-    [[nodiscard]] std::string abbreviatedRecording() const {
-        std::string text = "\n";
-        for (RecordEntry entry : platform_.recording()) {
-            if (entry.service == "PropertyListSerialization") continue;
-            entry.result.clear();
-            text += abbreviated(entry.line()) + "\n";
-        }
-        return text;
-    }
 };
 
 TEST_F(Session, MakesEveryCallAndWritesEveryMessageInOrder) {
     stageOneOfEach();
     EXPECT_EQ(run(), 1U);
-    EXPECT_EQ(abbreviatedRecording(), kWholeSession);
+    EXPECT_EQ(abbreviatedRecording(platform_), kWholeSession);
 }
 
 TEST_F(Session, LeavesTheDeviceInStepWithTheList) {
