@@ -7,6 +7,7 @@
 
 #include <benchmark/benchmark.h>
 #include <fcntl.h>
+#include <malloc.h>
 #include <unistd.h>
 
 #include <cstdlib>
@@ -95,6 +96,9 @@ void restore(benchmark::State& state, bool coordinated) {
     const int count = static_cast<int>(state.range(0));
     for (auto _ : state) {
         state.PauseTiming();
+        // As in a daemon that has just started: else few applications would find all the memory
+        // that they need in the allocator's hands, and many would not.
+        ::malloc_trim(0);
         SystemPropertyLists codec;
         auto platform = std::make_unique<SimulatedPlatform>(codec);
         platform->recorder.setEnabled(false);
