@@ -71,6 +71,7 @@ SessionEnd Session::sync(const Order& order) {
     end_.isDisabled =
         !owns(client_, kDataclass) || (disabled && disabled->contains(std::string(kDataclass)));
     if (end_.isDisabled) return end_;
+    watch_.takeUpDelivered();
     const std::vector<std::string> known =
         order.takesInventory ? std::vector<std::string>() : readLastSyncState(device_);
     if (!reconcile()) return end(false, {});

@@ -174,19 +174,27 @@ void SessionWatch::reportWaiting(const std::string& identifier,
 
 void SessionWatch::installBegins(const std::string& identifier) {
     const std::uint64_t size = sizeOf(identifier);
-    events_.report({SyncEventKind::Started, SyncPhase::Install, identifier, 0, size,
-                    SyncState::Active, std::nullopt, ""});
+    reportBegin(identifier, size);
     const std::lock_guard guard(mutex_);
     installing_[identifier] = size;
+    concluded_.erase(identifier);
+}
+
+void SessionWatch::reportBegin(const std::string& identifier, std::uint64_t size) {
+    events_.report({SyncEventKind::Started, SyncPhase::Install, identifier, 0, size,
+                    SyncState::Active, std::nullopt, ""});
 }
 
 void SessionWatch::installEnded(const std::string& identifier, const Status& status) {
     const std::uint64_t size = sizeOf(identifier);
+    bool hasBegun = false;
     {
         const std::lock_guard guard(mutex_);
-        installing_.erase(identifier);
+        hasBegun = installing_.erase(identifier) > 0;
         delivered_.erase(identifier);
+        concluded_.insert(identifier);
     }
+    if (!hasBegun) reportBegin(identifier, size);
     if (status) {
         facts_.installed(identifier);
     } else {
@@ -215,6 +223,17 @@ void SessionWatch::packageDelivered(const std::string& identifier) {
         delivered_.try_emplace(identifier);
     }
     installBegins(identifier);
+}
+
+void SessionWatch::takeUpDelivered() {
+    for (const std::string& identifier : device_.coordinatedInstallsUnderWay()) {
+        const std::uint64_t size = sizeOf(identifier);
+        const std::lock_guard guard(mutex_);
+        if (concluded_.contains(identifier)) continue;  // meanwhile
+        if (!delivered_.try_emplace(identifier).second) continue;
+        installing_[identifier] = size;
+        reportBegin(identifier, size);  // before anything else is told of it
+    }
 }
 
 void SessionWatch::coordinatorRefused(const std::string& identifier, const ErrorRecord& error) {

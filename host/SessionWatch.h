@@ -8,6 +8,7 @@
 #include <memory>
 #include <mutex>
 #include <optional>
+#include <set>
 #include <string>
 #include <thread>
 #include <vector>
@@ -57,6 +58,8 @@ class SessionWatch {
     [[nodiscard]] bool isCoordinated() const { return isCoordinated_; }
     /// The package of an application is the coordination service's to install from now on.
     void packageDelivered(const std::string& identifier);
+    /// The same for those whose packages an earlier session has delivered.
+    void takeUpDelivered();
     /// Waits until the uninstalls that the client has handed to the coordination service have
     /// ended, or a stop is requested.
     void waitForUninstalls(const std::atomic<bool>& stopRequested);
@@ -87,6 +90,7 @@ class SessionWatch {
 
     void poll();
     void reportProgress();
+    void reportBegin(const std::string& identifier, std::uint64_t size);
     void reportDenials();
     void reportDenial(const std::string& identifier);
     void reportWaiting(const std::string& identifier,
@@ -110,8 +114,9 @@ class SessionWatch {
     // Guarded by mutex_.
     std::map<std::string, std::uint64_t> sizes_;
     std::map<std::string, std::uint64_t> installing_;  // to their sizes
-    std::map<std::string, Delivered> delivered_;
-    std::size_t uninstalls_ = 0;  // of the coordination service's, under way
+    std::map<std::string, Delivered> delivered_;       // through coordinators
+    std::set<std::string> concluded_;                  // what was installed, or failed
+    std::size_t uninstalls_ = 0;                       // of the coordination service's, under way
     bool isOver_ = false;
 
     std::thread poller_;

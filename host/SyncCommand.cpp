@@ -194,6 +194,11 @@ class SyncRun {
     Result<int> hold() {
         Result<std::unique_ptr<PlugIn>> plugIn = PlugIn::load(*device_, events_, facts_);
         if (!plugIn) return plugIn.error();
+        for (const auto* installs : {&plan_.install, &plan_.update}) {
+            for (const PlannedInstall& each : *installs) {
+                if (each.hasArrived) (*plugIn)->watch().setSize(each.identifier, each.bytes);
+            }
+        }
         Session session(*device_, **plugIn, events_, facts_, signals_->stopRequested());
         const SessionEnd end = session.sync(
             {[this](const std::string& identifier) { return packageFile(library_, identifier); },

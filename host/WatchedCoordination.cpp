@@ -71,15 +71,12 @@ class WatchedObserver : public InstallCoordinatorObserver {
             [&](auto& plugIn) { plugIn.coordinatorDidInstallPlaceholder(coordinator); });
     }
     void coordinatorDidCompleteSuccessfully(const CoordinatorPointer& coordinator) override {
-        // The todo list first: whoever hears of the end may look at it.
-        handOn([](SessionWatch&) {},
-               [&](auto& plugIn) { plugIn.coordinatorDidCompleteSuccessfully(coordinator); });
         handOn(
             [&](SessionWatch& watch) {
                 const auto error = coordinator->error();
                 watch.installEnded(identifierOf(coordinator), error ? Status(*error) : Status());
             },
-            [](auto&) {});
+            [&](auto& plugIn) { plugIn.coordinatorDidCompleteSuccessfully(coordinator); });
     }
     void coordinatorCanceledWithReason(const CoordinatorPointer& coordinator,
                                        const ErrorRecord& reason,

@@ -157,8 +157,16 @@ def test_history(appsync, device, library):
     history = appsync.json("history", device.path)
     assert {"time", "kind", "success", "identifier", "description"} <= set(history[0])
     told = [(h["scenario"], h["identifier"], h["description"]) for h in history if h["kind"] == "scenario"]
-    assert ("Install placeholder", "com.example.app00", "Installed placeholder") in told
-    assert ("Asset install", "com.example.app00", "assertion not found") in told
+    if device.is_coordinated:
+        # The plug-in puts up no placeholder and asks for no assertion itself; it notes its steps.
+        steps = [(h["step"], h["phase"], h["success"], h["description"]) for h in history
+                 if h["kind"] == "step" and h["identifier"] == "com.example.app00"]
+        assert (3, 2, True, "Finished creating coordinator") in steps
+        assert (4, 2, True, "Finished creating placeholder") in steps
+        assert (1, 2, True, "Install app") in steps
+    else:
+        assert ("Install placeholder", "com.example.app00", "Installed placeholder") in told
+        assert ("Asset install", "com.example.app00", "assertion not found") in told
 
 
 def test_log_file_is_one_object_a_line(appsync, device, library):
@@ -221,11 +229,18 @@ def test_demoted_application_comes_back_by_send(appsync, device, library):
     assert "com.example.app02" in device.apps() and device.placeholders() == []
 
 
-def test_coordination_is_refused_clearly(appsync, device, tmp_path):
-    one_line(appsync("set", device.path, "coordination=on", expect=None))
-    done = appsync("create", tmp_path / "new", "--coordination", "on", expect=None)
-    assert done.returncode in (2, 3) and not (tmp_path / "new").exists()
-    appsync("create", tmp_path / "new", "--coordination", "off")
+def test_coordination_is_turned_on_and_off(appsync, device, library):
+    other = "off" if device.is_coordinated else "on"
+    device.sync(library)
+    appsync("set", device.path, "coordination=" + other)
+    packages.make_library(library, 5, "2.0")
+    assert len(device.sync(library)["updated"]) == 5
+    steps = [h for h in appsync.json("history", device.path) if h["kind"] == "step" and h["step"] == 3]
+    assert {h["phase"] for h in steps} == {1, 2}
+    appsync("set", device.path, "coordination=" + device.coordination)
+    assert device.sync(library)["requested"] == []
+    one_line(appsync("set", device.path, "coordination=perhaps", expect=2))
+    one_line(appsync("create", device.path + "2", "--coordination", "perhaps", expect=2))
 
 
 @pytest.mark.parametrize("arguments", [[], ["nonsense"], ["sync"], ["apps"], ["create"],
@@ -307,6 +322,11 @@ def test_send_to_a_device_that_was_never_synced(appsync, device, library):
 def test_restore_in_two_parts_on_a_device_that_was_never_synced(appsync, device, library, tmp_path):
     (tmp_path / "data.bin").write_bytes(b"mine")
     package = os.path.join(library, "com.example.app00.zip")
+    if device.is_coordinated:
+        # The plug-in takes no restored package where the store brings them.
+        one_line(appsync("send", device.path, "com.example.app00", package, "--restore", expect=1))
+        assert device.apps() == {} and device.placeholders() == []
+        return
     appsync("send", device.path, "com.example.app00", package, "--restore", "--parts", "1")
     assert device.apps() == {}
     appsync("send", device.path, "com.example.app00", tmp_path / "data.bin", "--restore", "--parts", "2")

@@ -25,9 +25,15 @@ def larger_library(tmp_path):
     return folder
 
 
+def packages_arrived(device):
+    """The applications whose package the device has whole and has yet to install."""
+    return {each["identifier"] for each in device.appsync.json("coordinator", device.path, "list")
+            if any(promise["name"].endswith("-Asset") and promise["complete"] for promise in each["promises"])}
+
+
 def settle(device, library, expect=0):
     """Runs the same command again and checks the whole device."""
-    device.sync(library, expect=expect)
+    result = device.sync(library, expect=expect)
     with sqlite3.connect(os.path.join(device.path, "device.db")) as database:
         assert database.execute("PRAGMA integrity_check").fetchall() == [("ok",)]
     database.close()
@@ -36,33 +42,36 @@ def settle(device, library, expect=0):
     assert sorted(containers) == sorted(os.path.basename(a["container"]) for a in device.apps().values())
     staging = os.listdir(device.inside("/var/mobile/Media/PublicStaging"))
     assert [name for name in staging if name.endswith(".zip")] == []
+    return result
 
 
-def duration_of(appsync, library, path):
-    fresh = Device(appsync, path)
+def duration_of(appsync, library, path, coordination):
+    fresh = Device(appsync, path, coordination)
     start = time.monotonic()
     fresh.sync(library)
     return time.monotonic() - start
 
 
 @pytest.mark.parametrize("number", [signal.SIGKILL, signal.SIGINT, signal.SIGTERM])
-def test_stopped_at_random_moments_and_run_again(appsync, larger_library, tmp_path, number):
+def test_stopped_at_random_moments_and_run_again(appsync, larger_library, tmp_path, number, coordination):
     """Twenty kills (ten for each polite signal), at moments from a fixed seed over the whole run."""
-    whole = duration_of(appsync, larger_library, tmp_path / "whole")
+    whole = duration_of(appsync, larger_library, tmp_path / "whole", coordination)
     choose = random.Random(int(number))
     for attempt in range(20 if number == signal.SIGKILL else 10):
-        device = Device(appsync, tmp_path / ("device%d" % attempt))
+        device = Device(appsync, tmp_path / ("device%d" % attempt), coordination)
         sync = appsync.start("sync", device.path, larger_library)
         time.sleep(choose.uniform(0, whole))
         sync.send_signal(number)
         sync.communicate(timeout=60)
-        settle(device, larger_library)
-        assert len(device.apps()) == 12
+        arrived = packages_arrived(device)
+        done = set(device.apps())
+        again = settle(device, larger_library)
+        assert arrived.isdisjoint(again["requested"]) and done.isdisjoint(again["requested"])
+        assert len(device.apps()) == 12 and appsync.json("coordinator", device.path, "list") == []
         assert device.sync(larger_library)["requested"] == []
 
 
-def test_killed_update_keeps_one_version_or_the_other(appsync, larger_library, tmp_path):
-    device = Device(appsync, tmp_path / "device")
+def test_killed_update_keeps_one_version_or_the_other(appsync, larger_library, device):
     device.sync(larger_library)
     packages.make_library(larger_library, 12, "2.0", payload=random.Random(8).randbytes(400_000))
     choose = random.Random(3)
@@ -154,7 +163,9 @@ def test_uninstalling_what_waits_wins_over_its_update(appsync, waiting_sync, dev
     assert sync.returncode == 1
     failed = json.loads(out)["failed"]
     assert [each["identifier"] for each in failed] == ["com.example.app00"]
-    assert "uninstalled on the device" in failed[0]["error"]
+    # Its coordinator hears of it at once; the direct path at its next try.
+    why = "removed from the device" if device.is_coordinated else "uninstalled on the device"
+    assert why in failed[0]["error"]
     assert "com.example.app00" not in device.apps()
     device.sync(library)
     assert device.versions()["com.example.app00"] == "2.0"

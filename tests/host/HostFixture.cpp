@@ -18,9 +18,9 @@ std::string infoOf(const std::string& identifier, const std::string& version) {
 
 }  // namespace
 
-HostFixture::HostFixture() {
+HostFixture::HostFixture(bool coordination) {
     std::filesystem::create_directory(library);
-    EXPECT_TRUE(Device::create(device).ok());
+    EXPECT_TRUE(Device::create(device, {coordination}).ok());
 }
 
 int HostFixture::run(std::vector<std::string> arguments) {

@@ -17,7 +17,7 @@ namespace appsync {
 /// A directory of its own for each test, with an empty device and an empty library in it.
 class HostFixture : public testing::Test {
   protected:
-    HostFixture();
+    explicit HostFixture(bool coordination = false);
 
     /// Runs a command of appsync. Gives its exit status; `out` and `err` hold what it printed.
     int run(std::vector<std::string> arguments);

@@ -51,6 +51,22 @@ TEST_F(SyncOutcome, TellsInstalledUpdatedAndRemovedApart) {
     EXPECT_FALSE(summary().incomplete);
 }
 
+TEST_F(SyncOutcome, SkipsWhatAnotherClientHasInHand) {
+    planInstall("com.a", "1");
+    facts.heldByClient("com.a", 7);
+    EXPECT_THAT(summary().failed, IsEmpty());
+    ASSERT_EQ(summary().skipped.size(), 1U);
+    EXPECT_THAT(summary().skipped[0].why, HasSubstr("client 7"));
+    EXPECT_TRUE(summary().incomplete);
+}
+
+TEST_F(SyncOutcome, NamesWhatAnInterruptedSessionHadBrought) {
+    facts.installed("com.a");
+    present("com.a", "1");
+    EXPECT_THAT(summary().installed, ElementsAre("com.a"));
+    EXPECT_FALSE(summary().incomplete);
+}
+
 TEST_F(SyncOutcome, NamesTheFirstCauseOfWhatIsNotThere) {
     planInstall("com.a", "1");
     facts.failed("com.a", "the package is damaged");

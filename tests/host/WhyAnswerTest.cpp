@@ -66,6 +66,66 @@ TEST(WhyAnswer, ARestoreWaitsForItsData) {
     EXPECT_EQ(explain("com.a", status, {}).waitsFor->what, "restore data");
 }
 
+CoordinatorRecord coordinator(CoordinationClient missing) {
+    CoordinatorRecord record;
+    record.identifier = "com.a";
+    record.kind = "initiating";
+    record.client = SyncClientID;
+    record.promises = {{"com.a-Asset", false, 0.5, missing, false}};
+    record.waitsFor = "client N has yet to deliver the package";
+    record.waitsForClient = missing;
+    return record;
+}
+
+TEST(WhyAnswer, NamesThePromiseOfTheHostThatIsMissing) {
+    ApplicationStatus status;
+    status.coordinator = coordinator(SyncClientID);
+    EXPECT_EQ(explain("com.a", status, {}).waitsFor->what, "sync");
+    status.sessionUnderWay = true;
+    const WhyAnswer answer = explain("com.a", status, {});
+    EXPECT_EQ(answer.waitsFor->what, "transfer");
+    EXPECT_EQ(answer.waitsFor->who, "host");
+    EXPECT_EQ(answer.waitsFor->promise, "com.a-Asset");
+    EXPECT_THAT(whyText(answer), HasSubstr("has yet to deliver the package"));
+}
+
+TEST(WhyAnswer, NamesAnotherClientAndTheStore) {
+    ApplicationStatus status;
+    status.coordinator = coordinator(7);
+    EXPECT_EQ(explain("com.a", status, {}).waitsFor->who, "client 7");
+    status.coordinator = coordinator(AppStoreClientID);
+    EXPECT_EQ(explain("com.a", status, {}).waitsFor->who, "store");
+}
+
+TEST(WhyAnswer, ACompleteCoordinatorWaitsForASessionOrItsInstall) {
+    ApplicationStatus status;
+    status.coordinator = coordinator(SyncClientID);
+    status.coordinator->isComplete = true;
+    EXPECT_EQ(explain("com.a", status, {}).waitsFor->what, "sync");
+    status.sessionUnderWay = true;
+    EXPECT_EQ(explain("com.a", status, {}).waitsFor->what, "install");
+    EXPECT_FALSE(explain("com.a", status, {}).waitsFor->promise);
+}
+
+TEST(WhyAnswer, NamesThePolicyThatForbids) {
+    DeviceSettings settings;
+    settings.installation = PolicyAnswer::No;
+    ApplicationStatus status;
+    EXPECT_EQ(explain("com.a", status, settings).waitsFor->what, "policy");
+    status.coordinator = coordinator(SyncClientID);
+    EXPECT_EQ(explain("com.a", status, settings).waitsFor->what, "policy");
+    status.coordinator.reset();
+    status.installed = application(false, kInstallTypeSync);
+    EXPECT_FALSE(explain("com.a", status, settings).waitsFor);
+}
+
+TEST(WhyAnswer, TellsTheErrorOfTheCoordinator) {
+    ApplicationStatus status;
+    status.coordinator = coordinator(SyncClientID);
+    status.coordinator->error = ErrorRecord::make(kInstallerErrorDomain, 6, "a file is damaged");
+    EXPECT_EQ(explain("com.a", status, {}).lastError, "a file is damaged");
+}
+
 TEST(WhyAnswer, TellsTheLastError) {
     ApplicationStatus status;
     status.lastFailure =

@@ -1,0 +1,123 @@
+#include <atomic>
+#include <filesystem>
+#include <thread>
+
+#include "host/WatchedCoordination.h"
+#include "tests/host/HostFixture.h"
+
+namespace appsync {
+namespace {
+
+using testing::ElementsAre;
+using testing::HasSubstr;
+using testing::IsEmpty;
+
+class CoordinatedSync : public HostFixture {
+  protected:
+    CoordinatedSync() : HostFixture(true) {}
+
+    [[nodiscard]] std::vector<std::string> coordinators() {
+        std::vector<std::string> identifiers;
+        const auto records = open(DeviceAccess::Look)->coordinators();
+        if (!records) return {"no answer"};
+        for (const CoordinatorRecord& each : *records) identifiers.push_back(each.identifier);
+        return identifiers;
+    }
+
+    void create(const std::string& identifier) {
+        EXPECT_EQ(run({"coordinator", device, "create", identifier}), 0) << err.str();
+    }
+};
+
+TEST_F(CoordinatedSync, InstallsUpdatesAndRemoves) {
+    addPackage("com.a", "1");
+    addPackage("com.b", "1");
+    EXPECT_EQ(sync(), 0) << out.str();
+    EXPECT_THAT(applications(), ElementsAre("com.a 1", "com.b 1"));
+    addPackage("com.a", "2");
+    EXPECT_EQ(sync({"--remove", "com.b"}), 0) << out.str();
+    EXPECT_THAT(applications(), ElementsAre("com.a 2"));
+    EXPECT_THAT(coordinators(), IsEmpty());
+}
+
+TEST_F(CoordinatedSync, ReportsTheSamePhasesAsADirectOne) {
+    addPackage("com.a", "1");
+    EXPECT_EQ(run({"sync", device, library}), 0);
+    EXPECT_THAT(out.str(), HasSubstr("install com.a: begins"));
+    EXPECT_THAT(out.str(), HasSubstr("install com.a: done"));
+}
+
+TEST_F(CoordinatedSync, LeavesToAnotherClientWhatThatHasInHand) {
+    addPackage("com.a", "1");
+    addPackage("com.b", "1");
+    create("com.a");
+    EXPECT_EQ(sync(), 1);
+    EXPECT_THAT(out.str(), HasSubstr("client 2"));
+    EXPECT_THAT(applications(), ElementsAre("com.b 1"));
+    EXPECT_THAT(coordinators(), ElementsAre("com.a"));
+}
+
+TEST_F(CoordinatedSync, APackageOfAnotherIdentifierFailsAndLeavesNothing) {
+    addPackage("com.b", "1");
+    write(root + "/var/mobile/Media/PublicStaging/ApplicationSync/ApplicationsSync.plist",
+          "<plist version=\"1.0\"><array><dict><key>identifier</key><string>com.a</string>"
+          "<key>operation</key><string>install</string></dict></array></plist>");
+    std::filesystem::rename(library + "/com.b.zip", library + "/com.a.zip");
+    EXPECT_EQ(sync({"--staged"}), 1);
+    EXPECT_THAT(out.str(), HasSubstr("\"identifier\": \"com.a\""));
+    EXPECT_THAT(applications(), IsEmpty());
+    EXPECT_THAT(coordinators(), IsEmpty());
+}
+
+TEST_F(CoordinatedSync, SendsOnePackageInASessionOfItsOwn) {
+    addPackage("com.a", "1");
+    EXPECT_EQ(run({"send", device, "com.a", library + "/com.a.zip"}), 0) << out.str() << err.str();
+    EXPECT_THAT(applications(), ElementsAre("com.a 1"));
+}
+
+TEST_F(CoordinatedSync, SendingTakesNoNoteOfWhatWasUninstalled) {
+    addPackage("com.a", "1");
+    addPackage("com.b", "1");
+    EXPECT_EQ(sync(), 0);
+    EXPECT_EQ(run({"uninstall", device, "com.b"}), 0);
+    EXPECT_EQ(run({"send", device, "com.a", library + "/com.a.zip"}), 0) << out.str() << err.str();
+    EXPECT_EQ(run({"inventory", device, "--json"}), 0);
+    EXPECT_THAT(out.str(), HasSubstr("\"deleted\": [\n    \"com.b\"\n  ]"));
+}
+
+TEST_F(CoordinatedSync, LookingAtTheDeviceStartsNothing) {
+    addPackage("com.a", "1");
+    create("com.a");
+    EXPECT_EQ(run({"inventory", device}), 0);
+    EXPECT_EQ(run({"apps", device}), 0);
+    EXPECT_THAT(coordinators(), ElementsAre("com.a"));
+}
+
+// The gate and what stands in it.
+
+TEST(CallGateTest, LetsNobodyInOnceItIsClosed) {
+    CallGate gate;
+    EXPECT_TRUE(gate.enter());
+    gate.leave();
+    gate.close();
+    EXPECT_FALSE(gate.enter());
+    gate.close();
+}
+
+TEST(CallGateTest, ClosesWhenTheLastOneHasLeft) {
+    CallGate gate;
+    ASSERT_TRUE(gate.enter());
+    std::atomic<bool> isClosed = false;
+    std::thread closer([&] {
+        gate.close();
+        isClosed = true;
+    });
+    while (gate.enter()) gate.leave();  // until the other thread has begun to close it
+    EXPECT_FALSE(isClosed);
+    gate.leave();
+    closer.join();
+    EXPECT_TRUE(isClosed);
+}
+
+}  // namespace
+}  // namespace appsync

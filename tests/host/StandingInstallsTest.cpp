@@ -1,0 +1,143 @@
+#include "host/StandingInstalls.h"
+
+#include <gmock/gmock.h>
+#include <gtest/gtest.h>
+
+#include "device/DeviceRecords.h"
+#include "host/StagingArea.h"
+#include "host/SyncPlan.h"
+#include "platform/InstallProgressRecord.h"
+#include "platform/PropertyList.h"
+
+namespace appsync {
+namespace {
+
+using testing::ElementsAre;
+using testing::HasSubstr;
+using testing::IsEmpty;
+
+class StandingInstallsTest : public testing::Test {
+  protected:
+    // A coordinator of the sync client, by default of a first install.
+    CoordinatorRecord& stands(const char* identifier, bool hasPackage) {
+        CoordinatorRecord record;
+        record.identifier = identifier;
+        record.kind = "initiating";
+        record.client = SyncClientID;
+        record.promises = {{std::string(identifier) + "-Asset", hasPackage, hasPackage ? 1.0 : 0.5,
+                            SyncClientID, false}};
+        record.isComplete = hasPackage;
+        return coordinators.emplace_back(record);
+    }
+
+    void placeholder(const char* identifier, const char* version) {
+        ApplicationRecord record;
+        record.identifier = identifier;
+        record.version = version;
+        record.isPlaceholder = true;
+        record.installType = kInstallTypeSync;
+        present.push_back(record);
+    }
+
+    void installed(const char* identifier) {
+        ApplicationRecord record;
+        record.identifier = identifier;
+        record.version = "1";
+        present.push_back(record);
+    }
+
+    void planInstall(const char* identifier, const char* version) {
+        plan.install.push_back({identifier, "", "", version, 100, 300});
+    }
+
+    StandingInstalls taken() { return takeUp(plan, coordinators, present); }
+
+    SyncPlan plan;
+    std::vector<CoordinatorRecord> coordinators;
+    std::vector<ApplicationRecord> present;
+};
+
+TEST_F(StandingInstallsTest, APackageThatHasArrivedTravelsNoMore) {
+    planInstall("com.a", "2");
+    placeholder("com.a", "2");
+    stands("com.a", true);
+    const StandingInstalls standing = taken();
+    EXPECT_THAT(standing.arrived, ElementsAre("com.a"));
+    EXPECT_THAT(standing.obsolete, IsEmpty());
+    EXPECT_EQ(plan.bytes(), 0U);
+    EXPECT_EQ(plan.needed(), 300U);
+    EXPECT_EQ(*todoListOf(plan).elements()[0].findString("operation"), "DOWNLOADED");
+}
+
+TEST_F(StandingInstallsTest, WhatLacksAnotherPieceIsAskedForAgainButNotSent) {
+    planInstall("com.a", "2");
+    placeholder("com.a", "2");
+    stands("com.a", true).isComplete = false;
+    EXPECT_THAT(taken().arrived, ElementsAre("com.a"));
+    EXPECT_EQ(*todoListOf(plan).elements()[0].findString("operation"), "install");
+}
+
+TEST_F(StandingInstallsTest, APackageOfAnotherVersionIsObsolete) {
+    planInstall("com.a", "3");
+    placeholder("com.a", "2");
+    stands("com.a", true);
+    EXPECT_THAT(taken().obsolete, ElementsAre("com.a"));
+    EXPECT_EQ(plan.bytes(), 100U);
+}
+
+TEST_F(StandingInstallsTest, WhatIsStillToBeSentGoesOnWhateverTheVersion) {
+    planInstall("com.a", "3");
+    placeholder("com.a", "2");
+    stands("com.a", false);
+    const StandingInstalls standing = taken();
+    EXPECT_THAT(standing.arrived, IsEmpty());
+    EXPECT_THAT(standing.obsolete, IsEmpty());
+}
+
+TEST_F(StandingInstallsTest, WhatNobodyAsksForIsObsoleteUnlessItHasArrived) {
+    stands("com.a", false);
+    stands("com.b", true);
+    const StandingInstalls standing = taken();
+    EXPECT_THAT(standing.obsolete, ElementsAre("com.a"));
+    EXPECT_THAT(standing.arrived, ElementsAre("com.b"));
+}
+
+TEST_F(StandingInstallsTest, WhatIsToBeRemovedIsObsolete) {
+    plan.remove = {"com.a"};
+    installed("com.a");
+    stands("com.a", true).kind = "updating";
+    EXPECT_THAT(taken().obsolete, ElementsAre("com.a"));
+}
+
+TEST_F(StandingInstallsTest, ACoordinatorOfTheWrongKindIsObsolete) {
+    plan.update.push_back({"com.a", "", "1", "2", 100, 300});
+    installed("com.a");
+    stands("com.a", false);
+    planInstall("com.b", "1");
+    stands("com.b", false).kind = "updating";
+    EXPECT_THAT(taken().obsolete, ElementsAre("com.a", "com.b"));
+}
+
+TEST_F(StandingInstallsTest, WhatAnotherClientHasInHandIsSkipped) {
+    planInstall("com.a", "1");
+    planInstall("com.b", "1");
+    stands("com.a", false).client = 7;
+    const StandingInstalls standing = taken();
+    EXPECT_THAT(standing.obsolete, IsEmpty());
+    ASSERT_EQ(plan.install.size(), 1U);
+    EXPECT_EQ(plan.install[0].identifier, "com.b");
+    ASSERT_EQ(plan.skipped.size(), 1U);
+    EXPECT_TRUE(plan.skipped[0].isUnmet);
+    EXPECT_THAT(plan.skipped[0].why, HasSubstr("client 7"));
+}
+
+TEST_F(StandingInstallsTest, ARestoreIsLeftAlone) {
+    stands("com.a", false).kind = "restoring";
+    stands("com.b", true).kind = "restoring demoted";
+    const StandingInstalls standing = taken();
+    EXPECT_THAT(standing.obsolete, IsEmpty());
+    EXPECT_THAT(standing.arrived, IsEmpty());
+}
+
+}  // namespace
+}  // namespace appsync
