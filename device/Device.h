@@ -2,6 +2,7 @@
 
 #include <chrono>
 #include <cstdint>
+#include <map>
 #include <memory>
 #include <optional>
 #include <string>
@@ -9,6 +10,7 @@
 
 #include "device/DeviceRecords.h"
 #include "device/HomeScreenPicture.h"
+#include "platform/Bytes.h"
 #include "platform/Platform.h"
 #include "platform/Result.h"
 
@@ -147,6 +149,15 @@ class Device {
     /// Whether the backup service holds data to restore for the application: until the application
     /// is installed or its restore is given up.
     Status setRestoreDataExpected(const std::string& identifier, bool expected);
+    /// The same of many, all of them at once.
+    Status expectRestoreData(const std::vector<std::string>& identifiers);
+    /// The device path at which the backup service finds the data that a restore has left for an
+    /// application: an archive. It is unpacked, and goes, with the install of the application.
+    [[nodiscard]] static std::string restoreDataPath(const std::string& identifier);
+    /// The device path of an application's data.
+    [[nodiscard]] static std::string dataPath(const std::string& identifier);
+    /// The SINF data of placeholders that have any, by identifier.
+    [[nodiscard]] Result<std::map<std::string, Bytes>> sinfData();
 
   private:
     struct State;
