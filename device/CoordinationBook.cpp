@@ -21,6 +21,10 @@ namespace {
 
 using Lookup = InstallCoordinatorService::Coordinator;
 
+/// A client that restores notes that it waits for a placeholder after it has handed that in. News
+/// that overtook it would be lost, and it would wait until its patience ends.
+constexpr std::chrono::milliseconds kBookingTime{20};
+
 Lookup nothing(const ErrorRecord& error) { return {nullptr, false, error}; }
 
 ErrorRecord serviceClosed() {
@@ -348,9 +352,15 @@ void CoordinationBook::tellLast(const Coordinator& coordinator, CoordinationHera
 }
 
 void CoordinationBook::tellPlaceholder(const Coordinator& coordinator) {
-    tell(coordinator, [handle = handle(coordinator)](InstallCoordinatorObserver& observer) {
-        observer.coordinatorDidInstallPlaceholder(handle);
-    });
+    if (access_ == Access::Look) return;
+    const bool restoring = coordinator->kind == CoordinatorKind::Restoring ||
+                           coordinator->kind == CoordinatorKind::RestoringDemoted;
+    herald_.tell(
+        coordinator,
+        [handle = handle(coordinator)](InstallCoordinatorObserver& observer) {
+            observer.coordinatorDidInstallPlaceholder(handle);
+        },
+        {}, restoring ? kBookingTime : std::chrono::milliseconds(0));
 }
 
 void CoordinationBook::tellCompletion(const Coordinator& coordinator) {

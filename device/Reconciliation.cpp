@@ -197,10 +197,14 @@ void clearPackages(const InstallContext& context) {
     }
 }
 
-// Data that was restored with an install is not restored again with the next one.
+// Data that was restored with an install is not restored again with the next one. What is no whole
+// archive was cut off.
 void clearRestoredData(const InstallContext& context) {
     for (const std::string& name : namesAt(context, kRestoreDataDirectory)) {
-        if (!name.ends_with(kPackageSuffix)) continue;
+        if (!name.ends_with(kPackageSuffix)) {
+            context.files.removeItem(std::string(kRestoreDataDirectory) + "/" + name).ignore();
+            continue;
+        }
         const std::string identifier = name.substr(0, name.size() - kPackageSuffix.size());
         bool isInstalled = false;
         context.database

@@ -238,7 +238,13 @@ class Restoring {
         return {};
     }
 
-    Status placeRestoreInfo() { return write(kRestoreInfoPath, restoreInfo_); }
+    // Beside the place where it goes once it has been processed.
+    Status placeRestoreInfo() {
+        const FileAttributes mobile{"mobile", "mobile"};
+        const Status made =
+            device_.files().createDirectory(directoryOf(kProcessedRestoreInfoPath), true, &mobile);
+        return made ? write(kRestoreInfoPath, restoreInfo_) : made;
+    }
 
     Status lookAtScreen() {
         const Result<std::vector<ApplicationRecord>> records = device_.applications();

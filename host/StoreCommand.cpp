@@ -85,7 +85,7 @@ class Store {
         const auto path = FileURL::fromPath(std::string(kPublicStaging) + "/" + name, false);
         auto promise = coordinator.appAssetPromise();
         if (promise == nullptr) {
-            promise = service_.makePathTransferPromise("package of " + identifier, AppStoreClientID,
+            promise = service_.makePathTransferPromise(identifier + "-Asset", AppStoreClientID,
                                                        path, package->bytes);
             const Status set = coordinator.setAppAssetPromise(promise);
             if (!set) return set;
