@@ -19,6 +19,7 @@
 
 #include "device/DataArchive.h"
 #include "device/Device.h"
+#include "device/IconDrawing.h"
 #include "host/Backup.h"
 #include "host/Commands.h"
 #include "host/Console.h"
@@ -121,12 +122,9 @@ class BackupMaking {
             if (!isForBackup(record) || !seen.insert(record.identifier).second) continue;
             records_.push_back(std::move(record));
         }
-        Result<std::vector<HomeScreenItem>> screen = device_.homeScreen();
+        const Result<std::vector<HomeScreenItem>> screen = device_.homeScreen();
         if (!screen) return screen.error();
-        for (HomeScreenItem& item : *screen) {
-            order_.push_back(item.identifier);
-            screen_[item.identifier] = std::move(item);
-        }
+        for (const HomeScreenItem& item : *screen) order_.push_back(item.identifier);
         Result<std::map<std::string, Bytes>> sinfs = device_.sinfData();
         if (!sinfs) return sinfs.error();
         sinfs_ = *std::move(sinfs);
@@ -158,10 +156,11 @@ class BackupMaking {
         if (record.isPlaceholder && sinf != sinfs_.end()) {
             entry.set("ApplicationSINF", sinf->second);
         }
-        const auto item = screen_.find(record.identifier);
-        if (item != screen_.end() && isPng(item->second.icon)) {
-            entry.set("PlaceholderIcon", item->second.icon);
-        }
+        const std::string icon = record.bundle + "/" + record.iconFile;
+        const Result<ItemAttributes> attributes = device_.files().attributes(icon);
+        if (!attributes || attributes->size > kMaximumIconFileBytes) return entry;
+        Result<Bytes> picture = device_.files().readFile(icon);
+        if (picture && isPng(*picture)) entry.set("PlaceholderIcon", *std::move(picture));
         return entry;
     }
 
@@ -265,7 +264,6 @@ class BackupMaking {
     const std::string backup_;
     std::vector<ApplicationRecord> records_;
     std::vector<std::string> order_;
-    std::map<std::string, HomeScreenItem> screen_;
     std::map<std::string, Bytes> sinfs_;
     BackupResult result_;
 };
