@@ -222,6 +222,8 @@ Status Device::startCoordination() {
     return {};
 }
 
+void Device::closeCoordination() { state_->coordination.close(); }
+
 std::vector<std::string> Device::coordinatedInstallsUnderWay() {
     return state_->coordination.installsUnderWay();
 }

@@ -121,6 +121,8 @@ class Device {
     /// The coordination service begins to work, if it does not yet: what is complete is installed.
     /// A client that attaches to the service has the same effect. Only with DeviceAccess::Session.
     Status startCoordination();
+    /// It works no more, and calls no observer any more. Does not come back.
+    void closeCoordination();
     /// The applications whose package the sync client has delivered to the service and whose
     /// install has not ended, observers included; ordered. Those that wait for a running
     /// application to end are among them: `status` tells of the denial.

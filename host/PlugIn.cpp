@@ -34,7 +34,13 @@ PlugIn::PlugIn(SyncDaemon::Process process) : daemon_(process) {}
 
 // The device may be in the middle of telling the client something.
 PlugIn::~PlugIn() {
-    if (watch_ != nullptr) watch_->closeCoordination();
+    if (watch_ != nullptr) {
+        watch_->closeCoordination();
+    } else {
+        device_->closeCoordination();
+    }
+    // Or else the client might go on the registry's thread, after what it stands on.
+    if (client_ != nullptr) registry_->removeObserver(client_.get());
 }
 
 Status PlugIn::openLog(Device& device) {
@@ -48,10 +54,12 @@ Status PlugIn::openLog(Device& device) {
 
 Result<std::unique_ptr<PlugIn>> PlugIn::loadIn(SyncDaemon::Process process, Device& device) {
     std::unique_ptr<PlugIn> plugIn(new PlugIn(process));
+    plugIn->device_ = &device;
     const Status status = plugIn->openLog(device);
     if (!status) return status.error();
     plugIn->platform_ =
         std::make_unique<const Platform>(device.platform(plugIn->daemon_, *plugIn->log_));
+    plugIn->registry_ = &plugIn->platform_->registry;
     return plugIn;
 }
 
@@ -73,6 +81,7 @@ Result<std::unique_ptr<PlugIn>> PlugIn::load(Device& device, SyncEvents& events,
     if (!loaded) return loaded;
     PlugIn& plugIn = **loaded;
     plugIn.watch_ = std::make_unique<SessionWatch>(device, plugIn.platform(), events, facts);
+    plugIn.registry_ = &plugIn.watch_->registry();
     plugIn.client_ = AppsClient::create(watched(plugIn.platform(), *plugIn.watch_));
     plugIn.platform().notificationCenter.post(kStartupNotification);
     return loaded;

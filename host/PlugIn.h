@@ -8,6 +8,7 @@
 
 namespace appsync {
 
+class AppRegistry;
 class AppsClient;
 class Device;
 class JsonLogFacility;
@@ -45,6 +46,8 @@ class PlugIn {
     Status openLog(Device& device);
 
     SyncDaemon daemon_;
+    Device* device_ = nullptr;
+    AppRegistry* registry_ = nullptr;  // the one that the client observes
     std::unique_ptr<JsonLogFacility> log_;
     std::unique_ptr<const Platform> platform_;
     std::unique_ptr<SessionWatch> watch_;

@@ -15,6 +15,7 @@ import pytest
 
 import packages
 from conftest import Device, names_of
+from test_device import in_own_mounts
 
 DATA = "/var/mobile/Containers/Data"
 RESTORE_INFO = "/var/mobile/Media/VessikRestore/RestoreApplications.plist"
@@ -495,16 +496,15 @@ def test_backup_that_is_cut_off_is_never_taken_for_a_whole_one(appsync, used, fr
 
 
 def test_backup_that_fails_says_that_it_is_not_whole(appsync, used, tmp_path):
-    """Something that cannot be read stands among the data: a folder that its owner closed."""
-    if os.geteuid() == 0:
-        pytest.skip("root reads everything")
-    closed = os.path.join(used.inside(DATA), IDS[1], "closed")
-    os.makedirs(closed)
-    os.chmod(closed, 0)
-    done = appsync("backup", used.path, tmp_path / "backup", expect=1)
-    os.chmod(closed, 0o755)
-    assert "is not whole" in done.stderr and done.stderr.count("\n") == 1
-    appsync("restore", used.path, tmp_path / "backup", expect=3)
+    """The disk of the backup is full before the end."""
+    write_data(used, IDS[0], {"big": random.Random(4).randbytes(3_000_000)})
+    script = "mount -t tmpfs -o size=1m tmpfs {0} && {1} backup {2} {0}/b; echo $?; {1} backup --check {0}/b; echo $?".format(
+        tmp_path, appsync.program, used.path)
+    os.rename(used.path, str(tmp_path) + "-device")
+    script = script.replace(used.path, str(tmp_path) + "-device")
+    done = in_own_mounts(script)
+    assert done.stdout.split() == ["1", "1"], done.stderr
+    assert "is not whole" in done.stderr
 
 
 # Many, and interrupted.
