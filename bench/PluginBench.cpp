@@ -1,9 +1,9 @@
-// What planning and restoring cost for each application, and what one edit of the todo list costs
-// beside a plain rewrite of the same bytes. Files are written to the working directory: it should
-// be on a disk.
+// What planning costs for each application, directly and with a coordinator prepared for each, what
+// restoring costs, and what one edit of the todo list costs beside a plain rewrite of the same
+// bytes. Files are written to the working directory: it should be on a disk.
 //
-// Names: planning/N, restoring/N, restoringCoordinated/N (one call with N applications),
-// todoListEdit, todoListPlainRewrite.
+// Names: planning/N, coordinating/N, restoring/N, restoringCoordinated/N (one call with N
+// applications), todoListEdit, todoListPlainRewrite.
 
 #include <benchmark/benchmark.h>
 #include <fcntl.h>
@@ -53,13 +53,14 @@ void stage(SimulatedPlatform& platform, int count) {
     }
 }
 
-void planning(benchmark::State& state) {
+void plan(benchmark::State& state, bool coordination) {
     const int count = static_cast<int>(state.range(0));
     for (auto _ : state) {
         state.PauseTiming();
         SystemPropertyLists codec;
         auto platform = std::make_unique<SimulatedPlatform>(codec);
         platform->recorder.setEnabled(false);
+        platform->coordination.setEnabled(coordination);
         stage(*platform, count);
         auto client = AppsClient::create(platform->services());
         state.ResumeTiming();
@@ -74,7 +75,12 @@ void planning(benchmark::State& state) {
     }
     state.SetItemsProcessed(state.iterations() * count);
 }
+
+void planning(benchmark::State& state) { plan(state, false); }
 BENCHMARK(planning)->Arg(1000)->Arg(10000)->Unit(benchmark::kMillisecond);
+
+void coordinating(benchmark::State& state) { plan(state, true); }
+BENCHMARK(coordinating)->Arg(1000)->Arg(10000)->Unit(benchmark::kMillisecond);
 
 /// What a restore has left: for each application store metadata, SINF data and an icon.
 void leaveRestoreInfo(SimulatedPlatform& platform, int count) {

@@ -7,14 +7,25 @@
 namespace appsync {
 namespace {
 
+std::string sizeText(const PlannedInstall& each) {
+    return each.hasArrived ? "(on the device already)\n" : "(" + formatBytes(each.bytes) + ")\n";
+}
+
 std::string installLine(const PlannedInstall& each) {
-    return "install  " + printable(each.identifier) + " " + printable(each.newVersion) + " (" +
-           formatBytes(each.bytes) + ")\n";
+    return "install  " + printable(each.identifier) + " " + printable(each.newVersion) + " " +
+           sizeText(each);
 }
 
 std::string updateLine(const PlannedInstall& each) {
     return "update   " + printable(each.identifier) + " " + printable(each.oldVersion) + " -> " +
-           printable(each.newVersion) + " (" + formatBytes(each.bytes) + ")\n";
+           printable(each.newVersion) + " " + sizeText(each);
+}
+
+std::size_t packagesToSend(const SyncPlan& plan) {
+    const auto travels = [](const PlannedInstall& each) { return !each.hasArrived; };
+    return static_cast<std::size_t>(
+        std::count_if(plan.install.begin(), plan.install.end(), travels) +
+        std::count_if(plan.update.begin(), plan.update.end(), travels));
 }
 
 bool isInStep(const SyncPlan& plan) {
@@ -40,7 +51,7 @@ std::string planText(const SyncPlan& plan, const SpaceCheck& space) {
     if (plan.empty()) {
         return text + (isInStep(plan) ? "Nothing to do: all is in step.\n" : "Nothing to do.\n");
     }
-    return text + counted(plan.install.size() + plan.update.size(), "package") + " to send, " +
+    return text + counted(packagesToSend(plan), "package") + " to send, " +
            formatBytes(plan.bytes()) + "; needed " + formatBytes(space.needed) + ", free " +
            formatBytes(space.free) + (space.fits() ? ": it fits\n" : ": it does not fit\n");
 }

@@ -71,7 +71,7 @@ SessionEnd Session::sync(const Order& order) {
     end_.isDisabled =
         !owns(client_, kDataclass) || (disabled && disabled->contains(std::string(kDataclass)));
     if (end_.isDisabled) return end_;
-    watch_.takeUpDelivered();
+    takeUpDelivered(order);
     const std::vector<std::string> known =
         order.takesInventory ? std::vector<std::string>() : readLastSyncState(device_);
     if (!reconcile()) return end(false, {});
@@ -84,6 +84,15 @@ SessionEnd Session::sync(const Order& order) {
     }
     transferAll(assets, order.packages);
     return end(!stopRequested_, known);
+}
+
+// What an interrupted session has delivered, except where this one begins anew.
+void Session::takeUpDelivered(const Order& order) {
+    for (const std::string& identifier : device_.coordinatedInstallsUnderWay()) {
+        if (order.sends(identifier)) continue;
+        watch_.takeUpDelivered(identifier);
+        takenUp_.insert(identifier);
+    }
 }
 
 // Ends when every removal has, also those that the plug-in does not wait for: an application that
@@ -136,7 +145,7 @@ Result<std::string> Session::packageOf(const SyncAsset& asset, const PackageSour
 }
 
 void Session::transfer(const SyncAssetPointer& asset, const PackageSource& packages) {
-    if (transfers_.isCancelled()) return reportFailure(asset, cancelledByDevice());
+    if (isCancelled(asset->identifier)) return reportFailure(asset, cancelledByDevice());
     Result<std::string> file = packageOf(*asset, packages);
     if (file) {
         send({asset, *std::move(file), std::string(kPublicStaging), asset->identifier + ".zip"});
@@ -163,7 +172,7 @@ void Session::send(const Parcel& parcel) {
         events_.report(event);
         asset->downloadProgress = static_cast<double>(done) / static_cast<double>(total);
         client_.assetTransferUpdatedProgress(asset, asset->downloadProgress);
-        return !stopRequested_ && !transfers_.isCancelled();
+        return !stopRequested_ && !isCancelled(asset->identifier);
     };
     const Result<std::uint64_t> sent =
         sender_.send(parcel.file, parcel.directory, parcel.name, progress);
@@ -176,6 +185,17 @@ void Session::send(const Parcel& parcel) {
     if (!parcel.keepsPath) asset->path = parcel.name;
     if (watch_.isCoordinated()) watch_.packageDelivered(asset->identifier);
     client_.assetTransferSucceeded(asset, true, nullptr);
+}
+
+// A cancel may be of an earlier coordinator of the same application, of which the device tells
+// late.
+bool Session::isCancelled(const std::string& identifier) {
+    if (!transfers_.isCancelled()) return false;
+    const Result<ApplicationStatus> status = device_.status(identifier);
+    const bool stands =
+        status && status->coordinator && status->coordinator->client == SyncClientID;
+    if (stands) transfers_.dismissCancel();
+    return !stands;
 }
 
 // A transfer that stops may do so because the device wants it no more.
@@ -196,8 +216,13 @@ void Session::reportFailure(const SyncAssetPointer& asset, const ErrorRecord& er
 const SessionEnd& Session::end(bool transfersSucceeded, const std::vector<std::string>& known) {
     client_.assetTransferEndedWithSuccess(transfersSucceeded);
     if (watch_.isCoordinated()) {
-        cancelGivenUp();
+        cancelWhere([this](const CoordinatorRecord& each) {
+            return std::find(givenUp_.begin(), givenUp_.end(), each.identifier) != givenUp_.end();
+        });
         awaitCoordinatedInstalls();
+        cancelWhere([this](const CoordinatorRecord& each) {
+            return takenUp_.contains(each.identifier) && !each.isComplete;
+        });
     }
     end_.isInterrupted = stopRequested_;
     const bool isSuccess = end_.isSuccess();
@@ -208,17 +233,21 @@ const SessionEnd& Session::end(bool transfersSucceeded, const std::vector<std::s
     return end_;
 }
 
-// The plug-in looks for something on the device before it cancels the coordinator of a package that
-// does not come; the placeholder may have come to stand there after it looked.
-void Session::cancelGivenUp() {
-    if (givenUp_.empty()) return;
-    const std::set<std::string> givenUp(givenUp_.begin(), givenUp_.end());
+// Cancels coordinators of the sync client to which no package will come in this session:
+//
+// - The plug-in looks for something on the device before it cancels the coordinator of a package
+//   that does not come; the placeholder may have come to stand there after it looked.
+// - It may see the placeholder of an install that was taken up in its last moment, and prepare
+//   another coordinator for it.
+void Session::cancelWhere(const std::function<bool(const CoordinatorRecord&)>& isToGo) {
+    if (givenUp_.empty() && takenUp_.empty()) return;
     const Result<std::vector<CoordinatorRecord>> coordinators = device_.coordinators();
     if (!coordinators) return;  // the session's end finds the same failure
     StandingInstalls standing;
     for (const CoordinatorRecord& each : *coordinators) {
-        const bool isOurs = each.client == SyncClientID && givenUp.contains(each.identifier);
-        if (isOurs) standing.obsolete.push_back(each.identifier);
+        if (each.client == SyncClientID && isToGo(each)) {
+            standing.obsolete.push_back(each.identifier);
+        }
     }
     const Status cancelled = cancelObsolete(device_, standing);
     if (!cancelled && !end_.error) end_.error = cancelled.error();

@@ -5,6 +5,7 @@
 #include <functional>
 #include <memory>
 #include <optional>
+#include <set>
 #include <string>
 #include <vector>
 
@@ -17,6 +18,7 @@ namespace appsync {
 
 class Device;
 class PlugIn;
+struct CoordinatorRecord;
 class SessionFacts;
 class SessionWatch;
 class SyncClient;
@@ -72,7 +74,9 @@ class Session {
     [[nodiscard]] SessionEnd deliver(const Parcel& parcel);
 
   private:
+    void takeUpDelivered(const Order& order);
     [[nodiscard]] bool reconcile();
+    [[nodiscard]] bool isCancelled(const std::string& identifier);
     void transferAll(const std::vector<SyncAssetPointer>& assets, const PackageSource& packages);
     void transfer(const SyncAssetPointer& asset, const PackageSource& packages);
     Result<std::string> packageOf(const SyncAsset& asset, const PackageSource& packages);
@@ -80,7 +84,7 @@ class Session {
     [[nodiscard]] ErrorRecord causeOf(const ErrorRecord& error) const;
     void reportFailure(const SyncAssetPointer& asset, const ErrorRecord& error);
     void awaitCoordinatedInstalls();
-    void cancelGivenUp();
+    void cancelWhere(const std::function<bool(const CoordinatorRecord&)>& isToGo);
     // `known`: the applications that the last session saw, where this one does not look.
     const SessionEnd& end(bool transfersSucceeded, const std::vector<std::string>& known);
 
@@ -94,6 +98,7 @@ class Session {
     const std::atomic<bool>& stopRequested_;
     PackageSender sender_;
     std::vector<std::string> givenUp_;  // whose transfers have failed for good
+    std::set<std::string> takenUp_;     // whose packages an earlier session has delivered
     SessionEnd end_;
 };
 

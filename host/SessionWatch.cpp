@@ -16,7 +16,7 @@ namespace {
 
 constexpr std::chrono::milliseconds kPollInterval{100};
 // Denials are looked for in the device's database, so less often.
-constexpr int kPollsForDenials = 5;
+constexpr int kPollsForDenials = 2;
 constexpr std::chrono::seconds kUsualRetryInterval{30};
 
 std::string identifierOf(const PropertyList& options) {
@@ -225,15 +225,13 @@ void SessionWatch::packageDelivered(const std::string& identifier) {
     installBegins(identifier);
 }
 
-void SessionWatch::takeUpDelivered() {
-    for (const std::string& identifier : device_.coordinatedInstallsUnderWay()) {
-        const std::uint64_t size = sizeOf(identifier);
-        const std::lock_guard guard(mutex_);
-        if (concluded_.contains(identifier)) continue;  // meanwhile
-        if (!delivered_.try_emplace(identifier).second) continue;
-        installing_[identifier] = size;
-        reportBegin(identifier, size);  // before anything else is told of it
-    }
+void SessionWatch::takeUpDelivered(const std::string& identifier) {
+    const std::uint64_t size = sizeOf(identifier);
+    const std::lock_guard guard(mutex_);
+    if (concluded_.contains(identifier)) return;  // meanwhile
+    if (!delivered_.try_emplace(identifier).second) return;
+    installing_[identifier] = size;
+    reportBegin(identifier, size);  // before anything else is told of it
 }
 
 void SessionWatch::coordinatorRefused(const std::string& identifier, const ErrorRecord& error) {

@@ -58,8 +58,8 @@ class SessionWatch {
     [[nodiscard]] bool isCoordinated() const { return isCoordinated_; }
     /// The package of an application is the coordination service's to install from now on.
     void packageDelivered(const std::string& identifier);
-    /// The same for those whose packages an earlier session has delivered.
-    void takeUpDelivered();
+    /// The same for one whose package an earlier session has delivered.
+    void takeUpDelivered(const std::string& identifier);
     /// Waits until the uninstalls that the client has handed to the coordination service have
     /// ended, or a stop is requested.
     void waitForUninstalls(const std::atomic<bool>& stopRequested);

@@ -39,6 +39,11 @@ bool TransferQueue::isCancelled() const {
     return cancelled_.contains(current_);
 }
 
+void TransferQueue::dismissCancel() {
+    const std::lock_guard guard(mutex_);
+    cancelled_.erase(current_);
+}
+
 void TransferQueue::cancelTransferForFailedAsset(const SyncAsset& asset) {
     const std::lock_guard guard(mutex_);
     cancelled_.insert(asset.identifier);

@@ -27,8 +27,10 @@ class TransferQueue : public TransferService {
     [[nodiscard]] SyncAssetPointer next();
     /// What `next` gave last is no longer under way.
     void finish();
-    /// Whether the device wants no more of the asset that is under way.
+    /// Whether the device has cancelled the asset that is under way.
     [[nodiscard]] bool isCancelled() const;
+    /// That cancel was of something else: the asset under way goes on.
+    void dismissCancel();
 
     // From the device.
 

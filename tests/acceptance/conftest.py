@@ -91,6 +91,10 @@ def coordination(request):
     return request.param
 
 
+# For what is the same on both paths, and takes long.
+ON_ONE_PATH = pytest.mark.parametrize("coordination", ["off"], indirect=True)
+
+
 @pytest.fixture
 def device(appsync, tmp_path, coordination):
     return Device(appsync, tmp_path / "device", coordination)

@@ -189,6 +189,18 @@ def test_an_update_that_waits_goes_on_in_the_next_session(appsync, device, libra
     assert device.placeholders() == [] and coordinators(device) == {}
 
 
+def test_an_update_that_still_waits_is_not_asked_for_again(appsync, device, library, waiting_update):
+    waiting_update.kill()
+    waiting_update.communicate()
+    sync = appsync.start("sync", device.path, library, "--json")
+    wait_until(lambda: waits_for(appsync, device, A) == "termination")
+    appsync("quit", device.path, A)
+    result = json.loads(sync.communicate(timeout=60)[0])
+    assert sync.returncode == 0
+    assert result["requested"] == [] and result["updated"] == [A] and result["bytes"] == 0
+    assert device.placeholders() == [] and coordinators(device) == {}
+
+
 def test_a_library_that_has_changed_meanwhile_counts(appsync, device, library, waiting_update):
     waiting_update.kill()
     waiting_update.communicate()

@@ -6,7 +6,7 @@ import plistlib
 import pytest
 
 import packages
-from conftest import names_of
+from conftest import ON_ONE_PATH, names_of
 from staging import AREA, install, remove, stage
 
 A, B = "com.example.app00", "com.example.app01"
@@ -115,6 +115,7 @@ def test_remove_and_install_of_one_identifier(device, library):
     assert device.versions()[A] == "2.0"
 
 
+@ON_ONE_PATH
 def test_two_hundred_thousand_entries_that_ask_for_nothing(device, library):
     todo = [{"identifier": "com.example.x%06d" % n, "operation": "INSTALLED"} for n in range(200_000)]
     stage(device, plistlib.dumps(todo + [install(A)], fmt=plistlib.FMT_BINARY), side_files=[A])
@@ -122,6 +123,7 @@ def test_two_hundred_thousand_entries_that_ask_for_nothing(device, library):
     assert sorted(device.apps()) == [A]
 
 
+@ON_ONE_PATH
 def test_two_hundred_thousand_installs_are_refused_and_stay(device, library):
     device.sync(library)
     todo = [install("com.example.x%06d" % n) for n in range(200_000)]

@@ -85,6 +85,13 @@ TEST_F(TransferQueueTest, TheTransferUnderWayIsCancelledAtOnce) {
     EXPECT_TRUE(queue.isCancelled());
 }
 
+TEST_F(TransferQueueTest, ADismissedCancelIsForgotten) {
+    queue.cancelTransferForFailedAsset(*asset("com.a"));
+    EXPECT_EQ(next(), "com.a");
+    queue.dismissCancel();
+    EXPECT_FALSE(queue.isCancelled());
+}
+
 TEST_F(TransferQueueTest, CancellingWhatIsNotUnderWayIsNoFailure) {
     queue.cancelTransferForFailedAsset(*asset("com.other"));
     EXPECT_EQ(next(), "com.a");
