@@ -1,4 +1,5 @@
 #include <benchmark/benchmark.h>
+#include <fcntl.h>
 #include <unistd.h>
 
 #include <array>
@@ -12,18 +13,24 @@
 #include <stdexcept>
 #include <string>
 #include <thread>
+#include <utility>
 #include <vector>
 
+#include "client/AppsClient.h"
+#include "client/Paths.h"
 #include "device/Containers.h"
 #include "device/Database.h"
 #include "device/Device.h"
 #include "device/DevicePaths.h"
 #include "device/PackageWriter.h"
 #include "platform/AppRegistry.h"
+#include "platform/LogFacility.h"
+#include "platform/SyncHost.h"
 #include "system/PropertyListCodec.h"
 
 // What a device costs: one install on an empty and on a full device, the opening of a session, and
-// many installs at once. Run it with --benchmark_enable_random_interleaving=true to compare.
+// many installs at once, and a restore beside the plain writing of the files that it leaves. Run it
+// with --benchmark_enable_random_interleaving=true to compare.
 
 namespace appsync {
 namespace {
@@ -77,6 +84,8 @@ class Bench {
     std::string root(std::string_view devicePath) const {
         return path("device/root") + std::string(devicePath);
     }
+
+    Device& device() { return *device_; }
 
     void open() { device_ = require(Device::open(path("device"), {DeviceAccess::Session})); }
     void close() { device_.reset(); }
@@ -199,6 +208,104 @@ BENCHMARK(installMany)
     ->MeasureProcessCPUTime()
     ->UseManualTime()
     ->Unit(benchmark::kMillisecond);
+
+class QuietHost final : public SyncHost {
+  public:
+    [[nodiscard]] std::string mainBundleIdentifier() const override { return "bench"; }
+    [[nodiscard]] std::string pluginBundleIdentifier() const override { return "bench"; }
+    [[nodiscard]] bool isRecoverableError(const ErrorRecord&) const override { return false; }
+};
+
+class NoLog final : public LogFacility {
+  public:
+    void write(const LogMessage&) noexcept override {}
+    [[nodiscard]] std::unique_ptr<LogHandle> makeHandle(std::string_view,
+                                                        std::string_view) override {
+        return std::make_unique<LogHandle>();
+    }
+};
+
+/// What a restore leaves to be read: so many applications, each with an icon of 4 KB.
+void leaveRestoreInfo(Bench& bench, std::int64_t count) {
+    SystemPropertyLists propertyLists;
+    const Bytes metadata = require(propertyLists.serialize(
+        PropertyList::map({{"title", "Application"}, {"bundleVersion", "1.0"}}),
+        PropertyListFormat::Binary));
+    const PropertyList app = PropertyList::map({{"VessikMetadata", metadata},
+                                                {"ApplicationSINF", Bytes(1000)},
+                                                {"PlaceholderIcon", Bytes(4000)}});
+    PropertyList info = PropertyList::map();
+    for (std::int64_t number = 0; number < count; ++number) {
+        info.set("com.example.restored" + std::to_string(number), app);
+    }
+    const Bytes bytes = require(propertyLists.serialize(info, PropertyListFormat::Binary));
+    const std::string path(kRestoreInfoPath);
+    FileSystem& files = bench.device().files();
+    for (const std::string_view each : {kRestoreInfoPath, kProcessedRestoreInfoPath}) {
+        require(files.createDirectory(std::string(each.substr(0, each.rfind('/'))), true, nullptr));
+    }
+    require(files.writeFileAtomically(path, bytes));
+}
+
+/// So many applications, from the host's call to its return.
+void restoreDirectly(benchmark::State& state) {
+    QuietHost host;
+    NoLog log;
+    for ([[maybe_unused]] auto _ : state) {
+        Bench bench;
+        bench.open();
+        leaveRestoreInfo(bench, state.range(0));
+        const auto client = AppsClient::create(bench.device().platform(host, log));
+        state.SetIterationTime(secondsOf([&] { client->reconcileRestoreOfType(2, nullptr); }));
+        if (require(bench.device().applications()).size() !=
+            static_cast<std::size_t>(state.range(0))) {
+            state.SkipWithError("not all restored");
+        }
+    }
+}
+BENCHMARK(restoreDirectly)->Arg(1000)->UseManualTime()->Unit(benchmark::kMillisecond);
+
+std::string bytesOf(const fs::path& path) {
+    std::ifstream file(path, std::ios::binary);
+    return {std::istreambuf_iterator<char>(file), {}};
+}
+
+void writePlainly(const fs::path& path, const std::string& bytes) {
+    const std::string temporary = path.string() + ".new";
+    const int file = ::open(temporary.c_str(), O_WRONLY | O_CREAT | O_TRUNC | O_CLOEXEC, 0644);
+    const bool written = ::write(file, bytes.data(), bytes.size()) >= 0 && ::fsync(file) == 0;
+    ::close(file);
+    if (!written) throw std::runtime_error("cannot write " + temporary);
+    fs::rename(temporary, path);
+}
+
+/// The files of the same restore, those of the placeholder bundles and the device's copies of them,
+/// each written, synced and renamed by itself.
+void restorePlainFiles(benchmark::State& state) {
+    QuietHost host;
+    NoLog log;
+    Bench bench;
+    bench.open();
+    leaveRestoreInfo(bench, state.range(0));
+    AppsClient::create(bench.device().platform(host, log))->reconcileRestoreOfType(2, nullptr);
+    std::vector<std::pair<fs::path, std::string>> files;
+    for (const char* tree : {"/tmp", "/private/var/tmp", "/var"}) {
+        const fs::path root = bench.root(tree);
+        if (!fs::is_directory(root)) continue;
+        for (const auto& entry : fs::recursive_directory_iterator(root)) {
+            if (!entry.is_regular_file() || entry.path().filename() == "RestoreApplications.plist")
+                continue;
+            files.emplace_back(entry.path(), bytesOf(entry.path()));
+        }
+    }
+    for ([[maybe_unused]] auto _ : state) {
+        state.SetIterationTime(secondsOf([&] {
+            for (const auto& [path, bytes] : files) writePlainly(path, bytes);
+        }));
+    }
+    state.counters["files"] = static_cast<double>(files.size());
+}
+BENCHMARK(restorePlainFiles)->Arg(1000)->UseManualTime()->Unit(benchmark::kMillisecond);
 
 }  // namespace
 }  // namespace appsync

@@ -1,12 +1,13 @@
-// What planning costs for each application, directly and with a coordinator prepared for each, and
-// what one edit of the todo list costs beside a plain rewrite of the same bytes. Files are written
-// to the working directory: it should be on a disk.
+// What planning costs for each application, directly and with a coordinator prepared for each, what
+// restoring costs, and what one edit of the todo list costs beside a plain rewrite of the same
+// bytes. Files are written to the working directory: it should be on a disk.
 //
-// Names: planning/N and coordinating/N (one call with N applications), todoListEdit,
-// todoListPlainRewrite.
+// Names: planning/N, coordinating/N, restoring/N, restoringCoordinated/N (one call with N
+// applications), todoListEdit, todoListPlainRewrite.
 
 #include <benchmark/benchmark.h>
 #include <fcntl.h>
+#include <malloc.h>
 #include <unistd.h>
 
 #include <cstdlib>
@@ -80,6 +81,55 @@ BENCHMARK(planning)->Arg(1000)->Arg(10000)->Unit(benchmark::kMillisecond);
 
 void coordinating(benchmark::State& state) { plan(state, true); }
 BENCHMARK(coordinating)->Arg(1000)->Arg(10000)->Unit(benchmark::kMillisecond);
+
+/// What a restore has left: for each application store metadata, SINF data and an icon.
+void leaveRestoreInfo(SimulatedPlatform& platform, int count) {
+    constexpr std::size_t sinfSize = 1000;
+    constexpr std::size_t iconSize = 4000;
+    const Bytes metadata = *SystemPropertyLists().serialize(
+        PropertyList::map({{"title", "Application"}, {"bundleVersion", "1.0"}, {"itemId", 12345}}),
+        PropertyListFormat::Binary);
+    const PropertyList info = PropertyList::map({{"VessikMetadata", metadata},
+                                                 {"ApplicationSINF", Bytes(sinfSize)},
+                                                 {"PlaceholderIcon", Bytes(iconSize)}});
+    PropertyList all = PropertyList::map(static_cast<std::size_t>(count));
+    for (int i = 0; i < count; ++i) all.set(identifierOf(i), info);
+    platform.addPropertyList(std::string(kRestoreInfoPath), all, PropertyListFormat::Binary);
+    platform.files.addDirectory("/var/mobile/Library/Logs/MediaServices");
+}
+
+void restore(benchmark::State& state, bool coordinated) {
+    const int count = static_cast<int>(state.range(0));
+    for (auto _ : state) {
+        state.PauseTiming();
+        // As in a daemon that has just started: else few applications would find all the memory
+        // that they need in the allocator's hands, and many would not.
+        ::malloc_trim(0);
+        SystemPropertyLists codec;
+        auto platform = std::make_unique<SimulatedPlatform>(codec);
+        platform->recorder.setEnabled(false);
+        platform->coordination.setEnabled(coordinated);
+        platform->host.setMainBundleIdentifier("bench");
+        leaveRestoreInfo(*platform, count);
+        auto client = AppsClient::create(platform->services());
+        state.ResumeTiming();
+        client->reconcileRestoreOfType(2, nullptr);
+        state.PauseTiming();
+        platform->runUntilIdle();
+        if (platform->registry.placeholderIdentifiers().size() != static_cast<std::size_t>(count))
+            state.SkipWithError("not all restored");
+        client.reset();
+        platform.reset();
+        state.ResumeTiming();
+    }
+    state.SetItemsProcessed(state.iterations() * count);
+}
+
+void restoring(benchmark::State& state) { restore(state, false); }
+BENCHMARK(restoring)->Arg(1000)->Arg(10000)->Unit(benchmark::kMillisecond);
+
+void restoringCoordinated(benchmark::State& state) { restore(state, true); }
+BENCHMARK(restoringCoordinated)->Arg(1000)->Arg(10000)->Unit(benchmark::kMillisecond);
 
 /// A directory of its own under the working directory, gone at the end.
 class ScratchDirectory {

@@ -24,6 +24,8 @@ namespace appsync {
 class AppInstallObserver;
 class BackupManager;
 class RestoreState;
+enum class CoordinatorKind;
+struct RestoredApp;
 struct TransferItem;
 
 /// The plug-in: the one object that the SyncHost sees, for the dataclass "Application".
@@ -249,6 +251,35 @@ class AppsClient final : public SyncClient,
     /// coordinator of the plug-in's. Any thread.
     void setupInstallCoordinatorObserver();
 
+    // coordination/CoordinatedRestore.cpp: `AppInstallUsingCoordination`, an application that a
+    // backup brings back.
+
+    /// `prepareAppForRestoreUsingCoordination:VessikMetadata:sinfData:iconData:demotionStatus:`:
+    /// sets up the application's restoring coordinator. Adds only what that lacks. `sinfData` and
+    /// `iconData` may be null; any demotion status but 0 is a demoted application's. False when it
+    /// cannot be restored; the coordinator is cancelled then.
+    bool prepareAppForRestoreUsingCoordination(const std::string& identifier,
+                                               const Bytes& vessikMetadata, const Bytes* sinfData,
+                                               const Bytes* iconData, std::uint64_t demotionStatus);
+    /// `_prepareDemotedAppForRestoreWithBundleId:VessikMetadata:sinfData:iconData:demotionStatus:`
+    bool _prepareDemotedAppForRestoreWithBundleId(const std::string& identifier,
+                                                  const Bytes& vessikMetadata,
+                                                  const Bytes* sinfData, const Bytes* iconData,
+                                                  std::uint64_t demotionStatus);
+    /// `_prepareNonDemotedAppForRestoreWithBundleId:VessikMetadata:sinfData:iconData:`: the app
+    /// store becomes responsible for the package.
+    bool _prepareNonDemotedAppForRestoreWithBundleId(const std::string& identifier,
+                                                     const Bytes& vessikMetadata,
+                                                     const Bytes* sinfData, const Bytes* iconData);
+    /// `_placeHolderForBundleIdentifier:withVessikMetadata:sinfData:iconData:demotionStatus:`: a
+    /// placeholder whose configuration is complete. `vessikMetadata` is a map. Null when it cannot
+    /// be made; what there is of it is cancelled then.
+    [[nodiscard]] std::shared_ptr<InstallPlaceholder>
+    _placeHolderForBundleIdentifierWithVessikMetadata(const std::string& identifier,
+                                                      const PropertyList& vessikMetadata,
+                                                      const Bytes* sinfData, const Bytes* iconData,
+                                                      std::uint64_t demotionStatus);
+
     // restore/PlaceholderBundles.cpp: placeholder applications.
 
     /// `placeholderAppPathForBundleIdentifier:`: creates nothing.
@@ -277,6 +308,26 @@ class AppsClient final : public SyncClient,
     void _enumeratePlaceholdersWithBlock(const AppRegistry::ProxyCallback& callback) const;
     /// `_getSystemAppPlaceholders`: the identifiers of system applications' placeholders.
     [[nodiscard]] std::set<std::string> _getSystemAppPlaceholders() const;
+
+    // restore/RestoreInfo.cpp: the applications that a backup brings back.
+
+    /// `reconcileRestoreOfType:withError:`: true and no error, whatever happens.
+    bool reconcileRestoreOfType(std::int64_t type, ErrorOut error) override;
+    /// `_processVessikRestoreInfo`: makes a placeholder for each application of the restore
+    /// information that has none, waits for those that are still to come, and moves the information
+    /// away. The outcome of the last application that was handed on; false also when the
+    /// information cannot be read.
+    bool _processVessikRestoreInfo();
+    /// `_processVessikRestoreInfoForApp:vessikMetaData:sinfData:iconData:`: builds and installs a
+    /// placeholder. `sinfData` and `iconData` may be null. True also when the metadata cannot be
+    /// parsed.
+    bool _processVessikRestoreInfoForApp(const std::string& identifier, const Bytes& vessikMetaData,
+                                         const Bytes* sinfData, const Bytes* iconData);
+    /// `_loadDemotedAppsPlist:withError:`: class operation. A map. Nothing when the file is missing
+    /// or empty (not logged), damaged or something else (logged).
+    [[nodiscard]] static std::optional<PropertyList> _loadDemotedAppsPlist(const Platform& platform,
+                                                                           std::string_view path,
+                                                                           ErrorOut error);
 
     // restore/RestoringPlaceholders.cpp: the book of the placeholders that a restore waits for. An
     // identifier is in the set exactly when the wait group holds one entry for it and the count
@@ -393,9 +444,41 @@ class AppsClient final : public SyncClient,
     void stopAwaitingPlaceholder(const std::string& identifier);
 
     // restore/PlaceholderBundles.cpp
-    void installPlaceholder(const SyncAsset& asset, const std::string& directory,
-                            const PropertyList& info);
+    void willCreatePlaceholder(const std::string& identifier, const PropertyList& info) const;
+    bool installPlaceholder(const std::string& directory, const PropertyList& info,
+                            const PropertyList& options);
+    void didFindPlaceholder(const std::string& identifier) const;
     void copyIcon(const SyncAsset& asset, const std::string& directory) const;
+
+    // restore/RestoreInfo.cpp
+    struct RestoreFacts;
+    [[nodiscard]] std::optional<PropertyList> readRestoreInfo() const;
+    bool restoreApps(const PropertyList& restoreInfo);
+    [[nodiscard]] RestoreFacts gatherRestoreFacts() const;
+    std::optional<bool> restoreApp(const std::string& identifier, const PropertyList& info,
+                                   const RestoreFacts& facts);
+    void waitForRestoringPlaceholders();
+    void putRestoreInfoAway() const;
+    [[nodiscard]] Result<PropertyList> parseVessikMetadata(const std::string& identifier,
+                                                           const Bytes& data,
+                                                           Level failureLevel) const;
+    bool installRestorePlaceholder(const RestoredApp& app, const PropertyList& metadata);
+    bool writeRestorePlaceholderInfo(const std::string& directory, const std::string& identifier,
+                                     const PropertyList& info);
+    void recordAppRestore(bool success, const std::string& identifier,
+                          std::string_view description);
+
+    // coordination/CoordinatedRestore.cpp
+    struct CoordinatedRestore;
+    bool beginRestore(CoordinatedRestore& restore, CoordinatorKind kind);
+    [[nodiscard]] bool isLeftToAppStore(const CoordinatedRestore& restore) const;
+    bool addRestorePromises(CoordinatedRestore& restore);
+    bool addUserDataPromise(CoordinatedRestore& restore);
+    bool addRestorePlaceholder(CoordinatedRestore& restore);
+    bool leaveToAppStore(CoordinatedRestore& restore);
+    void giveRestoreUp(const CoordinatedRestore& restore);
+    bool addRestoreIcon(const std::string& identifier, const std::string& path, std::uint64_t size,
+                        InstallPlaceholder& placeholder);
 
     // In the order in which they are set up. Only the thread of the SyncHost touches a member for
     // which nothing else is said.
@@ -414,9 +497,10 @@ class AppsClient final : public SyncClient,
     bool _finishedWaitingForPlaceHolderInstalls = false;     // only on _restoreQueue
     // Never changes once `create` has set it; the registry may ask a little earlier.
     std::atomic<bool> _useInstallCoordinator{false};
-    std::int64_t _restoringPlaceholderCount = 0;  // changed only on _restoreQueue
-    std::set<std::string> _updatingApps;          // only on _accessQueue
-    std::set<std::string> _userCancelledApps;     // only on _accessQueue
+    // Changed only on _restoreQueue; whoever waits reads it once without the queue.
+    std::atomic<std::int64_t> _restoringPlaceholderCount{0};
+    std::set<std::string> _updatingApps;       // only on _accessQueue
+    std::set<std::string> _userCancelledApps;  // only on _accessQueue
     std::optional<std::vector<std::string>> _uninstalledApps;
     std::shared_ptr<AppInstallObserver> _appInstallObserver;  // see isAppInstallObserverSetUp_
     std::atomic<std::uint32_t> _numAppInstallsAttempted{0};

@@ -29,6 +29,16 @@ inline constexpr std::string_view kRestoreStatePath =
 /// Where icons for the host are rendered; emptied by each `outstandingAssetTransfers`.
 inline constexpr std::string_view kIconDirectory = "/var/mobile/Library/ApplicationSync/Icons";
 
+/// What a restore from a backup has left: which applications to bring back.
+inline constexpr std::string_view kRestoreInfoPath =
+    "/var/mobile/Media/VessikRestore/RestoreApplications.plist";
+/// Where it goes once it has been looked at.
+inline constexpr std::string_view kProcessedRestoreInfoPath =
+    "/var/mobile/Library/Logs/MediaServices/RestoreApplications.plist";
+/// Which of them had been demoted; the backup service keeps it.
+inline constexpr std::string_view kDemotedAppsPath =
+    "/var/mobile/Library/Preferences/com.korvu.Bakvia.DemotedApps.plist";
+
 // Formats of paths, for `formatPath`.
 inline constexpr std::string_view kIconLayoutFormat = "%@/DeskoraIconState.plist";
 inline constexpr std::string_view kStoreMetadataFormat = "%@/VessikMetadata.plist";

@@ -1,5 +1,6 @@
 #include "client/PropertyListFile.h"
 
+#include <cstdint>
 #include <utility>
 
 #include "platform/FileSystem.h"
@@ -7,12 +8,26 @@
 
 namespace appsync {
 
+namespace {
+
+/// The code, in `kPropertyListErrorDomain`, of a property list that is not what it should be.
+constexpr std::int64_t kUnexpectedKind = 1;
+
+}  // namespace
+
+Result<PropertyList> parseMap(const Platform& platform, ByteView bytes) {
+    Result<PropertyList> value = platform.propertyLists.parse(bytes);
+    if (!value || value->isMap()) return value;
+    return ErrorRecord::make(kPropertyListErrorDomain, kUnexpectedKind,
+                             "the top level is not a map");
+}
+
 std::optional<PropertyList> readMapFile(const Platform& platform, const std::string& path) {
     const Result<Bytes> bytes = platform.files.readFile(path);
     if (!bytes) return std::nullopt;
-    Result<PropertyList> value = platform.propertyLists.parse(*bytes);
-    if (!value || !value->isMap()) return std::nullopt;
-    return *std::move(value);
+    Result<PropertyList> map = parseMap(platform, *bytes);
+    if (!map) return std::nullopt;
+    return *std::move(map);
 }
 
 Status writePropertyListFile(const Platform& platform, const std::string& path,

@@ -3,6 +3,7 @@
 #include <optional>
 #include <string>
 
+#include "platform/Bytes.h"
 #include "platform/PropertyList.h"
 #include "platform/PropertyListSerialization.h"
 #include "platform/Result.h"
@@ -10,6 +11,10 @@
 namespace appsync {
 
 struct Platform;
+
+/// The map that the bytes hold, either encoding. The reader's error, or one that says that they
+/// hold something else.
+[[nodiscard]] Result<PropertyList> parseMap(const Platform& platform, ByteView bytes);
 
 /// The map in a property-list file, either encoding. Nothing when the file is missing, cannot be
 /// read or parsed, or holds something else.

@@ -14,6 +14,7 @@
 #include "device/PackageReader.h"
 #include "device/ProgressBook.h"
 #include "device/RegistryTables.h"
+#include "device/RestoreData.h"
 #include "platform/FileURL.h"
 #include "system/PosixError.h"
 #include "system/RootDirectory.h"
@@ -125,9 +126,13 @@ Status installApplicationWith(const InstallContext& context, const std::string& 
                               const AlsoCommitted& alsoCommitted) {
     Result<PackageReader> reader = openPackage(context, identifier, package);
     if (!reader) return reader.error();
+    // Before the sync that the unpacked package goes through, which makes the data durable, too.
+    if (Status status = placeRestoredData(context, identifier); !status) return status;
     Result<NewContainer> container = unpackDurably(context, identifier, *reader);
     if (!container) return container.error();
-    return commitInstall(context, reader->info(), *container, installType, alsoCommitted);
+    Status status = commitInstall(context, reader->info(), *container, installType, alsoCommitted);
+    if (status) dropRestoredData(context, identifier);
+    return status;
 }
 
 Status installApplication(const InstallContext& context, const std::string& identifier,

@@ -9,6 +9,7 @@
 #include "device/InstallContext.h"
 #include "device/ProgressBook.h"
 #include "device/RegistryTables.h"
+#include "device/RestoreData.h"
 #include "device/WallClock.h"
 #include "system/RootedFileSystem.h"
 
@@ -116,7 +117,10 @@ Status removeBundles(const InstallContext& context, const std::string& identifie
         context.containers.remove(outcome.freed.placeholder);
     }
     if (outcome.removedApplication) context.containers.remove(outcome.freed.application);
-    if (outcome.dataGoes()) context.files.removeItem(dataDirectoryOf(identifier)).ignore();
+    if (outcome.dataGoes()) {
+        context.files.removeItem(dataDirectoryOf(identifier)).ignore();
+        dropRestoredData(context, identifier);
+    }
     return {};
 }
 

@@ -86,10 +86,11 @@ std::shared_ptr<AppInstallObserver> CoordinationHerald::observe(
 }
 
 void CoordinationHerald::tell(std::shared_ptr<LiveCoordinator> coordinator, Call call,
-                              std::function<void()> told) {
+                              std::function<void()> told, std::chrono::milliseconds delay) {
     const std::lock_guard lock(mutex_);
     if (closing_) return;
-    news_.push_back({std::move(coordinator), std::move(call), std::move(told)});
+    news_.push_back(
+        {std::move(coordinator), std::move(call), std::move(told), Clock::now() + delay});
     wakes_.notify_all();
     if (thread_.joinable()) return;
     try {
@@ -116,6 +117,12 @@ void CoordinationHerald::work() {
     while (true) {
         wakes_.wait(lock, [this] { return closing_ || !news_.empty(); });
         if (closing_) return;
+        const Clock::time_point notBefore = news_.front().notBefore;
+        if (wakes_.wait_until(lock, notBefore,
+                              [&] { return closing_ || Clock::now() >= notBefore; }) &&
+            closing_) {
+            return;
+        }
         {
             const News news = std::move(news_.front());
             news_.pop_front();

@@ -1,5 +1,6 @@
 #pragma once
 
+#include <chrono>
 #include <condition_variable>
 #include <deque>
 #include <functional>
@@ -35,19 +36,23 @@ class CoordinationHerald {
         std::weak_ptr<InstallCoordinatorObserver> delegate);
 
     /// Has the observers of the coordinator called; then, also when there are none, calls `told`.
+    /// News that has a delay is not told before, and holds up what comes after it.
     void tell(std::shared_ptr<LiveCoordinator> coordinator, Call call,
-              std::function<void()> told = {});
+              std::function<void()> told = {},
+              std::chrono::milliseconds delay = std::chrono::milliseconds(0));
 
     /// No call begins any more; waits for one that has begun. Not to be called by an observer.
     void close();
 
   private:
+    using Clock = std::chrono::steady_clock;
     class Registration;
     class Registrations;
     struct News {
         std::shared_ptr<LiveCoordinator> coordinator;
         Call call;
         std::function<void()> told;
+        Clock::time_point notBefore;
     };
 
     void work();

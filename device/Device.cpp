@@ -28,6 +28,7 @@
 #include "device/PlaceholderInstall.h"
 #include "device/ProgressBook.h"
 #include "device/Reconciliation.h"
+#include "device/RestoreData.h"
 #include "device/SessionLock.h"
 #include "system/PosixError.h"
 #include "system/PropertyListCodec.h"
@@ -221,6 +222,8 @@ Status Device::startCoordination() {
     return {};
 }
 
+void Device::closeCoordination() { state_->coordination.close(); }
+
 std::vector<std::string> Device::coordinatedInstallsUnderWay() {
     return state_->coordination.installsUnderWay();
 }
@@ -262,6 +265,31 @@ Status Device::demote(const std::string& identifier, DemotedBy by) {
 Status Device::setRestoreDataExpected(const std::string& identifier, bool expected) {
     if (Status status = requireLegalIdentifier(identifier); !status) return status;
     return state_->backup.setRestoreDataExpected(identifier, expected);
+}
+
+Status Device::expectRestoreData(const std::vector<std::string>& identifiers) {
+    for (const std::string& identifier : identifiers) {
+        if (Status status = requireLegalIdentifier(identifier); !status) return status;
+    }
+    return state_->backup.expectRestoreData(identifiers);
+}
+
+std::string Device::restoreDataPath(const std::string& identifier) {
+    return restoreArchiveOf(identifier);
+}
+
+std::string Device::dataPath(const std::string& identifier) { return dataDirectoryOf(identifier); }
+
+Result<std::map<std::string, Bytes>> Device::sinfData() {
+    std::map<std::string, Bytes> found;
+    const Status status = state_->database->read([&](Database& database) {
+        Query rows =
+            database.query("SELECT identifier, sinf FROM placeholders WHERE sinf IS NOT NULL");
+        while (rows.next()) found[rows.text(0)] = rows.blob(1);
+        return rows.status();
+    });
+    if (!status) return status.error();
+    return found;
 }
 
 Status Device::requireSession() const {

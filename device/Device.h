@@ -2,6 +2,7 @@
 
 #include <chrono>
 #include <cstdint>
+#include <map>
 #include <memory>
 #include <optional>
 #include <string>
@@ -9,6 +10,7 @@
 
 #include "device/DeviceRecords.h"
 #include "device/HomeScreenPicture.h"
+#include "platform/Bytes.h"
 #include "platform/Platform.h"
 #include "platform/Result.h"
 
@@ -119,6 +121,8 @@ class Device {
     /// The coordination service begins to work, if it does not yet: what is complete is installed.
     /// A client that attaches to the service has the same effect. Only with DeviceAccess::Session.
     Status startCoordination();
+    /// It works no more, and calls no observer any more. Does not come back.
+    void closeCoordination();
     /// The applications whose package the sync client has delivered to the service and whose
     /// install has not ended, observers included; ordered. Those that wait for a running
     /// application to end are among them: `status` tells of the denial.
@@ -147,6 +151,15 @@ class Device {
     /// Whether the backup service holds data to restore for the application: until the application
     /// is installed or its restore is given up.
     Status setRestoreDataExpected(const std::string& identifier, bool expected);
+    /// The same of many, all of them at once.
+    Status expectRestoreData(const std::vector<std::string>& identifiers);
+    /// The device path at which the backup service finds the data that a restore has left for an
+    /// application: an archive. It is unpacked, and goes, with the install of the application.
+    [[nodiscard]] static std::string restoreDataPath(const std::string& identifier);
+    /// The device path of an application's data.
+    [[nodiscard]] static std::string dataPath(const std::string& identifier);
+    /// The SINF data of placeholders that have any, by identifier.
+    [[nodiscard]] Result<std::map<std::string, Bytes>> sinfData();
 
   private:
     struct State;

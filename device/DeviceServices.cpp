@@ -154,6 +154,17 @@ Status DeviceBackup::setRestoreDataExpected(const std::string& identifier, bool 
     });
 }
 
+Status DeviceBackup::expectRestoreData(const std::vector<std::string>& identifiers) {
+    return database_.change(Durability::OnDisk, [&](Database& database) -> Status {
+        for (const std::string& identifier : identifiers) {
+            Query insert =
+                database.query("INSERT OR IGNORE INTO restore_data (identifier) VALUES (?)");
+            if (Status status = insert.bind(identifier).run(); !status) return status;
+        }
+        return {};
+    });
+}
+
 void DeviceHistory::initialize(const LogHandle& /*handle*/) {}
 
 void DeviceHistory::logStep(std::uint64_t kind, std::uint64_t party, std::uint64_t phase,

@@ -1,5 +1,8 @@
 #pragma once
 
+#include <string>
+#include <vector>
+
 #include "device/DeviceRecords.h"
 #include "platform/BackupService.h"
 #include "platform/DevicePolicyService.h"
@@ -50,6 +53,7 @@ class DeviceBackup final : public BackupService {
     [[nodiscard]] std::unique_ptr<BackupManager> makeManager() override;
 
     Status setRestoreDataExpected(const std::string& identifier, bool expected);
+    Status expectRestoreData(const std::vector<std::string>& identifiers);
 
   private:
     DeviceDatabase& database_;

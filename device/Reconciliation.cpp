@@ -14,6 +14,7 @@
 #include "device/InstallContext.h"
 #include "device/PackageIdentifier.h"
 #include "device/RegistryTables.h"
+#include "device/RestoreData.h"
 #include "device/WallClock.h"
 #include "platform/InstallProgressRecord.h"
 #include "system/RootDirectory.h"
@@ -196,6 +197,28 @@ void clearPackages(const InstallContext& context) {
     }
 }
 
+// Data that was restored with an install is not restored again with the next one. What is no whole
+// archive was cut off.
+void clearRestoredData(const InstallContext& context) {
+    for (const std::string& name : namesAt(context, kRestoreDataDirectory)) {
+        if (!name.ends_with(kPackageSuffix)) {
+            context.files.removeItem(std::string(kRestoreDataDirectory) + "/" + name).ignore();
+            continue;
+        }
+        const std::string identifier = name.substr(0, name.size() - kPackageSuffix.size());
+        bool isInstalled = false;
+        context.database
+            .read([&](Database& database) -> Status {
+                const auto row = findBundle(database, BundleTable::Applications, identifier);
+                if (!row) return row.error();
+                isInstalled = row->has_value();
+                return {};
+            })
+            .ignore();
+        if (isInstalled) dropRestoredData(context, identifier);
+    }
+}
+
 void clearTemporaries(const InstallContext& context) {
     for (const std::string& name : namesAt(context, kTemporaryDirectory)) {
         context.files.removeItem(std::string(kTemporaryDirectory) + "/" + name).ignore();
@@ -215,6 +238,7 @@ Result<std::vector<std::string>> reconcileDevice(const InstallContext& context) 
     if (Status status = comparison.run(); !status) return status.error();
     if (Status status = reconcileCoordinators(context); !status) return status.error();
     clearPackages(context);
+    clearRestoredData(context);
     clearTemporaries(context);
     return comparison.takeNotes();
 }

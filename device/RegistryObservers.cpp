@@ -117,12 +117,12 @@ bool RegistryObservers::tellNext(std::unique_lock<std::mutex>& lock) {
     called_ = observer.get();
     lock.unlock();
     observer->applicationInstallsArePrioritized(lists_.prioritized, lists_.paused);
+    // Perhaps the last: its destructor may call `remove`. Whoever removes an observer may take away
+    // what that stands on, so the call ends only now.
+    observer.reset();
     lock.lock();
     called_ = nullptr;
     callEnded_.notify_all();
-    lock.unlock();
-    observer.reset();  // perhaps the last: its destructor may call `remove`
-    lock.lock();
     return true;
 }
 

@@ -47,6 +47,8 @@ class Commands {
         addLook();
         addLog();
         addCoordination();
+        addBackup();
+        addRestore();
         addPackage();
         addPropertyList();
     }
@@ -322,6 +324,50 @@ class Commands {
             });
         added.add_option("FOLDER", values->other, "the store's packages")->required();
         addJson(added, values);
+    }
+
+    struct BackupValues {
+        BackupArguments backup;
+        std::string checked;
+    };
+
+    void addBackup() {
+        const auto values = std::make_shared<BackupValues>();
+        CLI::App& added = command<BackupValues>(
+            app_, "backup", "Back a device up into a new folder, or check a backup", values,
+            [this](const BackupValues& parsed) { return backUp(parsed); });
+        CLI::Option* device =
+            added.add_option("DEVICE", values->backup.device, "the device's directory");
+        CLI::Option* backup = added.add_option("BACKUP", values->backup.backup,
+                                               "the folder to make; it may exist if it is empty");
+        added.add_option("--check", values->checked, "only check this backup")
+            ->type_name("BACKUP")
+            ->excludes(device)
+            ->excludes(backup);
+        added.add_flag("--json", values->backup.asJson, "print JSON");
+    }
+
+    int backUp(const BackupValues& values) {
+        if (!values.checked.empty()) {
+            return runBackupCheck(values.checked, values.backup.asJson, console_);
+        }
+        if (!values.backup.backup.empty()) return runBackup(values.backup, console_);
+        return console_.fail(wrongUsage("backup needs DEVICE and BACKUP, or --check BACKUP",
+                                        "see appsync backup --help"));
+    }
+
+    void addRestore() {
+        const auto values = std::make_shared<RestoreArguments>();
+        CLI::App& added = command<RestoreArguments>(
+            app_, "restore", "Bring the applications of a backup back as placeholders", values,
+            [this](const RestoreArguments& parsed) { return runRestore(parsed, console_); });
+        added.add_option("DEVICE", values->device, "the device's directory")->required();
+        added.add_option("BACKUP", values->backup, "the folder that backup made")->required();
+        added
+            .add_option("--type", values->type,
+                        "the kind of restore; 2 and 3 bring applications back (default 2)")
+            ->type_name("N");
+        added.add_flag("--json", values->asJson, "print JSON");
     }
 
     struct FileValues {

@@ -1,5 +1,6 @@
 #pragma once
 
+#include <cstdint>
 #include <optional>
 #include <string>
 #include <vector>
@@ -90,8 +91,32 @@ struct CoordinatorArguments {
     bool asJson = false;
 };
 [[nodiscard]] int runCoordinator(const CoordinatorArguments& arguments, const Console& console);
+
+// host/StoreCommand.cpp
+
 [[nodiscard]] int runStore(const std::string& device, const std::string& folder, bool asJson,
                            const Console& console);
+
+// host/BackupCommand.cpp
+
+struct BackupArguments {
+    std::string device;
+    std::string backup;
+    bool asJson = false;
+};
+[[nodiscard]] int runBackup(const BackupArguments& arguments, const Console& console);
+[[nodiscard]] int runBackupCheck(const std::string& backup, bool asJson, const Console& console);
+
+// host/RestoreCommand.cpp
+
+struct RestoreArguments {
+    std::string device;
+    std::string backup;
+    /// What the plug-in is told; 2 and 3 bring applications back.
+    std::int64_t type = 2;
+    bool asJson = false;
+};
+[[nodiscard]] int runRestore(const RestoreArguments& arguments, const Console& console);
 
 // host/FileCommands.cpp: packages and property lists of this machine.
 

@@ -1,6 +1,4 @@
-#include <filesystem>
 #include <ostream>
-#include <system_error>
 
 #include "device/PackageIdentifier.h"
 #include "host/Commands.h"
@@ -13,14 +11,6 @@
 
 namespace appsync {
 namespace {
-
-Status checkFolder(const std::string& folder) {
-    std::error_code code;
-    const std::filesystem::directory_iterator iterator(folder, code);
-    if (!code) return {};
-    return unusable("cannot read the folder " + folder + ": " + code.message(),
-                    "name a folder of packages");
-}
 
 Status checkArguments(const CoordinatorArguments& arguments) {
     const bool isList = arguments.action == "list";
@@ -99,17 +89,6 @@ int runCoordinator(const CoordinatorArguments& arguments, const Console& console
     const bool isCreated = arguments.action == "create";
     console.out << "client " << arguments.client << (isCreated ? " has created" : " has cancelled")
                 << " the coordinator of " << arguments.identifier << '\n';
-    return kExitDone;
-}
-
-int runStore(const std::string& device, const std::string& folder, bool asJson,
-             const Console& console) {
-    const Result<std::unique_ptr<Device>> opened = openDevice(device, DeviceAccess::Look);
-    if (!opened) return console.fail(opened.error());
-    const Status readable = checkFolder(folder);
-    if (!readable) return console.fail(readable.error());
-    console.out << (asJson ? "{\n  \"kept\": [],\n  \"failed\": []\n}\n"
-                           : "Nothing waits for the store.\n");
     return kExitDone;
 }
 

@@ -30,11 +30,17 @@ Platform watched(const Platform& platform, SessionWatch& watch) {
 
 }  // namespace
 
-PlugIn::PlugIn() = default;
+PlugIn::PlugIn(SyncDaemon::Process process) : daemon_(process) {}
 
 // The device may be in the middle of telling the client something.
 PlugIn::~PlugIn() {
-    if (watch_ != nullptr) watch_->closeCoordination();
+    if (watch_ != nullptr) {
+        watch_->closeCoordination();
+    } else {
+        device_->closeCoordination();
+    }
+    // Or else the client might go on the registry's thread, after what it stands on.
+    if (client_ != nullptr) registry_->removeObserver(client_.get());
 }
 
 Status PlugIn::openLog(Device& device) {
@@ -46,24 +52,39 @@ Status PlugIn::openLog(Device& device) {
     return {};
 }
 
-Result<std::unique_ptr<PlugIn>> PlugIn::load(Device& device) {
-    std::unique_ptr<PlugIn> plugIn(new PlugIn());
+Result<std::unique_ptr<PlugIn>> PlugIn::loadIn(SyncDaemon::Process process, Device& device) {
+    std::unique_ptr<PlugIn> plugIn(new PlugIn(process));
+    plugIn->device_ = &device;
     const Status status = plugIn->openLog(device);
     if (!status) return status.error();
-    plugIn->client_ = AppsClient::create(device.platform(plugIn->daemon_, *plugIn->log_));
+    plugIn->platform_ =
+        std::make_unique<const Platform>(device.platform(plugIn->daemon_, *plugIn->log_));
+    plugIn->registry_ = &plugIn->platform_->registry;
+    return plugIn;
+}
+
+Result<std::unique_ptr<PlugIn>> PlugIn::load(Device& device) {
+    Result<std::unique_ptr<PlugIn>> plugIn = loadIn(SyncDaemon::Process::Daemon, device);
+    if (plugIn) (*plugIn)->client_ = AppsClient::create((*plugIn)->platform());
+    return plugIn;
+}
+
+Result<std::unique_ptr<PlugIn>> PlugIn::loadForRestore(Device& device) {
+    Result<std::unique_ptr<PlugIn>> plugIn = loadIn(SyncDaemon::Process::Restore, device);
+    if (plugIn) (*plugIn)->client_ = AppsClient::create((*plugIn)->platform());
     return plugIn;
 }
 
 Result<std::unique_ptr<PlugIn>> PlugIn::load(Device& device, SyncEvents& events,
                                              SessionFacts& facts) {
-    std::unique_ptr<PlugIn> plugIn(new PlugIn());
-    const Status status = plugIn->openLog(device);
-    if (!status) return status.error();
-    const Platform platform = device.platform(plugIn->daemon_, *plugIn->log_);
-    plugIn->watch_ = std::make_unique<SessionWatch>(device, platform, events, facts);
-    plugIn->client_ = AppsClient::create(watched(platform, *plugIn->watch_));
-    platform.notificationCenter.post(kStartupNotification);
-    return plugIn;
+    Result<std::unique_ptr<PlugIn>> loaded = loadIn(SyncDaemon::Process::Daemon, device);
+    if (!loaded) return loaded;
+    PlugIn& plugIn = **loaded;
+    plugIn.watch_ = std::make_unique<SessionWatch>(device, plugIn.platform(), events, facts);
+    plugIn.registry_ = &plugIn.watch_->registry();
+    plugIn.client_ = AppsClient::create(watched(plugIn.platform(), *plugIn.watch_));
+    plugIn.platform().notificationCenter.post(kStartupNotification);
+    return loaded;
 }
 
 SyncClient& PlugIn::client() { return *client_; }

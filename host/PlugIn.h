@@ -3,10 +3,12 @@
 #include <memory>
 
 #include "host/SyncDaemon.h"
+#include "platform/Platform.h"
 #include "platform/Result.h"
 
 namespace appsync {
 
+class AppRegistry;
 class AppsClient;
 class Device;
 class JsonLogFacility;
@@ -24,9 +26,13 @@ class PlugIn {
     /// up, upon which it attaches to the coordination service. Events and facts must outlive it.
     [[nodiscard]] static Result<std::unique_ptr<PlugIn>> load(Device& device, SyncEvents& events,
                                                               SessionFacts& facts);
+    /// In the process that restores backups, which is not the sync daemon.
+    [[nodiscard]] static Result<std::unique_ptr<PlugIn>> loadForRestore(Device& device);
     ~PlugIn();
 
     [[nodiscard]] SyncClient& client();
+    /// The device's own services, as the plug-in has them.
+    [[nodiscard]] const Platform& platform() const { return *platform_; }
     /// Only of one that was loaded with a watch.
     [[nodiscard]] SessionWatch& watch() { return *watch_; }
     [[nodiscard]] const SyncHost& host() const { return daemon_; }
@@ -34,11 +40,16 @@ class PlugIn {
     [[nodiscard]] TransferQueue& transfers() { return daemon_.transfers(); }
 
   private:
-    PlugIn();
+    explicit PlugIn(SyncDaemon::Process process);
+    [[nodiscard]] static Result<std::unique_ptr<PlugIn>> loadIn(SyncDaemon::Process process,
+                                                                Device& device);
     Status openLog(Device& device);
 
     SyncDaemon daemon_;
+    Device* device_ = nullptr;
+    AppRegistry* registry_ = nullptr;  // the one that the client observes
     std::unique_ptr<JsonLogFacility> log_;
+    std::unique_ptr<const Platform> platform_;
     std::unique_ptr<SessionWatch> watch_;
     std::shared_ptr<AppsClient> client_;  // goes first
 };

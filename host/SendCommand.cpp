@@ -8,11 +8,13 @@
 #include <utility>
 
 #include "client/Paths.h"
+#include "device/DataArchive.h"
 #include "device/Device.h"
 #include "device/PackageIdentifier.h"
 #include "device/PackageReader.h"
 #include "host/Commands.h"
 #include "host/Console.h"
+#include "host/HostFile.h"
 #include "host/Interruption.h"
 #include "host/Library.h"
 #include "host/LibraryReader.h"
@@ -32,8 +34,6 @@ namespace appsync {
 namespace {
 
 using Clock = std::chrono::steady_clock;
-
-constexpr std::string_view kApplicationData = "/var/mobile/Containers/Data";
 
 Status checkArguments(const SendArguments& arguments) {
     if (!isLegalIdentifier(arguments.identifier)) {
@@ -56,6 +56,13 @@ std::optional<std::string> waitingVersion(Device& device, const std::string& ide
     const PropertyList* versions = state->find(identifier);
     if (versions == nullptr || versions->entries().empty()) return std::nullopt;
     return versions->entries().back().key;
+}
+
+bool beginsAsArchive(const std::string& file) {
+    Result<HostFile> opened = HostFile::open(file);
+    Bytes begin(2);
+    const Result<std::size_t> count = opened ? opened->read(begin) : Result<std::size_t>(0);
+    return count && *count == 2 && begin[0] == 'P' && begin[1] == 'K';
 }
 
 class Sending {
@@ -208,9 +215,25 @@ class Sending {
         }
         makeAsset(*version);
         parcel_.keepsPath = true;  // the package's, which the plug-in has kept
-        parcel_.directory = std::string(kApplicationData) + "/" + arguments_.identifier;
-        parcel_.name = std::filesystem::path(arguments_.file).filename().string();
+        if (const Status placed = placeData(); !placed) return placed;
         return planInstall({arguments_.identifier, {}, {}, *version, 0, 0});
+    }
+
+    // An archive waits where the device unpacks it with the install; any other file is the data.
+    Status placeData() {
+        const std::filesystem::path archive = Device::restoreDataPath(arguments_.identifier);
+        const Status isArchive = checkDataArchive(arguments_.file);
+        if (isArchive) {
+            parcel_.directory = archive.parent_path().native();
+            parcel_.name = archive.filename().native();
+            return {};
+        }
+        if (beginsAsArchive(arguments_.file)) {
+            return failure(isArchive.error().description(), "send the archive of a whole backup");
+        }
+        parcel_.directory = Device::dataPath(arguments_.identifier);
+        parcel_.name = std::filesystem::path(arguments_.file).filename().string();
+        return {};
     }
 
     Status planInstall(PlannedInstall planned) {

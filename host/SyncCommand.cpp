@@ -118,7 +118,11 @@ class SyncRun {
         if (arguments_.isStaged) {
             planStaged(*present);
         } else {
-            plan_ = makePlan(library_, *present, arguments_.plan);
+            PlanOptions options = arguments_.plan;
+            const Result<DeviceSettings> settings = device_->settings();
+            if (!settings) return unusable(settings.error());
+            options.bringsOffloaded = settings->coordination;
+            plan_ = makePlan(library_, *present, options);
         }
         const Result<std::vector<CoordinatorRecord>> coordinators = device_->coordinators();
         if (!coordinators) return unusable(coordinators.error());

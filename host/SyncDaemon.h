@@ -25,7 +25,14 @@ enum TransferErrorCode : int {
 /// The sync daemon that loads the plug-in.
 class SyncDaemon : public SyncHost {
   public:
-    [[nodiscard]] std::string mainBundleIdentifier() const override { return "com.korvu.trd"; }
+    /// Which process loads the plug-in: the sync daemon, or the one that restores backups.
+    enum class Process { Daemon, Restore };
+
+    explicit SyncDaemon(Process process = Process::Daemon) : process_(process) {}
+
+    [[nodiscard]] std::string mainBundleIdentifier() const override {
+        return process_ == Process::Daemon ? "com.korvu.trd" : "com.korvu.bakvia";
+    }
     [[nodiscard]] std::string pluginBundleIdentifier() const override {
         return "com.korvu.trd.appsync";
     }
@@ -41,6 +48,7 @@ class SyncDaemon : public SyncHost {
     [[nodiscard]] TransferQueue& transfers() { return transfers_; }
 
   private:
+    const Process process_;
     TransferQueue transfers_;
 };
 

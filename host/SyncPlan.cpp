@@ -55,6 +55,10 @@ std::string whyNot(const Present& present) {
     if (isOffloaded(*present.placeholder)) {
         return "it is offloaded on the device: appsync send brings it back";
     }
+    if (present.placeholder->installType == kInstallTypeRestore) {
+        return "a restore brought it back, and its package is the store's to bring, or that of "
+               "appsync send --restore";
+    }
     return "another install of it is under way on the device";
 }
 
@@ -101,7 +105,11 @@ class Planner {
             return;
         }
         const Present& present = found->second;
-        if (present.isSystem() || present.placeholder != nullptr) {
+        const bool isAskedFor = options_.bringsOffloaded && !present.isSystem() &&
+                                present.placeholder != nullptr && isOffloaded(*present.placeholder);
+        if (isAskedFor) {
+            plan_.install.push_back(plannedInstall(package, {}));
+        } else if (present.isSystem() || present.placeholder != nullptr) {
             skip(package.identifier, whyNot(present), true);
         } else if (present.application->version.value_or("") != package.version) {
             plan_.update.push_back(

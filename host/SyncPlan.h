@@ -18,6 +18,9 @@ struct PlanOptions {
     std::vector<std::string> remove;
     /// Remove every user application that the library lacks.
     bool mirror = false;
+    /// Bring offloaded applications back: the plug-in asks for those where installs are
+    /// coordinated.
+    bool bringsOffloaded = false;
 };
 
 /// An application to bring to the device, or to bring up to date there.

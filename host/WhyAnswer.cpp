@@ -76,6 +76,10 @@ std::optional<AwaitedThing> awaitedOfPlaceholder(const ApplicationRecord& placeh
         case kInstallTypeIntentionalDowngrade:
             return awaited("store", "store",
                            "for its package, as it is offloaded: appsync send brings it back");
+        case kInstallTypeRestore:
+            return awaited("transfer", "host",
+                           "for its package, as a restore brought it back: send it (appsync send "
+                           "--restore)");
         default:
             return awaited("install", "store", "for an install of its package");
     }
@@ -103,8 +107,9 @@ std::optional<AwaitedThing> awaitedThing(const std::string& identifier,
         return thing;
     }
     if (status.awaitsRestoreData) {
-        return awaited("restore data", "host",
-                       "for its data: send it (appsync send --restore --parts 2)");
+        return awaited(
+            "restore data", "host",
+            "for its data: send it (appsync send --restore --parts 2) after its package");
     }
     if (isForbidden(status, settings)) return awaitedOfPolicy();
     if (status.coordinator) {

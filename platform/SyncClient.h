@@ -1,5 +1,6 @@
 #pragma once
 
+#include <cstdint>
 #include <functional>
 #include <optional>
 #include <set>
@@ -50,6 +51,10 @@ class SyncClient {
     /// staging area cannot be taken over.
     virtual bool reconcileSync(const PropertyList& request, const std::string& newAnchor,
                                const SyncProgressCallback& progressCallback, ErrorOut error) = 0;
+    /// `reconcileRestoreOfType:withError:`: the device has been restored from a backup. For types 2
+    /// and 3 every application of the backup becomes a placeholder; blocks until those are there,
+    /// at most 5 seconds for each. Always true, without an error.
+    virtual bool reconcileRestoreOfType(std::int64_t type, ErrorOut error) = 0;
     /// `syncEndedWithSuccess:`: the session is over.
     virtual void syncEndedWithSuccess(bool success) = 0;
 

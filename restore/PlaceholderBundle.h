@@ -8,11 +8,21 @@
 
 namespace appsync {
 
-/// The icon's name in a placeholder bundle.
+// The names of the files in a placeholder bundle.
 inline constexpr std::string_view kPlaceholderIconFile = "Icon.png";
+inline constexpr std::string_view kPlaceholderInfoFile = "Info.plist";
 
 /// Key of an info dictionary (boolean): the application may not be started.
 inline constexpr std::string_view kLaunchProhibitedKey = "RGApplicationLaunchProhibited";
+/// Another (boolean).
+inline constexpr std::string_view kPresselKey = "VKPresselApp";
+
+// What the transaction log says of placeholders. The scenario is that of a restored application;
+// the directory's failure counts as one of its steps whoever asked for the directory.
+inline constexpr std::string_view kAppRestoreScenario = "Vessik App Restore";
+inline constexpr std::string_view kPlaceholderDirectoryFailed = "Failed to create app directory";
+inline constexpr std::string_view kPlaceholderInstalled = "Installed placeholder";
+inline constexpr std::string_view kPlaceholderNotInstalled = "Failed to install placeholder";
 
 /// Whom a placeholder bundle and what is in it belong to.
 [[nodiscard]] inline FileAttributes placeholderFileAttributes() { return {"mobile", "mobile"}; }

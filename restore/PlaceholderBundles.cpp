@@ -14,15 +14,8 @@ namespace {
 // The directory, below that for temporary files, in which placeholder bundles are built.
 constexpr std::string_view kPlaceholderDirectory = "com.korvu.trd.Apps";
 constexpr std::string_view kBundleExtension = ".app";
-constexpr std::string_view kInfoFile = "Info.plist";
 
-constexpr std::string_view kPresselKey = "VKPresselApp";
-
-constexpr std::string_view kRestoreScenario = "Vessik App Restore";
-constexpr std::string_view kDirectoryFailed = "Failed to create app directory";
 constexpr std::string_view kPlaceholderScenario = "Install placeholder";
-constexpr std::string_view kPlaceholderInstalled = "Installed placeholder";
-constexpr std::string_view kPlaceholderFailed = "Failed to install placeholder";
 
 constexpr std::string_view kPngType = "public.png";
 
@@ -45,14 +38,17 @@ PropertyList placeholderInfo(const SyncAsset& asset, const PropertyList& assetIn
     return info;
 }
 
+PropertyList installOptions(const std::string& identifier) {
+    return PropertyList::map({{PackageTypeKey, PackageTypePlaceholder},
+                              {BundleIdentifierKey, identifier},
+                              {InstallTypeKey, std::uint64_t{kInstallTypeSync}}});
+}
+
 Status installDirectory(AppRegistry& registry, const std::string& directory,
-                        const std::string& identifier) {
+                        const PropertyList& options) {
     const auto url = FileURL::fromPath(directory, true);
     if (!url) return ErrorRecord{std::string(kPosixErrorDomain), kPosixInvalidArgument, {}};
-    return registry.installPlaceholderBundle(
-        *url, PropertyList::map({{PackageTypeKey, PackageTypePlaceholder},
-                                 {BundleIdentifierKey, identifier},
-                                 {InstallTypeKey, std::uint64_t{kInstallTypeSync}}}));
+    return registry.installPlaceholderBundle(*url, options);
 }
 
 /// The icon as a PNG image; nothing, and a message, when a step fails.
@@ -105,8 +101,8 @@ bool AppsClient::createPlaceHolderPath(const std::string& path, const std::strin
                                        const FileAttributes& attributes) {
     const Status created = platform_.files.createDirectory(path, true, &attributes);
     if (!created) {
-        platform_.transactions.logScenario(kRestoreScenario, 0, false, identifier,
-                                           kDirectoryFailed);
+        platform_.transactions.logScenario(kAppRestoreScenario, 0, false, identifier,
+                                           kPlaceholderDirectoryFailed);
     }
     log_(Level::Default,
          "%s|Created app directory for '%{public}@' at %{public}@ with err=%{public}@", identifier,
@@ -144,11 +140,15 @@ void AppsClient::_createPlaceHolderApplication(const SyncAsset& asset) {
     if (!createPlaceHolderPath(directory, asset.identifier, placeholderFileAttributes())) return;
     copyIcon(asset, directory);
     const PropertyList info = placeholderInfo(asset, assetInfo);
-    const Status written =
-        writePropertyListFile(platform_, formatPath(kInDirectoryFormat, {directory, kInfoFile}),
-                              info, PropertyListFormat::Xml);
+    const Status written = writePropertyListFile(
+        platform_, formatPath(kInDirectoryFormat, {directory, kPlaceholderInfoFile}), info,
+        PropertyListFormat::Xml);
     if (!written) return;
-    installPlaceholder(asset, directory, info);
+    willCreatePlaceholder(asset.identifier, info);
+    const bool installed = installPlaceholder(directory, info, installOptions(asset.identifier));
+    platform_.transactions.logScenario(
+        kPlaceholderScenario, 0, installed, asset.identifier,
+        installed ? kPlaceholderInstalled : kPlaceholderNotInstalled);
 }
 
 void AppsClient::copyIcon(const SyncAsset& asset, const std::string& directory) const {
@@ -162,25 +162,31 @@ void AppsClient::copyIcon(const SyncAsset& asset, const std::string& directory) 
          destination, copied.error());
 }
 
-void AppsClient::installPlaceholder(const SyncAsset& asset, const std::string& directory,
-                                    const PropertyList& info) {
+void AppsClient::willCreatePlaceholder(const std::string& identifier,
+                                       const PropertyList& info) const {
     log_(Level::Default, "%s|creating placeholder for '%{public}@'. info.plist=%{public}@",
-         asset.identifier, info);
-    const bool installed = installDirectory(platform_.registry, directory, asset.identifier).ok();
+         identifier, info);
+}
+
+bool AppsClient::installPlaceholder(const std::string& directory, const PropertyList& info,
+                                    const PropertyList& options) {
+    const bool installed = installDirectory(platform_.registry, directory, options).ok();
+    const std::string* title = info.findString(BundleDisplayNameKey);
+    const std::string* identifier = info.findString(BundleIdentifierKey);
+    const std::string* version = info.findString(BundleVersionKey);
     const PropertyList* isPressel = info.find(kPresselKey);
     if (installed) {
         log_(Level::Default,
              "%s|Installed Placeholder app from path %{public}@: %{public}@ [%{public}@ "
              "%{public}@] [isPressel: %{public}@]",
-             directory, asset.prettyName, asset.identifier, asset.version(), isPressel);
+             directory, title, identifier, version, isPressel);
     } else {
         log_(Level::Error,
              "%s|Placeholder app install failed from path %{public}@: %{public}@ [%{public}@ "
              "%{public}@] [isPressel: %{public}@]",
-             directory, asset.prettyName, asset.identifier, asset.version(), isPressel);
+             directory, title, identifier, version, isPressel);
     }
-    platform_.transactions.logScenario(kPlaceholderScenario, 0, installed, asset.identifier,
-                                       installed ? kPlaceholderInstalled : kPlaceholderFailed);
+    return installed;
 }
 
 bool AppsClient::_makeIconFromBundlePath(const Platform& platform,
@@ -199,14 +205,18 @@ bool AppsClient::_makeIconFromBundlePath(const Platform& platform,
 bool AppsClient::_placeholderExistsForApplication(const std::string& identifier) const {
     if (_useInstallCoordinator) return false;
     bool found = false;
-    platform_.registry.enumerateBundles(
-        AppRegistry::kUserBundles, [&](const AppProxy& proxy, bool& stop) {
-            if (proxy.applicationIdentifier != identifier) return;
-            found = true;
-            log_(Level::Default, "%s|Found placeholder for bundle %{public}@", identifier);
-            stop = true;
-        });
+    platform_.registry.enumerateBundles(AppRegistry::kUserBundles,
+                                        [&](const AppProxy& proxy, bool& stop) {
+                                            if (proxy.applicationIdentifier != identifier) return;
+                                            found = true;
+                                            didFindPlaceholder(identifier);
+                                            stop = true;
+                                        });
     return found;
+}
+
+void AppsClient::didFindPlaceholder(const std::string& identifier) const {
+    log_(Level::Default, "%s|Found placeholder for bundle %{public}@", identifier);
 }
 
 void AppsClient::_enumeratePlaceholdersWithBlock(const AppRegistry::ProxyCallback& callback) const {

@@ -11,7 +11,7 @@ void AppsClient::relocantSetPlaceHolderPromiseForRestoreAppBundle(const std::str
         log_(Level::Default,
              "%s|Relocant will wait for TS to install placeholder for %{public}@, "
              "_restoringPlaceholderCount %lld",
-             identifier, _restoringPlaceholderCount);
+             identifier, _restoringPlaceholderCount.load());
     });
 }
 
@@ -22,7 +22,7 @@ void AppsClient::relocantCancelledCoordinatorForRestoreAppBundle(const std::stri
         log_(Level::Default,
              "%s|Relocant cancelled coordinator for restoring app bundle %{public}@ "
              "_restoringPlaceholderCount %lld",
-             identifier, _restoringPlaceholderCount);
+             identifier, _restoringPlaceholderCount.load());
     });
 }
 
@@ -39,7 +39,7 @@ void AppsClient::tsDidInstallPlaceHolderForAppBundle(const std::string& identifi
         log_(Level::Default,
              "%s|TS finished installing placeholder for %{public}@, _restoringPlaceholderCount "
              "%lld",
-             identifier, _restoringPlaceholderCount);
+             identifier, _restoringPlaceholderCount.load());
     });
 }
 

@@ -1,4 +1,5 @@
 #include <cerrno>
+#include <chrono>
 
 #include "tests/client/AppsClientFixture.h"
 
@@ -40,8 +41,11 @@ TEST_F(BackupPreparation, ClearsTheMarkAndNothingElse) {
 TEST_F(BackupPreparation, LeavesAFileWithoutTheMarkUntouched) {
     platform_.addPropertyList(metadataPath(kA), PropertyList::map({{"is-auto-download", false}}));
     platform_.addPropertyList(metadataPath(kB), PropertyList::map({{"title", "B"}}));
+    const auto before = platform_.files.modificationTime(metadataPath(kA));
+    platform_.advance(std::chrono::seconds(1));
     client_->prepareForBackup();
     EXPECT_THAT(writes(), IsEmpty());
+    EXPECT_EQ(platform_.files.modificationTime(metadataPath(kA)), before);
 }
 
 TEST_F(BackupPreparation, TakesAnyValueThatReadsAsTrueForTheMark) {

@@ -1,0 +1,150 @@
+#include "device/ArchiveWriter.h"
+
+#include <fcntl.h>
+#include <sys/stat.h>
+#include <unistd.h>
+#include <zip.h>
+
+#include <cerrno>
+#include <memory>
+
+#include "device/PackageError.h"
+#include "device/PackageFolder.h"
+#include "system/PosixError.h"
+#include "system/UniqueFd.h"
+
+namespace appsync {
+
+namespace {
+
+/// Gives libzip the contents of a file, which is open only while it is packed, and refuses what
+/// became something else since it was listed.
+class FileSource {
+  public:
+    explicit FileSource(const PackageItem& item) : item_(item) { ::zip_error_init(&error_); }
+
+    /// A source that owns itself: libzip frees it.
+    static zip_source_t* create(const PackageItem& item, zip_error_t* error) {
+        auto source = std::make_unique<FileSource>(item);
+        zip_source_t* made = ::zip_source_function_create(&command, source.get(), error);
+        if (made != nullptr) static_cast<void>(source.release());
+        return made;
+    }
+
+  private:
+    static zip_int64_t command(void* self, void* data, zip_uint64_t length, zip_source_cmd_t what) {
+        auto* source = static_cast<FileSource*>(self);
+        switch (what) {
+            case ZIP_SOURCE_OPEN:
+                return source->open();
+            case ZIP_SOURCE_READ:
+                return source->read(data, length);
+            case ZIP_SOURCE_CLOSE:
+                source->descriptor_.reset();
+                return 0;
+            case ZIP_SOURCE_STAT:
+                return source->stat(data);
+            case ZIP_SOURCE_ERROR:
+                return ::zip_error_to_data(&source->error_, data, length);
+            case ZIP_SOURCE_FREE:
+                delete source;
+                return 0;
+            case ZIP_SOURCE_SUPPORTS:
+                return ::zip_source_make_command_bitmap(ZIP_SOURCE_OPEN, ZIP_SOURCE_READ,
+                                                        ZIP_SOURCE_CLOSE, ZIP_SOURCE_STAT,
+                                                        ZIP_SOURCE_ERROR, ZIP_SOURCE_FREE, -1);
+            default:
+                return source->fail(ZIP_ER_OPNOTSUPP, 0);
+        }
+    }
+
+    zip_int64_t open() {
+        constexpr int kFlags = O_RDONLY | O_NOFOLLOW | O_NONBLOCK | O_NOCTTY | O_CLOEXEC;
+        descriptor_.reset(::open(item_.path.c_str(), kFlags));
+        if (!descriptor_) return fail(ZIP_ER_OPEN, errno);
+        struct stat status = {};
+        if (::fstat(descriptor_.get(), &status) != 0) return fail(ZIP_ER_OPEN, errno);
+        return S_ISREG(status.st_mode) ? 0 : fail(ZIP_ER_OPEN, EINVAL);
+    }
+
+    zip_int64_t read(void* data, zip_uint64_t length) {
+        ssize_t count = -1;
+        do {
+            count = ::read(descriptor_.get(), data, length);
+        } while (count < 0 && errno == EINTR);
+        return count < 0 ? fail(ZIP_ER_READ, errno) : count;
+    }
+
+    zip_int64_t stat(void* data) const {
+        auto* status = static_cast<zip_stat_t*>(data);
+        ::zip_stat_init(status);
+        status->size = item_.size;
+        status->valid = ZIP_STAT_SIZE;
+        return static_cast<zip_int64_t>(sizeof *status);
+    }
+
+    zip_int64_t fail(int zipError, int errorNumber) {
+        ::zip_error_set(&error_, zipError, errorNumber);
+        return -1;
+    }
+
+    PackageItem item_;
+    UniqueFd descriptor_;
+    zip_error_t error_ = {};
+};
+
+struct ArchiveDiscarder {
+    void operator()(zip_t* archive) const noexcept { ::zip_discard(archive); }
+};
+using Archive = std::unique_ptr<zip_t, ArchiveDiscarder>;
+
+ErrorRecord archiveFailure(zip_error_t* error, const std::string& path) {
+    if (::zip_error_system_type(error) == ZIP_ET_SYS) {
+        return posixError(::zip_error_code_system(error), "pack", path,
+                          ::zip_error_strerror(error));
+    }
+    return cannotPack(PackageErrorCode::Inconsistent, path, ::zip_error_strerror(error));
+}
+
+Status addItem(zip_t* archive, const PackageItem& item) {
+    // The first day that an archive can hold: packages of the same files are the same.
+    constexpr zip_uint16_t kDosTime = 0;
+    constexpr zip_uint16_t kDosDate = (1U << 5U) | 1U;
+    zip_int64_t index = -1;
+    if (S_ISDIR(item.mode)) {
+        index = ::zip_dir_add(archive, item.entryName.c_str(), ZIP_FL_ENC_UTF_8);
+    } else if (zip_source_t* source = FileSource::create(item, ::zip_get_error(archive))) {
+        index = ::zip_file_add(archive, item.entryName.c_str(), source, ZIP_FL_ENC_UTF_8);
+        if (index < 0) ::zip_source_free(source);
+    }
+    const auto place = static_cast<zip_uint64_t>(index);
+    if (index < 0 || ::zip_file_set_dostime(archive, place, kDosTime, kDosDate, 0) != 0 ||
+        ::zip_file_set_external_attributes(archive, place, 0, ZIP_OPSYS_UNIX, item.mode << 16U) !=
+            0) {
+        return archiveFailure(::zip_get_error(archive), item.path);
+    }
+    return {};
+}
+
+}  // namespace
+
+Status writeArchive(const std::vector<PackageItem>& items, const std::string& path) {
+    zip_error_t error = {};
+    int code = 0;
+    Archive archive(::zip_open(path.c_str(), ZIP_CREATE | ZIP_TRUNCATE, &code));
+    if (!archive) {
+        ::zip_error_init_with_code(&error, code);
+        const ErrorRecord failure = archiveFailure(&error, path);
+        ::zip_error_fini(&error);
+        return failure;
+    }
+    for (const PackageItem& item : items) {
+        if (Status status = addItem(archive.get(), item); !status) return status;
+    }
+    if (::zip_close(archive.get()) != 0)
+        return archiveFailure(::zip_get_error(archive.get()), path);
+    static_cast<void>(archive.release());
+    return {};
+}
+
+}  // namespace appsync

@@ -1,0 +1,17 @@
+#pragma once
+
+#include <string>
+#include <vector>
+
+#include "platform/Result.h"
+
+namespace appsync {
+
+struct PackageItem;
+
+/// Writes the items, in their order, as an archive: the same, byte for byte, for the same names,
+/// contents and modes. Contents are packed in pieces. A file that becomes something else while it
+/// is packed is refused. Nothing is made durable. The one place that knows libzip's writer.
+[[nodiscard]] Status writeArchive(const std::vector<PackageItem>& items, const std::string& path);
+
+}  // namespace appsync

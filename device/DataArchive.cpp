@@ -1,0 +1,147 @@
+#include "device/DataArchive.h"
+
+#include <sys/stat.h>
+#include <sys/statvfs.h>
+
+#include <algorithm>
+#include <cerrno>
+#include <filesystem>
+#include <memory>
+#include <system_error>
+#include <utility>
+
+#include "device/ArchiveWriter.h"
+#include "device/PackageArchive.h"
+#include "device/PackageEntries.h"
+#include "device/PackageError.h"
+#include "device/PackageFile.h"
+#include "device/PackageFolder.h"
+#include "device/PackageLimits.h"
+#include "device/PackageUnpacker.h"
+#include "system/PosixError.h"
+#include "system/RootDirectory.h"
+
+namespace appsync {
+
+namespace {
+
+namespace fs = std::filesystem;
+
+// Data may be much, lie deep, and compress as well as it likes; what counts is the room for it.
+PackageLimits dataLimits() {
+    PackageLimits limits;
+    limits.entries = 1'000'000;
+    limits.unpackedBytes = std::uint64_t{1} << 44U;
+    limits.directoryBytes = std::uint64_t{256} << 20U;
+    limits.ratioFreeBytes = limits.unpackedBytes;
+    limits.nameBytes = 4096;
+    limits.components = 128;
+    return limits;
+}
+
+/// Collects what a directory holds. Everything is named from there.
+class DataListing {
+  public:
+    explicit DataListing(fs::path top) : top_(std::move(top)) {}
+
+    Status addContents(const std::string& prefix) {
+        std::error_code code;
+        fs::directory_iterator place(top_ / prefix, code);
+        for (; !code && place != fs::directory_iterator(); place.increment(code)) {
+            const std::string name = prefix + place->path().filename().native();
+            if (Status status = add(name); !status) return status;
+        }
+        if (code) return posixError(code.value(), "read", prefix.empty() ? "." : prefix);
+        return {};
+    }
+
+    std::vector<PackageItem> takeItems() {
+        std::sort(items_.begin(), items_.end(), [](const PackageItem& a, const PackageItem& b) {
+            return precedesInTree(a.entryName, b.entryName);
+        });
+        return std::move(items_);
+    }
+    std::vector<std::string> takeLeftOut() { return std::move(leftOut_); }
+
+  private:
+    Status add(std::string name) {
+        const std::string path = (top_ / name).native();
+        struct stat status = {};
+        if (::lstat(path.c_str(), &status) != 0) return posixError(errno, "examine", name);
+        const bool isDirectory = S_ISDIR(status.st_mode);
+        if (isDirectory) name += '/';
+        const auto size = isDirectory ? 0 : static_cast<std::uint64_t>(status.st_size);
+        const Result<PackageEntry> entry =
+            checkedEntry({.name = name, .mode = status.st_mode, .size = size}, limits_);
+        if (!entry) {
+            leftOut_.push_back(entry.error().description());
+            return {};
+        }
+        const std::uint32_t kind = isDirectory ? S_IFDIR : S_IFREG;
+        items_.push_back({path, name, kind | entry->mode, size});
+        return isDirectory ? addContents(name) : Status();
+    }
+
+    const fs::path top_;
+    const PackageLimits limits_ = dataLimits();
+    std::vector<PackageItem> items_;
+    std::vector<std::string> leftOut_;
+};
+
+Result<std::unique_ptr<PackageArchive>> openArchive(Result<PackageFile> file) {
+    if (!file) return file.error();
+    const std::string name = file->name();
+    Result<std::unique_ptr<PackageArchive>> archive =
+        PackageArchive::open(*std::move(file), dataLimits());
+    if (!archive) return archive.error().withContext("the archive of data " + name);
+    return archive;
+}
+
+Status checkSpace(int directory, const PackageArchive& archive) {
+    struct statvfs space = {};
+    if (::fstatvfs(directory, &space) != 0) return {};  // the writes will tell
+    const std::uint64_t free = std::uint64_t{space.f_bavail} * space.f_frsize;
+    if (archive.unpackedBytes() <= free) return {};
+    return posixError(ENOSPC, "unpack", archive.name(),
+                      "it needs " + std::to_string(archive.unpackedBytes()) + " bytes and " +
+                          std::to_string(free) + " are free; remove something from the device");
+}
+
+}  // namespace
+
+Result<DataArchiveContents> writeDataArchive(const RootDirectory& root,
+                                             const std::string& directory,
+                                             const std::string& file) {
+    DataArchiveContents contents;
+    const Result<UniqueFd> top = root.openDirectory(directory, "read");
+    if (!top) {
+        if (top.error().code == ENOENT) return contents;
+        return top.error();
+    }
+    // By descriptor, so that no link leads out of the device.
+    DataListing listing("/proc/self/fd/" + std::to_string(top->get()));
+    if (Status status = listing.addContents(""); !status) {
+        return status.error().withContext(directory);
+    }
+    contents.leftOut = listing.takeLeftOut();
+    const std::vector<PackageItem> items = listing.takeItems();
+    contents.entries = items.size();
+    if (items.empty()) return contents;
+    if (Status status = writeArchive(items, file); !status) return status.error();
+    return contents;
+}
+
+Status checkDataArchive(const std::string& file) {
+    const auto archive = openArchive(PackageFile::open(file));
+    return archive ? Status() : Status(archive.error());
+}
+
+Status unpackDataArchive(int archive, std::string_view name, int directory) {
+    const auto opened = openArchive(PackageFile::duplicate(archive, name));
+    if (!opened) return opened.error();
+    if (Status status = checkSpace(directory, **opened); !status) return status;
+    const PackageUnpackOptions options;
+    return PackageUnpacker(**opened, directory, options).run();
+}
+
+}  // namespace appsync

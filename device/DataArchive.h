@@ -1,0 +1,35 @@
+#pragma once
+
+#include <cstdint>
+#include <string>
+#include <string_view>
+#include <vector>
+
+#include "platform/Result.h"
+
+namespace appsync {
+
+class RootDirectory;
+
+/// What went into the archive of an application's data.
+struct DataArchiveContents {
+    std::uint64_t entries = 0;  // files and directories; with none, no archive was written
+    /// Why something was left out, one sentence each: links, pipes, names that no archive may hold.
+    std::vector<std::string> leftOut;
+};
+
+/// Archives what a directory of the device holds, in pieces, as a new file of this machine. What is
+/// left out is told, not refused. A directory that is missing holds nothing.
+[[nodiscard]] Result<DataArchiveContents> writeDataArchive(const RootDirectory& root,
+                                                           const std::string& directory,
+                                                           const std::string& file);
+
+/// Refuses a file of this machine that is no archive of data, or one that no device would unpack.
+[[nodiscard]] Status checkDataArchive(const std::string& file);
+
+/// Unpacks an archive of data into an empty directory. Both descriptors stay the caller's; `name`
+/// is what errors call the archive. Nothing is made durable. Refused before the first byte when
+/// more would be unpacked than there is room for.
+[[nodiscard]] Status unpackDataArchive(int archive, std::string_view name, int directory);
+
+}  // namespace appsync

@@ -1,0 +1,60 @@
+#pragma once
+
+#include <map>
+#include <optional>
+#include <string>
+#include <string_view>
+#include <vector>
+
+#include "host/Checksum.h"
+#include "platform/Result.h"
+
+namespace appsync {
+
+// What a backup folder consists of (docs/device-format.md).
+inline constexpr std::string_view kBackupManifest = "manifest.json";
+inline constexpr std::string_view kBackupRestoreInfo = "RestoreApplications.plist";
+inline constexpr std::string_view kBackupDemotedApps = "DemotedApps.plist";
+inline constexpr std::string_view kBackupIconOrder = "IconOrder.plist";
+inline constexpr std::string_view kBackupData = "data";
+
+/// One application of a backup, as its manifest has it.
+struct BackedUpApplication {
+    std::string identifier;
+    std::optional<std::string> version;
+    std::string name;
+    bool hasData = false;
+};
+
+/// What a backup says of itself.
+struct BackupManifest {
+    std::string made;  // when, ISO 8601
+    std::vector<BackedUpApplication> applications;
+    std::map<std::string, FileSum> files;  // by name, relative to the folder
+
+    [[nodiscard]] bool holds(std::string_view file) const {
+        return files.contains(std::string(file));
+    }
+};
+
+/// A file of a backup that is not as the manifest says.
+struct BackupFault {
+    std::string file;
+    std::string error;
+};
+
+/// The name of an application's archive, relative to the folder.
+[[nodiscard]] std::string dataArchiveName(const std::string& identifier);
+
+/// Reads the manifest. Without a good one, a folder is no backup that can be used: the error says
+/// which it is, none or a damaged one.
+[[nodiscard]] Result<BackupManifest> readBackupManifest(const std::string& backup);
+
+/// Writes the manifest: the folder is a whole backup from now on.
+[[nodiscard]] Status writeBackupManifest(const std::string& backup, const BackupManifest& manifest);
+
+/// Compares every file with its sum. Files that the manifest does not name are faults, too.
+[[nodiscard]] std::vector<BackupFault> checkBackup(const std::string& backup,
+                                                   const BackupManifest& manifest);
+
+}  // namespace appsync

@@ -1,0 +1,352 @@
+#include <fcntl.h>
+#include <sys/stat.h>
+#include <unistd.h>
+
+#include <algorithm>
+#include <cerrno>
+#include <chrono>
+#include <cmath>
+#include <filesystem>
+#include <map>
+#include <ostream>
+#include <set>
+#include <span>
+#include <string_view>
+#include <system_error>
+#include <utility>
+
+#include <nlohmann/json.hpp>
+
+#include "device/DataArchive.h"
+#include "device/Device.h"
+#include "device/IconDrawing.h"
+#include "host/Backup.h"
+#include "host/Commands.h"
+#include "host/Console.h"
+#include "host/HostFile.h"
+#include "host/JsonWriting.h"
+#include "host/OpenDevice.h"
+#include "host/PlugIn.h"
+#include "host/Problem.h"
+#include "host/Text.h"
+#include "platform/AppRegistry.h"
+#include "platform/FileSystem.h"
+#include "platform/PropertyListSerialization.h"
+#include "platform/SyncClient.h"
+#include "system/DescriptorIO.h"
+#include "system/RootDirectory.h"
+#include "system/UniqueFd.h"
+
+namespace appsync {
+namespace {
+
+namespace fs = std::filesystem;
+using Json = nlohmann::ordered_json;
+using Clock = std::chrono::steady_clock;
+
+constexpr std::string_view kMetadataName = "/VessikMetadata.plist";
+constexpr std::string_view kPngSignature = "\x89PNG\r\n\x1a\n";
+
+// What came of a backup.
+struct BackupResult {
+    BackupManifest manifest;
+    std::vector<std::string> demoted;
+    std::vector<BackupFault> leftOut;  // by identifier
+    std::uint64_t bytes = 0;
+};
+
+bool isDemoted(const ApplicationRecord& record) {
+    return record.isPlaceholder && (record.installType == kInstallTypeDowngrade ||
+                                    record.installType == kInstallTypeIntentionalDowngrade);
+}
+
+// What a restore brings back: the person's own applications. The placeholder of a sync is none yet.
+bool isForBackup(const ApplicationRecord& record) {
+    const bool isOfSync = record.isPlaceholder && record.installType == kInstallTypeSync;
+    return record.type == kApplicationTypeUser && !isOfSync;
+}
+
+bool isPng(ByteView bytes) {
+    return bytes.size() > kPngSignature.size() &&
+           std::equal(kPngSignature.begin(), kPngSignature.end(), bytes.begin(),
+                      [](char a, std::uint8_t b) { return static_cast<std::uint8_t>(a) == b; });
+}
+
+Status makeFolder(const std::string& backup) {
+    if (::mkdir(backup.c_str(), 0777) == 0) return {};
+    const int error = errno;
+    std::error_code code;
+    if (error != EEXIST) {
+        return failure(
+            "cannot make the folder " + backup + ": " + std::generic_category().message(error),
+            "name a folder that can be made");
+    }
+    if (fs::is_directory(backup, code) && fs::is_empty(backup, code) && !code) return {};
+    return failure(backup + " exists and is not an empty folder",
+                   "name a folder that does not exist");
+}
+
+// Puts everything that was written into the folder on disk.
+Status makeDurable(const std::string& folder) {
+    const UniqueFd opened(::open(folder.c_str(), O_RDONLY | O_DIRECTORY | O_CLOEXEC));
+    if (opened && ::syncfs(opened.get()) == 0) return {};
+    return systemError(errno, "cannot make " + folder + " durable");
+}
+
+// One backup in the making.
+class BackupMaking {
+  public:
+    BackupMaking(Device& device, const std::string& backup) : device_(device), backup_(backup) {}
+
+    Result<BackupResult> run() {
+        Status status = gather();
+        if (status) status = writeRestoreInfo();
+        if (status) status = writeDemotedApps();
+        if (status) status = writeIconOrder();
+        if (status) status = writeData();
+        if (status) status = makeDurable(backup_);
+        result_.manifest.made = formatTime(std::chrono::system_clock::now());
+        if (status) status = writeBackupManifest(backup_, result_.manifest);
+        if (status) status = makeDurable(backup_);
+        if (!status) return status.error();
+        for (const auto& [name, sum] : result_.manifest.files) result_.bytes += sum.size;
+        return std::move(result_);
+    }
+
+  private:
+    Status gather() {
+        Result<std::vector<ApplicationRecord>> records = device_.applications();
+        if (!records) return records.error();
+        std::set<std::string> seen;  // an application stands before the placeholder that covers it
+        for (ApplicationRecord& record : *records) {
+            if (!isForBackup(record) || !seen.insert(record.identifier).second) continue;
+            records_.push_back(std::move(record));
+        }
+        const Result<std::vector<HomeScreenItem>> screen = device_.homeScreen();
+        if (!screen) return screen.error();
+        for (const HomeScreenItem& item : *screen) order_.push_back(item.identifier);
+        Result<std::map<std::string, Bytes>> sinfs = device_.sinfData();
+        if (!sinfs) return sinfs.error();
+        sinfs_ = *std::move(sinfs);
+        return {};
+    }
+
+    Status writeRestoreInfo() {
+        PropertyList info = PropertyList::map();
+        for (const ApplicationRecord& record : records_) {
+            Result<PropertyList> entry = restoreEntry(record);
+            if (!entry) return entry.error();
+            info.set(record.identifier, *std::move(entry));
+            result_.manifest.applications.push_back(
+                {record.identifier, record.version, nameOf(record), false});
+        }
+        return writeList(kBackupRestoreInfo, info);
+    }
+
+    std::string nameOf(const ApplicationRecord& record) const {
+        return record.name.value_or(record.identifier);
+    }
+
+    Result<PropertyList> restoreEntry(const ApplicationRecord& record) {
+        Result<Bytes> metadata =
+            device_.propertyLists().serialize(metadataOf(record), PropertyListFormat::Binary);
+        if (!metadata) return metadata.error().withContext(record.identifier);
+        PropertyList entry = PropertyList::map({{"VessikMetadata", *std::move(metadata)}});
+        const auto sinf = sinfs_.find(record.identifier);
+        if (record.isPlaceholder && sinf != sinfs_.end()) {
+            entry.set("ApplicationSINF", sinf->second);
+        }
+        const std::string icon = record.bundle + "/" + record.iconFile;
+        const Result<ItemAttributes> attributes = device_.files().attributes(icon);
+        if (!attributes || attributes->size > kMaximumIconFileBytes) return entry;
+        Result<Bytes> picture = device_.files().readFile(icon);
+        if (picture && isPng(*picture)) entry.set("PlaceholderIcon", *std::move(picture));
+        return entry;
+    }
+
+    // What the store says, with the name and the version that stand on the home screen: those of
+    // the placeholder that a restore makes.
+    PropertyList metadataOf(const ApplicationRecord& record) {
+        PropertyList metadata = PropertyList::map();
+        const Result<Bytes> bytes =
+            device_.files().readFile(record.container + std::string(kMetadataName));
+        if (bytes) {
+            Result<PropertyList> parsed = device_.propertyLists().parse(*bytes);
+            if (parsed && parsed->isMap()) metadata = *std::move(parsed);
+        }
+        metadata.set("bundleVersion", record.version.value_or(""));
+        metadata.set("title", nameOf(record));
+        return metadata;
+    }
+
+    Status writeDemotedApps() {
+        PropertyList automatic = PropertyList::array();
+        PropertyList intentional = PropertyList::array();
+        for (const ApplicationRecord& record : records_) {
+            if (!isDemoted(record)) continue;
+            const bool bySystem = record.installType == kInstallTypeDowngrade;
+            (bySystem ? automatic : intentional).append(record.identifier);
+            result_.demoted.push_back(record.identifier);
+        }
+        return writeList(kBackupDemotedApps,
+                         PropertyList::map({{"AutomaticDowngrades", std::move(automatic)},
+                                            {"IntentionalDowngrades", std::move(intentional)}}));
+    }
+
+    Status writeIconOrder() { return writeList(kBackupIconOrder, PropertyList::strings(order_)); }
+
+    Status writeList(std::string_view name, const PropertyList& list) {
+        const Result<Bytes> bytes =
+            device_.propertyLists().serialize(list, PropertyListFormat::Binary);
+        if (!bytes) return bytes.error().withContext(name);
+        const Status status = writeHostFile(pathOf(name), *bytes);
+        return status ? note(std::string(name)) : status;
+    }
+
+    Status writeData() {
+        if (::mkdir(pathOf(kBackupData).c_str(), 0777) != 0) {
+            return systemError(errno, "cannot make " + pathOf(kBackupData));
+        }
+        for (BackedUpApplication& application : result_.manifest.applications) {
+            if (Status status = archive(application); !status) return status;
+        }
+        return {};
+    }
+
+    // Of an application that is still to be restored, the data that waits for it.
+    Status archive(BackedUpApplication& application) {
+        const std::string& identifier = application.identifier;
+        const std::string name = dataArchiveName(identifier);
+        Result<DataArchiveContents> contents =
+            writeDataArchive(device_.root(), Device::dataPath(identifier), pathOf(name));
+        if (!contents) return contents.error().withContext("the data of " + identifier);
+        for (std::string& reason : contents->leftOut) {
+            result_.leftOut.push_back({identifier, "left out of its data: " + std::move(reason)});
+        }
+        application.hasData = contents->entries > 0;
+        if (!application.hasData) {
+            const Result<bool> copied = copyWaitingData(identifier, name);
+            if (!copied) return copied.error();
+            application.hasData = *copied;
+        } else if (Status usable = checkDataArchive(pathOf(name)); !usable) {
+            return usable;
+        }
+        return application.hasData ? note(name) : Status();
+    }
+
+    Result<bool> copyWaitingData(const std::string& identifier, const std::string& name) {
+        const Result<RegularFile> waiting =
+            device_.root().openRegularFile(Device::restoreDataPath(identifier));
+        if (!waiting) {
+            if (waiting.error().code == ENOENT) return false;
+            return waiting.error();
+        }
+        const std::string path = pathOf(name);
+        const UniqueFd copy(::open(path.c_str(), O_WRONLY | O_CREAT | O_EXCL | O_CLOEXEC, 0666));
+        if (!copy) return systemError(errno, "cannot write " + path);
+        const int error = copyWhole(waiting->descriptor.get(), copy.get());
+        if (error != 0) return systemError(error, "cannot write " + path);
+        return true;
+    }
+
+    Status note(const std::string& name) {
+        Result<FileSum> sum = sumOfFile(pathOf(name));
+        if (!sum) return sum.error();
+        result_.manifest.files[name] = *std::move(sum);
+        return {};
+    }
+
+    [[nodiscard]] std::string pathOf(std::string_view name) const {
+        return (fs::path(backup_) / name).native();
+    }
+
+    Device& device_;
+    const std::string backup_;
+    std::vector<ApplicationRecord> records_;
+    std::vector<std::string> order_;
+    std::map<std::string, Bytes> sinfs_;
+    BackupResult result_;
+};
+
+Json jsonOf(const std::vector<BackupFault>& faults, const char* key) {
+    Json list = Json::array();
+    for (const BackupFault& fault : faults) {
+        list.push_back({{key, fault.file}, {"error", fault.error}});
+    }
+    return list;
+}
+
+void printBackup(const BackupResult& result, double seconds, const Console& console) {
+    std::uint64_t withData = 0;
+    for (const BackedUpApplication& each : result.manifest.applications) {
+        if (each.hasData) ++withData;
+    }
+    console.out << "backed up " << counted(result.manifest.applications.size(), "application")
+                << " (" << result.demoted.size() << " offloaded, " << withData << " with data), "
+                << formatBytes(result.bytes) << " in " << Json(std::round(seconds * 100) / 100)
+                << " s\n";
+}
+
+void printBackupJson(const BackupResult& result, double seconds, const Console& console) {
+    Json applications = Json::array();
+    Json data = Json::array();
+    for (const BackedUpApplication& each : result.manifest.applications) {
+        applications.push_back(each.identifier);
+        if (each.hasData) data.push_back(each.identifier);
+    }
+    console.out << indented({{"applications", std::move(applications)},
+                             {"demoted", result.demoted},
+                             {"data", std::move(data)},
+                             {"leftOut", jsonOf(result.leftOut, "identifier")},
+                             {"bytes", result.bytes},
+                             {"seconds", seconds}})
+                << '\n';
+}
+
+ErrorRecord unfinished(const std::string& backup, const ErrorRecord& cause) {
+    return failure("the backup " + backup + " is not whole: " + cause.description(),
+                   "remove the folder, and back up again");
+}
+
+}  // namespace
+
+int runBackup(const BackupArguments& arguments, const Console& console) {
+    const Clock::time_point begin = Clock::now();
+    const Result<std::unique_ptr<Device>> device =
+        openDevice(arguments.device, DeviceAccess::Session);
+    if (!device) return console.fail(device.error());
+    const Result<std::unique_ptr<PlugIn>> plugIn = PlugIn::load(**device);
+    if (!plugIn) return console.fail(plugIn.error());
+    if (const Status made = makeFolder(arguments.backup); !made) return console.fail(made.error());
+    (*plugIn)->client().prepareForBackup();
+    const Result<BackupResult> result = BackupMaking(**device, arguments.backup).run();
+    if (!result) return console.fail(unfinished(arguments.backup, result.error()));
+    const double seconds = std::chrono::duration<double>(Clock::now() - begin).count();
+    for (const BackupFault& each : result->leftOut) {
+        console.complain(each.file + ": " + each.error);
+    }
+    (arguments.asJson ? printBackupJson : printBackup)(*result, seconds, console);
+    return result->leftOut.empty() ? kExitDone : kExitSomethingFailed;
+}
+
+int runBackupCheck(const std::string& backup, bool asJson, const Console& console) {
+    const Result<BackupManifest> manifest = readBackupManifest(backup);
+    std::error_code code;
+    if (!manifest && !fs::is_directory(backup, code)) return console.fail(manifest.error());
+    const std::vector<BackupFault> faults =
+        manifest ? checkBackup(backup, *manifest)
+                 : std::vector<BackupFault>{
+                       {std::string(kBackupManifest), manifest.error().description()}};
+    for (const BackupFault& fault : faults) console.complain(fault.file + ": " + fault.error);
+    if (asJson) {
+        console.out << indented({{"whole", faults.empty()}, {"faults", jsonOf(faults, "file")}})
+                    << '\n';
+    } else if (faults.empty()) {
+        console.out << printable(backup)
+                    << " is whole: " << counted(manifest->applications.size(), "application")
+                    << ", of " << printable(manifest->made) << '\n';
+    }
+    return faults.empty() ? kExitDone : kExitSomethingFailed;
+}
+
+}  // namespace appsync
