@@ -108,7 +108,7 @@ void CoordinatedInstaller::work() {
 
 void CoordinatedInstaller::installNow(const Coordinator& coordinator) {
     if (coordinator->hasEnded()) return;
-    const TerminationAssertionResult asked =
+    TerminationAssertionResult asked =
         homeScreen_.takeTerminationAssertion(coordinator->identifier, kAssertionReason);
     if (asked.outcome == TerminationAssertionResult::kDenied) {
         const std::lock_guard lock(mutex_);
@@ -116,6 +116,7 @@ void CoordinatedInstaller::installNow(const Coordinator& coordinator) {
         return;
     }
     const Status status = unpackAndCommit(*coordinator);
+    asked.assertion.reset();  // whoever hears of the end may run the application
     if (status) {
         book_.installed(coordinator);
     } else {

@@ -96,6 +96,7 @@ class CoordinationBook : public std::enable_shared_from_this<CoordinationBook> {
                                                          CoordinationClient client,
                                                          bool& wasCreated);
     Coordinator adopt(const StoredCoordinator& stored);
+    [[nodiscard]] bool knowsAnother(const StoredCoordinator& stored) const;
     [[nodiscard]] std::shared_ptr<InstallCoordinator> handle(const Coordinator& coordinator);
 
     [[nodiscard]] LivePromise::Listener listener(const Coordinator& coordinator, PromiseRole role,

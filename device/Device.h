@@ -31,8 +31,8 @@ struct DeviceCreateOptions {
 
 struct DeviceOpenOptions {
     DeviceAccess access = DeviceAccess::Look;
-    /// When a denied termination is asked for again; only told to people, as the plug-in keeps the
-    /// time.
+    /// When a denied termination is asked for again: by the coordination service. On the direct
+    /// path it is only told to people, as the plug-in keeps the time.
     std::chrono::seconds retryInterval{30};
 };
 

@@ -19,8 +19,8 @@ std::optional<ErrorRecord> DeviceCoordinator::error() const {
 }
 
 std::string DeviceCoordinator::description() const {
-    return nameOf(coordinator_->kind) + " coordinator of " + coordinator_->identifier +
-           ", client " + std::to_string(coordinator_->client);
+    return coordinator_->identifier + " (" + nameOf(coordinator_->kind) + ", client " +
+           std::to_string(coordinator_->client) + ")";
 }
 
 void DeviceCoordinator::setObserver(std::weak_ptr<InstallCoordinatorObserver> observer) {
@@ -42,6 +42,7 @@ bool DeviceCoordinator::hasInitialODRAssetPromises() const {
 Status DeviceCoordinator::setInitialODRAssetPromises(
     const std::vector<std::shared_ptr<PathTransferPromise>>& promises) {
     std::vector<std::shared_ptr<LivePromise>> live;
+    live.reserve(promises.size());
     for (const auto& promise : promises) live.push_back(liveOf(promise.get()));
     return book_->setInitialAssets(coordinator_, live);
 }

@@ -25,8 +25,8 @@ DevicePlaceholder::DevicePlaceholder(std::string name, std::string identifier,
 
 std::string DevicePlaceholder::description() const {
     const PlaceholderConfiguration now = configuration();
-    return "placeholder of " + identifier_ + " (" + now.name + "), install type " +
-           std::to_string(now.installType);
+    return identifier_ + " (" + now.name + ", install type " + std::to_string(now.installType) +
+           ")";
 }
 
 Status DevicePlaceholder::setIconPromise(const std::shared_ptr<PathTransferPromise>& promise) {

@@ -11,24 +11,11 @@ namespace {
 
 using Methods = std::set<std::string, std::less<>>;
 
-const std::map<std::string, Methods, std::less<>>& knownCalls() {
-    static const std::map<std::string, Methods, std::less<>> calls{
-        {"AppRegistry",
-         {"proxyForIdentifier", "isApplicationInstalled", "enumerateBundles", "installProgress",
-          "finishInstallPhase", "installPackage", "installPlaceholderBundle",
-          "uninstallApplication", "addObserver", "removeObserver"}},
-        {"AppRegistryObserver",
-         {"applicationInstallsArePrioritized", "applicationInstallsDidCancel"}},
-        {"BackupManager", {"restoreDataExists", "cancelApplicationRestore"}},
-        {"BackupService", {"makeManager"}},
-        {"DevicePolicyService", {"effectiveValue"}},
-        {"FileSystem",
-         {"itemExists", "attributes", "createDirectory", "removeItem", "moveItem", "copyItem",
-          "readFile", "writeFileAtomically", "createFile", "setTimesToNow", "temporaryDirectory"}},
-        {"HomeScreenConnection", {"setIconState", "flattenedIconState"}},
-        {"HomeScreenService", {"blockableConnection", "takeTerminationAssertion"}},
-        {"IconRenderer", {"openBundle", "homeScreenIcon", "createImageDestination"}},
-        {"ImageDestination", {"addImage", "finalize"}},
+/// The methods of each service.
+using Calls = std::map<std::string, Methods, std::less<>>;
+
+const Calls& coordinationCalls() {
+    static const Calls calls{
         {"InstallCoordinator",
          {"bundleIdentifier", "creatorIdentifier", "error", "setObserver", "hasInstallOptions",
           "setInstallOptions", "hasInitialODRAssetPromises", "setInitialODRAssetPromises",
@@ -46,6 +33,37 @@ const std::map<std::string, Methods, std::less<>>& knownCalls() {
         {"InstallPlaceholder",
          {"setIconPromise", "setAttributes", "setMetadata", "setSinf", "setConfigurationComplete",
           "cancelForReason"}},
+        {"OutOfBandPromise",
+         {"name", "clientIdentifier", "percentComplete", "setPercentComplete", "isComplete",
+          "setComplete", "cancelForReason"}},
+        {"PathTransferPromise",
+         {"name", "clientIdentifier", "percentComplete", "setPercentComplete", "isComplete",
+          "setComplete", "cancelForReason", "transferPath", "setTransferPath"}},
+        {"TransferService",
+         {"canCancelTransfers", "cancelTransferForFailedAsset", "canPrioritizeAssets",
+          "prioritizeAsset"}},
+    };
+    return calls;
+}
+
+const Calls& otherCalls() {
+    static const Calls calls{
+        {"AppRegistry",
+         {"proxyForIdentifier", "isApplicationInstalled", "enumerateBundles", "installProgress",
+          "finishInstallPhase", "installPackage", "installPlaceholderBundle",
+          "uninstallApplication", "addObserver", "removeObserver"}},
+        {"AppRegistryObserver",
+         {"applicationInstallsArePrioritized", "applicationInstallsDidCancel"}},
+        {"BackupManager", {"restoreDataExists", "cancelApplicationRestore"}},
+        {"BackupService", {"makeManager"}},
+        {"DevicePolicyService", {"effectiveValue"}},
+        {"FileSystem",
+         {"itemExists", "attributes", "createDirectory", "removeItem", "moveItem", "copyItem",
+          "readFile", "writeFileAtomically", "createFile", "setTimesToNow", "temporaryDirectory"}},
+        {"HomeScreenConnection", {"setIconState", "flattenedIconState"}},
+        {"HomeScreenService", {"blockableConnection", "takeTerminationAssertion"}},
+        {"IconRenderer", {"openBundle", "homeScreenIcon", "createImageDestination"}},
+        {"ImageDestination", {"addImage", "finalize"}},
         {"InstallProgressRecord",
          {"installState", "setInstallState", "installPhase", "setInstallPhase", "totalUnitCount",
           "setTotalUnitCount", "completedUnitCount", "setCompletedUnitCount", "cancel",
@@ -58,20 +76,11 @@ const std::map<std::string, Methods, std::less<>>& knownCalls() {
         {"NotificationCenter", {"addObserver", "removeObserver"}},
         {"NotificationCenterObserver", {"callback"}},
         {"OperationQueue", {"add", "setMaximumConcurrentOperations"}},
-        {"OutOfBandPromise",
-         {"name", "clientIdentifier", "percentComplete", "setPercentComplete", "isComplete",
-          "setComplete", "cancelForReason"}},
-        {"PathTransferPromise",
-         {"name", "clientIdentifier", "percentComplete", "setPercentComplete", "isComplete",
-          "setComplete", "cancelForReason", "transferPath", "setTransferPath"}},
         {"PropertyListSerialization", {"parse", "serialize"}},
         {"Semaphore", {"signal", "wait"}},
         {"SerialQueue", {"sync"}},
         {"SyncHost", {"mainBundleIdentifier", "isRecoverableError", "transferService"}},
         {"TerminationAssertion", {"release"}},
-        {"TransferService",
-         {"canCancelTransfers", "cancelTransferForFailedAsset", "canPrioritizeAssets",
-          "prioritizeAsset"}},
         {"WaitGroup", {"enter", "leave", "wait", "waitFor"}},
         {"WorkQueues",
          {"makeSerialQueue", "makeOperationQueue", "makeWaitGroup", "makeSemaphore", "makeLock",
@@ -82,8 +91,11 @@ const std::map<std::string, Methods, std::less<>>& knownCalls() {
 
 /// Null when there is no such service.
 const Methods* methodsOf(std::string_view service) {
-    const auto found = knownCalls().find(withoutNumber(service));
-    return found == knownCalls().end() ? nullptr : &found->second;
+    for (const Calls* calls : {&coordinationCalls(), &otherCalls()}) {
+        const auto found = calls->find(withoutNumber(service));
+        if (found != calls->end()) return &found->second;
+    }
+    return nullptr;
 }
 
 }  // namespace

@@ -63,6 +63,18 @@ TEST_F(DeviceCoordinationEndingTest, whatWasCancelledElsewhereIsNotFoundAnyMore)
     EXPECT_TRUE(made->error());
 }
 
+TEST_F(DeviceCoordinationEndingTest, whatWasCancelledElsewhereAndBegunAnewIsHeardOfAsBoth) {
+    const auto made = prepare(kAtlas);
+    EXPECT_EQ(listener_->waitFor(1).size(), 1U);
+    EXPECT_TRUE(succeeded(look()->cancelCoordinator(kAtlas, kOther)));
+    const auto next = prepare(kAtlas);
+    EXPECT_EQ(listener_->waitFor(3),
+              (Texts{"placeholder com.example.atlas", "cancelled com.example.atlas, client 7",
+                     "placeholder com.example.atlas"}));
+    EXPECT_TRUE(hasPlaceholder(kAtlas));
+    EXPECT_FALSE(next->error());
+}
+
 TEST_F(DeviceCoordinationEndingTest, theLookOfTheCommandCreatesAndCancelsForOtherClients) {
     const auto beside = look();
     EXPECT_TRUE(succeeded(beside->createCoordinator(kAtlas, kOther)));
