@@ -495,8 +495,9 @@ class AppsClient final : public SyncClient,
     std::unique_ptr<SerialQueue> _accessQueue;               // guards itself
     std::unique_ptr<SerialQueue> _restoreQueue;              // guards itself
     bool _finishedWaitingForPlaceHolderInstalls = false;     // only on _restoreQueue
-    bool _useInstallCoordinator = false;                     // never changes once set
-    // Changed only on _restoreQueue; whoever waits reads it once without the queue.
+    // Never changes once `create` has set it; the registry may ask a little earlier.
+    std::atomic<bool> _useInstallCoordinator{false};
+    // Changed only on _restoreQueue; who waits for it to fall reads it once without the queue.
     std::atomic<std::int64_t> _restoringPlaceholderCount{0};
     std::set<std::string> _updatingApps;       // only on _accessQueue
     std::set<std::string> _userCancelledApps;  // only on _accessQueue

@@ -4,7 +4,6 @@
 #include <sys/stat.h>
 
 #include <cerrno>
-#include <optional>
 #include <utility>
 
 #include "client/AppsClient.h"
