@@ -122,7 +122,10 @@ void Scheduler::switchPoint() noexcept {
 
 void Scheduler::wait(const std::string& what, std::function<bool()> condition) {
     checkThread();
-    if (failure_ == nullptr && (broken_ || condition())) return;
+    if (failure_ == nullptr && (broken_ || condition())) {
+        current_->deadline.reset();
+        return;
+    }
     current_->what = what;
     current_->condition = std::move(condition);
     yieldTurn();

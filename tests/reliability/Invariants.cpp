@@ -3,6 +3,7 @@
 #include <algorithm>
 #include <chrono>
 #include <map>
+#include <utility>
 
 #include "client/Paths.h"
 #include "client/TodoList.h"
@@ -14,6 +15,7 @@ namespace {
 
 using Access = AppsClientTestAccess;
 
+const std::string kStagedList = std::string(kStagingArea) + "/ApplicationsSync.plist";
 constexpr const char* kAtomicWrite = "FileSystem.writeFileAtomically";
 
 std::string textAt(const PropertyList& entry, std::string_view key) {
@@ -47,18 +49,31 @@ Invariants::Invariants(World& world) : world_(world) {
 Invariants::~Invariants() { world_.platform.onCall(kAtomicWrite, {}); }
 
 void Invariants::sessionBegins(const PropertyList& todoList) {
-    beforeThat_ = todoList_;
-    todoList_ = todoList;
+    look();
+    staged_ = todoList;
     for (const std::string& identifier : identifiersToRemove(todoList)) mayRemove(identifier);
 }
 
-void Invariants::look() { lookAtTodoList(); }
+void Invariants::sessionBeginsWithoutList() {
+    look();
+    listMayGo_ = true;
+}
+
+void Invariants::look() {
+    noticeTakeover();
+    lookAtTodoList();
+}
+
+/// Until the staging area is taken over, installs of the session before go on marking its list.
+void Invariants::noticeTakeover() {
+    if (!staged_ || world_.platform.files.exists(kStagedList)) return;
+    todoList_ = *std::exchange(staged_, std::nullopt);
+    listMayGo_ = false;
+}
 
 void Invariants::lookAtTodoList() {
     const auto now = world_.platform.propertyListAt(std::string(kTodoListPath));
     if (!now || todoList_.isNull()) return;
-    // Of a session whose staging area could not be taken over the one before it is still there.
-    if (!namesTheSame(todoList_, *now) && *now == beforeThat_) return;
     compareTodoLists(todoList_, *now);
     todoList_ = *now;
 }
@@ -102,9 +117,9 @@ void Invariants::checkFilesParse() {
 
 /// The list is where it was taken to, or where the host left it.
 void Invariants::checkTodoListIsKept() {
-    if (todoList_.isNull()) return;
+    if (listMayGo_ || (todoList_.isNull() && !staged_)) return;
     if (world_.platform.files.exists(std::string(kTodoListPath))) return;
-    if (world_.platform.files.exists(std::string(kStagingArea) + "/ApplicationsSync.plist")) return;
+    if (world_.platform.files.exists(kStagedList)) return;
     violate("the todo list is gone");
 }
 
@@ -202,9 +217,20 @@ bool Invariants::mayLeavePackage(const std::string& name) const {
     // The service removes what it took. What nobody took stays: a coordinator that has ended, or
     // that another client has, takes nothing.
     if (!world_.coordinated) return false;
+    if (!wasPromiseKept(identifier, path)) return true;
     const auto* ended = world_.platform.coordination.ended(identifier);
     return ended == nullptr || ended->appAsset == nullptr || !ended->appAsset->complete ||
            !ended->appAsset->path || ended->appAsset->path->path() != path;
+}
+
+/// Whether the service was given what came last.
+bool Invariants::wasPromiseKept(const std::string& identifier, const std::string& path) const {
+    bool kept = false;
+    for (const RecordEntry& entry : world_.platform.recording()) {
+        if (entry.text == "Received file at " + path) kept = false;
+        if (entry.method == "setComplete" && entry.arguments == identifier + "-Asset") kept = true;
+    }
+    return kept;
 }
 
 void Invariants::checkHandles() {

@@ -1,6 +1,7 @@
 #pragma once
 
 #include <memory>
+#include <optional>
 #include <set>
 #include <string>
 #include <vector>
@@ -23,6 +24,8 @@ class Invariants {
 
     /// The host has staged this list and begins a session with it.
     void sessionBegins(const PropertyList& todoList);
+    /// The host begins a session without a list: that of the last one may go.
+    void sessionBeginsWithoutList();
     /// The application is installed, from now on.
     void mustKeep(const std::string& identifier) { installed_.insert(identifier); }
     /// Somebody wants the application removed.
@@ -41,6 +44,7 @@ class Invariants {
     [[nodiscard]] const std::vector<std::string>& violations() const { return violations_; }
 
   private:
+    void noticeTakeover();
     void lookAtTodoList();
     void compareTodoLists(const PropertyList& before, const PropertyList& after);
     void checkFilesParse();
@@ -53,14 +57,16 @@ class Invariants {
     void checkPackages();
     void checkHandles();
     [[nodiscard]] bool mayLeavePackage(const std::string& name) const;
+    [[nodiscard]] bool wasPromiseKept(const std::string& identifier, const std::string& path) const;
     [[nodiscard]] std::size_t countBeginning(std::string_view text) const;
     [[nodiscard]] std::size_t countCalls(std::string_view service, std::string_view method) const;
 
     World& world_;
     std::set<std::string> installed_;
     std::set<std::string> removable_;
-    PropertyList todoList_;    // as it was last seen, or as it was staged
-    PropertyList beforeThat_;  // of the session before
+    std::optional<PropertyList> staged_;  // while it is in the staging area
+    PropertyList todoList_;               // as it was last seen, or as it was staged; null before
+    bool listMayGo_ = false;
     bool restoring_ = false;
     std::vector<std::string> violations_;
 };

@@ -10,8 +10,8 @@ namespace {
 
 /// What retries for ever passes it.
 constexpr std::chrono::minutes kLongestRun{60};
-/// Longer than a retry waits.
-constexpr std::chrono::seconds kSettling{100};
+/// Longer than a retry waits and an install takes.
+constexpr std::chrono::minutes kSettling{4};
 
 }  // namespace
 
