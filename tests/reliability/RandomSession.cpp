@@ -39,11 +39,13 @@ void RandomSession::runThrowing() {
     world_.startClient();
     if (oneIn(2)) world_.faults.failSometimes(random_(), 10 + random_() % 90);
     if (oneIn(3)) restore();
+    leaves_ = oneIn(10);
     sync();
-    if (oneIn(3)) sync();
+    if (!leaves_ && oneIn(3)) sync();
     if (oneIn(8)) world_.client->prepareForBackup();
-    world_.settle();
-    invariants_.sessionHasEnded();
+    if (!leaves_) world_.settle();
+    // A host that leaves in the middle takes retries with it, and so their packages stay.
+    if (!leaves_) invariants_.sessionHasEnded();
     invariants_.clientGoes();
 }
 
@@ -108,6 +110,8 @@ void RandomSession::sync() {
     for (const SyncAssetPointer& asset : world_.client->outstandingAssetTransfers()) {
         transfer(asset);
     }
+    if (!world_.coordinated && oneIn(3)) transferRestore();
+    if (leaves_) return;
     const bool success = !oneIn(4);
     world_.client->assetTransferEndedWithSuccess(success);
     world_.client->syncEndedWithSuccess(success);
@@ -164,9 +168,37 @@ void RandomSession::transfer(const SyncAssetPointer& asset) {
     if (oneIn(4)) world_.platform.advance(anyDelay());
     if (oneIn(6)) {
         loseTransfer(asset);
+    } else if (oneIn(20)) {
+        asset->path = "../" + asset->identifier + ".zip";
+        world_.client->assetTransferSucceeded(asset, true, nullptr);
+    } else if (oneIn(20)) {
+        asset->isDownload = false;
+        asset->path = "upload";
+        world_.client->assetTransferSucceeded(asset, true, nullptr);
     } else if (!oneIn(8)) {
         world_.receive(asset);
         world_.client->assetTransferSucceeded(asset, true, nullptr);
+    }
+}
+
+/// The package of an application that restores, then its data, or one of them.
+void RandomSession::transferRestore() {
+    // In no list: what arrives a second time is marked as arrived a second time.
+    const std::string identifier = "com.example.restoring";
+    if (oneIn(2) && !world_.platform.registry.placeholder(identifier)) {
+        world_.platform.registry.addPlaceholder(identifier, 2);
+    }
+    if (oneIn(2)) world_.platform.backup.addRestoreData(identifier);
+    for (const unsigned parts :
+         {unsigned{kAssetPartApplication}, unsigned{kAssetPartApplicationData}}) {
+        if (oneIn(4)) continue;
+        auto asset = std::make_shared<SyncAsset>();
+        asset->identifier = identifier;
+        asset->dataclass = "Application";
+        asset->isRestore = true;
+        asset->completedParts = parts;
+        asset->variantOptions = PropertyList::map({{"Version", "1.0"}});
+        transfer(asset);
     }
 }
 

@@ -1,5 +1,6 @@
 #pragma once
 
+#include <chrono>
 #include <cstdint>
 #include <random>
 #include <string>
@@ -38,11 +39,13 @@ class RandomSession {
     void disturb();
     void cancelByAnother(const std::string& identifier);
     void transfer(const SyncAssetPointer& asset);
+    void transferRestore();
     void loseTransfer(const SyncAssetPointer& asset);
     void runThrowing();
 
     std::mt19937_64 random_;
     World world_;
+    bool leaves_ = false;  // the host does, in the middle of a session
     Invariants invariants_;
 };
 
