@@ -16,6 +16,7 @@ namespace {
 using Access = AppsClientTestAccess;
 
 const std::string kStagedList = std::string(kStagingArea) + "/ApplicationsSync.plist";
+constexpr std::string_view kChanging = "Changing ";
 constexpr const char* kAtomicWrite = "FileSystem.writeFileAtomically";
 
 std::string textAt(const PropertyList& entry, std::string_view key) {
@@ -102,8 +103,10 @@ void Invariants::sessionHasEnded() {
     checkTodoListIsKept();
     checkApplicationsAreKept();
     checkMarksAreTrue();
+    checkMarksAreMade();
     checkAccounts();
     checkWaitGroups();
+    checkAwaitedPlaceholders();
     checkRestoreInfoIsKept();
     checkPackages();
     checkHandles();
@@ -148,6 +151,24 @@ void Invariants::checkMarksAreTrue() {
     }
 }
 
+/// Where no call has failed, the list says what the log says.
+void Invariants::checkMarksAreMade() {
+    if (!world_.faults.injected().empty() || listMayGo_) return;
+    std::map<std::string, std::string> marks;  // those of the list that was taken over last
+    for (const RecordEntry& entry : world_.platform.recording()) {
+        if (entry.method == "moveItem" && entry.arguments.starts_with(kStagingArea)) marks.clear();
+        const std::size_t from = entry.text.find(" from ");
+        if (!entry.text.starts_with(kChanging) || from == std::string::npos) continue;
+        marks[entry.text.substr(kChanging.size(), from - kChanging.size())] =
+            entry.text.substr(entry.text.rfind(' ') + 1);
+    }
+    for (const auto& [identifier, mark] : marks) {
+        const auto index = indexOfEntry(todoList_, identifier);
+        if (index && textAt(*todoList_.at(*index), kTodoOperationKey) == mark) continue;
+        violate(identifier + " is not marked as " + mark);
+    }
+}
+
 /// Nothing that was begun is forgotten.
 void Invariants::checkAccounts() {
     const std::size_t queued = countCalls("OperationQueue", "add");
@@ -183,13 +204,28 @@ void Invariants::checkWaitGroups() {
     }
     std::int64_t sum = 0;
     for (const auto& [group, count] : entered) sum += count;
-    if (world_.client == nullptr) return;
     const auto awaited =
         static_cast<std::int64_t>(Access::placeholdersForRestoringApps(*world_.client).size());
     if (Access::restoringPlaceholderCount(*world_.client) != awaited) {
         violate("the count of restoring placeholders is not that of the set");
     }
     if (sum != awaited) violate("a wait group was not left as often as it was entered");
+}
+
+/// What the plug-in has given up itself it does not wait for.
+void Invariants::checkAwaitedPlaceholders() {
+    for (const std::string& identifier : Access::placeholdersForRestoringApps(*world_.client)) {
+        const auto* ended = world_.platform.coordination.ended(identifier);
+        if (ended == nullptr || !ended->cancelled || ended->cancelled->client != SyncClientID) {
+            continue;
+        }
+        // What somebody else cancels stays awaited; an install may have come after that.
+        if (ended->kind != CoordinatorKind::Restoring &&
+            ended->kind != CoordinatorKind::RestoringDemoted) {
+            continue;
+        }
+        violate(identifier + " is awaited although its restore was given up");
+    }
 }
 
 void Invariants::checkRestoreInfoIsKept() {

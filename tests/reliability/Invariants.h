@@ -51,8 +51,10 @@ class Invariants {
     void checkTodoListIsKept();
     void checkApplicationsAreKept();
     void checkMarksAreTrue();
+    void checkMarksAreMade();
     void checkAccounts();
     void checkWaitGroups();
+    void checkAwaitedPlaceholders();
     void checkRestoreInfoIsKept();
     void checkPackages();
     void checkHandles();

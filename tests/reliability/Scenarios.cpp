@@ -147,6 +147,20 @@ auto leaving(std::vector<std::string> installed, std::vector<std::string> placeh
     return [=](World& world) { return differences(world, installed, placeholders); };
 }
 
+/// The same, and every application of the list is marked as installed.
+auto marking(std::vector<std::string> installed) {
+    return [=](World& world) {
+        Shortcomings result = differences(world, installed);
+        const PropertyList list = world.platform.propertyListAt(std::string(kTodoListPath))
+                                      .value_or(PropertyList::array());
+        for (const PropertyList& entry : list.elements()) {
+            if (hasOperation(entry, kTodoInstalled) || hasOperation(entry, kTodoRemove)) continue;
+            result.push_back(*entry.findString(kTodoIdentifierKey) + " is not marked");
+        }
+        return result;
+    };
+}
+
 std::string metadataPath(const char* identifier) {
     return std::string("/var/containers/Bundle/Application/") + identifier +
            "/VessikMetadata.plist";
@@ -235,8 +249,8 @@ std::vector<Scenario> make() {
     const auto add = [&all](const Scenario& scenario) {
         for (Scenario& each : inBothModes(scenario)) all.push_back(std::move(each));
     };
-    add({"Sync", false, withB, syncing(oneOfEach()), leaving({kA})});
-    add({"Update", false, withAll, syncing(updates()), leaving({kA, kB, kC})});
+    add({"Sync", false, withB, syncing(oneOfEach()), marking({kA})});
+    add({"Update", false, withAll, syncing(updates()), marking({kA, kB, kC})});
     add({"Removal", false, withAll, syncing(removals()), leaving({kC})});
     add({"LostTransfers", false, withAll, loseTransfers, fine, false});
     // A placeholder that a coordinator has promised stays until the store keeps its promise; what
