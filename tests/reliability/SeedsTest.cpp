@@ -1,5 +1,10 @@
+#include <algorithm>
+#include <cstdint>
+#include <cstdio>
 #include <cstdlib>
+#include <optional>
 #include <string>
+#include <vector>
 
 #include "tests/reliability/RandomSession.h"
 

@@ -2,6 +2,7 @@
 
 #include <memory>
 #include <string>
+#include <vector>
 
 #include "client/AppsClient.h"
 #include "simulation/FaultPlan.h"
