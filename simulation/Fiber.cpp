@@ -5,7 +5,9 @@
 #include <array>
 #include <cstdlib>
 #include <cstring>
+#include <memory>
 #include <utility>
+#include <vector>
 
 #if defined(__SANITIZE_ADDRESS__)
 #define APPSYNC_ADDRESS_SANITIZER 1
@@ -24,6 +26,7 @@
 #endif
 
 #ifdef APPSYNC_ADDRESS_SANITIZER
+#include <sanitizer/asan_interface.h>
 #include <sanitizer/common_interface_defs.h>
 #endif
 #ifdef APPSYNC_THREAD_SANITIZER
@@ -53,6 +56,31 @@ class ExceptionState {
     std::array<std::byte, sizeof(Layout)> saved_;
 };
 
+using Stack = std::unique_ptr<std::byte[]>;
+
+/// Stacks of fibers that are gone: making one costs more than most fibers do. Never destroyed,
+/// because fibers may outlive it.
+std::vector<Stack>& freeStacks() {
+    thread_local auto& stacks = *new std::vector<Stack>;
+    return stacks;
+}
+
+Stack takeStack() {
+    std::vector<Stack>& stacks = freeStacks();
+    if (stacks.empty()) return std::make_unique_for_overwrite<std::byte[]>(kStackSize);
+    Stack stack = std::move(stacks.back());
+    stacks.pop_back();
+    return stack;
+}
+
+void giveBack(Stack stack) {
+#ifdef APPSYNC_ADDRESS_SANITIZER
+    // Frames that were never left have marked their surroundings.
+    __asan_unpoison_memory_region(stack.get(), kStackSize);
+#endif
+    freeStacks().push_back(std::move(stack));
+}
+
 }  // namespace
 
 Fiber::Fiber() {
@@ -63,7 +91,7 @@ Fiber::Fiber() {
 
 Fiber::Fiber(std::function<void()> body)
     : body_(std::move(body)),
-      stack_(std::make_unique_for_overwrite<std::byte[]>(kStackSize)),
+      stack_(takeStack()),
       stackBottom_(stack_.get()),
       stackSize_(kStackSize) {
     getcontext(&context_);
@@ -80,6 +108,7 @@ Fiber::~Fiber() {
 #ifdef APPSYNC_THREAD_SANITIZER
     if (stack_ != nullptr) __tsan_destroy_fiber(sanitizerState_);
 #endif
+    if (stack_ != nullptr) giveBack(std::move(stack_));
 }
 
 void Fiber::switchTo(Fiber& other) {

@@ -6,6 +6,7 @@
 #include <optional>
 #include <string>
 #include <string_view>
+#include <type_traits>
 #include <utility>
 #include <vector>
 
@@ -69,26 +70,45 @@ class RecordedCall {
         : recorder_(recorder),
           number_(recorder.begin(
               service, method,
-              recorder.isListening() ? joined({callText(arguments)...}) : std::string())) {}
+              recorder.isListening() ? joined({callText(arguments)...}) : std::string())),
+          refusal_(recorder.takeRefusal()) {}
 
     /// Records the result and gives it back.
     template <typename Value>
     Value result(Value value) {
+        if (refusal_) refuse(value);
         if (recorder_.isListening()) recorder_.end(number_, callText(value));
         return value;
     }
     /// Records a result that has no text of its own as `text`.
     template <typename Value>
     Value result(Value value, std::string text) {
+        if (refusal_) {
+            refuse(value);
+            text = "(refused)";
+        }
         recorder_.end(number_, std::move(text));
         return value;
     }
 
   private:
+    template <typename Value>
+    void refuse(Value& value) const {
+        if constexpr (requires { value.reset(); }) {
+            value.reset();
+        } else if constexpr (std::is_same_v<Value, bool>) {
+            value = false;
+        } else if constexpr (std::is_assignable_v<Value&, const ErrorRecord&>) {
+            value = *refusal_;
+        } else {
+            throw SimulationFailure("a call with such a result cannot be refused");
+        }
+    }
     static std::string joined(const std::vector<std::string>& texts);
 
     Recorder& recorder_;
     std::size_t number_;
+    std::optional<ErrorRecord> refusal_;
 };
 
 }  // namespace appsync

@@ -54,6 +54,7 @@ std::size_t Recorder::begin(std::string_view service, std::string_view method,
     const Hook hook = hookOf(entry);
     if (enabled_) entries_.push_back(entry);
     if (hook) hook(entry);
+    if (interceptor_ != nullptr) refusal_ = interceptor_->willCall(entry);
     return number;
 }
 
@@ -68,6 +69,7 @@ Recorder::Hook Recorder::hookOf(const RecordEntry& entry) const {
 }
 
 void Recorder::end(std::size_t call, std::string result) {
+    if (interceptor_ != nullptr) interceptor_->didCall();
     if (call == kNotRecorded || call < forgotten_) return;
     entries_[call - forgotten_].result = std::move(result);
 }

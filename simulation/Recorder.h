@@ -5,10 +5,13 @@
 #include <iosfwd>
 #include <limits>
 #include <map>
+#include <optional>
 #include <string>
 #include <string_view>
+#include <utility>
 #include <vector>
 
+#include "platform/Error.h"
 #include "platform/LogFacility.h"
 #include "simulation/Scheduler.h"
 
@@ -45,6 +48,17 @@ struct RecordEntry {
 /// GoogleTest prints entries with it.
 std::ostream& operator<<(std::ostream& out, const RecordEntry& entry);
 
+/// Stands in the way of every call across platform/.
+class CallInterceptor {
+  public:
+    virtual ~CallInterceptor() = default;
+    /// Like a hook, after it. With an error the call is refused: what it gives back is the error,
+    /// or nothing, or no.
+    virtual std::optional<ErrorRecord> willCall(const RecordEntry& entry) = 0;
+    /// A call that has a result gives it back now.
+    virtual void didCall() = 0;
+};
+
 /// Keeps, in order, everything that crosses platform/, and makes each of these crossings a point at
 /// which the scheduler may switch.
 class Recorder {
@@ -64,10 +78,19 @@ class Recorder {
     /// control, after the call was recorded and before it has any effect. An empty hook ends that.
     void setHook(std::string call, Hook hook);
 
+    /// Borrowed; null ends it.
+    void setInterceptor(CallInterceptor* interceptor) { interceptor_ = interceptor; }
+    /// Why the call that has just begun is refused. Nothing: it is not.
+    [[nodiscard]] std::optional<ErrorRecord> takeRefusal() {
+        return std::exchange(refusal_, std::nullopt);
+    }
+
     /// Recording costs memory; a long benchmark does without.
     void setEnabled(bool enabled) { enabled_ = enabled; }
     /// Whether anybody wants to know arguments and results.
-    [[nodiscard]] bool isListening() const { return enabled_ || !hooks_.empty(); }
+    [[nodiscard]] bool isListening() const {
+        return enabled_ || !hooks_.empty() || interceptor_ != nullptr;
+    }
     void clear();
     [[nodiscard]] const std::vector<RecordEntry>& entries() const { return entries_; }
     [[nodiscard]] Scheduler& scheduler() { return scheduler_; }
@@ -82,6 +105,8 @@ class Recorder {
     std::size_t forgotten_ = 0;  // how many entries were cleared
     bool enabled_ = true;
     std::map<std::string, Hook, std::less<>> hooks_;
+    CallInterceptor* interceptor_ = nullptr;
+    std::optional<ErrorRecord> refusal_;
 };
 
 }  // namespace appsync

@@ -15,6 +15,10 @@ namespace {
 constexpr SimulatedTime kDefaultTimeLimit = std::chrono::hours(24);
 /// Interleaved: at one switch point of this many the clock jumps although somebody could run.
 constexpr std::uint64_t kTimePassesOneIn = 64;
+/// With priorities: at one switch point of this many they change, while changes are left.
+constexpr std::uint64_t kPriorityChangesOneIn = 32;
+/// Priorities begin above this; those that fell behind are below.
+constexpr std::uint64_t kMiddlePriority = 1U << 20U;
 
 std::string seconds(SimulatedTime time) {
     return std::to_string(std::chrono::duration_cast<std::chrono::seconds>(time).count()) + " s";
@@ -36,7 +40,8 @@ struct Scheduler::Turn {
     std::unique_ptr<Fiber> fiber;
     std::function<void()> task;
     bool begun = false;
-    std::string what;  // what it waits for
+    std::uint64_t priority = 0;  // the highest goes first
+    std::string what;            // what it waits for
     std::function<bool()> condition;
     std::optional<SimulatedTime> deadline;
 };
@@ -54,7 +59,10 @@ Scheduler::Scheduler(Scheduling scheduling)
       thread_(std::this_thread::get_id()),
       timeLimit_(kDefaultTimeLimit),
       host_(std::make_unique<Turn>("host")),
-      current_(host_.get()) {
+      current_(host_.get()),
+      changesLeft_(scheduling.changePoints.value_or(0)),
+      lowestPriority_(kMiddlePriority) {
+    givePriority(*host_);
     host_->fiber = std::make_unique<Fiber>();
     order_.push_back(host_.get());
 }
@@ -75,6 +83,7 @@ void Scheduler::spawn(std::string name, std::function<void()> task) {
     turn.name = std::move(name);
     turn.task = std::move(task);
     turn.begun = false;
+    givePriority(turn);
     order_.push_back(&turn);
 }
 
@@ -107,12 +116,16 @@ void Scheduler::switchPoint() noexcept {
         const std::optional<SimulatedTime> event = nextEvent();
         if (event && *event <= timeLimit_) (void)jumpToNextEvent();
     }
-    switchTo(*randomTurn());
+    maybeFallBehind();
+    switchTo(*chosenTurn());
 }
 
 void Scheduler::wait(const std::string& what, std::function<bool()> condition) {
     checkThread();
-    if (failure_ == nullptr && (broken_ || condition())) return;
+    if (failure_ == nullptr && (broken_ || condition())) {
+        current_->deadline.reset();
+        return;
+    }
     current_->what = what;
     current_->condition = std::move(condition);
     yieldTurn();
@@ -154,18 +167,33 @@ bool Scheduler::othersRunnable() const {
     });
 }
 
-Scheduler::Turn* Scheduler::randomTurn() {
+/// Of those that can run, the one of the highest priority, or whoever the seed says.
+Scheduler::Turn* Scheduler::chosenTurn() {
     std::vector<Turn*> runnable;
     std::copy_if(order_.begin(), order_.end(), std::back_inserter(runnable),
                  [this](const Turn* turn) { return isRunnable(*turn); });
-    return runnable.empty() ? nullptr : runnable[random(runnable.size())];
+    if (runnable.empty()) return nullptr;
+    if (!scheduling_.changePoints) return runnable[random(runnable.size())];
+    return *std::max_element(runnable.begin(), runnable.end(), [](const Turn* a, const Turn* b) {
+        return a->priority < b->priority;
+    });
+}
+
+void Scheduler::givePriority(Turn& turn) {
+    if (scheduling_.changePoints) turn.priority = kMiddlePriority + random(kMiddlePriority);
+}
+
+void Scheduler::maybeFallBehind() {
+    if (changesLeft_ == 0 || random(kPriorityChangesOneIn) != 0) return;
+    --changesLeft_;
+    current_->priority = --lowestPriority_;
 }
 
 /// Whose turn is next, once the one that runs can not go on; null when nobody's ever is.
 Scheduler::Turn* Scheduler::nextTurn() {
     do {
         if (scheduling_.interleaved) {
-            if (Turn* turn = randomTurn()) return turn;
+            if (Turn* turn = chosenTurn()) return turn;
         } else {
             const auto found = std::find_if(order_.begin(), order_.end(),
                                             [this](const Turn* turn) { return isRunnable(*turn); });

@@ -1,6 +1,7 @@
 #pragma once
 
 #include <chrono>
+#include <cstddef>
 #include <cstdint>
 #include <exception>
 #include <functional>
@@ -35,9 +36,17 @@ struct Scheduling {
     /// whose turn is longest ago.
     bool interleaved = false;
     std::uint64_t seed = 0;
+    /// Interleaved: how often the one that runs falls behind all others, chosen by the seed; else
+    /// always the same one of those that can run goes first. Nothing: whoever the seed says goes on
+    /// at each call.
+    std::optional<std::size_t> changePoints = std::nullopt;
 
     [[nodiscard]] static Scheduling runToCompletion() { return {}; }
     [[nodiscard]] static Scheduling seeded(std::uint64_t seed) { return {true, seed}; }
+    /// Few changes of turn: what takes a certain order of a few events to go wrong shows sooner.
+    [[nodiscard]] static Scheduling prioritized(std::uint64_t seed, std::size_t changePoints) {
+        return {true, seed, changePoints};
+    }
 };
 
 /// Runs the host (whoever made the scheduler: the test) and tasks in turns, on one thread and by a
@@ -105,7 +114,9 @@ class Scheduler {
     [[nodiscard]] bool isRunnable(const Turn& turn) const;
     [[nodiscard]] bool othersRunnable() const;
     [[nodiscard]] Turn* nextTurn();
-    [[nodiscard]] Turn* randomTurn();
+    [[nodiscard]] Turn* chosenTurn();
+    void givePriority(Turn& turn);
+    void maybeFallBehind();
     [[nodiscard]] std::optional<SimulatedTime> nextEvent() const;
     [[nodiscard]] bool jumpToNextEvent();
     void startDueTasks();
@@ -131,6 +142,8 @@ class Scheduler {
     std::multimap<SimulatedTime, Delayed> delayed_;  // equal times: in order of submission
     std::exception_ptr failure_;
     bool broken_ = false;
+    std::size_t changesLeft_ = 0;
+    std::uint64_t lowestPriority_ = 0;
 };
 
 }  // namespace appsync

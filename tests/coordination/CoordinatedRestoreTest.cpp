@@ -481,14 +481,36 @@ TEST_F(CoordinatedRestore, CancelsOnlyTheCoordinatorWhenTheAppStoreIsRefused) {
 }
 
 TEST_F(CoordinatedRestore, RestoresTheOthersAllTheSame) {
-    setRestoreInfo(PropertyList::map(
-        {{kA, appInfo()}, {"no identifier", appInfo()}, {"..", appInfo()}, {kB, appInfo()}}));
+    setRestoreInfo(PropertyList::map({{kA, appInfo()},
+                                      {"no map", 1},
+                                      {"no metadata", PropertyList::map()},
+                                      {"damaged", PropertyList::map({{"VessikMetadata", sinf_}})},
+                                      {kB, appInfo()}}));
     service().failNext(CoordinationStep::Sinf, kA, refusal_);
     restore();
     EXPECT_THAT(service().identifiers(), ElementsAre(kB));
     EXPECT_TRUE(platform_.registry.placeholder(kB));
     EXPECT_THAT(awaited(), IsEmpty());
     EXPECT_EQ(platform_.now(), SimulatedTime(0));
+    expectInfoMovedOnce();
+}
+
+TEST_F(CoordinatedRestore, OfAnIdentifierThatNoApplicationCanHaveIsRefused) {
+    const std::vector<std::string> identifiers{
+        "", ".", "..", "a/../../b", "a/b", std::string("a\0b", 3), "a\nb", std::string(300, 'a')};
+    PropertyList info = PropertyList::map();
+    for (const std::string& identifier : identifiers) info.set(identifier, appInfo());
+    info.set(kB, appInfo());
+    setRestoreInfo(info);
+    restore();
+    for (const std::string& identifier : identifiers) {
+        EXPECT_THAT(platform_.messages(),
+                    Contains(testing::AllOf(
+                        StartsWith("Error Error Domain="),
+                        testing::EndsWith(" creating restore coordinator for " + identifier))));
+    }
+    EXPECT_THAT(service().identifiers(), ElementsAre(kB));
+    EXPECT_THAT(platform_.files.names("/tmp/com.korvu.trd.Apps"), ElementsAre("com.example.b.app"));
     expectInfoMovedOnce();
 }
 

@@ -89,6 +89,16 @@ TEST(SchedulerTest, AWaitThatIsFulfilledInTimeDoesNotLastUntilItsTimeout) {
     EXPECT_EQ(scheduler.now(), 2s);
 }
 
+TEST(SchedulerTest, ATimeoutThatWasNotNeededEndsNoLaterWait) {
+    Scheduler scheduler(Scheduling::runToCompletion());
+    EXPECT_TRUE(scheduler.waitFor("nothing", 1s, [] { return true; }));
+    bool done = false;
+    scheduler.spawnAfter(5s, "task", [&] { done = true; });
+    scheduler.wait("the task", [&] { return done; });
+    EXPECT_TRUE(done);
+    EXPECT_EQ(scheduler.now(), 5s);
+}
+
 TEST(SchedulerTest, AdvanceRunsOnlyWhatFallsDue) {
     Scheduler scheduler(Scheduling::runToCompletion());
     std::string trace;
@@ -198,8 +208,8 @@ TEST(SchedulerTest, ATaskThatNeverEndsIsLeftWhereItIs) {
 }
 
 /// What three tasks of four steps each make of a seed.
-std::string interleavingOf(std::uint64_t seed) {
-    Scheduler scheduler(Scheduling::seeded(seed));
+std::string interleavingOf(Scheduling scheduling) {
+    Scheduler scheduler(scheduling);
     std::string trace;
     for (const char name : {'a', 'b', 'c'}) {
         scheduler.spawn("task", [&scheduler, &trace, name] {
@@ -215,14 +225,34 @@ std::string interleavingOf(std::uint64_t seed) {
 
 TEST(SchedulerTest, TheSameSeedGivesTheSameTurns) {
     for (std::uint64_t seed = 0; seed < 20; ++seed) {
-        EXPECT_EQ(interleavingOf(seed), interleavingOf(seed));
+        EXPECT_EQ(interleavingOf(Scheduling::seeded(seed)),
+                  interleavingOf(Scheduling::seeded(seed)));
     }
 }
 
 TEST(SchedulerTest, SeedsGiveDifferentTurns) {
     std::set<std::string> traces;
-    for (std::uint64_t seed = 0; seed < 20; ++seed) traces.insert(interleavingOf(seed));
+    for (std::uint64_t seed = 0; seed < 20; ++seed)
+        traces.insert(interleavingOf(Scheduling::seeded(seed)));
     EXPECT_GE(traces.size(), 15U);
+}
+
+std::size_t changesIn(const std::string& trace) {
+    std::size_t changes = 0;
+    for (std::size_t i = 1; i < trace.size(); ++i) changes += trace[i] != trace[i - 1] ? 1U : 0U;
+    return changes;
+}
+
+TEST(SchedulerTest, WithPrioritiesTurnsChangeWhenATaskEndsAndAtTheChangePoints) {
+    std::set<std::string> traces;
+    for (std::uint64_t seed = 0; seed < 200; ++seed) {
+        EXPECT_EQ(changesIn(interleavingOf(Scheduling::prioritized(seed, 0))), 2U);
+        const std::string trace = interleavingOf(Scheduling::prioritized(seed, 2));
+        EXPECT_LE(changesIn(trace), 4U);
+        EXPECT_EQ(trace, interleavingOf(Scheduling::prioritized(seed, 2)));
+        traces.insert(trace);
+    }
+    EXPECT_GT(traces.size(), 12U);
 }
 
 TEST(SchedulerTest, ThousandsOfTasksReuseTheirStacks) {

@@ -1,0 +1,76 @@
+#pragma once
+
+#include <memory>
+#include <optional>
+#include <set>
+#include <string>
+#include <vector>
+
+#include "platform/PropertyList.h"
+#include "tests/reliability/World.h"
+
+namespace appsync {
+
+/// What holds whatever fails, in whatever order things happen. Looks on from the moment it is made;
+/// says what was broken, a line each.
+class Invariants {
+  public:
+    /// Everything that is installed now stays, unless somebody asks for its removal.
+    explicit Invariants(World& world);
+    ~Invariants();
+
+    Invariants(const Invariants&) = delete;
+    Invariants& operator=(const Invariants&) = delete;
+
+    /// The host has staged this list and begins a session with it.
+    void sessionBegins(const PropertyList& todoList);
+    /// The host begins a session without a list: that of the last one may go.
+    void sessionBeginsWithoutList();
+    /// The application is installed, from now on.
+    void mustKeep(const std::string& identifier) { installed_.insert(identifier); }
+    /// Somebody wants the application removed.
+    void mayRemove(const std::string& identifier) { removable_.insert(identifier); }
+    /// A restore began; its information is never lost.
+    void restoreBegins() { restoring_ = true; }
+    void violate(const std::string& what) { violations_.push_back(what); }
+
+    /// Everything has come to its end; the client is still there.
+    void sessionHasEnded();
+    /// Lets the client go, and looks what it has left.
+    void clientGoes();
+    /// Looks again at what must stand at every instant.
+    void look();
+
+    [[nodiscard]] const std::vector<std::string>& violations() const { return violations_; }
+
+  private:
+    void noticeTakeover();
+    void lookAtTodoList();
+    void compareTodoLists(const PropertyList& before, const PropertyList& after);
+    void checkFilesParse();
+    void checkTodoListIsKept();
+    void checkApplicationsAreKept();
+    void checkMarksAreTrue();
+    void checkMarksAreMade();
+    void checkAccounts();
+    void checkWaitGroups();
+    void checkAwaitedPlaceholders();
+    void checkRestoreInfoIsKept();
+    void checkPackages();
+    void checkHandles();
+    [[nodiscard]] bool mayLeavePackage(const std::string& name) const;
+    [[nodiscard]] bool wasPromiseKept(const std::string& identifier, const std::string& path) const;
+    [[nodiscard]] std::size_t countBeginning(std::string_view text) const;
+    [[nodiscard]] std::size_t countCalls(std::string_view service, std::string_view method) const;
+
+    World& world_;
+    std::set<std::string> installed_;
+    std::set<std::string> removable_;
+    std::optional<PropertyList> staged_;  // while it is in the staging area
+    PropertyList todoList_;               // as it was last seen, or as it was staged; null before
+    bool listMayGo_ = false;
+    bool restoring_ = false;
+    std::vector<std::string> violations_;
+};
+
+}  // namespace appsync

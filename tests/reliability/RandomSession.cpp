@@ -1,0 +1,210 @@
+#include "tests/reliability/RandomSession.h"
+
+#include <chrono>
+#include <exception>
+
+#include "client/Paths.h"
+
+namespace appsync {
+namespace {
+
+constexpr std::uint64_t kIdentifiers = 6;
+constexpr std::size_t kChangePoints = 4;
+constexpr std::uint64_t kLongestDelay = 90;  // seconds: some retries
+constexpr CoordinationClient kAnotherClient = 9;
+
+ErrorRecord somebodysReason() { return ErrorRecord::make("Person", 1, "cancelled"); }
+
+}  // namespace
+
+Scheduling RandomSession::schedulingOf(std::uint64_t seed) {
+    if (seed % 2 == 0) return Scheduling::seeded(seed);
+    return Scheduling::prioritized(seed, kChangePoints);
+}
+
+RandomSession::RandomSession(std::uint64_t seed)
+    : random_(seed), world_(schedulingOf(seed)), invariants_(world_) {}
+
+std::vector<std::string> RandomSession::run() {
+    try {
+        runThrowing();
+    } catch (const std::exception& failure) {
+        invariants_.violate(failure.what());
+    }
+    return invariants_.violations();
+}
+
+void RandomSession::runThrowing() {
+    arrange();
+    world_.startClient();
+    if (oneIn(2)) world_.faults.failSometimes(random_(), 10 + random_() % 90);
+    if (oneIn(3)) restore();
+    leaves_ = oneIn(10);
+    sync();
+    if (!leaves_ && oneIn(3)) sync();
+    if (oneIn(8)) world_.client->prepareForBackup();
+    if (!leaves_) world_.settle();
+    // A host that leaves in the middle takes retries with it, and so their packages stay.
+    if (!leaves_) invariants_.sessionHasEnded();
+    invariants_.clientGoes();
+}
+
+std::string RandomSession::anyIdentifier() {
+    return "com.example.app" + std::to_string(random_() % kIdentifiers);
+}
+
+std::chrono::seconds RandomSession::anyDelay() {
+    return std::chrono::seconds(random_() % kLongestDelay);
+}
+
+void RandomSession::arrange() {
+    world_.coordinated = oneIn(2);
+    if (oneIn(4)) world_.platform.host.setMainBundleIdentifier("com.example.other");
+    for (std::uint64_t i = random_() % kIdentifiers; i > 0; --i) {
+        const std::string identifier = anyIdentifier();
+        world_.platform.registry.addApplication(identifier, "0.9");
+        invariants_.mustKeep(identifier);
+        if (oneIn(3)) world_.platform.homeScreen.setRunning(identifier, true);
+        if (oneIn(6)) world_.platform.installer.addUninstalled(identifier);
+    }
+    if (oneIn(3)) world_.platform.registry.setInstallDuration(anyDelay());
+    if (oneIn(3)) world_.platform.host.setRecoverableTest([](const ErrorRecord&) { return true; });
+    if (oneIn(6)) world_.platform.transfers.setCanCancelTransfers(false);
+    if (oneIn(6)) world_.platform.host.setTransferService(nullptr);
+    arrangePolicy();
+}
+
+void RandomSession::arrangePolicy() {
+    if (oneIn(10)) {
+        world_.platform.policy.set(PolicyFeature::AppInstallationAllowed, PolicyAnswer::No);
+    }
+    if (oneIn(10)) world_.platform.policy.set(PolicyFeature::AppRemovalAllowed, PolicyAnswer::No);
+}
+
+void RandomSession::restore() {
+    std::vector<std::string> identifiers;
+    for (std::uint64_t i = 0; i < kIdentifiers; ++i) {
+        if (oneIn(2)) identifiers.push_back("com.example.app" + std::to_string(i));
+    }
+    world_.stageRestore(identifiers);
+    invariants_.restoreBegins();
+    std::optional<ErrorRecord> error;
+    if (!world_.client->reconcileRestoreOfType(2, &error) || error) {
+        invariants_.violate("a restore was refused");
+    }
+}
+
+void RandomSession::sync() {
+    const PropertyList list = anyTodoList();
+    if (!oneIn(12)) {
+        world_.stage(list);
+        invariants_.sessionBegins(list);
+    } else {
+        invariants_.sessionBeginsWithoutList();
+    }
+    disturb();
+    world_.client->prepareForSyncWithHostAnchor("anchor 0", {}, nullptr);
+    std::optional<ErrorRecord> error;
+    if (!world_.client->reconcileSync({}, "anchor 1", {}, &error)) return;
+    static_cast<void>(world_.client->installedAssets());
+    for (const SyncAssetPointer& asset : world_.client->outstandingAssetTransfers()) {
+        transfer(asset);
+    }
+    if (!world_.coordinated && oneIn(3)) transferRestore();
+    if (leaves_) return;
+    const bool success = !oneIn(4);
+    world_.client->assetTransferEndedWithSuccess(success);
+    world_.client->syncEndedWithSuccess(success);
+}
+
+/// No identifier twice: of two entries only the first is marked.
+PropertyList RandomSession::anyTodoList() {
+    PropertyList list = PropertyList::array();
+    for (std::uint64_t i = 0; i < kIdentifiers; ++i) {
+        const std::string identifier = "com.example.app" + std::to_string(i);
+        if (oneIn(3)) continue;
+        list.append(World::entry(identifier, oneIn(4) ? "remove" : "install"));
+    }
+    return list;
+}
+
+/// What others do while the session runs.
+void RandomSession::disturb() {
+    for (std::uint64_t i = 0; i < kIdentifiers; ++i) {
+        // Whoever runs is quit before the host loses patience.
+        const std::string identifier = "com.example.app" + std::to_string(i);
+        world_.platform.scheduler.spawnAfter(anyDelay(), "person", [this, identifier] {
+            world_.platform.homeScreen.setRunning(identifier, false);
+        });
+    }
+    if (oneIn(3)) cancelByAnother(anyIdentifier());
+    if (world_.coordinated && oneIn(6)) {
+        const std::string identifier = anyIdentifier();
+        if (world_.platform.coordination.state(identifier) == nullptr) {
+            world_.platform.coordination.addCoordinator(CoordinatorKind::Initiating, identifier,
+                                                        kAnotherClient);
+        }
+    }
+    if (world_.coordinated && oneIn(4)) world_.platform.coordination.prioritize(anyIdentifier());
+    if (oneIn(4)) {
+        world_.platform.registry.failNextInstall(
+            anyIdentifier(), ErrorRecord::make(kInstallerErrorDomain, 1, "refused"));
+    }
+}
+
+void RandomSession::cancelByAnother(const std::string& identifier) {
+    world_.platform.scheduler.spawnAfter(anyDelay(), "another client", [this, identifier] {
+        if (world_.platform.coordination.state(identifier) != nullptr) {
+            world_.platform.coordination.cancel(identifier, somebodysReason(), AppStoreClientID);
+        } else if (world_.platform.registry.progress(identifier)) {
+            world_.platform.registry.cancelInstalls({identifier});
+        }
+    });
+}
+
+void RandomSession::transfer(const SyncAssetPointer& asset) {
+    asset->downloadProgress = 0.5;
+    world_.client->assetTransferUpdatedProgress(asset, 0.5);
+    if (oneIn(4)) world_.platform.advance(anyDelay());
+    if (oneIn(6)) {
+        loseTransfer(asset);
+    } else if (oneIn(20)) {
+        asset->path = "../" + asset->identifier + ".zip";
+        world_.client->assetTransferSucceeded(asset, true, nullptr);
+    } else if (oneIn(20)) {
+        asset->isDownload = false;
+        asset->path = "upload";
+        world_.client->assetTransferSucceeded(asset, true, nullptr);
+    } else if (!oneIn(8)) {
+        world_.receive(asset);
+        world_.client->assetTransferSucceeded(asset, true, nullptr);
+    }
+}
+
+/// The package of an application that restores, then its data, or one of them.
+void RandomSession::transferRestore() {
+    // In no list: what arrives a second time is marked as arrived a second time.
+    const std::string identifier = "com.example.restoring";
+    if (oneIn(2) && !world_.platform.registry.placeholder(identifier)) {
+        world_.platform.registry.addPlaceholder(identifier, 2);
+    }
+    if (oneIn(2)) world_.platform.backup.addRestoreData(identifier);
+    for (const unsigned parts :
+         {unsigned{kAssetPartApplication}, unsigned{kAssetPartApplicationData}}) {
+        if (oneIn(4)) continue;
+        auto asset = std::make_shared<SyncAsset>();
+        asset->identifier = identifier;
+        asset->dataclass = "Application";
+        asset->isRestore = true;
+        asset->completedParts = parts;
+        asset->variantOptions = PropertyList::map({{"Version", "1.0"}});
+        transfer(asset);
+    }
+}
+
+void RandomSession::loseTransfer(const SyncAssetPointer& asset) {
+    const ErrorRecord lost = ErrorRecord::make(kPosixErrorDomain, 5, "lost");
+    world_.client->assetTransferSucceeded(asset, false, oneIn(2) ? &lost : nullptr);
+}
+
+}  // namespace appsync

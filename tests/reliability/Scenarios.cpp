@@ -1,0 +1,279 @@
+#include "tests/reliability/Scenarios.h"
+
+#include <optional>
+
+#include "client/Paths.h"
+#include "client/TodoList.h"
+
+namespace appsync {
+namespace {
+
+constexpr const char* kA = "com.example.a";
+constexpr const char* kB = "com.example.b";
+constexpr const char* kC = "com.example.c";
+
+using Shortcomings = std::vector<std::string>;
+
+/// The client's answer to the host is the one that is specified.
+void expect(Invariants& invariants, bool holds, const char* what) {
+    if (!holds) invariants.violate(what);
+}
+
+void reconcile(World& world, Invariants& invariants) {
+    std::optional<ErrorRecord> error;
+    const bool done = world.client->reconcileSync({}, "anchor 1", {}, &error);
+    const bool takeover =
+        world.faults.hasInjected("FileSystem.createDirectory(" + std::string(kWorkArea) + ", ") ||
+        world.faults.hasInjected("FileSystem.moveItem(");
+    // A directory of the last session that cannot be removed is in the way of the next one's.
+    const bool inTheWay = world.faults.hasInjected("FileSystem.removeItem(");
+    expect(invariants, done || takeover || inTheWay, "a session was refused without a reason");
+    expect(invariants, done || error.has_value(), "a session was refused without an error");
+}
+
+void transfer(World& world, const SyncAssetPointer& asset) {
+    asset->downloadProgress = 0.5;
+    world.client->assetTransferUpdatedProgress(asset, 0.5);
+    world.receive(asset);
+    world.client->assetTransferSucceeded(asset, true, nullptr);
+}
+
+void sync(World& world, Invariants& invariants, const PropertyList& list) {
+    world.stage(list);
+    invariants.sessionBegins(list);
+    expect(invariants, world.client->prepareForSyncWithHostAnchor("anchor 0", {}, nullptr),
+           "preparing for a sync was refused");
+    reconcile(world, invariants);
+    world.platform.runUntilIdle();
+    static_cast<void>(world.client->installedAssets());
+    const auto assets = world.client->outstandingAssetTransfers();
+    world.platform.runUntilIdle();
+    for (const SyncAssetPointer& asset : assets) transfer(world, asset);
+    world.client->assetTransferEndedWithSuccess(true);
+    world.client->syncEndedWithSuccess(true);
+    world.settle();
+}
+
+std::function<void(World&, Invariants&)> syncing(PropertyList list) {
+    return [list = std::move(list)](World& world, Invariants& invariants) {
+        sync(world, invariants, list);
+    };
+}
+
+void restore(World& world, Invariants& invariants, const std::vector<std::string>& identifiers) {
+    world.stageRestore(identifiers);
+    invariants.restoreBegins();
+    std::optional<ErrorRecord> error;
+    expect(invariants, world.client->reconcileRestoreOfType(2, &error), "a restore was refused");
+    expect(invariants, !error, "a restore gave an error");
+    world.settle();
+}
+
+/// The package of a restoring application, then its data.
+void transferRestore(World& world, Invariants&) {
+    for (const unsigned parts :
+         {unsigned{kAssetPartApplication}, unsigned{kAssetPartApplicationData}}) {
+        auto asset = std::make_shared<SyncAsset>();
+        asset->identifier = kA;
+        asset->dataclass = "Application";
+        asset->isRestore = true;
+        asset->completedParts = parts;
+        asset->variantOptions = PropertyList::map({{"Version", "1.0"}});
+        world.client->assetTransferUpdatedProgress(asset, 1.0);
+        world.receive(asset);
+        if (parts == kAssetPartApplicationData) asset->path = std::nullopt;
+        world.client->assetTransferSucceeded(asset, true, nullptr);
+    }
+    world.client->assetTransferEndedWithSuccess(true);
+    world.settle();
+}
+
+void clean(World& world, Invariants&) {
+    world.client->clearSyncData();
+    world.settle();
+}
+
+void backUp(World& world, Invariants&) {
+    world.client->prepareForBackup();
+    static_cast<void>(world.client->installedAssetMetrics());
+    static_cast<void>(world.client->korvuIDsForAssets());
+    static_cast<void>(world.client->accountsForAssets());
+    world.settle();
+}
+
+/// Of a session that has installed nothing: what is uninstalled is told of, and forgotten.
+void endSession(World& world, Invariants&) {
+    static_cast<void>(world.client->installedAssets());
+    world.client->assetTransferEndedWithSuccess(true);
+    world.client->syncEndedWithSuccess(true);
+    world.settle();
+}
+
+/// The transfers of two applications, one of which fails, and the phase that fails then.
+void loseTransfers(World& world, Invariants& invariants) {
+    const PropertyList list =
+        PropertyList::array({World::entry(kA, "install"), World::entry(kC, "install")});
+    world.stage(list);
+    invariants.sessionBegins(list);
+    reconcile(world, invariants);
+    const auto assets = world.client->outstandingAssetTransfers();
+    world.platform.runUntilIdle();
+    const ErrorRecord lost = ErrorRecord::make(kPosixErrorDomain, 5, "lost");
+    for (const SyncAssetPointer& asset : assets) {
+        world.client->assetTransferUpdatedProgress(asset, 0.5);
+        if (asset->identifier == kA) world.client->assetTransferSucceeded(asset, false, &lost);
+    }
+    world.client->assetTransferEndedWithSuccess(false);
+    world.client->syncEndedWithSuccess(false);
+    world.settle();
+}
+
+Shortcomings differences(World& world, const std::vector<std::string>& installed,
+                         const std::vector<std::string>& placeholders = {}) {
+    Shortcomings result;
+    if (world.platform.registry.installedIdentifiers() != installed) {
+        result.emplace_back("other applications are installed");
+    }
+    if (world.platform.registry.placeholderIdentifiers() != placeholders) {
+        result.emplace_back("there are other placeholders");
+    }
+    if (!world.platform.coordination.identifiers().empty() && placeholders.empty()) {
+        result.emplace_back("a coordinator is left");
+    }
+    return result;
+}
+
+auto leaving(std::vector<std::string> installed, std::vector<std::string> placeholders = {}) {
+    return [=](World& world) { return differences(world, installed, placeholders); };
+}
+
+/// The same, and every application of the list is marked as installed.
+auto marking(std::vector<std::string> installed) {
+    return [=](World& world) {
+        Shortcomings result = differences(world, installed);
+        const PropertyList list = world.platform.propertyListAt(std::string(kTodoListPath))
+                                      .value_or(PropertyList::array());
+        for (const PropertyList& entry : list.elements()) {
+            if (hasOperation(entry, kTodoInstalled) || hasOperation(entry, kTodoRemove)) continue;
+            result.push_back(*entry.findString(kTodoIdentifierKey) + " is not marked");
+        }
+        return result;
+    };
+}
+
+std::string metadataPath(const char* identifier) {
+    return std::string("/var/containers/Bundle/Application/") + identifier +
+           "/VessikMetadata.plist";
+}
+
+Shortcomings unclearedMarks(World& world) {
+    Shortcomings result;
+    for (const char* identifier : {kA, kB}) {
+        const auto metadata = world.platform.propertyListAt(metadataPath(identifier));
+        if (!metadata || metadata->find("title") == nullptr ||
+            metadata->find("is-auto-download") != nullptr) {
+            result.push_back(std::string("the metadata of ") + identifier);
+        }
+    }
+    return result;
+}
+
+void install(World& world, std::initializer_list<const char*> identifiers) {
+    for (const char* identifier : identifiers) {
+        world.platform.registry.addApplication(identifier, "0.9");
+    }
+}
+
+void addMarks(World& world) {
+    install(world, {kA, kB});
+    for (const char* identifier : {kA, kB}) {
+        world.platform.addPropertyList(
+            metadataPath(identifier),
+            PropertyList::map({{"title", "A"}, {"is-auto-download", true}, {"korvuId", "me"}}));
+    }
+}
+
+void addUninstalled(World& world) {
+    world.platform.files.addDirectory(std::string(kWorkArea));
+    world.platform.installer.addUninstalled(kA);
+    world.platform.addPropertyList(std::string(kLastSyncAppStatePath), PropertyList::array({kB}));
+}
+
+Shortcomings uncleared(World& world) {
+    Shortcomings result;
+    if (world.platform.installer.uninstalled()->size() != 0) {
+        result.emplace_back("the uninstalled list");
+    }
+    return result;
+}
+
+void addRestoring(World& world) {
+    world.platform.files.addDirectory(std::string(kWorkArea));
+    world.platform.registry.addPlaceholder(kA, 2);
+    world.platform.backup.addRestoreData(kA);
+    world.platform.addPropertyList(
+        std::string(kRestoreStatePath),
+        PropertyList::map(
+            {{kC, PropertyList::map({{"1.0", PropertyList::map({{"path", "/c"}})}})}}));
+}
+
+PropertyList oneOfEach() {
+    return PropertyList::array({World::entry(kA, "install"), World::entry(kB, "remove")});
+}
+
+PropertyList updates() {
+    return PropertyList::array({World::entry(kA, "install"), World::entry(kC, "install")});
+}
+
+PropertyList removals() {
+    return PropertyList::array({World::entry(kA, "remove"), World::entry(kB, "remove")});
+}
+
+std::vector<Scenario> inBothModes(const Scenario& scenario) {
+    Scenario direct = scenario;
+    Scenario coordinated = scenario;
+    direct.name = "Direct" + scenario.name;
+    coordinated.name = "Coordinated" + scenario.name;
+    coordinated.coordinated = true;
+    return {direct, coordinated};
+}
+
+std::vector<Scenario> make() {
+    const auto withB = [](World& world) { install(world, {kB}); };
+    const auto withAll = [](World& world) { install(world, {kA, kB, kC}); };
+    const auto fine = [](World&) { return Shortcomings{}; };
+    const auto restoring = [](World& world, Invariants& invariants) {
+        restore(world, invariants, {kA, kC});
+    };
+    std::vector<Scenario> all;
+    const auto add = [&all](const Scenario& scenario) {
+        for (Scenario& each : inBothModes(scenario)) all.push_back(std::move(each));
+    };
+    add({"Sync", false, withB, syncing(oneOfEach()), marking({kA})});
+    add({"Update", false, withAll, syncing(updates()), marking({kA, kB, kC})});
+    add({"Removal", false, withAll, syncing(removals()), leaving({kC})});
+    add({"LostTransfers", false, withAll, loseTransfers, fine, false});
+    // A placeholder that a coordinator has promised stays until the store keeps its promise; what
+    // is given up once has lost its restore information.
+    add({"Restore", false, withB, restoring, leaving({kB}, {kA, kC}), true});
+    add({"Backup", false, addMarks, backUp, unclearedMarks});
+    add({"SessionEnd", false, addUninstalled, endSession, uncleared});
+    add({"Clearing", false,
+         [](World& world) {
+             addUninstalled(world);
+             world.platform.registry.addPlaceholder(kC, 4);
+         },
+         clean, uncleared});
+    all.push_back(
+        {"DirectRestoreTransfer", false, addRestoring, transferRestore, leaving({kA}), false});
+    return all;
+}
+
+}  // namespace
+
+const std::vector<Scenario>& scenarios() {
+    static const std::vector<Scenario> all = make();
+    return all;
+}
+
+}  // namespace appsync

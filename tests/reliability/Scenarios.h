@@ -1,0 +1,29 @@
+#pragma once
+
+#include <functional>
+#include <string>
+#include <vector>
+
+#include "tests/reliability/Invariants.h"
+#include "tests/reliability/World.h"
+
+namespace appsync {
+
+/// Something that the host does with the client, from its beginning to its end.
+struct Scenario {
+    std::string name;
+    bool coordinated = false;
+    /// What is on the device before the client is.
+    std::function<void(World&)> arrange;
+    /// Leaves nothing under way.
+    std::function<void(World&, Invariants&)> run;
+    /// How the device is when nothing has failed, a line for each thing that is not so.
+    std::function<std::vector<std::string>(World&)> shortcomings;
+    /// Whether the same again, on what a failed run has left, comes to that end.
+    bool heals = true;
+};
+
+/// Every one of them.
+[[nodiscard]] const std::vector<Scenario>& scenarios();
+
+}  // namespace appsync

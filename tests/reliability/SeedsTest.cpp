@@ -1,0 +1,84 @@
+#include <algorithm>
+#include <cstdint>
+#include <cstdio>
+#include <cstdlib>
+#include <optional>
+#include <string>
+#include <vector>
+
+#include "tests/reliability/RandomSession.h"
+
+namespace appsync {
+namespace {
+
+using testing::IsEmpty;
+
+/// The environment variable that names one seed, and the one that says how many to try.
+constexpr const char* kOneSeed = "APPSYNC_SEED";
+constexpr const char* kManySeeds = "APPSYNC_SEEDS";
+constexpr std::uint64_t kSeeds = 2000;
+constexpr std::uint64_t kParts = 8;
+
+std::optional<std::uint64_t> numberIn(const char* variable) {
+    const char* text = std::getenv(variable);
+    return text != nullptr ? std::optional<std::uint64_t>(std::stoull(text)) : std::nullopt;
+}
+
+std::string firstDifference(const std::vector<std::string>& one,
+                            const std::vector<std::string>& other) {
+    for (std::size_t i = 0; i < std::min(one.size(), other.size()); ++i) {
+        if (one[i] != other[i]) return one[i] + " / " + other[i];
+    }
+    return one.size() == other.size() ? "" : "one goes on for longer";
+}
+
+void tryOut(std::uint64_t seed) {
+    SCOPED_TRACE(std::string(kOneSeed) + "=" + std::to_string(seed) +
+                 " build/release/tests/test_reliability --gtest_filter=Seeds.One");
+    RandomSession first(seed);
+    EXPECT_THAT(first.run(), IsEmpty());
+    RandomSession second(seed);
+    second.run();
+    EXPECT_EQ(firstDifference(first.trace(), second.trace()), "");
+}
+
+/// A part of the seeds, so that a long run shows how far it is.
+class ManySeeds : public testing::TestWithParam<std::uint64_t> {};
+
+TEST_P(ManySeeds, KeepTheInvariantsAndRepeatThemselves) {
+    const std::uint64_t count = numberIn(kManySeeds).value_or(kSeeds);
+    for (std::uint64_t seed = GetParam(); seed < count; seed += kParts) tryOut(seed);
+}
+
+INSTANTIATE_TEST_SUITE_P(Part, ManySeeds, testing::Range(std::uint64_t{0}, kParts));
+
+/// With APPSYNC_TRACE it also prints what crossed platform/.
+TEST(Seeds, One) {
+    const std::uint64_t seed = numberIn(kOneSeed).value_or(1);
+    tryOut(seed);
+    if (std::getenv("APPSYNC_TRACE") == nullptr) return;
+    RandomSession session(seed);
+    session.run();
+    for (const std::string& line : session.trace()) std::puts(line.c_str());
+}
+
+TEST(Seeds, MakeSessionsThatDiffer) {
+    RandomSession first(2);
+    RandomSession second(4);
+    first.run();
+    second.run();
+    EXPECT_NE(firstDifference(first.trace(), second.trace()), "");
+}
+
+TEST(Seeds, LetCallsFail) {
+    std::size_t faults = 0;
+    for (std::uint64_t seed = 0; seed < 20; ++seed) {
+        RandomSession session(seed);
+        session.run();
+        faults += session.faults();
+    }
+    EXPECT_GT(faults, 20U);
+}
+
+}  // namespace
+}  // namespace appsync

@@ -1,0 +1,79 @@
+#include "tests/reliability/World.h"
+
+#include <chrono>
+
+#include "client/Paths.h"
+#include "client/TodoList.h"
+
+namespace appsync {
+namespace {
+
+/// What retries for ever passes it.
+constexpr std::chrono::minutes kLongestRun{60};
+/// Longer than a retry waits and an install takes.
+constexpr std::chrono::minutes kSettling{4};
+
+}  // namespace
+
+World::World(Scheduling scheduling) : platform(codec, scheduling), faults(platform) {
+    platform.scheduler.setTimeLimit(kLongestRun);
+    platform.files.addDirectory("/var/mobile/Library/Logs/MediaServices");
+}
+
+World::~World() { faults.stop(); }
+
+void World::startClient() {
+    platform.coordination.setEnabled(coordinated);
+    client = AppsClient::create(platform.services());
+    platform.notificationCenter.post(kStartUp);
+    platform.runUntilIdle();
+}
+
+void World::settle() { platform.advance(kSettling); }
+
+std::string World::packagePath(const std::string& identifier) {
+    return std::string(kPublicStaging) + "/" + identifier + ".zip";
+}
+
+PropertyList World::entry(const std::string& identifier, const char* operation) {
+    return PropertyList::map({{kTodoIdentifierKey, identifier},
+                              {kTodoOperationKey, operation},
+                              {kTodoVersionKey, "1.0"},
+                              {kTodoNameKey, "Example"}});
+}
+
+void World::stage(const PropertyList& todoList) {
+    const std::string area(kStagingArea);
+    PropertyList layout = PropertyList::array();
+    for (const PropertyList& each : todoList.elements()) {
+        const std::string& identifier = *each.findString(kTodoIdentifierKey);
+        layout.append(identifier);
+        const std::string directory = area + "/" + identifier;
+        platform.addPropertyList(directory + "/Info.plist",
+                                 PropertyList::map({{"BundleDisplayName", "Shown"}}));
+        platform.addPropertyList(directory + "/VessikMetadata.plist",
+                                 PropertyList::map({{"itemName", "Sold"}}));
+        platform.files.addFile(directory + "/VessikArtwork", "artwork");
+    }
+    platform.addPropertyList(area + "/DeskoraIconState.plist", layout);
+    platform.addPropertyList(area + "/ApplicationsSync.plist", todoList);
+}
+
+void World::stageRestore(const std::vector<std::string>& identifiers) {
+    const auto metadata = *codec.serialize(
+        PropertyList::map({{"title", "Shown"}, {"bundleVersion", "1.0"}}), PropertyListFormat::Xml);
+    PropertyList info = PropertyList::map();
+    for (const std::string& identifier : identifiers) {
+        info.set(identifier, PropertyList::map({{"VessikMetadata", metadata},
+                                                {"ApplicationSINF", Bytes{9, 8, 7}},
+                                                {"PlaceholderIcon", Bytes{1, 2, 3, 4}}}));
+    }
+    platform.addPropertyList(std::string(kRestoreInfoPath), info, PropertyListFormat::Binary);
+}
+
+void World::receive(const SyncAssetPointer& asset) {
+    asset->path = asset->identifier + ".zip";
+    platform.files.addFile(packagePath(asset->identifier), "package");
+}
+
+}  // namespace appsync

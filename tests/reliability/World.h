@@ -1,0 +1,45 @@
+#pragma once
+
+#include <memory>
+#include <string>
+#include <vector>
+
+#include "client/AppsClient.h"
+#include "simulation/FaultPlan.h"
+#include "simulation/SimulatedPlatform.h"
+#include "system/PropertyListCodec.h"
+
+namespace appsync {
+
+inline constexpr const char* kStartUp = "com.korvu.trd.TRStartupCompleteNotification";
+
+/// A device in memory, a client on it, and what the host does with that client.
+struct World {
+    explicit World(Scheduling scheduling = Scheduling::runToCompletion());
+    ~World();
+
+    World(const World&) = delete;
+    World& operator=(const World&) = delete;
+
+    /// Starts the daemon that holds the client.
+    void startClient();
+    /// Lets everything that is under way come to its end.
+    void settle();
+
+    static std::string packagePath(const std::string& identifier);
+    static PropertyList entry(const std::string& identifier, const char* operation);
+    /// What the host leaves in the staging area, with the side files of each application.
+    void stage(const PropertyList& todoList);
+    /// What a backup has brought along.
+    void stageRestore(const std::vector<std::string>& identifiers);
+    /// The package has come to the device whole.
+    void receive(const SyncAssetPointer& asset);
+
+    SystemPropertyLists codec;
+    SimulatedPlatform platform;
+    FaultPlan faults;
+    bool coordinated = false;
+    std::shared_ptr<AppsClient> client;
+};
+
+}  // namespace appsync
