@@ -32,6 +32,7 @@ int actOn(const std::string& path, const std::string& identifier, DeviceAccess a
     const Result<std::unique_ptr<Device>> device = openDevice(path, access);
     if (!device) return console.fail(device.error());
     const Status status = action(**device);
+    if (const auto broken = (*device)->databaseFailure()) return console.fail(unusable(*broken));
     if (!status) return console.fail(classified(status.error()));
     console.out << identifier << " " << done << '\n';
     return kExitDone;

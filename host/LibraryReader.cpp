@@ -1,6 +1,7 @@
 #include "host/LibraryReader.h"
 
 #include <algorithm>
+#include <array>
 #include <filesystem>
 #include <optional>
 #include <string_view>
@@ -76,6 +77,25 @@ void readIconOrder(Library& library, PropertyListSerialization& propertyLists) {
     }
 }
 
+// The files of a staging area stand beside the directories that are named by applications.
+bool isStagingFileName(std::string_view identifier) {
+    constexpr std::array<std::string_view, 4> names = {
+        "ApplicationsSync.plist", "ApplicationsSync.plist-debug.plist", "AssetSortOrder.plist",
+        "DeskoraIconState.plist"};
+    return std::find(names.begin(), names.end(), identifier) != names.end();
+}
+
+void addPackage(const PackageReader& package, const std::string& name, const std::string& file,
+                std::vector<LibraryPackage>& packages, std::vector<LibraryFault>& faults) {
+    LibraryPackage described = packageOf(package.info(), file);
+    if (isStagingFileName(described.identifier)) {
+        faults.push_back({name, "the device keeps a file under the name " + described.identifier +
+                                    " when it syncs: give the application another identifier"});
+        return;
+    }
+    packages.push_back(std::move(described));
+}
+
 }  // namespace
 
 std::uint64_t bytesOnDevice(const PackageInfo& info) {
@@ -93,7 +113,7 @@ Result<Library> readLibrary(const std::string& folder, PropertyListSerialization
         file.append("/").append(name);
         const Result<PackageReader> package = PackageReader::open(file, propertyLists);
         if (package) {
-            packages.push_back(packageOf(package->info(), file));
+            addPackage(*package, name, file, packages, library.faults);
         } else {
             library.faults.push_back({name, package.error().description()});
         }

@@ -191,8 +191,8 @@ class SyncRun {
         if (!placeholders) return unusable(placeholders.error());
         status = removeStaleTransfers(*device_, standing_.arrived);
         if (status && !arguments_.isStaged) status = writeStagingArea(*device_, plan_, library_);
-        if (!status) return status.error().withContext("cannot prepare the device for the sync");
-        return {};
+        if (status) return {};
+        return unusable(status.error().withContext("cannot prepare the device for the sync"));
     }
 
     Result<int> hold() {

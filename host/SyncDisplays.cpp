@@ -206,14 +206,15 @@ std::string eventLine(const SyncEvent& event) {
 }
 
 std::string eventBar(const SyncEvent& event, std::size_t width) {
-    const std::string phase = fitted(nameOf(event.phase), kPhaseWidth);
+    std::string bar = fitted(nameOf(event.phase), kPhaseWidth);
     const std::string name = printable(event.identifier);
     const std::vector<std::string> states = barStates(event, width);
     for (const std::string& state : states) {
         const std::size_t taken = displayWidth(state) + 1;
         if (taken + kPhaseWidth + kShortNameWidth <= width) {
             const std::size_t room = std::min(width - taken - kPhaseWidth, kNameWidth);
-            return phase + fitted(name, room) + " " + state;
+            bar.append(fitted(name, room)).append(" ").append(state);
+            return bar;
         }
     }
     const std::string& shortest = states.back();

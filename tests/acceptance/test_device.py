@@ -394,3 +394,16 @@ def test_a_database_that_lacks_a_table_is_damaged(appsync, device, library, tabl
     done = appsync("sync", device.path, library, expect=3)
     assert "is damaged" in done.stderr
     assert done.stderr.count("\n") == 1
+
+
+def test_every_command_calls_a_damaged_database_unusable(appsync, device, library):
+    device.sync(library)
+    path = os.path.join(device.path, "device.db")
+    with sqlite3.connect(path) as database:
+        database.execute("PRAGMA wal_checkpoint(TRUNCATE)")
+    database.close()
+    with open(path, "r+b") as file:
+        file.seek(8192)
+        file.write(os.urandom(16384))
+    for command in ("uninstall", "run", "quit", "why"):
+        one_line(appsync(command, device.path, "com.example.app00", expect=3))

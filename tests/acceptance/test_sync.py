@@ -195,3 +195,15 @@ def test_link_in_the_place_of_the_staging_area_is_cleared(device, library):
     os.makedirs(staging, exist_ok=True)
     os.symlink("/nonexistent", os.path.join(staging, "ApplicationSync"))
     assert names_of(device.sync(library)["installed"]) == IDS
+
+
+def test_application_named_like_a_file_of_the_staging_area_fails_alone(device, tmp_path):
+    library = tmp_path / "named"
+    library.mkdir()
+    for identifier in ("com.example.good", "ApplicationsSync.plist", "DeskoraIconState.plist"):
+        packages.make_package(str(library), identifier)
+    (library / "IconOrder.plist").write_bytes(plistlib.dumps(["com.example.good"]))
+    result = device.sync(str(library), expect=1)
+    assert names_of(result["installed"]) == ["com.example.good"]
+    assert len(result["failed"]) == 2
+    assert all("another identifier" in failed["error"] for failed in result["failed"])
