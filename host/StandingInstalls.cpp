@@ -26,7 +26,9 @@ bool hasPackage(const CoordinatorRecord& coordinator) {
 
 class TakingUp {
   public:
-    TakingUp(SyncPlan& plan, const std::vector<ApplicationRecord>& present) : plan_(plan) {
+    TakingUp(SyncPlan& plan, const std::vector<ApplicationRecord>& present,
+             const StandingRules& rules)
+        : plan_(plan), rules_(rules) {
         for (const ApplicationRecord& record : present) {
             if (!record.isPlaceholder) installed_.insert(record.identifier);
             if (record.isPlaceholder && record.installType == kInstallTypeSync) {
@@ -63,6 +65,7 @@ class TakingUp {
     }
 
     bool goesOn(const CoordinatorRecord& coordinator) {
+        if (rules_.isForbidden) return false;
         const std::string& identifier = coordinator.identifier;
         const bool isUpdate = installed_.contains(identifier);
         if (isUpdate != (coordinator.kind == kUpdating)) return false;
@@ -71,8 +74,13 @@ class TakingUp {
         if (isRemoved) return false;
         const PlannedInstall* planned = find(identifier);
         if (!hasPackage(coordinator)) return planned != nullptr;
-        return planned == nullptr || planned->newVersion.empty() ||
-               expectedVersions_[identifier] == planned->newVersion;
+        if (planned == nullptr) return !isUnwanted(identifier);
+        return planned->newVersion.empty() || expectedVersions_[identifier] == planned->newVersion;
+    }
+
+    [[nodiscard]] bool isUnwanted(const std::string& identifier) const {
+        return plan_.absent.contains(identifier) ||
+               (rules_.isUnwanted && rules_.isUnwanted(identifier));
     }
 
     void leaveTo(const CoordinatorRecord& coordinator) {
@@ -86,6 +94,7 @@ class TakingUp {
     }
 
     SyncPlan& plan_;
+    const StandingRules& rules_;
     std::set<std::string> installed_;
     std::map<std::string, std::string> expectedVersions_;  // of what is to come
     StandingInstalls standing_;
@@ -100,8 +109,8 @@ std::string heldSentence(CoordinationClient client) {
 }
 
 StandingInstalls takeUp(SyncPlan& plan, const std::vector<CoordinatorRecord>& coordinators,
-                        const std::vector<ApplicationRecord>& present) {
-    TakingUp takingUp(plan, present);
+                        const std::vector<ApplicationRecord>& present, const StandingRules& rules) {
+    TakingUp takingUp(plan, present, rules);
     for (const CoordinatorRecord& coordinator : coordinators) takingUp.add(coordinator);
     return takingUp.take();
 }

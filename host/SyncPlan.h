@@ -1,6 +1,7 @@
 #pragma once
 
 #include <cstdint>
+#include <set>
 #include <string>
 #include <string_view>
 #include <vector>
@@ -60,6 +61,8 @@ struct SyncPlan {
     std::vector<PlannedInstall> install;
     std::vector<PlannedInstall> update;
     std::vector<std::string> remove;
+    /// To be removed as well, and not on the device: no install of these may bring them there.
+    std::set<std::string> absent;
     std::vector<PlannedSkip> skipped;
     /// What is asked for but cannot even be tried.
     std::vector<SyncFailure> failed;

@@ -2,7 +2,9 @@
 
 import json
 import os
+import shutil
 import signal
+import sqlite3
 import time
 
 import pytest
@@ -221,6 +223,58 @@ def interrupted(appsync, device, large_library):
     sync.communicate()
     assert sorted(coordinators(device)) == [A, B]
     return large_library
+
+
+def deliver(device, library, identifier):
+    """The package arrives as the session dies: its install has not begun."""
+    place = STAGING + "/" + identifier + ".zip"
+    shutil.copyfile(os.path.join(library, identifier + ".zip"), device.inside(place))
+    with sqlite3.connect(os.path.join(device.path, "device.db")) as database:
+        changed = database.execute(
+            "UPDATE promises SET complete = 1, percent = 1000, path = ? WHERE name = ?",
+            (place, identifier + "-Asset")).rowcount
+    database.close()
+    assert changed == 1
+
+
+@pytest.fixture
+def delivered(device, interrupted):
+    """The same library; the package of B had arrived whole."""
+    deliver(device, interrupted, B)
+    return interrupted
+
+
+def test_what_had_arrived_is_not_installed_when_it_is_to_be_removed(appsync, device, delivered):
+    plan = appsync.json("plan", device.path, delivered, "--remove", B)
+    assert names_of(plan["install"]) == [A] and plan["update"] == plan["remove"] == []
+    result = device.sync(delivered, "--remove", B)
+    assert result["installed"] == [A] and names_of(result["skipped"]) == [B]
+    assert list(device.apps()) == [A] and device.placeholders() == [] and coordinators(device) == {}
+    assert os.listdir(device.inside(STAGING)) == []
+
+
+def test_a_mirror_does_not_install_what_had_arrived_and_the_library_lacks(device, delivered):
+    os.remove(os.path.join(delivered, B + ".zip"))
+    assert device.sync(delivered, "--mirror")["installed"] == [A]
+    assert list(device.apps()) == [A] and device.placeholders() == [] and coordinators(device) == {}
+
+
+def test_a_todo_list_that_removes_what_had_arrived_keeps_it_away(device, delivered):
+    stage(device, [remove(B)])
+    assert device.sync(delivered, "--staged")["installed"] == []
+    assert device.apps() == {} and coordinators(device) == {}
+
+
+def test_policy_keeps_what_had_arrived_from_being_installed(appsync, device, delivered):
+    appsync("set", device.path, "installation=no")
+    result = device.sync(delivered, expect=1)
+    assert result["installed"] == [] and names_of(result["skipped"]) == [A, B]
+    assert device.apps() == {} and device.placeholders() == [] and coordinators(device) == {}
+
+
+def test_what_had_arrived_is_installed_though_the_library_lacks_it(device, delivered):
+    os.remove(os.path.join(delivered, B + ".zip"))
+    assert names_of(device.sync(delivered)["installed"]) == [A, B]
 
 
 def test_why_names_the_promise_that_is_missing(appsync, device, interrupted):

@@ -50,8 +50,9 @@ class StandingInstallsTest : public testing::Test {
         plan.install.push_back({identifier, "", "", version, 100, 300});
     }
 
-    StandingInstalls taken() { return takeUp(plan, coordinators, present); }
+    StandingInstalls taken() { return takeUp(plan, coordinators, present, rules); }
 
+    StandingRules rules;
     SyncPlan plan;
     std::vector<CoordinatorRecord> coordinators;
     std::vector<ApplicationRecord> present;
@@ -107,6 +108,47 @@ TEST_F(StandingInstallsTest, WhatIsToBeRemovedIsObsolete) {
     installed("com.a");
     stands("com.a", true).kind = "updating";
     EXPECT_THAT(taken().obsolete, ElementsAre("com.a"));
+}
+
+TEST_F(StandingInstallsTest, WhatIsToBeAbsentIsObsoleteThoughItHasArrived) {
+    plan.absent = {"com.a"};
+    stands("com.a", true);
+    const StandingInstalls standing = taken();
+    EXPECT_THAT(standing.obsolete, ElementsAre("com.a"));
+    EXPECT_THAT(standing.arrived, IsEmpty());
+}
+
+TEST_F(StandingInstallsTest, WhatIsRemovedAndInstalledAnewGoesOn) {
+    plan.absent = {"com.a"};
+    planInstall("com.a", "2");
+    placeholder("com.a", "2");
+    stands("com.a", true);
+    EXPECT_THAT(taken().arrived, ElementsAre("com.a"));
+}
+
+TEST_F(StandingInstallsTest, WhatIsUnwantedIsObsoleteUnlessThePlanAsksForIt) {
+    planInstall("com.a", "2");
+    placeholder("com.a", "2");
+    stands("com.a", true);
+    stands("com.b", true);
+    rules.isUnwanted = [](const std::string&) { return true; };
+    const StandingInstalls standing = taken();
+    EXPECT_THAT(standing.obsolete, ElementsAre("com.b"));
+    EXPECT_THAT(standing.arrived, ElementsAre("com.a"));
+}
+
+TEST_F(StandingInstallsTest, NothingGoesOnWhereInstallingIsForbidden) {
+    planInstall("com.a", "2");
+    placeholder("com.a", "2");
+    stands("com.a", true);
+    installed("com.b");
+    stands("com.b", true).kind = "updating";
+    stands("com.c", true).kind = "restoring";
+    rules.isForbidden = true;
+    const StandingInstalls standing = taken();
+    EXPECT_THAT(standing.obsolete, ElementsAre("com.a", "com.b"));
+    EXPECT_THAT(standing.arrived, IsEmpty());
+    EXPECT_FALSE(plan.install[0].hasArrived);
 }
 
 TEST_F(StandingInstallsTest, ACoordinatorOfTheWrongKindIsObsolete) {
