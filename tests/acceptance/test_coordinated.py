@@ -330,6 +330,34 @@ def test_interrupt_while_a_coordinated_install_waits(appsync, device, library, w
     assert device.sync(library)["updated"] == [A]
 
 
+@pytest.fixture(scope="module")
+def stored_library(tmp_path_factory):
+    """Six packages whose installs take a while."""
+    library = str(tmp_path_factory.mktemp("stored"))
+    for number in range(6):
+        packages.make_package(library, "com.example.large%d" % number, payload=os.urandom(15 << 20))
+    return library
+
+
+@pytest.mark.parametrize("moment", [1, 2, 3])
+def test_the_summary_of_an_interruption_is_what_the_device_holds(appsync, device, stored_library, moment):
+    sync = appsync.start("sync", device.path, stored_library, "--json-lines")
+    sent = 0
+    for line in sync.stdout:
+        event = json.loads(line)
+        sent += event["event"] == "ended" and event["phase"] == "transfer"
+        if sent == moment:
+            break
+    sync.send_signal(signal.SIGINT)
+    out, _ = sync.communicate(timeout=60)
+    summary = json.loads(out.splitlines()[-1])
+    assert sync.returncode == 1
+    assert names_of(summary["installed"]) == sorted(device.apps())
+    assert not set(names_of(summary["failed"])) & set(device.apps())
+    device.sync(stored_library)
+    assert len(device.apps()) == 6 and device.placeholders() == []
+
+
 def test_removals_are_done_when_the_sync_ends(appsync, device, library):
     device.sync(library)
     for identifier in (A, B):
