@@ -30,7 +30,9 @@ class TakingUp {
              const StandingRules& rules)
         : plan_(plan), rules_(rules) {
         for (const ApplicationRecord& record : present) {
-            if (!record.isPlaceholder) installed_.insert(record.identifier);
+            if (!record.isPlaceholder) {
+                installed_[record.identifier] = record.version.value_or("");
+            }
             if (record.isPlaceholder && record.installType == kInstallTypeSync) {
                 expectedVersions_[record.identifier] = record.version.value_or("");
             }
@@ -47,6 +49,8 @@ class TakingUp {
             if (PlannedInstall* planned = find(coordinator.identifier)) {
                 planned->hasArrived = true;
                 planned->isInstalledUnasked = coordinator.isComplete;
+            } else if (coordinator.isComplete) {
+                addLeftOver(coordinator.identifier);
             }
         }
     }
@@ -83,6 +87,17 @@ class TakingUp {
                (rules_.isUnwanted && rules_.isUnwanted(identifier));
     }
 
+    void addLeftOver(const std::string& identifier) {
+        PlannedInstall planned;
+        planned.identifier = identifier;
+        planned.newVersion = expectedVersions_[identifier];
+        planned.hasArrived = planned.isInstalledUnasked = planned.isLeftOver = true;
+        const auto installed = installed_.find(identifier);
+        const bool isUpdate = installed != installed_.end();
+        if (isUpdate) planned.oldVersion = installed->second;
+        (isUpdate ? plan_.update : plan_.install).push_back(std::move(planned));
+    }
+
     void leaveTo(const CoordinatorRecord& coordinator) {
         if (find(coordinator.identifier) == nullptr) return;
         for (auto* installs : {&plan_.install, &plan_.update}) {
@@ -95,7 +110,7 @@ class TakingUp {
 
     SyncPlan& plan_;
     const StandingRules& rules_;
-    std::set<std::string> installed_;
+    std::map<std::string, std::string> installed_;         // versions
     std::map<std::string, std::string> expectedVersions_;  // of what is to come
     StandingInstalls standing_;
 };

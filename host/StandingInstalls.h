@@ -35,8 +35,9 @@ struct StandingRules {
 /// Why an application is left to another client.
 [[nodiscard]] std::string heldSentence(CoordinationClient client);
 
-/// Holds the plan against the coordinators that stand. Marks in it what has arrived, and skips what
-/// another client has in hand. `present` is everything that the device holds.
+/// Holds the plan against the coordinators that stand. Marks in it what has arrived, adds what the
+/// device installs though the plan has not asked for it, and skips what another client has in hand.
+/// `present` is everything that the device holds.
 ///
 /// A coordinator of the sync client goes on where the plan still asks for the same version of the
 /// same application; one whose package has arrived also where the plan asks for nothing, as the

@@ -34,6 +34,7 @@ struct PlannedInstall {
     std::uint64_t unpackedBytes = 0;  // that it takes when installed
     bool hasArrived = false;          // its package is on the device already, and travels no more
     bool isInstalledUnasked = false;  // the device installs it with nothing more being done
+    bool isLeftOver = false;          // only an earlier session has asked for it
 };
 
 /// Why policy keeps something from being done.

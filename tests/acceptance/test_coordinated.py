@@ -191,6 +191,29 @@ def test_an_update_that_waits_goes_on_in_the_next_session(appsync, device, libra
     assert device.placeholders() == [] and coordinators(device) == {}
 
 
+def test_an_update_that_goes_on_is_an_update_though_the_library_lacks_it(
+        appsync, device, library, waiting_update):
+    waiting_update.kill()
+    waiting_update.communicate()
+    appsync("quit", device.path, A)
+    os.remove(os.path.join(library, A + ".zip"))
+    plan = appsync.json("plan", device.path, library)
+    assert names_of(plan["update"]) == [A] and plan["install"] == []
+    result = device.sync(library)
+    assert result["updated"] == [A] and result["installed"] == [] and result["bytes"] == 0
+    assert device.versions()[A] == "2.0" and coordinators(device) == {}
+
+
+def test_an_update_that_goes_on_beside_a_package_sent_is_an_update(
+        appsync, device, library, waiting_update, tmp_path):
+    waiting_update.kill()
+    waiting_update.communicate()
+    appsync("quit", device.path, A)
+    package = packages.make_package(str(tmp_path / "sent"), B, "2.0")
+    result = appsync.json("send", device.path, B, package)
+    assert names_of(result["updated"]) == [A, B] and result["installed"] == []
+
+
 def test_an_update_that_still_waits_is_not_asked_for_again(appsync, device, library, waiting_update):
     waiting_update.kill()
     waiting_update.communicate()

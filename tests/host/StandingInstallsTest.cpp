@@ -110,6 +110,25 @@ TEST_F(StandingInstallsTest, WhatIsToBeRemovedIsObsolete) {
     EXPECT_THAT(taken().obsolete, ElementsAre("com.a"));
 }
 
+TEST_F(StandingInstallsTest, ThePlanNamesWhatTheDeviceInstallsUnasked) {
+    placeholder("com.a", "2");
+    stands("com.a", true);
+    installed("com.b");
+    placeholder("com.b", "3");
+    stands("com.b", true).kind = "updating";
+    stands("com.c", true).isComplete = false;
+    EXPECT_THAT(taken().arrived, ElementsAre("com.a", "com.b", "com.c"));
+    ASSERT_EQ(plan.install.size(), 1U);
+    EXPECT_EQ(plan.install[0].identifier, "com.a");
+    EXPECT_EQ(plan.install[0].newVersion, "2");
+    ASSERT_EQ(plan.update.size(), 1U);
+    EXPECT_EQ(plan.update[0].identifier, "com.b");
+    EXPECT_EQ(plan.update[0].oldVersion, "1");
+    EXPECT_EQ(plan.update[0].newVersion, "3");
+    EXPECT_EQ(plan.needed(), 0U);
+    EXPECT_THAT(todoListOf(plan).elements(), IsEmpty());
+}
+
 TEST_F(StandingInstallsTest, WhatIsToBeAbsentIsObsoleteThoughItHasArrived) {
     plan.absent = {"com.a"};
     stands("com.a", true);
