@@ -124,6 +124,7 @@ class SyncRun {
             options.bringsOffloaded = settings->coordination;
             plan_ = makePlan(library_, *present, options);
         }
+        if (!settings->coordination) return {};  // a session begins by dropping what stands
         const Result<std::vector<CoordinatorRecord>> coordinators = device_->coordinators();
         if (!coordinators) return unusable(coordinators.error());
         standing_ = takeUp(plan_, *coordinators, *present, standingRules(*settings));

@@ -295,6 +295,14 @@ def test_policy_keeps_what_had_arrived_from_being_installed(appsync, device, del
     assert device.apps() == {} and device.placeholders() == [] and coordinators(device) == {}
 
 
+def test_a_plan_counts_on_nothing_that_stands_where_coordination_was_turned_off(
+        appsync, device, delivered):
+    os.remove(os.path.join(delivered, B + ".zip"))
+    appsync("set", device.path, "coordination=off")
+    assert names_of(appsync.json("plan", device.path, delivered)["install"]) == [A]
+    assert device.sync(delivered)["installed"] == [A]
+
+
 def test_what_had_arrived_is_installed_though_the_library_lacks_it(device, delivered):
     os.remove(os.path.join(delivered, B + ".zip"))
     assert names_of(device.sync(delivered)["installed"]) == [A, B]
