@@ -227,6 +227,8 @@ const SessionEnd& Session::end(bool transfersSucceeded, const std::vector<std::s
     end_.isInterrupted = stopRequested_;
     const bool isSuccess = end_.isSuccess();
     client_.syncEndedWithSuccess(isSuccess);
+    // What is being installed at this moment ends here; whoever looks at the device then sees it.
+    if (end_.isInterrupted && watch_.isCoordinated()) device_.closeCoordination();
     if (!isSuccess) return end_;
     const Status written = writeLastSyncState(device_, known);
     if (!written) end_.error = written.error();

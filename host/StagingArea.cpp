@@ -55,8 +55,11 @@ class StagingWriter {
         status_ = device_.files().createDirectory(directory_, true, &kMobile);
         addTodoList(plan);
         if (library.iconOrder) add("DeskoraIconState.plist", *library.iconOrder);
-        for (const PlannedInstall& each : plan.install) addApplication(library, each.identifier);
-        for (const PlannedInstall& each : plan.update) addApplication(library, each.identifier);
+        for (const auto* installs : {&plan.install, &plan.update}) {
+            for (const PlannedInstall& each : *installs) {
+                if (!each.isLeftOver) addApplication(library, each.identifier);
+            }
+        }
         return status_;
     }
 
@@ -173,8 +176,11 @@ std::size_t installsIn(const PropertyList& todoList) {
 PropertyList todoListOf(const SyncPlan& plan) {
     PropertyList list = PropertyList::array(plan.remove.size() + plan.install.size());
     for (const std::string& identifier : plan.remove) list.append(todoEntry(identifier, "remove"));
-    for (const PlannedInstall& each : plan.install) list.append(installEntry(each));
-    for (const PlannedInstall& each : plan.update) list.append(installEntry(each));
+    for (const auto* installs : {&plan.install, &plan.update}) {
+        for (const PlannedInstall& each : *installs) {
+            if (!each.isLeftOver) list.append(installEntry(each));
+        }
+    }
     return list;
 }
 

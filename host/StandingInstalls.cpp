@@ -26,9 +26,13 @@ bool hasPackage(const CoordinatorRecord& coordinator) {
 
 class TakingUp {
   public:
-    TakingUp(SyncPlan& plan, const std::vector<ApplicationRecord>& present) : plan_(plan) {
+    TakingUp(SyncPlan& plan, const std::vector<ApplicationRecord>& present,
+             const StandingRules& rules)
+        : plan_(plan), rules_(rules) {
         for (const ApplicationRecord& record : present) {
-            if (!record.isPlaceholder) installed_.insert(record.identifier);
+            if (!record.isPlaceholder) {
+                installed_[record.identifier] = record.version.value_or("");
+            }
             if (record.isPlaceholder && record.installType == kInstallTypeSync) {
                 expectedVersions_[record.identifier] = record.version.value_or("");
             }
@@ -45,6 +49,8 @@ class TakingUp {
             if (PlannedInstall* planned = find(coordinator.identifier)) {
                 planned->hasArrived = true;
                 planned->isInstalledUnasked = coordinator.isComplete;
+            } else if (coordinator.isComplete) {
+                addLeftOver(coordinator.identifier);
             }
         }
     }
@@ -63,6 +69,7 @@ class TakingUp {
     }
 
     bool goesOn(const CoordinatorRecord& coordinator) {
+        if (rules_.isForbidden) return false;
         const std::string& identifier = coordinator.identifier;
         const bool isUpdate = installed_.contains(identifier);
         if (isUpdate != (coordinator.kind == kUpdating)) return false;
@@ -71,8 +78,24 @@ class TakingUp {
         if (isRemoved) return false;
         const PlannedInstall* planned = find(identifier);
         if (!hasPackage(coordinator)) return planned != nullptr;
-        return planned == nullptr || planned->newVersion.empty() ||
-               expectedVersions_[identifier] == planned->newVersion;
+        if (planned == nullptr) return !isUnwanted(identifier);
+        return planned->newVersion.empty() || expectedVersions_[identifier] == planned->newVersion;
+    }
+
+    [[nodiscard]] bool isUnwanted(const std::string& identifier) const {
+        return plan_.absent.contains(identifier) ||
+               (rules_.isUnwanted && rules_.isUnwanted(identifier));
+    }
+
+    void addLeftOver(const std::string& identifier) {
+        PlannedInstall planned;
+        planned.identifier = identifier;
+        planned.newVersion = expectedVersions_[identifier];
+        planned.hasArrived = planned.isInstalledUnasked = planned.isLeftOver = true;
+        const auto installed = installed_.find(identifier);
+        const bool isUpdate = installed != installed_.end();
+        if (isUpdate) planned.oldVersion = installed->second;
+        (isUpdate ? plan_.update : plan_.install).push_back(std::move(planned));
     }
 
     void leaveTo(const CoordinatorRecord& coordinator) {
@@ -86,7 +109,8 @@ class TakingUp {
     }
 
     SyncPlan& plan_;
-    std::set<std::string> installed_;
+    const StandingRules& rules_;
+    std::map<std::string, std::string> installed_;         // versions
     std::map<std::string, std::string> expectedVersions_;  // of what is to come
     StandingInstalls standing_;
 };
@@ -100,8 +124,8 @@ std::string heldSentence(CoordinationClient client) {
 }
 
 StandingInstalls takeUp(SyncPlan& plan, const std::vector<CoordinatorRecord>& coordinators,
-                        const std::vector<ApplicationRecord>& present) {
-    TakingUp takingUp(plan, present);
+                        const std::vector<ApplicationRecord>& present, const StandingRules& rules) {
+    TakingUp takingUp(plan, present, rules);
     for (const CoordinatorRecord& coordinator : coordinators) takingUp.add(coordinator);
     return takingUp.take();
 }

@@ -1,5 +1,6 @@
 #pragma once
 
+#include <functional>
 #include <set>
 #include <string>
 #include <vector>
@@ -23,19 +24,30 @@ struct StandingInstalls {
     std::vector<std::string> obsolete;
 };
 
+/// What rules installs out that an earlier session has begun.
+struct StandingRules {
+    /// Device policy allows no install at all.
+    bool isForbidden = false;
+    /// Whether an application that the plan does not name must not come either. Nothing: none is.
+    std::function<bool(const std::string& identifier)> isUnwanted = nullptr;
+};
+
 /// Why an application is left to another client.
 [[nodiscard]] std::string heldSentence(CoordinationClient client);
 
-/// Holds the plan against the coordinators that stand. Marks in it what has arrived, and skips what
-/// another client has in hand. `present` is everything that the device holds.
+/// Holds the plan against the coordinators that stand. Marks in it what has arrived, adds what the
+/// device installs though the plan has not asked for it, and skips what another client has in hand.
+/// `present` is everything that the device holds.
 ///
 /// A coordinator of the sync client goes on where the plan still asks for the same version of the
 /// same application; one whose package has arrived also where the plan asks for nothing, as the
-/// device has promised the install to whoever looks at its home screen. Everything else of the sync
-/// client's is obsolete. Coordinators of a restore are nobody's business here.
+/// device has promised the install to whoever looks at its home screen; but not where the
+/// application is to be removed, or the rules are against it. Everything else of the sync client's
+/// is obsolete. Coordinators of a restore are nobody's business here.
 [[nodiscard]] StandingInstalls takeUp(SyncPlan& plan,
                                       const std::vector<CoordinatorRecord>& coordinators,
-                                      const std::vector<ApplicationRecord>& present);
+                                      const std::vector<ApplicationRecord>& present,
+                                      const StandingRules& rules = {});
 
 /// Cancels what is obsolete. One that has gone meanwhile is no failure.
 Status cancelObsolete(Device& device, const StandingInstalls& standing);

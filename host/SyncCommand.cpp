@@ -115,19 +115,31 @@ class SyncRun {
     Status makeThePlan() {
         const Result<std::vector<ApplicationRecord>> present = device_->applications();
         if (!present) return unusable(present.error());
+        const Result<DeviceSettings> settings = device_->settings();
+        if (!settings) return unusable(settings.error());
         if (arguments_.isStaged) {
             planStaged(*present);
         } else {
             PlanOptions options = arguments_.plan;
-            const Result<DeviceSettings> settings = device_->settings();
-            if (!settings) return unusable(settings.error());
             options.bringsOffloaded = settings->coordination;
             plan_ = makePlan(library_, *present, options);
         }
+        if (!settings->coordination) return {};  // a session begins by dropping what stands
         const Result<std::vector<CoordinatorRecord>> coordinators = device_->coordinators();
         if (!coordinators) return unusable(coordinators.error());
-        standing_ = takeUp(plan_, *coordinators, *present);
+        standing_ = takeUp(plan_, *coordinators, *present, standingRules(*settings));
         return {};
+    }
+
+    // What cannot be read in a mirrored library may be the package of any application.
+    [[nodiscard]] StandingRules standingRules(const DeviceSettings& settings) const {
+        StandingRules rules;
+        rules.isForbidden = settings.installation == PolicyAnswer::No;
+        if (!arguments_.plan.mirror || !library_.faults.empty()) return rules;
+        rules.isUnwanted = [this](const std::string& identifier) {
+            return library_.find(identifier) == nullptr;
+        };
+        return rules;
     }
 
     void planStaged(const std::vector<ApplicationRecord>& present) {

@@ -54,7 +54,9 @@ class Summarizer {
   private:
     void judge(const PlannedInstall& planned, std::vector<std::string>& done) {
         const auto found = versions_.find(planned.identifier);
-        const bool isThere = found != versions_.end() && facts_.wasInstalled(planned.identifier);
+        const bool isThere =
+            found != versions_.end() && (facts_.wasInstalled(planned.identifier) ||
+                                         hasComeUnseen(found->second != planned.oldVersion));
         if (isThere && (planned.newVersion.empty() || found->second == planned.newVersion)) {
             done.push_back(planned.identifier);
         } else if (isThere) {
@@ -71,9 +73,16 @@ class Summarizer {
         }
     }
 
+    // An interrupted session does not hear how everything ends that has begun; the device tells.
+    [[nodiscard]] bool hasComeUnseen(bool isChanged) const {
+        return aftermath_.isInterrupted && isChanged;
+    }
+
     void judgeRemoval(const std::string& identifier) {
-        const bool isGone = facts_.wasRemoved(identifier) &&
-                            (!present_.contains(identifier) || installs_.contains(identifier));
+        const bool isPresent = present_.contains(identifier);
+        const bool isGone = facts_.wasRemoved(identifier)
+                                ? !isPresent || installs_.contains(identifier)
+                                : hasComeUnseen(!isPresent);
         if (isGone) {
             summary_.removed.push_back(identifier);
         } else if (!present_.contains(identifier)) {

@@ -89,6 +89,7 @@ class Planner {
         if (!named_.insert(identifier).second) return;
         const auto found = present_.find(identifier);
         if (found == present_.end()) {
+            plan_.absent.insert(identifier);
             skip(identifier, "it is not on the device", false);
         } else if (found->second.isSystem()) {
             skip(identifier, "it belongs to the system", true);
@@ -197,6 +198,7 @@ class StagedPlanner {
         if (!removals_.insert(identifier).second) return;
         const auto found = present_.find(identifier);
         if (found == present_.end()) {
+            plan_.absent.insert(identifier);
             plan_.skipped.push_back({identifier, "it is not on the device", false});
             return;
         }

@@ -2,7 +2,9 @@
 
 import json
 import os
+import shutil
 import signal
+import sqlite3
 import time
 
 import pytest
@@ -189,6 +191,29 @@ def test_an_update_that_waits_goes_on_in_the_next_session(appsync, device, libra
     assert device.placeholders() == [] and coordinators(device) == {}
 
 
+def test_an_update_that_goes_on_is_an_update_though_the_library_lacks_it(
+        appsync, device, library, waiting_update):
+    waiting_update.kill()
+    waiting_update.communicate()
+    appsync("quit", device.path, A)
+    os.remove(os.path.join(library, A + ".zip"))
+    plan = appsync.json("plan", device.path, library)
+    assert names_of(plan["update"]) == [A] and plan["install"] == []
+    result = device.sync(library)
+    assert result["updated"] == [A] and result["installed"] == [] and result["bytes"] == 0
+    assert device.versions()[A] == "2.0" and coordinators(device) == {}
+
+
+def test_an_update_that_goes_on_beside_a_package_sent_is_an_update(
+        appsync, device, library, waiting_update, tmp_path):
+    waiting_update.kill()
+    waiting_update.communicate()
+    appsync("quit", device.path, A)
+    package = packages.make_package(str(tmp_path / "sent"), B, "2.0")
+    result = appsync.json("send", device.path, B, package)
+    assert names_of(result["updated"]) == [A, B] and result["installed"] == []
+
+
 def test_an_update_that_still_waits_is_not_asked_for_again(appsync, device, library, waiting_update):
     waiting_update.kill()
     waiting_update.communicate()
@@ -221,6 +246,66 @@ def interrupted(appsync, device, large_library):
     sync.communicate()
     assert sorted(coordinators(device)) == [A, B]
     return large_library
+
+
+def deliver(device, library, identifier):
+    """The package arrives as the session dies: its install has not begun."""
+    place = STAGING + "/" + identifier + ".zip"
+    shutil.copyfile(os.path.join(library, identifier + ".zip"), device.inside(place))
+    with sqlite3.connect(os.path.join(device.path, "device.db")) as database:
+        changed = database.execute(
+            "UPDATE promises SET complete = 1, percent = 1000, path = ? WHERE name = ?",
+            (place, identifier + "-Asset")).rowcount
+    database.close()
+    assert changed == 1
+
+
+@pytest.fixture
+def delivered(device, interrupted):
+    """The same library; the package of B had arrived whole."""
+    deliver(device, interrupted, B)
+    return interrupted
+
+
+def test_what_had_arrived_is_not_installed_when_it_is_to_be_removed(appsync, device, delivered):
+    plan = appsync.json("plan", device.path, delivered, "--remove", B)
+    assert names_of(plan["install"]) == [A] and plan["update"] == plan["remove"] == []
+    result = device.sync(delivered, "--remove", B)
+    assert result["installed"] == [A] and names_of(result["skipped"]) == [B]
+    assert list(device.apps()) == [A] and device.placeholders() == [] and coordinators(device) == {}
+    assert os.listdir(device.inside(STAGING)) == []
+
+
+def test_a_mirror_does_not_install_what_had_arrived_and_the_library_lacks(device, delivered):
+    os.remove(os.path.join(delivered, B + ".zip"))
+    assert device.sync(delivered, "--mirror")["installed"] == [A]
+    assert list(device.apps()) == [A] and device.placeholders() == [] and coordinators(device) == {}
+
+
+def test_a_todo_list_that_removes_what_had_arrived_keeps_it_away(device, delivered):
+    stage(device, [remove(B)])
+    assert device.sync(delivered, "--staged")["installed"] == []
+    assert device.apps() == {} and coordinators(device) == {}
+
+
+def test_policy_keeps_what_had_arrived_from_being_installed(appsync, device, delivered):
+    appsync("set", device.path, "installation=no")
+    result = device.sync(delivered, expect=1)
+    assert result["installed"] == [] and names_of(result["skipped"]) == [A, B]
+    assert device.apps() == {} and device.placeholders() == [] and coordinators(device) == {}
+
+
+def test_a_plan_counts_on_nothing_that_stands_where_coordination_was_turned_off(
+        appsync, device, delivered):
+    os.remove(os.path.join(delivered, B + ".zip"))
+    appsync("set", device.path, "coordination=off")
+    assert names_of(appsync.json("plan", device.path, delivered)["install"]) == [A]
+    assert device.sync(delivered)["installed"] == [A]
+
+
+def test_what_had_arrived_is_installed_though_the_library_lacks_it(device, delivered):
+    os.remove(os.path.join(delivered, B + ".zip"))
+    assert names_of(device.sync(delivered)["installed"]) == [A, B]
 
 
 def test_why_names_the_promise_that_is_missing(appsync, device, interrupted):
@@ -274,6 +359,34 @@ def test_interrupt_while_a_coordinated_install_waits(appsync, device, library, w
     assert "interrupted" in err and names_of(json.loads(out)["failed"]) == [A]
     appsync("quit", device.path, A)
     assert device.sync(library)["updated"] == [A]
+
+
+@pytest.fixture(scope="module")
+def stored_library(tmp_path_factory):
+    """Six packages whose installs take a while."""
+    library = str(tmp_path_factory.mktemp("stored"))
+    for number in range(6):
+        packages.make_package(library, "com.example.large%d" % number, payload=os.urandom(15 << 20))
+    return library
+
+
+@pytest.mark.parametrize("moment", [1, 2, 3])
+def test_the_summary_of_an_interruption_is_what_the_device_holds(appsync, device, stored_library, moment):
+    sync = appsync.start("sync", device.path, stored_library, "--json-lines")
+    sent = 0
+    for line in sync.stdout:
+        event = json.loads(line)
+        sent += event["event"] == "ended" and event["phase"] == "transfer"
+        if sent == moment:
+            break
+    sync.send_signal(signal.SIGINT)
+    out, _ = sync.communicate(timeout=60)
+    summary = json.loads(out.splitlines()[-1])
+    assert sync.returncode == 1
+    assert names_of(summary["installed"]) == sorted(device.apps())
+    assert not set(names_of(summary["failed"])) & set(device.apps())
+    device.sync(stored_library)
+    assert len(device.apps()) == 6 and device.placeholders() == []
 
 
 def test_removals_are_done_when_the_sync_ends(appsync, device, library):

@@ -50,8 +50,9 @@ class StandingInstallsTest : public testing::Test {
         plan.install.push_back({identifier, "", "", version, 100, 300});
     }
 
-    StandingInstalls taken() { return takeUp(plan, coordinators, present); }
+    StandingInstalls taken() { return takeUp(plan, coordinators, present, rules); }
 
+    StandingRules rules;
     SyncPlan plan;
     std::vector<CoordinatorRecord> coordinators;
     std::vector<ApplicationRecord> present;
@@ -107,6 +108,66 @@ TEST_F(StandingInstallsTest, WhatIsToBeRemovedIsObsolete) {
     installed("com.a");
     stands("com.a", true).kind = "updating";
     EXPECT_THAT(taken().obsolete, ElementsAre("com.a"));
+}
+
+TEST_F(StandingInstallsTest, ThePlanNamesWhatTheDeviceInstallsUnasked) {
+    placeholder("com.a", "2");
+    stands("com.a", true);
+    installed("com.b");
+    placeholder("com.b", "3");
+    stands("com.b", true).kind = "updating";
+    stands("com.c", true).isComplete = false;
+    EXPECT_THAT(taken().arrived, ElementsAre("com.a", "com.b", "com.c"));
+    ASSERT_EQ(plan.install.size(), 1U);
+    EXPECT_EQ(plan.install[0].identifier, "com.a");
+    EXPECT_EQ(plan.install[0].newVersion, "2");
+    ASSERT_EQ(plan.update.size(), 1U);
+    EXPECT_EQ(plan.update[0].identifier, "com.b");
+    EXPECT_EQ(plan.update[0].oldVersion, "1");
+    EXPECT_EQ(plan.update[0].newVersion, "3");
+    EXPECT_EQ(plan.needed(), 0U);
+    EXPECT_THAT(todoListOf(plan).elements(), IsEmpty());
+}
+
+TEST_F(StandingInstallsTest, WhatIsToBeAbsentIsObsoleteThoughItHasArrived) {
+    plan.absent = {"com.a"};
+    stands("com.a", true);
+    const StandingInstalls standing = taken();
+    EXPECT_THAT(standing.obsolete, ElementsAre("com.a"));
+    EXPECT_THAT(standing.arrived, IsEmpty());
+}
+
+TEST_F(StandingInstallsTest, WhatIsRemovedAndInstalledAnewGoesOn) {
+    plan.absent = {"com.a"};
+    planInstall("com.a", "2");
+    placeholder("com.a", "2");
+    stands("com.a", true);
+    EXPECT_THAT(taken().arrived, ElementsAre("com.a"));
+}
+
+TEST_F(StandingInstallsTest, WhatIsUnwantedIsObsoleteUnlessThePlanAsksForIt) {
+    planInstall("com.a", "2");
+    placeholder("com.a", "2");
+    stands("com.a", true);
+    stands("com.b", true);
+    rules.isUnwanted = [](const std::string&) { return true; };
+    const StandingInstalls standing = taken();
+    EXPECT_THAT(standing.obsolete, ElementsAre("com.b"));
+    EXPECT_THAT(standing.arrived, ElementsAre("com.a"));
+}
+
+TEST_F(StandingInstallsTest, NothingGoesOnWhereInstallingIsForbidden) {
+    planInstall("com.a", "2");
+    placeholder("com.a", "2");
+    stands("com.a", true);
+    installed("com.b");
+    stands("com.b", true).kind = "updating";
+    stands("com.c", true).kind = "restoring";
+    rules.isForbidden = true;
+    const StandingInstalls standing = taken();
+    EXPECT_THAT(standing.obsolete, ElementsAre("com.a", "com.b"));
+    EXPECT_THAT(standing.arrived, IsEmpty());
+    EXPECT_FALSE(plan.install[0].hasArrived);
 }
 
 TEST_F(StandingInstallsTest, ACoordinatorOfTheWrongKindIsObsolete) {

@@ -67,6 +67,25 @@ TEST_F(SyncOutcome, NamesWhatAnInterruptedSessionHadBrought) {
     EXPECT_FALSE(summary().incomplete);
 }
 
+TEST_F(SyncOutcome, AnInterruptionCountsWhatTheDeviceHasDoneUnseen) {
+    planInstall("com.a", "1");
+    planInstall("com.b", "1");
+    plan.update.push_back({"com.c", "", "1", "2", 0, 0});
+    plan.update.push_back({"com.d", "", "1", "2", 0, 0});
+    plan.remove = {"com.e", "com.f"};
+    present("com.a", "1");
+    present("com.c", "2");
+    present("com.d", "1");
+    present("com.f", "1");
+    aftermath.isInterrupted = true;
+    EXPECT_THAT(summary().installed, ElementsAre("com.a"));
+    EXPECT_THAT(summary().updated, ElementsAre("com.c"));
+    EXPECT_THAT(summary().removed, ElementsAre("com.e"));
+    std::vector<std::string> open;
+    for (const SyncFailure& each : summary().failed) open.push_back(each.identifier);
+    EXPECT_THAT(open, ElementsAre("com.f", "com.b", "com.d"));
+}
+
 TEST_F(SyncOutcome, NamesTheFirstCauseOfWhatIsNotThere) {
     planInstall("com.a", "1");
     facts.failed("com.a", "the package is damaged");
