@@ -30,6 +30,16 @@ std::optional<PropertyList> readMapFile(const Platform& platform, const std::str
     return *std::move(map);
 }
 
+std::optional<Result<PropertyList>> readListFile(const Platform& platform, std::string_view path,
+                                                 ErrorOut error) {
+    const Result<Bytes> bytes = platform.files.readFile(std::string(path));
+    if (!bytes && error != nullptr) *error = bytes.error();
+    if (!bytes || bytes->empty()) return std::nullopt;
+    Result<PropertyList> list = platform.propertyLists.parse(*bytes);
+    if (!list && error != nullptr) *error = list.error();
+    return list;
+}
+
 Status writePropertyListFile(const Platform& platform, const std::string& path,
                              const PropertyList& value, PropertyListFormat format) {
     const Result<Bytes> bytes = platform.propertyLists.serialize(value, format);

@@ -2,6 +2,7 @@
 
 #include <optional>
 #include <string>
+#include <string_view>
 
 #include "platform/Bytes.h"
 #include "platform/PropertyList.h"
@@ -15,6 +16,12 @@ struct Platform;
 /// The map that the bytes hold, either encoding. The reader's error, or one that says that they
 /// hold something else.
 [[nodiscard]] Result<PropertyList> parseMap(const Platform& platform, ByteView bytes);
+
+/// What a file of the plug-in's own holds: nothing when it is missing or empty, else what the
+/// reader says. An error, of reading the file or its contents, is left in `error` too.
+[[nodiscard]] std::optional<Result<PropertyList>> readListFile(const Platform& platform,
+                                                               std::string_view path,
+                                                               ErrorOut error);
 
 /// The map in a property-list file, either encoding. Nothing when the file is missing, cannot be
 /// read or parsed, or holds something else.

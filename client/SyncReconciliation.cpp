@@ -163,21 +163,17 @@ void AppsClient::clearUninstalledApps() {
 std::optional<PropertyList> AppsClient::_loadPlist(const Platform& platform, std::string_view path,
                                                    ErrorOut error) {
     const Log log(platform);
-    const Result<Bytes> bytes = platform.files.readFile(std::string(path));
-    if (!bytes && error != nullptr) *error = bytes.error();
-    if (!bytes || bytes->empty()) return std::nullopt;
-
-    Result<PropertyList> list = platform.propertyLists.parse(*bytes);
-    if (!list) {
-        if (error != nullptr) *error = list.error();
+    std::optional<Result<PropertyList>> list = readListFile(platform, path, error);
+    if (!list) return std::nullopt;
+    if (!*list) {
         log(Level::Error, "%s|couldn't parse todo list");
         return std::nullopt;
     }
-    if (!list->isArray()) {
+    if (!(*list)->isArray()) {
         log(Level::Error, "%s|todo list is not an array");
         return std::nullopt;
     }
-    return *std::move(list);
+    return **std::move(list);
 }
 
 void AppsClient::_notifyDeskora(const Platform& platform, bool starting) {

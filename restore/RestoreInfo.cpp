@@ -258,21 +258,17 @@ std::optional<PropertyList> AppsClient::_loadDemotedAppsPlist(const Platform& pl
                                                               std::string_view path,
                                                               ErrorOut error) {
     const Log log(platform);
-    const Result<Bytes> bytes = platform.files.readFile(std::string(path));
-    if (!bytes && error != nullptr) *error = bytes.error();
-    if (!bytes || bytes->empty()) return std::nullopt;
-
-    Result<PropertyList> list = platform.propertyLists.parse(*bytes);
-    if (!list) {
-        if (error != nullptr) *error = list.error();
+    std::optional<Result<PropertyList>> list = readListFile(platform, path, error);
+    if (!list) return std::nullopt;
+    if (!*list) {
         log(Level::Error, "%s|couldn't parse demoted apps list");
         return std::nullopt;
     }
-    if (!list->isMap()) {
+    if (!(*list)->isMap()) {
         log(Level::Error, "%s|demoted apps list is not a dictionary");
         return std::nullopt;
     }
-    return *std::move(list);
+    return **std::move(list);
 }
 
 }  // namespace appsync
