@@ -21,6 +21,9 @@ inline constexpr std::string_view BundleDisplayNameKey = "BundleDisplayName";
 inline constexpr std::string_view BundleExecutableKey = "BundleExecutable";
 inline constexpr std::string_view BundleIconFileKey = "BundleIconFile";
 
+/// The "phase" of the progress record of a whole install.
+inline constexpr std::uint64_t kWholeInstall = 0;
+
 /// Keys of install options. `BundleIdentifierKey` and "RGInstallType" (unsigned integer) are
 /// options too.
 inline constexpr std::string_view PackageTypeKey = "PackageType";
@@ -114,7 +117,7 @@ class AppRegistry {
     virtual void enumerateBundles(BundleType type, const ProxyCallback& callback) = 0;
 
     /// The install-progress record of an application or placeholder, fetched synchronously; null
-    /// when no install is under way for it. `phase` 0 asks for the record of the whole install.
+    /// when no install is under way for it. `phase`: of which of its phases, or `kWholeInstall`.
     [[nodiscard]] virtual std::shared_ptr<InstallProgressRecord> installProgress(
         const AppProxy& proxy, std::uint64_t phase) = 0;
 

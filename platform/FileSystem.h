@@ -28,6 +28,22 @@ struct ItemAttributes {
 /// may). Failures are errors of `kPosixErrorDomain` with the errno value and a sentence that names
 /// the operation and the path. Nothing but regular files is ever read or copied: a link at the end
 /// of a path is followed inside the root; a device or a pipe is refused without waiting on it.
+///
+/// The end of the process, however it comes, undoes nothing that a call has done. A loss of power
+/// may undo what was done since the device last synced its files, which it does with the install of
+/// each application and at the end of a session, and nobody else has to:
+///
+/// - `writeFileAtomically` leaves the old file or the new one, whole. Only the contents are synced:
+///   the old file may come back.
+/// - `createFile` and `copyItem` leave what was there before, or the new file, or a part of it: cut
+///   off, empty, or with zeros for what is missing.
+/// - `createDirectory`, `moveItem` and `removeItem` are done or not; an item that is moved is in
+/// one
+///   of the two places. Of a directory with contents a part may be removed.
+/// - What was done later may stay although what was done before it is undone.
+///
+/// Both may leave temporary files (`.<name>.appsync-` and six characters) beside a file that was
+/// being written; the device clears them when it is next opened, wherever the plug-in writes.
 class FileSystem {
   public:
     virtual ~FileSystem() = default;
@@ -41,8 +57,8 @@ class FileSystem {
     virtual Status createDirectory(const std::string& path, bool withIntermediates,
                                    const FileAttributes* attributes) = 0;
 
-    /// Removes a file, a link (not what it points to) or a directory with everything in it. ENOENT
-    /// when there is none.
+    /// Removes a file, a link (not what it points to) or a directory with everything in it, which
+    /// is not one step: a failure or a crash may leave a part. ENOENT when there is none.
     virtual Status removeItem(const std::string& path) = 0;
 
     /// Renames. EEXIST when something stands at `to`.
@@ -59,7 +75,8 @@ class FileSystem {
     /// file stays for good.
     virtual Status writeFileAtomically(const std::string& path, ByteView contents) = 0;
 
-    /// Creates or replaces a file, not atomically. `attributes` as with directories.
+    /// Creates or replaces a file, not atomically: nothing is synced. `attributes` as with
+    /// directories.
     virtual Status createFile(const std::string& path, ByteView contents,
                               const FileAttributes& attributes) = 0;
 

@@ -88,7 +88,7 @@ class InstallCoordinatorService {
     /// From now on the delegate, held weakly, hears of every coordinator that one of the clients
     /// has created and that has no observer of its own: what the service went on with before
     /// anybody looked at it is told here. `serviceName` is the name under which the delegate can be
-    /// reached.
+    /// reached. Null when that cannot be; it may be asked for again.
     [[nodiscard]] virtual std::shared_ptr<AppInstallObserver> makeAppInstallObserver(
         const std::string& serviceName, const std::set<CoordinationClient>& clients,
         std::weak_ptr<InstallCoordinatorObserver> delegate) = 0;

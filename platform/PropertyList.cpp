@@ -81,14 +81,10 @@ struct PropertyList::MapStorage {
 
     void add(std::string_view key, PropertyList&& value) {
         if (index.empty() && entries.size() == kLinearEntries) indexAllEntries();
+        const bool isIndexed = !index.empty();
+        if (isIndexed) index.makeRoom();
         entries.push_back({std::string(key), std::move(value)});
-        if (index.empty()) return;
-        try {
-            index.add(PropertyListKeyIndex::hashOf(key), entries.size() - 1);
-        } catch (...) {
-            entries.pop_back();
-            throw;
-        }
+        if (isIndexed) index.add(PropertyListKeyIndex::hashOf(key), entries.size() - 1);
     }
 
     void indexAllEntries() {
@@ -364,6 +360,11 @@ const std::string* PropertyList::findString(std::string_view key) const noexcept
     return value != nullptr ? value->asString() : nullptr;
 }
 
+bool PropertyList::findFlag(std::string_view key) const noexcept {
+    const PropertyList* value = find(key);
+    return value != nullptr && value->booleanConversion().value_or(false);
+}
+
 bool PropertyList::set(std::string_view key, PropertyList value) {
     MapStorage* map = mapStorage();
     if (map == nullptr || !value.fitsInContainer()) return false;
@@ -421,10 +422,6 @@ bool operator==(const PropertyList& left, const PropertyList& right) noexcept {
     }
     if (left.kind() != right.kind()) return false;
     switch (left.kind()) {
-        case PropertyList::Kind::Null:
-        case PropertyList::Kind::Integer:
-        case PropertyList::Kind::Unsigned:
-            return true;
         case PropertyList::Kind::Boolean:
             return left.asBoolean() == right.asBoolean();
         case PropertyList::Kind::Real:
@@ -439,8 +436,12 @@ bool operator==(const PropertyList& left, const PropertyList& right) noexcept {
             return std::ranges::equal(left.elements(), right.elements());
         case PropertyList::Kind::Map:
             return equalEntries(left, right);
+        case PropertyList::Kind::Null:
+        case PropertyList::Kind::Integer:  // compared above
+        case PropertyList::Kind::Unsigned:
+            break;
     }
-    return false;
+    return true;
 }
 
 }  // namespace appsync

@@ -149,6 +149,8 @@ class PropertyList {
     [[nodiscard]] const PropertyList* find(std::string_view key) const noexcept;
     /// The string at `key`; null when there is none or it is of another kind.
     [[nodiscard]] const std::string* findString(std::string_view key) const noexcept;
+    /// The boolean conversion of what is at `key`; false when there is none.
+    [[nodiscard]] bool findFlag(std::string_view key) const noexcept;
     /// Replaces the value in place, or adds the entry at the end.
     bool set(std::string_view key, PropertyList value);
     /// Moves the value out and leaves the null marker in its place (the entry stays, in its place).

@@ -11,26 +11,10 @@ namespace appsync {
 
 namespace {
 
-struct HashKey {
-    std::uint64_t first = 0;
-    std::uint64_t second = 0;
-};
-
-HashKey drawHashKey() noexcept {
-    try {
-        std::random_device device;
-        const auto draw = [&device] { return std::uint64_t{device()} << 32U | device(); };
-        return {draw(), draw()};
-    } catch (const std::exception&) {
-        const auto now = std::chrono::steady_clock::now().time_since_epoch().count();
-        return {static_cast<std::uint64_t>(now), 0x9e3779b97f4a7c15U};
-    }
-}
-
 /// SipHash-1-3: short, and an attacker who does not know the key cannot make keys collide.
 class SipHash {
   public:
-    explicit SipHash(const HashKey& key) noexcept
+    explicit SipHash(const PropertyListKeyIndex::HashKey& key) noexcept
         : a_(key.first ^ 0x736f6d6570736575U),
           b_(key.second ^ 0x646f72616e646f6dU),
           c_(key.first ^ 0x6c7967656e657261U),
@@ -39,18 +23,29 @@ class SipHash {
     std::uint64_t operator()(std::string_view text) noexcept {
         const char* at = text.data();
         std::size_t left = text.size();
-        for (; left >= 8; at += 8, left -= 8) absorb(word(at, 8));
-        absorb(word(at, left) | std::uint64_t{text.size()} << 56U);
+        for (; left >= 8; at += 8, left -= 8) absorb(word<std::uint64_t>(at));
+        absorb(tail(at, left) | std::uint64_t{text.size()} << 56U);
         c_ ^= 0xffU;
         for (int i = 0; i < 3; ++i) round();
         return a_ ^ b_ ^ c_ ^ d_;
     }
 
   private:
-    static std::uint64_t word(const char* at, std::size_t size) noexcept {
-        std::uint64_t result = 0;
-        if (size != 0) std::memcpy(&result, at, size);
+    template <typename Word>
+    static std::uint64_t word(const char* at) noexcept {
+        Word result = 0;
+        std::memcpy(&result, at, sizeof(result));
         return result;
+    }
+
+    // At most 7 bytes. Loads of fixed sizes, two of which may overlap, cost less than a copy.
+    static std::uint64_t tail(const char* at, std::size_t size) noexcept {
+        if (size >= 4) {
+            return word<std::uint32_t>(at) | word<std::uint32_t>(at + size - 4) << 8 * (size - 4);
+        }
+        if (size == 0) return 0;
+        const auto byte = [at](std::size_t i) { return word<std::uint8_t>(at + i); };
+        return byte(0) | byte(size / 2) << 8 * (size / 2) | byte(size - 1) << 8 * (size - 1);
     }
 
     void absorb(std::uint64_t word) noexcept {
@@ -71,13 +66,28 @@ class SipHash {
 
 }  // namespace
 
+PropertyListKeyIndex::HashKey PropertyListKeyIndex::drawHashKey(
+    const std::function<std::uint32_t()>& random) noexcept {
+    try {
+        const auto draw = [&random] { return std::uint64_t{random()} << 32U | random(); };
+        return {draw(), draw()};
+    } catch (const std::exception&) {
+        const auto now = std::chrono::steady_clock::now().time_since_epoch().count();
+        return {static_cast<std::uint64_t>(now), 0x9e3779b97f4a7c15U};
+    }
+}
+
 std::uint32_t PropertyListKeyIndex::hashOf(std::string_view text) noexcept {
-    static const HashKey key = drawHashKey();
+    static const HashKey key = drawHashKey([] { return std::uint32_t{std::random_device()()}; });
     return static_cast<std::uint32_t>(SipHash(key)(text));
 }
 
-void PropertyListKeyIndex::add(std::uint32_t hash, std::size_t position) {
+void PropertyListKeyIndex::makeRoom() {
     if ((count_ + 1) * 2 > slots_.size()) grow();
+}
+
+void PropertyListKeyIndex::add(std::uint32_t hash, std::size_t position) {
+    makeRoom();
     place({hash, static_cast<std::uint32_t>(position)});
     ++count_;
 }

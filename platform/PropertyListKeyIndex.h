@@ -2,6 +2,7 @@
 
 #include <cstddef>
 #include <cstdint>
+#include <functional>
 #include <optional>
 #include <string_view>
 #include <vector>
@@ -20,6 +21,16 @@ class PropertyListKeyIndex {
 
     [[nodiscard]] static std::uint32_t hashOf(std::string_view text) noexcept;
 
+    /// What hashes are keyed with.
+    struct HashKey {
+        std::uint64_t first = 0;
+        std::uint64_t second = 0;
+        friend bool operator==(const HashKey&, const HashKey&) = default;
+    };
+    /// A new key of random numbers; where `random` throws, since there are none to be had, one that
+    /// changes with the clock.
+    [[nodiscard]] static HashKey drawHashKey(const std::function<std::uint32_t()>& random) noexcept;
+
     /// The position of `text`, whose hash is `hash`; `textAt(position)` gives a text that was
     /// added.
     template <typename TextAt>
@@ -34,13 +45,14 @@ class PropertyListKeyIndex {
         return std::nullopt;
     }
 
+    /// Has the next `add` need no memory, so that it cannot fail.
+    void makeRoom();
     /// Learns that a text of this hash stands at `position`. The text is not there yet.
     void add(std::uint32_t hash, std::size_t position);
 
     /// Forgets the text at `position`; those behind it have moved one forward.
     void erase(std::size_t position);
 
-    void clear() noexcept { slots_.clear(), count_ = 0; }
     [[nodiscard]] bool empty() const noexcept { return count_ == 0; }
 
   private:

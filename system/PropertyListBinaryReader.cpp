@@ -1,7 +1,9 @@
 #include "system/PropertyListBinaryReader.h"
 
 #include <algorithm>
+#include <array>
 #include <bit>
+#include <cstring>
 #include <memory>
 #include <string>
 #include <string_view>
@@ -17,10 +19,13 @@ namespace appsync {
 
 namespace {
 
+// Eight bytes are there to be read, of which `width` count, 1 to 8: what is read in this file
+// stands before the trailer or in it.
 std::uint64_t bigEndian(const std::uint8_t* bytes, std::size_t width) {
     std::uint64_t value = 0;
-    for (std::size_t i = 0; i < width; ++i) value = value << 8U | bytes[i];
-    return value;
+    std::memcpy(&value, bytes, sizeof(value));
+    if constexpr (std::endian::native == std::endian::little) value = __builtin_bswap64(value);
+    return value >> (64 - 8 * width);
 }
 
 std::uint8_t kindOf(std::uint8_t marker) { return marker & 0xF0U; }
@@ -270,7 +275,7 @@ class BinaryReader {
         const std::string_view all(reinterpret_cast<const char*>(content.data()), content.size());
         const std::size_t ascii = asciiPrefix(all);
         if (ascii != all.size()) return refuse(span.at + ascii, "expected an ASCII character");
-        text = all;
+        text.assign(all);
         return true;
     }
 
@@ -316,9 +321,10 @@ class BinaryReader {
     bool readMap(Span span, PropertyList& value) {
         std::vector<PropertyList::Entry> entries(span.size / 2 / referenceWidth_);
         std::size_t at = span.at;
+        std::size_t place = 0;
         for (auto& [key, inner] : entries) {
             const std::size_t valueAt = at + span.size / 2;
-            if (!readKey(at, key) || !readObject(referenceAt(valueAt), valueAt, inner))
+            if (!readKeyAt(place++, at, key) || !readObject(referenceAt(valueAt), valueAt, inner))
                 return false;
             at += referenceWidth_;
         }
@@ -326,6 +332,22 @@ class BinaryReader {
         const std::size_t repeated = PropertyList::findRepeatedKey(entries).value_or(0);
         return refuse(span.at + repeated * referenceWidth_,
                       "expected a key that the map does not have yet");
+    }
+
+    /// Maps of one list mostly have the same keys at the same places: what the map before had there
+    /// is not looked up again.
+    bool readKeyAt(std::size_t place, std::size_t from, std::string& key) {
+        if (place >= kRememberedKeys) return readKey(from, key);
+        Key& before = keys_[place];
+        const std::uint64_t reference = referenceAt(from);
+        if (before.isKnown && before.reference == reference) {
+            key = before.text;
+            return true;
+        }
+        if (!readKey(from, key)) return false;
+        before.isKnown = key.size() <= kBinaryCopiedSize;
+        if (before.isKnown) before.reference = reference, before.text = key;
+        return true;
     }
 
     /// Reads the key that is referred to at `from`.
@@ -354,6 +376,14 @@ class BinaryReader {
         return true;
     }
 
+    /// A short key and what refers to it.
+    struct Key {
+        std::uint64_t reference = 0;
+        std::string text;
+        bool isKnown = false;
+    };
+    static constexpr std::size_t kRememberedKeys = 16;
+
     ByteView bytes_;
     std::size_t offsetWidth_ = 0;
     std::size_t referenceWidth_ = 0;
@@ -364,7 +394,8 @@ class BinaryReader {
     std::size_t valuesLeft_;
     std::size_t longBytesLeft_;
     std::size_t keyBytesLeft_;
-    std::vector<std::size_t> open_;  // where the containers stand that are being read
+    std::array<Key, kRememberedKeys> keys_;  // at their places in the map before
+    std::vector<std::size_t> open_;          // where the containers stand that are being read
     std::unordered_map<std::size_t, PropertyList> longBlocks_;  // by where they stand
 
     std::size_t problemAt_ = 0;

@@ -1,9 +1,11 @@
 #include "system/RootDirectory.h"
 
 #include <cerrno>
+#include <memory>
 #include <optional>
 #include <utility>
 
+#include <dirent.h>
 #include <fcntl.h>
 #include <linux/openat2.h>
 #include <sys/stat.h>
@@ -21,13 +23,14 @@ constexpr int kResolutionTries = 1000;
 
 bool isWorthRepeating(int code) { return code == EAGAIN || code == EINTR; }
 
-UniqueFd openInRoot(int root, const char* path, int flags, mode_t mode) {
+UniqueFd openInRoot(int root, const char* path, int flags, mode_t mode,
+                    std::uint64_t resolution = 0) {
     open_how how{};
     how.flags = static_cast<std::uint64_t>(flags | O_CLOEXEC | O_NOCTTY);
     if ((flags & O_PATH) != 0) how.flags = static_cast<std::uint64_t>(flags | O_CLOEXEC);
     const bool creates = (flags & O_CREAT) != 0 || (flags & O_TMPFILE) == O_TMPFILE;
     how.mode = creates ? mode : 0;
-    how.resolve = RESOLVE_IN_ROOT | RESOLVE_NO_MAGICLINKS;
+    how.resolve = RESOLVE_IN_ROOT | RESOLVE_NO_MAGICLINKS | resolution;
     UniqueFd opened;
     for (int tries = 0; tries < kResolutionTries; ++tries) {
         opened.reset(static_cast<int>(::syscall(SYS_openat2, root, path, &how, sizeof how)));
@@ -35,6 +38,10 @@ UniqueFd openInRoot(int root, const char* path, int flags, mode_t mode) {
     }
     return opened;
 }
+
+struct CloseDirectory {
+    void operator()(DIR* directory) const { ::closedir(directory); }
+};
 
 /// What is wrong with the path before anybody looks for it; nothing when it may be used.
 std::optional<std::string_view> complaintAbout(std::string_view path) {
@@ -72,6 +79,17 @@ Result<UniqueFd> RootDirectory::openDirectory(const std::string& path,
     return openFile(path, O_RDONLY | O_DIRECTORY, 0, operation);
 }
 
+Result<UniqueFd> RootDirectory::openDirectoryWithoutLinks(const std::string& path,
+                                                          std::string_view operation) const {
+    if (const auto complaint = complaintAbout(path)) {
+        return posixError(EINVAL, operation, path, *complaint);
+    }
+    UniqueFd opened =
+        openInRoot(descriptor_.get(), path.c_str(), O_RDONLY | O_DIRECTORY, 0, RESOLVE_NO_SYMLINKS);
+    if (!opened) return posixError(errno, operation, path);
+    return opened;
+}
+
 Result<RegularFile> RootDirectory::openRegularFile(const std::string& path,
                                                    std::string_view operation) const {
     Result<UniqueFd> opened = openFile(path, O_RDONLY | O_NONBLOCK, 0, operation);
@@ -100,6 +118,23 @@ Result<ItemPlace> RootDirectory::place(const std::string& path, std::string_view
         openInRoot(descriptor_.get(), path.substr(0, start).c_str(), O_PATH | O_DIRECTORY, 0);
     if (!directory) return posixError(errno, operation, path);
     return ItemPlace{std::move(directory), std::move(name), end < path.size()};
+}
+
+Result<std::vector<std::string>> namesIn(int directory, std::string_view path) {
+    UniqueFd own(::openat(directory, ".", O_RDONLY | O_DIRECTORY | O_CLOEXEC));
+    if (!own) return posixError(errno, "list", path);
+    const std::unique_ptr<DIR, CloseDirectory> stream(::fdopendir(own.get()));
+    if (stream == nullptr) return posixError(errno, "list", path);
+    static_cast<void>(own.release());  // the stream's now
+    std::vector<std::string> names;
+    errno = 0;
+    while (const dirent* entry = ::readdir(stream.get())) {
+        const std::string_view name = entry->d_name;
+        if (name != "." && name != "..") names.emplace_back(name);
+        errno = 0;
+    }
+    if (errno != 0) return posixError(errno, "list", path);
+    return names;
 }
 
 }  // namespace appsync

@@ -3,6 +3,7 @@
 #include <cstdint>
 #include <string>
 #include <string_view>
+#include <vector>
 
 #include <sys/types.h>
 
@@ -57,6 +58,11 @@ class RootDirectory {
     [[nodiscard]] Result<UniqueFd> openDirectory(const std::string& path,
                                                  std::string_view operation = "open") const;
 
+    /// The same where no part of the path is a link; ELOOP where one is. For whoever removes what
+    /// the directory holds: nobody who may only put a link somewhere can turn that elsewhere.
+    [[nodiscard]] Result<UniqueFd> openDirectoryWithoutLinks(
+        const std::string& path, std::string_view operation = "open") const;
+
     /// Opens a regular file for reading. Anything else is refused without waiting on it: EISDIR for
     /// a directory, EINVAL for a pipe, a device, a socket.
     [[nodiscard]] Result<RegularFile> openRegularFile(const std::string& path,
@@ -73,5 +79,8 @@ class RootDirectory {
 
     UniqueFd descriptor_;
 };
+
+/// The names in the directory that a descriptor refers to, without "." and "..".
+[[nodiscard]] Result<std::vector<std::string>> namesIn(int directory, std::string_view path);
 
 }  // namespace appsync

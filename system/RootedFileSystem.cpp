@@ -1,5 +1,6 @@
 #include "system/RootedFileSystem.h"
 
+#include <algorithm>
 #include <cerrno>
 #include <cstdio>
 #include <optional>
@@ -24,12 +25,15 @@ constexpr mode_t kDirectoryPermissions = S_IRWXU | S_IRGRP | S_IXGRP | S_IROTH |
 constexpr std::string_view kMakeDirectory = "create the directory";
 constexpr std::string_view kCreate = "create";
 constexpr std::string_view kCopy = "copy";
+constexpr std::string_view kCopyTo = "copy something to";
 constexpr std::string_view kExamine = "examine";
 constexpr std::string_view kMove = "move";
+constexpr std::string_view kMoveTo = "move something to";
 constexpr std::string_view kRead = "read";
 constexpr std::string_view kRemove = "remove";
 constexpr std::string_view kClear = "clear temporary files in";
 constexpr std::string_view kTouch = "set the times of";
+constexpr std::string_view kWrite = "write";
 
 /// Whom something is to be given to.
 struct Ownership {
@@ -59,6 +63,25 @@ Result<Ownership> ownershipFor(const AccountMap& accounts, const FileAttributes&
         result.group = account->group;
     }
     return result;
+}
+
+/// Whether a path that begins with the directory leads out of it again by "..".
+bool leavesDirectory(std::string_view path, std::string_view directory) {
+    if (!path.starts_with(directory)) return false;
+    path.remove_prefix(directory.size());
+    if (!path.starts_with('/')) return false;
+    int depth = 0;
+    while (!path.empty() && depth >= 0) {
+        const std::size_t end = std::min(path.find('/'), path.size());
+        const std::string_view component = path.substr(0, end);
+        if (component == "..") {
+            --depth;
+        } else if (!component.empty() && component != ".") {
+            ++depth;
+        }
+        path.remove_prefix(std::min(end + 1, path.size()));
+    }
+    return depth < 0;
 }
 
 /// Gives an errno value, or 0. No system call is made that would change nothing: an ordinary
@@ -151,6 +174,12 @@ TreeActions removal() {
             }};
 }
 
+Status removeAt(int parent, const std::string& name, const std::string& path) {
+    if (::unlinkat(parent, name.c_str(), 0) == 0) return {};
+    if (errno != EISDIR) return posixError(errno, kRemove, path);
+    return walkTree(parent, name, removal(), kRemove, path);
+}
+
 TreeActions clearingOfTemporaries() {
     return {[](int directory, const std::string& name) {
                 return isTemporaryName(name) ? removeIfStale(directory, name) : 0;
@@ -194,6 +223,7 @@ Result<ItemAttributes> RootedFileSystem::attributes(const std::string& path) {
 
 Status RootedFileSystem::createDirectory(const std::string& path, bool withIntermediates,
                                          const FileAttributes* attributes) {
+    if (Status status = checkStays(path, kMakeDirectory); !status) return status;
     const FileAttributes wanted = attributes != nullptr ? *attributes : FileAttributes{};
     const Result<Ownership> owner = ownershipFor(accounts_, wanted, kMakeDirectory, path);
     if (!owner) return owner.error();
@@ -202,18 +232,35 @@ Status RootedFileSystem::createDirectory(const std::string& path, bool withInter
 }
 
 Status RootedFileSystem::removeItem(const std::string& path) {
+    if (Status status = checkStays(path, kRemove); !status) return status;
     const Result<ItemPlace> place = root_.place(path, kRemove);
     if (!place) return place.error();
-    const int parent = place->directory.get();
-    if (::unlinkat(parent, place->name.c_str(), 0) == 0) return {};
-    if (errno != EISDIR) return posixError(errno, kRemove, path);
-    return walkTree(parent, place->name, removal(), kRemove, path);
+    return removeAt(place->directory.get(), place->name, path);
+}
+
+Status RootedFileSystem::removeContents(const std::string& directory,
+                                        const std::function<bool(const std::string& name)>& goes) {
+    const Result<UniqueFd> opened = root_.openDirectoryWithoutLinks(directory, kRemove);
+    if (!opened) return opened.error();
+    const Result<std::vector<std::string>> names = namesIn(opened->get(), directory);
+    if (!names) return names.error();
+    Status first;
+    for (const std::string& name : *names) {
+        if (!goes(name)) continue;
+        std::string path = directory;
+        path.append("/").append(name);
+        Status removed = removeAt(opened->get(), name, path);
+        if (first && !removed) first = std::move(removed);
+    }
+    return first;
 }
 
 Status RootedFileSystem::moveItem(const std::string& from, const std::string& to) {
+    if (Status status = checkStays(from, kMove); !status) return status;
+    if (Status status = checkStays(to, kMoveTo); !status) return status;
     const Result<ItemPlace> source = root_.place(from, kMove);
     if (!source) return source.error();
-    const Result<ItemPlace> target = root_.place(to, "move something to");
+    const Result<ItemPlace> target = root_.place(to, kMoveTo);
     if (!target) return target.error();
     const int error = renameUnlessThere(*source, *target);
     if (error != 0) return posixErrorBetween(error, kMove, from, to);
@@ -221,9 +268,10 @@ Status RootedFileSystem::moveItem(const std::string& from, const std::string& to
 }
 
 Status RootedFileSystem::copyItem(const std::string& from, const std::string& to) {
+    if (Status status = checkStays(to, kCopyTo); !status) return status;
     const Result<RegularFile> source = root_.openRegularFile(from, kCopy);
     if (!source) return source.error();
-    const Result<ItemPlace> target = root_.place(to, "copy something to");
+    const Result<ItemPlace> target = root_.place(to, kCopyTo);
     if (!target) return target.error();
     const int error = target->mustBeDirectory ? EISDIR : copyInto(*source, *target);
     if (error != 0) return posixErrorBetween(error, kCopy, from, to);
@@ -240,6 +288,7 @@ Result<Bytes> RootedFileSystem::readFile(const std::string& path) {
 }
 
 Status RootedFileSystem::writeFileAtomically(const std::string& path, ByteView contents) {
+    if (Status status = checkStays(path, kWrite); !status) return status;
     Result<TemporaryFile> file = TemporaryFile::create(root_, path);
     if (!file) return file.error();
     if (Status written = file->write(contents); !written) return written;
@@ -250,6 +299,7 @@ Status RootedFileSystem::writeFileAtomically(const std::string& path, ByteView c
 
 Status RootedFileSystem::createFile(const std::string& path, ByteView contents,
                                     const FileAttributes& attributes) {
+    if (Status status = checkStays(path, kCreate); !status) return status;
     const Result<Ownership> owner = ownershipFor(accounts_, attributes, kCreate, path);
     if (!owner) return owner.error();
     Result<TemporaryFile> file = TemporaryFile::create(root_, path);
@@ -268,6 +318,11 @@ Status RootedFileSystem::setTimesToNow(const std::string& path) {
         return posixError(errno, kTouch, path);
     }
     return {};
+}
+
+Status RootedFileSystem::checkStays(const std::string& path, std::string_view operation) const {
+    if (!leavesDirectory(path, temporaryDirectory_)) return {};
+    return posixError(EACCES, operation, path, "the path leads out of " + temporaryDirectory_);
 }
 
 std::string RootedFileSystem::temporaryDirectory() { return temporaryDirectory_; }

@@ -36,6 +36,9 @@ struct RootedFileSystemOptions {
 /// `isTemporaryName`); the finished file takes the target's name, and where the target was a link,
 /// the link's place. A file that is replaced keeps its permissions and its owner. A crash can leave
 /// a temporary file; `removeStaleTemporaries` clears it.
+///
+/// What begins with the path of the temporary directory is changed there only: where ".." would
+/// lead out of it, nothing is made, changed or removed, and the error is EACCES.
 class RootedFileSystem : public FileSystem {
   public:
     /// The largest file that `readFile` reads.
@@ -62,6 +65,11 @@ class RootedFileSystem : public FileSystem {
     Status setTimesToNow(const std::string& path) override;
     [[nodiscard]] std::string temporaryDirectory() override;
 
+    /// Removes what stands in the directory under the names that `goes` accepts. Refused where a
+    /// part of the path is a link. Everything is tried; tells the first failure.
+    Status removeContents(const std::string& directory,
+                          const std::function<bool(const std::string& name)>& goes);
+
     /// Removes, from the directory and everything below it, the temporary files that crashed
     /// processes left. Those that a living process is writing are left alone. No failure when there
     /// is no such directory.
@@ -69,6 +77,9 @@ class RootedFileSystem : public FileSystem {
 
   private:
     RootedFileSystem(RootDirectory root, RootedFileSystemOptions options);
+
+    /// Refuses a path to something in the temporary directory that lies elsewhere.
+    [[nodiscard]] Status checkStays(const std::string& path, std::string_view operation) const;
 
     const RootDirectory root_;
     const AccountMap accounts_;

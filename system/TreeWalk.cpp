@@ -19,7 +19,7 @@ namespace {
 
 constexpr int kMostVisits = 16;
 
-struct CloseDirectory {
+struct CloseStream {
     void operator()(DIR* stream) const { ::closedir(stream); }
 };
 
@@ -106,7 +106,7 @@ class TreeWalk {
         ++level.visits;
         const int copy = ::fcntl(current_.get(), F_DUPFD_CLOEXEC, 0);
         if (copy < 0) return errno;
-        const std::unique_ptr<DIR, CloseDirectory> stream(::fdopendir(copy));
+        const std::unique_ptr<DIR, CloseStream> stream(::fdopendir(copy));
         if (stream == nullptr) {
             const int error = errno;
             UniqueFd(copy).reset();

@@ -127,5 +127,64 @@ TEST(LogRenderingTest, CutsEachArgumentOfAMessage) {
     EXPECT_EQ(render("%{public}@|%s", {text(longText), text("end")}), expected);
 }
 
+TEST(LogRenderingTest, RendersIntegersInEachNotation) {
+    EXPECT_EQ(render("%x %X %i", {unsignedInteger(255), signedInteger(255), signedInteger(-7)}),
+              "ff FF -7");
+    EXPECT_EQ(render("%04x %f %.1f", {unsignedInteger(10), signedInteger(3), unsignedInteger(4)}),
+              "000a 3.000000 4.0");
+}
+
+TEST(LogRenderingTest, ARealWhereNoneIsAskedForIsRenderedAsItIs) {
+    EXPECT_EQ(render("%d %{public}@ %s", {0.5, 1.25, -2.0}), "0.5 1.25 -2");
+}
+
+TEST(LogRenderingTest, RendersListsAndErrorsAmongTheArguments) {
+    const PropertyList list = PropertyList::array({1});
+    const ErrorRecord error{"TRError", 30, {}};
+    EXPECT_EQ(render("%{public}@ %s", {&list, &error}),
+              "(1) Error Domain=TRError Code=30 \"(null)\"");
+}
+
+TEST(LogRenderingTest, AFormatThatEndsInAPlaceholderIsRenderedAsItIs) {
+    EXPECT_EQ(render("%", {text("one")}), "%");
+    EXPECT_EQ(render("%5", {text("one")}), "%5");
+    EXPECT_EQ(render("%ll", {text("one")}), "%ll");
+    EXPECT_EQ(render("%k %s", {text("one")}), "%k one");
+    EXPECT_EQ(render("%{public}", {text("one")}), "%{public}");
+}
+
+TEST(LogRenderingTest, AWideNumberIsCut) {
+    EXPECT_EQ(render("%600d", {signedInteger(1)}), std::string(511, ' '));
+}
+
+TEST(LogRenderingTest, DescribesDatesFarAway) {
+    EXPECT_EQ(describe(PropertyList::Date{-2.9e11}), "-7189-04-08 12:26:40 +0000");
+    EXPECT_EQ(describe(PropertyList::Date{3e11}), "3e+11 s since 2001-01-01 00:00:00 +0000");
+    EXPECT_EQ(describe(PropertyList::Date{-1e300}), "-1e+300 s since 2001-01-01 00:00:00 +0000");
+    EXPECT_EQ(describe(PropertyList::Date{3661}), "2001-01-01 01:01:01 +0000");
+}
+
+TEST(LogRenderingTest, DescribesMapsOfSeveralEntries) {
+    EXPECT_EQ(describe(PropertyList::map({{"a", 1}, {"b", -2}, {"c", UINT64_MAX}})),
+              "{a = 1; b = -2; c = 18446744073709551615;}");
+}
+
+TEST(LogRenderingTest, CutsWhatBeginsInsideACharacter) {
+    EXPECT_EQ(describe("\x80\x80\x80", 2), "\x80\x80… (1 more bytes)");
+    EXPECT_EQ(describe("\x80", 0), "… (1 more bytes)");
+}
+
+TEST(LogRenderingTest, KeepsCharactersThatEndAtTheCut) {
+    EXPECT_EQ(describe("éx", 2), "é… (1 more bytes)");
+    EXPECT_EQ(describe("€x", 3), "€… (1 more bytes)");
+    EXPECT_EQ(describe("😀x", 4), "😀… (1 more bytes)");
+    EXPECT_EQ(describe("€", 1), "… (3 more bytes)");
+    EXPECT_EQ(describe("€", 2), "… (3 more bytes)");
+    EXPECT_EQ(describe("a😀", 2), "a… (4 more bytes)");
+    // The first of the leading bytes of three, and of two.
+    EXPECT_EQ(describe("\xE0\xA4\x85", 2), "… (3 more bytes)");
+    EXPECT_EQ(describe("\xC0\x80", 1), "… (2 more bytes)");
+}
+
 }  // namespace
 }  // namespace appsync

@@ -5,7 +5,9 @@
 #include <cmath>
 #include <cstdint>
 #include <limits>
+#include <memory>
 #include <string>
+#include <vector>
 
 namespace appsync {
 namespace {
@@ -60,6 +62,7 @@ TEST(PropertyListIntegers, AreGivenInEitherKindWhenTheyFit) {
 TEST(PropertyListEquality, IntegersCompareByValue) {
     EXPECT_EQ(PropertyList(5), PropertyList(5U));
     EXPECT_NE(PropertyList(-1), PropertyList(UINT64_MAX));
+    EXPECT_NE(PropertyList(-1), PropertyList(-2));
     EXPECT_EQ(PropertyList(UINT64_MAX), PropertyList(UINT64_MAX));
     EXPECT_NE(PropertyList(UINT64_MAX), PropertyList(UINT64_MAX - 1));
     EXPECT_NE(PropertyList(1), PropertyList(1.0));
@@ -180,6 +183,16 @@ TEST(PropertyListMaps, FindStringIgnoresOtherKinds) {
     EXPECT_EQ(map.findString("none"), nullptr);
 }
 
+TEST(PropertyListMaps, AFlagIsWhatTheValueConvertsTo) {
+    const auto map = PropertyList::map(
+        {{"yes", true}, {"one", 1}, {"no", false}, {"list", PropertyList::array({1})}});
+    EXPECT_TRUE(map.findFlag("yes"));
+    EXPECT_TRUE(map.findFlag("one"));
+    EXPECT_FALSE(map.findFlag("no"));
+    EXPECT_FALSE(map.findFlag("list"));
+    EXPECT_FALSE(map.findFlag("none"));
+}
+
 TEST(PropertyListMaps, KeysMayHoldAnything) {
     auto map = PropertyList::map();
     map.set(std::string_view("a\0b", 3), 1);
@@ -268,9 +281,9 @@ TEST(PropertyListBooleanConversion, TakesBooleansNumbersAndWords) {
           PropertyList("Y")}) {
         EXPECT_EQ(yes.booleanConversion(), true);
     }
-    for (const PropertyList& no :
-         {PropertyList(false), PropertyList(0), PropertyList(0U), PropertyList(0.0),
-          PropertyList("NO"), PropertyList("false"), PropertyList("0"), PropertyList("f")}) {
+    for (const PropertyList& no : {PropertyList(false), PropertyList(0), PropertyList(0U),
+                                   PropertyList(0.0), PropertyList("NO"), PropertyList("FALSE"),
+                                   PropertyList("false"), PropertyList("0"), PropertyList("f")}) {
         EXPECT_EQ(no.booleanConversion(), false);
     }
 }
@@ -282,6 +295,131 @@ TEST(PropertyListBooleanConversion, GivesNothingForAnythingElse) {
           PropertyList::map()}) {
         EXPECT_FALSE(other.booleanConversion().has_value());
     }
+}
+
+TEST(PropertyListEquality, DataComparesByItsBytes) {
+    const auto bytes = std::make_shared<const Bytes>(Bytes{1, 2});
+    EXPECT_EQ(PropertyList::shared(bytes), PropertyList(Bytes{1, 2}));
+    EXPECT_EQ(PropertyList::shared(bytes).asData(), bytes.get());
+    EXPECT_NE(PropertyList::shared(bytes), PropertyList(Bytes{1, 3}));
+    EXPECT_NE(PropertyList::shared(bytes), PropertyList(Bytes{1}));
+}
+
+TEST(PropertyListEquality, ScalarsCompareByValueAndKind) {
+    EXPECT_EQ(PropertyList(), PropertyList());
+    EXPECT_NE(PropertyList(), PropertyList(false));
+    EXPECT_NE(PropertyList(true), PropertyList(false));
+    EXPECT_EQ(PropertyList(0.5), PropertyList(0.5));
+    EXPECT_NE(PropertyList(0.5), PropertyList(0.25));
+    EXPECT_NE(PropertyList(0.5), PropertyList(std::numeric_limits<double>::quiet_NaN()));
+    EXPECT_EQ(PropertyList(PropertyList::Date{5}), PropertyList(PropertyList::Date{5}));
+    EXPECT_NE(PropertyList(PropertyList::Date{5}), PropertyList(PropertyList::Date{6}));
+    EXPECT_NE(PropertyList("a"), PropertyList("b"));
+}
+
+TEST(PropertyListIntegers, AreMadeOfEveryWidth) {
+    EXPECT_EQ(PropertyList(-5LL), PropertyList(-5));
+    EXPECT_EQ(PropertyList(5ULL), PropertyList(5));
+    EXPECT_EQ(PropertyList(5ULL).kind(), PropertyList::Kind::Unsigned);
+    EXPECT_EQ(PropertyList(0).asUnsigned(), 0U);
+}
+
+TEST(PropertyListCopies, OntoThemselvesChangeNothing) {
+    PropertyList list = PropertyList::array({1, 2});
+    PropertyList& same = list;
+    list = same;
+    EXPECT_EQ(list, PropertyList::array({1, 2}));
+    list = std::move(same);
+    EXPECT_EQ(list, PropertyList::array({1, 2}));
+}
+
+TEST(PropertyListArrays, GiveNothingOutOfOtherKinds) {
+    PropertyList map = PropertyList::map({{"a", 1}});
+    EXPECT_TRUE(map.take(0).isNull());
+    EXPECT_EQ(map.at(0), nullptr);
+    EXPECT_EQ(map, PropertyList::map({{"a", 1}}));
+}
+
+TEST(PropertyListReaders, MakeAnArrayOfItsParts) {
+    std::vector<PropertyList> parts = {1, PropertyList::array()};
+    PropertyList value;
+    EXPECT_TRUE(value.becomeArray(parts));
+    EXPECT_EQ(value, PropertyList::array({1, PropertyList::array()}));
+    EXPECT_EQ(value.depth(), 2U);
+}
+
+TEST(PropertyListReaders, MakeAMapOfItsParts) {
+    std::vector<PropertyList::Entry> parts;
+    for (int i = 0; i < 40; ++i) parts.push_back({keyNumber(i), i});
+    parts[0].value = PropertyList::array();
+    PropertyList value;
+    EXPECT_TRUE(value.becomeMap(parts));
+    ASSERT_EQ(value.size(), 40U);
+    EXPECT_EQ(*value.find("key39"), PropertyList(39));
+    EXPECT_EQ(value.find("key40"), nullptr);
+    EXPECT_EQ(value.depth(), 2U);
+}
+
+TEST(PropertyListReaders, MakeContainersOfScalarsOneDeep) {
+    std::vector<PropertyList> elements = {1, "x"};
+    std::vector<PropertyList::Entry> entries;
+    entries.push_back({"a", 1});
+    PropertyList array;
+    PropertyList map;
+    EXPECT_TRUE(array.becomeArray(elements));
+    EXPECT_TRUE(map.becomeMap(entries));
+    EXPECT_EQ(array.depth(), 1U);
+    EXPECT_EQ(map.depth(), 1U);
+}
+
+TEST(PropertyListReaders, AreRefusedWhatIsTooDeep) {
+    std::vector<PropertyList> elements = {1, nested(PropertyList::kMaximumDepth)};
+    std::vector<PropertyList::Entry> entries;
+    entries.push_back({"a", nested(PropertyList::kMaximumDepth)});
+    PropertyList value = "unchanged";
+    EXPECT_FALSE(value.becomeArray(elements));
+    EXPECT_FALSE(value.becomeMap(entries));
+    EXPECT_EQ(value, PropertyList("unchanged"));
+    EXPECT_EQ(elements.size(), 2U);
+    EXPECT_EQ(entries[0].value.depth(), PropertyList::kMaximumDepth);
+}
+
+/// Few keys are compared one after the other, many are looked up by their hashes.
+class PropertyListRepeatedKeys : public testing::TestWithParam<int> {
+  protected:
+    [[nodiscard]] std::vector<PropertyList::Entry> entries() const {
+        std::vector<PropertyList::Entry> result;
+        for (int i = 0; i < GetParam(); ++i) result.push_back({keyNumber(i), i});
+        return result;
+    }
+};
+
+TEST_P(PropertyListRepeatedKeys, AreFoundWhereTheyStand) {
+    auto some = entries();
+    EXPECT_EQ(PropertyList::findRepeatedKey(some), std::nullopt);
+    some.push_back({keyNumber(GetParam() - 1), 0});
+    some.push_back({keyNumber(0), 0});
+    EXPECT_EQ(PropertyList::findRepeatedKey(some), static_cast<std::size_t>(GetParam()));
+}
+
+TEST_P(PropertyListRepeatedKeys, MakeNoMap) {
+    auto some = entries();
+    some.push_back({keyNumber(0), 0});
+    PropertyList value = "unchanged";
+    EXPECT_FALSE(value.becomeMap(some));
+    EXPECT_EQ(value, PropertyList("unchanged"));
+}
+
+INSTANTIATE_TEST_SUITE_P(FewAndMany, PropertyListRepeatedKeys,
+                         testing::Values(1, 14, 15, 16, 17, 40));
+
+TEST(PropertyListDepth, OfAMapCountsWhatIsStillInIt) {
+    PropertyList map = PropertyList::map({{"deep", nested(127)}, {"a", PropertyList::array()}});
+    EXPECT_EQ(map.depth(), 128U);
+    EXPECT_TRUE(map.erase("deep"));
+    PropertyList outer = PropertyList::map();
+    EXPECT_TRUE(outer.set("inner", std::move(map)));
+    EXPECT_EQ(outer.depth(), 3U);
 }
 
 }  // namespace

@@ -104,6 +104,47 @@ TEST(BinaryPropertyListReader, ReadsWideReferencesAndLaterMinorVersions) {
     EXPECT_EQ(*parse(bytes), PropertyList::array({true}));
 }
 
+TEST(BinaryPropertyListReader, KeysThatMapsShareAtTheSamePlacesAreEachMapsOwn) {
+    const std::string longKey(100, 'k');
+    const auto pair = [](std::string_view first, std::string_view second) {
+        return PropertyList::map({{first, 1}, {second, PropertyList::map({{second, 2}})}});
+    };
+    const auto list = PropertyList::array({pair("a", "b"), pair("a", "b"), pair("b", "a"),
+                                           PropertyList::map({{"b", true}}), pair(longKey, "b"),
+                                           pair("a", longKey), pair("a", "b")});
+    EXPECT_EQ(roundTrip(list, PropertyListFormat::Binary), list);
+}
+
+TEST(BinaryPropertyListReader, RefusesAKeyThatIsRepeatedAfterMapsWithTheSameKeys) {
+    // An array of a good map (a, b) and of one in which b is followed by another b.
+    const Bytes bytes = BinaryList()
+                            .add("\xA2\x01\x02")
+                            .add("\xD2\x03\x04\x06\x06")
+                            .add("\xD2\x04\x05\x06\x06")
+                            .add(
+                                "\x51"
+                                "a")
+                            .add(
+                                "\x51"
+                                "b")
+                            .add(
+                                "\x51"
+                                "b")
+                            .add("\x09")
+                            .bytes();
+    EXPECT_EQ(problem(bytes), "offset 18: expected a key that the map does not have yet");
+}
+
+TEST(BinaryPropertyListReader, RefusesTheGreatestReferenceAsAKey) {
+    const Bytes bytes =
+        BinaryList()
+            .referenceWidth(8)
+            .add("\xD1" + BinaryList::number(UINT64_MAX, 8) + BinaryList::number(1, 8))
+            .add("\x09")
+            .bytes();
+    EXPECT_EQ(problem(bytes).substr(0, 10), "offset 9: ");
+}
+
 TEST(BinaryPropertyListReader, RefusesOtherVersions) {
     EXPECT_EQ(refusal("bplist15xxxxxxxxxxxxxxxxxxxxxxxxxxxxxxxxxxxxxxxxxxx"),
               "binary property list, offset 6: expected version 0 ('bplist00')");

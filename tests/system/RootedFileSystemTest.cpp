@@ -126,6 +126,36 @@ TEST_F(RootedFileSystemTest, AFailedReadIsTold) {
               "cannot read /file: Input/output error");
 }
 
+TEST_F(RootedFileSystemTest, APathInTheTemporaryDirectoryChangesNothingOutsideOfIt) {
+    put("/var/kept", "kept");
+    put("/tmp/own", "own");
+    for (const char* path : {"/tmp/../var/new", "/tmp/a/../../var/new", "/tmp/./../var/new",
+                             "/tmp//../var/new", "/tmp/a/b/../../../var/new", "/tmp/.."}) {
+        EXPECT_EQ(codeOf(files_->createDirectory(path, true, nullptr)), EACCES) << path;
+        EXPECT_EQ(codeOf(files_->createDirectory(path, false, &kMobile)), EACCES) << path;
+        EXPECT_EQ(codeOf(files_->createFile(path, bytes("x"), kMobile)), EACCES) << path;
+        EXPECT_EQ(codeOf(files_->writeFileAtomically(path, bytes("x"))), EACCES) << path;
+        EXPECT_EQ(codeOf(files_->copyItem("/tmp/own", path)), EACCES) << path;
+        EXPECT_EQ(codeOf(files_->moveItem("/tmp/own", path)), EACCES) << path;
+    }
+    EXPECT_EQ(codeOf(files_->removeItem("/tmp/../var/kept")), EACCES);
+    EXPECT_EQ(codeOf(files_->moveItem("/tmp/../var/kept", "/tmp/stolen")), EACCES);
+    EXPECT_EQ(files_->createFile("/tmp/../var/kept", bytes("x"), kMobile).error().description(),
+              "cannot create /tmp/../var/kept: the path leads out of /tmp");
+    EXPECT_EQ(names("/var"), std::vector<std::string>{"kept"});
+    EXPECT_EQ(contents("/var/kept"), "kept");
+    EXPECT_EQ(contents("/tmp/own"), "own");
+}
+
+TEST_F(RootedFileSystemTest, APathMayGoUpWithinTheTemporaryDirectoryAndElsewhere) {
+    EXPECT_TRUE(files_->createDirectory("/tmp/a/b", true, nullptr));
+    EXPECT_TRUE(files_->createFile("/tmp/a/../file", bytes("x"), kMobile));
+    EXPECT_TRUE(files_->createFile("/tmp/a/..file", bytes("x"), kMobile));
+    EXPECT_TRUE(files_->createDirectory("/tmpfile/../other", true, nullptr));
+    EXPECT_TRUE(files_->createFile("/other/../tmp/up", bytes("x"), kMobile));
+    EXPECT_EQ(names("/tmp"), (std::vector<std::string>{"a", "file", "up"}));
+}
+
 TEST_F(RootedFileSystemTest, MakesADirectory) {
     EXPECT_TRUE(files_->createDirectory("/new", false, nullptr));
     EXPECT_TRUE(fs::is_directory(real("/new")));
