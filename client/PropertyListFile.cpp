@@ -42,7 +42,11 @@ std::optional<Result<PropertyList>> readListFile(const Platform& platform, std::
 
 Status writePropertyListFile(const Platform& platform, const std::string& path,
                              const PropertyList& value, PropertyListFormat format) {
-    const Result<Bytes> bytes = platform.propertyLists.serialize(value, format);
+    Result<Bytes> bytes = platform.propertyLists.serialize(value, format);
+    // XML has no words for some characters of a text.
+    if (!bytes && format == PropertyListFormat::Xml) {
+        bytes = platform.propertyLists.serialize(value, PropertyListFormat::Binary);
+    }
     if (!bytes) return bytes.error();
     return platform.files.writeFileAtomically(path, *bytes);
 }

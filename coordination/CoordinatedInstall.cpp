@@ -212,7 +212,7 @@ bool AppsClient::setPlaceholderAttributes(Preparation& preparation) {
     const std::string& identifier = preparation.identifier();
     PlaceholderAttributes attributes;
     attributes.info = preparation.info.value_or(PropertyList::map());
-    attributes.launchProhibited = flagAt(attributes.info, kLaunchProhibitedKey);
+    attributes.launchProhibited = attributes.info.findFlag(kLaunchProhibitedKey);
     if (const std::string* version = preparation.asset.version()) {
         attributes.bundleVersion = *version;
     }

@@ -27,10 +27,4 @@ inline constexpr std::string_view kPlaceholderNotInstalled = "Failed to install 
 /// Whom a placeholder bundle and what is in it belong to.
 [[nodiscard]] inline FileAttributes placeholderFileAttributes() { return {"mobile", "mobile"}; }
 
-/// The boolean at the key. What is absent or answers to no boolean conversion is false.
-[[nodiscard]] inline bool flagAt(const PropertyList& map, std::string_view key) {
-    const PropertyList* flag = map.find(key);
-    return flag != nullptr && flag->booleanConversion().value_or(false);
-}
-
 }  // namespace appsync

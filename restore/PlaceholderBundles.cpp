@@ -33,8 +33,8 @@ PropertyList placeholderInfo(const SyncAsset& asset, const PropertyList& assetIn
     info.set(BundleExecutableKey, *asset.prettyName);
     info.set(BundleDisplayNameKey, *asset.prettyName);
     info.set(BundleIconFileKey, kPlaceholderIconFile);
-    info.set(kPresselKey, flagAt(assetInfo, kPresselKey));
-    info.set(kLaunchProhibitedKey, flagAt(assetInfo, kLaunchProhibitedKey));
+    info.set(kPresselKey, assetInfo.findFlag(kPresselKey));
+    info.set(kLaunchProhibitedKey, assetInfo.findFlag(kLaunchProhibitedKey));
     return info;
 }
 

@@ -26,9 +26,9 @@ const std::string* displayTitleOf(const PropertyList& metadata) {
 
 bool isLaunchProhibited(const PropertyList& metadata) {
     const bool isSaid = metadata.find(kLaunchProhibitedKey) != nullptr;
-    return flagAt(metadata, isSaid ? kLaunchProhibitedKey : kLaunchProhibitedFallbackKey);
+    return metadata.findFlag(isSaid ? kLaunchProhibitedKey : kLaunchProhibitedFallbackKey);
 }
 
-bool isPressel(const PropertyList& metadata) { return flagAt(metadata, kPresselKey); }
+bool isPressel(const PropertyList& metadata) { return metadata.findFlag(kPresselKey); }
 
 }  // namespace appsync

@@ -12,8 +12,6 @@ namespace appsync {
 
 namespace {
 
-constexpr std::uint64_t kWholeInstall = 0;
-
 struct InstallStatus {
     std::uint64_t type;
     std::uint64_t state;

@@ -26,7 +26,6 @@ constexpr std::string_view kPlaceholderRemoved = "placeholder removed";
 constexpr std::string_view kPlaceholderNotRemoved = "failed to remove placeholder";
 
 constexpr std::uint64_t kAssertionReason = 0;
-constexpr std::uint64_t kWholeInstall = 0;
 
 ErrorRecord invalidArgument() {
     return {std::string(kPosixErrorDomain), kPosixInvalidArgument, {}};

@@ -21,11 +21,6 @@ std::optional<std::string> stringAt(const PropertyList& item, std::string_view k
     return text != nullptr ? std::optional(*text) : std::nullopt;
 }
 
-bool flagAt(const PropertyList& item, std::string_view key) {
-    const PropertyList* flag = item.find(key);
-    return flag != nullptr && flag->booleanConversion().value_or(false);
-}
-
 /// The flags of item maps are numbers.
 int numberOf(bool flag) { return flag ? 1 : 0; }
 
@@ -42,10 +37,10 @@ TransferItem TransferItem::fromItemMap(const PropertyList& item) {
     result.container = stringAt(item, kContainerKey).value_or("");
     result.version = stringAt(item, BundleVersionKey);
     result.nameFromVessik = stringAt(item, kNameFromVessikKey);
-    result.isRestore = flagAt(item, kIsRestoreKey);
-    result.isIntentionallyDemoted = flagAt(item, kIntentionallyDemotedKey);
-    result.isAutomaticallyDemoted = flagAt(item, kAutomaticallyDemotedKey);
-    result.isSystemApp = flagAt(item, kSystemAppKey);
+    result.isRestore = item.findFlag(kIsRestoreKey);
+    result.isIntentionallyDemoted = item.findFlag(kIntentionallyDemotedKey);
+    result.isAutomaticallyDemoted = item.findFlag(kAutomaticallyDemotedKey);
+    result.isSystemApp = item.findFlag(kSystemAppKey);
     return result;
 }
 

@@ -38,6 +38,15 @@ TEST_F(BackupPreparation, ClearsTheMarkAndNothingElse) {
     EXPECT_THAT(platform_.callsTo({"AppRegistry"}), ElementsAre("AppRegistry.enumerateBundles(1)"));
 }
 
+TEST_F(BackupPreparation, ClearsTheMarkBesideTextThatXmlCannotHold) {
+    const std::string text("page\x0c break", 11);
+    platform_.addPropertyList(metadataPath(kA),
+                              PropertyList::map({{"is-auto-download", true}, {"text", text}}),
+                              PropertyListFormat::Binary);
+    client_->prepareForBackup();
+    EXPECT_EQ(platform_.propertyListAt(metadataPath(kA)), PropertyList::map({{"text", text}}));
+}
+
 TEST_F(BackupPreparation, LeavesAFileWithoutTheMarkUntouched) {
     platform_.addPropertyList(metadataPath(kA), PropertyList::map({{"is-auto-download", false}}));
     platform_.addPropertyList(metadataPath(kB), PropertyList::map({{"title", "B"}}));

@@ -1,3 +1,6 @@
+#include <algorithm>
+#include <cstdint>
+
 #include "tests/client/AppsClientFixture.h"
 
 namespace appsync {
@@ -172,6 +175,42 @@ TEST_F(ClientObject, CountsInstallAttemptsOnce) {
     platform_.runUntilIdle();
     EXPECT_EQ(client_->_getAndResetNumAppInstallsAttempted(), 2U);
     EXPECT_EQ(client_->_getAndResetNumAppInstallsAttempted(), 0U);
+}
+
+TEST_F(ClientObject, ObservesItsCoordinatorsAtTheNextStartWhenTheServiceCouldNotTellIt) {
+    platform_.coordination.makeNoneNext(CoordinationObject::AppInstallObserver,
+                                        "com.korvu.trd.rlink.tsappobserverdelegate");
+    client_->setupInstallCoordinatorObserver();
+    EXPECT_FALSE(Access::hasAppInstallObserver(*client_));
+    client_->setupInstallCoordinatorObserver();
+    EXPECT_TRUE(Access::hasAppInstallObserver(*client_));
+    EXPECT_THAT(platform_.callsTo({"InstallCoordinatorService"}), testing::SizeIs(2));
+}
+
+/// The daemon's start is told while the client is being destroyed. Whether it was told in time:
+/// after the client could no longer be held, and before it stopped listening.
+bool isToldWhileItDies(PropertyListSerialization& codec, std::uint64_t seed) {
+    constexpr std::string_view told = "NotificationCenterObserver.callback(";
+    SimulatedPlatform platform(codec, Scheduling::seeded(seed));
+    auto client = AppsClient::create(platform.services());
+    platform.runUntilIdle();
+    platform.clearRecording();
+    platform.onCall("AppRegistry.removeObserver", [&platform](const RecordEntry&) {
+        platform.notificationCenter.post(kStartup);
+    });
+    client.reset();
+    const std::vector<std::string> calls = platform.calls();
+    platform.runUntilIdle();
+    EXPECT_THAT(platform.coordination.appInstallObservers(), testing::IsEmpty());
+    EXPECT_THAT(platform.callsTo({"InstallCoordinatorService"}), testing::IsEmpty());
+    return std::any_of(calls.begin(), calls.end(),
+                       [told](const std::string& call) { return call.starts_with(told); });
+}
+
+TEST_F(ClientObject, DoesNotHeedAStartThatIsToldWhileItDies) {
+    int told = 0;
+    for (std::uint64_t seed = 1; seed <= 30; ++seed) told += isToldWhileItDies(codec_, seed);
+    EXPECT_GT(told, 0);
 }
 
 }  // namespace

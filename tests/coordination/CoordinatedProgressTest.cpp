@@ -178,7 +178,9 @@ TEST_F(CoordinatedCompletion, AtAPathThatNoUrlCanHoldCancelsTheCoordinator) {
     complete();
     EXPECT_FALSE(promise("-Asset").complete);
     ASSERT_NE(service().ended(kA), nullptr);
-    EXPECT_TRUE(service().ended(kA)->cancelled);
+    ASSERT_TRUE(service().ended(kA)->cancelled);
+    EXPECT_EQ(service().ended(kA)->cancelled->reason,
+              service().userPresentableError(1, ErrorRecord{"POSIX", 22, {}}));
 }
 
 TEST_F(CoordinatedCompletion, WithAnErrorCancelsTheCoordinator) {

@@ -291,6 +291,13 @@ TEST_F(CoordinatedRestore, GoesWithoutAnIcon) {
     }
 }
 
+TEST_F(CoordinatedRestore, GoesWithoutAnIconThatCannotBeWritten) {
+    platform_.files.failNext(FileOperation::CreateFile, kBundle + "/Icon.png", ENOSPC);
+    EXPECT_TRUE(prepare(0));
+    EXPECT_EQ(placeholder().icon, nullptr);
+    EXPECT_TRUE(platform_.registry.placeholder(kA));
+}
+
 TEST_F(CoordinatedRestore, GoesWithoutSinfData) {
     EXPECT_TRUE(prepareWithout(nullptr, &icon_));
     EXPECT_EQ(placeholder().sinf, std::nullopt);
@@ -330,13 +337,14 @@ TEST_F(CoordinatedRestore, AddsNothingToADemotedCoordinatorThatHasBothPromises) 
     service().setHas(CoordinationStep::PlaceholderPromise, kA, true);
     EXPECT_TRUE(prepare(1));
     EXPECT_THAT(
-        platform_.messages(),
-        ElementsAre(
-            "processing app restore for demoted bundle 'com.example.a' with install coordination",
-            "Coordinator for com.example.a has a valid user data promise",
-            "Coordinator for com.example.a has a valid placeholder promise",
-            "processing app restore for demoted app com.example.a finished with status 1 error "
-            "(null)"));
+        platform_.messageLines(),
+        ElementsAre(HasSubstr("processing app restore for demoted bundle 'com.example.a' with "
+                              "install coordination"),
+                    "8 default Coordinator for com.example.a has a valid user data promise",
+                    "8 default Coordinator for com.example.a has a valid placeholder promise",
+                    "8 default processing app restore for demoted app com.example.a finished with "
+                    "status 1 error "
+                    "(null)"));
     EXPECT_THAT(platform_.callsTo({"InstallCoordinatorService.makeAppPlaceholder", "FileSystem"}),
                 IsEmpty());
 }
@@ -466,6 +474,8 @@ TEST_F(CoordinatedRestore, CancelsTheCoordinatorBeforeAPlaceholderThatItRefuses)
                     "8 error Error .* setting placeholder promise for 'com.example.a'")));
     EXPECT_THAT(cancels(), ElementsAre(StartsWith("InstallCoordinator.cancelForReason"),
                                        StartsWith("InstallPlaceholder.cancelForReason")));
+    EXPECT_TRUE(
+        logged(LogLevel::Default, "Cancelling placeholder for appBundleIdentifier:com.example.a"));
     EXPECT_EQ(placeholder().cancelled, givenUp());
     expectCoordinatorCancelled();
 }

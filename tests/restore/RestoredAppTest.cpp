@@ -94,11 +94,17 @@ TEST_F(RestoredAppPlaceholder, IsOfARestoreWhetherDemotedOrNot) {
 }
 
 TEST_F(RestoredAppPlaceholder, GetsMetadataAndSinfDataAsTheyCame) {
-    const Bytes metadata = bytesOf(storeMetadata());
+    // In the encoding of its own, and with entries that nobody reads.
+    PropertyList entries = storeMetadata();
+    entries.set("unread", Bytes{0, 255, 0});
+    const Bytes metadata = *codec_.serialize(entries, PropertyListFormat::Xml);
     EXPECT_TRUE(processData(metadata));
-    EXPECT_THAT(platform_.callsTo({"AppRegistry.installPlaceholderBundle"}),
-                ElementsAre(HasSubstr("StoreMetadata = <" + std::to_string(metadata.size()) +
-                                      " bytes>; ApplicationSINF = <3 bytes>;")));
+    EXPECT_EQ(platform_.registry.placeholderOptions(kA),
+              PropertyList::map({{"PackageType", "Placeholder"},
+                                 {"BundleIdentifier", kA},
+                                 {"RGInstallType", 2U},
+                                 {"StoreMetadata", metadata},
+                                 {"ApplicationSINF", sinf_}}));
 }
 
 TEST_F(RestoredAppPlaceholder, IsFoundByTheTransfersThatFollow) {
@@ -147,8 +153,8 @@ TEST_F(RestoredAppPlaceholder, NeedsATitleAndAVersion) {
         platform_.clearRecording();
         EXPECT_FALSE(process(metadata));
         EXPECT_THAT(
-            platform_.messages(),
-            Contains(HasSubstr("failed to create placeholder info at " + kBundle +
+            platform_.messageLines(),
+            Contains(HasSubstr("8 default failed to create placeholder info at " + kBundle +
                                "/Info.plist with info {BundleIdentifier = com.example.a;")));
         EXPECT_THAT(platform_.messages().back(),
                     HasSubstr("failed to process app restore info for 'com.example.a'"));

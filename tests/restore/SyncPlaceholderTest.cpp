@@ -188,5 +188,13 @@ TEST_F(SyncPlaceholder, OfAnIdentifierThatNoPathCanHoldFails) {
     EXPECT_FALSE(platform_.files.exists(kBundle));
 }
 
+TEST_F(SyncPlaceholder, IsNotInstalledFromAPathThatNoURLCanHold) {
+    asset_.identifier = std::string("com\0example", 11);
+    create();
+    EXPECT_THAT(installs(), IsEmpty());
+    EXPECT_THAT(platform_.messages(), Contains(HasSubstr("Error Domain=POSIX Code=22")));
+    EXPECT_THAT(platform_.registry.placeholderIdentifiers(), IsEmpty());
+}
+
 }  // namespace
 }  // namespace appsync

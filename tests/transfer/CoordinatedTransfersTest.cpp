@@ -426,5 +426,30 @@ TEST_F(CoordinatedInstallOutcome, HasNoProgressRecord) {
                             "enabled"));
 }
 
+TEST_F(CoordinatedOutstandingTransfers, InstallAnewWhatTheRegistryKnowsButHasNotInstalled) {
+    AppProxy proxy;
+    proxy.applicationIdentifier = kA;
+    platform_.registry.add(proxy);
+    request({kA});
+    EXPECT_THAT(transfers(), ElementsAre(kA));
+    EXPECT_THAT(Access::updatingApps(*client_), IsEmpty());
+    EXPECT_FALSE(
+        logged(LogLevel::Default, "App com.example.a is already installed and will be updated."));
+}
+
+TEST_F(CoordinatedTransferEvents, FinishNoInstallPhase) {
+    // The record is one from before: a coordinated client gets none.
+    Access::setUseInstallCoordinator(*client_, false);
+    platform_.onCall("AppRegistry.installProgress", [this](const RecordEntry&) {
+        Access::setUseInstallCoordinator(*client_, true);
+    });
+    platform_.registry.setProgress(kA, {kInstallStateActive, kInstallPhaseLoading, 1000, 1000});
+    receive(asset_);
+    EXPECT_TRUE(logged(LogLevel::Default,
+                       "not setting install phase finished for com.example.a as coordination is "
+                       "enabled"));
+    EXPECT_THAT(platform_.callsTo({"AppRegistry.finishInstallPhase"}), IsEmpty());
+}
+
 }  // namespace
 }  // namespace appsync

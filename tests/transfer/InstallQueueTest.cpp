@@ -326,5 +326,39 @@ TEST_F(InstallQueue, KeepsTheClientUntilItsLastRetryHasRun) {
     EXPECT_EQ(platform_.registry.observers(), 0U);
 }
 
+/// No restore fails for good: its failure counts as recoverable. Here the asset becomes one when
+/// that has been decided.
+class InstallQueueOfALateRestore : public InstallQueue {
+  protected:
+    void failAsRestore(bool coordinated) {
+        const auto asset = receivedAsset(kA);
+        platform_.onCall("FileSystem.readFile", [this, asset, coordinated](const RecordEntry&) {
+            asset->isRestore = true;
+            AppsClientTestAccess::setUseInstallCoordinator(*client_, coordinated);
+        });
+        client_->assetInstallFailed(asset, ErrorRecord::make(kInstallerErrorDomain, 3, "refused"));
+        platform_.runUntilIdle();
+    }
+};
+
+TEST_F(InstallQueueOfALateRestore, GivesTheRestoreUp) {
+    failAsRestore(false);
+    EXPECT_THAT(platform_.backup.cancelled(), ElementsAre(kA));
+    EXPECT_FALSE(platform_.registry.placeholder(kA));
+    EXPECT_EQ(operationOf(kA), "FAILED");
+}
+
+TEST_F(InstallQueueOfALateRestore, LeavesACoordinatedRestoreAlone) {
+    failAsRestore(true);
+    EXPECT_THAT(platform_.backup.cancelled(), IsEmpty());
+    EXPECT_TRUE(platform_.registry.placeholder(kA));
+    EXPECT_TRUE(logged(LogLevel::Default,
+                       "not asking backup manager to cancel app restore for com.example.a as "
+                       "install coordination is enabled"));
+    EXPECT_TRUE(logged(LogLevel::Default,
+                       "not uninstalling restore asset com.example.a as install coordination is "
+                       "enabled"));
+}
+
 }  // namespace
 }  // namespace appsync

@@ -244,6 +244,8 @@ TEST_F(OutstandingTransfers, SkipPlaceholdersOfSystemApplications) {
     EXPECT_THAT(transfers(), IsEmpty());
     EXPECT_TRUE(logged(LogLevel::Default, "com.example.a is system app placeholder - skipping"));
     EXPECT_THAT(platform_.messages(), Contains(HasSubstr("system_app = 1")));
+    EXPECT_THAT(platform_.messages(), Not(Contains(StartsWith("Asset com.example.a"))));
+    EXPECT_THAT(platform_.messages(), Not(Contains(StartsWith("Not creating a placeholder"))));
 }
 
 TEST_F(OutstandingTransfers, DoNotFilterDemotedApplications) {

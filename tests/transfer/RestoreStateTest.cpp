@@ -152,5 +152,18 @@ TEST_F(RestoreStateStore, IsEditedUnderItsLock) {
                             HasSubstr("writeFileAtomically"), "Lock#2.unlock()"));
 }
 
+TEST_F(RestoreStateStore, ThatIsDamagedIsLeftAsItIs) {
+    platform_.files.addFile(kFile, "damaged");
+    const Platform services = platform_.services();
+    RestoreState state(services);
+    EXPECT_TRUE(state.isDamaged());
+    state.setProperty("/a", "path", kA, kOne);
+    state.erase(kA);
+    state.write(services);
+    EXPECT_EQ(state.property("path", kA, &kOne), nullptr);
+    EXPECT_EQ(platform_.files.text(kFile), "damaged");
+    EXPECT_THAT(writes(), IsEmpty());
+}
+
 }  // namespace
 }  // namespace appsync

@@ -114,5 +114,33 @@ TEST_F(TransferFailure, DoNotHeedOtherInstallsThatAreCancelledOnTheDevice) {
     EXPECT_THAT(platform_.messages(), Not(Contains(StartsWith("transfer for asset"))));
 }
 
+/// No restore gets as far as to be given up: its failure has ended before. Here the asset becomes
+/// one on the way, at the call of this name.
+class TransferFailureOfALateRestore : public TransferFailure {
+  protected:
+    void failAsRestoreFrom(const std::string& call, bool coordinated) {
+        const auto asset = receivedAsset(kA);
+        platform_.onCall(call, [this, asset, coordinated](const RecordEntry&) {
+            asset->isRestore = true;
+            AppsClientTestAccess::setUseInstallCoordinator(*client_, coordinated);
+        });
+        fail(asset);
+    }
+};
+
+TEST_F(TransferFailureOfALateRestore, GivesTheRestoreUp) {
+    failAsRestoreFrom("InstallProgressRecord.cancel", false);
+    EXPECT_THAT(platform_.backup.cancelled(), ElementsAre(kA));
+    EXPECT_FALSE(platform_.registry.placeholder(kA));
+}
+
+TEST_F(TransferFailureOfALateRestore, LeavesACoordinatedRestoreAlone) {
+    failAsRestoreFrom("InstallProgressRecord.cancel", true);
+    EXPECT_THAT(platform_.backup.cancelled(), IsEmpty());
+    EXPECT_TRUE(logged(LogLevel::Default,
+                       "Install coordination is enabled - not calling "
+                       "cancelApplicationRestoreWithBundleID for com.example.a"));
+}
+
 }  // namespace
 }  // namespace appsync
