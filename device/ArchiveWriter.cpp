@@ -6,6 +6,9 @@
 #include <zip.h>
 
 #include <cerrno>
+#include <climits>
+#include <cstdio>
+#include <filesystem>
 #include <memory>
 
 #include "device/PackageError.h"
@@ -126,9 +129,15 @@ Status addItem(zip_t* archive, const PackageItem& item) {
     return {};
 }
 
-}  // namespace
+// Where libzip is to write: it makes a file beside that, whose name is seven bytes longer.
+std::string workPathOf(const std::string& path) {
+    constexpr std::size_t kLongestName = NAME_MAX - 7;
+    const std::filesystem::path target(path);
+    if (target.filename().native().size() <= kLongestName) return path;
+    return (target.parent_path() / (".archive-" + std::to_string(::getpid()))).native();
+}
 
-Status writeArchive(const std::vector<PackageItem>& items, const std::string& path) {
+Status writeAt(const std::vector<PackageItem>& items, const std::string& path) {
     zip_error_t error = {};
     int code = 0;
     Archive archive(::zip_open(path.c_str(), ZIP_CREATE | ZIP_TRUNCATE, &code));
@@ -145,6 +154,18 @@ Status writeArchive(const std::vector<PackageItem>& items, const std::string& pa
         return archiveFailure(::zip_get_error(archive.get()), path);
     static_cast<void>(archive.release());
     return {};
+}
+
+}  // namespace
+
+Status writeArchive(const std::vector<PackageItem>& items, const std::string& path) {
+    const std::string work = workPathOf(path);
+    Status status = writeAt(items, work);
+    if (!status || work == path) return status;
+    if (::rename(work.c_str(), path.c_str()) == 0) return {};
+    const int error = errno;
+    ::unlink(work.c_str());
+    return posixError(error, "pack", path);
 }
 
 }  // namespace appsync

@@ -56,8 +56,9 @@ Status decide(const std::string& identifier, Removal removal, Outcome& outcome) 
                              identifier + " is a system application and cannot be removed");
     }
     if (outcome.removedApplication || outcome.removedPlaceholder) return {};
-    const char* what =
-        removal == Removal::PlaceholderOnly ? " has no placeholder to remove" : " is not installed";
+    const char* what = removal == Removal::PlaceholderOnly
+                           ? " has no placeholder to remove"
+                           : " is not installed; appsync apps shows what is";
     return registryError(RegistryErrorCode::NothingInstalled, identifier + what);
 }
 

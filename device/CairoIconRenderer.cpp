@@ -5,6 +5,8 @@
 #include <utility>
 
 #include "device/IconDrawing.h"
+#include "device/PackageInfo.h"
+#include "platform/AppRegistry.h"
 #include "platform/PropertyList.h"
 #include "platform/PropertyListSerialization.h"
 #include "system/DescriptorIO.h"
@@ -15,8 +17,6 @@ namespace appsync {
 namespace {
 
 constexpr std::string_view kPngType = "public.png";
-constexpr std::string_view kIconFileKey = "BundleIconFile";
-constexpr std::string_view kUsualIconFile = "Icon.png";
 constexpr std::uint64_t kMaximumInfoBytes = std::uint64_t{1} << 20;
 
 class OpenBundle final : public AppBundle {
@@ -78,7 +78,7 @@ bool isPlainFileName(std::string_view name) noexcept {
 }
 
 std::optional<std::string> iconFileOf(const PropertyList& info) {
-    const PropertyList* value = info.find(kIconFileKey);
+    const PropertyList* value = info.find(BundleIconFileKey);
     if (value == nullptr) return std::string(kUsualIconFile);
     const std::string* name = value->asString();
     if (name == nullptr || !isPlainFileName(*name)) return std::nullopt;

@@ -1,6 +1,5 @@
 #include "device/Containers.h"
 
-#include <dirent.h>
 #include <fcntl.h>
 #include <sys/random.h>
 #include <sys/stat.h>
@@ -8,8 +7,8 @@
 
 #include <array>
 #include <cerrno>
-#include <memory>
 
+#include "device/DevicePaths.h"
 #include "system/PosixError.h"
 #include "system/RootDirectory.h"
 #include "system/RootedFileSystem.h"
@@ -35,10 +34,6 @@ std::string makeUuid() {
     }
     return text;
 }
-
-struct CloseDirectory {
-    void operator()(DIR* directory) const { ::closedir(directory); }
-};
 
 }  // namespace
 
@@ -72,35 +67,20 @@ Result<NewContainer> Containers::make() {
 }
 
 void Containers::remove(const std::string& name) {
-    if (!name.empty()) files_.removeItem(pathOf(name)).ignore();
+    // Out of a database that somebody has altered it could be the path of anything.
+    const bool isPlain = name.find('/') == name.npos && name != "." && name != "..";
+    if (isPlain && !name.empty()) files_.removeItem(pathOf(name)).ignore();
 }
 
 Result<std::vector<std::string>> Containers::names() const {
     const std::string path(kContainersDirectory);
-    const Result<UniqueFd> directory = files_.root().openDirectory(path, "list");
+    const Result<UniqueFd> directory = files_.root().openDirectoryWithoutLinks(path, "list");
     if (!directory) return directory.error();
     return namesIn(directory->get(), path);
 }
 
 std::string Containers::pathOf(std::string_view name) {
     return std::string(kContainersDirectory).append("/").append(name);
-}
-
-Result<std::vector<std::string>> namesIn(int directory, std::string_view path) {
-    UniqueFd own(::openat(directory, ".", O_RDONLY | O_DIRECTORY | O_CLOEXEC));
-    if (!own) return posixError(errno, "list", path);
-    const std::unique_ptr<DIR, CloseDirectory> stream(::fdopendir(own.get()));
-    if (stream == nullptr) return posixError(errno, "list", path);
-    static_cast<void>(own.release());  // the stream's now
-    std::vector<std::string> names;
-    errno = 0;
-    while (const dirent* entry = ::readdir(stream.get())) {
-        const std::string_view name = entry->d_name;
-        if (name != "." && name != "..") names.emplace_back(name);
-        errno = 0;
-    }
-    if (errno != 0) return posixError(errno, "list", path);
-    return names;
 }
 
 }  // namespace appsync

@@ -2,7 +2,6 @@
 
 #include <cstdint>
 #include <string>
-#include <string_view>
 #include <vector>
 
 #include "platform/Result.h"
@@ -11,9 +10,6 @@
 namespace appsync {
 
 class RootedFileSystem;
-
-/// The directory that holds the containers of all bundles, a device path.
-inline constexpr std::string_view kContainersDirectory = "/var/containers/Bundle/Application";
 
 /// A fresh container that belongs to no record yet: it is removed again unless it is kept.
 class NewContainer {
@@ -59,8 +55,5 @@ class Containers {
   private:
     RootedFileSystem& files_;
 };
-
-/// The names in the directory that a descriptor refers to, without "." and "..".
-[[nodiscard]] Result<std::vector<std::string>> namesIn(int directory, std::string_view path);
 
 }  // namespace appsync

@@ -30,12 +30,6 @@ ErrorRecord notInstalled(const std::string& identifier) {
                              identifier + " is not installed, so there is nothing to update");
 }
 
-Result<bool> isInstalled(Database& database, const std::string& identifier) {
-    const auto row = findBundle(database, BundleTable::Applications, identifier);
-    if (!row) return row.error();
-    return row->has_value();
-}
-
 Result<StoredCoordinator> insert(Database& database, CoordinatorKind kind,
                                  const std::string& identifier, CoordinationClient client) {
     const Result<std::int64_t> id = insertCoordinator(database, identifier, kind, client);

@@ -74,17 +74,16 @@ Status reconcileCoordinators(const InstallContext& context) {
     return {};
 }
 
-std::unordered_set<std::string> deliveredFiles(const InstallContext& context) {
+Result<std::unordered_set<std::string>> deliveredFiles(const InstallContext& context) {
     std::unordered_set<std::string> paths;
-    context.database
-        .read([&](Database& database) {
-            Query rows = database.query(
-                "SELECT path FROM promises"
-                " WHERE complete <> 0 AND cancelled = 0 AND path IS NOT NULL");
-            while (rows.next()) paths.insert(rows.text(0));
-            return rows.status();
-        })
-        .ignore();
+    const Status status = context.database.read([&](Database& database) {
+        Query rows = database.query(
+            "SELECT path FROM promises"
+            " WHERE complete <> 0 AND cancelled = 0 AND path IS NOT NULL");
+        while (rows.next()) paths.insert(rows.text(0));
+        return rows.status();
+    });
+    if (!status) return status.error();
     return paths;
 }
 

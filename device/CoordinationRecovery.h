@@ -19,6 +19,6 @@ struct InstallContext;
 Status reconcileCoordinators(const InstallContext& context);
 
 /// The device paths of the files that coordinators have been delivered and have yet to use.
-[[nodiscard]] std::unordered_set<std::string> deliveredFiles(const InstallContext& context);
+[[nodiscard]] Result<std::unordered_set<std::string>> deliveredFiles(const InstallContext& context);
 
 }  // namespace appsync

@@ -24,6 +24,8 @@ struct Failure {
     const std::string& path;
 };
 
+bool meansNoSpace(int systemError) { return systemError == ENOSPC || systemError == EDQUOT; }
+
 // Without its shared memory file a database cannot even be read, and what failed there may hide the
 // system's reason.
 bool hasNoSpace(const Failure& failure) {
@@ -32,7 +34,7 @@ bool hasNoSpace(const Failure& failure) {
             return true;
         case SQLITE_IOERR:
         case SQLITE_CANTOPEN: {
-            if (failure.systemError == ENOSPC || failure.systemError == EDQUOT) return true;
+            if (meansNoSpace(failure.systemError)) return true;
             struct statvfs space = {};
             return ::statvfs(failure.path.c_str(), &space) == 0 && space.f_blocks > 0 &&
                    space.f_bavail == 0;
@@ -51,15 +53,30 @@ bool isWriteProtected(const Failure& failure) {
     return ::access(failure.path.c_str(), W_OK) != 0 || ::access(directory.c_str(), W_OK) != 0;
 }
 
+// The system's reason for the last failure on the log or the database. What SQLite tells itself
+// may be of a call that it has made since.
+int systemErrorOf(sqlite3* handle) {
+    sqlite3_file* log = nullptr;
+    int ofLog = 0;
+    if (sqlite3_file_control(handle, "main", SQLITE_FCNTL_JOURNAL_POINTER, &log) == SQLITE_OK &&
+        log != nullptr && log->pMethods != nullptr) {
+        log->pMethods->xFileControl(log, SQLITE_FCNTL_LAST_ERRNO, &ofLog);
+    }
+    if (meansNoSpace(ofLog)) return ofLog;
+    int ofDatabase = 0;
+    sqlite3_file_control(handle, "main", SQLITE_FCNTL_LAST_ERRNO, &ofDatabase);
+    return meansNoSpace(ofDatabase) ? ofDatabase : sqlite3_system_errno(handle);
+}
+
 // The one place where SQLite's result codes become errors.
 ErrorRecord databaseError(const Failure& failure) {
     const std::string what = "the device's database " + failure.path;
     if (hasNoSpace(failure)) {
         return deviceError(
-            DeviceErrorCode::CannotUse,
+            DeviceErrorCode::NoSpace,
             what +
                 " cannot grow: the disk that it is on is full; free some space there and try "
-                "again");
+                "again, or remove an application with appsync uninstall");
     }
     if (isWriteProtected(failure)) {
         return deviceError(
@@ -179,10 +196,14 @@ Result<std::unique_ptr<Database>> Database::open(const std::string& path, Mode m
     if (resultCode != SQLITE_OK) return database->error(resultCode);
     sqlite3_busy_timeout(handle, kBusyTimeoutMilliseconds);
     sqlite3_db_config(handle, SQLITE_DBCONFIG_DEFENSIVE, 1, nullptr);
-    if (Status status = database->execute("PRAGMA foreign_keys = ON; PRAGMA trusted_schema = OFF;");
-        !status) {
-        return status.error();
-    }
+    // A device's database has neither; what somebody put into it does not run.
+    sqlite3_db_config(handle, SQLITE_DBCONFIG_ENABLE_TRIGGER, 0, nullptr);
+    sqlite3_db_config(handle, SQLITE_DBCONFIG_ENABLE_VIEW, 0, nullptr);
+    Status status = database->execute("PRAGMA foreign_keys = ON; PRAGMA trusted_schema = OFF;");
+    // Before the first access, so that the log's index is kept in memory.
+    if (status && mode == Mode::Alone)
+        status = database->execute("PRAGMA locking_mode = EXCLUSIVE");
+    if (!status) return status.error();
     return database;
 }
 
@@ -225,8 +246,9 @@ std::size_t Database::changedRows() const {
 ErrorRecord Database::error(int resultCode) const {
     if (handle_ == nullptr)
         return databaseError({resultCode, 0, sqlite3_errstr(resultCode), path_});
-    return databaseError(
-        {resultCode, sqlite3_system_errno(handle_), sqlite3_errmsg(handle_), path_});
+    // Asked for first: asking for the reason changes it.
+    const std::string reason = sqlite3_errmsg(handle_);
+    return databaseError({resultCode, systemErrorOf(handle_), reason, path_});
 }
 
 }  // namespace appsync

@@ -77,7 +77,14 @@ class Query {
 /// `kDeviceErrorDomain`.
 class Database {
   public:
-    enum class Mode { Create, Existing };
+    enum class Mode {
+        Create,
+        Existing,
+        /// An existing one, and nobody else has it open meanwhile: whoever comes waits. Needs no
+        /// shared memory file, so a full disk can be looked at. Fails as a database that is in use
+        /// where another connection stays for ten seconds.
+        Alone,
+    };
 
     /// Creates the file or opens an existing one. Waits up to ten seconds where another connection
     /// holds what a statement needs.

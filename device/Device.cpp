@@ -7,6 +7,7 @@
 #include <filesystem>
 #include <fstream>
 #include <map>
+#include <set>
 
 #include "device/BundleRemoval.h"
 #include "device/CairoIconRenderer.h"
@@ -30,6 +31,7 @@
 #include "device/Reconciliation.h"
 #include "device/RestoreData.h"
 #include "device/SessionLock.h"
+#include "device/SpaceReserve.h"
 #include "system/PosixError.h"
 #include "system/PropertyListCodec.h"
 #include "system/RootedFileSystem.h"
@@ -111,7 +113,7 @@ Status Device::create(const std::string& path, const DeviceCreateOptions& option
 Result<std::unique_ptr<Device>> Device::open(const std::string& path,
                                              const DeviceOpenOptions& options) {
     const bool session = options.access == DeviceAccess::Session;
-    Result<OpenedDevice> opened = openDevice(path, session);
+    Result<OpenedDevice> opened = openDevice(path, session, options.makesRoom);
     if (!opened) return opened.error();
     auto state = std::make_unique<State>(std::move(*opened), options);
     if (session) {
@@ -128,7 +130,10 @@ Device::Device(std::unique_ptr<State> state) : state_(std::move(state)) {}
 Device::~Device() {
     state_->coordination.close();
     state_->database->flush().ignore();
-    if (state_->lock) endSession(state_->context).ignore();
+    if (!state_->lock) return;
+    clearPackages(state_->context);
+    endSession(state_->context).ignore();
+    keepSpaceReserve(state_->path);
 }
 
 Platform Device::platform(SyncHost& host, LogFacility& log) {
@@ -174,6 +179,24 @@ Result<std::vector<ApplicationRecord>> Device::applications() {
     return listApplications(*state_->database);
 }
 
+// An install may have taken the old bundle away between the two looks.
+Result<std::vector<ApplicationRecord>> Device::applicationsOnDisk() {
+    Result<std::vector<ApplicationRecord>> records = applications();
+    if (!records) return records;
+    std::set<std::string> lost;
+    for (const ApplicationRecord& each : *records) {
+        if (!state_->files->itemExists(each.container)) lost.insert(each.container);
+    }
+    if (lost.empty()) return records;
+    records = applications();
+    if (!records) return records;
+    std::erase_if(*records,
+                  [&](const ApplicationRecord& each) { return lost.contains(each.container); });
+    return records;
+}
+
+bool Device::freeze(std::chrono::milliseconds longest) { return state_->database->freeze(longest); }
+
 std::optional<InstallProgress> Device::installProgress(const std::string& identifier) {
     if (state_->lock) return state_->progress.progress(identifier);
     return storedProgress(*state_->database, identifier);
@@ -194,6 +217,18 @@ Result<std::vector<HomeScreenItem>> Device::homeScreen() {
     const Result<std::vector<ApplicationRecord>> records = applications();
     if (!records) return records.error();
     return homeScreenItems(*order, *records, state_->files->root());
+}
+
+Result<std::vector<ApplicationRecord>> Device::homeScreenApplications() {
+    const Result<std::vector<std::string>> order = state_->homeScreen.order();
+    if (!order) return order.error();
+    const Result<std::vector<ApplicationRecord>> records = applications();
+    if (!records) return records.error();
+    std::vector<ApplicationRecord> shown;
+    for (const ApplicationRecord* record : homeScreenRecords(*order, *records)) {
+        shown.push_back(*record);
+    }
+    return shown;
 }
 
 Result<std::vector<HistoryRecord>> Device::history(std::size_t limit) {
@@ -252,6 +287,27 @@ Status Device::uninstall(const std::string& identifier) {
 Result<std::vector<std::string>> Device::removeLeftoverSyncPlaceholders() {
     if (Status status = requireSession(); !status) return status.error();
     return removeSyncPlaceholders(state_->context);
+}
+
+Status Device::forgetFailures(const std::set<std::string>& identifiers) {
+    if (Status status = requireSession(); !status) return status;
+    std::vector<std::string> obsolete;
+    Status status = state_->database->read([&](Database& database) {
+        Query rows = database.query("SELECT identifier FROM failures");
+        while (rows.next()) {
+            if (identifiers.contains(rows.text(0))) obsolete.push_back(rows.text(0));
+        }
+        return rows.status();
+    });
+    if (!status || obsolete.empty()) return status;
+    return state_->database->change(Durability::Soon, [&](Database& database) -> Status {
+        for (const std::string& identifier : obsolete) {
+            Status deleted =
+                database.query("DELETE FROM failures WHERE identifier = ?").bind(identifier).run();
+            if (!deleted) return deleted;
+        }
+        return {};
+    });
 }
 
 Status Device::demote(const std::string& identifier, DemotedBy by) {

@@ -5,6 +5,7 @@
 #include <map>
 #include <memory>
 #include <optional>
+#include <set>
 #include <string>
 #include <vector>
 
@@ -36,6 +37,9 @@ struct DeviceOpenOptions {
     /// When a denied termination is asked for again: by the coordination service. On the direct
     /// path it is only told to people, as the plug-in keeps the time.
     std::chrono::seconds retryInterval{30};
+    /// Something is to be taken away. Where the disk is full, the space that the device keeps for
+    /// that is given up; the next session that ends with plenty of it left keeps some again.
+    bool makesRoom = false;
 };
 
 /// Who takes an application's bundle away while its placeholder and its data stay.
@@ -95,17 +99,28 @@ class Device {
     /// Installed applications and placeholders, ordered by identifier; an application stands before
     /// the placeholder that covers it.
     [[nodiscard]] Result<std::vector<ApplicationRecord>> applications();
+    /// The same as a session that began now would find it: without what has lost its bundle on
+    /// disk.
+    [[nodiscard]] Result<std::vector<ApplicationRecord>> applicationsOnDisk();
     /// How far an install has come; nothing when none is under way. Cheap; may be polled.
     [[nodiscard]] std::optional<InstallProgress> installProgress(const std::string& identifier);
     [[nodiscard]] Result<ApplicationStatus> status(const std::string& identifier);
     /// What `drawHomeScreen` draws: one item an application, in home-screen order.
     [[nodiscard]] Result<std::vector<HomeScreenItem>> homeScreen();
+    /// The same applications in the same order, without rendering their icons.
+    [[nodiscard]] Result<std::vector<ApplicationRecord>> homeScreenApplications();
     /// The transaction log, oldest first; at most the last `limit` records.
     [[nodiscard]] Result<std::vector<HistoryRecord>> history(std::size_t limit = 100'000);
 
     [[nodiscard]] Result<DeviceSettings> settings();
     /// Takes effect at once, also for a session that is under way (coordination: for the next).
     Status change(const DeviceSettingsChange& change);
+
+    /// For a process that is about to leave at once: nothing more is committed, whoever tries to
+    /// waits for ever, so that what the device shows from now on is what it will be left with.
+    /// False, and nothing is certain, when a commit does not end within the time. The device cannot
+    /// be used any more, except to look at it.
+    [[nodiscard]] bool freeze(std::chrono::milliseconds longest);
 
     // Coordinated installs.
 
@@ -145,6 +160,8 @@ class Device {
     /// Removes the placeholders of type `kInstallTypeSync` that an interrupted session left. Gives
     /// their identifiers.
     [[nodiscard]] Result<std::vector<std::string>> removeLeftoverSyncPlaceholders();
+    /// Nobody misses anything of these applications any more: their last failures are forgotten.
+    Status forgetFailures(const std::set<std::string>& identifiers);
     /// Takes the bundle away and leaves placeholder and data.
     Status demote(const std::string& identifier, DemotedBy by);
 

@@ -5,10 +5,10 @@
 #include <sys/stat.h>
 #include <unistd.h>
 
-#include <array>
 #include <cerrno>
 #include <cstdio>
 #include <filesystem>
+#include <utility>
 
 #include "device/Containers.h"
 #include "device/Database.h"
@@ -16,6 +16,7 @@
 #include "device/DevicePaths.h"
 #include "device/DeviceSchema.h"
 #include "device/PackageError.h"
+#include "device/SpaceReserve.h"
 #include "system/PosixError.h"
 #include "system/UniqueFd.h"
 
@@ -24,10 +25,6 @@ namespace appsync {
 namespace {
 
 namespace fs = std::filesystem;
-
-constexpr std::array<std::string_view, 6> kDirectories = {
-    kTemporaryDirectory,  kPublicStagingDirectory, kDataDirectory,
-    kContainersDirectory, "/var/mobile/Library",   "/var/mobile/Library/Preferences"};
 
 ErrorRecord cannotCreate(const fs::path& device, const ErrorRecord& cause) {
     return deviceError(
@@ -78,18 +75,16 @@ class Scaffold {
 
     /// Removes what crashed creations left, and makes the directory.
     Status make() {
+        constexpr int kMostAttempts = 100;
         clearStale();
-        std::string pattern = (device_.parent_path() / (prefix_ + "XXXXXX")).string();
-        if (::mkdtemp(pattern.data()) == nullptr) {
-            return parentRefuses(device_, errno);
+        for (int attempt = 0; attempt < kMostAttempts; ++attempt) {
+            std::string pattern = (device_.parent_path() / (prefix_ + "XXXXXX")).string();
+            if (::mkdtemp(pattern.data()) == nullptr) return parentRefuses(device_, errno);
+            path_ = pattern;
+            if (hold()) return {};
+            discard(std::exchange(path_, {}));
         }
-        path_ = pattern;
-        lock_ = openDirectory(path_);
-        if (!lock_ || ::flock(lock_.get(), LOCK_EX | LOCK_NB) != 0 ||
-            ::fchmod(lock_.get(), 0755) != 0) {
-            return posixError(errno, "create", device_.string());
-        }
-        return {};
+        return posixError(errno, "create", device_.string());
     }
 
     /// Makes it durable, and the device.
@@ -115,6 +110,16 @@ class Scaffold {
         return UniqueFd(::open(path.c_str(), O_RDONLY | O_DIRECTORY | O_CLOEXEC | O_NOFOLLOW));
     }
 
+    // Another creation, at the same moment, may take the directory for one that a crash left, as
+    // long as it is not locked.
+    bool hold() {
+        lock_ = openDirectory(path_);
+        struct stat attributes {};
+        return lock_ && ::flock(lock_.get(), LOCK_EX | LOCK_NB) == 0 &&
+               ::fstat(lock_.get(), &attributes) == 0 && attributes.st_nlink > 0 &&
+               ::fchmod(lock_.get(), 0755) == 0;
+    }
+
     static void discard(const fs::path& path) {
         std::error_code ignored;
         if (!path.empty()) fs::remove_all(path, ignored);
@@ -138,7 +143,7 @@ class Scaffold {
 };
 
 Status makeDirectories(const fs::path& device) {
-    for (const std::string_view directory : kDirectories) {
+    for (const std::string_view directory : kStandingDirectories) {
         const fs::path path = device / kRootName / directory.substr(1);
         std::error_code error;
         fs::create_directories(path, error);
@@ -165,7 +170,9 @@ Status build(Scaffold& scaffold, bool coordination) {
     Status status = scaffold.make();
     if (status) status = makeDirectories(scaffold.path());
     if (status) status = makeDatabase(scaffold.path(), coordination);
-    return status ? scaffold.putInPlace() : status;
+    if (!status) return status;
+    keepSpaceReserve(scaffold.path().string());
+    return scaffold.putInPlace();
 }
 
 }  // namespace

@@ -15,8 +15,9 @@ namespace {
 
 constexpr std::chrono::milliseconds kLongestDelay{100};
 
-Result<std::unique_ptr<Database>> connect(const std::string& path) {
-    Result<std::unique_ptr<Database>> database = Database::open(path, Database::Mode::Existing);
+Result<std::unique_ptr<Database>> connect(const std::string& path,
+                                          Database::Mode mode = Database::Mode::Existing) {
+    Result<std::unique_ptr<Database>> database = Database::open(path, mode);
     if (!database) return database;
     if (Status status = checkDeviceSchema(**database); !status) return status.error();
     if (Status status = (*database)->execute("PRAGMA synchronous = FULL"); !status) {
@@ -35,10 +36,15 @@ struct DeviceDatabase::Waiting {
     bool done = false;
 };
 
-Result<std::unique_ptr<DeviceDatabase>> DeviceDatabase::open(const std::string& path) {
+Result<std::unique_ptr<DeviceDatabase>> DeviceDatabase::open(const std::string& path,
+                                                             Sharing sharing) {
     Result<std::unique_ptr<Database>> reader = connect(path);
-    if (!reader) return reader.error();
-    Result<std::unique_ptr<Database>> writer = connect(path);
+    const bool alone = !reader && sharing == Sharing::IfThereIsSpace &&
+                       isDeviceError(reader.error(), DeviceErrorCode::NoSpace);
+    if (!reader && !alone) return reader.error();
+    if (alone) reader = std::unique_ptr<Database>();
+    Result<std::unique_ptr<Database>> writer =
+        connect(path, alone ? Database::Mode::Alone : Database::Mode::Existing);
     if (!writer) return writer.error();
     return std::unique_ptr<DeviceDatabase>(
         new DeviceDatabase(std::move(*reader), std::move(*writer)));
@@ -58,6 +64,7 @@ DeviceDatabase::~DeviceDatabase() {
 }
 
 Status DeviceDatabase::read(const Reading& reading) {
+    if (!reader_) return change(Durability::Soon, reading);
     const std::lock_guard lock(readerMutex_);
     return noteFailure(reading(*reader_));
 }
@@ -66,7 +73,7 @@ Status DeviceDatabase::change(Durability durability, const Change& change) {
     Waiting own{change, durability};
     std::unique_lock lock(mutex_);
     queue_.push_back(&own);
-    turn_.wait(lock, [&] { return own.done || queue_.front() == &own; });
+    turn_.wait(lock, [&] { return own.done || (queue_.front() == &own && !isFrozen_); });
     if (!own.done) lead(lock);
     lock.unlock();
     return noteFailure(std::move(own.status));
@@ -76,9 +83,11 @@ Status DeviceDatabase::change(Durability durability, const Change& change) {
 void DeviceDatabase::lead(std::unique_lock<std::mutex>& lock) {
     const std::vector<Waiting*> batch(queue_.begin(), queue_.end());
     const std::vector<Change> later = std::exchange(later_, {});
+    isLeading_ = true;
     lock.unlock();
     commitTogether(batch, later);
     lock.lock();
+    isLeading_ = false;
     queue_.erase(queue_.begin(), queue_.begin() + static_cast<std::ptrdiff_t>(batch.size()));
     for (Waiting* waiting : batch) waiting->done = true;
     turn_.notify_all();
@@ -161,9 +170,15 @@ void DeviceDatabase::flushNowAndThen() {
 Status DeviceDatabase::flush() {
     {
         const std::lock_guard lock(mutex_);
-        if (later_.empty() && queue_.empty()) return {};
+        if (isFrozen_ || (later_.empty() && queue_.empty())) return {};
     }
     return change(Durability::Soon, [](Database&) { return Status(); });
+}
+
+bool DeviceDatabase::freeze(std::chrono::milliseconds longest) {
+    std::unique_lock lock(mutex_);
+    isFrozen_ = true;
+    return turn_.wait_for(lock, longest, [this] { return !isLeading_; });
 }
 
 std::optional<ErrorRecord> DeviceDatabase::failure() const {

@@ -1,5 +1,6 @@
 #pragma once
 
+#include <chrono>
 #include <condition_variable>
 #include <deque>
 #include <functional>
@@ -23,7 +24,7 @@ enum class Durability {
     Soon,    // with the next change that is OnDisk, or when the system gets to it
 };
 
-/// A device's database: one connection that reads, one that writes.
+/// A device's database: one connection that reads, one that writes; on a full disk a single one.
 ///
 /// Writers that come at the same time share one transaction and one sync: the first of them
 /// commits for all that wait by then. Callable on any thread. The functions that are passed in may
@@ -34,8 +35,17 @@ class DeviceDatabase {
     using Change = std::function<Status(Database&)>;
     using Reading = std::function<Status(Database&)>;
 
+    /// Whether others may use the database at the same time.
+    enum class Sharing {
+        Always,
+        /// Where there is no space for what sharing needs, nobody else can use it as long as this
+        /// object has it open.
+        IfThereIsSpace,
+    };
+
     /// Opens the database and checks that it is one that this version can use.
-    [[nodiscard]] static Result<std::unique_ptr<DeviceDatabase>> open(const std::string& path);
+    [[nodiscard]] static Result<std::unique_ptr<DeviceDatabase>> open(
+        const std::string& path, Sharing sharing = Sharing::Always);
 
     /// Makes the changes that were left for later.
     ~DeviceDatabase();
@@ -57,6 +67,10 @@ class DeviceDatabase {
     /// Makes the changes that were left for later, now.
     Status flush();
 
+    /// From now on no change is begun, whoever asks for one waits for ever. False when one that is
+    /// under way does not end within the time.
+    [[nodiscard]] bool freeze(std::chrono::milliseconds longest);
+
     /// The first failure of the database itself, whoever met it.
     [[nodiscard]] std::optional<ErrorRecord> failure() const;
 
@@ -74,8 +88,8 @@ class DeviceDatabase {
     void flushNowAndThen();
 
     std::mutex readerMutex_;
-    const std::unique_ptr<Database> reader_;            // protected by readerMutex_
-    const std::unique_ptr<Database> writer_;            // used by whoever stands first in queue_
+    const std::unique_ptr<Database> reader_;  // protected by readerMutex_; none when not shared
+    const std::unique_ptr<Database> writer_;  // used by whoever stands first in queue_
     Durability writerDurability_ = Durability::OnDisk;  // likewise
 
     mutable std::mutex mutex_;
@@ -83,6 +97,8 @@ class DeviceDatabase {
     std::condition_variable turn_;
     std::deque<Waiting*> queue_;
     std::vector<Change> later_;
+    bool isLeading_ = false;  // somebody commits
+    bool isFrozen_ = false;
     std::optional<ErrorRecord> failure_;
     std::condition_variable flusherWakes_;
     bool closing_ = false;

@@ -19,7 +19,8 @@ enum class DeviceErrorCode : std::int64_t {
     Damaged = 5,        // the database cannot be read
     InUse = 6,          // another session holds the device
     AlreadyExists = 7,  // creation only: something stands at the path already
-    CannotUse = 8,      // the operating system refuses: permissions, a full disk ...
+    CannotUse = 8,      // the operating system refuses: permissions ...
+    NoSpace = 9,        // the disk is full
 };
 
 /// The codes of `kRegistryErrorDomain` of a device's registry.
@@ -33,6 +34,7 @@ enum class RegistryErrorCode : std::int64_t {
     InstallUnderWay = 7,     // a termination assertion is held on it
     DatabaseFailed = 8,      // the registry's own database failed
     Uninstalled = 9,         // a person uninstalled it while its install was under way
+    Running = 10,            // it runs, and its termination is denied
 };
 
 /// Domain of errors of a device's coordination service.

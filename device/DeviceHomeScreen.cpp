@@ -75,10 +75,6 @@ Result<bool> holds(Database& database, const char* sql, const std::string& ident
     return found;
 }
 
-Result<bool> isInstalled(Database& database, const std::string& identifier) {
-    return holds(database, "SELECT 1 FROM applications WHERE identifier = ?", identifier);
-}
-
 Status recordDenial(Database& database, const std::string& identifier,
                     std::chrono::seconds retryInterval) {
     const WallTime now = wallNow();
@@ -221,8 +217,9 @@ Status markRunning(Database& database, const std::string& identifier, bool asser
     const Result<bool> installed = isInstalled(database, identifier);
     if (!installed) return installed.error();
     if (!*installed) {
-        return registryError(RegistryErrorCode::NothingInstalled,
-                             identifier + " is not installed, so it cannot run");
+        return registryError(
+            RegistryErrorCode::NothingInstalled,
+            identifier + " is not installed, so it cannot run; appsync apps shows what is");
     }
     const Result<bool> held =
         holds(database, "SELECT 1 FROM assertions WHERE identifier = ?", identifier);
@@ -242,8 +239,9 @@ Status endRunning(Database& database, const std::string& identifier) {
     const Result<bool> installed = isInstalled(database, identifier);
     if (!installed) return installed.error();
     if (!*installed) {
-        return registryError(RegistryErrorCode::NothingInstalled,
-                             identifier + " is not installed, so it does not run");
+        return registryError(
+            RegistryErrorCode::NothingInstalled,
+            identifier + " is not installed, so it does not run; appsync apps shows what is");
     }
     return database.query("DELETE FROM running WHERE identifier = ?").bind(identifier).run();
 }

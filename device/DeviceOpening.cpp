@@ -11,6 +11,7 @@
 #include "device/DeviceError.h"
 #include "device/DevicePaths.h"
 #include "device/DeviceSchema.h"
+#include "device/SpaceReserve.h"
 #include "system/PosixError.h"
 
 namespace appsync {
@@ -104,7 +105,9 @@ Status takeLock(const fs::path& device, std::optional<SessionLock>& lock) {
 }
 
 Status openDatabase(const fs::path& device, bool session, OpenedDevice& opened) {
-    auto database = DeviceDatabase::open((device / kDatabaseName).string());
+    using Sharing = DeviceDatabase::Sharing;
+    auto database = DeviceDatabase::open((device / kDatabaseName).string(),
+                                         session ? Sharing::Always : Sharing::IfThereIsSpace);
     if (!database) return database.error();
     opened.database = std::move(*database);
     if (!session) return {};
@@ -128,7 +131,7 @@ ErrorRecord cannotUseDevice(const std::string& path, const ErrorRecord& cause) {
                        "cannot use the device " + displayPath(path) + ": " + cause.description());
 }
 
-Result<OpenedDevice> openDevice(const std::string& path, bool session) {
+Result<OpenedDevice> openDevice(const std::string& path, bool session, bool makesRoom) {
     std::error_code error;
     const fs::path device = fs::absolute(path, error);
     if (path.empty() || path.find('\0') != path.npos || error) return missing(path).error();
@@ -136,6 +139,7 @@ Result<OpenedDevice> openDevice(const std::string& path, bool session) {
     opened.path = device.string();
     Status status = checkDirectory(device);
     if (status && session) status = takeLock(device, opened.lock);
+    if (status && makesRoom) giveUpSpaceReserveIfFull(opened.path);
     if (status) status = openDatabase(device, session, opened);
     if (status) status = openFiles(device, opened);
     if (!status) return cannotUseDevice(path, status.error());

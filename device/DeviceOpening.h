@@ -20,8 +20,10 @@ struct OpenedDevice {
 };
 
 /// Opens a device directory. With `session` it takes the session's lock first, and reads the whole
-/// database to see whether it is sound. Errors are of `kDeviceErrorDomain`.
-[[nodiscard]] Result<OpenedDevice> openDevice(const std::string& path, bool session);
+/// database to see whether it is sound; with `makesRoom` it gives up the space that the device
+/// keeps for a full disk, if it is. Errors are of `kDeviceErrorDomain`.
+[[nodiscard]] Result<OpenedDevice> openDevice(const std::string& path, bool session,
+                                              bool makesRoom);
 
 /// The error as one that says that the device cannot be used; one that does already, as it is.
 [[nodiscard]] ErrorRecord cannotUseDevice(const std::string& path, const ErrorRecord& cause);

@@ -7,7 +7,7 @@ namespace appsync {
 
 namespace {
 
-Status refused(const std::string& identifier, std::string_view reason) {
+Status refusedPlaceholder(const std::string& identifier, std::string_view reason) {
     return coordinationError(
         CoordinationErrorCode::Refused,
         "the placeholder of " + identifier + " is refused: " + std::string(reason));
@@ -87,8 +87,8 @@ PlaceholderConfiguration DevicePlaceholder::configuration() const {
 
 Status DevicePlaceholder::hand(Owner owner) {
     const std::lock_guard lock(mutex_);
-    if (cancelled_) return refused(identifier_, "it was given up");
-    if (owner_) return refused(identifier_, "a coordinator has it already");
+    if (cancelled_) return refusedPlaceholder(identifier_, "it was given up");
+    if (owner_) return refusedPlaceholder(identifier_, "a coordinator has it already");
     owner_ = std::move(owner);
     return {};
 }
@@ -100,8 +100,8 @@ bool DevicePlaceholder::isConfigurationComplete() const {
 
 Status DevicePlaceholder::mayChange() const {
     const std::lock_guard lock(mutex_);
-    if (cancelled_) return refused(identifier_, "it was given up");
-    if (complete_) return refused(identifier_, "its configuration is complete");
+    if (cancelled_) return refusedPlaceholder(identifier_, "it was given up");
+    if (complete_) return refusedPlaceholder(identifier_, "its configuration is complete");
     return {};
 }
 

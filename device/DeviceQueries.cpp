@@ -199,15 +199,24 @@ Result<ApplicationStatus> applicationStatus(DeviceDatabase& database,
     return status;
 }
 
+std::vector<const ApplicationRecord*> homeScreenRecords(
+    std::span<const std::string> order, std::span<const ApplicationRecord> records) {
+    std::unordered_map<std::string_view, const ApplicationRecord*> byIdentifier;
+    for (const ApplicationRecord& record : records) byIdentifier[record.identifier] = &record;
+    std::vector<const ApplicationRecord*> shown;
+    for (const std::string& identifier : order) {
+        const auto found = byIdentifier.find(identifier);
+        if (found != byIdentifier.end()) shown.push_back(found->second);
+    }
+    return shown;
+}
+
 std::vector<HomeScreenItem> homeScreenItems(std::span<const std::string> order,
                                             std::span<const ApplicationRecord> records,
                                             const RootDirectory& root) {
-    std::unordered_map<std::string_view, const ApplicationRecord*> byIdentifier;
-    for (const ApplicationRecord& record : records) byIdentifier[record.identifier] = &record;
     std::vector<HomeScreenItem> items;
-    for (const std::string& identifier : order) {
-        const auto found = byIdentifier.find(identifier);
-        if (found != byIdentifier.end()) items.push_back(itemOf(*found->second, root));
+    for (const ApplicationRecord* record : homeScreenRecords(order, records)) {
+        items.push_back(itemOf(*record, root));
     }
     return items;
 }

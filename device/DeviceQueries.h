@@ -29,8 +29,12 @@ class RootDirectory;
 [[nodiscard]] Result<ApplicationStatus> applicationStatus(DeviceDatabase& database,
                                                           const std::string& identifier);
 
-/// The items of the home screen: of `order` those that `records` hold. A placeholder stands before
-/// the application that it covers. Icons that cannot be read are left out.
+/// What stands on the home screen: of `order` those that `records` hold. A placeholder stands
+/// before the application that it covers. The results point into `records`.
+[[nodiscard]] std::vector<const ApplicationRecord*> homeScreenRecords(
+    std::span<const std::string> order, std::span<const ApplicationRecord> records);
+
+/// The same as items, with their icons. Icons that cannot be read are left out.
 [[nodiscard]] std::vector<HomeScreenItem> homeScreenItems(
     std::span<const std::string> order, std::span<const ApplicationRecord> records,
     const RootDirectory& root);

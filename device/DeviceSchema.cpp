@@ -1,11 +1,13 @@
 #include "device/DeviceSchema.h"
 
+#include <algorithm>
+#include <set>
 #include <string>
 #include <string_view>
-#include <vector>
 
 #include "device/Database.h"
 #include "device/DeviceError.h"
+#include "device/PackageError.h"
 
 namespace appsync {
 
@@ -180,29 +182,42 @@ ErrorRecord damaged(const Database& database, const std::string& what) {
                            "sync it");
 }
 
-// The names that kTables creates.
-std::vector<std::string> tableNames() {
-    constexpr std::string_view kCreates = "CREATE TABLE ";
-    const std::string_view script = kTables;
-    std::vector<std::string> names;
-    for (std::size_t at = script.find(kCreates); at != script.npos;
-         at = script.find(kCreates, at)) {
-        at += kCreates.size();
-        names.emplace_back(script.substr(at, script.find(' ', at) - at));
+// The statements of kTables, as the database keeps them.
+std::set<std::string> expectedStatements() {
+    std::string_view script = kTables;
+    std::set<std::string> statements;
+    for (std::size_t end = script.find(';'); end != script.npos; end = script.find(';')) {
+        const std::size_t begin = script.find_first_not_of(" \n");
+        statements.emplace(script.substr(begin, end - begin));
+        script.remove_prefix(end + 1);
     }
-    return names;
+    return statements;
 }
 
-Status checkTables(Database& database) {
-    for (const std::string& name : tableNames()) {
-        Query rows =
-            database.query("SELECT 1 FROM sqlite_schema WHERE type = 'table' AND name = ?");
-        rows.bind(name);
-        const bool found = rows.next();
-        if (Status status = rows.status(); !status) return status;
-        if (!found) return damaged(database, "it has no table " + name);
+// "CREATE TABLE name ..." -> "table name".
+std::string creationOf(const std::string& statement) {
+    constexpr std::size_t kCreate = std::string_view("CREATE ").size();
+    const std::size_t name = statement.find(' ', kCreate) + 1;
+    std::string kind = statement.substr(kCreate, name - kCreate);
+    std::transform(kind.begin(), kind.end(), kind.begin(),
+                   [](char letter) { return static_cast<char>(letter | 0x20); });
+    return kind + statement.substr(name, statement.find_first_of(" (", name) - name);
+}
+
+// Exactly what createDeviceSchema makes: a trigger, a view or an index that somebody has put there
+// would do its work with ours.
+Status checkDefinitions(Database& database) {
+    std::set<std::string> missing = expectedStatements();
+    Query rows = database.query(
+        "SELECT type, name, sql FROM sqlite_schema WHERE substr(name, 1, 7) <> 'sqlite_'");
+    while (rows.next()) {
+        if (missing.erase(rows.text(2)) == 1) continue;
+        return damaged(database, "its " + rows.text(0) + " " + quotedName(rows.text(1)) +
+                                     " is not that of a device");
     }
-    return {};
+    if (Status status = rows.status(); !status) return status;
+    if (missing.empty()) return {};
+    return damaged(database, "it has no " + creationOf(*missing.begin()));
 }
 
 }  // namespace
@@ -229,11 +244,10 @@ Status checkDeviceSchema(Database& database) {
     if (!version) return version.error();
     if (*version > kDeviceSchemaVersion) return newerSchema(database, *version);
     if (*version < 1) return damaged(database, "it has no schema version");
-    return {};
+    return checkDefinitions(database);
 }
 
 Status checkDeviceDatabase(Database& database) {
-    if (Status status = checkTables(database); !status) return status;
     Query lines = database.query("PRAGMA quick_check(1)");
     const std::string answer = lines.next() ? lines.text(0) : "no answer";
     if (!lines.status()) return lines.status();

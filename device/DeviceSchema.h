@@ -15,7 +15,9 @@ inline constexpr int kDeviceSchemaVersion = 1;
 /// Makes the tables of an empty database, and marks it as a device's.
 Status createDeviceSchema(Database& database);
 
-/// Refuses a database that is no device's, that is not whole, or that a newer version made.
+/// Refuses a database that is no device's, that is not whole, that a newer version made, or that
+/// holds other tables, indexes, views or triggers than a device's: those of somebody else would
+/// take part in every statement.
 Status checkDeviceSchema(Database& database);
 
 /// Reads the whole database and refuses it when it is damaged.

@@ -68,11 +68,29 @@ Status checkPngClaims(ByteView png) {
     }
     const std::uint32_t width = bigEndian(png.subspan(16, 4));
     const std::uint32_t height = bigEndian(png.subspan(20, 4));
-    if (width == 0 || height == 0 || width > kMaximumIconSide || height > kMaximumIconSide) {
+    const bool isTooLong = width > kMaximumIconSide || height > kMaximumIconSide;
+    if (width == 0 || height == 0 || isTooLong ||
+        std::uint64_t{width} * height > kMaximumIconPixels) {
         return refusal("the image claims " + std::to_string(width) + " x " +
-                       std::to_string(height) + " pixels; at most 4096 x 4096 are allowed");
+                       std::to_string(height) +
+                       " pixels; at most 2048 x 2048 are allowed, or as many with a side of up to "
+                       "4096");
     }
     return {};
+}
+
+/// Refuses chunks that claim more than there is: for some, memory would be taken as claimed.
+Status checkPngChunks(ByteView png) {
+    constexpr std::size_t kLengthBytes = 4;
+    constexpr std::size_t kFrameBytes = 12;  // the chunk's length, type and sum
+    ByteView rest = png.subspan(kPngSignature.size());
+    while (rest.size() >= kFrameBytes) {
+        const std::size_t length = bigEndian(rest.first(kLengthBytes));
+        if (length > rest.size() - kFrameBytes) return refusal("the PNG is damaged or cut off");
+        if (std::memcmp(rest.data() + kLengthBytes, "IEND", 4) == 0) return {};
+        rest = rest.subspan(kFrameBytes + length);
+    }
+    return refusal("the PNG is damaged or cut off");
 }
 
 cairo_status_t readPng(void* closure, unsigned char* data, unsigned int length) {
@@ -145,6 +163,7 @@ DrawingContext drawOn(cairo_surface_t* surface) { return DrawingContext(::cairo_
 
 Result<Surface> decodePng(ByteView png) {
     if (Status status = checkPngClaims(png); !status) return status.error();
+    if (Status status = checkPngChunks(png); !status) return status.error();
     ByteView rest = png;
     Surface surface(::cairo_image_surface_create_from_png_stream(&readPng, &rest));
     const cairo_status_t status = ::cairo_surface_status(surface.get());

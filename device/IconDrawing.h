@@ -12,10 +12,11 @@ namespace appsync {
 /// The side of an icon on the home screen, in pixels.
 inline constexpr int kIconSize = 120;
 
-/// The largest icon file that is read, in bytes, and the largest side of the image in it, in
-/// pixels.
+/// The largest icon file that is read, in bytes; the largest side of the image in it, in pixels;
+/// and how many of them it may have: each takes four bytes, whatever the file's size.
 inline constexpr std::size_t kMaximumIconFileBytes = std::size_t{16} << 20;
 inline constexpr std::uint32_t kMaximumIconSide = 4096;
+inline constexpr std::uint64_t kMaximumIconPixels = std::uint64_t{1} << 22;
 
 /// The image of an icon file as the home screen shows it: scaled to fill 120 x 120 pixels, with
 /// rounded corners, encoded as PNG. Refuses what is not a whole PNG within the limits above; the

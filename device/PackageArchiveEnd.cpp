@@ -30,9 +30,8 @@ constexpr std::uint32_t kHeaderSignature = 0x02014b50;
 constexpr std::size_t kHeaderBytes = 46;
 /// An offset that stands in an extra field instead.
 constexpr std::uint32_t kOffsetElsewhere = 0xffffffff;
-// The header before the contents of an entry.
+/// Of the header before the contents of an entry.
 constexpr std::uint32_t kLocalHeaderSignature = 0x04034b50;
-constexpr std::size_t kLocalHeaderBytes = 30;
 
 /// A package may hold archives of its own, whose ends are seen too; each costs libzip some work.
 constexpr std::size_t kMostEnds = 16;

@@ -5,6 +5,7 @@
 #include <algorithm>
 #include <cstddef>
 
+#include "device/PackageArchiveEnd.h"
 #include "device/PackageError.h"
 #include "device/PackageText.h"
 
@@ -13,8 +14,6 @@ namespace appsync {
 namespace {
 
 constexpr std::string_view kBundleSuffix = ".app";
-/// What a local header takes in the archive at least, beside the name.
-constexpr std::uint64_t kLocalHeaderBytes = 30;
 
 unsigned int rank(char character) noexcept {
     return character == '/' ? 0U : static_cast<unsigned char>(character) + 1U;

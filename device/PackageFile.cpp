@@ -17,7 +17,11 @@ PackageFile::PackageFile(UniqueFd descriptor, std::uint64_t size, std::string_vi
 
 Result<PackageFile> PackageFile::open(const std::string& path) {
     UniqueFd descriptor(::open(path.c_str(), O_RDONLY | O_NONBLOCK | O_NOCTTY | O_CLOEXEC));
-    if (!descriptor) return posixError(errno, "open", path);
+    if (!descriptor) {
+        const int error = errno;
+        return posixError(error, "open", path,
+                          posixReason(error) + "; name a file that can be read");
+    }
     return take(std::move(descriptor), path);
 }
 

@@ -6,6 +6,11 @@ namespace appsync {
 
 namespace {
 
+constexpr std::string_view kArchiveSuffix = ".zip";
+// No identifier ends so.
+constexpr std::string_view kReplacedSuffix = "~zip";
+constexpr std::size_t kLongestFileName = 255;
+
 bool isIdentifierCharacter(char character) noexcept {
     return (character >= 'a' && character <= 'z') || (character >= 'A' && character <= 'Z') ||
            (character >= '0' && character <= '9') || character == '.' || character == '-' ||
@@ -18,6 +23,27 @@ bool isLegalIdentifier(std::string_view text) noexcept {
     if (text.empty() || text.size() > kMaximumIdentifierLength) return false;
     if (text == "." || text == "..") return false;
     return std::all_of(text.begin(), text.end(), isIdentifierCharacter);
+}
+
+std::string archiveNameOf(const std::string& identifier) {
+    if (identifier.size() + kArchiveSuffix.size() <= kLongestFileName) {
+        return identifier + std::string(kArchiveSuffix);
+    }
+    if (!identifier.ends_with(kArchiveSuffix)) return identifier;
+    return identifier.substr(0, identifier.size() - kArchiveSuffix.size()) +
+           std::string(kReplacedSuffix);
+}
+
+std::optional<std::string> identifierOfArchive(std::string_view name) {
+    std::string identifier(name);
+    if (name.ends_with(kArchiveSuffix)) {
+        identifier.resize(name.size() - kArchiveSuffix.size());
+    } else if (name.ends_with(kReplacedSuffix)) {
+        identifier.replace(name.size() - kReplacedSuffix.size(), kReplacedSuffix.size(),
+                           kArchiveSuffix);
+    }
+    if (!isLegalIdentifier(identifier) || archiveNameOf(identifier) != name) return std::nullopt;
+    return identifier;
 }
 
 }  // namespace appsync

@@ -1,6 +1,8 @@
 #pragma once
 
 #include <cstddef>
+#include <optional>
+#include <string>
 #include <string_view>
 
 namespace appsync {
@@ -12,5 +14,13 @@ inline constexpr std::size_t kMaximumIdentifierLength = 255;
 /// letters, digits, '.', '-' and '_', and neither "." nor "..". Such a text is safe as the name of
 /// a file.
 [[nodiscard]] bool isLegalIdentifier(std::string_view text) noexcept;
+
+/// The name of the file in which the package of an application, or its data, travels and waits: the
+/// identifier and ".zip". No file name is longer than 255 bytes: where that would be, it is the
+/// identifier alone, and a ".zip" that this ends in becomes "~zip". No two identifiers share one.
+[[nodiscard]] std::string archiveNameOf(const std::string& identifier);
+
+/// The identifier whose archive is named so; nothing when no identifier's is.
+[[nodiscard]] std::optional<std::string> identifierOfArchive(std::string_view name);
 
 }  // namespace appsync

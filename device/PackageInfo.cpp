@@ -6,17 +6,11 @@
 #include "device/PackageError.h"
 #include "device/PackageIdentifier.h"
 #include "device/PackageText.h"
+#include "platform/AppRegistry.h"
 
 namespace appsync {
 
 namespace {
-
-constexpr std::string_view kIdentifierKey = "BundleIdentifier";
-constexpr std::string_view kVersionKey = "BundleVersion";
-constexpr std::string_view kDisplayNameKey = "BundleDisplayName";
-constexpr std::string_view kExecutableKey = "BundleExecutable";
-constexpr std::string_view kIconFileKey = "BundleIconFile";
-constexpr std::string_view kUsualIconFile = "Icon.png";
 
 ErrorRecord illegal(PackageErrorCode code, std::string_view key, std::string_view reason) {
     return packageError(code, "Info.plist: the value of " + quotedName(key) + " " +
@@ -55,13 +49,13 @@ Result<std::string> fileNameAt(const PropertyList& info, std::string_view key,
 }
 
 Result<std::string> identifierIn(const PropertyList& info) {
-    const std::string* identifier = info.findString(kIdentifierKey);
+    const std::string* identifier = info.findString(BundleIdentifierKey);
     if (identifier == nullptr) {
-        return illegal(PackageErrorCode::IllegalIdentifier, kIdentifierKey,
+        return illegal(PackageErrorCode::IllegalIdentifier, BundleIdentifierKey,
                        "is missing or is not a string");
     }
     if (isLegalIdentifier(*identifier)) return *identifier;
-    return illegal(PackageErrorCode::IllegalIdentifier, kIdentifierKey,
+    return illegal(PackageErrorCode::IllegalIdentifier, BundleIdentifierKey,
                    "is " + quotedName(*identifier) +
                        ", which is not 1 to 255 letters, digits, '.', '-' and '_'");
 }
@@ -77,13 +71,13 @@ Result<PackageInfo> packageInfoFrom(PropertyList info, std::string_view bundleDi
     const std::string_view stem = bundleDirectoryName.substr(0, bundleDirectoryName.rfind('.'));
     Result<std::string> identifier = identifierIn(info);
     if (!identifier) return identifier.error();
-    Result<std::string> version = textAt(info, kVersionKey, "", limits);
+    Result<std::string> version = textAt(info, BundleVersionKey, "", limits);
     if (!version) return version.error();
-    Result<std::string> displayName = textAt(info, kDisplayNameKey, stem, limits);
+    Result<std::string> displayName = textAt(info, BundleDisplayNameKey, stem, limits);
     if (!displayName) return displayName.error();
-    Result<std::string> executable = fileNameAt(info, kExecutableKey, "", limits);
+    Result<std::string> executable = fileNameAt(info, BundleExecutableKey, "", limits);
     if (!executable) return executable.error();
-    Result<std::string> iconFile = fileNameAt(info, kIconFileKey, kUsualIconFile, limits);
+    Result<std::string> iconFile = fileNameAt(info, BundleIconFileKey, kUsualIconFile, limits);
     if (!iconFile) return iconFile.error();
 
     PackageInfo result;

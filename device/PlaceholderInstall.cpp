@@ -237,28 +237,43 @@ Result<Bundle> makeBundle(const InstallContext& context, const PlaceholderConten
     return bundle;
 }
 
+ErrorRecord notInstalled(const std::string& identifier, const std::optional<BundleRow>& covering) {
+    std::string why = " is not installed; appsync apps shows what is";
+    if (covering) {
+        why =
+            isDemotedType(covering->installType)
+                ? " is offloaded already; there is nothing more to do"
+                : " is a placeholder, whose package is still to come; offload it once it is there";
+    }
+    return registryError(RegistryErrorCode::NothingInstalled, identifier + why);
+}
+
+Status requireNotRunning(Database& database, const std::string& identifier) {
+    Query rows = database.query("SELECT 1 FROM running WHERE identifier = ?");
+    rows.bind(identifier);
+    if (!rows.next()) return rows.status();
+    return registryError(RegistryErrorCode::Running,
+                         identifier + " is running; quit it (appsync quit), and offload it then");
+}
+
 Result<BundleRow> findDemotable(const InstallContext& context, const std::string& identifier) {
     std::optional<BundleRow> application;
-    bool covered = false;
+    std::optional<BundleRow> covering;
     const Status status = context.database.read([&](Database& database) -> Status {
-        const auto placeholder = findBundle(database, BundleTable::Placeholders, identifier);
+        auto placeholder = findBundle(database, BundleTable::Placeholders, identifier);
         if (!placeholder) return placeholder.error();
-        covered = placeholder->has_value();
+        covering = std::move(*placeholder);
         auto row = findBundle(database, BundleTable::Applications, identifier);
         if (!row) return row.error();
         application = std::move(*row);
-        return {};
+        return requireNotRunning(database, identifier);
     });
     if (!status) return asRegistryStatus(status).error();
-    if (!application) {
-        return registryError(RegistryErrorCode::NothingInstalled,
-                             identifier + " is not installed, so it cannot be demoted");
-    }
-    if (!covered) return *std::move(application);
-    return registryError(RegistryErrorCode::UpdateUnderWay,
-                         "an update of " + identifier +
-                             " is under way; let a sync finish it, or uninstall its placeholder, "
-                             "and demote it then");
+    if (!application) return notInstalled(identifier, covering);
+    if (!covering) return *std::move(application);
+    return registryError(
+        RegistryErrorCode::UpdateUnderWay,
+        "an update of " + identifier + " is under way; let a sync finish it, and offload it then");
 }
 
 PlaceholderSource sourceOf(const InstallContext& context, const BundleRow& application,
@@ -311,7 +326,8 @@ Status demoteApplication(const InstallContext& context, const std::string& ident
     const BundleRow row = rowOf(*bundle, source, *container);
     FreedContainers freed;
     const Status committed = context.database.change(Durability::OnDisk, [&](Database& database) {
-        const Status status = recordPlaceholder(database, row, {}, freed);
+        Status status = requireNotRunning(database, identifier);  // somebody may have started it
+        if (status) status = recordPlaceholder(database, row, {}, freed);
         if (!status) return status;
         return forgetBundle(database, BundleTable::Applications, identifier, freed.application);
     });

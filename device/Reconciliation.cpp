@@ -3,6 +3,7 @@
 #include <unistd.h>
 
 #include <algorithm>
+#include <optional>
 #include <unordered_set>
 
 #include "device/Containers.h"
@@ -19,13 +20,13 @@
 #include "platform/InstallProgressRecord.h"
 #include "system/RootDirectory.h"
 #include "system/RootedFileSystem.h"
+#include "system/TemporaryFile.h"
 
 namespace appsync {
 
 namespace {
 
 constexpr std::int64_t kKeptHistory = 100'000;
-constexpr std::string_view kPackageSuffix = ".zip";
 
 /// An identifier and the container of its record.
 struct Holding {
@@ -165,67 +166,102 @@ class Comparison {
 
 std::vector<std::string> namesAt(const InstallContext& context, std::string_view directory) {
     const std::string path(directory);
-    const Result<UniqueFd> opened = context.files.root().openDirectory(path, "list");
+    const Result<UniqueFd> opened = context.files.root().openDirectoryWithoutLinks(path, "list");
     if (!opened) return {};
     Result<std::vector<std::string>> names = namesIn(opened->get(), path);
     return names ? std::move(*names) : std::vector<std::string>();
 }
 
-std::unordered_set<std::string> identifiersWithRestoreData(const InstallContext& context) {
+Result<std::unordered_set<std::string>> identifiersWithRestoreData(const InstallContext& context) {
     std::unordered_set<std::string> identifiers;
-    context.database
-        .read([&](Database& database) {
-            Query rows = database.query("SELECT identifier FROM restore_data");
-            while (rows.next()) identifiers.insert(rows.text(0));
-            return rows.status();
-        })
-        .ignore();
+    const Status status = context.database.read([&](Database& database) {
+        Query rows = database.query("SELECT identifier FROM restore_data");
+        while (rows.next()) identifiers.insert(rows.text(0));
+        return rows.status();
+    });
+    if (!status) return status.error();
     return identifiers;
 }
 
-// A package that was delivered to a coordinator, or whose data is yet to come, waits where it lies;
-// any other is sent again.
+}  // namespace
+
 void clearPackages(const InstallContext& context) {
-    const std::unordered_set<std::string> waiting = identifiersWithRestoreData(context);
-    const std::unordered_set<std::string> delivered = deliveredFiles(context);
-    for (const std::string& name : namesAt(context, kPublicStagingDirectory)) {
-        if (!name.ends_with(kPackageSuffix)) continue;
-        const std::string identifier = name.substr(0, name.size() - kPackageSuffix.size());
-        if (!isLegalIdentifier(identifier) || waiting.contains(identifier)) continue;
-        const std::string path = std::string(kPublicStagingDirectory) + "/" + name;
-        if (!delivered.contains(path)) context.files.removeItem(path).ignore();
-    }
+    const auto waiting = identifiersWithRestoreData(context);
+    const auto delivered = deliveredFiles(context);
+    if (!waiting || !delivered) return;  // nobody knows what is waited for
+    const std::string directory(kPublicStagingDirectory);
+    context.files
+        .removeContents(directory,
+                        [&](const std::string& name) {
+                            const std::optional<std::string> identifier = identifierOfArchive(name);
+                            return identifier && !waiting->contains(*identifier) &&
+                                   !delivered->contains(directory + "/" + name);
+                        })
+        .ignore();
 }
+
+namespace {
 
 // Data that was restored with an install is not restored again with the next one. What is no whole
 // archive was cut off.
 void clearRestoredData(const InstallContext& context) {
+    const auto isNoArchive = [](const std::string& name) { return !identifierOfArchive(name); };
+    context.files.removeContents(std::string(kRestoreDataDirectory), isNoArchive).ignore();
     for (const std::string& name : namesAt(context, kRestoreDataDirectory)) {
-        if (!name.ends_with(kPackageSuffix)) {
-            context.files.removeItem(std::string(kRestoreDataDirectory) + "/" + name).ignore();
-            continue;
-        }
-        const std::string identifier = name.substr(0, name.size() - kPackageSuffix.size());
+        const std::optional<std::string> identifier = identifierOfArchive(name);
+        if (!identifier) continue;
         bool isInstalled = false;
         context.database
             .read([&](Database& database) -> Status {
-                const auto row = findBundle(database, BundleTable::Applications, identifier);
+                const auto row = findBundle(database, BundleTable::Applications, *identifier);
                 if (!row) return row.error();
                 isInstalled = row->has_value();
                 return {};
             })
             .ignore();
-        if (isInstalled) dropRestoredData(context, identifier);
+        if (isInstalled) dropRestoredData(context, *identifier);
+    }
+}
+
+void remakeDirectories(const InstallContext& context) {
+    for (const std::string_view directory : kStandingDirectories) {
+        context.files.createDirectory(std::string(directory), true, nullptr).ignore();
+    }
+}
+
+bool wasInterrupted(const InstallContext& context) {
+    bool interrupted = true;
+    context.database
+        .read([&](Database& database) -> Status {
+            const Result<std::int64_t> sessions = database.integer("SELECT count(*) FROM session");
+            if (!sessions) return sessions.error();
+            interrupted = *sessions != 0;
+            return {};
+        })
+        .ignore();
+    return interrupted;
+}
+
+// Of the store metadata that was being written. There may be thousands of bundles: they are only
+// looked at where a session has not ended.
+void clearTemporariesOfBundles(const InstallContext& context) {
+    if (!wasInterrupted(context)) return;
+    const Result<std::vector<std::string>> containers = context.containers.names();
+    if (!containers) return;
+    for (const std::string& container : *containers) {
+        context.files.removeContents(Containers::pathOf(container), isTemporaryName).ignore();
     }
 }
 
 void clearTemporaries(const InstallContext& context) {
-    for (const std::string& name : namesAt(context, kTemporaryDirectory)) {
-        context.files.removeItem(std::string(kTemporaryDirectory) + "/" + name).ignore();
-    }
-    for (const std::string_view directory : {kWorkAreaDirectory, kPublicStagingDirectory}) {
+    const auto all = [](const std::string&) { return true; };
+    context.files.removeContents(std::string(kTemporaryDirectory), all).ignore();
+    for (const std::string_view directory :
+         {kWorkAreaDirectory, kPublicStagingDirectory, kPreferencesDirectory, kRestoreDirectory,
+          kRestoreLogDirectory}) {
         context.files.removeStaleTemporaries(std::string(directory)).ignore();
     }
+    clearTemporariesOfBundles(context);
 }
 
 }  // namespace
@@ -237,6 +273,7 @@ Result<std::vector<std::string>> reconcileDevice(const InstallContext& context) 
     Comparison comparison(context);
     if (Status status = comparison.run(); !status) return status.error();
     if (Status status = reconcileCoordinators(context); !status) return status.error();
+    remakeDirectories(context);
     clearPackages(context);
     clearRestoredData(context);
     clearTemporaries(context);
@@ -244,7 +281,8 @@ Result<std::vector<std::string>> reconcileDevice(const InstallContext& context) 
 }
 
 Status beginSession(const InstallContext& context) {
-    return context.database.change(Durability::Soon, [](Database& database) {
+    // The next session has to know of it, whatever ends this one.
+    return context.database.change(Durability::OnDisk, [](Database& database) {
         return database
             .query("INSERT OR REPLACE INTO session (id, process, started) VALUES (1, ?, ?)")
             .bind(std::int64_t{::getpid()}, milliseconds(wallNow()))

@@ -14,6 +14,11 @@ struct InstallContext;
 /// sentence for each thing that a person may miss. Costs a look at the names of all containers.
 [[nodiscard]] Result<std::vector<std::string>> reconcileDevice(const InstallContext& context);
 
+/// Removes the packages in the public staging directory that nobody waits for: one that was
+/// delivered to a coordinator, or whose data is yet to come, stays where it lies; any other is sent
+/// again. Only while the session's lock is held.
+void clearPackages(const InstallContext& context);
+
 /// Says in the database that this process's session holds the device.
 Status beginSession(const InstallContext& context);
 

@@ -147,6 +147,14 @@ Result<std::optional<BundleRow>> findBundle(Database& database, BundleTable tabl
     return row;
 }
 
+Result<bool> isInstalled(Database& database, const std::string& identifier) {
+    Query rows = database.query("SELECT 1 FROM applications WHERE identifier = ?");
+    rows.bind(identifier);
+    const bool found = rows.next();
+    if (Status status = rows.status(); !status) return status.error();
+    return found;
+}
+
 Result<std::vector<BundleRow>> allBundles(Database& database, BundleTable table) {
     return readRows(database.query(
         either(table,

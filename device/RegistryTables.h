@@ -52,6 +52,9 @@ struct FreedContainers {
 [[nodiscard]] Result<std::optional<BundleRow>> findBundle(Database& database, BundleTable table,
                                                           const std::string& identifier);
 
+/// Whether there is an application, no mere placeholder, of that identifier.
+[[nodiscard]] Result<bool> isInstalled(Database& database, const std::string& identifier);
+
 /// Every row of the table, ordered by identifier.
 [[nodiscard]] Result<std::vector<BundleRow>> allBundles(Database& database, BundleTable table);
 

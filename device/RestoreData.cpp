@@ -6,6 +6,7 @@
 #include "device/DataArchive.h"
 #include "device/DevicePaths.h"
 #include "device/InstallContext.h"
+#include "device/PackageIdentifier.h"
 #include "system/PosixError.h"
 #include "system/RootDirectory.h"
 #include "system/RootedFileSystem.h"
@@ -40,7 +41,7 @@ Status replaceData(const InstallContext& context, const std::string& from, const
 }  // namespace
 
 std::string restoreArchiveOf(const std::string& identifier) {
-    return std::string(kRestoreDataDirectory) + "/" + identifier + ".zip";
+    return std::string(kRestoreDataDirectory) + "/" + archiveNameOf(identifier);
 }
 
 Status placeRestoredData(const InstallContext& context, const std::string& identifier) {
@@ -48,7 +49,7 @@ Status placeRestoredData(const InstallContext& context, const std::string& ident
     const Result<RegularFile> archive = context.files.root().openRegularFile(path);
     if (!archive) return archive.error().code == ENOENT ? Status() : Status(archive.error());
     const std::string unpacked = std::string(kUnpackedDataDirectory) + "/" + identifier;
-    Status status = unpackTo(context, *archive, identifier + ".zip", unpacked);
+    Status status = unpackTo(context, *archive, archiveNameOf(identifier), unpacked);
     if (status) status = replaceData(context, unpacked, dataDirectoryOf(identifier));
     if (status) return status;
     context.files.removeItem(unpacked).ignore();

@@ -40,6 +40,47 @@ TEST_F(DeviceDatabaseTest, aChangeIsSeenByEverybodyWhenTheCallReturns) {
     }
 }
 
+TEST_F(DeviceDatabaseTest, nothingIsCommittedOnceItIsFrozen) {
+    const pid_t child = ::fork();
+    if (child == 0) {
+        DeviceDatabase* database = open().release();
+        std::atomic<bool> isAtWork = false;
+        std::atomic<bool> mayEnd = false;
+        std::thread([&] {
+            database
+                ->change(Durability::Soon,
+                         [&](Database& writer) {
+                             isAtWork = true;
+                             while (!mayEnd) std::this_thread::yield();
+                             return insert(writer, "first");
+                         })
+                .ignore();
+        }).detach();
+        while (!isAtWork) std::this_thread::yield();
+        for (const char* late : {"second", "third"}) {
+            std::thread([=] {
+                database
+                    ->change(Durability::OnDisk,
+                             [=](Database& writer) { return insert(writer, late); })
+                    .ignore();
+            }).detach();
+        }
+        if (database->freeze(std::chrono::milliseconds(1))) ::_exit(1);
+        mayEnd = true;
+        if (!database->freeze(std::chrono::minutes(1))) ::_exit(2);
+        database->changeLater([](Database& writer) { return insert(writer, "later"); });
+        for (int times = 0; times < 1000; ++times) {
+            if (!database->flush()) ::_exit(3);
+            std::this_thread::yield();
+        }
+        ::_exit(0);
+    }
+    int status = -1;
+    ASSERT_EQ(::waitpid(child, &status, 0), child);
+    EXPECT_EQ(status, 0);
+    EXPECT_EQ(rows(), 1);
+}
+
 TEST_F(DeviceDatabaseTest, aChangeThatFailsChangesNothing) {
     const auto database = open();
     const Status status = database->change(Durability::OnDisk, [](Database& writer) -> Status {
@@ -50,6 +91,47 @@ TEST_F(DeviceDatabaseTest, aChangeThatFailsChangesNothing) {
     EXPECT_EQ(status.error().code, 7);
     EXPECT_EQ(rows(), 0);
     EXPECT_FALSE(database->failure()) << "a refusal is no failure of the database";
+}
+
+TEST_F(DeviceDatabaseTest, oneThatIsAloneNeedsNoSharedMemoryFile) {
+    const auto alone = Database::open(devicePath(kDatabaseName), Database::Mode::Alone);
+    ASSERT_TRUE(alone.ok());
+    ASSERT_TRUE(succeeded(insert(**alone, "first")));
+    EXPECT_EQ(*(*alone)->integer("SELECT count(*) FROM restore_data"), 1);
+    EXPECT_FALSE(std::filesystem::exists(devicePath("device.db-shm")));
+}
+
+TEST_F(DeviceDatabaseTest, oneThatWantsToBeAloneWaitsForTheOthersAndSeesWhatTheyDid) {
+    auto other = Database::open(devicePath(kDatabaseName), Database::Mode::Existing);
+    ASSERT_TRUE(other.ok());
+    ASSERT_EQ(*(*other)->integer("SELECT count(*) FROM restore_data"), 0);
+    std::int64_t seen = -1;
+    std::thread late([&] {
+        const auto alone = Database::open(devicePath(kDatabaseName), Database::Mode::Alone);
+        const auto count = (*alone)->integer("SELECT count(*) FROM restore_data");
+        if (count) seen = *count;
+    });
+    ASSERT_TRUE(succeeded(insert(**other, "first")));
+    other->reset();
+    late.join();
+    EXPECT_EQ(seen, 1);
+}
+
+TEST_F(DeviceDatabaseTest, whoComesWhileOneIsAloneWaitsAndSeesWhatThatDid) {
+    auto alone = Database::open(devicePath(kDatabaseName), Database::Mode::Alone);
+    ASSERT_TRUE(alone.ok());
+    ASSERT_TRUE(succeeded((*alone)->execute("BEGIN IMMEDIATE")));
+    std::int64_t seen = -1;
+    std::thread late([&] {
+        const auto other = Database::open(devicePath(kDatabaseName), Database::Mode::Existing);
+        const auto count = (*other)->integer("SELECT count(*) FROM restore_data");
+        if (count) seen = *count;
+    });
+    ASSERT_TRUE(succeeded(insert(**alone, "first")));
+    ASSERT_TRUE(succeeded((*alone)->execute("COMMIT")));
+    alone->reset();
+    late.join();
+    EXPECT_EQ(seen, 1);
 }
 
 TEST_F(DeviceDatabaseTest, changesAtTheSameTimeAreIndependent) {
@@ -139,6 +221,31 @@ TEST_F(DeviceDatabaseTest, aKilledProcessLeavesWhatItCommittedAndNothingElse) {
     EXPECT_EQ(rows(), 1);
     ::close(ends[0]);
     ::close(ends[1]);
+}
+
+TEST_F(DeviceDatabaseTest, whatSomebodyHasPutBesideTheTablesIsRefused) {
+    for (const auto& [made, removed] : {std::pair{"TABLE extra (a)", "TABLE extra"},
+                                        {"VIEW extra AS SELECT 1", "VIEW extra"},
+                                        {"INDEX extra ON history (time)", "INDEX extra"},
+                                        {"TRIGGER extra AFTER INSERT ON session BEGIN"
+                                         " DELETE FROM applications; END",
+                                         "TRIGGER extra"}}) {
+        sql(std::string("CREATE ") + made);
+        const auto refused = DeviceDatabase::open(devicePath(kDatabaseName));
+        ASSERT_FALSE(refused.ok()) << made;
+        EXPECT_NE(refused.error().description().find("'extra' is not that of a device"),
+                  std::string::npos);
+        sql(std::string("DROP ") + removed);
+        EXPECT_TRUE(DeviceDatabase::open(devicePath(kDatabaseName)).ok()) << removed;
+    }
+}
+
+TEST_F(DeviceDatabaseTest, triggersThatComeLaterDoNotRun) {
+    const auto database = open();
+    sql("CREATE TRIGGER late AFTER INSERT ON restore_data BEGIN DELETE FROM restore_data; END");
+    ASSERT_TRUE(succeeded(database->change(
+        Durability::OnDisk, [](Database& writer) { return insert(writer, "stays"); })));
+    EXPECT_EQ(rows(), 1);
 }
 
 TEST_F(DeviceDatabaseTest, textsAndBytesComeBackAsTheyWere) {

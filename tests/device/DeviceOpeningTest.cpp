@@ -59,6 +59,18 @@ TEST_F(DeviceOpeningTest, creationRefusesALinkThatLeadsNowhere) {
     EXPECT_TRUE(isDeviceError(status.error(), DeviceErrorCode::AlreadyExists));
 }
 
+TEST_F(DeviceOpeningTest, spaceForAFullDiskIsKept) {
+    const std::string reserve = devicePath("space.reserve");
+    ASSERT_EQ(fs::file_size(reserve), 256U * 1024) << "or the test's own disk is about full";
+    ASSERT_TRUE(Device::open(devicePath(), {.makesRoom = true}).ok());
+    EXPECT_TRUE(fs::exists(reserve)) << "the disk is not full";
+    fs::remove(reserve);
+    ASSERT_TRUE(Device::open(devicePath()).ok());
+    EXPECT_FALSE(fs::exists(reserve));
+    ASSERT_TRUE(openSession(devicePath()).ok());
+    EXPECT_TRUE(fs::exists(reserve)) << "a session keeps some when it ends";
+}
+
 TEST_F(DeviceOpeningTest, creationWithoutAParentLeavesNothing) {
     const Status status = Device::create(path("no/such/device"));
     ASSERT_FALSE(status);

@@ -3,6 +3,7 @@
 
 #include "device/Containers.h"
 #include "device/DevicePaths.h"
+#include "device/PackageIdentifier.h"
 #include "tests/device/DevicePlatformFixture.h"
 
 namespace appsync {
@@ -93,6 +94,42 @@ TEST_F(DeviceReconciliationTest, packagesAndTemporaryFilesOfAnInterruptedSession
     EXPECT_TRUE(fs::is_empty(rootPath(kTemporaryDirectory)));
 }
 
+TEST_F(DeviceReconciliationTest, temporaryFilesOfAnInterruptedRestoreAreCleared) {
+    const std::vector<std::string> directories{std::string(kPreferencesDirectory),
+                                               std::string(kRestoreDirectory),
+                                               std::string(kRestoreLogDirectory)};
+    reopenAfter([&] {
+        for (const std::string& directory : directories) {
+            fs::create_directories(rootPath(directory));
+            write(directory + "/.DemotedApps.plist.appsync-abc123", "half a list");
+            write(directory + "/DemotedApps.plist", "a list");
+        }
+    });
+    for (const std::string& directory : directories) {
+        EXPECT_FALSE(exists(directory + "/.DemotedApps.plist.appsync-abc123")) << directory;
+        EXPECT_TRUE(exists(directory + "/DemotedApps.plist")) << directory;
+    }
+}
+
+TEST_F(DeviceReconciliationTest, aLinkInThePlaceOfADirectoryThatIsClearedTakesNothingAway) {
+    ASSERT_TRUE(succeeded(install(kAtlas)));
+    const std::string data = std::string(kDataDirectory) + "/" + std::string(kAtlas);
+    for (const std::string_view directory : {kTemporaryDirectory, kRestoreDataDirectory}) {
+        for (const std::string target :
+             {"..", "/var/containers/Bundle/Application", "/var/mobile/Containers/Data"}) {
+            reopenAfter([&] {
+                fs::create_directories(rootPath(data));
+                write(data + "/notes", "to be kept");
+                fs::remove_all(rootPath(directory));
+                fs::create_directories(fs::path(rootPath(directory)).parent_path());
+                fs::create_symlink(target, rootPath(directory));
+            });
+            EXPECT_TRUE(exists(data + "/notes")) << directory << " -> " << target;
+            EXPECT_EQ(containers().size(), 1U) << directory << " -> " << target;
+        }
+    }
+}
+
 TEST_F(DeviceReconciliationTest, aPackageThatWaitsForItsDataStays) {
     const std::string package = stagePackage(kAtlas);
     const std::string other = stagePackage(kBrook);
@@ -100,6 +137,40 @@ TEST_F(DeviceReconciliationTest, aPackageThatWaitsForItsDataStays) {
     reopenAfter([] {});
     EXPECT_TRUE(exists(package));
     EXPECT_FALSE(exists(other));
+}
+
+TEST_F(DeviceReconciliationTest, packagesOfTheLongestIdentifiersAreTreatedLikeAllOthers) {
+    const std::string waiting(255, 'w');
+    const std::string other(255, 'o');
+    const auto packageAt = [](const std::string& identifier) {
+        return std::string(kPublicStagingDirectory) + "/" + archiveNameOf(identifier);
+    };
+    ASSERT_TRUE(succeeded(device().setRestoreDataExpected(waiting, true)));
+    reopenAfter([&] {
+        write(packageAt(waiting), "a package");
+        write(packageAt(other), "a package");
+    });
+    EXPECT_TRUE(exists(packageAt(waiting)));
+    EXPECT_FALSE(exists(packageAt(other)));
+}
+
+TEST_F(DeviceReconciliationTest, theEndOfASessionClearsPackagesThatNobodyWaitsForAnyMore) {
+    const std::string waiting = stagePackage(kAtlas);
+    const std::string other = stagePackage(kBrook);
+    ASSERT_TRUE(succeeded(device().setRestoreDataExpected(kAtlas, true)));
+    endSession();
+    EXPECT_TRUE(exists(waiting));
+    EXPECT_FALSE(exists(other));
+}
+
+TEST_F(DeviceReconciliationTest, directoriesThatADeviceAlwaysHasAreRemade) {
+    for (const std::string_view directory : kStandingDirectories)
+        EXPECT_TRUE(exists(std::string(directory)));
+    reopenAfter([&] { fs::remove_all(rootPath("/var/mobile")); });
+    for (const std::string_view directory : kStandingDirectories) {
+        EXPECT_TRUE(exists(std::string(directory))) << directory;
+    }
+    EXPECT_TRUE(exists("/var/mobile/Library/Logs/MediaServices"));
 }
 
 TEST_F(DeviceReconciliationTest, whatWasAtWorkWaitsAgain) {
@@ -134,6 +205,33 @@ TEST_F(DeviceReconciliationTest, anEndedSessionLeavesNothingUnsynced) {
     endSession();
     EXPECT_EQ(number("SELECT count(*) FROM placeholders WHERE unsynced_boot IS NOT NULL"), 0);
     EXPECT_EQ(number("SELECT count(*) FROM session"), 0);
+}
+
+TEST_F(DeviceReconciliationTest, aRestoreThatWasCutOffLeavesNoTemporaryFile) {
+    const std::vector<std::string> temporaries{
+        "/var/mobile/Media/VessikRestore/.RestoreApplications.plist.appsync-a1b2c3",
+        "/var/mobile/Library/Preferences/.com.korvu.Bakvia.DemotedApps.plist.appsync-a1b2c3"};
+    reopenAfter([&] {
+        for (const std::string& path : temporaries) {
+            fs::create_directories(fs::path(rootPath(path)).parent_path());
+            write(path, "half of it");
+        }
+    });
+    for (const std::string& path : temporaries) EXPECT_FALSE(fs::exists(rootPath(path))) << path;
+}
+
+TEST_F(DeviceReconciliationTest, aSessionThatWasCutOffLeavesNoTemporaryFileInABundle) {
+    ASSERT_TRUE(succeeded(install(kAtlas)));
+    const std::string container = application(kAtlas)->bundleContainerPath;
+    const std::string temporary = container + "/.VessikMetadata.plist.appsync-a1b2c3";
+    reopenAfter([&] {
+        sql("INSERT INTO session (id, process, started) VALUES (1, 1, 1)");
+        write(temporary, "half of it");
+        write(container + "/.hidden", "the application's own");
+    });
+    EXPECT_FALSE(fs::exists(rootPath(temporary)));
+    EXPECT_EQ(read(container + "/.hidden"), "the application's own");
+    EXPECT_EQ(read(application(kAtlas)->bundlePath + "/main"), "program 1.0");
 }
 
 TEST_F(DeviceReconciliationTest, whoeverRunsGoesOnRunning) {

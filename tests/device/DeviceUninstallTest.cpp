@@ -33,6 +33,16 @@ TEST_F(DeviceUninstallTest, anApplicationGoesWithItsFilesAndItsData) {
     EXPECT_FALSE(exists(data()));
 }
 
+TEST_F(DeviceUninstallTest, aContainerThatIsAPathTakesNothingElseAlong) {
+    for (const char* container : {"/", ".", "..", "../../../mobile", "a/../../../../mobile"}) {
+        ASSERT_TRUE(succeeded(install(kAtlas)));
+        sql(std::string("UPDATE applications SET container = '") + container + "'");
+        ASSERT_TRUE(succeeded(uninstall()));
+        EXPECT_TRUE(exists(std::string(kPublicStagingDirectory))) << container;
+        EXPECT_FALSE(containers().empty()) << container;
+    }
+}
+
 TEST_F(DeviceUninstallTest, thePlaceholderGoesFirst) {
     ASSERT_TRUE(succeeded(install(kAtlas, "1.0")));
     ASSERT_TRUE(succeeded(installPlaceholder(kAtlas)));

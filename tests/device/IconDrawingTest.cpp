@@ -1,6 +1,7 @@
 #include "device/IconDrawing.h"
 
 #include <gtest/gtest.h>
+#include <sys/resource.h>
 
 #include "tests/device/IconPng.h"
 
@@ -53,6 +54,27 @@ TEST(IconDrawingTest, hugeClaimsAreRefusedByWhatTheySay) {
         EXPECT_NE(wide.error().description().find(std::to_string(side)), std::string::npos);
         EXPECT_FALSE(renderIcon(claimingSize(png, 1, side)).ok());
     }
+}
+
+TEST(IconDrawingTest, imageThatWouldTake64MebibytesIsRefusedByWhatItClaims) {
+    const Result<Bytes> icon = renderIcon(pngOf(4096, 4096, kRed));
+    ASSERT_FALSE(icon.ok());
+    EXPECT_NE(icon.error().description().find("4096 x 4096"), std::string::npos);
+    EXPECT_FALSE(renderIcon(pngOf(2048, 2049, kRed)).ok());
+    EXPECT_TRUE(renderIcon(pngOf(2048, 2048, kRed)).ok());
+    EXPECT_TRUE(renderIcon(pngOf(4096, 1024, kRed)).ok());
+}
+
+TEST(IconDrawingTest, chunkThatClaimsMoreThanThereIsIsRefusedBeforeMemoryIsTakenForIt) {
+    Bytes png = pngOf(8, 8, kRed);
+    const Bytes text{0x7f, 0xff, 0xff, 0xff, 't', 'E', 'X', 't', 'a', 0, 'b'};
+    png.insert(png.begin() + 33, text.begin(), text.end());
+    rusage before = {};
+    ::getrusage(RUSAGE_SELF, &before);
+    EXPECT_FALSE(renderIcon(png).ok());
+    rusage after = {};
+    ::getrusage(RUSAGE_SELF, &after);
+    EXPECT_LT(after.ru_maxrss - before.ru_maxrss, 64 * 1024);
 }
 
 TEST(IconDrawingTest, noPixelsAreRefused) {

@@ -2,6 +2,8 @@
 
 #include <gtest/gtest.h>
 
+#include <optional>
+#include <set>
 #include <string>
 
 namespace appsync {
@@ -31,6 +33,37 @@ TEST(PackageIdentifierTest, everyOtherByteIsRefused) {
 TEST(PackageIdentifierTest, theLongestHas255Bytes) {
     EXPECT_TRUE(isLegalIdentifier(std::string(255, 'x')));
     EXPECT_FALSE(isLegalIdentifier(std::string(256, 'x')));
+}
+
+TEST(PackageIdentifierTest, anArchiveIsNamedByItsIdentifier) {
+    EXPECT_EQ(archiveNameOf("com.example.atlas"), "com.example.atlas.zip");
+    EXPECT_EQ(identifierOfArchive("com.example.atlas.zip"), "com.example.atlas");
+    EXPECT_EQ(identifierOfArchive("a.zip.zip"), "a.zip");
+}
+
+TEST(PackageIdentifierTest, theArchiveOfALongIdentifierHasANameThatAFileCanHave) {
+    std::set<std::string> names;
+    for (const std::size_t length : {247U, 248U, 250U, 251U, 252U, 254U, 255U}) {
+        const std::string plain(length, 'x');
+        const std::string ending = std::string(length - 4, 'x') + ".zip";
+        for (const std::string& identifier : {plain, ending}) {
+            const std::string name = archiveNameOf(identifier);
+            EXPECT_LE(name.size(), 255U);
+            EXPECT_EQ(identifierOfArchive(name), identifier);
+            EXPECT_TRUE(names.insert(name).second) << "two share the name " << name;
+        }
+    }
+    EXPECT_EQ(archiveNameOf(std::string(251, 'x')), std::string(251, 'x') + ".zip");
+    EXPECT_EQ(archiveNameOf(std::string(252, 'x')), std::string(252, 'x'));
+}
+
+TEST(PackageIdentifierTest, noIdentifiersArchiveIsNamedOtherwise) {
+    for (const char* name : {"", ".zip", "..zip", "...zip", "a", "a~zip", "~zip", "a b.zip",
+                             "a/b.zip", "ApplicationSync", "a.part"}) {
+        EXPECT_EQ(identifierOfArchive(name), std::nullopt) << name;
+    }
+    EXPECT_EQ(identifierOfArchive(std::string(252, 'x') + ".zip"), std::nullopt);
+    EXPECT_EQ(identifierOfArchive(std::string(256, 'x')), std::nullopt);
 }
 
 }  // namespace
