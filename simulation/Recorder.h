@@ -13,6 +13,7 @@
 
 #include "platform/Error.h"
 #include "platform/LogFacility.h"
+#include "simulation/DurableChanges.h"
 #include "simulation/Scheduler.h"
 
 namespace appsync {
@@ -85,6 +86,16 @@ class Recorder {
         return std::exchange(refusal_, std::nullopt);
     }
 
+    /// Who hears of what the services change on the device. Borrowed; null ends it.
+    void setChangeListener(DurableChangeListener* listener) { changeListener_ = listener; }
+    [[nodiscard]] bool isChangeListening() const { return changeListener_ != nullptr; }
+    void filesChanged(std::string_view what) {
+        if (changeListener_ != nullptr) changeListener_->filesChanged(what);
+    }
+    void recordsChanged(std::string_view what, Persistence persistence) {
+        if (changeListener_ != nullptr) changeListener_->recordsChanged(what, persistence);
+    }
+
     /// Recording costs memory; a long benchmark does without.
     void setEnabled(bool enabled) { enabled_ = enabled; }
     /// Whether anybody wants to know arguments and results.
@@ -106,6 +117,7 @@ class Recorder {
     bool enabled_ = true;
     std::map<std::string, Hook, std::less<>> hooks_;
     CallInterceptor* interceptor_ = nullptr;
+    DurableChangeListener* changeListener_ = nullptr;
     std::optional<ErrorRecord> refusal_;
 };
 

@@ -151,7 +151,10 @@ void Scheduler::advance(SimulatedTime duration) {
     const SimulatedTime target = now_ + duration;
     runUntilIdle();
     for (auto event = nextEvent(); event && *event <= target && !broken_; event = nextEvent()) {
-        (void)jumpToNextEvent();
+        if (!jumpToNextEvent()) {
+            failStandstill();
+            throwFailure();
+        }
         runUntilIdle();
     }
     now_ = std::max(now_, target);
@@ -232,14 +235,18 @@ void Scheduler::startDueTasks() {
 void Scheduler::yieldTurn() {
     Turn* next = broken_ ? host_.get() : nextTurn();
     if (next == nullptr) {
-        const std::string headline = nextEvent()
-                                         ? "the clock has passed its limit of " +
-                                               seconds(timeLimit_) + " and the end is not in sight"
-                                         : "nothing can run any more";
-        fail(std::make_exception_ptr(SimulationFailure(standstill(headline))));
+        failStandstill();
         next = host_.get();
     }
     switchTo(*next);
+}
+
+void Scheduler::failStandstill() {
+    const std::string headline = nextEvent()
+                                     ? "the clock has passed its limit of " + seconds(timeLimit_) +
+                                           " and the end is not in sight"
+                                     : "nothing can run any more";
+    fail(std::make_exception_ptr(SimulationFailure(standstill(headline))));
 }
 
 void Scheduler::switchTo(Turn& next) {

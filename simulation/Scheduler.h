@@ -122,6 +122,7 @@ class Scheduler {
     void startDueTasks();
     void yieldTurn();
     void switchTo(Turn& next);
+    void failStandstill();
     void throwFailure();
     void workerLoop(Turn& turn);
     static void abandon(std::unique_ptr<Turn> turn);

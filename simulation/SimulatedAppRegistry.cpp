@@ -17,6 +17,8 @@ constexpr std::int64_t kRefused = 1;
 constexpr std::int64_t kNotFound = 2;
 constexpr std::int64_t kPackageRefused = 1;
 constexpr std::size_t kLongestIdentifier = 255;
+constexpr const char* kPlaceholders = "/var/containers/Bundle/Placeholder";
+constexpr const char* kApplications = "/var/containers/Bundle/Application";
 
 bool isLegalCharacter(char c) {
     return (c >= 'a' && c <= 'z') || (c >= 'A' && c <= 'Z') || (c >= '0' && c <= '9') || c == '.' ||
@@ -153,6 +155,7 @@ void SimulatedAppRegistry::finishInstallPhase(InstallProgressRecord& record) {
     const RecordedCall call(recorder_, kService, "finishInstallPhase", simulated->identifier());
     if (simulated->isOver()) return;
     simulated->setValues(afterPhase(simulated->values()));
+    recorder_.recordsChanged("the progress of " + simulated->identifier(), Persistence::Soon);
     reportChange();
 }
 
@@ -167,7 +170,11 @@ Status SimulatedAppRegistry::installPackageNow(const FileURL& package,
                                                const PropertyList& options) {
     const Result<std::string> identifier = checkedIdentifier(options, PackageTypeCustomer);
     if (!identifier) return identifier.error();
-    return install(*identifier, package.path());
+    Status status = install(*identifier, package.path());
+    if (status) {
+        recorder_.recordsChanged("the install of " + *identifier, Persistence::OnDisk);
+    }
+    return status;
 }
 
 Status SimulatedAppRegistry::install(const std::string& identifier, const std::string& path) {
@@ -232,6 +239,7 @@ void SimulatedAppRegistry::commitPackage(const std::string& identifier) {
         proxy.displayName = package->second.displayName;
     }
     files_.addDirectory(proxy.bundlePath);
+    files_.sync();
     application.installed = std::move(proxy);
     removePlaceholder(application, kInstallStateFinished);
 }
@@ -257,9 +265,20 @@ Status SimulatedAppRegistry::installPlaceholderNow(const FileURL& directory,
     files_.copyTree(directory.path(), proxy.bundlePath);
     Application& application = applications_[*identifier];
     if (application.installed) proxy.applicationType = application.installed->applicationType;
-    application.placeholder = std::move(proxy);
-    startProgress(*identifier, application);
+    application.placeholderOptions = options;
+    const Persistence persistence = beginPlaceholder(*identifier, std::move(proxy));
+    recorder_.recordsChanged("the placeholder of " + *identifier, persistence);
     return {};
+}
+
+/// Its files are there. Those of a sync's new one are not waited for: the next sync makes it again.
+Persistence SimulatedAppRegistry::beginPlaceholder(const std::string& identifier, AppProxy proxy) {
+    Application& application = applications_[identifier];
+    application.isUnsynced = proxy.installType == kInstallTypeSync && !application.placeholder;
+    if (!application.isUnsynced) files_.sync();
+    application.placeholder = std::move(proxy);
+    startProgress(identifier, application);
+    return application.isUnsynced ? Persistence::Committed : Persistence::OnDisk;
 }
 
 /// Takes what the Info.plist in the directory says; refuses one that is not of this identifier.
@@ -310,6 +329,7 @@ Status SimulatedAppRegistry::uninstallNow(const std::string& identifier,
         endProgress(*application, kInstallStateCanceled);
     }
     dropIfEmpty(identifier);
+    recorder_.recordsChanged("the removal of " + identifier, Persistence::OnDisk);
     return {};
 }
 
@@ -465,6 +485,55 @@ void SimulatedAppRegistry::cancelInstalls(const std::vector<std::string>& identi
     reportCancel(cancelled);
 }
 
+// Crashes.
+
+SimulatedAppRegistry::Records SimulatedAppRegistry::records() const {
+    Records result{{}, packages_};
+    for (const auto& [identifier, application] : applications_) {
+        Record record{application.installed, application.placeholder, std::nullopt,
+                      application.installNumber, application.isUnsynced};
+        if (application.progress != nullptr) record.progress = application.progress->values();
+        result.applications.emplace(identifier, std::move(record));
+    }
+    return result;
+}
+
+void SimulatedAppRegistry::reopen(const Records& records, bool powerWasLost) {
+    packages_ = records.packages;
+    for (const auto& [identifier, record] : records.applications) {
+        Application& application = applications_[identifier];
+        if (hasContainer(record.installed)) application.installed = record.installed;
+        const bool isLost = record.isUnsynced && powerWasLost;
+        if (!isLost && hasContainer(record.placeholder)) {
+            application.placeholder = record.placeholder;
+            application.isUnsynced = record.isUnsynced;
+        }
+        if (application.placeholder && record.progress) {
+            startProgress(identifier, application);
+            SimulatedProgressRecord::Values values = *record.progress;
+            if (values.state == kInstallStateActive) values.state = kInstallStateWaiting;
+            if (values.phase == kInstallPhaseInstalling) values.phase = kInstallPhaseLoading;
+            application.progress->setValues(values);
+        }
+        dropIfEmpty(identifier);
+    }
+    removeStrayContainers();
+}
+
+bool SimulatedAppRegistry::hasContainer(const std::optional<AppProxy>& proxy) const {
+    return proxy && (proxy->bundlePath.empty() || files_.exists(proxy->bundlePath));
+}
+
+void SimulatedAppRegistry::removeStrayContainers() {
+    for (const char* directory : {kPlaceholders, kApplications}) {
+        for (const std::string& name : files_.names(directory)) {
+            const bool isHeld = directory == kPlaceholders ? placeholder(name).has_value()
+                                                           : installed(name).has_value();
+            if (!isHeld) files_.remove(std::string(directory) + "/" + name);
+        }
+    }
+}
+
 // Other services.
 
 bool SimulatedAppRegistry::isLegalIdentifier(std::string_view identifier) {
@@ -473,9 +542,10 @@ bool SimulatedAppRegistry::isLegalIdentifier(std::string_view identifier) {
            std::all_of(identifier.begin(), identifier.end(), isLegalCharacter);
 }
 
-Status SimulatedAppRegistry::showPlaceholder(AppProxy proxy) {
+Result<Persistence> SimulatedAppRegistry::showPlaceholder(AppProxy proxy) {
     const std::string identifier = proxy.applicationIdentifier;
-    if (Status failure = takeFailure(placeholderFailures_, identifier); !failure) return failure;
+    const Status failure = takeFailure(placeholderFailures_, identifier);
+    if (!failure) return failure.error();
     const AppProxy usual = proxyWithUsualPaths(identifier, true);
     proxy.bundlePath = usual.bundlePath;
     proxy.bundleContainerPath = usual.bundleContainerPath;
@@ -483,9 +553,8 @@ Status SimulatedAppRegistry::showPlaceholder(AppProxy proxy) {
     if (const auto application = installed(identifier)) {
         proxy.applicationType = application->applicationType;
     }
-    add(std::move(proxy));
-    startProgress(identifier, applications_[identifier]);
-    return {};
+    files_.addDirectory(proxy.bundlePath);
+    return beginPlaceholder(identifier, std::move(proxy));
 }
 
 void SimulatedAppRegistry::hidePlaceholder(const std::string& identifier) {
@@ -568,6 +637,11 @@ std::optional<AppProxy> SimulatedAppRegistry::installed(const std::string& ident
 std::optional<AppProxy> SimulatedAppRegistry::placeholder(const std::string& identifier) const {
     const Application* application = find(identifier);
     return application == nullptr ? std::nullopt : application->placeholder;
+}
+
+PropertyList SimulatedAppRegistry::placeholderOptions(const std::string& identifier) const {
+    const Application* application = find(identifier);
+    return application == nullptr ? PropertyList() : application->placeholderOptions;
 }
 
 std::optional<SimulatedProgressRecord::Values> SimulatedAppRegistry::progress(

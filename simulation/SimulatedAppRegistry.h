@@ -31,6 +31,11 @@ class SimulatedFileSystem;
 /// The methods below the interface are the test's: they are not recorded.
 class SimulatedAppRegistry : public AppRegistry {
   public:
+    struct PackageContents {
+        std::string version;
+        std::string displayName;
+    };
+
     /// `codec` reads the Info.plist of placeholder bundles. All are only borrowed.
     SimulatedAppRegistry(Recorder& recorder, SimulatedFileSystem& files,
                          PropertyListSerialization& codec);
@@ -72,6 +77,8 @@ class SimulatedAppRegistry : public AppRegistry {
     // What the test looks at.
     [[nodiscard]] std::optional<AppProxy> installed(const std::string& identifier) const;
     [[nodiscard]] std::optional<AppProxy> placeholder(const std::string& identifier) const;
+    /// The options with which a placeholder of the identifier was last installed; null when none.
+    [[nodiscard]] PropertyList placeholderOptions(const std::string& identifier) const;
     /// The values of the progress record; nothing when no install is under way.
     [[nodiscard]] std::optional<SimulatedProgressRecord::Values> progress(
         const std::string& identifier) const;
@@ -83,14 +90,35 @@ class SimulatedAppRegistry : public AppRegistry {
     // What other services of the device do with it.
     [[nodiscard]] static bool isLegalIdentifier(std::string_view identifier);
     /// Installs the file at a path as the package of the identifier; fails as `installPackage`
-    /// does.
+    /// does. Who calls it says that something has changed.
     Status install(const std::string& identifier, const std::string& path);
-    /// Shows the placeholder with the usual paths; fails as `failNextPlaceholderInstall` says.
-    Status showPlaceholder(AppProxy proxy);
+    /// Shows the placeholder with the usual paths, and says how long that lasts; fails as
+    /// `failNextPlaceholderInstall` says.
+    Result<Persistence> showPlaceholder(AppProxy proxy);
     /// Takes away the placeholder, if there is one: its install was cancelled or has failed.
     void hidePlaceholder(const std::string& identifier);
     /// Fails as `uninstallApplication` does.
     Status uninstall(const std::string& identifier);
+
+    // Crashes.
+    /// What the registry has written down of an identifier.
+    struct Record {
+        std::optional<AppProxy> installed;
+        std::optional<AppProxy> placeholder;
+        std::optional<SimulatedProgressRecord::Values> progress;
+        std::uint64_t installNumber = 0;
+        /// A loss of power may take the placeholder's files.
+        bool isUnsynced = false;
+    };
+    struct Records {
+        std::map<std::string, Record> applications;
+        std::map<std::string, PackageContents> packages;
+    };
+    [[nodiscard]] Records records() const;
+    /// Takes records over as the registry does when it is started: those whose files are gone go,
+    /// and so do files without a record, and placeholders whose files were not synced before power
+    /// was lost; nothing is at work on an install.
+    void reopen(const Records& records, bool powerWasLost);
 
     // Answers. Each identifier's failures are used up one by one, in the order given.
     void failNextInstall(const std::string& identifier, ErrorRecord error);
@@ -108,8 +136,10 @@ class SimulatedAppRegistry : public AppRegistry {
 
   private:
     struct Application {
+        bool isUnsynced = false;  // of the placeholder
         std::optional<AppProxy> installed;
         std::optional<AppProxy> placeholder;
+        PropertyList placeholderOptions{};
         std::shared_ptr<SimulatedProgressRecord> progress;
         std::uint64_t installNumber = 0;  // of the install that `progress` is of
     };
@@ -118,10 +148,6 @@ class SimulatedAppRegistry : public AppRegistry {
         std::vector<AppProxy> paused;
     };
     struct Subscription;
-    struct PackageContents {
-        std::string version;
-        std::string displayName;
-    };
     using Failures = std::map<std::string, std::deque<ErrorRecord>>;
 
     [[nodiscard]] Application* find(const std::string& identifier);
@@ -139,6 +165,9 @@ class SimulatedAppRegistry : public AppRegistry {
     void startProgress(const std::string& identifier, Application& application);
     void endProgress(Application& application, std::uint64_t state);
     void dropIfEmpty(const std::string& identifier);
+    [[nodiscard]] bool hasContainer(const std::optional<AppProxy>& proxy) const;
+    void removeStrayContainers();
+    [[nodiscard]] Persistence beginPlaceholder(const std::string& identifier, AppProxy proxy);
     [[nodiscard]] Status describeFromBundle(const std::string& directory, AppProxy& proxy) const;
     [[nodiscard]] Report report() const;
     void reportChange();

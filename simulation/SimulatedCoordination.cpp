@@ -84,6 +84,35 @@ AppProxy proxyOf(const SimulatedPlaceholderState& placeholder) {
     return proxy;
 }
 
+using PromiseState = std::shared_ptr<SimulatedPromiseState>;
+using CoordinatorState = std::shared_ptr<SimulatedCoordinatorState>;
+
+PromiseState copyOf(const PromiseState& promise, const CoordinatorState& coordinator) {
+    if (promise == nullptr) return nullptr;
+    auto copy = std::make_shared<SimulatedPromiseState>(*promise);
+    copy->coordinator = coordinator;
+    return copy;
+}
+
+/// A copy with pieces of its own, as no process has touched it.
+CoordinatorState copyOf(const SimulatedCoordinatorState& state) {
+    auto copy = std::make_shared<SimulatedCoordinatorState>(state);
+    copy->observer.reset();
+    copy->before.reset();
+    copy->scheduled = false;
+    copy->appAsset = copyOf(state.appAsset, copy);
+    copy->userData = copyOf(state.userData, copy);
+    if (copy->initialODRAssets) {
+        for (PromiseState& each : *copy->initialODRAssets) each = copyOf(each, copy);
+    }
+    if (state.placeholder != nullptr) {
+        copy->placeholder = std::make_shared<SimulatedPlaceholderState>(*state.placeholder);
+        copy->placeholder->coordinator = copy;
+        copy->placeholder->icon = copyOf(state.placeholder->icon, nullptr);
+    }
+    return copy;
+}
+
 void endPromise(const std::shared_ptr<SimulatedPromiseState>& promise) {
     if (promise != nullptr) promise->over = true;
 }
@@ -269,11 +298,15 @@ std::shared_ptr<AppInstallObserver> SimulatedCoordination::makeAppInstallObserve
     std::weak_ptr<InstallCoordinatorObserver> delegate) {
     RecordedCall call(recorder_, kService, "makeAppInstallObserver", serviceName,
                       clientsText(clients));
+    if (takeNone(CoordinationObject::AppInstallObserver, serviceName)) {
+        return call.result(std::shared_ptr<AppInstallObserver>(), "(null)");
+    }
     auto registration =
         std::make_shared<Registration>(Registration{serviceName, clients, std::move(delegate)});
     registrations_.push_back(registration);
     std::shared_ptr<AppInstallObserver> observer =
         std::make_shared<Observer>(std::move(registration));
+    resume();
     return call.result(std::move(observer), "an observer");
 }
 
@@ -337,6 +370,7 @@ void SimulatedCoordination::cancelPromise(SimulatedPromiseState& promise, const 
                                           CoordinationClient client) {
     if (promise.over || !promise.isAwaited()) return;
     promise.cancelled = SimulatedCancel{reason, client};
+    tell("a promise given up", promise.name, Persistence::Soon);
     if (const State coordinator = promise.coordinator.lock()) advance(coordinator);
 }
 
@@ -346,7 +380,52 @@ void SimulatedCoordination::cancelNow(const State& state, const ErrorRecord& rea
     state->cancelled = SimulatedCancel{reason, client};
     end(state, reason);
     takePlaceholderAway(*state);
+    tell("the cancel", *state->identifier, Persistence::Committed);
     submit([this, state, reason, client] { reportCancel(state, reason, client); });
+}
+
+// Crashes.
+
+SimulatedCoordination::Records SimulatedCoordination::records() const {
+    Records result;
+    for (const auto& [identifier, state] : coordinators_) {
+        const bool isOnItsWay = wantsPlaceholder(*state) && state->before != nullptr;
+        result[identifier] = copyOf(isOnItsWay ? *state->before : *state);
+    }
+    return result;
+}
+
+void SimulatedCoordination::reopen(const Records& records) {
+    for (const auto& [identifier, state] : records) {
+        const bool stood = state->placeholderShown;
+        if (!enabled_) {
+            if (stood) registry_.hidePlaceholder(identifier);
+        } else if (!stood || registry_.placeholder(identifier)) {
+            coordinators_[identifier] = copyOf(*state);
+        }
+    }
+    isReopened_ = enabled_;
+    if (!enabled_) return;
+    for (const std::string& identifier : registry_.placeholderIdentifiers()) {
+        const bool isOfSync = registry_.placeholder(identifier)->installType == kInstallTypeSync;
+        if (isOfSync && !coordinators_.contains(identifier)) registry_.hidePlaceholder(identifier);
+    }
+}
+
+/// The device shows a placeholder before the call that hands it in returns, in one step with it.
+void SimulatedCoordination::willHandPlaceholder(SimulatedCoordinatorState& state) const {
+    if (recorder_.isChangeListening()) state.before = copyOf(state);
+}
+
+void SimulatedCoordination::resume() {
+    if (!std::exchange(isReopened_, false)) return;
+    for (const auto& [identifier, state] : Records(coordinators_)) advance(state);
+}
+
+void SimulatedCoordination::tell(std::string_view what, const std::string& identifier,
+                                 Persistence persistence) const {
+    if (!recorder_.isChangeListening()) return;
+    recorder_.recordsChanged(std::string(what) + " of " + identifier, persistence);
 }
 
 // What the service does by itself.
@@ -382,11 +461,12 @@ void SimulatedCoordination::goOn(const State& state) {
 }
 
 void SimulatedCoordination::showPlaceholder(const State& state) {
-    const Status status = registry_.showPlaceholder(proxyOf(*state->placeholder));
-    state->placeholderShown = status.ok();
-    if (!status) end(state, status.error());
+    const Result<Persistence> shown = registry_.showPlaceholder(proxyOf(*state->placeholder));
+    state->placeholderShown = shown.ok();
+    if (!shown) end(state, shown.error());
+    tell("the placeholder", *state->identifier, shown ? *shown : Persistence::Committed);
     reportPlaceholder(state);
-    if (!status) reportCompletion(state);
+    if (!shown) reportCompletion(state);
 }
 
 void SimulatedCoordination::install(const State& state) {
@@ -395,6 +475,8 @@ void SimulatedCoordination::install(const State& state) {
     if (state->ended) return;  // cancelled meanwhile
     end(state, status ? std::nullopt : std::optional(status.error()));
     if (!status) takePlaceholderAway(*state);
+    const bool isInstalled = status.ok() && state->kind != CoordinatorKind::RestoringDemoted;
+    tell("the end", *state->identifier, isInstalled ? Persistence::OnDisk : Persistence::Committed);
     reportCompletion(state);
 }
 
@@ -486,6 +568,7 @@ SimulatedCoordination::State SimulatedCoordination::create(CoordinatorKind kind,
     state->identifier = identifier;
     state->creator = client;
     coordinators_[identifier] = state;
+    tell("a coordinator", identifier, Persistence::Committed);
     return state;
 }
 
@@ -531,6 +614,20 @@ const SimulatedPlaceholderState* SimulatedCoordination::placeholder(
     const std::string& identifier) const {
     const auto found = placeholders_.find(identifier);
     return found == placeholders_.end() ? nullptr : found->second.get();
+}
+
+bool SimulatedCoordination::isComplete(const std::string& identifier) const {
+    const State found = find(identifier);
+    return found != nullptr && isReady(*found);
+}
+
+std::set<std::string> SimulatedCoordination::deliveredPackages() const {
+    std::set<std::string> paths;
+    for (const auto& [identifier, state] : coordinators_) {
+        const PromiseState& asset = state->appAsset;
+        if (asset != nullptr && asset->complete && asset->path) paths.insert(asset->path->path());
+    }
+    return paths;
 }
 
 std::vector<std::string> SimulatedCoordination::identifiers() const {

@@ -44,6 +44,7 @@ enum class CoordinationObject {
     PathTransferPromise,  // by name
     OutOfBandPromise,     // by name
     Placeholder,          // by bundle identifier
+    AppInstallObserver,   // by service name
 };
 
 /// The install-coordination service in memory: it keeps coordinators, shows placeholders and
@@ -92,6 +93,7 @@ class SimulatedCoordination : public InstallCoordinatorService {
     static constexpr std::size_t kThreads = 4;
 
     void setEnabled(bool enabled) { enabled_ = enabled; }
+    [[nodiscard]] bool isEnabled() const { return enabled_; }
 
     // What other clients do.
     /// A client creates a coordinator (the store: 1, another: any number) where there is none.
@@ -104,6 +106,16 @@ class SimulatedCoordination : public InstallCoordinatorService {
     /// Somebody wants the application before the others.
     void prioritize(const std::string& identifier) { postShouldPrioritize(identifier); }
 
+    // Crashes.
+    /// The coordinators that there are, each with pieces of its own.
+    using Records = std::map<std::string, std::shared_ptr<SimulatedCoordinatorState>>;
+    [[nodiscard]] Records records() const;
+    /// Takes records over as the service does when the device is opened, after the registry has:
+    /// coordinators whose placeholder stood and is lost go, and so do a sync's placeholders without
+    /// a coordinator; without coordination everything goes, except placeholders. Who observed is
+    /// gone. What is left goes on once somebody observes installs.
+    void reopen(const Records& records);
+
     // What the test looks at. Null when there is none.
     [[nodiscard]] const SimulatedCoordinatorState* state(const std::string& identifier) const;
     /// The last coordinator of the identifier that is done or cancelled.
@@ -111,6 +123,10 @@ class SimulatedCoordination : public InstallCoordinatorService {
     /// The last promise that was made of this name, and the last placeholder of this identifier.
     [[nodiscard]] const SimulatedPromiseState* promise(const std::string& name) const;
     [[nodiscard]] const SimulatedPlaceholderState* placeholder(const std::string& identifier) const;
+    /// Whether the coordinator of the identifier has everything that it needs.
+    [[nodiscard]] bool isComplete(const std::string& identifier) const;
+    /// The paths of the packages that coordinators have and have not used.
+    [[nodiscard]] std::set<std::string> deliveredPackages() const;
     /// The identifiers that have a coordinator, sorted.
     [[nodiscard]] std::vector<std::string> identifiers() const;
     /// The service names of the app-install observers that live, in order.
@@ -177,6 +193,11 @@ class SimulatedCoordination : public InstallCoordinatorService {
     /// Lets the service look at what the coordinator has now.
     void advance(const State& state);
 
+    void willHandPlaceholder(SimulatedCoordinatorState& state) const;
+    /// Tells that the records have changed.
+    void tell(std::string_view what, const std::string& identifier, Persistence persistence) const;
+    void resume();
+
     // Threads.
     void submit(Work work);
     void workerLoop();
@@ -213,6 +234,7 @@ class SimulatedCoordination : public InstallCoordinatorService {
     SimulatedAppRegistry& registry_;
     SimulatedFileSystem& files_;
     bool enabled_ = false;
+    bool isReopened_ = false;
     std::map<std::string, State> coordinators_;
     std::map<std::string, State> ended_;
     std::map<std::string, std::shared_ptr<SimulatedPromiseState>> promises_;

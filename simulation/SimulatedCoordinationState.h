@@ -84,6 +84,9 @@ struct SimulatedCoordinatorState {
     bool ended = false;
     /// A thread of the service's is at work on it, or will be.
     bool scheduled = false;
+    /// As it was before its placeholder was handed in, while that is on its way to the home screen:
+    /// both are written down at once.
+    std::shared_ptr<const SimulatedCoordinatorState> before;
 };
 
 }  // namespace appsync

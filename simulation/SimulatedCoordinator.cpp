@@ -81,6 +81,7 @@ Status SimulatedCoordinator::setInstallOptions(const InstallOptions& options) {
                                       state_->installOptions.has_value());
     if (!status) return call.result(status);
     state_->installOptions = options;
+    service_.tell("install options", name(), Persistence::Soon);
     service_.advance(state_);
     return call.result(status);
 }
@@ -101,6 +102,7 @@ Status SimulatedCoordinator::setInitialODRAssetPromises(
     if (!status) return call.result(status);
     for (const auto& state : states) state->coordinator = state_;
     state_->initialODRAssets = std::move(states);
+    service_.tell("the initial assets", name(), Persistence::Soon);
     service_.advance(state_);
     return call.result(status);
 }
@@ -126,6 +128,7 @@ Status SimulatedCoordinator::setAppAssetPromise(
     if (!status) return call.result(status);
     asset->coordinator = state_;
     state_->appAsset = asset;
+    service_.tell("the package promise", name(), Persistence::Soon);
     service_.advance(state_);
     return call.result(status);
 }
@@ -140,7 +143,10 @@ Status SimulatedCoordinator::setAppAssetPromiseResponsibleClient(CoordinationCli
                       client);
     Status status = service_.checkSet(CoordinationStep::AppAssetPromiseResponsibleClient, *state_,
                                       state_->responsibleClient.has_value());
-    if (status) state_->responsibleClient = client;
+    if (status) {
+        state_->responsibleClient = client;
+        service_.tell("who brings the package", name(), Persistence::Soon);
+    }
     return call.result(status);
 }
 
@@ -159,6 +165,7 @@ Status SimulatedCoordinator::setUserDataPromise(const std::shared_ptr<OutOfBandP
     if (!status) return call.result(status);
     data->coordinator = state_;
     state_->userData = data;
+    service_.tell("the data promise", name(), Persistence::Soon);
     service_.advance(state_);
     return call.result(status);
 }
@@ -178,7 +185,9 @@ Status SimulatedCoordinator::setPlaceholderPromise(
     if (status) status = SimulatedCoordination::checkPlaceholder(*state_, given.get());
     if (!status) return call.result(status);
     given->coordinator = state_;
+    service_.willHandPlaceholder(*state_);
     state_->placeholder = given;
+    service_.tell("a placeholder handed in", name(), Persistence::Soon);
     service_.advance(state_);
     return call.result(status);
 }

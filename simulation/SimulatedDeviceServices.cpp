@@ -28,6 +28,7 @@ class SimulatedBackupService::Manager : public BackupManager {
                                 identifier);
         service_.cancelled_.push_back(identifier);
         service_.restoreData_.erase(identifier);
+        service_.recorder_.recordsChanged("the restore data of " + identifier, Persistence::OnDisk);
     }
 
   private:
@@ -53,6 +54,7 @@ bool SimulatedInstaller::clearUninstalled(std::span<const std::string> identifie
     for (const std::string& identifier : identifiers) {
         if (uninstalled_) uninstalled_->erase(identifier);
     }
+    recorder_.recordsChanged("the list of uninstalled applications", Persistence::OnDisk);
     return call.result(true);
 }
 

@@ -38,6 +38,10 @@ class SimulatedBackupService : public BackupService {
     [[nodiscard]] std::unique_ptr<BackupManager> makeManager() override;
 
     void addRestoreData(const std::string& identifier) { restoreData_.insert(identifier); }
+    void setRestoreData(std::set<std::string> identifiers) {
+        restoreData_ = std::move(identifiers);
+    }
+    [[nodiscard]] const std::set<std::string>& restoreData() const { return restoreData_; }
     /// The identifiers whose restore was cancelled, in order. Their data is gone.
     [[nodiscard]] const std::vector<std::string>& cancelled() const { return cancelled_; }
 

@@ -34,6 +34,13 @@ std::vector<std::string> componentsOf(std::string_view path) {
     return components;
 }
 
+/// The one copy of a name, which outlives every file system.
+const std::string* accountName(std::string_view name) {
+    static auto& names = *new std::set<std::string, std::less<>>;
+    const auto found = names.find(name);
+    return found != names.end() ? &*found : &*names.emplace(name).first;
+}
+
 int checkPath(const std::string& path) {
     if (!path.starts_with('/') || path.find('\0') != std::string::npos) return EINVAL;
     if (path.size() > kLongestPath) return ENAMETOOLONG;
@@ -41,32 +48,6 @@ int checkPath(const std::string& path) {
 }
 
 }  // namespace
-
-// Kept small: there are tens of thousands of them in the largest tests.
-struct SimulatedFileSystem::Node {
-    enum class Kind { Directory, File, Link, Pipe };
-
-    [[nodiscard]] std::uint64_t bytes() const {
-        std::uint64_t sum = kind == Kind::File ? contents->size() : 0;
-        for (const auto& [name, child] : children) sum += child->bytes();
-        return sum;
-    }
-
-    [[nodiscard]] bool holds(const Node* other) const {
-        if (this == other) return true;
-        for (const auto& [name, child] : children) {
-            if (child->holds(other)) return true;
-        }
-        return false;
-    }
-
-    Kind kind = Kind::File;
-    const std::string* owner = nullptr;  // a known account
-    const std::string* group = nullptr;
-    SimulatedTime modified{0};
-    Contents contents;  // of a link: where it points
-    std::map<std::string, NodePointer, std::less<>> children;
-};
 
 /// The directory that holds an item, and the item, if there is one.
 struct SimulatedFileSystem::Place {
@@ -118,6 +99,7 @@ Status SimulatedFileSystem::createDirectory(const std::string& path, bool withIn
     if (error == 0) {
         error = withIntermediates ? makeDirectories(path, wanted) : makeDirectory(path, wanted);
     }
+    tell(error, "createDirectory", path);
     return call.result(statusOf(error, "create the directory", path));
 }
 
@@ -125,6 +107,7 @@ Status SimulatedFileSystem::removeItem(const std::string& path) {
     RecordedCall call(recorder_, kService, "removeItem", path);
     int error = fault(FileOperation::RemoveItem, path);
     if (error == 0) error = removeAt(path);
+    tell(error, "removeItem", path);
     return call.result(statusOf(error, "remove", path));
 }
 
@@ -132,6 +115,7 @@ Status SimulatedFileSystem::moveItem(const std::string& from, const std::string&
     RecordedCall call(recorder_, kService, "moveItem", from, to);
     int error = fault(FileOperation::MoveItem, from);
     if (error == 0) error = moveTo(from, to);
+    tell(error, "moveItem", from + ", " + to);
     return call.result(statusOf(error, "move", from + "' to '" + to));
 }
 
@@ -139,6 +123,7 @@ Status SimulatedFileSystem::copyItem(const std::string& from, const std::string&
     RecordedCall call(recorder_, kService, "copyItem", from, to);
     int error = fault(FileOperation::CopyItem, from);
     if (error == 0) error = copyTo(from, to);
+    tell(error, "copyItem", from + ", " + to);
     return call.result(statusOf(error, "copy", from + "' to '" + to));
 }
 
@@ -154,7 +139,8 @@ Result<Bytes> SimulatedFileSystem::readFile(const std::string& path) {
 Status SimulatedFileSystem::writeFileAtomically(const std::string& path, ByteView contents) {
     RecordedCall call(recorder_, kService, "writeFileAtomically", path, contents);
     int error = fault(FileOperation::WriteFileAtomically, path);
-    if (error == 0) error = replaceFile(path, share(contents), {});
+    if (error == 0) error = replaceFile(path, share(contents), {}, Written::Synced);
+    tell(error, "writeFileAtomically", path);
     return call.result(statusOf(error, "write", path));
 }
 
@@ -163,7 +149,8 @@ Status SimulatedFileSystem::createFile(const std::string& path, ByteView content
     RecordedCall call(recorder_, kService, "createFile", path, contents, attributes);
     int error = fault(FileOperation::CreateFile, path);
     if (error == 0) error = checkAttributes(attributes);
-    if (error == 0) error = replaceFile(path, share(contents), attributes);
+    if (error == 0) error = replaceFile(path, share(contents), attributes, Written::Unsynced);
+    tell(error, "createFile", path);
     return call.result(statusOf(error, "create", path));
 }
 
@@ -173,6 +160,7 @@ Status SimulatedFileSystem::setTimesToNow(const std::string& path) {
     int error = fault(FileOperation::SetTimesToNow, path);
     if (error == 0) error = resolve(path, node);
     if (error == 0) node->modified = recorder_.scheduler().now();
+    tell(error, "setTimesToNow", path);
     return call.result(statusOf(error, "set the times of", path));
 }
 
@@ -282,9 +270,9 @@ int SimulatedFileSystem::checkAttributes(const FileAttributes& attributes) const
 }
 
 /// The accounts are known.
-void SimulatedFileSystem::give(Node& node, const FileAttributes& attributes) const {
-    if (attributes.owner) node.owner = &*accounts_.find(*attributes.owner);
-    if (attributes.group) node.group = &*accounts_.find(*attributes.group);
+void SimulatedFileSystem::give(Node& node, const FileAttributes& attributes) {
+    if (attributes.owner) node.owner = accountName(*attributes.owner);
+    if (attributes.group) node.group = accountName(*attributes.group);
 }
 
 int SimulatedFileSystem::makeDirectory(const std::string& path, const FileAttributes& attributes) {
@@ -294,7 +282,7 @@ int SimulatedFileSystem::makeDirectory(const std::string& path, const FileAttrib
     NodePointer node = makeNode();
     node->kind = Node::Kind::Directory;
     give(*node, attributes);
-    target.directory->children[target.name] = std::move(node);
+    setChild(target.directory, target.name, std::move(node), Written::Nothing);
     return 0;
 }
 
@@ -316,7 +304,7 @@ int SimulatedFileSystem::makeDirectories(const std::string& path,
 }
 
 int SimulatedFileSystem::replaceFile(const std::string& path, Contents contents,
-                                     const FileAttributes& attributes) {
+                                     const FileAttributes& attributes, Written written) {
     Place target;
     if (const int error = place(path, target); error != 0) return error;
     if (path.ends_with('/')) return EISDIR;
@@ -332,7 +320,7 @@ int SimulatedFileSystem::replaceFile(const std::string& path, Contents contents,
     give(*node, attributes);
     usedBytes_ = without + contents->size();
     node->contents = std::move(contents);
-    target.directory->children[target.name] = std::move(node);
+    setChild(target.directory, target.name, std::move(node), written);
     return 0;
 }
 
@@ -345,6 +333,11 @@ int SimulatedFileSystem::moveTo(const std::string& from, const std::string& to) 
     if (target.node != nullptr) return EEXIST;
     if (source.node->holds(target.directory.get())) return EINVAL;
     if (to.ends_with('/') && source.node->kind != Node::Kind::Directory) return ENOTDIR;
+    if (journal_) {
+        journal_->record({{source.directory, source.name, source.node, nullptr},
+                          {target.directory, target.name, nullptr, source.node}},
+                         Written::Nothing);
+    }
     source.directory->children.erase(source.name);
     target.directory->children[target.name] = source.node;
     return 0;
@@ -356,7 +349,7 @@ int SimulatedFileSystem::copyTo(const std::string& from, const std::string& to) 
     if (const int error = regularFileAt(from, source); error != 0) return error;
     if (const int error = place(to, target); error != 0) return error;
     if (target.node != nullptr) return EEXIST;
-    return replaceFile(to, source->contents, {});
+    return replaceFile(to, source->contents, {}, Written::Unsynced);
 }
 
 int SimulatedFileSystem::removeAt(const std::string& path) {
@@ -364,14 +357,45 @@ int SimulatedFileSystem::removeAt(const std::string& path) {
     if (const int error = place(path, target); error != 0) return error;
     if (target.node == nullptr) return ENOENT;
     usedBytes_ -= target.node->bytes();
-    target.directory->children.erase(target.name);
+    recordRemovals(target.node);
+    setChild(target.directory, target.name, nullptr, Written::Nothing);
     return 0;
+}
+
+/// Null takes away what is there.
+void SimulatedFileSystem::setChild(const NodePointer& directory, const std::string& name,
+                                   NodePointer node, Written written) {
+    const auto found = directory->children.find(name);
+    if (journal_) {
+        const NodePointer before = found != directory->children.end() ? found->second : nullptr;
+        journal_->record({{directory, name, before, node}}, written);
+    }
+    if (node != nullptr) {
+        directory->children[name] = std::move(node);
+    } else if (found != directory->children.end()) {
+        directory->children.erase(found);
+    }
+}
+
+/// A directory is removed item by item, what is inside before what holds it.
+void SimulatedFileSystem::recordRemovals(const NodePointer& directory) {
+    if (!journal_) return;
+    for (const auto& [name, child] : directory->children) {
+        recordRemovals(child);
+        journal_->record({{directory, name, child, nullptr}}, Written::Nothing);
+    }
+}
+
+void SimulatedFileSystem::tell(int error, std::string_view method, const std::string& arguments) {
+    if (error != 0 || !recorder_.isChangeListening()) return;
+    recorder_.filesChanged(std::string(kService) + "." + std::string(method) + "(" + arguments +
+                           ")");
 }
 
 SimulatedFileSystem::NodePointer SimulatedFileSystem::makeNode() const {
     static const Contents nothing = std::make_shared<const Bytes>();
     auto node = std::make_shared<Node>();
-    node->owner = &*accounts_.find(kDefaultAccount);
+    node->owner = accountName(kDefaultAccount);
     node->group = node->owner;
     node->contents = nothing;
     node->modified = recorder_.scheduler().now();
@@ -389,7 +413,9 @@ void SimulatedFileSystem::put(const std::string& path, NodePointer node) {
     if (error == 0) error = place(path, target);
     if (error != 0) throw SimulationFailure(statusOf(error, "add", path).error().description());
     usedBytes_ += node->bytes();
-    target.directory->children[target.name] = std::move(node);
+    const bool isFile = node->kind == Node::Kind::File;
+    setChild(target.directory, target.name, std::move(node),
+             isFile ? Written::Unsynced : Written::Nothing);
 }
 
 void SimulatedFileSystem::addDirectory(const std::string& path) {
@@ -475,7 +501,7 @@ std::vector<std::string> SimulatedFileSystem::paths(const std::string& directory
     return result;
 }
 
-SimulatedFileSystem::NodePointer SimulatedFileSystem::copyOf(const Node& node) const {
+SimulatedFileSystem::NodePointer SimulatedFileSystem::copyOf(const Node& node) {
     auto copy = std::make_shared<Node>(node);
     for (auto& [name, child] : copy->children) child = copyOf(*child);
     return copy;
@@ -486,6 +512,25 @@ bool SimulatedFileSystem::copyTree(const std::string& from, const std::string& t
     if (node == nullptr || node->kind != Node::Kind::Directory) return false;
     put(to, copyOf(*node));
     return true;
+}
+
+// Crashes.
+
+void SimulatedFileSystem::keepJournal() { journal_.emplace(); }
+
+void SimulatedFileSystem::sync() {
+    if (journal_) journal_->sync();
+}
+
+std::shared_ptr<const FileNode> SimulatedFileSystem::afterCrash(const FileLoss& loss) const {
+    if (!journal_) throw SimulationFailure("the file system keeps no journal");
+    return journal_->afterCrash(root_, loss);
+}
+
+void SimulatedFileSystem::load(const FileNode& root) {
+    root_ = copyOf(root);
+    usedBytes_ = root_->bytes();
+    if (journal_) journal_->sync();
 }
 
 // Faults.

@@ -13,6 +13,7 @@
 #include <vector>
 
 #include "platform/FileSystem.h"
+#include "simulation/FileJournal.h"
 #include "simulation/Recorder.h"
 
 namespace appsync {
@@ -90,19 +91,30 @@ class SimulatedFileSystem : public FileSystem {
     void failEvery(FileOperation operation, std::string_view path, int errnoValue);
     void stopFailing() { faults_.clear(); }
 
+    // Crashes. What is lost at one is said in platform/FileSystem.h.
+    /// From now on it is known what was not synced. Everything that is there now is on disk.
+    void keepJournal();
+    /// A service of the device has synced the whole file system.
+    void sync();
+    /// The files as a crash at this moment leaves them. Only with a journal.
+    [[nodiscard]] std::shared_ptr<const FileNode> afterCrash(const FileLoss& loss) const;
+    /// Takes over what a crash has left; everything is on disk.
+    void load(const FileNode& root);
+
     /// Copies a tree without crossing platform/: what a service of the device does with files that
     /// it is given. False when there is no directory at `from`.
     bool copyTree(const std::string& from, const std::string& to);
 
   private:
-    struct Node;
+    using Node = FileNode;
     struct Place;
     struct Fault {
         int errnoValue = 0;
         std::size_t left = 0;
     };
-    using NodePointer = std::shared_ptr<Node>;
-    using Contents = std::shared_ptr<const Bytes>;  // copies of a file share theirs
+    using NodePointer = Node::Pointer;
+    using Contents = Node::Contents;
+    using Written = FileJournal::Written;
     static constexpr std::size_t kForEver = std::numeric_limits<std::size_t>::max();
 
     [[nodiscard]] static Contents share(ByteView contents);
@@ -114,17 +126,22 @@ class SimulatedFileSystem : public FileSystem {
     [[nodiscard]] int regularFileAt(const std::string& path, NodePointer& found) const;
     [[nodiscard]] int fault(FileOperation operation, const std::string& path);
     [[nodiscard]] int checkAttributes(const FileAttributes& attributes) const;
-    void give(Node& node, const FileAttributes& attributes) const;
+    static void give(Node& node, const FileAttributes& attributes);
     [[nodiscard]] int makeDirectory(const std::string& path, const FileAttributes& attributes);
     [[nodiscard]] int makeDirectories(const std::string& path, const FileAttributes& attributes);
     [[nodiscard]] int replaceFile(const std::string& path, Contents contents,
-                                  const FileAttributes& attributes);
+                                  const FileAttributes& attributes, Written written);
     [[nodiscard]] int moveTo(const std::string& from, const std::string& to);
     [[nodiscard]] int copyTo(const std::string& from, const std::string& to);
     [[nodiscard]] int removeAt(const std::string& path);
     void put(const std::string& path, NodePointer node);
+    void setChild(const NodePointer& directory, const std::string& name, NodePointer node,
+                  Written written);
+    void recordRemovals(const NodePointer& directory);
+    /// Tells of what a call has changed, if it has.
+    void tell(int error, std::string_view method, const std::string& arguments);
     [[nodiscard]] NodePointer makeNode() const;
-    [[nodiscard]] NodePointer copyOf(const Node& node) const;
+    [[nodiscard]] static NodePointer copyOf(const Node& node);
 
     Recorder& recorder_;
     NodePointer root_;
@@ -132,6 +149,7 @@ class SimulatedFileSystem : public FileSystem {
     std::uint64_t capacity_ = std::numeric_limits<std::uint64_t>::max();
     std::uint64_t usedBytes_ = 0;
     std::map<std::pair<FileOperation, std::string>, Fault> faults_;
+    std::optional<FileJournal> journal_;
 };
 
 }  // namespace appsync

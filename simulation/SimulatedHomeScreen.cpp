@@ -16,7 +16,9 @@ class SimulatedHomeScreen::Connection : public HomeScreenConnection {
 
     bool setIconState(ByteView state) override {
         RecordedCall call(home_.recorder_, kConnectionService, "setIconState", state);
-        return call.result(home_.takeLayout(state));
+        const bool taken = home_.takeLayout(state);
+        if (taken) home_.recorder_.recordsChanged("the icon layout", Persistence::Committed);
+        return call.result(taken);
     }
 
     [[nodiscard]] std::optional<Bytes> flattenedIconState(std::uint64_t variant) override {

@@ -59,6 +59,7 @@ Status SimulatedPlaceholder::setConfigurationComplete() {
     Status status = service_.checkChange(CoordinationStep::ConfigurationComplete, *state_);
     if (!status) return call.result(status);
     state_->configurationComplete = true;
+    service_.tell("a configuration", state_->identifier, Persistence::Soon);
     if (const auto coordinator = state_->coordinator.lock()) service_.advance(coordinator);
     return call.result(status);
 }

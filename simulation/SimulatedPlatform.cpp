@@ -3,10 +3,47 @@
 #include <algorithm>
 #include <utility>
 
+#include "simulation/DeviceImage.h"
 #include "simulation/KnownCalls.h"
 
 namespace appsync {
 namespace {
+
+constexpr std::string_view kReceivedFiles = "/var/mobile/Media/PublicStaging";
+constexpr std::string_view kTemporaryFiles = "/tmp";
+constexpr std::string_view kPackageSuffix = ".zip";
+/// In the name of a file that was about to be renamed.
+constexpr std::string_view kTemporaryMark = ".appsync-";
+
+/// A package that was delivered to a coordinator, or whose data is yet to come, waits where it is.
+void clearPackages(SimulatedPlatform& platform) {
+    const std::set<std::string> delivered = platform.coordination.deliveredPackages();
+    for (const std::string& name : platform.files.names(std::string(kReceivedFiles))) {
+        if (!name.ends_with(kPackageSuffix)) continue;
+        const std::string identifier = name.substr(0, name.size() - kPackageSuffix.size());
+        const std::string path = std::string(kReceivedFiles) + "/" + name;
+        if (platform.backup.restoreData().contains(identifier) || delivered.contains(path)) {
+            continue;
+        }
+        platform.files.remove(path);
+    }
+}
+
+void clearTemporaries(SimulatedPlatform& platform) {
+    platform.files.remove(std::string(kTemporaryFiles));
+    platform.files.addDirectory(std::string(kTemporaryFiles));
+    for (const char* directory :
+         {"/var/mobile/Library/ApplicationSync", kReceivedFiles.data(),
+          "/var/mobile/Media/VessikRestore", "/var/mobile/Library/Preferences",
+          "/var/containers/Bundle/Application"}) {
+        for (const std::string& path : platform.files.paths(directory)) {
+            const std::string_view name = std::string_view(path).substr(path.rfind('/') + 1);
+            const bool isTemporary =
+                name.starts_with('.') && name.find(kTemporaryMark) != std::string_view::npos;
+            if (isTemporary) platform.files.remove(path);
+        }
+    }
+}
 
 bool isCall(const RecordEntry& entry) { return entry.kind == RecordEntry::Kind::Call; }
 bool isMessage(const RecordEntry& entry) { return entry.kind == RecordEntry::Kind::Message; }
@@ -104,6 +141,21 @@ std::size_t SimulatedPlatform::countMessages(std::string_view text) const {
 
 void SimulatedPlatform::onCall(std::string call, Recorder::Hook hook) {
     recorder.setHook(std::move(call), std::move(hook));
+}
+
+void SimulatedPlatform::reopen(const DeviceImage& image) {
+    files.load(*image.files);
+    coordination.setEnabled(image.records.isCoordinated);
+    registry.reopen(image.records.registry, image.powerWasLost);
+    coordination.reopen(image.records.coordination);
+    installer.setUninstalled(image.records.uninstalled);
+    // The install of an application takes its data along.
+    std::set<std::string> restoreData = image.records.restoreData;
+    std::erase_if(restoreData, [this](const auto& each) { return registry.installed(each); });
+    backup.setRestoreData(std::move(restoreData));
+    homeScreen.setLayout(image.records.layout);
+    clearPackages(*this);
+    clearTemporaries(*this);
 }
 
 void SimulatedPlatform::addPropertyList(const std::string& path, const PropertyList& value,

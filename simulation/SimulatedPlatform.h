@@ -27,6 +27,8 @@
 
 namespace appsync {
 
+struct DeviceImage;
+
 /// A whole platform in memory, on one thread, by a virtual clock.
 ///
 ///     PropertyListCodec codec;                        // whatever reads and writes property lists
@@ -93,6 +95,10 @@ class SimulatedPlatform {
 
     /// From now on `hook` runs at each call of "Service.method", before it has any effect.
     void onCall(std::string call, Recorder::Hook hook);
+
+    /// Takes over what a crash has left, and puts it in order as the opening of a device does. The
+    /// platform is as it was made. Applications that ran run no more.
+    void reopen(const DeviceImage& image);
 
     // Property lists as files.
     void addPropertyList(const std::string& path, const PropertyList& value,

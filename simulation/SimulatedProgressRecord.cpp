@@ -25,6 +25,7 @@ void SimulatedProgressRecord::setInstallState(std::uint64_t state) {
     const RecordedCall call(recorder_, kService, "setInstallState", identifier_, state);
     if (over_) return;
     values_.state = state;
+    tell();
     stateChanged_();
 }
 
@@ -35,7 +36,9 @@ std::uint64_t SimulatedProgressRecord::installPhase() const {
 
 void SimulatedProgressRecord::setInstallPhase(std::uint64_t phase) {
     const RecordedCall call(recorder_, kService, "setInstallPhase", identifier_, phase);
-    if (!over_) values_.phase = phase;
+    if (over_) return;
+    values_.phase = phase;
+    tell();
 }
 
 std::int64_t SimulatedProgressRecord::totalUnitCount() const {
@@ -62,12 +65,17 @@ void SimulatedProgressRecord::cancel() {
     const RecordedCall call(recorder_, kService, "cancel", identifier_);
     if (over_) return;
     values_.state = kInstallStateCanceled;
+    tell();
     stateChanged_();
 }
 
 std::string SimulatedProgressRecord::description() const {
     RecordedCall call(recorder_, kService, "description", identifier_);
     return call.result(text());
+}
+
+void SimulatedProgressRecord::tell() const {
+    recorder_.recordsChanged("the progress of " + identifier_, Persistence::Soon);
 }
 
 void SimulatedProgressRecord::end(std::uint64_t state) {

@@ -48,6 +48,8 @@ class SimulatedProgressRecord : public InstallProgressRecord {
     [[nodiscard]] std::string text() const;
 
   private:
+    void tell() const;
+
     Recorder& recorder_;
     const std::string identifier_;
     const std::function<void()> stateChanged_;

@@ -38,7 +38,9 @@ template <typename Interface>
 void SimulatedPromise<Interface>::setPercentComplete(double percent) {
     [[maybe_unused]] const RecordedCall call(service_.recorder_, kService<Interface>,
                                              "setPercentComplete", state_->name, percent);
-    if (!state_->over) state_->percent = percent;
+    if (state_->over) return;
+    state_->percent = percent;
+    service_.tell("a promise's progress", state_->name, Persistence::Soon);
 }
 
 template <typename Interface>
@@ -53,6 +55,7 @@ void SimulatedPromise<Interface>::setComplete() {
                                              state_->name);
     if (state_->over || !state_->isAwaited()) return;
     state_->complete = true;
+    service_.tell("a promise kept", state_->name, Persistence::Committed);
     if (const auto coordinator = state_->coordinator.lock()) service_.advance(coordinator);
 }
 
@@ -75,7 +78,9 @@ std::optional<FileURL> SimulatedPathTransferPromise::transferPath() const {
 void SimulatedPathTransferPromise::setTransferPath(const FileURL& path) {
     const RecordedCall call(service_.recorder_, kPathTransferPromise, "setTransferPath",
                             state_->name, path);
-    if (!state_->over) state_->path = path;
+    if (state_->over) return;
+    state_->path = path;
+    service_.tell("a promise's path", state_->name, Persistence::Soon);
 }
 
 }  // namespace appsync

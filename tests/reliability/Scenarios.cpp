@@ -4,6 +4,7 @@
 
 #include "client/Paths.h"
 #include "client/TodoList.h"
+#include "tests/reliability/HostPlan.h"
 
 namespace appsync {
 namespace {
@@ -13,6 +14,18 @@ constexpr const char* kB = "com.example.b";
 constexpr const char* kC = "com.example.c";
 
 using Shortcomings = std::vector<std::string>;
+
+PropertyList oneOfEach() {
+    return PropertyList::array({World::entry(kA, "install"), World::entry(kB, "remove")});
+}
+
+PropertyList updates() {
+    return PropertyList::array({World::entry(kA, "install"), World::entry(kC, "install")});
+}
+
+PropertyList removals() {
+    return PropertyList::array({World::entry(kA, "remove"), World::entry(kB, "remove")});
+}
 
 /// The client's answer to the host is the one that is specified.
 void expect(Invariants& invariants, bool holds, const char* what) {
@@ -38,20 +51,14 @@ void transfer(World& world, const SyncAssetPointer& asset) {
     world.client->assetTransferSucceeded(asset, true, nullptr);
 }
 
-void sync(World& world, Invariants& invariants, const PropertyList& list) {
-    world.stage(list);
-    invariants.sessionBegins(list);
-    expect(invariants, world.client->prepareForSyncWithHostAnchor("anchor 0", {}, nullptr),
-           "preparing for a sync was refused");
-    reconcile(world, invariants);
-    world.platform.runUntilIdle();
-    static_cast<void>(world.client->installedAssets());
-    const auto assets = world.client->outstandingAssetTransfers();
-    world.platform.runUntilIdle();
-    for (const SyncAssetPointer& asset : assets) transfer(world, asset);
-    world.client->assetTransferEndedWithSuccess(true);
-    world.client->syncEndedWithSuccess(true);
-    world.settle();
+/// Up to the moment at which the session begins.
+HostPlan begin(World& world, Invariants& invariants, const PropertyList& wanted) {
+    HostPlan plan{wanted, {}};
+    if (world.hostPlans) plan = planSession(world, wanted);
+    world.stage(plan.todoList, wanted);
+    invariants.sessionBegins(plan.todoList);
+    if (world.client == nullptr) world.startClient();
+    return plan;
 }
 
 std::function<void(World&, Invariants&)> syncing(PropertyList list) {
@@ -71,6 +78,8 @@ void restore(World& world, Invariants& invariants, const std::vector<std::string
 
 /// The package of a restoring application, then its data.
 void transferRestore(World& world, Invariants&) {
+    // Who sends it by hand sees whether it is there.
+    if (world.hostPlans && world.platform.registry.installed(kA)) return;
     for (const unsigned parts :
          {unsigned{kAssetPartApplication}, unsigned{kAssetPartApplicationData}}) {
         auto asset = std::make_shared<SyncAsset>();
@@ -111,10 +120,8 @@ void endSession(World& world, Invariants&) {
 
 /// The transfers of two applications, one of which fails, and the phase that fails then.
 void loseTransfers(World& world, Invariants& invariants) {
-    const PropertyList list =
-        PropertyList::array({World::entry(kA, "install"), World::entry(kC, "install")});
-    world.stage(list);
-    invariants.sessionBegins(list);
+    const PropertyList list = updates();
+    begin(world, invariants, list);
     reconcile(world, invariants);
     const auto assets = world.client->outstandingAssetTransfers();
     world.platform.runUntilIdle();
@@ -217,18 +224,6 @@ void addRestoring(World& world) {
             {{kC, PropertyList::map({{"1.0", PropertyList::map({{"path", "/c"}})}})}}));
 }
 
-PropertyList oneOfEach() {
-    return PropertyList::array({World::entry(kA, "install"), World::entry(kB, "remove")});
-}
-
-PropertyList updates() {
-    return PropertyList::array({World::entry(kA, "install"), World::entry(kC, "install")});
-}
-
-PropertyList removals() {
-    return PropertyList::array({World::entry(kA, "remove"), World::entry(kB, "remove")});
-}
-
 std::vector<Scenario> inBothModes(const Scenario& scenario) {
     Scenario direct = scenario;
     Scenario coordinated = scenario;
@@ -249,10 +244,11 @@ std::vector<Scenario> make() {
     const auto add = [&all](const Scenario& scenario) {
         for (Scenario& each : inBothModes(scenario)) all.push_back(std::move(each));
     };
-    add({"Sync", false, withB, syncing(oneOfEach()), marking({kA})});
-    add({"Update", false, withAll, syncing(updates()), marking({kA, kB, kC})});
-    add({"Removal", false, withAll, syncing(removals()), leaving({kC})});
-    add({"LostTransfers", false, withAll, loseTransfers, fine, false});
+    add({"Sync", false, withB, syncing(oneOfEach()), marking({kA}), true, oneOfEach()});
+    add({"Update", false, withAll, syncing(updates()), marking({kA, kB, kC}), true, updates()});
+    add({"Removal", false, withAll, syncing(removals()), leaving({kC}), true, removals()});
+    add({"LostTransfers", false, withAll, loseTransfers, fine, false, updates(),
+         syncing(updates())});
     // A placeholder that a coordinator has promised stays until the store keeps its promise; what
     // is given up once has lost its restore information.
     add({"Restore", false, withB, restoring, leaving({kB}, {kA, kC}), true});
@@ -270,6 +266,25 @@ std::vector<Scenario> make() {
 }
 
 }  // namespace
+
+void sync(World& world, Invariants& invariants, const PropertyList& wanted) {
+    const HostPlan plan = begin(world, invariants, wanted);
+    expect(invariants, world.client->prepareForSyncWithHostAnchor("anchor 0", {}, nullptr),
+           "preparing for a sync was refused");
+    reconcile(world, invariants);
+    world.platform.runUntilIdle();
+    static_cast<void>(world.client->installedAssets());
+    const auto assets = world.client->outstandingAssetTransfers();
+    world.platform.runUntilIdle();
+    for (const SyncAssetPointer& asset : assets) {
+        if (!plan.arrived.contains(asset->identifier)) transfer(world, asset);
+    }
+    world.client->assetTransferEndedWithSuccess(true);
+    world.platform.runUntilIdle();
+    cancelWhatWasTakenUp(world, plan);
+    world.client->syncEndedWithSuccess(true);
+    world.settle();
+}
 
 const std::vector<Scenario>& scenarios() {
     static const std::vector<Scenario> all = make();

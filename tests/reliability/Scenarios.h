@@ -4,6 +4,7 @@
 #include <string>
 #include <vector>
 
+#include "platform/PropertyList.h"
 #include "tests/reliability/Invariants.h"
 #include "tests/reliability/World.h"
 
@@ -21,7 +22,15 @@ struct Scenario {
     std::function<std::vector<std::string>(World&)> shortcomings;
     /// Whether the same again, on what a failed run has left, comes to that end.
     bool heals = true;
+    /// What the host wants on the device: the list that `run` stages. Null: it stages none.
+    PropertyList wanted{};
+    /// What the host does after an interruption, where that is not the same again.
+    std::function<void(World&, Invariants&)> resume{};
 };
+
+/// A whole sync that brings the device in step with what is wanted. A host that plans stages what
+/// is left to do of that, and starts the client.
+void sync(World& world, Invariants& invariants, const PropertyList& wanted);
 
 /// Every one of them.
 [[nodiscard]] const std::vector<Scenario>& scenarios();

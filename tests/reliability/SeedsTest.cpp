@@ -13,9 +13,10 @@ namespace {
 
 using testing::IsEmpty;
 
-/// The environment variable that names one seed, and the one that says how many to try.
+/// The environment variable that names one seed; those that say how many to try, from which on.
 constexpr const char* kOneSeed = "APPSYNC_SEED";
 constexpr const char* kManySeeds = "APPSYNC_SEEDS";
+constexpr const char* kFirstSeed = "APPSYNC_FIRST_SEED";
 constexpr std::uint64_t kSeeds = 2000;
 constexpr std::uint64_t kParts = 8;
 
@@ -32,7 +33,8 @@ std::string firstDifference(const std::vector<std::string>& one,
     return one.size() == other.size() ? "" : "one goes on for longer";
 }
 
-void tryOut(std::uint64_t seed) {
+/// How many calls were made to fail.
+std::size_t tryOut(std::uint64_t seed) {
     SCOPED_TRACE(std::string(kOneSeed) + "=" + std::to_string(seed) +
                  " build/release/tests/test_reliability --gtest_filter=Seeds.One");
     RandomSession first(seed);
@@ -40,14 +42,20 @@ void tryOut(std::uint64_t seed) {
     RandomSession second(seed);
     second.run();
     EXPECT_EQ(firstDifference(first.trace(), second.trace()), "");
+    return first.faults();
 }
 
 /// A part of the seeds, so that a long run shows how far it is.
 class ManySeeds : public testing::TestWithParam<std::uint64_t> {};
 
 TEST_P(ManySeeds, KeepTheInvariantsAndRepeatThemselves) {
+    const std::uint64_t first = numberIn(kFirstSeed).value_or(0);
     const std::uint64_t count = numberIn(kManySeeds).value_or(kSeeds);
-    for (std::uint64_t seed = GetParam(); seed < count; seed += kParts) tryOut(seed);
+    std::size_t seeds = 0;
+    std::size_t faults = 0;
+    for (std::uint64_t i = GetParam(); i < count; i += kParts, ++seeds) faults += tryOut(first + i);
+    RecordProperty("seeds", static_cast<int>(seeds));
+    RecordProperty("faults", static_cast<int>(faults));
 }
 
 INSTANTIATE_TEST_SUITE_P(Part, ManySeeds, testing::Range(std::uint64_t{0}, kParts));

@@ -29,6 +29,11 @@ void World::startClient() {
     platform.runUntilIdle();
 }
 
+void World::reopen(const DeviceImage& image) {
+    platform.reopen(image);
+    coordinated = platform.coordination.isEnabled();
+}
+
 void World::settle() { platform.advance(kSettling); }
 
 std::string World::packagePath(const std::string& identifier) {
@@ -42,12 +47,17 @@ PropertyList World::entry(const std::string& identifier, const char* operation) 
                               {kTodoNameKey, "Example"}});
 }
 
-void World::stage(const PropertyList& todoList) {
+void World::stage(const PropertyList& todoList) { stage(todoList, todoList); }
+
+void World::stage(const PropertyList& todoList, const PropertyList& order) {
     const std::string area(kStagingArea);
+    platform.files.remove(area);
     PropertyList layout = PropertyList::array();
+    for (const PropertyList& each : order.elements()) {
+        layout.append(*each.findString(kTodoIdentifierKey));
+    }
     for (const PropertyList& each : todoList.elements()) {
         const std::string& identifier = *each.findString(kTodoIdentifierKey);
-        layout.append(identifier);
         const std::string directory = area + "/" + identifier;
         platform.addPropertyList(directory + "/Info.plist",
                                  PropertyList::map({{"BundleDisplayName", "Shown"}}));

@@ -5,6 +5,7 @@
 #include <vector>
 
 #include "client/AppsClient.h"
+#include "simulation/DeviceImage.h"
 #include "simulation/FaultPlan.h"
 #include "simulation/SimulatedPlatform.h"
 #include "system/PropertyListCodec.h"
@@ -23,6 +24,8 @@ struct World {
 
     /// Starts the daemon that holds the client.
     void startClient();
+    /// Takes over what a crash has left of another world. Before there is a client.
+    void reopen(const DeviceImage& image);
     /// Lets everything that is under way come to its end.
     void settle();
 
@@ -30,6 +33,8 @@ struct World {
     static PropertyList entry(const std::string& identifier, const char* operation);
     /// What the host leaves in the staging area, with the side files of each application.
     void stage(const PropertyList& todoList);
+    /// The same, with the icon layout of another list.
+    void stage(const PropertyList& todoList, const PropertyList& order);
     /// What a backup has brought along.
     void stageRestore(const std::vector<std::string>& identifiers);
     /// The package has come to the device whole.
@@ -39,6 +44,9 @@ struct World {
     SimulatedPlatform platform;
     FaultPlan faults;
     bool coordinated = false;
+    /// Whether the host looks at the device before it stages a list, as the desktop host does;
+    /// otherwise it stages what the scenario wants as it is.
+    bool hostPlans = false;
     std::shared_ptr<AppsClient> client;
 };
 

@@ -57,6 +57,16 @@ TEST(SchedulerTest, WithoutSeedEachTaskRunsUntilItBlocks) {
     EXPECT_EQ(trace, "aabba");
 }
 
+TEST(SchedulerTest, AdvancingPastTheLimitWithWorkDueBehindItIsAFailure) {
+    Scheduler scheduler(Scheduling::runToCompletion());
+    scheduler.setTimeLimit(10s);
+    bool done = false;
+    scheduler.spawnAfter(20s, "late", [&] { done = true; });
+    scheduler.advance(5s);
+    EXPECT_THAT(failureOf([&] { scheduler.advance(30s); }), HasSubstr("limit of 10 s"));
+    EXPECT_FALSE(done);
+}
+
 TEST(SchedulerTest, TimeJumpsToTheNextDelayedTask) {
     Scheduler scheduler(Scheduling::runToCompletion());
     std::vector<SimulatedTime> times;
