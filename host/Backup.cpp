@@ -43,12 +43,7 @@ bool isBackupFile(const std::string& name) {
     if (name == kBackupRestoreInfo || name == kBackupDemotedApps || name == kBackupIconOrder) {
         return true;
     }
-    const std::string prefix = std::string(kBackupData) + "/";
-    constexpr std::string_view kSuffix = ".zip";
-    return name.starts_with(prefix) && name.ends_with(kSuffix) &&
-           name.size() > prefix.size() + kSuffix.size() &&
-           isLegalIdentifier(
-               name.substr(prefix.size(), name.size() - prefix.size() - kSuffix.size()));
+    return identifierOfData(name).has_value();
 }
 
 bool isSum(const std::string& text) {
@@ -99,13 +94,44 @@ bool readApplication(const Json& value, BackupManifest& manifest) {
     return true;
 }
 
-bool readFile(const std::string& name, const Json& value, BackupManifest& manifest) {
+// Why it cannot be used; empty when it can.
+std::string readFile(const std::string& name, const Json& value, BackupManifest& manifest) {
+    if (!isBackupFile(name))
+        return "it names " + printable(name) + ", which is no file of a backup";
     const Json* size = memberOf(value, kSizeKey);
     const auto sum = textAt(value, kSumKey);
-    if (!isBackupFile(name) || size == nullptr || !size->is_number_unsigned()) return false;
-    if (!sum || !isSum(*sum)) return false;
+    if (size == nullptr || !size->is_number_unsigned() || !sum || !isSum(*sum)) {
+        return "its file " + printable(name) + " has no size or no sum";
+    }
     manifest.files[name] = {size->get<std::uint64_t>(), *sum};
-    return true;
+    return "";
+}
+
+bool namesTwice(const std::vector<BackedUpApplication>& applications) {
+    std::set<std::string_view> seen;
+    return std::any_of(applications.begin(), applications.end(),
+                       [&](const auto& each) { return !seen.insert(each.identifier).second; });
+}
+
+// Nothing when it is no JSON, or when an object in it has two members of one name. What lies deeper
+// than anything in a manifest is not kept.
+std::optional<Json> parsedOnce(ByteView text) {
+    constexpr int kDeepest = 8;
+    if (std::ranges::find(text, 0) != text.end()) return std::nullopt;  // the parser's end
+    std::vector<std::set<std::string>> names;  // of the objects around, the innermost last
+    bool isUnique = true;
+    const auto look = [&](int depth, Json::parse_event_t event, Json& value) {
+        if (depth > kDeepest) return false;
+        if (event == Json::parse_event_t::object_start) names.emplace_back();
+        if (event == Json::parse_event_t::object_end) names.pop_back();
+        if (event == Json::parse_event_t::key) {
+            isUnique = names.back().insert(value.get<std::string>()).second && isUnique;
+        }
+        return true;
+    };
+    Json root = Json::parse(text.begin(), text.end(), look, false);
+    if (root.is_discarded() || !isUnique) return std::nullopt;
+    return root;
 }
 
 // Why it cannot be used; empty when it can.
@@ -123,42 +149,104 @@ std::string readInto(const Json& root, BackupManifest& manifest) {
     for (const Json& each : *applications) {
         if (!readApplication(each, manifest)) return "an application in it is not as it should be";
     }
+    if (namesTwice(manifest.applications)) return "it lists an application twice";
     for (const auto& [name, each] : files->items()) {
-        if (!readFile(name, each, manifest)) return "its file " + printable(name) + " has no sum";
+        const std::string defect = readFile(name, each, manifest);
+        if (!defect.empty()) return defect;
     }
     return manifest.holds(kBackupRestoreInfo) ? "" : "it does not name the restore information";
 }
 
-std::optional<BackupFault> checkFile(const std::string& backup, const std::string& name,
-                                     const FileSum& expected) {
-    const fs::path path = fs::path(backup) / name;
+// What is wrong with the kind of a file; empty when it is a regular one.
+std::string wrongKind(const std::string& backup, const std::string& name) {
     std::error_code code;
-    if (!fs::exists(path, code)) return BackupFault{name, "it is missing"};
-    const Result<FileSum> sum = sumOfFile(path.native());
-    if (!sum) return BackupFault{name, sum.error().description()};
-    if (*sum == expected) return std::nullopt;
-    if (sum->size == expected.size) return BackupFault{name, "its contents are altered"};
-    return BackupFault{name, "it is altered: " + std::to_string(sum->size) + " bytes instead of " +
-                                 std::to_string(expected.size)};
+    const fs::path path = fs::path(backup) / name;
+    const fs::path above = path.parent_path();
+    if (name.find('/') != name.npos && fs::is_symlink(above, code)) return "it lies behind a link";
+    switch (fs::symlink_status(path, code).type()) {
+        case fs::file_type::regular:
+            return "";
+        case fs::file_type::not_found:
+            return "it is missing";
+        case fs::file_type::symlink:
+            return "it is a link, not a file";
+        case fs::file_type::none:
+            return code.message();
+        default:
+            return "it is no regular file";
+    }
 }
 
-std::vector<std::string> filesIn(const std::string& backup) {
+// What is wrong with a file; empty when it is what the manifest says.
+std::string defectOf(const std::string& backup, const std::string& name, const FileSum& expected) {
+    const std::string kind = wrongKind(backup, name);
+    if (!kind.empty()) return kind;
+    const fs::path path = fs::path(backup) / name;
+    std::error_code code;
+    const std::uint64_t size = fs::file_size(path, code);
+    if (!code && size != expected.size) {
+        return "it is altered: " + std::to_string(size) + " bytes instead of " +
+               std::to_string(expected.size);
+    }
+    const Result<FileSum> sum = sumOfFile(path.native());
+    if (!sum) return sum.error().description();
+    return *sum == expected ? "" : "its contents are altered";
+}
+
+using Defects = std::map<std::string, std::string>;  // by file
+
+void addFileDefects(const std::string& backup, const BackupManifest& manifest, Defects& defects) {
+    for (const auto& [name, sum] : manifest.files) {
+        const std::string defect = defectOf(backup, name, sum);
+        if (!defect.empty()) defects.emplace(name, defect);
+    }
+}
+
+// Where the manifest does not agree with itself.
+void addDisagreements(const BackupManifest& manifest, Defects& defects) {
+    for (const std::string_view list : {kBackupDemotedApps, kBackupIconOrder}) {
+        if (!manifest.holds(list)) defects.emplace(list, "the manifest has no sum of it");
+    }
+    std::set<std::string> archives;
+    for (const BackedUpApplication& each : manifest.applications) {
+        if (!each.hasData) continue;
+        const std::string name = dataArchiveName(each.identifier);
+        archives.insert(name);
+        if (!manifest.holds(name)) defects.emplace(name, "the manifest has no sum of it");
+    }
+    for (const auto& [name, sum] : manifest.files) {
+        if (!name.starts_with(kBackupData) || archives.contains(name)) continue;
+        defects.emplace(name, "no application of the manifest says that it has data");
+    }
+}
+
+// All that is there, except for the folder of archives itself.
+std::vector<std::string> itemsIn(const std::string& backup) {
     std::vector<std::string> names;
     std::error_code code;
-    fs::recursive_directory_iterator place(backup, code);
+    // What may not be read cannot be surplus, and its files are found missing.
+    constexpr auto kOptions = fs::directory_options::skip_permission_denied;
+    fs::recursive_directory_iterator place(backup, kOptions, code);
     for (; !code && place != fs::recursive_directory_iterator(); place.increment(code)) {
         std::error_code ignored;
-        if (place->is_directory(ignored) && !place->is_symlink(ignored)) continue;
-        names.push_back(place->path().lexically_relative(backup).native());
+        const std::string name = place->path().lexically_relative(backup).native();
+        const bool isFolder = place->is_directory(ignored) && !place->is_symlink(ignored);
+        if (!isFolder || name != kBackupData) names.push_back(name);
     }
-    std::sort(names.begin(), names.end());
     return names;
 }
 
 }  // namespace
 
 std::string dataArchiveName(const std::string& identifier) {
-    return std::string(kBackupData) + "/" + identifier + ".zip";
+    return std::string(kBackupData) + "/" + archiveNameOf(identifier);
+}
+
+std::optional<std::string> identifierOfData(std::string_view file) {
+    if (!file.starts_with(kBackupData)) return std::nullopt;
+    file.remove_prefix(kBackupData.size());
+    if (!file.starts_with('/')) return std::nullopt;
+    return identifierOfArchive(file.substr(1));
 }
 
 Result<BackupManifest> readBackupManifest(const std::string& backup) {
@@ -167,35 +255,49 @@ Result<BackupManifest> readBackupManifest(const std::string& backup) {
         return unusable("there is no backup " + backup, "name the folder that appsync backup made");
     }
     const std::string path = (fs::path(backup) / kBackupManifest).native();
-    if (!fs::exists(path, code)) {
+    const fs::file_status found = fs::symlink_status(path, code);
+    if (found.type() == fs::file_type::none) {
+        return unusable("cannot read the backup " + backup + ": " + code.message(),
+                        "make it readable");
+    }
+    if (!fs::exists(found)) {
         return unusable("the backup " + backup + " has no " + std::string(kBackupManifest) +
                             ": it was cut off, or it is no backup",
                         "make a new one with appsync backup");
     }
+    const std::string kind = wrongKind(backup, std::string(kBackupManifest));
+    if (!kind.empty()) return damaged(path, kind);
     const Result<Bytes> bytes = readHostFile(path, kLargestManifest);
-    if (!bytes) return unusable(bytes.error().description(), "make it readable");
-    const Json root = Json::parse(bytes->begin(), bytes->end(), nullptr, false);
-    if (root.is_discarded()) return damaged(path, "it is not JSON");
+    if (!bytes) return unusable(bytes.error());
+    return parseBackupManifest(*bytes, path);
+}
+
+Result<BackupManifest> parseBackupManifest(ByteView text, const std::string& path) {
+    const std::optional<Json> root = parsedOnce(text);
+    if (!root) return damaged(path, "it is not JSON, or names something twice");
     BackupManifest manifest;
-    const std::string defect = readInto(root, manifest);
+    const std::string defect = readInto(*root, manifest);
     if (!defect.empty()) return damaged(path, defect);
     return manifest;
 }
 
-Status writeBackupManifest(const std::string& backup, const BackupManifest& manifest) {
+Bytes manifestText(const BackupManifest& manifest) {
     const std::string text = indented(jsonOf(manifest)) + "\n";
-    const Bytes bytes(text.begin(), text.end());
-    return writeHostFile((fs::path(backup) / kBackupManifest).native(), bytes);
+    return {text.begin(), text.end()};
 }
 
 std::vector<BackupFault> checkBackup(const std::string& backup, const BackupManifest& manifest) {
-    std::vector<BackupFault> faults;
-    for (const auto& [name, sum] : manifest.files) {
-        if (auto fault = checkFile(backup, name, sum)) faults.push_back(*std::move(fault));
-    }
-    for (const std::string& name : filesIn(backup)) {
+    Defects defects;
+    addFileDefects(backup, manifest, defects);
+    addDisagreements(manifest, defects);
+    std::set<std::string> surplus;
+    for (const std::string& name : itemsIn(backup)) {
         if (name == kBackupManifest || manifest.holds(name)) continue;
-        faults.push_back({name, "the manifest does not name it"});
+        if (defects.emplace(name, "the manifest does not name it").second) surplus.insert(name);
+    }
+    std::vector<BackupFault> faults;
+    for (const auto& [name, defect] : defects) {
+        faults.push_back({name, defect, surplus.contains(name)});
     }
     return faults;
 }

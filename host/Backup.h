@@ -7,6 +7,7 @@
 #include <vector>
 
 #include "host/Checksum.h"
+#include "platform/Bytes.h"
 #include "platform/Result.h"
 
 namespace appsync {
@@ -41,19 +42,29 @@ struct BackupManifest {
 struct BackupFault {
     std::string file;
     std::string error;
+    /// The manifest does not know the file, so a restore does not miss it.
+    bool isSurplus = false;
 };
 
 /// The name of an application's archive, relative to the folder.
 [[nodiscard]] std::string dataArchiveName(const std::string& identifier);
 
+/// Whose archive the file is; nothing when it is none.
+[[nodiscard]] std::optional<std::string> identifierOfData(std::string_view file);
+
 /// Reads the manifest. Without a good one, a folder is no backup that can be used: the error says
 /// which it is, none or a damaged one.
 [[nodiscard]] Result<BackupManifest> readBackupManifest(const std::string& backup);
 
-/// Writes the manifest: the folder is a whole backup from now on.
-[[nodiscard]] Status writeBackupManifest(const std::string& backup, const BackupManifest& manifest);
+/// Reads what the manifest at a path holds.
+[[nodiscard]] Result<BackupManifest> parseBackupManifest(ByteView text, const std::string& path);
 
-/// Compares every file with its sum. Files that the manifest does not name are faults, too.
+/// The manifest as it stands in its file.
+[[nodiscard]] Bytes manifestText(const BackupManifest& manifest);
+
+/// Compares every file with its sum, and the parts of the manifest with each other. Files that the
+/// manifest does not name are faults, too. One fault a file, sorted by its name; a link is a fault
+/// wherever it leads.
 [[nodiscard]] std::vector<BackupFault> checkBackup(const std::string& backup,
                                                    const BackupManifest& manifest);
 

@@ -3,6 +3,7 @@
 #include <unistd.h>
 
 #include <algorithm>
+#include <array>
 #include <cerrno>
 #include <chrono>
 #include <cmath>
@@ -21,6 +22,7 @@
 #include "device/Device.h"
 #include "device/IconDrawing.h"
 #include "host/Backup.h"
+#include "host/BackupFolder.h"
 #include "host/Commands.h"
 #include "host/Console.h"
 #include "host/HostFile.h"
@@ -44,6 +46,7 @@ namespace fs = std::filesystem;
 using Json = nlohmann::ordered_json;
 using Clock = std::chrono::steady_clock;
 
+constexpr const char* kWholeBackup = "backup";  // in place of an identifier
 constexpr std::string_view kMetadataName = "/VessikMetadata.plist";
 constexpr std::string_view kPngSignature = "\x89PNG\r\n\x1a\n";
 
@@ -72,31 +75,28 @@ bool isPng(ByteView bytes) {
                       [](char a, std::uint8_t b) { return static_cast<std::uint8_t>(a) == b; });
 }
 
-Status makeFolder(const std::string& backup) {
-    if (::mkdir(backup.c_str(), 0777) == 0) return {};
-    const int error = errno;
-    std::error_code code;
-    if (error != EEXIST) {
-        return failure(
-            "cannot make the folder " + backup + ": " + std::generic_category().message(error),
-            "name a folder that can be made");
-    }
-    if (fs::is_directory(backup, code) && fs::is_empty(backup, code) && !code) return {};
-    return failure(backup + " exists and is not an empty folder",
-                   "name a folder that does not exist");
+// Whether it is the data that cannot be read, not the archive that cannot be written.
+bool isOfSource(const ErrorRecord& error) {
+    constexpr std::array<std::int64_t, 5> kCodes = {EACCES, EPERM, ENOENT, ENOTDIR, ELOOP};
+    return error.domain == kPosixErrorDomain &&
+           std::find(kCodes.begin(), kCodes.end(), error.code) != kCodes.end();
 }
 
-// Puts everything that was written into the folder on disk.
-Status makeDurable(const std::string& folder) {
-    const UniqueFd opened(::open(folder.c_str(), O_RDONLY | O_DIRECTORY | O_CLOEXEC));
-    if (opened && ::syncfs(opened.get()) == 0) return {};
-    return systemError(errno, "cannot make " + folder + " durable");
+// A backup in there would be part of what it backs up.
+Status checkPlace(const Device& device, const std::string& backup) {
+    std::error_code code;
+    const fs::path folder = fs::weakly_canonical(backup, code);
+    const fs::path inside = folder.lexically_relative(fs::weakly_canonical(device.path(), code));
+    if (code || inside.empty() || *inside.begin() == "..") return {};
+    return unusable(backup + " lies in the device that is to be backed up",
+                    "name a folder outside of it");
 }
 
 // One backup in the making.
 class BackupMaking {
   public:
-    BackupMaking(Device& device, const std::string& backup) : device_(device), backup_(backup) {}
+    BackupMaking(Device& device, BackupFolder& folder)
+        : device_(device), folder_(folder), backup_(folder.path()) {}
 
     Result<BackupResult> run() {
         Status status = gather();
@@ -104,10 +104,8 @@ class BackupMaking {
         if (status) status = writeDemotedApps();
         if (status) status = writeIconOrder();
         if (status) status = writeData();
-        if (status) status = makeDurable(backup_);
         result_.manifest.made = formatTime(std::chrono::system_clock::now());
-        if (status) status = writeBackupManifest(backup_, result_.manifest);
-        if (status) status = makeDurable(backup_);
+        if (status) status = folder_.finish(manifestText(result_.manifest));
         if (!status) return status.error();
         for (const auto& [name, sum] : result_.manifest.files) result_.bytes += sum.size;
         return std::move(result_);
@@ -122,9 +120,9 @@ class BackupMaking {
             if (!isForBackup(record) || !seen.insert(record.identifier).second) continue;
             records_.push_back(std::move(record));
         }
-        const Result<std::vector<HomeScreenItem>> screen = device_.homeScreen();
-        if (!screen) return screen.error();
-        for (const HomeScreenItem& item : *screen) order_.push_back(item.identifier);
+        const Result<std::vector<ApplicationRecord>> shown = device_.homeScreenApplications();
+        if (!shown) return shown.error();
+        for (const ApplicationRecord& record : *shown) order_.push_back(record.identifier);
         Result<std::map<std::string, Bytes>> sinfs = device_.sinfData();
         if (!sinfs) return sinfs.error();
         sinfs_ = *std::move(sinfs);
@@ -205,7 +203,7 @@ class BackupMaking {
 
     Status writeData() {
         if (::mkdir(pathOf(kBackupData).c_str(), 0777) != 0) {
-            return systemError(errno, "cannot make " + pathOf(kBackupData));
+            return cannotWriteFile(errno, pathOf(kBackupData));
         }
         for (BackedUpApplication& application : result_.manifest.applications) {
             if (Status status = archive(application); !status) return status;
@@ -217,21 +215,38 @@ class BackupMaking {
     Status archive(BackedUpApplication& application) {
         const std::string& identifier = application.identifier;
         const std::string name = dataArchiveName(identifier);
+        const std::string directory = Device::dataPath(identifier);
+        const Result<UniqueFd> readable = device_.root().openDirectory(directory, "read");
+        if (!readable && readable.error().code != ENOENT) {
+            leaveOut(identifier, readable.error().description());
+            return {};
+        }
         Result<DataArchiveContents> contents =
-            writeDataArchive(device_.root(), Device::dataPath(identifier), pathOf(name));
+            writeDataArchive(device_.root(), directory, pathOf(name));
+        if (!contents && isOfSource(contents.error())) {
+            ::unlink(pathOf(name).c_str());
+            leaveOut(identifier, contents.error().description());
+            return {};
+        }
         if (!contents) return contents.error().withContext("the data of " + identifier);
         for (std::string& reason : contents->leftOut) {
-            result_.leftOut.push_back({identifier, "left out of its data: " + std::move(reason)});
+            leaveOut(identifier, reason);
         }
         application.hasData = contents->entries > 0;
         if (!application.hasData) {
             const Result<bool> copied = copyWaitingData(identifier, name);
             if (!copied) return copied.error();
             application.hasData = *copied;
-        } else if (Status usable = checkDataArchive(pathOf(name)); !usable) {
-            return usable;
+        } else if (const Status usable = checkDataArchive(pathOf(name)); !usable) {
+            leaveOut(identifier, usable.error().description());
+            application.hasData = false;
+            ::unlink(pathOf(name).c_str());
         }
         return application.hasData ? note(name) : Status();
+    }
+
+    void leaveOut(const std::string& identifier, const std::string& reason) {
+        result_.leftOut.push_back({identifier, "left out of its data: " + reason});
     }
 
     Result<bool> copyWaitingData(const std::string& identifier, const std::string& name) {
@@ -243,9 +258,9 @@ class BackupMaking {
         }
         const std::string path = pathOf(name);
         const UniqueFd copy(::open(path.c_str(), O_WRONLY | O_CREAT | O_EXCL | O_CLOEXEC, 0666));
-        if (!copy) return systemError(errno, "cannot write " + path);
+        if (!copy) return cannotWriteFile(errno, path);
         const int error = copyWhole(waiting->descriptor.get(), copy.get());
-        if (error != 0) return systemError(error, "cannot write " + path);
+        if (error != 0) return cannotWriteFile(error, path);
         return true;
     }
 
@@ -261,6 +276,7 @@ class BackupMaking {
     }
 
     Device& device_;
+    BackupFolder& folder_;
     const std::string backup_;
     std::vector<ApplicationRecord> records_;
     std::vector<std::string> order_;
@@ -287,25 +303,44 @@ void printBackup(const BackupResult& result, double seconds, const Console& cons
                 << " s\n";
 }
 
-void printBackupJson(const BackupResult& result, double seconds, const Console& console) {
+std::string jsonText(const BackupResult& result, const std::vector<BackupFault>& failed,
+                     double seconds) {
     Json applications = Json::array();
     Json data = Json::array();
     for (const BackedUpApplication& each : result.manifest.applications) {
         applications.push_back(each.identifier);
         if (each.hasData) data.push_back(each.identifier);
     }
-    console.out << indented({{"applications", std::move(applications)},
-                             {"demoted", result.demoted},
-                             {"data", std::move(data)},
-                             {"leftOut", jsonOf(result.leftOut, "identifier")},
-                             {"bytes", result.bytes},
-                             {"seconds", seconds}})
-                << '\n';
+    return indented({{"applications", std::move(applications)},
+                     {"demoted", result.demoted},
+                     {"data", std::move(data)},
+                     {"leftOut", jsonOf(result.leftOut, "identifier")},
+                     {"failed", jsonOf(failed, "identifier")},
+                     {"bytes", result.bytes},
+                     {"seconds", seconds}});
+}
+
+void printBackupJson(const BackupResult& result, double seconds, const Console& console) {
+    console.out << jsonText(result, {}, seconds) << '\n';
+}
+
+const char* whatToDoWith(const BackupFault& fault) {
+    return fault.isSurplus ? "; remove it if nobody needs it"
+                           : "; use another backup, or make a new one";
 }
 
 ErrorRecord unfinished(const std::string& backup, const ErrorRecord& cause) {
     return failure("the backup " + backup + " is not whole: " + cause.description(),
-                   "remove the folder, and back up again");
+                   "mend that and back up again, or remove the folder");
+}
+
+// The backup as a whole is what failed.
+int failWhole(const BackupArguments& arguments, const ErrorRecord& error, const Console& console) {
+    if (arguments.asJson) {
+        const BackupFault whole{kWholeBackup, error.description()};
+        console.out << jsonText(BackupResult(), {whole}, 0) << '\n';
+    }
+    return console.fail(error);
 }
 
 }  // namespace
@@ -317,10 +352,16 @@ int runBackup(const BackupArguments& arguments, const Console& console) {
     if (!device) return console.fail(device.error());
     const Result<std::unique_ptr<PlugIn>> plugIn = PlugIn::load(**device);
     if (!plugIn) return console.fail(plugIn.error());
-    if (const Status made = makeFolder(arguments.backup); !made) return console.fail(made.error());
+    if (const Status good = checkPlace(**device, arguments.backup); !good) {
+        return console.fail(good.error());
+    }
+    Result<BackupFolder> folder = BackupFolder::make(arguments.backup);
+    if (!folder) return console.fail(unusable(folder.error()));
     (*plugIn)->client().prepareForBackup();
-    const Result<BackupResult> result = BackupMaking(**device, arguments.backup).run();
-    if (!result) return console.fail(unfinished(arguments.backup, result.error()));
+    const Result<BackupResult> result = BackupMaking(**device, *folder).run();
+    if (!result) {
+        return failWhole(arguments, unfinished(arguments.backup, result.error()), console);
+    }
     const double seconds = std::chrono::duration<double>(Clock::now() - begin).count();
     for (const BackupFault& each : result->leftOut) {
         console.complain(each.file + ": " + each.error);
@@ -337,7 +378,9 @@ int runBackupCheck(const std::string& backup, bool asJson, const Console& consol
         manifest ? checkBackup(backup, *manifest)
                  : std::vector<BackupFault>{
                        {std::string(kBackupManifest), manifest.error().description()}};
-    for (const BackupFault& fault : faults) console.complain(fault.file + ": " + fault.error);
+    for (const BackupFault& fault : faults) {
+        console.complain(fault.file + ": " + fault.error + (manifest ? whatToDoWith(fault) : ""));
+    }
     if (asJson) {
         console.out << indented({{"whole", faults.empty()}, {"faults", jsonOf(faults, "file")}})
                     << '\n';

@@ -12,7 +12,7 @@
 namespace appsync {
 namespace {
 
-constexpr std::size_t kPieceBytes = std::size_t{256} << 10U;
+constexpr std::size_t kHashedAtOnce = std::size_t{256} << 10U;
 
 struct ContextDeleter {
     void operator()(EVP_MD_CTX* context) const noexcept { ::EVP_MD_CTX_free(context); }
@@ -43,7 +43,7 @@ Result<FileSum> sumOfFile(const std::string& path) {
         return cannotSum(path);
     }
     FileSum sum;
-    Bytes piece(kPieceBytes);
+    Bytes piece(kHashedAtOnce);
     for (;;) {
         const Result<std::size_t> count = file->read(piece);
         if (!count) return count.error().withContext(path);

@@ -1,10 +1,15 @@
 #include "host/CommandLine.h"
 
 #include <algorithm>
+#include <charconv>
+#include <cstdint>
 #include <functional>
 #include <map>
 #include <memory>
+#include <optional>
 #include <ostream>
+#include <string_view>
+#include <system_error>
 #include <utility>
 
 #include <CLI/CLI.hpp>
@@ -31,6 +36,13 @@ CLI::Validator oneOf(const std::vector<std::string>& words) {
                 return isKnown ? std::string() : given + " is none of " + listed;
             },
             ""};
+}
+
+std::optional<std::int64_t> wholeNumber(std::string_view text) {
+    std::int64_t number = 0;
+    const auto [end, error] = std::from_chars(text.data(), text.data() + text.size(), number);
+    if (error != std::errc() || end != text.data() + text.size()) return std::nullopt;
+    return number;
 }
 
 // Declares the commands and remembers which one was chosen. The values that options are parsed into
@@ -364,9 +376,15 @@ class Commands {
         added.add_option("DEVICE", values->device, "the device's directory")->required();
         added.add_option("BACKUP", values->backup, "the folder that backup made")->required();
         added
-            .add_option("--type", values->type,
-                        "the kind of restore; 2 and 3 bring applications back (default 2)")
-            ->type_name("N");
+            .add_option_function<std::string>(
+                "--type", [values](const std::string& text) { values->type = *wholeNumber(text); },
+                "the kind of restore; 2 and 3 bring applications back (default 2)")
+            ->type_name("N")
+            ->check(CLI::Validator(
+                [](const std::string& given) {
+                    return wholeNumber(given) ? "" : "'" + given + "' is no whole number";
+                },
+                ""));
         added.add_flag("--json", values->asJson, "print JSON");
     }
 

@@ -19,17 +19,17 @@ namespace {
 
 Status checkIdentifier(const std::string& identifier) {
     if (isLegalIdentifier(identifier)) return {};
-    return wrongUsage(printable(identifier) + " is not an identifier",
+    return wrongUsage((identifier.empty() ? "''" : identifier) + " is not an identifier",
                       "give one as appsync apps shows it");
 }
 
 // Does something to one application of a device and says that it is done.
 template <typename Action>
-int actOn(const std::string& path, const std::string& identifier, DeviceAccess access,
+int actOn(const std::string& path, const std::string& identifier, const DeviceOpenOptions& options,
           std::string_view done, const Console& console, Action action) {
     const Status checked = checkIdentifier(identifier);
     if (!checked) return console.fail(checked.error());
-    const Result<std::unique_ptr<Device>> device = openDevice(path, access);
+    const Result<std::unique_ptr<Device>> device = openDevice(path, options);
     if (!device) return console.fail(device.error());
     const Status status = action(**device);
     if (const auto broken = (*device)->databaseFailure()) return console.fail(unusable(*broken));
@@ -80,6 +80,10 @@ Result<DeviceSettingsChange> parseAssignments(const std::vector<std::string>& as
 }  // namespace
 
 int runCreate(const std::string& device, bool coordination, const Console& console) {
+    if (device.empty()) {
+        return console.fail(wrongUsage("cannot create a device at ''",
+                                       "it is no path of a directory; give that of a new one"));
+    }
     const Status created = Device::create(device, {coordination});
     if (!created) return console.fail(unusable(created.error()));
     console.out << printable(device) << " is an empty device\n";
@@ -98,29 +102,31 @@ int runSet(const std::string& device, const std::vector<std::string>& assignment
 }
 
 int runRun(const std::string& device, const std::string& identifier, const Console& console) {
-    return actOn(device, identifier, DeviceAccess::Look, "runs", console,
+    return actOn(device, identifier, {}, "runs", console,
                  [&](Device& opened) { return opened.run(identifier); });
 }
 
 int runQuit(const std::string& device, const std::string& identifier, const Console& console) {
-    return actOn(device, identifier, DeviceAccess::Look, "does not run any more", console,
+    return actOn(device, identifier, {}, "does not run any more", console,
                  [&](Device& opened) { return opened.quit(identifier); });
 }
 
 int runUninstall(const std::string& device, const std::string& identifier, const Console& console) {
-    return actOn(device, identifier, DeviceAccess::Look, "is uninstalled", console,
+    return actOn(device, identifier, {.makesRoom = true}, "is uninstalled", console,
                  [&](Device& opened) { return opened.uninstall(identifier); });
 }
 
 int runDemote(const std::string& device, const std::string& identifier, bool bySystem,
               const Console& console) {
     const DemotedBy by = bySystem ? DemotedBy::System : DemotedBy::Person;
-    return actOn(device, identifier, DeviceAccess::Session, "is offloaded", console,
+    const DeviceOpenOptions options{.access = DeviceAccess::Session, .makesRoom = true};
+    return actOn(device, identifier, options, "is offloaded", console,
                  [&](Device& opened) { return opened.demote(identifier, by); });
 }
 
 int runReset(const std::string& device, const Console& console) {
-    const Result<std::unique_ptr<Device>> opened = openDevice(device, DeviceAccess::Session);
+    const Result<std::unique_ptr<Device>> opened =
+        openDevice(device, {.access = DeviceAccess::Session, .makesRoom = true});
     if (!opened) return console.fail(opened.error());
     const Result<std::unique_ptr<PlugIn>> plugIn = PlugIn::load(**opened);
     if (!plugIn) return console.fail(plugIn.error());

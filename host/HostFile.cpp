@@ -15,14 +15,32 @@ ErrorRecord systemError(int errorNumber, const std::string& what) {
     return ErrorRecord::make(kPosixErrorDomain, errorNumber, what + ": " + text);
 }
 
+namespace {
+
+ErrorRecord advised(const ErrorRecord& error, const char* advice) {
+    return ErrorRecord::make(error.domain, error.code, error.description() + "; " + advice);
+}
+
+}  // namespace
+
+ErrorRecord cannotWriteFile(int errorNumber, const std::string& path) {
+    const bool isFull = errorNumber == ENOSPC || errorNumber == EDQUOT;
+    return advised(systemError(errorNumber, "cannot write " + path),
+                   isFull ? "free space there, and run it again"
+                          : "name a file in a directory that can be written");
+}
+
 Result<HostFile> HostFile::open(const std::string& path) {
     const int descriptor = ::open(path.c_str(), O_RDONLY | O_CLOEXEC | O_NONBLOCK);
-    if (descriptor < 0) return systemError(errno, "cannot open " + path);
+    if (descriptor < 0) {
+        return advised(systemError(errno, "cannot open " + path), "name a file that can be read");
+    }
     HostFile file(descriptor, 0);
     struct stat attributes {};
     if (::fstat(descriptor, &attributes) != 0) return systemError(errno, "cannot look at " + path);
     if (!S_ISREG(attributes.st_mode)) {
-        return ErrorRecord::make(kPosixErrorDomain, EINVAL, path + " is not a regular file");
+        return ErrorRecord::make(kPosixErrorDomain, EINVAL,
+                                 path + " is not a regular file; name one that is");
     }
     file.size_ = static_cast<std::uint64_t>(attributes.st_size);
     return file;
@@ -59,7 +77,7 @@ Result<Bytes> readHostFile(const std::string& path, std::uint64_t maximumBytes) 
     }
     if (length == contents.size()) {
         return ErrorRecord::make(kPosixErrorDomain, EFBIG,
-                                 path + " is too large, or grows while it is read");
+                                 path + " is too large, or grows while it is read; see what it is");
     }
     contents.resize(length);
     return contents;
@@ -74,10 +92,10 @@ Status writeAndClose(int descriptor, const std::string& path, ByteView contents)
         if (count >= 0) {
             contents = contents.subspan(static_cast<std::size_t>(count));
         } else if (errno != EINTR) {
-            status = systemError(errno, "cannot write " + path);
+            status = cannotWriteFile(errno, path);
         }
     }
-    if (::close(descriptor) != 0 && status) status = systemError(errno, "cannot write " + path);
+    if (::close(descriptor) != 0 && status) status = cannotWriteFile(errno, path);
     return status;
 }
 
@@ -94,11 +112,11 @@ Status writeHostFile(const std::string& path, ByteView contents) {
     const std::string target = isDirect ? path : path + "." + std::to_string(::getpid()) + ".new";
     const int descriptor =
         ::open(target.c_str(), O_WRONLY | O_CREAT | O_CLOEXEC | (isDirect ? 0 : O_EXCL), 0666);
-    if (descriptor < 0) return systemError(errno, "cannot write " + path);
+    if (descriptor < 0) return cannotWriteFile(errno, path);
     Status status = writeAndClose(descriptor, path, contents);
     if (isDirect) return status;
     if (status && ::rename(target.c_str(), path.c_str()) != 0) {
-        status = systemError(errno, "cannot write " + path);
+        status = cannotWriteFile(errno, path);
     }
     if (!status) ::unlink(target.c_str());
     return status;

@@ -39,6 +39,9 @@ class HostFile {
 /// Creates or replaces a file of this machine, whole: on failure the old one stays.
 [[nodiscard]] Status writeHostFile(const std::string& path, ByteView contents);
 
+/// That a file of this machine cannot be written, and what to do about it.
+[[nodiscard]] ErrorRecord cannotWriteFile(int errorNumber, const std::string& path);
+
 /// The error of the failed call that `errorNumber` stands for: "`what`: the system's text".
 [[nodiscard]] ErrorRecord systemError(int errorNumber, const std::string& what);
 

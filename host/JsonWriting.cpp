@@ -4,14 +4,12 @@
 
 namespace appsync {
 
-using Json = nlohmann::ordered_json;
-
-std::string dumped(const Json& value) {
-    return value.dump(-1, ' ', false, Json::error_handler_t::replace);
+std::string dumped(const nlohmann::ordered_json& value) {
+    return value.dump(-1, ' ', false, nlohmann::ordered_json::error_handler_t::replace);
 }
 
-std::string indented(const Json& value) {
-    return value.dump(2, ' ', false, Json::error_handler_t::replace);
+std::string indented(const nlohmann::ordered_json& value) {
+    return value.dump(2, ' ', false, nlohmann::ordered_json::error_handler_t::replace);
 }
 
 }  // namespace appsync

@@ -11,6 +11,7 @@
 #include "device/PackageReader.h"
 #include "host/HostFile.h"
 #include "host/Problem.h"
+#include "host/SyncDaemon.h"
 #include "platform/PropertyListSerialization.h"
 
 namespace appsync {
@@ -97,6 +98,30 @@ void addPackage(const PackageReader& package, const std::string& name, const std
 }
 
 }  // namespace
+
+Result<std::string> packageFileFor(const Library& library, const std::string& identifier) {
+    if (const LibraryPackage* package = library.find(identifier)) return package->file;
+    std::string file = library.folder + "/" + identifier + ".zip";
+    std::error_code code;
+    if (std::filesystem::exists(file, code)) return file;
+    return ErrorRecord::make(
+        kTransferErrorDomain, kTransferNoPackage,
+        "the library has no package of " + identifier + ": put one into " + library.folder);
+}
+
+Result<LibraryPackage> packageFor(const Library& library, const std::string& identifier,
+                                  PropertyListSerialization& propertyLists) {
+    if (const LibraryPackage* known = library.find(identifier)) return *known;
+    Result<std::string> file = packageFileFor(library, identifier);
+    if (!file) return file.error();
+    const Result<PackageReader> package = PackageReader::open(*file, propertyLists);
+    if (!package) return package.error();
+    if (package->info().identifier != identifier) {
+        return failure(*file + " is a package of " + package->info().identifier,
+                       "put one of " + identifier + " in its place");
+    }
+    return packageOf(package->info(), *std::move(file));
+}
 
 std::uint64_t bytesOnDevice(const PackageInfo& info) {
     return info.unpackedBytes + info.entryCount * kBlockBytes;  // each file fills its last block

@@ -20,6 +20,16 @@ inline constexpr std::string_view kIconOrderFile = "IconOrder.plist";
 [[nodiscard]] Result<Library> readLibrary(const std::string& folder,
                                           PropertyListSerialization& propertyLists);
 
+/// The file that a session sends for an identifier: the library's package of it, else the file
+/// ID.zip, which the device then judges.
+[[nodiscard]] Result<std::string> packageFileFor(const Library& library,
+                                                 const std::string& identifier);
+
+/// The package in that file, or why the device cannot take it.
+[[nodiscard]] Result<LibraryPackage> packageFor(const Library& library,
+                                                const std::string& identifier,
+                                                PropertyListSerialization& propertyLists);
+
 /// Bytes that the application of a package takes on a device, unpacked.
 [[nodiscard]] std::uint64_t bytesOnDevice(const PackageInfo& info);
 

@@ -1,9 +1,11 @@
 #include <array>
 #include <chrono>
+#include <filesystem>
 #include <fstream>
 #include <ostream>
 #include <string>
 #include <string_view>
+#include <system_error>
 #include <thread>
 
 #include <nlohmann/json.hpp>
@@ -38,7 +40,7 @@ std::size_t severityOf(std::string_view name) {
     return rank;
 }
 
-std::string textAt(const Json& line, const char* key) {
+std::string textOf(const Json& line, const char* key) {
     const auto found = line.find(key);
     return found != line.end() && found->is_string() ? found->get<std::string>() : std::string();
 }
@@ -49,7 +51,7 @@ bool isWanted(const Json& line, const LogArguments& arguments) {
         if (category == line.end() || !category->is_number_integer()) return false;
         if (category->get<std::int64_t>() != *arguments.category) return false;
     }
-    return !arguments.level || severityOf(textAt(line, "level")) >= severityOf(*arguments.level);
+    return !arguments.level || severityOf(textOf(line, "level")) >= severityOf(*arguments.level);
 }
 
 void showLine(const std::string& text, const LogArguments& arguments, const Console& console) {
@@ -61,10 +63,11 @@ void showLine(const std::string& text, const LogArguments& arguments, const Cons
         return;
     }
     const auto category = line.find("category");
-    const std::string number = category != line.end() ? category->dump() : "-";
-    console.out << printable(textAt(line, "time")) << ' '
-                << fitted(printable(textAt(line, "level")), 7) << ' '
-                << fitted(printable(number), 2) << ' ' << printable(textAt(line, "message"))
+    const bool hasNumber = category != line.end() && category->is_number_integer();
+    const std::string number = hasNumber ? category->dump() : "-";
+    console.out << printable(textOf(line, "time")) << ' '
+                << fitted(printable(textOf(line, "level")), 7) << ' '
+                << fitted(printable(number), 2) << ' ' << printable(textOf(line, "message"))
                 << '\n';
 }
 
@@ -85,8 +88,11 @@ void showWhatIsThere(std::ifstream& file, std::string& begun, const LogArguments
 void follow(const std::string& path, const LogArguments& arguments, const Console& console) {
     std::ifstream file;
     std::string begun;
+    std::error_code ignored;
     do {
-        if (!file.is_open()) file.open(path, std::ios::binary);
+        // A pipe in its place would be waited on.
+        const bool isThere = file.is_open() || std::filesystem::is_regular_file(path, ignored);
+        if (isThere && !file.is_open()) file.open(path, std::ios::binary);
         if (file.is_open()) showWhatIsThere(file, begun, arguments, console);
         if (arguments.follows) std::this_thread::sleep_for(kFollowInterval);
     } while (arguments.follows && console.out.good());
@@ -95,9 +101,11 @@ void follow(const std::string& path, const LogArguments& arguments, const Consol
 }  // namespace
 
 int runLog(const LogArguments& arguments, const Console& console) {
-    const Result<std::unique_ptr<Device>> device = openDevice(arguments.device, DeviceAccess::Look);
+    Result<std::unique_ptr<Device>> device = openDevice(arguments.device, DeviceAccess::Look);
     if (!device) return console.fail(device.error());
-    follow((*device)->logPath(), arguments, console);
+    const std::string path = (*device)->logPath();
+    device->reset();  // whoever watches the log has no use for the database
+    follow(path, arguments, console);
     return kExitDone;
 }
 

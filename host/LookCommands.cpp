@@ -121,7 +121,8 @@ int runWhy(const std::string& device, const std::string& identifier, bool asJson
            const Console& console) {
     if (!isLegalIdentifier(identifier)) {
         return console.fail(
-            wrongUsage(identifier + " is not an identifier", "give one as appsync apps shows it"));
+            wrongUsage((identifier.empty() ? "''" : identifier) + " is not an identifier",
+                       "give one as appsync apps shows it"));
     }
     return lookAt(device, console, [&](Device& opened) -> Status {
         const Result<ApplicationStatus> status = opened.status(identifier);

@@ -6,8 +6,11 @@
 namespace appsync {
 
 Result<std::unique_ptr<Device>> openDevice(const std::string& path, DeviceAccess access) {
-    DeviceOpenOptions options;
-    options.access = access;
+    return openDevice(path, {.access = access});
+}
+
+Result<std::unique_ptr<Device>> openDevice(const std::string& path,
+                                           const DeviceOpenOptions& options) {
     Result<std::unique_ptr<Device>> device = Device::open(path, options);
     if (!device) return unusable(device.error());
     return device;

@@ -12,6 +12,10 @@ namespace appsync {
 [[nodiscard]] Result<std::unique_ptr<Device>> openDevice(const std::string& path,
                                                          DeviceAccess access);
 
+/// The same with all that there is to say.
+[[nodiscard]] Result<std::unique_ptr<Device>> openDevice(const std::string& path,
+                                                         const DeviceOpenOptions& options);
+
 /// The error of an operation on a device: when it tells that the device itself cannot be used, one
 /// with that exit status; else as it is.
 [[nodiscard]] ErrorRecord classified(const ErrorRecord& error);

@@ -6,6 +6,8 @@
 #include <algorithm>
 #include <cerrno>
 #include <span>
+#include <string_view>
+#include <utility>
 
 #include "device/Device.h"
 #include "host/HostFile.h"
@@ -15,9 +17,6 @@
 #include "system/RootDirectory.h"
 
 namespace appsync {
-namespace {
-
-constexpr std::size_t kPieceBytes = std::size_t{1} << 20;
 
 // A new file of the device, which goes away again unless it is kept.
 class NewFile {
@@ -41,6 +40,17 @@ class NewFile {
         if (error_ == 0) error_ = writeWhole(descriptor_.get(), bytes).error;
     }
     void keep() { isKept_ = true; }
+    /// Makes it durable and gives it another place, in one step.
+    void moveTo(int directory, const std::string& name) {
+        if (error_ == 0 && ::fsync(descriptor_.get()) != 0) error_ = errno;
+        if (error_ != 0) return;
+        if (::renameat(directory_, name_.c_str(), directory, name.c_str()) != 0) {
+            error_ = errno;
+            return;
+        }
+        isKept_ = true;
+        if (::fsync(directory) != 0) error_ = errno;
+    }
 
   private:
     const int directory_;
@@ -49,6 +59,12 @@ class NewFile {
     int error_ = 0;
     bool isKept_ = false;
 };
+
+namespace {
+
+constexpr std::size_t kPieceBytes = std::size_t{1} << 20;
+// In the directory for temporary files, which the opening of each session empties.
+constexpr std::string_view kUnfinishedName = "Arriving";
 
 ErrorRecord interrupted() {
     return ErrorRecord::make(kTransferErrorDomain, kTransferInterrupted,
@@ -62,9 +78,17 @@ ErrorRecord cutShort(const std::string& file) {
 
 ErrorRecord cannotWrite(int errorNumber, const std::string& path) {
     ErrorRecord error = systemError(errorNumber, "cannot write " + path);
-    if (errorNumber != ENOSPC && errorNumber != EDQUOT) return error;
-    return ErrorRecord::make(error.domain, error.code,
-                             error.description() + "; free space on the device and sync again");
+    std::string advice;
+    if (errorNumber == ENOSPC || errorNumber == EDQUOT) {
+        advice = "; free space on the device and run it again";
+    } else if (errorNumber == ENAMETOOLONG) {
+        advice =
+            "; the device has no room for names that long: give the application an identifier of "
+            "at most 251 bytes";
+    } else {
+        return error;
+    }
+    return ErrorRecord::make(error.domain, error.code, error.description() + advice);
 }
 
 Result<UniqueFd> openTarget(Device& device, const std::string& directory) {
@@ -85,21 +109,42 @@ Result<std::uint64_t> PackageSender::send(const std::string& file, const std::st
     const Result<UniqueFd> target = openTarget(device_, directory);
     if (!target) return target.error();
     NewFile sent(*target, name);
-    const std::uint64_t total = source->size();
-    for (std::uint64_t done = 0; done < total && sent.error() == 0;) {
+    Result<std::uint64_t> total = copy(*source, file, sent, progress);
+    if (total && sent.error() != 0) return cannotWrite(sent.error(), directory + "/" + name);
+    if (total) sent.keep();
+    return total;
+}
+
+Result<std::uint64_t> PackageSender::sendWhole(const std::string& file,
+                                               const std::string& directory,
+                                               const std::string& name, const Progress& progress) {
+    Result<HostFile> source = HostFile::open(file);
+    if (!source) return source.error();
+    const Result<UniqueFd> target = openTarget(device_, directory);
+    if (!target) return target.error();
+    const Result<UniqueFd> temporary = openTarget(device_, device_.files().temporaryDirectory());
+    if (!temporary) return temporary.error();
+    NewFile sent(*temporary, std::string(kUnfinishedName));
+    Result<std::uint64_t> total = copy(*source, file, sent, progress);
+    if (total) sent.moveTo(target->get(), name);
+    if (total && sent.error() != 0) return cannotWrite(sent.error(), directory + "/" + name);
+    return total;
+}
+
+// Failures to write are the target's to tell.
+Result<std::uint64_t> PackageSender::copy(HostFile& source, const std::string& file,
+                                          NewFile& target, const Progress& progress) {
+    const std::uint64_t total = source.size();
+    for (std::uint64_t done = 0; done < total && target.error() == 0;) {
         const std::size_t wanted =
             static_cast<std::size_t>(std::min<std::uint64_t>(piece_.size(), total - done));
-        const Result<std::size_t> count = source->read(std::span(piece_).first(wanted));
+        const Result<std::size_t> count = source.read(std::span(piece_).first(wanted));
         if (!count) return count.error().withContext(file);
         if (*count == 0) return cutShort(file);
-        sent.write(std::span(piece_).first(*count));
+        target.write(std::span(piece_).first(*count));
         done += *count;
-        if (sent.error() == 0 && !progress(done, total)) return interrupted();
+        if (target.error() == 0 && !progress(done, total)) return interrupted();
     }
-    if (sent.error() != 0) {
-        return cannotWrite(sent.error(), directory + "/" + name);
-    }
-    sent.keep();
     return total;
 }
 

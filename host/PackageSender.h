@@ -10,6 +10,8 @@
 namespace appsync {
 
 class Device;
+class HostFile;
+class NewFile;
 
 /// Carries files from this machine to a device, in pieces. One thread at a time.
 class PackageSender {
@@ -25,7 +27,17 @@ class PackageSender {
     [[nodiscard]] Result<std::uint64_t> send(const std::string& file, const std::string& directory,
                                              const std::string& name, const Progress& progress);
 
+    /// The same for a file that the device keeps beyond the session: it is there whole and durable,
+    /// or what stood there before is, whatever ends the transfer.
+    [[nodiscard]] Result<std::uint64_t> sendWhole(const std::string& file,
+                                                  const std::string& directory,
+                                                  const std::string& name,
+                                                  const Progress& progress);
+
   private:
+    Result<std::uint64_t> copy(HostFile& source, const std::string& file, NewFile& target,
+                               const Progress& progress);
+
     Device& device_;
     Bytes piece_;
 };

@@ -45,9 +45,22 @@ PlugIn::~PlugIn() {
 
 Status PlugIn::openLog(Device& device) {
     const std::string path = device.logPath();
-    ::mkdir(path.substr(0, path.rfind('/')).c_str(), 0755);  // it may have been tidied away
-    UniqueFd file(::open(path.c_str(), O_WRONLY | O_APPEND | O_CREAT | O_CLOEXEC, 0644));
-    if (!file) return unusable(systemError(errno, "cannot write the device's log " + path));
+    const std::size_t slash = path.rfind('/');
+    const std::string directory = path.substr(0, slash);
+    ::mkdir(directory.c_str(), 0755);  // it may have been tidied away
+    // Nothing is written outside the device, and a pipe is not waited on.
+    constexpr int kFlags = O_WRONLY | O_APPEND | O_CREAT | O_CLOEXEC | O_NOFOLLOW | O_NONBLOCK;
+    const UniqueFd folder(
+        ::open(directory.c_str(), O_RDONLY | O_DIRECTORY | O_NOFOLLOW | O_CLOEXEC));
+    UniqueFd file;
+    if (folder) file = UniqueFd(::openat(folder.get(), path.c_str() + slash + 1, kFlags, 0644));
+    if (!file) {
+        return unusable(systemError(errno, "cannot write the device's log " + path));
+    }
+    struct stat attributes {};
+    if (::fstat(file.get(), &attributes) != 0 || !S_ISREG(attributes.st_mode)) {
+        return unusable("the device's log " + path + " is not a regular file", "remove it");
+    }
     log_ = std::make_unique<JsonLogFacility>(std::move(file));
     return {};
 }

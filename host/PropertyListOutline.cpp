@@ -32,6 +32,22 @@ std::string hexText(const Bytes& bytes) {
     return bytes.size() > kShownBytes ? text + "..." : text;
 }
 
+// What breaks a line, and what would look like it, stands as in most programming languages.
+std::string quoted(std::string_view text) {
+    constexpr std::string_view kEscaped = "\n\r\t\\\"";
+    constexpr std::string_view kLetters = "nrt\\\"";
+    std::string escaped = "\"";
+    for (const char character : text) {
+        const std::size_t found = kEscaped.find(character);
+        if (found == std::string_view::npos) {
+            escaped += character;
+        } else {
+            escaped.append({'\\', kLetters[found]});
+        }
+    }
+    return printable(escaped + "\"");
+}
+
 std::string scalarText(const PropertyList& value) {
     switch (value.kind()) {
         case PropertyList::Kind::Boolean:
@@ -48,7 +64,7 @@ std::string scalarText(const PropertyList& value) {
             return "data of " + formatBytes(value.asData()->size()) + " <" +
                    hexText(*value.asData()) + ">";
         case PropertyList::Kind::String:
-            return "\"" + printable(*value.asString()) + "\"";
+            return quoted(*value.asString());
         default:
             return "null";
     }

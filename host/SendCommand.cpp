@@ -18,6 +18,7 @@
 #include "host/Interruption.h"
 #include "host/Library.h"
 #include "host/LibraryReader.h"
+#include "host/OpenDevice.h"
 #include "host/PlugIn.h"
 #include "host/Problem.h"
 #include "host/Session.h"
@@ -37,8 +38,8 @@ using Clock = std::chrono::steady_clock;
 
 Status checkArguments(const SendArguments& arguments) {
     if (!isLegalIdentifier(arguments.identifier)) {
-        return wrongUsage(arguments.identifier + " is not an identifier",
-                          "use letters, digits, '.', '-' and '_'");
+        const std::string shown = arguments.identifier.empty() ? "''" : arguments.identifier;
+        return wrongUsage(shown + " is not an identifier", "use letters, digits, '.', '-' and '_'");
     }
     if (!arguments.isRestore && arguments.parts != kAssetPartApplication) {
         return wrongUsage("--parts " + std::to_string(arguments.parts) + " without --restore",
@@ -47,7 +48,8 @@ Status checkArguments(const SendArguments& arguments) {
     return {};
 }
 
-// The version under which the package of a restore waits for its data; nothing when none does.
+// The version under which the package of a restore waits for its data; nothing when none does, or
+// when a crash has taken the package, or what says that it was installed.
 std::optional<std::string> waitingVersion(Device& device, const std::string& identifier) {
     const Result<Bytes> bytes = device.files().readFile(std::string(kRestoreStatePath));
     if (!bytes) return std::nullopt;
@@ -55,7 +57,10 @@ std::optional<std::string> waitingVersion(Device& device, const std::string& ide
     if (!state) return std::nullopt;
     const PropertyList* versions = state->find(identifier);
     if (versions == nullptr || versions->entries().empty()) return std::nullopt;
-    return versions->entries().back().key;
+    const PropertyList::Entry& last = versions->entries().back();
+    const std::string* path = last.value.findString("path");
+    if (path == nullptr || !device.files().itemExists(*path)) return std::nullopt;
+    return last.key;
 }
 
 bool beginsAsArchive(const std::string& file) {
@@ -87,14 +92,15 @@ class Sending {
         const Result<DeviceSettings> settings = device_->settings();
         if (!settings) return unusable(settings.error());
         if (settings->installation == PolicyAnswer::No) return refuse(forbidden());
-        Status ready = checkSpace();
+        Status ready = checkFile();
+        if (ready) ready = checkSpace();
         if (!ready) return refuse(ready.error());
         isCoordinated_ = settings->coordination;
         if (isCoordinated_) ready = checkCoordinated();
-        if (!ready) return ready.error();
-        ready = isData() ? prepareData() : preparePackage();
+        if (ready && !isData()) ready = checkPackage();
+        if (ready) ready = isData() ? prepareData() : preparePackage();
         if (ready) ready = clearTheWay();
-        if (!ready) return ready.error();
+        if (!ready) return refuse(ready.error());
         isPlanned_ = true;
         if (signals_.stopRequested()) return finish(summarizeInterrupted(plan_, facts_));
         return hold();
@@ -111,6 +117,13 @@ class Sending {
                 "the installs of this device are coordinated, and restored packages "
                 "are the store's to bring",
                 "see appsync store, or turn coordination off");
+        }
+        const Result<ApplicationStatus> status = device_->status(arguments_.identifier);
+        if (!status) return unusable(status.error());
+        if (status->coordinator && status->coordinator->kind.starts_with("restoring")) {
+            return failure("a restore brought " + arguments_.identifier +
+                               " back, and its package is the store's to bring",
+                           "see appsync store");
         }
         if (!device_->files().itemExists(std::string(kStagingArea))) return {};
         return failure("a host has left a staging area on the device",
@@ -149,6 +162,11 @@ class Sending {
         return failure(kInstallationForbidden, "allow it with appsync set DEVICE installation=yes");
     }
 
+    Status checkFile() const {
+        const Result<HostFile> file = HostFile::open(arguments_.file);
+        return file ? Status() : Status(file.error());
+    }
+
     // What cannot be looked at here is told by whoever uses it.
     Status checkSpace() const {
         std::error_code code;
@@ -166,8 +184,10 @@ class Sending {
             "free space on the device");
     }
 
-    // Nothing is sent.
-    int refuse(const ErrorRecord& reason) {
+    // Nothing is sent. A device that cannot be used is an error, not a failure of this package.
+    Result<int> refuse(const ErrorRecord& cause) {
+        const ErrorRecord reason = classified(cause);
+        if (exitStatusOf(reason) == kExitUnusable) return reason;
         SyncSummary summary;
         summary.failed.push_back({arguments_.identifier, reason.description()});
         summary.incomplete = true;
@@ -186,14 +206,21 @@ class Sending {
         parcel_.file = arguments_.file;
     }
 
-    // A package that cannot be read is sent all the same: the device judges it.
+    // Nobody has asked for it, so there is no placeholder that would go when the device refuses it:
+    // the application that is installed would.
+    Status checkPackage() const {
+        const Result<PackageReader> package =
+            PackageReader::open(arguments_.file, device_->propertyLists());
+        return package ? package->expectIdentifier(arguments_.identifier) : Status(package.error());
+    }
+
     Status preparePackage() {
         const Result<PackageReader> package =
             PackageReader::open(arguments_.file, device_->propertyLists());
         const std::string version = package ? package->info().version : "";
         makeAsset(version);
         parcel_.directory = kPublicStaging;
-        parcel_.name = arguments_.identifier + ".zip";
+        parcel_.name = archiveNameOf(arguments_.identifier);
         PlannedInstall planned{arguments_.identifier, {}, {}, {}, 0, 0};
         if (package) planned.newVersion = version;
         if (package && package->info().identifier == arguments_.identifier) {

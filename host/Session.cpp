@@ -47,6 +47,10 @@ ErrorRecord cancelledByDevice() {
                              "the device cancelled its install: run the command again to have it");
 }
 
+bool isOfInterruption(const ErrorRecord& error) {
+    return error.domain == kTransferErrorDomain && error.code == kTransferInterrupted;
+}
+
 bool isUserApplication(const ApplicationRecord& record) {
     const bool isOfSync = record.isPlaceholder && record.installType == kInstallTypeSync;
     return record.type == kApplicationTypeUser && !isOfSync;
@@ -74,7 +78,7 @@ SessionEnd Session::sync(const Order& order) {
     takeUpDelivered(order);
     const std::vector<std::string> known =
         order.takesInventory ? std::vector<std::string>() : readLastSyncState(device_);
-    if (!reconcile()) return end(false, {});
+    if (!reconcile()) return end({});
     if (order.takesInventory) static_cast<void>(client_.installedAssets());
     std::vector<SyncAssetPointer> assets;
     for (SyncAssetPointer& asset : client_.outstandingAssetTransfers()) {
@@ -83,7 +87,7 @@ SessionEnd Session::sync(const Order& order) {
         assets.push_back(std::move(asset));
     }
     transferAll(assets, order.packages);
-    return end(!stopRequested_, known);
+    return end(known);
 }
 
 // What an interrupted session has delivered, except where this one begins anew.
@@ -104,8 +108,9 @@ bool Session::reconcile() {
     watch_.setRemoving(true);
     const bool reconciled =
         client_.reconcileSync(PropertyList::map(), anchor, ignoreProgress, &error);
-    watch_.waitForUninstalls(stopRequested_);
+    isCutShort_ = !watch_.waitForUninstalls(stopRequested_);
     watch_.setRemoving(false);
+    if (reconciled && !isCutShort_) facts_.reconciled();
     if (reconciled) return true;
     end_.error = error.value_or(ErrorRecord::make(kPosixErrorDomain, EIO, "it cannot begin"));
     return false;
@@ -114,9 +119,12 @@ bool Session::reconcile() {
 void Session::transferAll(const std::vector<SyncAssetPointer>& assets,
                           const PackageSource& packages) {
     transfers_.fill(assets);
-    while (!stopRequested_) {
-        const SyncAssetPointer asset = transfers_.next();
-        if (asset == nullptr) return;
+    while (const SyncAssetPointer asset = transfers_.next()) {
+        if (stopRequested_) {
+            isCutShort_ = true;
+            transfers_.finish();
+            return;
+        }
         transfer(asset, packages);
         transfers_.finish();
     }
@@ -131,12 +139,13 @@ SessionEnd Session::deliver(const Parcel& parcel) {
         return end_;
     }
     client_.prepareForSyncWithHostAnchor(client_.currentSyncAnchor(), ignoreProgress, nullptr);
+    facts_.reconciled();
     facts_.requested(parcel.asset->identifier);
     transfers_.fill({parcel.asset});
     static_cast<void>(transfers_.next());
     send(parcel);
     transfers_.finish();
-    return end(!stopRequested_, known);
+    return end(known);
 }
 
 Result<std::string> Session::packageOf(const SyncAsset& asset, const PackageSource& packages) {
@@ -148,7 +157,8 @@ void Session::transfer(const SyncAssetPointer& asset, const PackageSource& packa
     if (isCancelled(asset->identifier)) return reportFailure(asset, cancelledByDevice());
     Result<std::string> file = packageOf(*asset, packages);
     if (file) {
-        send({asset, *std::move(file), std::string(kPublicStaging), asset->identifier + ".zip"});
+        send({asset, *std::move(file), std::string(kPublicStaging),
+              archiveNameOf(asset->identifier)});
     } else {
         reportFailure(asset, file.error());
     }
@@ -174,8 +184,10 @@ void Session::send(const Parcel& parcel) {
         client_.assetTransferUpdatedProgress(asset, asset->downloadProgress);
         return !stopRequested_ && !isCancelled(asset->identifier);
     };
+    // What a restore brings may wait on the device for its other part, also through a crash.
     const Result<std::uint64_t> sent =
-        sender_.send(parcel.file, parcel.directory, parcel.name, progress);
+        asset->isRestore ? sender_.sendWhole(parcel.file, parcel.directory, parcel.name, progress)
+                         : sender_.send(parcel.file, parcel.directory, parcel.name, progress);
     if (!sent) return reportFailure(asset, causeOf(sent.error()));
     facts_.sent(*sent);
     event.kind = SyncEventKind::Ended;
@@ -209,12 +221,14 @@ void Session::reportFailure(const SyncAssetPointer& asset, const ErrorRecord& er
     const std::string cause = facts_.firstFailure(identifier).value_or(error.description());
     events_.report({SyncEventKind::Ended, SyncPhase::Transfer, identifier, 0, 0, SyncState::Failed,
                     std::nullopt, cause});
+    if (isOfInterruption(error)) isCutShort_ = true;
     if (!host_.isRecoverableError(error)) givenUp_.push_back(identifier);
     client_.assetTransferSucceeded(asset, false, &error);
 }
 
-const SessionEnd& Session::end(bool transfersSucceeded, const std::vector<std::string>& known) {
-    client_.assetTransferEndedWithSuccess(transfersSucceeded);
+// A stop that comes when nothing is left to do interrupts nothing.
+const SessionEnd& Session::end(const std::vector<std::string>& known) {
+    client_.assetTransferEndedWithSuccess(!isCutShort_ && !end_.error);
     if (watch_.isCoordinated()) {
         cancelWhere([this](const CoordinatorRecord& each) {
             return std::find(givenUp_.begin(), givenUp_.end(), each.identifier) != givenUp_.end();
@@ -224,7 +238,7 @@ const SessionEnd& Session::end(bool transfersSucceeded, const std::vector<std::s
             return takenUp_.contains(each.identifier) && !each.isComplete;
         });
     }
-    end_.isInterrupted = stopRequested_;
+    end_.isInterrupted = isCutShort_;
     const bool isSuccess = end_.isSuccess();
     client_.syncEndedWithSuccess(isSuccess);
     // What is being installed at this moment ends here; whoever looks at the device then sees it.
@@ -258,11 +272,12 @@ void Session::cancelWhere(const std::function<bool(const CoordinatorRecord&)>& i
 // The plug-in has done its part when the transfers have; what the coordination service does with
 // the packages belongs to the session all the same: its end says that the device is in step.
 void Session::awaitCoordinatedInstalls() {
-    while (!stopRequested_) {
-        if (!device_.waitForCoordinatedInstalls(kStopInterval)) continue;
-        watch_.settleDelivered();
+    while (!device_.waitForCoordinatedInstalls(kStopInterval)) {
+        if (!stopRequested_) continue;
+        isCutShort_ = true;
         return;
     }
+    watch_.settleDelivered();
 }
 
 std::vector<std::string> readLastSyncState(Device& device) {

@@ -30,7 +30,7 @@ class TransferQueue;
 struct SessionEnd {
     /// Device policy rules the whole dataclass out; nothing was done.
     bool isDisabled = false;
-    /// The person stopped it.
+    /// The person stopped it before all was done.
     bool isInterrupted = false;
     /// Why nothing could be transferred at all.
     std::optional<ErrorRecord> error;
@@ -86,7 +86,7 @@ class Session {
     void awaitCoordinatedInstalls();
     void cancelWhere(const std::function<bool(const CoordinatorRecord&)>& isToGo);
     // `known`: the applications that the last session saw, where this one does not look.
-    const SessionEnd& end(bool transfersSucceeded, const std::vector<std::string>& known);
+    const SessionEnd& end(const std::vector<std::string>& known);
 
     Device& device_;
     SyncClient& client_;
@@ -99,6 +99,7 @@ class Session {
     PackageSender sender_;
     std::vector<std::string> givenUp_;  // whose transfers have failed for good
     std::set<std::string> takenUp_;     // whose packages an earlier session has delivered
+    bool isCutShort_ = false;           // something was left out because of a stop
     SessionEnd end_;
 };
 

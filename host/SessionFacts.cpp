@@ -22,6 +22,11 @@ void SessionFacts::requested(const std::string& identifier) {
     requests_.push_back(identifier);
 }
 
+void SessionFacts::reconciled() {
+    const std::lock_guard guard(mutex_);
+    isReconciled_ = true;
+}
+
 void SessionFacts::sent(std::uint64_t bytes) {
     const std::lock_guard guard(mutex_);
     bytesSent_ += bytes;
@@ -53,6 +58,11 @@ std::set<std::string> SessionFacts::installedIdentifiers() const {
 bool SessionFacts::wasInstalled(const std::string& identifier) const {
     const std::lock_guard guard(mutex_);
     return installed_.contains(identifier);
+}
+
+bool SessionFacts::wasReconciled() const {
+    const std::lock_guard guard(mutex_);
+    return isReconciled_;
 }
 
 bool SessionFacts::wasRemoved(const std::string& identifier) const {

@@ -21,6 +21,8 @@ class SessionFacts {
     void installed(const std::string& identifier);
     void removed(const std::string& identifier);
     void requested(const std::string& identifier);
+    /// The device has taken over what the host asks for, and done all removals.
+    void reconciled();
     void sent(std::uint64_t bytes);
     /// The plug-in was told whether it may; its last answer is what it went by.
     void policyAnswered(PolicyFeature feature, PolicyAnswer answer);
@@ -32,6 +34,7 @@ class SessionFacts {
     /// Everything that was.
     [[nodiscard]] std::set<std::string> installedIdentifiers() const;
     [[nodiscard]] std::optional<CoordinationClient> holder(const std::string& identifier) const;
+    [[nodiscard]] bool wasReconciled() const;
     [[nodiscard]] bool wasRemoved(const std::string& identifier) const;
     /// In the order in which the device asked.
     [[nodiscard]] std::vector<std::string> requests() const;
@@ -46,6 +49,7 @@ class SessionFacts {
     std::map<std::string, CoordinationClient> holders_;
     std::set<std::string> removed_;
     std::vector<std::string> requests_;
+    bool isReconciled_ = false;
     std::uint64_t bytesSent_ = 0;
     std::map<PolicyFeature, PolicyAnswer> answers_;
 };

@@ -284,11 +284,12 @@ void SessionWatch::coordinatedUninstallEnded(const std::string& identifier, cons
     ended_.notify_all();
 }
 
-void SessionWatch::waitForUninstalls(const std::atomic<bool>& stopRequested) {
+bool SessionWatch::waitForUninstalls(const std::atomic<bool>& stopRequested) {
     std::unique_lock lock(mutex_);
     while (!stopRequested &&
            !ended_.wait_for(lock, kPollInterval, [this] { return uninstalls_ == 0; })) {
     }
+    return uninstalls_ == 0;
 }
 
 void SessionWatch::poll() {

@@ -61,8 +61,8 @@ class SessionWatch {
     /// The same for one whose package an earlier session has delivered.
     void takeUpDelivered(const std::string& identifier);
     /// Waits until the uninstalls that the client has handed to the coordination service have
-    /// ended, or a stop is requested.
-    void waitForUninstalls(const std::atomic<bool>& stopRequested);
+    /// ended, or a stop is requested. Whether they have.
+    bool waitForUninstalls(const std::atomic<bool>& stopRequested);
     /// No install is under way any more: what was delivered and never heard of again has failed.
     void settleDelivered();
 

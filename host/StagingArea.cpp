@@ -5,14 +5,18 @@
 #include <sys/stat.h>
 
 #include <algorithm>
+#include <array>
 #include <memory>
 #include <set>
 #include <utility>
 #include <vector>
 
 #include "client/Paths.h"
+#include "client/TodoList.h"
 #include "device/Device.h"
+#include "device/PackageIdentifier.h"
 #include "device/PackageReader.h"
+#include "host/InterruptedStaging.h"
 #include "host/Library.h"
 #include "host/SyncPlan.h"
 #include "platform/FileSystem.h"
@@ -26,8 +30,8 @@ constexpr std::uint64_t kMaximumIconBytes = std::uint64_t{8} << 20;
 constexpr std::string_view kUnfinishedStagingArea =
     "/var/mobile/Media/PublicStaging/ApplicationSync.new";
 constexpr std::string_view kTodoListName = "ApplicationsSync.plist";
-constexpr std::string_view kPackageSuffix = ".zip";
-// Twice what a device is expected to hold: a session with more would go on for hours.
+// Twice what a device is expected to hold: a session with more would go on for hours. Of entries
+// that the device has not marked as done, whatever they ask for, there may be no more either.
 constexpr std::size_t kMostInstalls = 20'000;
 
 const FileAttributes kMobile{"mobile", "mobile"};
@@ -53,7 +57,8 @@ class StagingWriter {
 
     Status write(const SyncPlan& plan, const Library& library) {
         status_ = device_.files().createDirectory(directory_, true, &kMobile);
-        addTodoList(plan);
+        addList(kHostRecordName, hostRecordOfLibrary());
+        addList(kTodoListName, todoListOf(plan));
         if (library.iconOrder) add("DeskoraIconState.plist", *library.iconOrder);
         for (const auto* installs : {&plan.install, &plan.update}) {
             for (const PlannedInstall& each : *installs) {
@@ -64,11 +69,11 @@ class StagingWriter {
     }
 
   private:
-    void addTodoList(const SyncPlan& plan) {
+    void addList(std::string_view name, const PropertyList& list) {
         const Result<Bytes> bytes =
-            device_.propertyLists().serialize(todoListOf(plan), PropertyListFormat::Binary);
+            device_.propertyLists().serialize(list, PropertyListFormat::Binary);
         if (bytes) {
-            add(std::string(kTodoListName), *bytes);
+            add(std::string(name), *bytes);
         } else if (status_) {
             status_ = bytes.error();
         }
@@ -147,6 +152,10 @@ std::set<std::string> packagesThatWait(Device& device) {
     return paths;
 }
 
+bool isPackageName(const std::string& name) {
+    return name.ends_with(".zip") || identifierOfArchive(name);
+}
+
 bool isLink(const RootDirectory& root, const std::string& path) {
     const Result<ItemPlace> place = root.place(path);
     if (!place) return false;
@@ -169,6 +178,25 @@ std::size_t installsIn(const PropertyList& todoList) {
         if (operation != nullptr && *operation == "install") ++count;
     }
     return count;
+}
+
+bool isDone(const PropertyList& entry) {
+    return std::ranges::any_of(std::array{kTodoSent, kTodoDownloaded, kTodoInstalled, kTodoFailed},
+                               [&](std::string_view mark) { return hasOperation(entry, mark); });
+}
+
+// Why a session could not do all that the list asks for; empty when it can.
+std::string excessOf(const PropertyList& todoList) {
+    const std::string most = ", and " + std::to_string(kMostInstalls) + " are the most";
+    const std::size_t installs = installsIn(todoList);
+    if (installs > kMostInstalls) {
+        return "it asks for " + std::to_string(installs) + " installs" + most;
+    }
+    const auto entries = todoList.elements();
+    const auto done = std::ranges::count_if(entries, isDone);
+    const std::size_t open = entries.size() - static_cast<std::size_t>(done);
+    if (open <= kMostInstalls) return {};
+    return "it has " + std::to_string(open) + " entries that are not done" + most;
 }
 
 }  // namespace
@@ -196,18 +224,23 @@ Status writeStagingArea(Device& device, const SyncPlan& plan, const Library& lib
 StagedTodoList readStagedTodoList(Device& device) {
     StagedTodoList staged;
     const std::string place(kStagingArea);
-    if (!device.files().itemExists(place)) {
-        if (isLink(device.root(), place)) staged.error = place + " is a link that leads nowhere";
+    const bool isWaiting = device.files().itemExists(place);
+    if (!isWaiting && isLink(device.root(), place)) {
+        staged.error = place + " is a link that leads nowhere";
         return staged;
     }
-    Result<PropertyList> list = loadTodoList(device, place + "/" + std::string(kTodoListName));
+    std::optional<PropertyList> left = interruptedTodoList(device);
+    if (!isWaiting && !left) return staged;
+    staged.isTakenUp = left.has_value();
+    Result<PropertyList> list =
+        left ? Result<PropertyList>(*std::move(left))
+             : loadTodoList(device, place + "/" + std::string(kTodoListName));
     if (!list) {
         staged.error = list.error().description();
     } else if (!list->isArray()) {
         staged.error = "it is not a list";
-    } else if (const std::size_t installs = installsIn(*list); installs > kMostInstalls) {
-        staged.error = "it asks for " + std::to_string(installs) + " installs, and " +
-                       std::to_string(kMostInstalls) + " are the most";
+    } else if (std::string excess = excessOf(*list); !excess.empty()) {
+        staged.error = std::move(excess);
         staged.isTooLarge = true;
     } else {
         staged.list = *std::move(list);
@@ -218,13 +251,12 @@ StagedTodoList readStagedTodoList(Device& device) {
 Status removeStaleTransfers(Device& device, const std::set<std::string>& arrived) {
     std::set<std::string> waiting = packagesThatWait(device);
     for (const std::string& identifier : arrived) {
-        waiting.insert(std::string(kPublicStaging) + "/" + identifier +
-                       std::string(kPackageSuffix));
+        waiting.insert(std::string(kPublicStaging) + "/" + archiveNameOf(identifier));
     }
     device.files().removeItem(std::string(kUnfinishedStagingArea)).ignore();
     for (const std::string& name : namesIn(device.root(), kPublicStaging)) {
         const std::string path = std::string(kPublicStaging) + "/" + name;
-        if (!name.ends_with(kPackageSuffix) || waiting.contains(path)) continue;
+        if (!isPackageName(name) || waiting.contains(path)) continue;
         Status removed = device.files().removeItem(path);
         if (!removed) return removed;
     }

@@ -23,7 +23,7 @@ struct SyncPlan;
 /// gets no directory. On failure nothing stays.
 Status writeStagingArea(Device& device, const SyncPlan& plan, const Library& library);
 
-/// What a host left in the staging area of the device.
+/// What a host left in the staging area of the device, or a session that was interrupted of it.
 struct StagedTodoList {
     /// Null when there is none, or no usable one.
     PropertyList list;
@@ -31,6 +31,8 @@ struct StagedTodoList {
     std::optional<std::string> error;
     /// It asks for more than a session can do: the device must not get to see it.
     bool isTooLarge = false;
+    /// No area waits, and this is what an interrupted session has left to do.
+    bool isTakenUp = false;
 };
 [[nodiscard]] StagedTodoList readStagedTodoList(Device& device);
 

@@ -51,6 +51,7 @@ class Store {
         const Result<std::vector<CoordinatorRecord>> coordinators = device_.coordinators();
         if (!coordinators) return unusable(coordinators.error());
         for (const CoordinatorRecord& each : *coordinators) serve(each.identifier);
+        if (lacksPackage_) nameFaults();
         while (!device_.waitForCoordinatedInstalls(kWaitInterval)) {
             if (allWaitForApplications()) break;
         }
@@ -75,6 +76,7 @@ class Store {
     Status deliver(const std::string& identifier, InstallCoordinator& coordinator) {
         const LibraryPackage* package = library_.find(identifier);
         if (package == nullptr) {
+            lacksPackage_ = true;
             return failure("the store has no package of it", "add one to its folder");
         }
         const std::string name = identifier + ".zip";
@@ -95,6 +97,14 @@ class Store {
         promise->setPercentComplete(1.0);
         promise->setComplete();
         return {};
+    }
+
+    // A package that cannot be read may be the one that is missed.
+    void nameFaults() {
+        for (const LibraryFault& fault : library_.faults) {
+            if (fault.fileName == kIconOrderFile) continue;
+            result_.failed.push_back({fault.fileName, fault.error});
+        }
     }
 
     // A placeholder does not run, but an application that it covers may.
@@ -137,10 +147,11 @@ class Store {
     InstallCoordinatorService& service_;
     PackageSender sender_;
     std::set<std::string> delivered_;
+    bool lacksPackage_ = false;
     StoreResult result_;
 };
 
-void printJson(const StoreResult& result, const Console& console) {
+void printKeptJson(const StoreResult& result, const Console& console) {
     Json failed = Json::array();
     for (const FailedPromise& each : result.failed) {
         failed.push_back({{"identifier", each.identifier}, {"error", each.error}});
@@ -148,7 +159,7 @@ void printJson(const StoreResult& result, const Console& console) {
     console.out << indented({{"kept", result.kept}, {"failed", std::move(failed)}}) << '\n';
 }
 
-void print(const StoreResult& result, const Console& console) {
+void printKept(const StoreResult& result, const Console& console) {
     if (result.kept.empty() && result.failed.empty()) {
         console.out << "Nothing waits for the store.\n";
         return;
@@ -176,7 +187,7 @@ int runStore(const std::string& device, const std::string& folder, bool asJson,
     for (const FailedPromise& each : result->failed) {
         console.complain(each.identifier + ": " + each.error);
     }
-    (asJson ? printJson : print)(*result, console);
+    (asJson ? printKeptJson : printKept)(*result, console);
     return result->failed.empty() ? kExitDone : kExitSomethingFailed;
 }
 

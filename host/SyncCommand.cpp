@@ -1,17 +1,19 @@
+#include <unistd.h>
+
 #include <algorithm>
 #include <atomic>
 #include <chrono>
-#include <filesystem>
 #include <memory>
 #include <optional>
 #include <ostream>
-#include <system_error>
+#include <set>
 #include <utility>
 
 #include "device/Device.h"
 #include "device/PackageIdentifier.h"
 #include "host/Commands.h"
 #include "host/Console.h"
+#include "host/InterruptedStaging.h"
 #include "host/Interruption.h"
 #include "host/Json.h"
 #include "host/LibraryReader.h"
@@ -45,16 +47,12 @@ Status checkArguments(const SyncArguments& arguments) {
     return {};
 }
 
-// The package that the library has for an identifier; else the file that is named for it, which the
-// device then judges.
-Result<std::string> packageFile(const Library& library, const std::string& identifier) {
-    if (const LibraryPackage* package = library.find(identifier)) return package->file;
-    std::string file = library.folder + "/" + identifier + ".zip";
-    std::error_code code;
-    if (std::filesystem::exists(file, code)) return file;
-    return ErrorRecord::make(
-        kTransferErrorDomain, kTransferNoPackage,
-        "the library has no package of " + identifier + ": put one into " + library.folder);
+// What the host staged for another session is not this one's to do.
+std::string givenUpNote(StagedWork work) {
+    const std::string what = work == StagedWork::Waiting
+                                 ? "the staging area that waits on the device"
+                                 : "what an interrupted sync --staged has left to do";
+    return what + " is given up for this sync: stage it again afterwards";
 }
 
 // One run of `sync` or `plan`.
@@ -72,7 +70,10 @@ class SyncRun {
     SyncRun(const SyncRun&) = delete;
     SyncRun& operator=(const SyncRun&) = delete;
     // Signals must not end the process in an instant before the device is closed.
-    ~SyncRun() { device_.reset(); }
+    ~SyncRun() {
+        while (isDeviceTaken_.test_and_set()) ::pause();  // the process is about to end
+        device_.reset();
+    }
 
     Result<int> run() {
         Status ready = prepare();
@@ -81,6 +82,7 @@ class SyncRun {
         isPlanned_ = true;
         if (mustNotRun_) return refuse(plan_.failed.back().error);
         if (!space_.fits()) return refuse(space_.description());
+        if (givenUp_ != StagedWork::None) console_.complain(givenUpNote(givenUp_));
         ready = clearTheWay();
         if (!ready) return ready.error();
         if (signals_->stopRequested()) return finish(summarizeInterrupted(plan_, facts_));
@@ -113,16 +115,19 @@ class SyncRun {
     }
 
     Status makeThePlan() {
-        const Result<std::vector<ApplicationRecord>> present = device_->applications();
+        const Result<std::vector<ApplicationRecord>> present = device_->applicationsOnDisk();
         if (!present) return unusable(present.error());
         const Result<DeviceSettings> settings = device_->settings();
         if (!settings) return unusable(settings.error());
         if (arguments_.isStaged) {
-            planStaged(*present);
+            planStaged(*present, *settings);
         } else {
             PlanOptions options = arguments_.plan;
             options.bringsOffloaded = settings->coordination;
             plan_ = makePlan(library_, *present, options);
+            givenUp_ = stagedWorkOn(*device_);
+            const bool isToNote = arguments_.isDryRun && givenUp_ != StagedWork::None;
+            if (isToNote) plan_.notes.push_back(givenUpNote(givenUp_));  // a sync complains of it
         }
         if (!settings->coordination) return {};  // a session begins by dropping what stands
         const Result<std::vector<CoordinatorRecord>> coordinators = device_->coordinators();
@@ -142,14 +147,23 @@ class SyncRun {
         return rules;
     }
 
-    void planStaged(const std::vector<ApplicationRecord>& present) {
-        const StagedTodoList staged = readStagedTodoList(*device_);
-        plan_ = makeStagedPlan(staged.list, library_, present);
-        mustNotRun_ = staged.isTooLarge;
-        if (staged.error) {
+    void planStaged(const std::vector<ApplicationRecord>& present, const DeviceSettings& settings) {
+        staged_ = readStagedTodoList(*device_);
+        StagedPlanOptions options;
+        options.bringsOffloaded = settings.coordination;
+        options.packageOf = [this](const std::string& identifier) {
+            return packageFor(library_, identifier, device_->propertyLists());
+        };
+        plan_ = makeStagedPlan(staged_.list, present, options);
+        plan_.notes = library_.notes;
+        if (staged_.isTakenUp) {
+            plan_.notes.emplace_back("this takes up the session that was interrupted");
+        }
+        mustNotRun_ = staged_.isTooLarge;
+        if (staged_.error) {
             plan_.failed.push_back(
                 {"ApplicationsSync.plist",
-                 "the todo list of the staging area cannot be used: " + *staged.error +
+                 "the todo list of the staging area cannot be used: " + *staged_.error +
                      (mustNotRun_ ? "; split it, nothing was done"
                                   : "; write the staging area anew")});
         }
@@ -202,9 +216,20 @@ class SyncRun {
             device_->removeLeftoverSyncPlaceholders();
         if (!placeholders) return unusable(placeholders.error());
         status = removeStaleTransfers(*device_, standing_.arrived);
-        if (status && !arguments_.isStaged) status = writeStagingArea(*device_, plan_, library_);
+        if (status) status = stage();
         if (status) return {};
         return unusable(status.error().withContext("cannot prepare the device for the sync"));
+    }
+
+    Status stage() {
+        if (!arguments_.isStaged) return writeStagingArea(*device_, plan_, library_);
+        if (staged_.isTakenUp) {
+            const Status again = stageAgain(*device_, staged_.list, plan_);
+            if (!again) return again;
+        }
+        // Where it cannot be noted, as in an area that is a link, an interruption is final.
+        if (staged_.list.isArray()) beginStagedSession(*device_, staged_.list).ignore();
+        return {};
     }
 
     Result<int> hold() {
@@ -217,21 +242,49 @@ class SyncRun {
         }
         Session session(*device_, **plugIn, events_, facts_, signals_->stopRequested());
         const SessionEnd end = session.sync(
-            {[this](const std::string& identifier) { return packageFile(library_, identifier); },
+            {[this](const std::string& identifier) { return packageFileFor(library_, identifier); },
              [this](const std::string& identifier) {
                  return !standing_.arrived.contains(identifier);
              }});
+        if (arguments_.isStaged && end.isSuccess()) endStagedSession(*device_);
         Result<SessionAftermath> aftermath = aftermathOf(*device_, end, facts_);
-        if (aftermath) return finish(summarize(plan_, facts_, *aftermath));
+        if (aftermath) {
+            if (end.isSuccess()) forgetFailures(aftermath->present);
+            return finish(summarize(plan_, facts_, *aftermath));
+        }
         finish(summarizeFailed(plan_, facts_, aftermath.error()));
         return aftermath.error();
     }
 
+    // What is in step with the library, an earlier update may have failed of.
+    void forgetFailures(const std::vector<ApplicationRecord>& present) {
+        if (arguments_.isStaged) return;
+        std::set<std::string> inStep;
+        for (const ApplicationRecord& each : present) {
+            const LibraryPackage* package = library_.find(each.identifier);
+            const bool isSame = !each.isPlaceholder && package != nullptr &&
+                                package->version == each.version.value_or("");
+            if (isSame) inStep.insert(each.identifier);
+        }
+        device_->forgetFailures(inStep).ignore();
+    }
+
     // On the thread of the signals, whatever the session is at. From here on the plan stays as it
-    // is, and the device is not asked: it may be what does not answer.
+    // is. What the session has said at its end comes before what is said here.
     [[noreturn]] void leave() {
-        if (isPlanned_) events_.finishSoon(timed(summarizeInterrupted(plan_, facts_)));
+        if (!isPlanned_) leaveAtOnce(console_);
+        const SyncSummary summary = timed(summaryOnLeaving());
+        events_.finishSoon(summary);
+        if (const int status = endedWith_; status >= 0) ::_exit(status);
+        if (!summary.incomplete) ::_exit(kExitDone);
         leaveAtOnce(console_);
+    }
+
+    SyncSummary summaryOnLeaving() {
+        if (isDeviceTaken_.test_and_set()) return summarizeInterrupted(plan_, facts_);
+        const Result<SessionAftermath> aftermath = aftermathOnLeaving(*device_, facts_);
+        return aftermath ? summarize(plan_, facts_, *aftermath)
+                         : summarizeInterrupted(plan_, facts_);
     }
 
     SyncSummary timed(SyncSummary summary) const {
@@ -243,11 +296,13 @@ class SyncRun {
     int finish(SyncSummary summary) {
         summary = timed(std::move(summary));
         if (arguments_.display == SyncDisplayKind::Text) {
-            for (const std::string& note : library_.notes) console_.out << printable(note) << '\n';
+            for (const std::string& note : plan_.notes) console_.out << printable(note) << '\n';
         }
+        endedWith_ = summary.incomplete ? kExitSomethingFailed : kExitDone;
         events_.finish(summary);
-        if (signals_->stopRequested()) console_.fail(failure("interrupted", kRunAgain));
-        return summary.incomplete ? kExitSomethingFailed : kExitDone;
+        const bool isInterrupted = summary.incomplete && signals_->stopRequested();
+        if (isInterrupted) console_.fail(failure("interrupted", kRunAgain));
+        return endedWith_;
     }
 
     const SyncArguments& arguments_;
@@ -260,10 +315,14 @@ class SyncRun {
     SyncPlan plan_;
     SyncPlan allowed_;  // what of it policy lets happen
     StandingInstalls standing_;
+    StagedTodoList staged_;                  // only with --staged
+    StagedWork givenUp_ = StagedWork::None;  // only without
     SpaceCheck space_;
     bool mustNotRun_ = false;
     const Clock::time_point begin_ = Clock::now();
     std::atomic<bool> isPlanned_ = false;  // the plan is made, and changes no more
+    std::atomic<int> endedWith_ = -1;      // the status that the session's own end has found
+    std::atomic_flag isDeviceTaken_;       // by whoever closes the device, or leaves it
     std::optional<StopSignals> signals_;   // not for a dry run
 };
 

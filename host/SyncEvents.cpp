@@ -55,7 +55,9 @@ namespace {
 
 bool isNews(const SyncEvent& progress, const SyncEvent& last) {
     if (last.kind == SyncEventKind::Ended) return false;  // it comes too late
-    return progress.state != last.state ||
+    // What waits is looked at all the same, and goes on only when it has come further.
+    const bool isOtherState = progress.state != last.state && last.state != SyncState::Waiting;
+    return isOtherState ||
            percentOf(progress.done, progress.total) > percentOf(last.done, last.total);
 }
 

@@ -1,8 +1,12 @@
 #include "host/SyncOutcome.h"
 
 #include <algorithm>
+#include <chrono>
+#include <future>
 #include <map>
 #include <set>
+#include <system_error>
+#include <thread>
 #include <utility>
 
 #include "device/Device.h"
@@ -20,6 +24,10 @@ bool hasUnmet(const std::vector<PlannedSkip>& skipped) {
     return std::any_of(skipped.begin(), skipped.end(),
                        [](const PlannedSkip& skip) { return skip.isUnmet; });
 }
+
+// Of a device that a process looks at before it leaves at once.
+constexpr std::chrono::milliseconds kLongestCommit{500};
+constexpr std::chrono::milliseconds kLongestLook{1000};
 
 std::string interruption() { return "interrupted: " + std::string(kRunAgain); }
 
@@ -45,7 +53,7 @@ class Summarizer {
         for (const PlannedInstall& each : plan_.update) judge(each, summary_.updated);
         judgeUnplanned();
         addUnplannedInstalls();
-        if (aftermath_.isInterrupted && summary_.failed.empty()) addSessionFailure(interruption());
+        if (isCutOffUnnoticed()) addSessionFailure(interruption());
         if (aftermath_.failure) addSessionFailure(*aftermath_.failure);
         summary_.incomplete = !summary_.failed.empty() || hasUnmet(summary_.skipped);
         return std::move(summary_);
@@ -73,6 +81,11 @@ class Summarizer {
         }
     }
 
+    // What is not named in a plan, such as the icon layout, may not have reached the device.
+    [[nodiscard]] bool isCutOffUnnoticed() const {
+        return aftermath_.isInterrupted && summary_.failed.empty() && !facts_.wasReconciled();
+    }
+
     // An interrupted session does not hear how everything ends that has begun; the device tells.
     [[nodiscard]] bool hasComeUnseen(bool isChanged) const {
         return aftermath_.isInterrupted && isChanged;
@@ -98,7 +111,9 @@ class Summarizer {
         std::set<std::string> named;
         for (const SyncFailure& each : summary_.failed) named.insert(each.identifier);
         for (const std::string& identifier : summary_.requested) {
-            if (installs_.contains(identifier) || !named.insert(identifier).second) continue;
+            // Without an identifier, the plan has named the entry by its number.
+            if (identifier.empty() || installs_.contains(identifier)) continue;
+            if (!named.insert(identifier).second) continue;
             if (const auto cause = facts_.firstFailure(identifier)) fail(identifier, *cause);
         }
     }
@@ -182,6 +197,28 @@ Result<SessionAftermath> aftermathOf(Device& device, const SessionEnd& end,
     std::optional<ErrorRecord> failure = device.databaseFailure();
     if (!failure) failure = end.error;
     if (failure) aftermath.failure = failure->description();
+    return aftermath;
+}
+
+Result<SessionAftermath> aftermathOnLeaving(Device& device, const SessionFacts& facts) {
+    using Look = Result<std::vector<ApplicationRecord>>;
+    const auto noAnswer = [] { return failure("the device does not answer", "look at it later"); };
+    std::promise<Look> promise;
+    std::future<Look> future = promise.get_future();
+    try {
+        std::thread([&device, noAnswer, kept = std::move(promise)]() mutable {
+            kept.set_value(device.freeze(kLongestCommit) ? device.applications()
+                                                         : Look(noAnswer()));
+        }).detach();
+    } catch (const std::system_error&) {
+        return noAnswer();
+    }
+    if (future.wait_for(kLongestLook) != std::future_status::ready) return noAnswer();
+    Look present = future.get();
+    if (!present) return present.error();
+    SessionAftermath aftermath = policyOf(facts);
+    aftermath.present = *std::move(present);
+    aftermath.isInterrupted = true;
     return aftermath;
 }
 

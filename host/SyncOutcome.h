@@ -31,6 +31,13 @@ struct SessionAftermath {
 [[nodiscard]] Result<SessionAftermath> aftermathOf(Device& device, const SessionEnd& end,
                                                    const SessionFacts& facts);
 
+/// The same for a process that leaves the session in its middle, and then leaves the device alone:
+/// it is kept from changing any more, so that what is said is what is found later. Takes a second
+/// at most; an error when the device has not answered by then. For the thread that ends the
+/// process.
+[[nodiscard]] Result<SessionAftermath> aftermathOnLeaving(Device& device,
+                                                          const SessionFacts& facts);
+
 /// Holds the plan against what the device holds after the session: what was asked for and did not
 /// happen is failed, with its first cause, or skipped where policy forbids it. The time is
 /// the caller's to fill in.

@@ -151,13 +151,14 @@ class Planner {
 // Plans what a todo list asks for; the list may be hostile.
 class StagedPlanner {
   public:
-    StagedPlanner(const Library& library, const std::vector<ApplicationRecord>& present)
-        : library_(library), present_(byIdentifier(present)) {}
+    StagedPlanner(const std::vector<ApplicationRecord>& present, const StagedPlanOptions& options)
+        : options_(options), present_(byIdentifier(present)) {}
 
+    // The device removes before it asks for anything, in whatever order the entries stand.
     SyncPlan make(const PropertyList& todoList) {
-        plan_.notes = library_.notes;
         std::size_t number = 0;
         for (const PropertyList& entry : todoList.elements()) add(entry, ++number);
+        for (const std::string& identifier : asked_) install(identifier);
         return std::move(plan_);
     }
 
@@ -176,22 +177,42 @@ class StagedPlanner {
                         "it is not a legal identifier");
         }
         if (isInstall) {
-            install(*identifier);
+            if (installs_.insert(*identifier).second) asked_.push_back(*identifier);
         } else {
             remove(*identifier);
         }
     }
 
     void install(const std::string& identifier) {
-        if (!installs_.insert(identifier).second) return;
         const auto found = present_.find(identifier);
-        const bool isUpdate = found != present_.end() && found->second.application != nullptr;
-        PlannedInstall planned{identifier, {}, {}, {}, 0, 0};
-        if (isUpdate) planned.oldVersion = found->second.application->version.value_or("");
-        if (const LibraryPackage* package = library_.find(identifier)) {
-            planned = plannedInstall(*package, planned.oldVersion);
+        const bool isThere = found != present_.end() && !removals_.contains(identifier);
+        if (isThere && isNotAskedFor(found->second)) {
+            plan_.skipped.push_back({identifier, whyNot(found->second), true});
+            return;
         }
-        (isUpdate ? plan_.update : plan_.install).push_back(std::move(planned));
+        const bool isInstalled = found != present_.end() && found->second.application != nullptr;
+        const std::string oldVersion =
+            isInstalled ? found->second.application->version.value_or("") : "";
+        (isThere && isInstalled ? plan_.update : plan_.install)
+            .push_back(planned(identifier, oldVersion));
+    }
+
+    // The device leaves alone what has a placeholder that is not of a sync.
+    [[nodiscard]] bool isNotAskedFor(const Present& present) const {
+        if (present.placeholder == nullptr) return false;
+        return present.isSystem() || !options_.bringsOffloaded ||
+               !isOffloaded(*present.placeholder);
+    }
+
+    [[nodiscard]] PlannedInstall planned(const std::string& identifier,
+                                         const std::string& oldVersion) const {
+        const Result<LibraryPackage> package = options_.packageOf(identifier);
+        if (package) return plannedInstall(*package, oldVersion);
+        PlannedInstall planned;
+        planned.identifier = identifier;
+        planned.oldVersion = oldVersion;
+        planned.doubt = package.error().description();
+        return planned;
     }
 
     void remove(const std::string& identifier) {
@@ -210,9 +231,10 @@ class StagedPlanner {
         plan_.failed.push_back({std::move(identifier), std::move(error)});
     }
 
-    const Library& library_;
+    const StagedPlanOptions& options_;
     const PresentByIdentifier present_;
-    std::set<std::string> installs_;
+    std::vector<std::string> asked_;  // to install, in the order of the list
+    std::set<std::string> installs_;  // the same
     std::set<std::string> removals_;
     SyncPlan plan_;
 };
@@ -224,6 +246,9 @@ std::uint64_t total(const SyncPlan& plan, Number number) {
     for (const PlannedInstall& each : plan.update) sum += number(each);
     return sum;
 }
+
+// What has arrived needs no package.
+bool isDoubtful(const PlannedInstall& each) { return !each.doubt.empty() && !each.hasArrived; }
 
 }  // namespace
 
@@ -269,12 +294,18 @@ SyncPlan allowedBy(const DeviceSettings& settings, SyncPlan plan) {
             installs->clear();
         }
     }
+    for (auto* installs : {&plan.install, &plan.update}) {
+        for (const PlannedInstall& each : *installs) {
+            if (isDoubtful(each)) plan.failed.push_back({each.identifier, each.doubt});
+        }
+        std::erase_if(*installs, isDoubtful);
+    }
     return plan;
 }
 
-SyncPlan makeStagedPlan(const PropertyList& todoList, const Library& library,
-                        const std::vector<ApplicationRecord>& present) {
-    return StagedPlanner(library, present).make(todoList);
+SyncPlan makeStagedPlan(const PropertyList& todoList, const std::vector<ApplicationRecord>& present,
+                        const StagedPlanOptions& options) {
+    return StagedPlanner(present, options).make(todoList);
 }
 
 }  // namespace appsync

@@ -1,16 +1,19 @@
 #pragma once
 
 #include <cstdint>
+#include <functional>
 #include <set>
 #include <string>
 #include <string_view>
 #include <vector>
 
+#include "host/Library.h"
+#include "platform/Result.h"
+
 namespace appsync {
 
 struct ApplicationRecord;
 struct DeviceSettings;
-struct Library;
 class PropertyList;
 
 /// What the person asked for, beside "in step with the library".
@@ -35,6 +38,7 @@ struct PlannedInstall {
     bool hasArrived = false;          // its package is on the device already, and travels no more
     bool isInstalledUnasked = false;  // the device installs it with nothing more being done
     bool isLeftOver = false;          // only an earlier session has asked for it
+    std::string doubt = {};           // why no good package of it can be sent, if there is none
 };
 
 /// Why policy keeps something from being done.
@@ -101,12 +105,23 @@ struct SpaceCheck {
                                 const std::vector<ApplicationRecord>& present,
                                 const PlanOptions& options);
 
-/// What of the plan the device's policy lets happen; the rest is skipped.
+/// What of the plan can happen: what the device's policy forbids is skipped, what has no good
+/// package has failed.
 [[nodiscard]] SyncPlan allowedBy(const DeviceSettings& settings, SyncPlan plan);
 
+/// What a staged plan has to know beside the todo list.
+struct StagedPlanOptions {
+    /// The package that would be sent for an identifier, or why there is none that a device takes.
+    std::function<Result<LibraryPackage>(const std::string& identifier)> packageOf;
+    /// The device asks for offloaded applications: where installs are coordinated.
+    bool bringsOffloaded = false;
+};
+
 /// The plan that a todo list asks for, whatever stands in it. Entries with another operation than
-/// "install" and "remove" ask for nothing.
-[[nodiscard]] SyncPlan makeStagedPlan(const PropertyList& todoList, const Library& library,
-                                      const std::vector<ApplicationRecord>& present);
+/// "install" and "remove" ask for nothing. An install without a good package is planned with a
+/// doubt, as the device asks for it all the same.
+[[nodiscard]] SyncPlan makeStagedPlan(const PropertyList& todoList,
+                                      const std::vector<ApplicationRecord>& present,
+                                      const StagedPlanOptions& options);
 
 }  // namespace appsync

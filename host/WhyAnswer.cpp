@@ -67,15 +67,24 @@ AwaitedThing awaitedOfSync(const ApplicationRecord& placeholder, bool sessionUnd
                      : awaited("install", "device", "for its install, which is under way");
 }
 
+AwaitedThing awaitedOfOffloaded(bool isCoordinated) {
+    if (isCoordinated) {
+        return awaited("sync", "host",
+                       "for its package, as it is offloaded: run appsync sync with a library that "
+                       "holds it");
+    }
+    return awaited("transfer", "host",
+                   "for its package, as it is offloaded: send it (appsync send)");
+}
+
 std::optional<AwaitedThing> awaitedOfPlaceholder(const ApplicationRecord& placeholder,
-                                                 bool sessionUnderWay) {
+                                                 bool sessionUnderWay, bool isCoordinated) {
     switch (placeholder.installType) {
         case kInstallTypeSync:
             return awaitedOfSync(placeholder, sessionUnderWay);
         case kInstallTypeDowngrade:
         case kInstallTypeIntentionalDowngrade:
-            return awaited("store", "store",
-                           "for its package, as it is offloaded: appsync send brings it back");
+            return awaitedOfOffloaded(isCoordinated);
         case kInstallTypeRestore:
             return awaited("transfer", "host",
                            "for its package, as a restore brought it back: send it (appsync send "
@@ -91,8 +100,7 @@ bool isForbidden(const ApplicationStatus& status, const DeviceSettings& settings
     if (status.coordinator) {
         return !isOfRestore(*status.coordinator) && !status.coordinator->isComplete;
     }
-    if (status.placeholder) return status.placeholder->installType == kInstallTypeSync;
-    return !status.installed;
+    return status.placeholder || !status.installed;
 }
 
 std::optional<AwaitedThing> awaitedThing(const std::string& identifier,
@@ -116,7 +124,7 @@ std::optional<AwaitedThing> awaitedThing(const std::string& identifier,
         return awaitedOfCoordinator(*status.coordinator, status.sessionUnderWay);
     }
     if (!status.placeholder) return std::nullopt;
-    return awaitedOfPlaceholder(*status.placeholder, status.sessionUnderWay);
+    return awaitedOfPlaceholder(*status.placeholder, status.sessionUnderWay, settings.coordination);
 }
 
 std::string versionText(const ApplicationRecord& record) {

@@ -364,15 +364,12 @@ def look_at(appsync, path):
     return "; ".join(line + " >/dev/null; echo $?" for line in lines)
 
 
-def test_looking_on_a_full_disk_says_that_it_is_full(appsync, tmp_path):
+def test_a_full_disk_can_be_looked_at(appsync, tmp_path):
     script = ("mount -t tmpfs -o size=1m tmpfs {0} && {1} create {0}/d >/dev/null && "
               "{{ cat /dev/zero >{0}/filler; {2}; }} 2>&1").format(tmp_path, appsync.program, look_at(appsync, "%s/d" % tmp_path))
     done = in_own_mounts(script)
-    told = [line for line in done.stdout.splitlines() if line.startswith("appsync: ")]
-    assert len(told) == len(LOOKING), done.stdout
-    for line in told:
-        assert "the disk that it is on is full" in line and "%s/d/device.db" % tmp_path in line
-    assert done.stdout.splitlines().count("3") == len(LOOKING)
+    # Nothing is installed, which `why` says.
+    assert [line for line in done.stdout.splitlines() if line.isdigit()] == ["0", "1", "0", "0"], done.stdout
 
 
 def test_looking_at_a_read_only_device_says_so(appsync, device):

@@ -16,6 +16,7 @@ import pytest
 
 import packages
 from conftest import ON_ONE_PATH, Device
+from staging import install, stage
 
 
 @pytest.fixture
@@ -70,6 +71,25 @@ def test_stopped_at_random_moments_and_run_again(appsync, larger_library, tmp_pa
         assert arrived.isdisjoint(again["requested"]) and done.isdisjoint(again["requested"])
         assert len(device.apps()) == 12 and appsync.json("coordinator", device.path, "list") == []
         assert device.sync(larger_library)["requested"] == []
+
+
+@pytest.mark.parametrize("number", [signal.SIGKILL, signal.SIGINT])
+def test_an_interrupted_staged_sync_is_taken_up_by_the_same_command(appsync, larger_library, device, number):
+    identifiers = ["com.example.app%02d" % n for n in range(12)]
+    stage(device, [install(each) for each in identifiers], side_files=identifiers)
+    sync = appsync.start("sync", device.path, larger_library, "--staged", "--json-lines")
+    for line in sync.stdout:
+        event = json.loads(line)
+        if event["event"] == "ended" and event["phase"] == "install":
+            break
+    sync.send_signal(number)
+    sync.communicate(timeout=60)
+    done = set(device.apps())
+    again = device.sync(larger_library, "--staged")
+    assert set(again["requested"]).isdisjoint(done | packages_arrived(device))
+    assert sorted(device.apps()) == identifiers
+    assert device.placeholders() == []
+    assert device.sync(larger_library, "--staged")["requested"] == []
 
 
 def test_killed_update_keeps_one_version_or_the_other(appsync, larger_library, device):

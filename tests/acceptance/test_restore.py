@@ -14,7 +14,7 @@ import zipfile
 import pytest
 
 import packages
-from conftest import Device, names_of
+from conftest import ON_ONE_PATH, Device, names_of
 from test_device import in_own_mounts
 
 DATA = "/var/mobile/Containers/Data"
@@ -245,13 +245,13 @@ def test_data_directory_that_leads_outside_is_not_backed_up(appsync, device, sto
 def test_backup_folder_must_be_new_or_empty(appsync, device, tmp_path):
     (tmp_path / "full").mkdir()
     (tmp_path / "full" / "mine").write_text("mine")
-    done = appsync("backup", device.path, tmp_path / "full", expect=1)
+    done = appsync("backup", device.path, tmp_path / "full", expect=3)
     assert "not an empty folder" in done.stderr and done.stderr.count("\n") == 1
     assert os.listdir(tmp_path / "full") == ["mine"]
     (tmp_path / "empty").mkdir()
     appsync("backup", device.path, tmp_path / "empty")
     appsync("backup", "--check", tmp_path / "empty")
-    assert "cannot make the folder" in appsync("backup", device.path, tmp_path / "no" / "way", expect=1).stderr
+    assert "cannot make the folder" in appsync("backup", device.path, tmp_path / "no" / "way", expect=3).stderr
 
 
 def test_wrong_usage(appsync, device, tmp_path):
@@ -332,6 +332,22 @@ def test_parked_package_survives_a_kill_and_its_data_installs_it(appsync, backup
     assert appsync.json("why", fresh.path, IDS[1])["waitsFor"]["what"] == "restore data"
     appsync("send", fresh.path, IDS[1], os.path.join(backup, "data", IDS[1] + ".zip"), "--restore", "--parts", "2")
     assert IDS[1] in fresh.apps()
+    assert data_of(fresh, IDS[1])["Documents/letter.txt"] == b"Dear"
+
+
+def test_data_is_not_sent_for_a_package_that_is_gone(appsync, backup, fresh, store):
+    """A loss of power can take the package, and leave what says that it waits."""
+    if fresh.is_coordinated:
+        pytest.skip("there the store brings restored packages")
+    restore(fresh, backup)
+    package = os.path.join(store, IDS[1] + ".zip")
+    data = os.path.join(backup, "data", IDS[1] + ".zip")
+    appsync("send", fresh.path, IDS[1], package, "--restore")
+    os.remove(fresh.inside("/var/mobile/Media/PublicStaging/" + IDS[1] + ".zip"))
+    result = appsync("send", fresh.path, IDS[1], data, "--restore", "--parts", "2", expect=1)
+    assert "no package of " + IDS[1] + " waits for its data: send the package first" in result.stderr
+    appsync("send", fresh.path, IDS[1], package, "--restore")
+    appsync("send", fresh.path, IDS[1], data, "--restore", "--parts", "2")
     assert data_of(fresh, IDS[1])["Documents/letter.txt"] == b"Dear"
 
 
@@ -480,6 +496,7 @@ def test_damaged_entries_fail_alone(appsync, backup, fresh):
         assert plistlib.load(file)[IDS[4]]["ApplicationSINF"] == b"\0\1\2"
 
 
+@ON_ONE_PATH
 def test_backup_that_is_cut_off_is_never_taken_for_a_whole_one(appsync, used, fresh, tmp_path):
     write_data(used, IDS[0], {"big": random.Random(4).randbytes(4_000_000)})
     start = time.monotonic()
@@ -505,6 +522,7 @@ def test_backup_that_is_cut_off_is_never_taken_for_a_whole_one(appsync, used, fr
     assert appsync.json("apps", fresh.path) == []
 
 
+@ON_ONE_PATH
 def test_backup_that_fails_says_that_it_is_not_whole(appsync, used, tmp_path):
     """The disk of the backup is full before the end."""
     write_data(used, IDS[0], {"big": random.Random(4).randbytes(3_000_000)})
@@ -585,5 +603,9 @@ def test_restore_killed_at_random_moments_and_run_again(appsync, tmp_path, coord
         assert restore(device, folder)["screen"] == wanted
         found = appsync.json("apps", device.path)
         assert {app["identifier"]: app["installType"] for app in found} == types
+        assert os.listdir(device.inside(os.path.dirname(PROCESSED_INFO))) == ["RestoreApplications.plist"]
+        assert not os.path.exists(device.inside(RESTORE_INFO))
+        archives = "/var/mobile/Media/VessikRestore/Data"
+        assert sorted(os.listdir(device.inside(archives))) == sorted(os.listdir(folder / "data"))
         shutil.rmtree(device.path)
     assert interrupted > 5

@@ -1,5 +1,7 @@
 #include <atomic>
 #include <filesystem>
+#include <fstream>
+#include <sstream>
 #include <thread>
 
 #include "host/WatchedCoordination.h"
@@ -83,6 +85,29 @@ TEST_F(CoordinatedSync, SendingTakesNoNoteOfWhatWasUninstalled) {
     EXPECT_EQ(run({"send", device, "com.a", library + "/com.a.zip"}), 0) << out.str() << err.str();
     EXPECT_EQ(run({"inventory", device, "--json"}), 0);
     EXPECT_THAT(out.str(), HasSubstr("\"deleted\": [\n    \"com.b\"\n  ]"));
+}
+
+// Changes what only unpacking reads: the packed contents of an entry.
+void damage(const std::string& package, const std::string& entry) {
+    std::fstream file(package, std::ios::in | std::ios::out | std::ios::binary);
+    std::stringstream contents;
+    contents << file.rdbuf();
+    const std::size_t place = contents.str().find(entry) + entry.size() + 4;
+    file.seekp(static_cast<std::streamoff>(place));
+    file.put(static_cast<char>(contents.str().at(place) ^ 0x20));
+}
+
+TEST_F(CoordinatedSync, AnErrorIsForgottenOnceAllIsInStep) {
+    addPackage("com.a", "2");
+    damage(library + "/com.a.zip", "Name.app/data");
+    EXPECT_EQ(sync(), 1);
+    EXPECT_EQ(run({"why", device, "com.a"}), 0);
+    EXPECT_THAT(out.str(), HasSubstr("Its last error"));
+    addPackage("com.a", "1");
+    EXPECT_EQ(sync(), 0);
+    EXPECT_EQ(run({"why", device, "com.a"}), 0);
+    EXPECT_THAT(out.str(), testing::Not(HasSubstr("Its last error")));
+    EXPECT_THAT(applications(), ElementsAre("com.a 1"));
 }
 
 TEST_F(CoordinatedSync, LookingAtTheDeviceStartsNothing) {

@@ -49,6 +49,13 @@ void HostFixture::addPackage(const std::string& identifier, const std::string& v
     EXPECT_TRUE(writePackage(folder, library + "/" + identifier + ".zip", propertyLists).ok());
 }
 
+void HostFixture::addPackageAs(const std::string& file, const std::string& identifier,
+                               const std::string& version) {
+    const std::string folder = directory.path() + "/named";
+    write(folder + "/Name.app/Info.plist", infoOf(identifier, version));
+    EXPECT_EQ(run({"package", "make", folder, library + "/" + file}), 0) << err.str();
+}
+
 std::unique_ptr<Device> HostFixture::open(DeviceAccess access) {
     DeviceOpenOptions options;
     options.access = access;

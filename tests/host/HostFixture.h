@@ -26,6 +26,9 @@ class HostFixture : public testing::Test {
 
     /// Puts an application's package into the library, as ID.zip.
     void addPackage(const std::string& identifier, const std::string& version);
+    /// The same under a file name of its own.
+    void addPackageAs(const std::string& file, const std::string& identifier,
+                      const std::string& version);
     void write(const std::string& path, std::string_view contents);
     [[nodiscard]] std::unique_ptr<Device> open(DeviceAccess access);
     /// "identifier version" of each application, "identifier placeholder" of each placeholder.

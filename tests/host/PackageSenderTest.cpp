@@ -5,6 +5,7 @@
 #include <utility>
 
 #include "host/SyncDaemon.h"
+#include "platform/FileSystem.h"
 #include "tests/host/HostFixture.h"
 
 namespace appsync {
@@ -63,6 +64,56 @@ TEST_F(PackageSending, ReplacesALinkInsteadOfFollowingIt) {
     ASSERT_TRUE(send([](std::uint64_t, std::uint64_t) { return true; }).ok());
     EXPECT_EQ(std::filesystem::file_size(victim), 8U);
     EXPECT_TRUE(std::filesystem::is_regular_file(std::filesystem::symlink_status(arrived)));
+}
+
+/// A file that the device keeps beyond the session.
+class WholeSending : public PackageSending {
+  protected:
+    WholeSending() { write(arrived, "old"); }
+
+    Result<std::uint64_t> sendWhole(const PackageSender::Progress& progress) {
+        return PackageSender(*opened).sendWhole(file, kDirectory, "com.a.zip", progress);
+    }
+    /// The names in the directory for temporary files.
+    [[nodiscard]] std::vector<std::string> temporaries() const {
+        std::vector<std::string> names;
+        for (const auto& entry :
+             std::filesystem::directory_iterator(root + opened->files().temporaryDirectory())) {
+            names.push_back(entry.path().filename());
+        }
+        return names;
+    }
+};
+
+TEST_F(WholeSending, ShowsNothingOfTheFileBeforeItIsWhole) {
+    const Result<std::uint64_t> sent = sendWhole([&](std::uint64_t, std::uint64_t) {
+        EXPECT_EQ(std::filesystem::file_size(arrived), 3U) << "the old one stands";
+        EXPECT_THAT(temporaries(), testing::SizeIs(1));
+        return true;
+    });
+    ASSERT_TRUE(sent.ok()) << sent.error().description();
+    EXPECT_EQ(std::filesystem::file_size(arrived), 2 * kMebibyte + 7);
+    EXPECT_THAT(temporaries(), testing::IsEmpty());
+}
+
+TEST_F(WholeSending, LeavesTheOldFileWhenItIsInterrupted) {
+    const Result<std::uint64_t> sent =
+        sendWhole([](std::uint64_t, std::uint64_t) { return false; });
+    ASSERT_FALSE(sent.ok());
+    EXPECT_EQ(sent.error().code, kTransferInterrupted);
+    EXPECT_EQ(std::filesystem::file_size(arrived), 3U);
+    EXPECT_THAT(temporaries(), testing::IsEmpty());
+}
+
+TEST_F(WholeSending, DoesNotTakeThePlaceOfADirectory) {
+    std::filesystem::remove(arrived);
+    write(arrived + "/inside", "kept");
+    const Result<std::uint64_t> sent = sendWhole([](std::uint64_t, std::uint64_t) { return true; });
+    ASSERT_FALSE(sent.ok());
+    EXPECT_THAT(sent.error().description(),
+                testing::HasSubstr("cannot write " + kDirectory + "/com.a.zip"));
+    EXPECT_TRUE(std::filesystem::exists(arrived + "/inside"));
+    EXPECT_THAT(temporaries(), testing::IsEmpty());
 }
 
 }  // namespace

@@ -30,6 +30,11 @@ TEST(PropertyListOutline, ShowsWholeNumbersOfBothSigns) {
               "18446744073709551615\n");
 }
 
+TEST(PropertyListOutline, ShowsWhatBreaksALine) {
+    EXPECT_EQ(propertyListOutline("a\nb\t\"c\" \\n"), "\"a\\nb\\t\\\"c\\\" \\\\n\"\n");
+    EXPECT_EQ(propertyListOutline("a\x1b[J"), "\"a?[J\"\n");
+}
+
 TEST(DateText, SurvivesDatesThatNoCalendarHolds) {
     EXPECT_EQ(dateText({1e300}), "1.0000000000000001e+300 s since 2001");
     EXPECT_EQ(dateText({std::numeric_limits<double>::quiet_NaN()}), "nan s since 2001");

@@ -56,6 +56,21 @@ TEST(SyncEvents, ATotalThatGrowsDoesNotMakeProgressGoBack) {
     EXPECT_EQ(display.events.back().done, 60U);
 }
 
+TEST(SyncEvents, WhatWaitsIsActiveAgainWhenItHasComeFurther) {
+    RecordingDisplay display;
+    SyncEvents events(display);
+    events.report(progress(50, 100));
+    SyncEvent waiting = progress(50, 100);
+    waiting.kind = SyncEventKind::Waiting;
+    waiting.state = SyncState::Waiting;
+    events.report(waiting);
+    events.report(progress(50, 100));
+    EXPECT_EQ(display.events.back().state, SyncState::Waiting);
+    events.report(progress(51, 100));
+    EXPECT_EQ(display.events.back().state, SyncState::Active);
+    EXPECT_EQ(display.events.size(), 3U);
+}
+
 TEST(SyncEvents, OnlyAWholePerCentIsNews) {
     RecordingDisplay display;
     SyncEvents events(display);

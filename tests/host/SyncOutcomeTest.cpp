@@ -86,6 +86,25 @@ TEST_F(SyncOutcome, AnInterruptionCountsWhatTheDeviceHasDoneUnseen) {
     EXPECT_THAT(open, ElementsAre("com.f", "com.b", "com.d"));
 }
 
+TEST_F(SyncOutcome, AStopThatComesWhenAllIsDoneLeavesNothingOpen) {
+    planInstall("com.a", "1");
+    present("com.a", "1");
+    facts.reconciled();
+    facts.installed("com.a");
+    aftermath.isInterrupted = true;
+    EXPECT_THAT(summary().installed, ElementsAre("com.a"));
+    EXPECT_THAT(summary().failed, IsEmpty());
+    EXPECT_FALSE(summary().incomplete);
+    EXPECT_FALSE(summarizeInterrupted(plan, facts).incomplete);
+}
+
+TEST_F(SyncOutcome, AStopBeforeTheDeviceHasTakenTheSyncOverIsNamedEvenWhenNothingIsOpen) {
+    aftermath.isInterrupted = true;
+    ASSERT_EQ(summary().failed.size(), 1U);
+    EXPECT_EQ(summary().failed[0].identifier, "session");
+    EXPECT_TRUE(summary().incomplete);
+}
+
 TEST_F(SyncOutcome, NamesTheFirstCauseOfWhatIsNotThere) {
     planInstall("com.a", "1");
     facts.failed("com.a", "the package is damaged");
@@ -182,7 +201,7 @@ TEST_F(SyncOutcome, AFailureOfTheWholeSessionIsNamedEvenWhenNothingWasPlanned) {
 
 TEST_F(SyncOutcome, ARequestThatWasNotPlannedAndFailedIsNamedOnce) {
     plan.failed.push_back({"a/b", "it is not a legal identifier"});
-    for (const char* identifier : {"a/b", "com.x"}) {
+    for (const char* identifier : {"a/b", "com.x", ""}) {
         facts.requested(identifier);
         facts.failed(identifier, "refused");
     }

@@ -3,6 +3,8 @@
 #include <gmock/gmock.h>
 #include <gtest/gtest.h>
 
+#include <set>
+
 #include "device/DeviceRecords.h"
 #include "host/Library.h"
 #include "platform/InstallProgressRecord.h"
@@ -43,6 +45,17 @@ std::vector<std::string> identifiersOf(const std::vector<PlannedInstall>& instal
     std::vector<std::string> identifiers;
     for (const PlannedInstall& each : installs) identifiers.push_back(each.identifier);
     return identifiers;
+}
+
+// A library that has a package of each of these, version 3.
+StagedPlanOptions packagesOf(std::set<std::string> identifiers, bool bringsOffloaded = false) {
+    StagedPlanOptions options;
+    options.bringsOffloaded = bringsOffloaded;
+    options.packageOf = [=](const std::string& identifier) -> Result<LibraryPackage> {
+        if (!identifiers.contains(identifier)) return ErrorRecord::make("test", 1, "no package");
+        return LibraryPackage{identifier, "3", "Name", "file", 100, 300};
+    };
+    return options;
 }
 
 PropertyList entry(PropertyList identifier, const char* operation) {
@@ -152,8 +165,8 @@ TEST(StagedPlan, FollowsTheTodoListOnceForEachIdentifier) {
     const PropertyList list = PropertyList::array(
         {entry("com.a", "install"), entry("com.a", "install"), entry("com.b", "install"),
          entry("com.c", "remove"), entry("com.d", "remove"), entry("com.e", "INSTALLED")});
-    const SyncPlan plan = makeStagedPlan(list, libraryOf({{"com.a", "3"}}),
-                                         {installed("com.b", "1"), installed("com.c", "1")});
+    const SyncPlan plan = makeStagedPlan(list, {installed("com.b", "1"), installed("com.c", "1")},
+                                         packagesOf({"com.a"}));
     ASSERT_THAT(identifiersOf(plan.install), ElementsAre("com.a"));
     EXPECT_EQ(plan.install[0].newVersion, "3");
     EXPECT_THAT(identifiersOf(plan.update), ElementsAre("com.b"));
@@ -169,7 +182,7 @@ TEST(StagedPlan, NamesEachEntryThatItCanMakeNothingOf) {
         PropertyList::array({"text", PropertyList::map(), entry(7, "install"), entry("", "remove"),
                              entry("../x", "install"), entry(std::string(300, 'x'), "install"),
                              entry(withNul, "remove")});
-    const SyncPlan plan = makeStagedPlan(list, {}, {});
+    const SyncPlan plan = makeStagedPlan(list, {}, packagesOf({}));
     EXPECT_TRUE(plan.empty());
     ASSERT_EQ(plan.failed.size(), 7U);
     EXPECT_EQ(plan.failed[0].identifier, "entry 1 of the todo list");
@@ -177,9 +190,55 @@ TEST(StagedPlan, NamesEachEntryThatItCanMakeNothingOf) {
     EXPECT_EQ(plan.failed[4].identifier, "../x");
 }
 
+TEST(StagedPlan, WhatHasNoGoodPackageHasFailedAndNeedsNothing) {
+    const PropertyList list = PropertyList::array(
+        {entry("com.a", "install"), entry("com.b", "install"), entry("com.c", "install")});
+    SyncPlan plan = makeStagedPlan(list, {installed("com.b", "1")}, packagesOf({"com.a"}));
+    EXPECT_EQ(identifiersOf(plan.install).size() + plan.update.size(), 3U)
+        << "the device asks for them all the same";
+    const SyncPlan shown = allowedBy({}, plan);
+    EXPECT_THAT(identifiersOf(shown.install), ElementsAre("com.a"));
+    EXPECT_THAT(shown.update, IsEmpty());
+    ASSERT_EQ(shown.failed.size(), 2U);
+    EXPECT_EQ(shown.failed[0].identifier, "com.c");
+    EXPECT_EQ(shown.failed[0].error, "no package");
+    EXPECT_EQ(shown.bytes(), 100U);
+    EXPECT_EQ(shown.needed(), 400U);
+    plan.install.back().hasArrived = true;
+    EXPECT_THAT(identifiersOf(allowedBy({}, plan).install), ElementsAre("com.a", "com.c"));
+}
+
+TEST(StagedPlan, SkipsWhatTheDeviceDoesNotAskForAsItHasAPlaceholder) {
+    const PropertyList list =
+        PropertyList::array({entry("com.off", "install"), entry("com.restored", "install"),
+                             entry("com.gone", "install"), entry("com.gone", "remove")});
+    const std::vector<ApplicationRecord> present = {
+        placeholder("com.off", kInstallTypeDowngrade),
+        placeholder("com.restored", kInstallTypeRestore),
+        placeholder("com.gone", kInstallTypeIntentionalDowngrade)};
+    const auto options = packagesOf({"com.off", "com.restored", "com.gone"});
+    const SyncPlan direct = makeStagedPlan(list, present, options);
+    EXPECT_THAT(identifiersOf(direct.install), ElementsAre("com.gone")) << "it is removed first";
+    ASSERT_EQ(direct.skipped.size(), 2U);
+    EXPECT_THAT(direct.skipped[0].why, HasSubstr("offloaded"));
+    EXPECT_TRUE(direct.skipped[0].isUnmet && direct.skipped[1].isUnmet);
+    const auto coordinated = packagesOf({"com.off", "com.restored", "com.gone"}, true);
+    EXPECT_THAT(identifiersOf(makeStagedPlan(list, present, coordinated).install),
+                ElementsAre("com.off", "com.gone"));
+}
+
+TEST(StagedPlan, WhatIsRemovedFirstIsInstalledAndNotUpdated) {
+    const PropertyList list =
+        PropertyList::array({entry("com.a", "remove"), entry("com.a", "install")});
+    const SyncPlan plan = makeStagedPlan(list, {installed("com.a", "1")}, packagesOf({"com.a"}));
+    EXPECT_THAT(plan.remove, ElementsAre("com.a"));
+    EXPECT_THAT(identifiersOf(plan.install), ElementsAre("com.a"));
+    EXPECT_THAT(plan.update, IsEmpty());
+}
+
 TEST(StagedPlan, AListThatIsNoneAsksForNothing) {
-    EXPECT_TRUE(makeStagedPlan(PropertyList::map(), {}, {}).empty());
-    EXPECT_TRUE(makeStagedPlan(PropertyList(), {}, {}).empty());
+    EXPECT_TRUE(makeStagedPlan(PropertyList::map(), {}, packagesOf({})).empty());
+    EXPECT_TRUE(makeStagedPlan(PropertyList(), {}, packagesOf({})).empty());
 }
 
 TEST(StagedPlan, TakesTwoHundredThousandEntries) {
@@ -187,7 +246,7 @@ TEST(StagedPlan, TakesTwoHundredThousandEntries) {
     for (int number = 0; number < 200'000; ++number) {
         list.append(entry("com.app" + std::to_string(number), "install"));
     }
-    EXPECT_EQ(makeStagedPlan(list, {}, {}).install.size(), 200'000U);
+    EXPECT_EQ(makeStagedPlan(list, {}, packagesOf({})).install.size(), 200'000U);
 }
 
 TEST(SpaceCheck, SaysWhatIsNeededWhatIsFreeAndHowMuchIsMissing) {

@@ -53,11 +53,27 @@ TEST(WhyAnswer, APlaceholderOfASyncWaitsForTheHost) {
     EXPECT_EQ(explain("com.a", status, {}).waitsFor->what, "install");
 }
 
-TEST(WhyAnswer, AnOffloadedApplicationWaitsForTheStore) {
+TEST(WhyAnswer, AnOffloadedApplicationWaitsForTheHostNotForAStoreThatKnowsNothingOfIt) {
     ApplicationStatus status;
     status.placeholder = application(true, kInstallTypeIntentionalDowngrade);
-    EXPECT_EQ(explain("com.a", status, {}).state, "placeholder");
-    EXPECT_EQ(explain("com.a", status, {}).waitsFor->who, "store");
+    DeviceSettings settings;
+    EXPECT_EQ(explain("com.a", status, settings).state, "placeholder");
+    EXPECT_EQ(explain("com.a", status, settings).waitsFor->what, "transfer");
+    EXPECT_EQ(explain("com.a", status, settings).waitsFor->who, "host");
+    settings.coordination = true;
+    EXPECT_EQ(explain("com.a", status, settings).waitsFor->what, "sync");
+    EXPECT_EQ(explain("com.a", status, settings).waitsFor->who, "host");
+}
+
+TEST(WhyAnswer, PolicyForbidsTheInstallThatAnyPlaceholderWaitsFor) {
+    DeviceSettings settings;
+    settings.installation = PolicyAnswer::No;
+    for (const std::uint64_t type :
+         {kInstallTypeSync, kInstallTypeRestore, kInstallTypeDowngrade}) {
+        ApplicationStatus status;
+        status.placeholder = application(true, type);
+        EXPECT_EQ(explain("com.a", status, settings).waitsFor->what, "policy") << type;
+    }
 }
 
 TEST(WhyAnswer, ARestoreWaitsForItsData) {

@@ -1,0 +1,371 @@
+#include "host/Restoring.h"
+
+#include <algorithm>
+#include <filesystem>
+#include <map>
+#include <set>
+#include <string_view>
+#include <utility>
+
+#include "client/Paths.h"
+#include "device/DataArchive.h"
+#include "device/Device.h"
+#include "device/PackageIdentifier.h"
+#include "host/Backup.h"
+#include "host/HostFile.h"
+#include "host/PackageSender.h"
+#include "host/PlugIn.h"
+#include "host/Problem.h"
+#include "host/RestoreDefects.h"
+#include "host/StandingInstalls.h"
+#include "platform/FileSystem.h"
+#include "platform/HomeScreenService.h"
+#include "platform/PropertyListSerialization.h"
+#include "platform/SyncClient.h"
+
+namespace appsync {
+namespace {
+
+namespace fs = std::filesystem;
+
+constexpr std::uint64_t kLargestList = std::uint64_t{2} << 30U;
+constexpr std::int64_t kApplicationsToo[] = {2, 3};
+// Where the device's files for a placeholder are named ID.app.
+constexpr std::size_t kLongestIdentifier = 251;
+// Under which an archive arrives: no name of an archive.
+constexpr const char* kPartialArchive = "arriving.part";
+
+std::string directoryOf(std::string_view path) {
+    return std::string(path.substr(0, path.rfind('/')));
+}
+
+// "it is missing" becomes " is missing", what does not begin so ": ...".
+std::string without(std::string_view subject, const std::string& sentence) {
+    const bool begins = sentence.starts_with(subject);
+    return begins ? " " + sentence.substr(subject.size()) : ": " + sentence;
+}
+
+// One restore. The restore information is the last file to be placed: without it, nothing has
+// begun, and whatever was placed is placed again the next time.
+class Restoring {
+  public:
+    Restoring(const std::string& backup, const BackupManifest& manifest, std::int64_t type,
+              Device& device, PlugIn& plugIn)
+        : backup_(backup), manifest_(manifest), type_(type), device_(device), plugIn_(plugIn) {}
+
+    // An error when the device or the backup cannot be used at all.
+    Result<RestoreResult> run() {
+        Status status = findPresent();
+        if (status) status = readRestoreInfo();
+        if (status) status = clearTheWay();
+        if (!status) return status.error();
+        checkFiles();
+        status = placeData();
+        if (status) status = placeDemotedApps();
+        if (!status) return status.error();
+        noteUnless(placeIconOrder(), kBackupIconOrder, "the order of the home screen stays");
+        if (noteUnless(placeRestoreInfo(), kBackupRestoreInfo, "nothing is restored")) {
+            plugIn_.client().reconcileRestoreOfType(type_, nullptr);
+        }
+        if (const auto error = device_.databaseFailure()) return unusable(*error);
+        status = lookAtScreen();
+        if (!status) return status.error();
+        return std::move(result_);
+    }
+
+  private:
+    Status findPresent() {
+        const Result<std::vector<ApplicationRecord>> records = device_.applications();
+        if (!records) return unusable(records.error());
+        for (const ApplicationRecord& record : *records) {
+            if (!record.isPlaceholder) installed_.insert(record.identifier);
+        }
+        const Result<DeviceSettings> settings = device_.settings();
+        if (!settings) return unusable(settings.error());
+        isCoordinated_ = settings->coordination;
+        return {};
+    }
+
+    // What is installed stays as it is, and is taken off the list. A list that is no list goes to
+    // the device as it is: the device judges it.
+    Status readRestoreInfo() {
+        const std::string name(kBackupRestoreInfo);
+        for (BackupFault& fault : checkBackup(backup_, manifest_)) {
+            if (!fault.isSurplus) faults_.emplace(fault.file, std::move(fault.error));
+        }
+        if (const auto fault = faults_.find(name); fault != faults_.end()) {
+            return unusable(pathOf(name) + without("it ", fault->second),
+                            "use another backup, or make a new one");
+        }
+        Result<Bytes> bytes = readHostFile(pathOf(name), kLargestList);
+        if (!bytes) return unusable(bytes.error());
+        restoreInfo_ = *std::move(bytes);
+        const Result<PropertyList> parsed = device_.propertyLists().parse(restoreInfo_);
+        if (parsed && parsed->isMap()) return takeOver(*parsed);
+        for (const BackedUpApplication& each : manifest_.applications) {
+            wantUnlessInstalled(each.identifier, "the restore information of the backup is no map");
+        }
+        return {};
+    }
+
+    Status takeOver(const PropertyList& info) {
+        PropertyList taken = PropertyList::map();
+        for (const auto& [identifier, entry] : info.entries()) {
+            if (!isLegalIdentifier(identifier)) {
+                fail(identifier,
+                     "this is not an identifier, so it is left out; use another backup");
+            } else if (installed_.contains(identifier)) {
+                result_.kept.push_back(identifier);
+            } else {
+                want(identifier,
+                     defectOfRestoreEntry(entry, device_.propertyLists(), isCoordinated_));
+                taken.set(identifier, entry);
+            }
+        }
+        for (const BackedUpApplication& each : manifest_.applications) {
+            if (info.find(each.identifier) != nullptr) continue;
+            wantUnlessInstalled(each.identifier,
+                                "the restore information of the backup does not name it");
+        }
+        if (taken.entries().size() == info.entries().size()) return {};
+        Result<Bytes> bytes = device_.propertyLists().serialize(taken, PropertyListFormat::Binary);
+        if (!bytes) return bytes.error();
+        restoreInfo_ = *std::move(bytes);
+        return {};
+    }
+
+    void wantUnlessInstalled(const std::string& identifier, const std::string& defect) {
+        if (installed_.contains(identifier)) {
+            result_.kept.push_back(identifier);
+        } else {
+            want(identifier, defect);
+        }
+    }
+
+    void want(const std::string& identifier, const std::string& defect) {
+        wanted_.push_back(identifier);
+        if (!defect.empty()) {
+            defects_[identifier] = defect + "; use another backup, or install it with appsync sync";
+        }
+        if (identifier.size() > kLongestIdentifier) {
+            defects_[identifier] =
+                "its identifier is too long for the files of the device; give "
+                "the application one of at most " +
+                std::to_string(kLongestIdentifier) + " bytes";
+        }
+    }
+
+    // What an interrupted sync was about to bring would go with the next sync, not stay restored.
+    Status clearTheWay() {
+        if (!bringsApplications(type_)) return {};
+        const auto removed = device_.removeLeftoverSyncPlaceholders();
+        if (!removed) return unusable(removed.error());
+        const Result<std::vector<CoordinatorRecord>> coordinators = device_.coordinators();
+        if (!coordinators) return unusable(coordinators.error());
+        const std::set<std::string> wanted(wanted_.begin(), wanted_.end());
+        for (const CoordinatorRecord& each : *coordinators) {
+            const bool isOfSync = each.client == SyncClientID && each.kind == "initiating";
+            if (!isOfSync || each.isComplete || !wanted.contains(each.identifier)) continue;
+            const Status cancelled = device_.cancelCoordinator(each.identifier, SyncClientID);
+            if (!cancelled) return unusable(cancelled.error());
+        }
+        return {};
+    }
+
+    // The data is named by its application, a list by its name.
+    void checkFiles() {
+        for (const auto& [name, error] : faults_) {
+            const std::optional<std::string> identifier = identifierOfData(name);
+            if (!identifier) {
+                fail(name, error + "; use another backup");
+                continue;
+            }
+            if (installed_.contains(*identifier)) continue;
+            std::string what = name;
+            failData(*identifier, what.append(": ").append(error));
+        }
+    }
+
+    void failData(const std::string& identifier, const std::string& error) {
+        fail(identifier, error + "; it comes back without its data: use another backup for that");
+    }
+
+    void fail(const std::string& identifier, std::string error) {
+        result_.failed.push_back({identifier, std::move(error)});
+    }
+
+    // Whether it went well; else the list is named.
+    bool noteUnless(const Status& status, std::string_view name, const char* consequence) {
+        if (!status) fail(std::string(name), status.error().description() + "; " + consequence);
+        return status.ok();
+    }
+
+    Status placeData() {
+        PackageSender sender(device_);
+        device_.files().removeItem(partialArchive()).ignore();  // of a restore that was cut off
+        std::vector<std::string> identifiers;
+        for (const BackedUpApplication& each : manifest_.applications) {
+            const std::string name = dataArchiveName(each.identifier);
+            if (!each.hasData || installed_.contains(each.identifier) || !canUse(name)) continue;
+            // An offloaded application has kept its own.
+            if (device_.files().itemExists(Device::dataPath(each.identifier))) continue;
+            if (const Status usable = checkDataArchive(pathOf(name)); !usable) {
+                failData(each.identifier, usable.error().description());
+                continue;
+            }
+            const Status placed = placeArchive(sender, each.identifier, pathOf(name));
+            if (placed) {
+                identifiers.push_back(each.identifier);
+            } else {
+                fail(each.identifier,
+                     placed.error().description() + "; until then it comes back without its data");
+            }
+        }
+        // Where installs are coordinated, nobody sends the data: it counts as there.
+        if (isCoordinated_ || identifiers.empty()) return {};
+        const Status known = device_.expectRestoreData(identifiers);
+        return known ? known : Status(unusable(known.error()));
+    }
+
+    // Under another name first: an archive is there whole, or not at all.
+    Status placeArchive(PackageSender& sender, const std::string& identifier,
+                        const std::string& file) {
+        const std::string path = Device::restoreDataPath(identifier);
+        const std::string directory = directoryOf(path);
+        const Result<std::uint64_t> sent = sender.send(
+            file, directory, kPartialArchive, [](std::uint64_t, std::uint64_t) { return true; });
+        if (!sent) return sent.error();
+        device_.files().removeItem(path).ignore();
+        return device_.files().moveItem(partialArchive(), path);
+    }
+
+    static std::string partialArchive() {
+        return directoryOf(Device::restoreDataPath("any")) + "/" + kPartialArchive;
+    }
+
+    // A list that is none goes to the device all the same: the device judges it. One that the
+    // device cannot hold is an error: without it what was offloaded would come back as the others,
+    // for good.
+    Status placeDemotedApps() {
+        constexpr const char* kConsequence = "nobody counts as offloaded";
+        device_.files().removeItem(std::string(kDemotedAppsPath)).ignore();
+        if (!canUse(kBackupDemotedApps)) return {};
+        const Result<Bytes> bytes = readHostFile(pathOf(kBackupDemotedApps), kLargestList);
+        if (!noteUnless(bytes ? Status() : Status(bytes.error()), kBackupDemotedApps,
+                        kConsequence)) {
+            return {};
+        }
+        const std::string defect = defectOfDemotedApps(device_.propertyLists().parse(*bytes));
+        if (!defect.empty()) {
+            noteUnless(failure(defect, "use another backup"), kBackupDemotedApps, kConsequence);
+        }
+        return write(kDemotedAppsPath, *bytes);
+    }
+
+    Status write(std::string_view path, ByteView contents) {
+        const FileAttributes mobile{"mobile", "mobile"};
+        const Status made = device_.files().createDirectory(directoryOf(path), true, &mobile);
+        if (!made) return made;
+        return device_.files().writeFileAtomically(std::string(path), contents);
+    }
+
+    // What stands on the home screen keeps its place; the others come after it.
+    Status placeIconOrder() {
+        if (!canUse(kBackupIconOrder)) return {};
+        const Result<Bytes> bytes = readHostFile(pathOf(kBackupIconOrder), kLargestList);
+        if (!bytes) return bytes.error();
+        const auto screen = plugIn_.platform().homeScreen.blockableConnection();
+        PropertyList order = PropertyList::array();
+        std::set<std::string> seen;
+        const auto append = [&](ByteView list) {
+            const Result<PropertyList> parsed = device_.propertyLists().parse(list);
+            if (!parsed || !parsed->isArray()) return false;
+            for (const PropertyList& each : parsed->elements()) {
+                const std::string* identifier = each.asString();
+                if (identifier != nullptr && seen.insert(*identifier).second) order.append(each);
+            }
+            return true;
+        };
+        if (const auto now = screen->flattenedIconState(1)) append(*now);
+        if (!append(*bytes)) return failure("it is no list", "use another backup");
+        const Result<Bytes> state =
+            device_.propertyLists().serialize(order, PropertyListFormat::Binary);
+        if (!state) return state.error();
+        if (screen->setIconState(*state)) return {};
+        return failure("the home screen refuses it", "see appsync log");
+    }
+
+    // Beside the place where it goes once it has been processed.
+    Status placeRestoreInfo() {
+        const FileAttributes mobile{"mobile", "mobile"};
+        const Status made =
+            device_.files().createDirectory(directoryOf(kProcessedRestoreInfoPath), true, &mobile);
+        return made ? write(kRestoreInfoPath, restoreInfo_) : made;
+    }
+
+    Status lookAtScreen() {
+        const Result<std::vector<ApplicationRecord>> shown = device_.homeScreenApplications();
+        if (!shown) return unusable(shown.error());
+        std::set<std::string> present;
+        for (const ApplicationRecord& record : *shown) {
+            present.insert(record.identifier);
+            result_.screen.push_back({record.identifier, record.name.value_or(record.identifier),
+                                      record.version, record.isPlaceholder});
+        }
+        if (!bringsApplications(type_)) return {};
+        for (const std::string& identifier : wanted_) {
+            if (present.contains(identifier)) {
+                result_.restored.push_back(identifier);
+            } else {
+                fail(identifier, whyMissing(identifier));
+            }
+        }
+        return {};
+    }
+
+    std::string whyMissing(const std::string& identifier) {
+        const auto defect = defects_.find(identifier);
+        if (defect != defects_.end()) return defect->second;
+        const Result<ApplicationStatus> status = device_.status(identifier);
+        if (status && status->coordinator && status->coordinator->client != SyncClientID) {
+            return heldSentence(status->coordinator->client);
+        }
+        if (status && status->lastFailure) return status->lastFailure->error.description();
+        return "the device has made no placeholder of it: see appsync log";
+    }
+
+    [[nodiscard]] bool canUse(std::string_view name) const {
+        return manifest_.holds(name) && !faults_.contains(std::string(name));
+    }
+
+    [[nodiscard]] std::string pathOf(std::string_view name) const {
+        return (fs::path(backup_) / name).native();
+    }
+
+    const std::string& backup_;
+    const BackupManifest& manifest_;
+    const std::int64_t type_;
+    Device& device_;
+    PlugIn& plugIn_;
+    bool isCoordinated_ = false;
+    std::set<std::string> installed_;
+    std::vector<std::string> wanted_;
+    std::map<std::string, std::string> defects_;  // by identifier
+    std::map<std::string, std::string> faults_;   // by file of the backup
+    Bytes restoreInfo_;
+    RestoreResult result_;
+};
+
+}  // namespace
+
+bool bringsApplications(std::int64_t type) {
+    return std::find(std::begin(kApplicationsToo), std::end(kApplicationsToo), type) !=
+           std::end(kApplicationsToo);
+}
+
+Result<RestoreResult> restoreBackup(const std::string& backup, const BackupManifest& manifest,
+                                    std::int64_t type, Device& device, PlugIn& plugIn) {
+    return Restoring(backup, manifest, type, device, plugIn).run();
+}
+
+}  // namespace appsync
