@@ -1,0 +1,173 @@
+"""What test_full_disk.py runs in a mount namespace of its own, where DISK is a small disk.
+
+    full_disk.py grow|look|remove APPSYNC DISK FOLDER COORDINATION STRIDE
+"""
+
+import os
+import re
+import shutil
+import sqlite3
+import subprocess
+import sys
+import tempfile
+
+sys.path.insert(0, os.path.join(os.path.dirname(os.path.abspath(__file__)), "..", "acceptance"))
+import packages
+
+PAGE = 4  # KiB
+SAYS_FULL = re.compile("is full|bytes and [0-9]+ are free|No space left|does not fit|do not fit|missing")
+
+
+class Disk:
+    """A tmpfs that can be made larger and be filled to the last byte."""
+
+    def __init__(self, where, kib):
+        self.where = where
+        subprocess.run(["mount", "-t", "tmpfs", "-o", "size=%dk" % kib, "tmpfs", where], check=True)
+
+    def resize(self, kib):
+        subprocess.run(["mount", "-o", "remount,size=%dk" % kib, self.where], check=True)
+
+    def used(self):
+        space = os.statvfs(self.where)
+        return (space.f_blocks - space.f_bfree) * space.f_frsize // 1024
+
+    def free(self):
+        space = os.statvfs(self.where)
+        return space.f_bavail * space.f_frsize
+
+    def fill(self):
+        """Takes all that is left, as somebody else's file."""
+        with open(os.path.join(self.where, "ballast"), "ab", buffering=0) as file:
+            try:
+                while True:
+                    file.write(bytes(4096))
+            except OSError:
+                pass
+        assert self.free() == 0
+
+
+class Runner:
+    def __init__(self, program, disk, folder, coordination):
+        self.program = program
+        self.disk = disk
+        self.device = os.path.join(disk.where, "device")
+        self.library = os.path.join(folder, "library")
+        self.folder = folder
+        packages.make_library(self.library, 3)
+        self.ok("create", self.device, "--coordination", coordination)
+
+    def run(self, *arguments):
+        done = subprocess.run([self.program, *arguments], capture_output=True, text=True, timeout=100)
+        assert done.returncode in (0, 1, 3), (arguments, done.returncode, done.stdout, done.stderr)
+        return done
+
+    def ok(self, *arguments):
+        done = self.run(*arguments)
+        assert done.returncode == 0, (arguments, done.returncode, done.stdout, done.stderr)
+        return done.stdout
+
+    def refused(self, *arguments):
+        """It fails, and says that the space does not suffice."""
+        done = self.run(*arguments)
+        said = done.stdout + done.stderr
+        assert done.returncode != 0, (arguments, said)
+        assert SAYS_FULL.search(said), (arguments, said)
+        return said
+
+    def check_intact(self):
+        """A copy of the database is whole: looking at it in its place takes space."""
+        with tempfile.TemporaryDirectory() as folder:
+            for name in os.listdir(self.device):
+                if name in ("device.db", "device.db-wal"):
+                    shutil.copy(os.path.join(self.device, name), folder)
+            database = sqlite3.connect(os.path.join(folder, "device.db"))
+            assert database.execute("PRAGMA integrity_check").fetchall() == [("ok",)]
+            database.close()
+
+
+def grow(runner, stride):
+    """The disk grows until a sync fits; at each size it fails in a clear way and leaves the device whole."""
+    base = runner.device + ".base"
+    shutil.copytree(runner.device, base, symlinks=True)
+    start = runner.disk.used()
+    fits = first_fit(runner, start, stride)
+    if stride > PAGE:  # the last steps again, one by one
+        shutil.rmtree(runner.device)
+        shutil.copytree(base, runner.device, symlinks=True)
+        fits = first_fit(runner, fits - stride, PAGE)
+    runner.check_intact()
+    assert len(runner.ok("apps", runner.device).splitlines()) == 4
+    print("fits with %d KiB left" % (fits - start))
+
+
+def first_fit(runner, kib, stride):
+    for attempt in range(1000):
+        runner.disk.resize(kib)
+        done = runner.run("sync", runner.device, runner.library)
+        if done.returncode == 0:
+            return kib
+        said = done.stdout + done.stderr
+        assert SAYS_FULL.search(said), (kib, said)
+        runner.ok("apps", runner.device)
+        runner.check_intact()
+        kib += stride
+    raise AssertionError("never fits")
+
+
+def look(runner, _):
+    """With nothing left, everything can be looked at, and what would write says why it cannot."""
+    identifier = "com.example.app00"
+    runner.ok("sync", runner.device, runner.library)
+    runner.disk.fill()
+    check_looks(runner, identifier)
+    for arguments in (["set", runner.device, "installation=no"], ["run", runner.device, identifier],
+                      ["sync", runner.device, runner.library],
+                      ["sync", runner.device, runner.library, "--remove", identifier]):
+        assert "uninstall" in runner.refused(*arguments) or arguments[0] != "sync"
+    runner.check_intact()
+    check_looks(runner, identifier)
+
+
+def check_looks(runner, identifier):
+    device = runner.device
+    assert identifier in runner.ok("apps", device)
+    assert "installed" in runner.ok("why", device, identifier)
+    runner.ok("inventory", device, "--json")
+    assert runner.ok("history", device).count("\n") > 3
+    assert runner.ok("log", device).count("\n") > 3
+    runner.ok("coordinator", device, "list")
+    runner.ok("screen", device, os.path.join(runner.folder, "screen.png"))
+    runner.ok("plan", device, runner.library)  # nothing to do
+
+
+def remove(runner, _):
+    """With nothing left, an application can be removed all the same, and the sync data."""
+    runner.ok("sync", runner.device, runner.library)
+    base = os.path.join(runner.folder, "base")
+    shutil.copytree(runner.device, base, symlinks=True)
+    for arguments in (["uninstall", runner.device, "com.example.app00"], ["reset", runner.device],
+                      ["demote", runner.device, "com.example.app01"]):
+        shutil.rmtree(runner.device)
+        shutil.copytree(base, runner.device, symlinks=True)
+        runner.disk.fill()
+        runner.ok(*arguments)
+        runner.check_intact()
+        if arguments[0] == "uninstall":
+            assert "com.example.app00" not in runner.ok("apps", runner.device)
+        os.remove(os.path.join(runner.disk.where, "ballast"))
+        runner.ok("reset", runner.device)  # the end of a session: the device keeps a reserve again
+        runner.disk.fill()
+        runner.ok("uninstall", runner.device, "com.example.app02")
+        os.remove(os.path.join(runner.disk.where, "ballast"))
+        runner.ok("sync", runner.device, runner.library)
+        assert len(runner.ok("apps", runner.device).splitlines()) == 4
+
+
+def main():
+    what, program, where, folder, coordination, stride = sys.argv[1:]
+    disk = Disk(where, 2048 if what == "grow" else 8192)
+    {"grow": grow, "look": look, "remove": remove}[what](Runner(program, disk, folder, coordination), int(stride))
+
+
+main()
