@@ -12,6 +12,9 @@ endfunction()
 function(appsync_finish_library target)
     set_target_properties(${target} PROPERTIES LINKER_LANGUAGE CXX)
     target_include_directories(${target} PUBLIC "${CMAKE_SOURCE_DIR}")
+    if(APPSYNC_MERGE_SOURCES)
+        set_target_properties(${target} PROPERTIES UNITY_BUILD ON UNITY_BUILD_BATCH_SIZE 12)
+    endif()
 endfunction()
 
 # A static library TARGET of the calling folder's sources, linked with LIBRARIES.

@@ -1,15 +1,9 @@
 #include <cstddef>
 #include <cstdint>
 
-#include "fuzz/PropertyListFuzz.h"
-#include "system/PropertyListBinaryReader.h"
+#include "fuzz/Fuzz.h"
+#include "fuzz/readers/FileReaders.h"
 
 extern "C" int LLVMFuzzerTestOneInput(const std::uint8_t* data, std::size_t size) {
-    const auto value = appsync::readBinaryPropertyList({data, size});
-    if (value) {
-        appsync::requireRoundTrip(*value);
-    } else {
-        appsync::require(value.error().userInfo.find("offset") != nullptr);
-    }
-    return 0;
+    return appsync::fuzz({data, size}, {appsync::readBinaryList});
 }

@@ -1,0 +1,149 @@
+#include "fuzz/readers/FileReaders.h"
+
+#include <algorithm>
+#include <array>
+#include <compare>
+#include <cstdint>
+#include <filesystem>
+#include <string_view>
+
+#include "device/DataArchive.h"
+#include "device/IconDrawing.h"
+#include "device/PackageIdentifier.h"
+#include "device/PackageReader.h"
+#include "fuzz/readers/ScratchDirectory.h"
+#include "host/Backup.h"
+#include "host/Versions.h"
+#include "system/PropertyListBinaryReader.h"
+#include "system/PropertyListCodec.h"
+#include "system/PropertyListPlainXmlReader.h"
+#include "system/PropertyListXmlReader.h"
+
+namespace appsync {
+
+namespace {
+
+constexpr std::uint64_t kMostUnpacked = std::uint64_t{1} << 20U;
+constexpr std::uint64_t kMostEntries = 100;
+
+/// In binary always; in XML when XML can carry it.
+bool isReadBackEqual(const PropertyList& value) {
+    SystemPropertyLists codec;
+    const auto binary = codec.serialize(value, PropertyListFormat::Binary);
+    if (!binary) return false;
+    const auto fromBinary = codec.parse(*binary);
+    if (!fromBinary || *fromBinary != value) return false;
+    const auto xml = codec.serialize(value, PropertyListFormat::Xml);
+    if (!xml) return true;
+    const auto fromXml = codec.parse(*xml);
+    return fromXml.ok() && *fromXml == value;
+}
+
+Reading readList(const Result<PropertyList>& value, std::string_view placeKey) {
+    if (value) {
+        return Reading::read().unless(isReadBackEqual(*value), "it does not read back equal");
+    }
+    return Reading::refused(value.error().description())
+        .unless(value.error().userInfo.find(placeKey) != nullptr, "the refusal names no place");
+}
+
+Reading unpackAndLook(PackageReader& package) {
+    const PackageInfo& info = package.info();
+    const ScratchDirectory target;
+    const Status unpacked = package.unpackInto(target.open().get());
+    if (!unpacked) return Reading::refused(unpacked.error().description());
+    std::uint64_t bytes = 0;
+    const std::string danger = target.findDanger(bytes);
+    const auto infoFile =
+        std::filesystem::path(target.path()) / info.bundleDirectoryName / "Info.plist";
+    return Reading::read()
+        .unless(danger.empty(), danger)
+        .unless(bytes == info.unpackedBytes, "it is not of the size that was announced")
+        .unless(std::filesystem::is_regular_file(infoFile), "it has no Info.plist");
+}
+
+std::string_view nextLine(std::string_view& text) {
+    const std::size_t end = std::min(text.find('\n'), text.size());
+    const std::string_view line = text.substr(0, end);
+    text.remove_prefix(std::min(end + 1, text.size()));
+    return line;
+}
+
+}  // namespace
+
+Reading readXmlList(ByteView bytes) {
+    const auto value = readXmlPropertyList(bytes);
+    const auto plain = readPlainXmlPropertyList(bytes);
+    return readList(value, "line")
+        .unless(!plain || (value.ok() && *value == *plain), "the plain form reads otherwise");
+}
+
+Reading readBinaryList(ByteView bytes) { return readList(readBinaryPropertyList(bytes), "offset"); }
+
+Reading readPackage(ByteView bytes) {
+    SystemPropertyLists propertyLists;
+    auto package = PackageReader::open(fileOf(bytes).get(), "foreign.zip", propertyLists);
+    if (!package) return Reading::refused(package.error().description());
+    const PackageInfo& info = package->info();
+    static_cast<void>(package->readStoreMetadata());
+    static_cast<void>(package->readBundleFile(info.iconFile, kMostUnpacked));
+    const bool isSmall = info.unpackedBytes <= kMostUnpacked && info.entryCount <= kMostEntries;
+    return (isSmall ? unpackAndLook(*package) : Reading::read())
+        .unless(isLegalIdentifier(info.identifier), "its identifier is not legal");
+}
+
+Reading readDataArchive(ByteView bytes) {
+    const ScratchDirectory target;
+    const Status unpacked =
+        unpackDataArchive(fileOf(bytes).get(), "foreign.zip", target.open().get());
+    std::uint64_t unpackedBytes = 0;
+    const std::string danger = target.findDanger(unpackedBytes);
+    return (unpacked ? Reading::read() : Reading::refused(unpacked.error().description()))
+        .unless(danger.empty(), danger);
+}
+
+Reading readIcon(ByteView bytes) {
+    const Result<Bytes> icon = renderIcon(bytes);
+    if (!icon) return Reading::refused(icon.error().description());
+    return Reading::read().unless(!icon->empty(), "it became no picture");
+}
+
+Reading readManifest(ByteView bytes) {
+    const Result<BackupManifest> manifest = parseBackupManifest(bytes, "foreign.json");
+    if (!manifest) {
+        return Reading::refused(manifest.error().description())
+            .unless(manifest.error().description().find("foreign.json") != std::string::npos,
+                    "the refusal does not name the file");
+    }
+    const auto isLegal = [](const BackedUpApplication& each) {
+        return isLegalIdentifier(each.identifier);
+    };
+    const auto isInside = [](const auto& file) {
+        return file.first.find("..") == std::string::npos || file.first.starts_with("data/");
+    };
+    return Reading::read()
+        .unless(std::ranges::all_of(manifest->applications, isLegal), "an illegal identifier")
+        .unless(std::ranges::all_of(manifest->files, isInside), "a file outside the backup");
+}
+
+Reading readVersions(ByteView bytes) {
+    std::string_view text(reinterpret_cast<const char*>(bytes.data()), bytes.size());
+    std::array<std::string_view, 3> versions;
+    for (std::string_view& version : versions) version = nextLine(text);
+    Reading reading = Reading::read();
+    for (const std::string_view a : versions) {
+        for (const std::string_view b : versions) {
+            const std::weak_ordering there = compareVersions(a, b);
+            reading = std::move(reading).unless(there == 0 <=> compareVersions(b, a),
+                                                "turned round it is another order");
+            for (const std::string_view c : versions) {
+                if (there > 0 || compareVersions(b, c) > 0) continue;
+                reading = std::move(reading).unless(compareVersions(a, c) <= 0,
+                                                    "the order goes round in a circle");
+            }
+        }
+    }
+    return reading;
+}
+
+}  // namespace appsync
