@@ -77,6 +77,18 @@ Result<DeviceSettingsChange> parseAssignments(const std::vector<std::string>& as
     return change;
 }
 
+// Without coordination no coordinator outlives the opening of a session; whoever turns it off hears
+// whose goes.
+int tellWhatEnds(Device& device, const Console& console) {
+    const Result<std::vector<CoordinatorRecord>> ending = device.coordinators();
+    if (!ending) return console.fail(unusable(ending.error()));
+    if (ending->empty()) return kExitDone;
+    console.out << "The next session gives up what has a coordinator:";
+    for (const CoordinatorRecord& each : *ending) console.out << " " << each.identifier;
+    console.out << "\nTo keep it, turn coordination on again before that.\n";
+    return kExitDone;
+}
+
 }  // namespace
 
 int runCreate(const std::string& device, bool coordination, const Console& console) {
@@ -98,7 +110,7 @@ int runSet(const std::string& device, const std::vector<std::string>& assignment
     if (!opened) return console.fail(opened.error());
     const Status changed = (*opened)->change(*change);
     if (!changed) return console.fail(classified(changed.error()));
-    return kExitDone;
+    return change->coordination == false ? tellWhatEnds(**opened, console) : kExitDone;
 }
 
 int runRun(const std::string& device, const std::string& identifier, const Console& console) {

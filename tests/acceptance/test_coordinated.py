@@ -346,7 +346,10 @@ def test_send_waits_for_a_staging_area_to_be_taken_over(appsync, device, library
     assert device.sync(library, "--staged")["installed"] == [A]
 
 
-def test_turning_coordination_off_drops_what_stands(appsync, device, interrupted):
+def test_turning_coordination_off_drops_what_stands_and_says_so(appsync, device, interrupted):
+    told = appsync("set", device.path, "coordination=off").stdout
+    assert "what has a coordinator: %s %s\n" % (A, B) in told
+    assert appsync("set", device.path, "coordination=on").stdout == ""
     appsync("set", device.path, "coordination=off")
     assert names_of(device.sync(interrupted)["installed"]) == [A, B]
     assert device.placeholders() == [] and coordinators(device) == {}
