@@ -15,6 +15,7 @@
 #include "host/Commands.h"
 #include "host/Console.h"
 #include "host/HostFile.h"
+#include "host/InterruptedStaging.h"
 #include "host/Interruption.h"
 #include "host/Library.h"
 #include "host/LibraryReader.h"
@@ -125,8 +126,16 @@ class Sending {
                                " back, and its package is the store's to bring",
                            "see appsync store");
         }
-        if (!device_->files().itemExists(std::string(kStagingArea))) return {};
-        return failure("a host has left a staging area on the device",
+        return checkStagedWork();
+    }
+
+    // This session's own staging area would take the place of the host's.
+    Status checkStagedWork() const {
+        const StagedWork work = stagedWorkOn(*device_);
+        if (work == StagedWork::None) return {};
+        return failure(work == StagedWork::Waiting
+                           ? "a host has left a staging area on the device"
+                           : "an interrupted sync --staged has left something to do on the device",
                        "take it over first with appsync sync --staged");
     }
 

@@ -2,6 +2,7 @@
 
 import json
 import os
+import plistlib
 import shutil
 import signal
 import sqlite3
@@ -344,6 +345,30 @@ def test_send_waits_for_a_staging_area_to_be_taken_over(appsync, device, library
     done = appsync("send", device.path, B, os.path.join(library, B + ".zip"), expect=1)
     assert "--staged" in done.stderr
     assert device.sync(library, "--staged")["installed"] == [A]
+
+
+def test_send_takes_the_place_of_a_staging_area_that_a_killed_command_has_left(appsync, device, library):
+    area = stage(device, [install(A)], side_files=[A])
+    with open(os.path.join(area, "Host session.plist"), "wb") as record:
+        plistlib.dump("library", record)
+    appsync("send", device.path, B, os.path.join(library, B + ".zip"))
+    assert list(device.apps()) == [B] and not os.path.exists(area)
+
+
+def test_send_waits_for_what_an_interrupted_staged_sync_has_left(appsync, device, library, large_library):
+    stage(device, [install(A), install(B)], side_files=[A, B])
+    sync = appsync.start("sync", device.path, large_library, "--staged", "--json-lines")
+    for line in sync.stdout:
+        if json.loads(line)["event"] == "progress":
+            break
+    sync.kill()
+    sync.communicate()
+    other = "com.example.app03"
+    package = os.path.join(library, other + ".zip")
+    assert "--staged" in appsync("send", device.path, other, package, expect=1).stderr
+    assert names_of(device.sync(large_library, "--staged")["installed"]) == [A, B]
+    appsync("send", device.path, other, package)
+    assert sorted(device.apps()) == [A, B, other]
 
 
 def test_turning_coordination_off_drops_what_stands_and_says_so(appsync, device, interrupted):
