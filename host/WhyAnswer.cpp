@@ -117,7 +117,8 @@ std::optional<AwaitedThing> awaitedThing(const std::string& identifier,
     if (status.awaitsRestoreData) {
         return awaited(
             "restore data", "host",
-            "for its data: send it (appsync send --restore --parts 2) after its package");
+            "for its data: send it after its package (appsync send --restore --parts 1, then "
+            "--parts 2), or send the package with --parts 3 to use what the restore has left");
     }
     if (isForbidden(status, settings)) return awaitedOfPolicy();
     if (status.coordinator) {
