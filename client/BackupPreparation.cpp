@@ -8,15 +8,10 @@ namespace {
 
 constexpr std::string_view kAutoDownloadKey = "is-auto-download";
 
-bool isMarkedAutoDownload(const PropertyList& metadata) {
-    const PropertyList* mark = metadata.find(kAutoDownloadKey);
-    return mark != nullptr && mark->booleanConversion().value_or(false);
-}
-
 void clearAutoDownload(const Platform& platform, const AppProxy& proxy) {
     const std::string path = storeMetadataPath(proxy);
     std::optional<PropertyList> metadata = readMapFile(platform, path);
-    if (!metadata || !isMarkedAutoDownload(*metadata)) return;
+    if (!metadata || !metadata->findFlag(kAutoDownloadKey)) return;
     metadata->erase(kAutoDownloadKey);
     const Log log(platform);
     log(Level::Default, "%s|clearing is-auto-download value for %{public}@",

@@ -29,8 +29,7 @@ struct Platform;
                                                       const std::string& path);
 
 /// Writes a property list atomically; what XML has no words for, in the binary encoding. The error
-/// of whichever failed, the encoder or the file
-/// system; nothing is written then.
+/// of whichever failed, the encoder or the file system; nothing is written then.
 Status writePropertyListFile(const Platform& platform, const std::string& path,
                              const PropertyList& value, PropertyListFormat format);
 

@@ -119,7 +119,11 @@ Reading readManifest(ByteView bytes) {
         return isLegalIdentifier(each.identifier);
     };
     const auto isInside = [](const auto& file) {
-        return file.first.find("..") == std::string::npos || file.first.starts_with("data/");
+        constexpr std::string_view kFolder = "data/";
+        std::string_view name = file.first;
+        if (name.starts_with(kFolder)) name.remove_prefix(kFolder.size());
+        return !name.empty() && name != "." && name != ".." &&
+               name.find('/') == std::string_view::npos;
     };
     return Reading::read()
         .unless(std::ranges::all_of(manifest->applications, isLegal), "an illegal identifier")

@@ -27,7 +27,7 @@ PropertyList removals() {
     return PropertyList::array({World::entry(kA, "remove"), World::entry(kB, "remove")});
 }
 
-/// The client's answer to the host is the one that is specified.
+/// The client's answer to the host is the one that it promises.
 void expect(Invariants& invariants, bool holds, const char* what) {
     if (!holds) invariants.violate(what);
 }
