@@ -1,8 +1,8 @@
 #include <ostream>
 
-#include "device/PackageIdentifier.h"
 #include "host/Commands.h"
 #include "host/Console.h"
+#include "host/IdentifierArgument.h"
 #include "host/JsonRecords.h"
 #include "host/OpenDevice.h"
 #include "host/Problem.h"
@@ -22,13 +22,11 @@ Status checkArguments(const CoordinatorArguments& arguments) {
     if (isList && !arguments.identifier.empty()) {
         return wrongUsage("coordinator list takes no identifier", "leave it out");
     }
-    if (isList || isLegalIdentifier(arguments.identifier)) return {};
-    if (arguments.identifier.empty()) {
+    if (!isList && arguments.identifier.empty()) {
         return wrongUsage("coordinator " + arguments.action + " needs an identifier",
                           "name the application");
     }
-    return wrongUsage(printable(arguments.identifier) + " is not an identifier",
-                      "use letters, digits, '.', '-' and '_'");
+    return isList ? Status() : checkIdentifier(arguments.identifier, kUseLegalCharacters);
 }
 
 std::string promisesText(const CoordinatorRecord& coordinator) {

@@ -5,9 +5,9 @@
 
 #include "device/Device.h"
 #include "device/DeviceError.h"
-#include "device/PackageIdentifier.h"
 #include "host/Commands.h"
 #include "host/Console.h"
+#include "host/IdentifierArgument.h"
 #include "host/OpenDevice.h"
 #include "host/PlugIn.h"
 #include "host/Problem.h"
@@ -17,17 +17,11 @@
 namespace appsync {
 namespace {
 
-Status checkIdentifier(const std::string& identifier) {
-    if (isLegalIdentifier(identifier)) return {};
-    return wrongUsage((identifier.empty() ? "''" : identifier) + " is not an identifier",
-                      "give one as appsync apps shows it");
-}
-
 // Does something to one application of a device and says that it is done.
 template <typename Action>
 int actOn(const std::string& path, const std::string& identifier, const DeviceOpenOptions& options,
           std::string_view done, const Console& console, Action action) {
-    const Status checked = checkIdentifier(identifier);
+    const Status checked = checkIdentifier(identifier, kGiveAsShown);
     if (!checked) return console.fail(checked.error());
     const Result<std::unique_ptr<Device>> device = openDevice(path, options);
     if (!device) return console.fail(device.error());

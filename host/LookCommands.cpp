@@ -4,10 +4,10 @@
 
 #include "device/Device.h"
 #include "device/HomeScreenPicture.h"
-#include "device/PackageIdentifier.h"
 #include "host/Commands.h"
 #include "host/Console.h"
 #include "host/HostFile.h"
+#include "host/IdentifierArgument.h"
 #include "host/JsonRecords.h"
 #include "host/OpenDevice.h"
 #include "host/PlugIn.h"
@@ -119,11 +119,8 @@ int runApps(const std::string& device, bool asJson, const Console& console) {
 
 int runWhy(const std::string& device, const std::string& identifier, bool asJson,
            const Console& console) {
-    if (!isLegalIdentifier(identifier)) {
-        return console.fail(
-            wrongUsage((identifier.empty() ? "''" : identifier) + " is not an identifier",
-                       "give one as appsync apps shows it"));
-    }
+    const Status checked = checkIdentifier(identifier, kGiveAsShown);
+    if (!checked) return console.fail(checked.error());
     return lookAt(device, console, [&](Device& opened) -> Status {
         const Result<ApplicationStatus> status = opened.status(identifier);
         if (!status) return status.error();

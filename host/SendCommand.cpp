@@ -15,6 +15,7 @@
 #include "host/Commands.h"
 #include "host/Console.h"
 #include "host/HostFile.h"
+#include "host/IdentifierArgument.h"
 #include "host/InterruptedStaging.h"
 #include "host/Interruption.h"
 #include "host/Library.h"
@@ -38,10 +39,8 @@ namespace {
 using Clock = std::chrono::steady_clock;
 
 Status checkArguments(const SendArguments& arguments) {
-    if (!isLegalIdentifier(arguments.identifier)) {
-        const std::string shown = arguments.identifier.empty() ? "''" : arguments.identifier;
-        return wrongUsage(shown + " is not an identifier", "use letters, digits, '.', '-' and '_'");
-    }
+    const Status legal = checkIdentifier(arguments.identifier, kUseLegalCharacters);
+    if (!legal) return legal;
     if (!arguments.isRestore && arguments.parts != kAssetPartApplication) {
         return wrongUsage("--parts " + std::to_string(arguments.parts) + " without --restore",
                           "only a restore comes in parts");

@@ -9,6 +9,7 @@
 
 #include "client/Paths.h"
 #include "device/Device.h"
+#include "device/PackageIdentifier.h"
 #include "host/Commands.h"
 #include "host/Console.h"
 #include "host/JsonWriting.h"
@@ -79,7 +80,7 @@ class Store {
             lacksPackage_ = true;
             return failure("the store has no package of it", "add one to its folder");
         }
-        const std::string name = identifier + ".zip";
+        const std::string name = archiveNameOf(identifier);
         const Result<std::uint64_t> sent =
             sender_.send(package->file, std::string(kPublicStaging), name,
                          [](std::uint64_t, std::uint64_t) { return true; });

@@ -10,9 +10,9 @@
 #include <utility>
 
 #include "device/Device.h"
-#include "device/PackageIdentifier.h"
 #include "host/Commands.h"
 #include "host/Console.h"
+#include "host/IdentifierArgument.h"
 #include "host/InterruptedStaging.h"
 #include "host/Interruption.h"
 #include "host/Json.h"
@@ -40,9 +40,9 @@ Status checkArguments(const SyncArguments& arguments) {
                           "the staging area says what to remove");
     }
     for (const std::string& identifier : arguments.plan.remove) {
-        if (isLegalIdentifier(identifier)) continue;
-        return wrongUsage("--remove " + identifier + " is not an identifier",
-                          "give one as appsync apps shows it");
+        if (Status legal = checkIdentifier(identifier, kGiveAsShown, "--remove"); !legal) {
+            return legal;
+        }
     }
     return {};
 }

@@ -46,7 +46,7 @@ INSTANTIATE_TEST_SUITE_P(
         WrongUsage{{"sync", "device"}, "LIBRARY"},
         WrongUsage{{"sync", "device", "library", "--json", "--json-lines"}, "--json"},
         WrongUsage{{"sync", "device", "library", "--staged", "--mirror"}, "--staged"},
-        WrongUsage{{"sync", "device", "library", "--remove", "a/b"}, "--remove a/b"},
+        WrongUsage{{"sync", "device", "library", "--remove", "a/b"}, "--remove a/b is not"},
         WrongUsage{{"create", "device", "--coordination", "maybe"}, "on"},
         WrongUsage{{"create", "device", "--coordination", "perhaps"}, "perhaps"},
         WrongUsage{{"set", "device", "coordination=maybe"}, "use on or off"},
@@ -57,6 +57,9 @@ INSTANTIATE_TEST_SUITE_P(
         WrongUsage{{"set", "device", "colour=red"}, "no setting colour"},
         WrongUsage{{"run", "device", "not/legal"}, "not an identifier"},
         WrongUsage{{"why", "device", "../x"}, "../x is not an identifier"},
+        WrongUsage{{"why", "device", ""}, "'' is not an identifier"},
+        WrongUsage{{"send", "device", "a b", "file"}, "a b is not an identifier"},
+        WrongUsage{{"coordinator", "device", "cancel", "a/b"}, "a/b is not an identifier"},
         WrongUsage{{"log", "device", "--level", "loud"}, "loud"},
         WrongUsage{{"send", "device", "com.a", "file", "--parts", "2"}, "without --restore"},
         WrongUsage{{"send", "device", "com.a", "file", "--restore", "--parts", "4"}, "4"},
@@ -82,9 +85,9 @@ TEST_P(EachCommand, HasHelp) {
 INSTANTIATE_TEST_SUITE_P(Help, EachCommand,
                          testing::Values("", "create", "sync", "plan", "apps", "screen", "why",
                                          "inventory", "set", "run", "quit", "uninstall", "reset",
-                                         "log", "history", "coordinator", "demote", "store", "send",
-                                         "package", "package make", "package show", "plist",
-                                         "plist show", "plist convert"));
+                                         "log", "history", "coordinator", "demote", "backup",
+                                         "restore", "store", "send", "package", "package make",
+                                         "package show", "plist", "plist show", "plist convert"));
 
 TEST_F(CommandLine, ADeviceThatIsMissingIsStatus3) {
     EXPECT_EQ(run({"apps", "/nonexistent/device"}), 3);

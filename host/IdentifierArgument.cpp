@@ -1,0 +1,20 @@
+#include "host/IdentifierArgument.h"
+
+#include "device/PackageIdentifier.h"
+#include "host/Problem.h"
+
+namespace appsync {
+
+Status checkIdentifier(const std::string& identifier, std::string_view whatToDo,
+                       std::string_view option) {
+    if (isLegalIdentifier(identifier)) return {};
+    std::string given(option);
+    if (!given.empty()) given += ' ';
+    return wrongUsage(given + shownIdentifier(identifier) + " is not an identifier", whatToDo);
+}
+
+std::string shownIdentifier(const std::string& identifier) {
+    return identifier.empty() ? "''" : identifier;
+}
+
+}  // namespace appsync
