@@ -1,5 +1,4 @@
 #include <cerrno>
-#include <ostream>
 
 #include "tests/restore/RestoreFixture.h"
 
@@ -8,39 +7,13 @@ namespace {
 
 using testing::Contains;
 using testing::ElementsAre;
-using testing::HasSubstr;
 using testing::IsEmpty;
 using testing::Not;
 using testing::SizeIs;
 using testing::StartsWith;
 
-class RestoreInfo : public RestoreFixture {
-  protected:
-    /// One application after the bad one, to see that it is restored all the same.
-    void restoreBesideB(const std::string& identifier, const PropertyList& info) {
-        setRestoreInfo(PropertyList::map({{identifier, info}, {kB, appInfo()}}));
-        restore();
-        EXPECT_TRUE(platform_.registry.placeholder(kB));
-        expectInfoMovedOnce();
-    }
-    /// Information that cannot be used as a whole.
-    void expectOnlyMoved() {
-        EXPECT_FALSE(client_->_processVessikRestoreInfo());
-        expectInfoMovedOnce();
-        EXPECT_FALSE(AppsClientTestAccess::finishedWaitingForPlaceHolderInstalls(*client_));
-        EXPECT_THAT(platform_.registry.placeholderIdentifiers(), IsEmpty());
-        EXPECT_THAT(platform_.callsTo({"WaitGroup"}), IsEmpty());
-    }
-    void expectRefusedAsDamaged(const std::string& why) {
-        expectOnlyMoved();
-        EXPECT_THAT(
-            platform_.messageLines(),
-            ElementsAre("8 default processing vessik restore info",
-                        testing::AllOf(
-                            StartsWith("8 default failed to parse vessik app restore info. err="),
-                            HasSubstr(why))));
-    }
-};
+// What can be wrong with it: BadRestoreInfoTest.cpp.
+class RestoreInfo : public RestoreFixture {};
 
 // The entry point.
 
@@ -79,51 +52,6 @@ TEST_F(RestoreInfo, NeverTellsTheHostOfAFailure) {
 }
 
 // The file as a whole.
-
-TEST_F(RestoreInfo, ThatIsMissingEndsTheRestoreAtOnce) {
-    EXPECT_TRUE(client_->_processVessikRestoreInfo());
-    EXPECT_THAT(
-        platform_.lines(),
-        ElementsAre(
-            "FileSystem.itemExists(" + kInfoPath + ") -> no",
-            "8 default no vessik restore plist found - skipping processing of vessik restored "
-            "apps"));
-    EXPECT_FALSE(AppsClientTestAccess::finishedWaitingForPlaceHolderInstalls(*client_));
-    EXPECT_EQ(platform_.now(), SimulatedTime(0));
-}
-
-TEST_F(RestoreInfo, ThatCannotBeReadIsMovedAway) {
-    setRestoreInfo(PropertyList::map({{kA, appInfo()}}));
-    platform_.files.failNext(FileOperation::ReadFile, kInfoPath, EIO);
-    expectOnlyMoved();
-    EXPECT_THAT(platform_.messageLines(),
-                ElementsAre(StartsWith("8 default failed to read vessik app restore info. "
-                                       "err=Error Domain=POSIX Code=5")));
-}
-
-TEST_F(RestoreInfo, ThatIsADirectoryIsMovedAway) {
-    platform_.files.addDirectory(kInfoPath);
-    expectOnlyMoved();
-    EXPECT_THAT(platform_.messages(),
-                ElementsAre(StartsWith("failed to read vessik app restore info. err=Error")));
-}
-
-TEST_F(RestoreInfo, ThatIsEmptyIsDamaged) {
-    platform_.files.addFile(kInfoPath, "");
-    expectRefusedAsDamaged("Error Domain=PropertyList");
-}
-
-TEST_F(RestoreInfo, ThatIsCutShortIsDamaged) {
-    Bytes whole = bytesOf(PropertyList::map({{kA, appInfo()}}));
-    whole.resize(whole.size() / 2);
-    platform_.files.addFile(kInfoPath, whole);
-    expectRefusedAsDamaged("Error Domain=PropertyList");
-}
-
-TEST_F(RestoreInfo, WhoseTopLevelIsNoMapIsDamaged) {
-    setRestoreInfo(PropertyList::array({kA}));
-    expectRefusedAsDamaged("the top level is not a map");
-}
 
 TEST_F(RestoreInfo, MayBeInEitherEncoding) {
     platform_.addPropertyList(kInfoPath, PropertyList::map({{kA, appInfo()}}),
@@ -171,47 +99,12 @@ TEST_F(RestoreInfo, ThatCannotBeMovedIsLogged) {
 
 // One application among others.
 
-TEST_F(RestoreInfo, OfAnApplicationThatIsNoMapIsSkipped) {
-    restoreBesideB(kA, PropertyList::array({"VessikMetadata"}));
-    EXPECT_TRUE(logged(LogLevel::Default, "no vessik restore info for 'com.example.a' - skipping"));
-    EXPECT_FALSE(platform_.registry.placeholder(kA));
-}
-
-TEST_F(RestoreInfo, OfAnApplicationWithoutMetadataIsIgnored) {
-    restoreBesideB(kA, PropertyList::map({{"ApplicationSINF", sinf_}}));
-    EXPECT_TRUE(logged(LogLevel::Default, "no VessikMetadata for 'com.example.a' - ignoring"));
-    EXPECT_FALSE(platform_.registry.placeholder(kA));
-}
-
-TEST_F(RestoreInfo, OfAnApplicationWhoseMetadataIsOfAnotherTypeIsIgnored) {
-    restoreBesideB(kA, PropertyList::map({{"VessikMetadata", storeMetadata()}}));
-    EXPECT_TRUE(logged(LogLevel::Default, "no VessikMetadata for 'com.example.a' - ignoring"));
-}
-
-TEST_F(RestoreInfo, OfAnApplicationWhoseMetadataIsDamagedIsRecorded) {
-    restoreBesideB(kA, PropertyList::map({{"VessikMetadata", Bytes{'x'}}}));
-    EXPECT_THAT(platform_.messageLines(),
-                Contains(StartsWith("8 default failed to parse vessik metadata for "
-                                    "'com.example.a'. err=Error Domain=PropertyList")));
-    EXPECT_THAT(scenarios(), Contains("Vessik App Restore|com.example.a|no|Failed to parse vessik "
-                                      "metadata"));
-    EXPECT_FALSE(platform_.files.exists("/tmp/com.korvu.trd.Apps/com.example.a.app"));
-}
-
-TEST_F(RestoreInfo, TakesAnIconOrSinfDataOfAnotherTypeForMissing) {
-    PropertyList info = appInfo();
-    info.set("PlaceholderIcon", "text");
-    info.set("ApplicationSINF", PropertyList::map());
-    restoreBesideB(kA, info);
-    EXPECT_TRUE(logged(LogLevel::Error, "no icon data for 'com.example.a'"));
-    EXPECT_THAT(platform_.callsTo({"AppRegistry.installPlaceholderBundle"}).front(),
-                HasSubstr("ApplicationSINF = (null);"));
-    EXPECT_TRUE(platform_.registry.placeholder(kA));
-}
-
 TEST_F(RestoreInfo, OfAnApplicationThatHasAPlaceholderIsSkipped) {
     platform_.registry.addPlaceholder(kA, kInstallTypeSync, "0.9");
-    restoreBesideB(kA, appInfo());
+    setRestoreInfo(PropertyList::map({{kA, appInfo()}, {kB, appInfo()}}));
+    restore();
+    EXPECT_TRUE(platform_.registry.placeholder(kB));
+    expectInfoMovedOnce();
     EXPECT_EQ(platform_.registry.placeholder(kA)->bundleVersion, "0.9");
     EXPECT_THAT(platform_.messages(),
                 testing::IsSupersetOf(
@@ -232,56 +125,6 @@ TEST_F(RestoreInfo, GivesTheOutcomeOfTheLastApplicationThatWasHandedOn) {
     setRestoreInfo(PropertyList::map({{"com.example.d", 1}}));
     EXPECT_TRUE(client_->_processVessikRestoreInfo()) << "none was handed on";
 }
-
-TEST_F(RestoreInfo, OfTenThousandApplicationsIsAllRestored) {
-    constexpr int kCount = 10'000;
-    platform_.recorder.setEnabled(false);
-    PropertyList info = PropertyList::map(kCount);
-    const PropertyList each = appInfo();
-    for (int i = 0; i < kCount; ++i) info.set("com.example.n" + std::to_string(i), each);
-    setRestoreInfo(info);
-    restore();
-    EXPECT_THAT(platform_.registry.placeholderIdentifiers(), SizeIs(kCount));
-}
-
-// Identifiers that no application can have: the registry, or the file system, refuses them.
-
-struct Hostile {
-    std::string identifier;
-    std::string message;  // begins so
-    friend void PrintTo(const Hostile& hostile, std::ostream* out) {
-        *out << testing::PrintToString(hostile.identifier);
-    }
-};
-
-class HostileIdentifier : public RestoreInfo, public testing::WithParamInterface<Hostile> {};
-
-TEST_P(HostileIdentifier, GetsNoPlaceholderAndHarmsNobody) {
-    const std::string& identifier = GetParam().identifier;
-    platform_.files.addFile("/var/mobile/Library/Preferences/kept", "kept");
-    const auto before = platform_.files.paths("/var/mobile/Library/Preferences");
-    restoreBesideB(identifier, appInfo());
-    EXPECT_THAT(platform_.registry.placeholderIdentifiers(), ElementsAre(kB));
-    EXPECT_THAT(platform_.messages(), Contains(StartsWith(GetParam().message)));
-    EXPECT_THAT(platform_.messages(),
-                Contains("failed to process app restore info for '" + identifier +
-                         "'. vessikMetadataDictionary={title = Shown; bundleVersion = 1.0;}"));
-    EXPECT_EQ(platform_.files.paths("/var/mobile/Library/Preferences"), before);
-}
-
-constexpr const char* kRefusedByRegistry = "Placeholder app install failed from path ";
-constexpr const char* kRefusedByFiles = "failed to create app directory for '";
-
-INSTANTIATE_TEST_SUITE_P(Each, HostileIdentifier,
-                         testing::Values(Hostile{"", kRefusedByRegistry},
-                                         Hostile{".", kRefusedByRegistry},
-                                         Hostile{"..", kRefusedByRegistry},
-                                         Hostile{"a/../../b", kRefusedByRegistry},
-                                         Hostile{"/../../../var/mobile", kRefusedByRegistry},
-                                         Hostile{"a/b", kRefusedByRegistry},
-                                         Hostile{std::string("a\0b", 3), kRefusedByFiles},
-                                         Hostile{"a\nb", kRefusedByRegistry},
-                                         Hostile{std::string(300, 'a'), kRefusedByFiles}));
 
 // The demoted-apps list.
 
