@@ -37,9 +37,9 @@ struct ItemAttributes {
 ///   the old file may come back.
 /// - `createFile` and `copyItem` leave what was there before, or the new file, or a part of it: cut
 ///   off, empty, or with zeros for what is missing.
-/// - `createDirectory`, `moveItem` and `removeItem` are done or not; an item that is moved is in
-/// one
-///   of the two places. Of a directory with contents a part may be removed.
+/// - `createDirectory`, `moveItem` and `removeItem` are done or not; an item that is moved stands
+///   in one of the two places.
+/// - Of a directory that is removed with what it holds, a part may be gone.
 /// - What was done later may stay although what was done before it is undone.
 ///
 /// Both may leave temporary files (`.<name>.appsync-` and six characters) beside a file that was
