@@ -207,19 +207,6 @@ TEST_F(DeviceReconciliationTest, anEndedSessionLeavesNothingUnsynced) {
     EXPECT_EQ(number("SELECT count(*) FROM session"), 0);
 }
 
-TEST_F(DeviceReconciliationTest, aRestoreThatWasCutOffLeavesNoTemporaryFile) {
-    const std::vector<std::string> temporaries{
-        "/var/mobile/Media/VessikRestore/.RestoreApplications.plist.appsync-a1b2c3",
-        "/var/mobile/Library/Preferences/.com.korvu.Bakvia.DemotedApps.plist.appsync-a1b2c3"};
-    reopenAfter([&] {
-        for (const std::string& path : temporaries) {
-            fs::create_directories(fs::path(rootPath(path)).parent_path());
-            write(path, "half of it");
-        }
-    });
-    for (const std::string& path : temporaries) EXPECT_FALSE(fs::exists(rootPath(path))) << path;
-}
-
 TEST_F(DeviceReconciliationTest, aSessionThatWasCutOffLeavesNoTemporaryFileInABundle) {
     ASSERT_TRUE(succeeded(install(kAtlas)));
     const std::string container = application(kAtlas)->bundleContainerPath;
