@@ -78,7 +78,7 @@ int tellWhatEnds(Device& device, const Console& console) {
     if (!ending) return console.fail(unusable(ending.error()));
     if (ending->empty()) return kExitDone;
     console.out << "The next session gives up what has a coordinator:";
-    for (const CoordinatorRecord& each : *ending) console.out << " " << each.identifier;
+    for (const CoordinatorRecord& each : *ending) console.out << ' ' << printable(each.identifier);
     console.out << "\nTo keep it, turn coordination on again before that.\n";
     return kExitDone;
 }

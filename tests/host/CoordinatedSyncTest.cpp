@@ -4,6 +4,7 @@
 #include <sstream>
 #include <thread>
 
+#include "device/Database.h"
 #include "host/WatchedCoordination.h"
 #include "tests/host/HostFixture.h"
 
@@ -108,6 +109,17 @@ TEST_F(CoordinatedSync, AnErrorIsForgottenOnceAllIsInStep) {
     EXPECT_EQ(run({"why", device, "com.a"}), 0);
     EXPECT_THAT(out.str(), testing::Not(HasSubstr("Its last error")));
     EXPECT_THAT(applications(), ElementsAre("com.a 1"));
+}
+
+TEST_F(CoordinatedSync, WhatEndsWithCoordinationIsNamedInPrintableText) {
+    create("com.a");
+    {
+        const auto database = Database::open(device + "/device.db", Database::Mode::Existing);
+        ASSERT_TRUE(database.ok());
+        ASSERT_TRUE((*database)->execute("UPDATE coordinators SET identifier = char(27) || '[2J'"));
+    }
+    EXPECT_EQ(run({"set", device, "coordination=off"}), 0);
+    EXPECT_THAT(out.str(), HasSubstr("has a coordinator: ?[2J\n"));
 }
 
 TEST_F(CoordinatedSync, LookingAtTheDeviceStartsNothing) {
