@@ -7,6 +7,7 @@
 #include <vector>
 
 #include "client/Paths.h"
+#include "client/TodoList.h"
 #include "device/Device.h"
 #include "host/SyncPlan.h"
 #include "platform/FileSystem.h"
@@ -37,22 +38,17 @@ Status save(Device& device, const std::string& path, const PropertyList& value) 
     return device.files().writeFileAtomically(path, *bytes);
 }
 
-std::string textAt(const PropertyList& entry, std::string_view key) {
-    const std::string* text = entry.findString(key);
+std::string entryIdentifier(const PropertyList& entry) {
+    const std::string* text = entry.findString(kTodoIdentifierKey);
     return text != nullptr ? *text : std::string();
-}
-
-bool has(const PropertyList& entry, std::string_view operation) {
-    const std::string* text = entry.findString("operation");
-    return text != nullptr && *text == operation;
 }
 
 // The plug-in changes the operations of a list and nothing else.
 bool areOfOneList(const PropertyList& staged, const PropertyList& now) {
     if (!staged.isArray() || !now.isArray() || staged.size() != now.size()) return false;
     for (std::size_t index = 0; index < now.size(); ++index) {
-        const PropertyList* before = staged.elements()[index].find("identifier");
-        const PropertyList* after = now.elements()[index].find("identifier");
+        const PropertyList* before = staged.elements()[index].find(kTodoIdentifierKey);
+        const PropertyList* after = now.elements()[index].find(kTodoIdentifierKey);
         if ((before == nullptr) != (after == nullptr)) return false;
         if (before != nullptr && *before != *after) return false;
     }
@@ -73,9 +69,10 @@ class Installed {
         const auto staged = record.find(kEntries)->elements();
         for (std::size_t index = 0; index < now.size(); ++index) {
             const PropertyList& entry = now.elements()[index];
-            const std::string identifier = textAt(entry, "identifier");
-            const bool isNoted = has(entry, "INSTALLED") && !has(staged[index], "INSTALLED");
-            const bool isSeen = has(entry, "DOWNLOADED") && hasChanged(identifier);
+            const std::string identifier = entryIdentifier(entry);
+            const bool isNoted =
+                hasOperation(entry, kTodoInstalled) && !hasOperation(staged[index], kTodoInstalled);
+            const bool isSeen = hasOperation(entry, kTodoDownloaded) && hasChanged(identifier);
             if (isNoted || isSeen) installed_.insert(identifier);
         }
     }
@@ -104,9 +101,9 @@ PropertyList openAgain(const PropertyList& record, const PropertyList& now,
     PropertyList list = PropertyList::array(now.size());
     for (std::size_t index = 0; index < now.size(); ++index) {
         PropertyList entry = now.elements()[index];
-        if (has(staged[index], "install")) {
-            const bool isDone = installed.contains(textAt(entry, "identifier"));
-            entry.set("operation", isDone ? "INSTALLED" : "install");
+        if (hasOperation(staged[index], kTodoInstall)) {
+            const bool isDone = installed.contains(entryIdentifier(entry));
+            entry.set(kTodoOperationKey, isDone ? kTodoInstalled : kTodoInstall);
         }
         list.append(std::move(entry));
     }
@@ -127,8 +124,8 @@ PropertyList withoutUnasked(const PropertyList& todoList, const SyncPlan& plan) 
     const std::set<std::string> unasked = installedUnasked(plan);
     PropertyList list = PropertyList::array(todoList.size());
     for (PropertyList entry : todoList.elements()) {
-        if (has(entry, "install") && unasked.contains(textAt(entry, "identifier"))) {
-            entry.set("operation", "DOWNLOADED");
+        if (hasOperation(entry, kTodoInstall) && unasked.contains(entryIdentifier(entry))) {
+            entry.set(kTodoOperationKey, kTodoDownloaded);
         }
         list.append(std::move(entry));
     }

@@ -37,15 +37,15 @@ constexpr std::size_t kMostInstalls = 20'000;
 const FileAttributes kMobile{"mobile", "mobile"};
 
 PropertyList todoEntry(std::string_view identifier, std::string_view operation) {
-    return PropertyList::map({{"identifier", identifier}, {"operation", operation}});
+    return PropertyList::map({{kTodoIdentifierKey, identifier}, {kTodoOperationKey, operation}});
 }
 
 PropertyList installEntry(const PlannedInstall& planned) {
     // What has arrived is not asked for; the device notes in the same entry what becomes of it.
     PropertyList entry =
-        todoEntry(planned.identifier, planned.isInstalledUnasked ? "DOWNLOADED" : "install");
-    if (!planned.newVersion.empty()) entry.set("version", planned.newVersion);
-    if (!planned.name.empty()) entry.set("name", planned.name);
+        todoEntry(planned.identifier, planned.isInstalledUnasked ? kTodoDownloaded : kTodoInstall);
+    if (!planned.newVersion.empty()) entry.set(kTodoVersionKey, planned.newVersion);
+    if (!planned.name.empty()) entry.set(kTodoNameKey, planned.name);
     return entry;
 }
 
@@ -172,12 +172,9 @@ Result<PropertyList> loadTodoList(Device& device, const std::string& path) {
 }
 
 std::size_t installsIn(const PropertyList& todoList) {
-    std::size_t count = 0;
-    for (const PropertyList& entry : todoList.elements()) {
-        const std::string* operation = entry.findString("operation");
-        if (operation != nullptr && *operation == "install") ++count;
-    }
-    return count;
+    return static_cast<std::size_t>(std::ranges::count_if(
+        todoList.elements(),
+        [](const PropertyList& entry) { return hasOperation(entry, kTodoInstall); }));
 }
 
 bool isDone(const PropertyList& entry) {
@@ -203,7 +200,8 @@ std::string excessOf(const PropertyList& todoList) {
 
 PropertyList todoListOf(const SyncPlan& plan) {
     PropertyList list = PropertyList::array(plan.remove.size() + plan.install.size());
-    for (const std::string& identifier : plan.remove) list.append(todoEntry(identifier, "remove"));
+    for (const std::string& identifier : plan.remove)
+        list.append(todoEntry(identifier, kTodoRemove));
     for (const auto* installs : {&plan.install, &plan.update}) {
         for (const PlannedInstall& each : *installs) {
             if (!each.isLeftOver) list.append(installEntry(each));

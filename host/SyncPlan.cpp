@@ -6,6 +6,7 @@
 #include <string_view>
 #include <utility>
 
+#include "client/TodoList.h"
 #include "device/DeviceRecords.h"
 #include "device/PackageIdentifier.h"
 #include "host/Library.h"
@@ -166,11 +167,11 @@ class StagedPlanner {
     void add(const PropertyList& entry, std::size_t number) {
         const std::string entryName = "entry " + std::to_string(number) + " of the todo list";
         if (!entry.isMap()) return fail(entryName, "it is not a map");
-        const std::string* operation = entry.findString("operation");
+        const std::string* operation = entry.findString(kTodoOperationKey);
         if (operation == nullptr) return fail(entryName, "it has no operation");
-        const bool isInstall = *operation == "install";
-        if (!isInstall && *operation != "remove") return;
-        const std::string* identifier = entry.findString("identifier");
+        const bool isInstall = *operation == kTodoInstall;
+        if (!isInstall && *operation != kTodoRemove) return;
+        const std::string* identifier = entry.findString(kTodoIdentifierKey);
         if (identifier == nullptr) return fail(entryName, "its identifier is not a string");
         if (!isLegalIdentifier(*identifier)) {
             return fail(identifier->empty() ? entryName : *identifier,
