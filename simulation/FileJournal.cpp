@@ -1,6 +1,9 @@
 #include "simulation/FileJournal.h"
 
 #include <algorithm>
+#include <cstddef>
+#include <map>
+#include <random>
 #include <utility>
 
 namespace appsync {

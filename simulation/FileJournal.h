@@ -1,9 +1,6 @@
 #pragma once
 
-#include <cstddef>
 #include <cstdint>
-#include <map>
-#include <random>
 #include <set>
 #include <string>
 #include <vector>
@@ -52,6 +49,8 @@ class FileJournal {
         Unsynced,
     };
 
+    /// An operation has been done, which is these changes at once. `written` is how the file that
+    /// the last of them brings came to its contents.
     void record(std::vector<Change> changes, Written written);
     /// Everything is on disk.
     void sync();
