@@ -8,6 +8,8 @@
 #include <nlohmann/json.hpp>
 
 #include "device/PackageIdentifier.h"
+#include "host/BackupManifestKeys.h"
+#include "host/BackupManifestReader.h"
 #include "host/HostFile.h"
 #include "host/JsonWriting.h"
 #include "host/Problem.h"
@@ -19,35 +21,11 @@ namespace {
 namespace fs = std::filesystem;
 using Json = nlohmann::ordered_json;
 
-constexpr int kFormat = 1;
 constexpr std::uint64_t kLargestManifest = std::uint64_t{256} << 20U;
-
-constexpr const char* kFormatKey = "format";
-constexpr const char* kMadeKey = "made";
-constexpr const char* kApplicationsKey = "applications";
-constexpr const char* kFilesKey = "files";
-constexpr const char* kIdentifierKey = "identifier";
-constexpr const char* kVersionKey = "version";
-constexpr const char* kNameKey = "name";
-constexpr const char* kDataKey = "data";
-constexpr const char* kSizeKey = "size";
-constexpr const char* kSumKey = "sha256";
 
 ErrorRecord damaged(const std::string& path, const std::string& what) {
     return unusable("the manifest " + path + " is damaged: " + what,
                     "use another backup, or make a new one");
-}
-
-// Where a file of the manifest may stand: one of the three lists, or an archive of data.
-bool isBackupFile(const std::string& name) {
-    if (name == kBackupRestoreInfo || name == kBackupDemotedApps || name == kBackupIconOrder) {
-        return true;
-    }
-    return identifierOfData(name).has_value();
-}
-
-bool isSum(const std::string& text) {
-    return text.size() == 64 && text.find_first_not_of("0123456789abcdef") == text.npos;
 }
 
 Json jsonOf(const BackupManifest& manifest) {
@@ -58,103 +36,14 @@ Json jsonOf(const BackupManifest& manifest) {
                                 {kNameKey, each.name},
                                 {kDataKey, each.hasData}});
     }
-    Json files = Json::object();
+    Json::object_t files;  // filled as the array that it is: an object looks for each name first
     for (const auto& [name, sum] : manifest.files) {
-        files[name] = {{kSizeKey, sum.size}, {kSumKey, sum.sha256}};
+        files.emplace_back(name, Json{{kSizeKey, sum.size}, {kSumKey, sum.sha256}});
     }
-    return {{kFormatKey, kFormat},
+    return {{kFormatKey, kBackupFormat},
             {kMadeKey, manifest.made},
             {kApplicationsKey, std::move(applications)},
             {kFilesKey, std::move(files)}};
-}
-
-const Json* memberOf(const Json& object, const char* key) {
-    if (!object.is_object()) return nullptr;
-    const auto found = object.find(key);
-    return found == object.end() ? nullptr : &*found;
-}
-
-std::optional<std::string> textAt(const Json& object, const char* key) {
-    const Json* member = memberOf(object, key);
-    if (member == nullptr || !member->is_string()) return std::nullopt;
-    return member->get<std::string>();
-}
-
-bool readApplication(const Json& value, BackupManifest& manifest) {
-    BackedUpApplication application;
-    const auto identifier = textAt(value, kIdentifierKey);
-    const Json* data = memberOf(value, kDataKey);
-    if (!identifier || !isLegalIdentifier(*identifier)) return false;
-    if (data == nullptr || !data->is_boolean()) return false;
-    application.identifier = *identifier;
-    application.version = textAt(value, kVersionKey);
-    application.name = textAt(value, kNameKey).value_or(*identifier);
-    application.hasData = data->get<bool>();
-    manifest.applications.push_back(std::move(application));
-    return true;
-}
-
-// Why it cannot be used; empty when it can.
-std::string readFile(const std::string& name, const Json& value, BackupManifest& manifest) {
-    if (!isBackupFile(name))
-        return "it names " + printable(name) + ", which is no file of a backup";
-    const Json* size = memberOf(value, kSizeKey);
-    const auto sum = textAt(value, kSumKey);
-    if (size == nullptr || !size->is_number_unsigned() || !sum || !isSum(*sum)) {
-        return "its file " + printable(name) + " has no size or no sum";
-    }
-    manifest.files[name] = {size->get<std::uint64_t>(), *sum};
-    return "";
-}
-
-bool namesTwice(const std::vector<BackedUpApplication>& applications) {
-    std::set<std::string_view> seen;
-    return std::any_of(applications.begin(), applications.end(),
-                       [&](const auto& each) { return !seen.insert(each.identifier).second; });
-}
-
-// Nothing when it is no JSON, or when an object in it has two members of one name. What lies deeper
-// than anything in a manifest is not kept.
-std::optional<Json> parsedOnce(ByteView text) {
-    constexpr int kDeepest = 8;
-    if (std::ranges::find(text, 0) != text.end()) return std::nullopt;  // the parser's end
-    std::vector<std::set<std::string>> names;  // of the objects around, the innermost last
-    bool isUnique = true;
-    const auto look = [&](int depth, Json::parse_event_t event, Json& value) {
-        if (depth > kDeepest) return false;
-        if (event == Json::parse_event_t::object_start) names.emplace_back();
-        if (event == Json::parse_event_t::object_end) names.pop_back();
-        if (event == Json::parse_event_t::key) {
-            isUnique = names.back().insert(value.get<std::string>()).second && isUnique;
-        }
-        return true;
-    };
-    Json root = Json::parse(text.begin(), text.end(), look, false);
-    if (root.is_discarded() || !isUnique) return std::nullopt;
-    return root;
-}
-
-// Why it cannot be used; empty when it can.
-std::string readInto(const Json& root, BackupManifest& manifest) {
-    const Json* format = memberOf(root, kFormatKey);
-    if (format == nullptr || !format->is_number_integer()) return "it tells no format";
-    if (format->get<std::int64_t>() != kFormat) {
-        return "this version does not know its format " + format->dump();
-    }
-    manifest.made = textAt(root, kMadeKey).value_or("");
-    const Json* applications = memberOf(root, kApplicationsKey);
-    const Json* files = memberOf(root, kFilesKey);
-    if (applications == nullptr || !applications->is_array()) return "it lists no applications";
-    if (files == nullptr || !files->is_object()) return "it lists no files";
-    for (const Json& each : *applications) {
-        if (!readApplication(each, manifest)) return "an application in it is not as it should be";
-    }
-    if (namesTwice(manifest.applications)) return "it lists an application twice";
-    for (const auto& [name, each] : files->items()) {
-        const std::string defect = readFile(name, each, manifest);
-        if (!defect.empty()) return defect;
-    }
-    return manifest.holds(kBackupRestoreInfo) ? "" : "it does not name the restore information";
 }
 
 // What is wrong with the kind of a file; empty when it is a regular one.
@@ -273,10 +162,9 @@ Result<BackupManifest> readBackupManifest(const std::string& backup) {
 }
 
 Result<BackupManifest> parseBackupManifest(ByteView text, const std::string& path) {
-    const std::optional<Json> root = parsedOnce(text);
-    if (!root) return damaged(path, "it is not JSON, or names something twice");
     BackupManifest manifest;
-    const std::string defect = readInto(*root, manifest);
+    const std::string_view characters(reinterpret_cast<const char*>(text.data()), text.size());
+    const std::string defect = readManifestText(characters, manifest);
     if (!defect.empty()) return damaged(path, defect);
     return manifest;
 }

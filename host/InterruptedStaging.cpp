@@ -157,15 +157,17 @@ Status stageAgain(Device& device, const PropertyList& todoList, const SyncPlan& 
     return device.files().moveItem(std::string(kTodoDirectory), place);
 }
 
-Status beginStagedSession(Device& device, const PropertyList& todoList) {
+Status beginStagedSession(Device& device, PropertyList todoList) {
     const Result<std::vector<ApplicationRecord>> present = device.applications();
     if (!present) return present.error();
     PropertyList versions = PropertyList::map();
     for (const ApplicationRecord& each : *present) {
         if (!each.isPlaceholder) versions.set(each.identifier, each.version.value_or(""));
     }
-    return save(device, recordIn(kStagingArea),
-                PropertyList::map({{kEntries, todoList}, {kVersions, std::move(versions)}}));
+    PropertyList record = PropertyList::map();
+    record.set(kEntries, std::move(todoList));
+    record.set(kVersions, std::move(versions));
+    return save(device, recordIn(kStagingArea), record);
 }
 
 void endStagedSession(Device& device) {

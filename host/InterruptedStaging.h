@@ -30,7 +30,7 @@ Status stageAgain(Device& device, const PropertyList& todoList, const SyncPlan& 
 
 /// Notes that a session on the area that waits begins with this list. From now on, until
 /// `endStagedSession`, an end of this process is an interruption.
-Status beginStagedSession(Device& device, const PropertyList& todoList);
+Status beginStagedSession(Device& device, PropertyList todoList);
 void endStagedSession(Device& device);
 
 /// What a host has asked for, and a session that brings its own staging area does away with.

@@ -1,17 +1,21 @@
 #include <array>
 #include <chrono>
+#include <cstddef>
+#include <cstdint>
 #include <filesystem>
 #include <fstream>
+#include <optional>
 #include <ostream>
 #include <string>
 #include <string_view>
 #include <system_error>
 #include <thread>
-
-#include <nlohmann/json.hpp>
+#include <utility>
+#include <variant>
 
 #include "host/Commands.h"
 #include "host/Console.h"
+#include "host/JsonReading.h"
 #include "host/OpenDevice.h"
 #include "host/Problem.h"
 #include "host/Text.h"
@@ -20,9 +24,11 @@
 namespace appsync {
 namespace {
 
-using Json = nlohmann::ordered_json;
-
 constexpr std::chrono::milliseconds kFollowInterval{200};
+
+// More than a device writes: each of a message's few arguments is cut at 16 KiB.
+constexpr std::size_t kLongestLine = std::size_t{1} << 20U;
+constexpr std::size_t kPieceSize = std::size_t{64} << 10U;
 
 // From the least to the most severe.
 constexpr std::array kSeverity = {LogLevel::Debug, LogLevel::Info, LogLevel::Default,
@@ -40,46 +46,121 @@ std::size_t severityOf(std::string_view name) {
     return rank;
 }
 
-std::string textOf(const Json& line, const char* key) {
-    const auto found = line.find(key);
-    return found != line.end() && found->is_string() ? found->get<std::string>() : std::string();
+// What the log says of a message; empty where it says nothing, or something else than a text.
+struct LogRecord {
+    std::string time;
+    std::string level;
+    std::string message;
+    std::optional<std::int64_t> category;
+};
+
+std::optional<std::int64_t> wholeNumber(const JsonScalar& value) {
+    if (const auto* number = std::get_if<std::int64_t>(&value)) return *number;
+    const auto* positive = std::get_if<std::uint64_t>(&value);
+    if (positive == nullptr || !std::in_range<std::int64_t>(*positive)) return std::nullopt;
+    return static_cast<std::int64_t>(*positive);
 }
 
-bool isWanted(const Json& line, const LogArguments& arguments) {
-    const auto category = line.find("category");
-    if (arguments.category) {
-        if (category == line.end() || !category->is_number_integer()) return false;
-        if (category->get<std::int64_t>() != *arguments.category) return false;
+// Takes a line's members and nothing that lies deeper.
+class LineListener final : public JsonListener {
+  public:
+    explicit LineListener(LogRecord& record) : record_(record) {}
+
+    bool memberBegins(std::string name) override {
+        if (depth_ == 1) member_ = std::move(name);
+        return true;
     }
-    return !arguments.level || severityOf(textOf(line, "level")) >= severityOf(*arguments.level);
+    bool scalar(JsonScalar value) override {
+        if (depth_ != 1) return depth_ != 0;  // a line is an object
+        if (member_ == "category") record_.category = wholeNumber(value);
+        if (auto* text = std::get_if<std::string>(&value)) take(*text);
+        return true;
+    }
+    bool objectBegins() override { return ++depth_ != 0; }
+    bool arrayBegins() override { return depth_++ != 0; }
+    bool containerEnds() override {
+        --depth_;
+        return true;
+    }
+
+  private:
+    void take(std::string& text) {
+        if (member_ == "time") record_.time = std::move(text);
+        if (member_ == "level") record_.level = std::move(text);
+        if (member_ == "message") record_.message = std::move(text);
+    }
+
+    LogRecord& record_;
+    std::string member_;
+    std::size_t depth_ = 0;
+};
+
+bool isWanted(const LogRecord& record, const LogArguments& arguments) {
+    if (arguments.category && record.category != arguments.category) return false;
+    return !arguments.level || severityOf(record.level) >= severityOf(*arguments.level);
 }
 
 void showLine(const std::string& text, const LogArguments& arguments, const Console& console) {
-    const Json line = Json::parse(text, nullptr, false);
-    if (!line.is_object() || !isWanted(line, arguments))
-        return;  // cut off by a crash, for instance
+    LogRecord record;
+    LineListener listener(record);
+    if (!readJson(text, listener)) return;  // cut off by a crash, for instance
+    if (!isWanted(record, arguments)) return;
     if (arguments.asJson) {
         console.out << text << '\n';
         return;
     }
-    const auto category = line.find("category");
-    const bool hasNumber = category != line.end() && category->is_number_integer();
-    const std::string number = hasNumber ? category->dump() : "-";
-    console.out << printable(textOf(line, "time")) << ' '
-                << fitted(printable(textOf(line, "level")), 7) << ' '
-                << fitted(printable(number), 2) << ' ' << printable(textOf(line, "message"))
-                << '\n';
+    const std::string number = record.category ? std::to_string(*record.category) : "-";
+    console.out << printable(record.time) << ' ' << fitted(printable(record.level), 7) << ' '
+                << fitted(number, 2) << ' ' << printable(record.message) << '\n';
 }
 
+// Puts lines together from the pieces that are read, and shows them.
+class LogLines {
+  public:
+    LogLines(std::string path, const LogArguments& arguments, const Console& console)
+        : path_(std::move(path)), arguments_(arguments), console_(console) {}
+
+    void add(std::string_view piece) {
+        for (std::size_t end = piece.find('\n'); end != piece.npos; end = piece.find('\n')) {
+            addToLine(piece.substr(0, end));
+            endLine();
+            piece.remove_prefix(end + 1);
+        }
+        addToLine(piece);
+    }
+
+  private:
+    void addToLine(std::string_view piece) {
+        isTooLong_ = isTooLong_ || begun_.size() + piece.size() > kLongestLine;
+        if (!isTooLong_) begun_ += piece;
+    }
+
+    void endLine() {
+        ++number_;
+        if (isTooLong_) {
+            console_.complain("line " + std::to_string(number_) + " of " + path_ +
+                              " is left out: it is longer than any that a device writes");
+        } else {
+            showLine(begun_, arguments_, console_);
+        }
+        begun_.clear();
+        isTooLong_ = false;
+    }
+
+    const std::string path_;
+    const LogArguments& arguments_;
+    const Console& console_;
+    std::string begun_;  // the line that is still being written
+    bool isTooLong_ = false;
+    std::uint64_t number_ = 0;
+};
+
 // Shows the whole lines that the file has from where the stream stands.
-void showWhatIsThere(std::ifstream& file, std::string& begun, const LogArguments& arguments,
-                     const Console& console) {
-    std::string text;
-    while (console.out.good() && std::getline(file, text)) {
-        begun += text;
-        if (file.eof()) break;  // the line is still being written
-        showLine(begun, arguments, console);
-        begun.clear();
+void showWhatIsThere(std::ifstream& file, LogLines& lines, const Console& console) {
+    std::string piece(kPieceSize, '\0');
+    while (console.out.good() && file.good()) {
+        file.read(piece.data(), static_cast<std::streamsize>(piece.size()));
+        lines.add(std::string_view(piece).substr(0, static_cast<std::size_t>(file.gcount())));
     }
     file.clear();
     console.out.flush();
@@ -87,13 +168,13 @@ void showWhatIsThere(std::ifstream& file, std::string& begun, const LogArguments
 
 void follow(const std::string& path, const LogArguments& arguments, const Console& console) {
     std::ifstream file;
-    std::string begun;
+    LogLines lines(path, arguments, console);
     std::error_code ignored;
     do {
         // A pipe in its place would be waited on.
         const bool isThere = file.is_open() || std::filesystem::is_regular_file(path, ignored);
         if (isThere && !file.is_open()) file.open(path, std::ios::binary);
-        if (file.is_open()) showWhatIsThere(file, begun, arguments, console);
+        if (file.is_open()) showWhatIsThere(file, lines, console);
         if (arguments.follows) std::this_thread::sleep_for(kFollowInterval);
     } while (arguments.follows && console.out.good());
 }

@@ -23,11 +23,11 @@ std::string realText(double value) {
 }
 
 std::string hexText(const Bytes& bytes) {
+    constexpr std::string_view kDigits = "0123456789abcdef";
     std::string text;
-    for (std::size_t index = 0; index < std::min(bytes.size(), kShownBytes); ++index) {
-        std::array<char, 4> buffer{};
-        std::snprintf(buffer.data(), buffer.size(), "%02x", unsigned{bytes[index]});
-        text += buffer.data();
+    for (const std::uint8_t byte : ByteView(bytes).first(std::min(bytes.size(), kShownBytes))) {
+        text += kDigits[byte >> 4U];
+        text += kDigits[byte & 15U];
     }
     return bytes.size() > kShownBytes ? text + "..." : text;
 }

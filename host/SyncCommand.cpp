@@ -228,7 +228,9 @@ class SyncRun {
             if (!again) return again;
         }
         // Where it cannot be noted, as in an area that is a link, an interruption is final.
-        if (staged_.list.isArray()) beginStagedSession(*device_, staged_.list).ignore();
+        if (staged_.list.isArray()) {
+            beginStagedSession(*device_, std::exchange(staged_.list, {})).ignore();
+        }
         return {};
     }
 
@@ -315,7 +317,7 @@ class SyncRun {
     SyncPlan plan_;
     SyncPlan allowed_;  // what of it policy lets happen
     StandingInstalls standing_;
-    StagedTodoList staged_;                  // only with --staged
+    StagedTodoList staged_;                  // only with --staged, until the session begins
     StagedWork givenUp_ = StagedWork::None;  // only without
     SpaceCheck space_;
     bool mustNotRun_ = false;

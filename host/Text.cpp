@@ -62,6 +62,13 @@ std::size_t characterLength(std::string_view text) {
     return std::all_of(tail.begin(), tail.end(), isContinuation) ? length : 0;
 }
 
+// How much of the text is ASCII without control characters: nearly all of it, mostly.
+std::size_t plainLength(std::string_view text) {
+    std::size_t length = 0;
+    while (length < text.size() && text[length] >= 0x20 && text[length] < 0x7F) ++length;
+    return length;
+}
+
 }  // namespace
 
 std::string formatBytes(std::uint64_t bytes) {
@@ -93,6 +100,10 @@ std::string printable(std::string_view text) {
     std::string result;
     result.reserve(text.size());
     while (!text.empty()) {
+        const std::size_t plain = plainLength(text);
+        result += text.substr(0, plain);
+        text.remove_prefix(plain);
+        if (text.empty()) break;
         const std::size_t length = characterLength(text);
         if (length != 0 && isPrintable(decoded(text.substr(0, length)), length)) {
             result += text.substr(0, length);

@@ -271,13 +271,35 @@ ROOTS = [
         (place.device / "log/system.log").unlink(), os.mkfifo(place.device / "log/system.log"))), SYNC, 3),
     Entry("the log is a pipe, log", tree_with(lambda place: (
         (place.device / "log/system.log").unlink(), os.mkfifo(place.device / "log/system.log"))), ("log", "{device}"), 0),
-    *[Entry("the log holds " + name, tree_with(lambda place, content=content: (
-        place.device / "log/system.log").write_bytes(content)), ("log", "{device}"), 0)
-      for name, content in (("rubbish", b"\xff\0\n" * 1000), ("lines cut off", b'{"time": "x", "cat\n{"message'),
-                            ("a category nested 100,000 deep", b'{"category":' + b"[" * 100_000 + b"]" * 100_000 + b"}\n"),
-                            ("a category of bytes that are no text", b'{"category":"\xff\xfe","message":"a"}\n'),
-                            ("a line of four megabytes", b'{"message":"' + b"x" * (4 << 20) + b'"}\n'),
-                            ("numbers everywhere", b'{"time":1,"level":2,"category":1e999,"message":[]}\n'))],
 ]
 
-ENTRIES = FILES + PAGES + SCHEMAS + VALUES + NUMBERS + BLOBS + ROOTS
+
+def log(name, content, says="", shown=0):
+    """The log holds that; so many of its lines are shown."""
+    def also(place, done):
+        assert done.out.count("\n") == shown and "\x1b" not in done.out
+
+    return Entry("the log holds " + name, tree_with(lambda place: (place.device / "log/system.log").write_bytes(content)),
+                 ("log", "{device}"), 0, says, also=also)
+
+
+def members(count):
+    return b"{" + b",".join(b'"k%d":%d' % (n, n) for n in range(count)) + b"}\n"
+
+
+LOGS = [
+    log("rubbish", b"\xff\0\n" * 1000),
+    log("lines cut off", b'{"time": "x", "cat\n{"message'),
+    log("a category nested 100,000 deep", b'{"category":' + b"[" * 100_000 + b"]" * 100_000 + b"}\n", shown=1),
+    log("a category of bytes that are no text", b'{"category":"\xff\xfe","message":"a"}\n'),
+    log("a line of four megabytes", b'{"message":"' + b"x" * (4 << 20) + b'"}\n{"message":"a"}\n', "line 1 of", 1),
+    log("a line of nearly a megabyte", b'{"message":"' + b"x" * 1_000_000 + b'"}\n', shown=1),
+    log("sixteen megabytes without a line end", b"x" * (16 << 20)),
+    log("a line of 60,000 members", members(60_000), shown=1),
+    log("numbers everywhere", b'{"time":1,"level":2,"category":1,"message":[]}\n', shown=1),
+    log("a number beyond all numbers", b'{"category":1e999,"message":"a"}\n'),
+    log("what takes over the terminal", b'{"message":"\\u001b[2J\\u0007","time":"\\u001b","level":"\\u001b"}\n', shown=1),
+    log("lists and texts instead of maps", b'[{"message":"a"}]\n"message"\n7\n{"a":[{"message":"b"}]}\n', shown=1),
+]
+
+ENTRIES = FILES + PAGES + SCHEMAS + VALUES + NUMBERS + BLOBS + ROOTS + LOGS
