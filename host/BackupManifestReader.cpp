@@ -59,7 +59,7 @@ class Members {
     [[nodiscard]] bool isAt(std::string_view name) const {
         return current_ != count && names_.at(current_) == name;
     }
-    void set(JsonScalar value) {
+    void set(JsonScalar&& value) {
         if (current_ != count) values_.at(current_) = std::move(value);
     }
     // The value, if it is of that kind.

@@ -73,7 +73,9 @@ class LineListener final : public JsonListener {
     bool scalar(JsonScalar value) override {
         if (depth_ != 1) return depth_ != 0;  // a line is an object
         if (member_ == "category") record_.category = wholeNumber(value);
-        if (auto* text = std::get_if<std::string>(&value)) take(*text);
+        auto* text = std::get_if<std::string>(&value);
+        std::string* place = placeOf(member_);
+        if (text != nullptr && place != nullptr) *place = std::move(*text);
         return true;
     }
     bool objectBegins() override { return ++depth_ != 0; }
@@ -84,10 +86,10 @@ class LineListener final : public JsonListener {
     }
 
   private:
-    void take(std::string& text) {
-        if (member_ == "time") record_.time = std::move(text);
-        if (member_ == "level") record_.level = std::move(text);
-        if (member_ == "message") record_.message = std::move(text);
+    std::string* placeOf(std::string_view member) {
+        if (member == "time") return &record_.time;
+        if (member == "level") return &record_.level;
+        return member == "message" ? &record_.message : nullptr;
     }
 
     LogRecord& record_;

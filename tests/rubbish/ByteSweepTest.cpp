@@ -83,6 +83,9 @@ std::vector<std::uint8_t> valuesFor(std::uint8_t value, std::size_t position, Pa
 
 class ByteSweep : public testing::TestWithParam<Kind> {
   protected:
+    /// The report of a run says how many inputs it has tried.
+    void TearDown() override { RecordProperty("inputs", std::to_string(read_ + refused_)); }
+
     /// False when something did not hold: one such input is told, not thousands.
     [[nodiscard]] bool holds(ByteView bytes) {
         const Limits limits;
