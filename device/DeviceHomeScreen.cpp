@@ -182,9 +182,9 @@ Result<std::vector<std::string>> DeviceHomeScreen::order() {
     });
     if (!status) return status.error();
     IdentifierList list;
-    if (!state.empty()) {
-        const Result<PropertyList> layout = propertyLists_.parse(state);
-        if (!layout) return layout.error();
+    // One that is damaged is none: the applications are there all the same.
+    const Result<PropertyList> layout = propertyLists_.parse(state);
+    if (layout) {
         for (const PropertyList& element : layout->elements()) {
             if (const std::string* identifier = element.asString()) list.add(*identifier);
         }

@@ -4,9 +4,9 @@
 #include <sys/stat.h>
 #include <unistd.h>
 
-#include <algorithm>
 #include <cerrno>
 #include <system_error>
+#include <utility>
 
 namespace appsync {
 
@@ -67,7 +67,11 @@ Result<std::size_t> HostFile::read(std::span<std::uint8_t> buffer) {
 Result<Bytes> readHostFile(const std::string& path, std::uint64_t maximumBytes) {
     Result<HostFile> file = HostFile::open(path);
     if (!file) return file.error();
-    Bytes contents(std::min(file->size(), maximumBytes) + 1);
+    const ErrorRecord tooLarge =
+        ErrorRecord::make(kPosixErrorDomain, EFBIG,
+                          path + " is too large, or grows while it is read; see what it is");
+    if (file->size() > maximumBytes) return tooLarge;
+    Bytes contents(file->size() + 1);
     std::size_t length = 0;
     while (length < contents.size()) {
         const Result<std::size_t> count = file->read(std::span(contents).subspan(length));
@@ -75,10 +79,7 @@ Result<Bytes> readHostFile(const std::string& path, std::uint64_t maximumBytes) 
         if (*count == 0) break;
         length += *count;
     }
-    if (length == contents.size()) {
-        return ErrorRecord::make(kPosixErrorDomain, EFBIG,
-                                 path + " is too large, or grows while it is read; see what it is");
-    }
+    if (length == contents.size()) return tooLarge;
     contents.resize(length);
     return contents;
 }

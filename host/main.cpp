@@ -1,3 +1,4 @@
+#include <fcntl.h>
 #include <poll.h>
 #include <unistd.h>
 
@@ -12,6 +13,16 @@
 #include "host/Problem.h"
 
 namespace {
+
+/// No file may get the number of a standard stream that is closed: what is printed would go there.
+/// Nothing can be written to what stands in its place, so that it shows as before.
+void keepStandardStreams() {
+    int descriptor = 0;
+    while (descriptor >= 0 && descriptor <= STDERR_FILENO) {
+        descriptor = ::open("/dev/null", O_RDONLY | O_CLOEXEC);
+    }
+    if (descriptor >= 0) ::close(descriptor);
+}
 
 bool hasReaderGoneAway() {
     pollfd output = {STDOUT_FILENO, POLLOUT, 0};
@@ -32,6 +43,7 @@ int afterOutput(const appsync::Console& console, int status) {
 int main(int argumentCount, char** arguments) {
     // A reader that goes away (| head) must not end a session in its middle.
     std::signal(SIGPIPE, SIG_IGN);
+    keepStandardStreams();
     const appsync::Console console = appsync::processConsole();
     try {
         const int status =

@@ -2,6 +2,8 @@
 
 #include <chrono>
 
+#include "device/Database.h"
+#include "device/DevicePaths.h"
 #include "platform/PropertyListSerialization.h"
 #include "tests/device/DevicePlatformFixture.h"
 
@@ -54,6 +56,16 @@ TEST_F(DeviceHomeScreenTest, anUpdateKeepsItsPlace) {
 TEST_F(DeviceHomeScreenTest, aRepeatedIdentifierHasItsFirstPlace) {
     ASSERT_TRUE(setLayout(PropertyList::array({kAtlas, kBrook, kAtlas, "../escape"})));
     EXPECT_EQ(layout(), PropertyList::array({kAtlas, kBrook}));
+}
+
+TEST_F(DeviceHomeScreenTest, aDamagedLayoutIsNone) {
+    ASSERT_TRUE(succeeded(install(kBrook)));
+    ASSERT_TRUE(succeeded(install(kAtlas)));
+    ASSERT_TRUE(setLayout(PropertyList::array({kAtlas})));
+    const auto database = Database::open(devicePath(kDatabaseName), Database::Mode::Existing);
+    ASSERT_TRUE((*database)->execute("UPDATE icon_layout SET state = X'62706C697374303041'"));
+    EXPECT_EQ(layout(), PropertyList::array({kBrook, kAtlas}));
+    EXPECT_TRUE(device().homeScreen().ok());
 }
 
 TEST_F(DeviceHomeScreenTest, theLayoutOutlivesTheSession) {

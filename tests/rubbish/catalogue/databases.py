@@ -233,7 +233,7 @@ BLOBS = [
           SYNC, None, also=unharmed),
     Entry("an icon layout of rubbish, screen",
           altered(("INSERT OR REPLACE INTO icon_layout VALUES (1, ?)", (b"bplist00" + b"\xff" * 100,))),
-          ("screen", "{device}", "{out}"), None),
+          ("screen", "{device}", "{out}"), 0),
     Entry("install options of rubbish", altered(*ROWS, ("UPDATE coordinators SET options = ?", (b"bplist00\xff",))),
           SYNC, None, device="used-coordinated", also=unharmed),
     Entry("the path of a promise that climbs",

@@ -186,6 +186,9 @@ ENTRIES = XML + BINARY + [
     Entry("no file", lambda place: None, ("plist", "show", "{input}"), 1, "No such file", device=None),
     Entry("a pipe", lambda place: os.mkfifo(place.input), ("plist", "show", "{input}"), 1,
           "regular file", device=None),
+    Entry("500 GiB of nothing", lambda place: (place.device.mkdir(), (place.device / "big").touch(),
+                                               os.truncate(place.device / "big", 500 << 30))[3:] or None,
+          ("plist", "show", "{device}/big"), 1, "too large", device=None),
     Entry("converted in its own place while damaged", lambda place: b"<plist>",
           ("plist", "convert", "{input}", "--to", "binary", "--out", "{input}"), 1, "line 1", device=None),
 ]
