@@ -9,6 +9,7 @@
 #include <utility>
 
 #include "device/DeviceError.h"
+#include "system/PosixError.h"
 
 namespace appsync {
 
@@ -68,6 +69,14 @@ int systemErrorOf(sqlite3* handle) {
     return meansNoSpace(ofDatabase) ? ofDatabase : sqlite3_system_errno(handle);
 }
 
+// What the system says of it, where it was the cause.
+std::string systemReason(const Failure& failure) {
+    const int primary = failure.resultCode & 0xff;
+    const bool isOfSystem = primary == SQLITE_IOERR || primary == SQLITE_CANTOPEN;
+    if (!isOfSystem || failure.systemError == 0) return {};
+    return ": " + posixReason(failure.systemError);
+}
+
 // The one place where SQLite's result codes become errors.
 ErrorRecord databaseError(const Failure& failure) {
     const std::string what = "the device's database " + failure.path;
@@ -101,7 +110,7 @@ ErrorRecord databaseError(const Failure& failure) {
                                    "when that one is done");
         default:
             return deviceError(DeviceErrorCode::CannotUse,
-                               what + " cannot be used: " + failure.reason +
+                               what + " cannot be used: " + failure.reason + systemReason(failure) +
                                    "; check the disk and who may write there");
     }
 }

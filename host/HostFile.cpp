@@ -5,14 +5,15 @@
 #include <unistd.h>
 
 #include <cerrno>
-#include <system_error>
 #include <utility>
+
+#include "system/PosixError.h"
 
 namespace appsync {
 
 ErrorRecord systemError(int errorNumber, const std::string& what) {
-    const std::string text = std::generic_category().message(errorNumber);
-    return ErrorRecord::make(kPosixErrorDomain, errorNumber, what + ": " + text);
+    return ErrorRecord::make(kPosixErrorDomain, errorNumber,
+                             what + ": " + posixReason(errorNumber));
 }
 
 namespace {

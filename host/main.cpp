@@ -2,10 +2,16 @@
 #include <poll.h>
 #include <unistd.h>
 
+#include <array>
 #include <csignal>
+#include <cstdio>
+#include <cstdlib>
+#include <cstring>
 #include <exception>
+#include <new>
 #include <ostream>
 #include <string>
+#include <system_error>
 #include <vector>
 
 #include "host/CommandLine.h"
@@ -38,11 +44,38 @@ int afterOutput(const appsync::Console& console, int status) {
     return status == appsync::kExitDone ? appsync::kExitSomethingFailed : status;
 }
 
+/// An exception that nothing on its thread can catch: it ends the process, as a crash would, which
+/// a device survives. Who runs out of memory or threads is told so.
+[[noreturn]] void endWithoutMeans() {
+    const char* what = nullptr;
+    try {
+        if (const std::exception_ptr thrown = std::current_exception()) {
+            std::rethrow_exception(thrown);
+        }
+    } catch (const std::bad_alloc& error) {
+        what = error.what();
+    } catch (const std::system_error& error) {
+        what = error.what();
+    } catch (...) {
+        what = nullptr;
+    }
+    if (what == nullptr) std::abort();
+    // In one piece: another thread may be about to say the same.
+    std::array<char, 256> line{};
+    std::snprintf(line.data(), line.size(), "appsync: out of means: %s: run it again\n", what);
+    [[maybe_unused]] const ssize_t written =
+        ::write(STDERR_FILENO, line.data(), std::strlen(line.data()));
+    ::_exit(appsync::kExitSomethingFailed);
+}
+
 }  // namespace
 
 int main(int argumentCount, char** arguments) {
     // A reader that goes away (| head) must not end a session in its middle.
     std::signal(SIGPIPE, SIG_IGN);
+    std::signal(SIGXFSZ,
+                SIG_IGN);  // nor a limit on the size of files: that is an error of the write
+    std::set_terminate(endWithoutMeans);
     keepStandardStreams();
     const appsync::Console console = appsync::processConsole();
     try {

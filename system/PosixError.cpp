@@ -1,5 +1,6 @@
 #include "system/PosixError.h"
 
+#include <cerrno>
 #include <cstring>
 
 namespace appsync {
@@ -30,6 +31,7 @@ ErrorRecord failure(int code, std::string_view operation, const std::string& wha
 }  // namespace
 
 std::string posixReason(int code) {
+    if (code == EMFILE) return "Too many open files (raise their limit with ulimit -n)";
     if (const char* text = ::strerrordesc_np(code)) return text;
     return "unknown error " + std::to_string(code);
 }

@@ -58,8 +58,9 @@ Result<RootDirectory> RootDirectory::open(const std::string& machinePath) {
     if (!root) return posixError(errno, "open the device's files in", machinePath);
     if (!openInRoot(root.get(), "/", O_PATH | O_DIRECTORY, 0)) {
         const int code = errno;
-        return posixError(code, "resolve paths inside", machinePath,
-                          posixReason(code) + " (this needs openat2: Linux 5.6 or newer)");
+        const bool mayLackIt = code == ENOSYS || code == EPERM;
+        const char* need = mayLackIt ? " (this needs openat2: Linux 5.6 or newer)" : "";
+        return posixError(code, "resolve paths inside", machinePath, posixReason(code) + need);
     }
     return RootDirectory(std::move(root));
 }
