@@ -28,7 +28,7 @@ Result<PropertyList> readPropertyList(const std::string& file) {
     const Result<Bytes> bytes = readHostFile(file, kLargestPropertyList);
     if (!bytes) return bytes.error();
     Result<PropertyList> value = SystemPropertyLists().parse(*bytes);
-    if (!value) return value.error().withContext(file);
+    if (!value) return failure(value.error().withContext(file).description(), "correct it there");
     return value;
 }
 

@@ -74,7 +74,7 @@ void readIconOrder(Library& library, PropertyListSerialization& propertyLists) {
     if (problem.empty()) {
         library.iconOrder = *std::move(bytes);
     } else {
-        library.faults.push_back({name, problem});
+        library.faults.push_back({name, problem + "; correct it, or remove it"});
     }
 }
 
