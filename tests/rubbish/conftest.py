@@ -46,6 +46,10 @@ class Command:
             ["/usr/bin/python3", "-S", "-E", str(HERE / "measure.py")],
             stdin=subprocess.PIPE, stdout=subprocess.PIPE, text=True)
 
+    @property
+    def is_sanitized(self):
+        return "san" in self.program.rsplit("/", 2)[1]
+
     def __call__(self, *arguments, directory="/"):
         order = {"command": [self.program, *map(str, arguments)], "timeout": TIMEOUT,
                  "environment": self.environment, "out": self.out, "err": self.err,

@@ -69,7 +69,7 @@ def test_outcome(kind, entry, appsync, templates, scratch, base):
             entry.also(place, done)
         assert done.seconds <= SECONDS
         # A sanitizer's own memory is there before anything is read.
-        limit = KILOBYTES + (base if "san" in appsync.program.rsplit("/", 2)[1] else 0)
+        limit = KILOBYTES + (base if appsync.is_sanitized else 0)
         assert done.kilobytes <= limit, done.kilobytes
     finally:
         shutil.rmtree(place.top, ignore_errors=True)
