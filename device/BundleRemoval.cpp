@@ -44,9 +44,22 @@ Status find(Database& database, const std::string& identifier, Outcome& outcome)
     return {};
 }
 
+const char* nothingToRemove(Removal removal) {
+    switch (removal) {
+        case Removal::PlaceholderOnly:
+            return " has no placeholder to remove";
+        case Removal::SyncPlaceholderOnly:
+            return " has no placeholder of the install that failed";
+        default:
+            return " is not installed; appsync apps shows what is";
+    }
+}
+
 // Decides what goes. An error when that is nothing.
 Status decide(const std::string& identifier, Removal removal, Outcome& outcome) {
-    outcome.removedPlaceholder = outcome.placeholder.has_value();
+    outcome.removedPlaceholder =
+        outcome.placeholder && (removal != Removal::SyncPlaceholderOnly ||
+                                outcome.placeholder->installType == kInstallTypeSync);
     const bool applicationToo =
         removal == Removal::Everything ||
         (removal == Removal::PlaceholderFirst && !outcome.removedPlaceholder);
@@ -56,10 +69,8 @@ Status decide(const std::string& identifier, Removal removal, Outcome& outcome) 
                              identifier + " is a system application and cannot be removed");
     }
     if (outcome.removedApplication || outcome.removedPlaceholder) return {};
-    const char* what = removal == Removal::PlaceholderOnly
-                           ? " has no placeholder to remove"
-                           : " is not installed; appsync apps shows what is";
-    return registryError(RegistryErrorCode::NothingInstalled, identifier + what);
+    return registryError(RegistryErrorCode::NothingInstalled,
+                         identifier + nothingToRemove(removal));
 }
 
 Status runFor(Database& database, const char* sql, const std::string& identifier) {

@@ -14,6 +14,9 @@ enum class Removal {
     /// The placeholder where there is one, else the application.
     PlaceholderFirst,
     PlaceholderOnly,
+    /// The placeholder of a sync, which stands for an install that has failed. What was there
+    /// before that install stays.
+    SyncPlaceholderOnly,
     /// All of it, and the installer's list says so: what a person does.
     Everything,
 };

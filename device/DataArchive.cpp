@@ -27,6 +27,8 @@ namespace {
 
 namespace fs = std::filesystem;
 
+constexpr std::size_t kReadPieceBytes = std::size_t{256} << 10U;
+
 // Data may be much, lie deep, and compress as well as it likes; what counts is the room for it.
 PackageLimits dataLimits() {
     PackageLimits limits;
@@ -88,12 +90,22 @@ class DataListing {
     std::vector<std::string> leftOut_;
 };
 
+// The reason alone: an archive of data is no package, and what packages are advised to is no advice
+// for it.
+ErrorRecord bare(const ErrorRecord& error, const std::string& name) {
+    if (error.domain != kInstallerErrorDomain) return error;
+    std::string reason = error.description();
+    const std::string subject = "package " + quotedName(name) + ": ";
+    if (reason.starts_with(subject)) reason.erase(0, subject.size());
+    return ErrorRecord::make(error.domain, error.code, reason.substr(0, reason.rfind("; ")));
+}
+
 Result<std::unique_ptr<PackageArchive>> openArchive(Result<PackageFile> file) {
     if (!file) return file.error();
     const std::string name = file->name();
     Result<std::unique_ptr<PackageArchive>> archive =
         PackageArchive::open(*std::move(file), dataLimits());
-    if (!archive) return archive.error().withContext("the archive of data " + name);
+    if (!archive) return bare(archive.error(), name);
     return archive;
 }
 
@@ -131,9 +143,22 @@ Result<DataArchiveContents> writeDataArchive(const RootDirectory& root,
     return contents;
 }
 
-Status checkDataArchive(const std::string& file) {
+Result<std::uint64_t> checkDataArchive(const std::string& file) {
     const auto archive = openArchive(PackageFile::open(file));
-    return archive ? Status() : Status(archive.error());
+    if (!archive) return archive.error();
+    return (*archive)->unpackedBytes();
+}
+
+Status verifyDataArchive(const std::string& file) {
+    const auto archive = openArchive(PackageFile::open(file));
+    if (!archive) return archive.error();
+    Bytes piece(kReadPieceBytes);
+    for (const PackageEntry& entry : (*archive)->entries()) {
+        if (entry.isDirectory) continue;
+        const Status read = (*archive)->stream(entry, piece, [](ByteView) { return Status(); });
+        if (!read) return bare(read.error(), (*archive)->name());
+    }
+    return {};
 }
 
 Status unpackDataArchive(int archive, std::string_view name, int directory) {
@@ -141,7 +166,8 @@ Status unpackDataArchive(int archive, std::string_view name, int directory) {
     if (!opened) return opened.error();
     if (Status status = checkSpace(directory, **opened); !status) return status;
     const PackageUnpackOptions options;
-    return PackageUnpacker(**opened, directory, options).run();
+    const Status unpacked = PackageUnpacker(**opened, directory, options).run();
+    return unpacked ? unpacked : Status(bare(unpacked.error(), (*opened)->name()));
 }
 
 }  // namespace appsync

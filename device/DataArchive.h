@@ -25,11 +25,17 @@ struct DataArchiveContents {
                                                            const std::string& file);
 
 /// Refuses a file of this machine that is no archive of data, or one that no device would unpack.
-[[nodiscard]] Status checkDataArchive(const std::string& file);
+/// Takes what the archive says of its contents for true, and gives the bytes that they unpack to.
+/// Errors say what is wrong with the archive; which it is, and what to do, is for the caller to
+/// say.
+[[nodiscard]] Result<std::uint64_t> checkDataArchive(const std::string& file);
+
+/// The same, and reads the contents, in pieces, as an unpacking does.
+[[nodiscard]] Status verifyDataArchive(const std::string& file);
 
 /// Unpacks an archive of data into an empty directory. Both descriptors stay the caller's; `name`
-/// is what errors call the archive. Nothing is made durable. Refused before the first byte when
-/// more would be unpacked than there is room for.
+/// is what errors of the system call the archive. Nothing is made durable. Refused before the first
+/// byte when more would be unpacked than there is room for.
 [[nodiscard]] Status unpackDataArchive(int archive, std::string_view name, int directory);
 
 }  // namespace appsync

@@ -166,7 +166,23 @@ void DeviceRegistry::finishInstallPhase(InstallProgressRecord& record) {
 Status DeviceRegistry::installPackage(const FileURL& package, const PropertyList& options) {
     const Result<std::string> identifier = identifierOf(options, PackageTypeCustomer);
     if (!identifier) return identifier.error();
-    return installApplication(context_, *identifier, package, installTypeOf(options));
+    Status status = installApplication(context_, *identifier, package, installTypeOf(options));
+    noteInstall(*identifier, status);
+    return status;
+}
+
+void DeviceRegistry::noteInstall(const std::string& identifier, const Status& status) {
+    const std::lock_guard guard(mutex_);
+    if (status) {
+        failedInstalls_.erase(identifier);
+    } else {
+        failedInstalls_.insert(identifier);
+    }
+}
+
+bool DeviceRegistry::takeFailedInstall(const std::string& identifier) {
+    const std::lock_guard guard(mutex_);
+    return failedInstalls_.erase(identifier) > 0;
 }
 
 Status DeviceRegistry::installPlaceholderBundle(const FileURL& directory,
@@ -191,8 +207,10 @@ Status DeviceRegistry::uninstallApplication(const std::string& identifier,
     if (Status status = requireLegalIdentifier(identifier); !status) return status;
     const PropertyList* only = options.find(UninstallPlaceholderOnlyKey);
     const bool placeholderOnly = only != nullptr && only->booleanConversion().value_or(false);
+    if (placeholderOnly) return removeBundles(context_, identifier, Removal::PlaceholderOnly);
+    const bool clearsUp = takeFailedInstall(identifier);
     return removeBundles(context_, identifier,
-                         placeholderOnly ? Removal::PlaceholderOnly : Removal::PlaceholderFirst);
+                         clearsUp ? Removal::SyncPlaceholderOnly : Removal::PlaceholderFirst);
 }
 
 void DeviceRegistry::addObserver(std::weak_ptr<AppRegistryObserver> observer) {

@@ -1,7 +1,9 @@
 #pragma once
 
 #include <memory>
+#include <mutex>
 #include <optional>
+#include <set>
 #include <string>
 
 #include "device/InstallContext.h"
@@ -13,6 +15,10 @@ namespace appsync {
 /// The registry of a device: what is installed is what its database says, and the containers on
 /// disk hold it. A failure of the database reads as "nothing there"; `Device::databaseFailure`
 /// tells of it.
+///
+/// The uninstall without options that follows a failed install is the clearing up after it: it
+/// takes the placeholder of a sync away and nothing else, so that what was there before the install
+/// stays.
 class DeviceRegistry final : public AppRegistry {
   public:
     explicit DeviceRegistry(const InstallContext& context);
@@ -39,9 +45,14 @@ class DeviceRegistry final : public AppRegistry {
 
   private:
     [[nodiscard]] InstallsUnderWay installsUnderWay();
+    void noteInstall(const std::string& identifier, const Status& status);
+    [[nodiscard]] bool takeFailedInstall(const std::string& identifier);
 
     const InstallContext context_;
     RegistryObservers observers_;
+    std::mutex mutex_;
+    /// Whose last install has failed, until an uninstall follows. Guarded by `mutex_`.
+    std::set<std::string> failedInstalls_;
 };
 
 /// A registry error unless the identifier is a legal one.

@@ -53,7 +53,11 @@ Status placeRestoredData(const InstallContext& context, const std::string& ident
     if (status) status = replaceData(context, unpacked, dataDirectoryOf(identifier));
     if (status) return status;
     context.files.removeItem(unpacked).ignore();
-    return status.error().withContext("the data of " + identifier + " cannot be restored");
+    const ErrorRecord error =
+        status.error().withContext("the data of " + identifier + " cannot be restored");
+    if (error.domain != kInstallerErrorDomain) return error;
+    return ErrorRecord::make(error.domain, error.code,
+                             error.description() + "; restore it from another backup");
 }
 
 void dropRestoredData(const InstallContext& context, const std::string& identifier) {

@@ -7,6 +7,7 @@
 
 #include <nlohmann/json.hpp>
 
+#include "device/DataArchive.h"
 #include "device/PackageIdentifier.h"
 #include "host/BackupManifestKeys.h"
 #include "host/BackupManifestReader.h"
@@ -79,7 +80,10 @@ std::string defectOf(const std::string& backup, const std::string& name, const F
     }
     const Result<FileSum> sum = sumOfFile(path.native());
     if (!sum) return sum.error().description();
-    return *sum == expected ? "" : "its contents are altered";
+    if (*sum != expected) return "its contents are altered";
+    if (!identifierOfData(name)) return "";
+    const Status verified = verifyDataArchive(path.native());
+    return verified ? "" : "no device can unpack it: " + verified.error().description();
 }
 
 using Defects = std::map<std::string, std::string>;  // by file

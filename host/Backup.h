@@ -62,7 +62,8 @@ struct BackupFault {
 /// The manifest as it stands in its file.
 [[nodiscard]] Bytes manifestText(const BackupManifest& manifest);
 
-/// Compares every file with its sum, and the parts of the manifest with each other. Files that the
+/// Compares every file with its sum, and the parts of the manifest with each other, and reads the
+/// archives of data as a device does that unpacks them. Files that the
 /// manifest does not name are faults, too. One fault a file, sorted by its name; a link is a fault
 /// wherever it leads.
 [[nodiscard]] std::vector<BackupFault> checkBackup(const std::string& backup,

@@ -237,12 +237,22 @@ class BackupMaking {
             const Result<bool> copied = copyWaitingData(identifier, name);
             if (!copied) return copied.error();
             application.hasData = *copied;
-        } else if (const Status usable = checkDataArchive(pathOf(name)); !usable) {
-            leaveOut(identifier, usable.error().description());
+        }
+        if (!application.hasData) return {};
+        if (const Status usable = checkArchive(name, contents->entries > 0); !usable) {
+            leaveOut(identifier, "its archive: " + usable.error().description());
             application.hasData = false;
             ::unlink(pathOf(name).c_str());
+            return {};
         }
-        return application.hasData ? note(name) : Status();
+        return note(name);
+    }
+
+    // What was written here is what was read; what a restore has left came from elsewhere.
+    [[nodiscard]] Status checkArchive(const std::string& name, bool isOwn) const {
+        if (!isOwn) return verifyDataArchive(pathOf(name));
+        const Result<std::uint64_t> checked = checkDataArchive(pathOf(name));
+        return checked ? Status() : Status(checked.error());
     }
 
     void leaveOut(const std::string& identifier, const std::string& reason) {

@@ -73,14 +73,14 @@ ErrorRecord interrupted() {
 
 ErrorRecord cutShort(const std::string& file) {
     return ErrorRecord::make(kTransferErrorDomain, kTransferCutShort,
-                             file + " became shorter while it was sent: run the command again");
+                             file + " became shorter while it was sent: send it again");
 }
 
 ErrorRecord cannotWrite(int errorNumber, const std::string& path) {
     ErrorRecord error = systemError(errorNumber, "cannot write " + path);
     std::string advice;
     if (errorNumber == ENOSPC || errorNumber == EDQUOT) {
-        advice = "; free space on the device and run it again";
+        advice = "; free space on the device and send it again";
     } else if (errorNumber == ENAMETOOLONG) {
         advice =
             "; the device has no room for names that long: give the application an identifier of "

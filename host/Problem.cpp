@@ -2,6 +2,8 @@
 
 #include <string>
 
+#include "host/Text.h"
+
 namespace appsync {
 namespace {
 
@@ -26,6 +28,13 @@ ErrorRecord unusable(std::string_view what, std::string_view whatToDo) {
 
 ErrorRecord unusable(const ErrorRecord& cause) {
     return ErrorRecord::make(kCommandErrorDomain, kExitUnusable, cause.description());
+}
+
+ErrorRecord lackOfSpace(std::string_view subject, std::uint64_t needed, std::uint64_t free,
+                        std::string_view whatToDo) {
+    return failure(std::string(subject) + " needs " + formatBytes(needed) + ", the device has " +
+                       formatBytes(free) + " free",
+                   whatToDo);
 }
 
 ExitStatus exitStatusOf(const ErrorRecord& error) {

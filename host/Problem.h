@@ -1,5 +1,6 @@
 #pragma once
 
+#include <cstdint>
 #include <string_view>
 
 #include "platform/Error.h"
@@ -25,6 +26,10 @@ inline constexpr std::string_view kCommandErrorDomain = "appsync";
 [[nodiscard]] ErrorRecord unusable(std::string_view what, std::string_view whatToDo);
 /// The same of an error that somebody else has found.
 [[nodiscard]] ErrorRecord unusable(const ErrorRecord& cause);
+
+/// The device has no room for `subject`.
+[[nodiscard]] ErrorRecord lackOfSpace(std::string_view subject, std::uint64_t needed,
+                                      std::uint64_t free, std::string_view whatToDo);
 
 /// The exit status that the error asks for; `kExitSomethingFailed` for errors of other domains.
 [[nodiscard]] ExitStatus exitStatusOf(const ErrorRecord& error);

@@ -32,8 +32,6 @@ constexpr std::uint64_t kLargestList = std::uint64_t{2} << 30U;
 constexpr std::int64_t kApplicationsToo[] = {2, 3};
 // Where the device's files for a placeholder are named ID.app.
 constexpr std::size_t kLongestIdentifier = 251;
-// Under which an archive arrives: no name of an archive.
-constexpr const char* kPartialArchive = "arriving.part";
 
 std::string directoryOf(std::string_view path) {
     return std::string(path.substr(0, path.rfind('/')));
@@ -202,17 +200,12 @@ class Restoring {
 
     Status placeData() {
         PackageSender sender(device_);
-        device_.files().removeItem(partialArchive()).ignore();  // of a restore that was cut off
         std::vector<std::string> identifiers;
         for (const BackedUpApplication& each : manifest_.applications) {
             const std::string name = dataArchiveName(each.identifier);
             if (!each.hasData || installed_.contains(each.identifier) || !canUse(name)) continue;
             // An offloaded application has kept its own.
             if (device_.files().itemExists(Device::dataPath(each.identifier))) continue;
-            if (const Status usable = checkDataArchive(pathOf(name)); !usable) {
-                failData(each.identifier, usable.error().description());
-                continue;
-            }
             const Status placed = placeArchive(sender, each.identifier, pathOf(name));
             if (placed) {
                 identifiers.push_back(each.identifier);
@@ -227,20 +220,21 @@ class Restoring {
         return known ? known : Status(unusable(known.error()));
     }
 
-    // Under another name first: an archive is there whole, or not at all.
+    // An install fails for good while data waits that the device has no room for.
     Status placeArchive(PackageSender& sender, const std::string& identifier,
                         const std::string& file) {
-        const std::string path = Device::restoreDataPath(identifier);
-        const std::string directory = directoryOf(path);
-        const Result<std::uint64_t> sent = sender.send(
-            file, directory, kPartialArchive, [](std::uint64_t, std::uint64_t) { return true; });
-        if (!sent) return sent.error();
-        device_.files().removeItem(path).ignore();
-        return device_.files().moveItem(partialArchive(), path);
-    }
-
-    static std::string partialArchive() {
-        return directoryOf(Device::restoreDataPath("any")) + "/" + kPartialArchive;
+        const fs::path place = Device::restoreDataPath(identifier);
+        const Result<std::uint64_t> unpacked = checkDataArchive(file);
+        if (!unpacked) return unpacked.error();
+        const Result<std::uint64_t> free = device_.freeSpace();
+        if (free && *unpacked > *free) {
+            return lackOfSpace("its data", *unpacked, *free,
+                               "free space on the device and restore again");
+        }
+        const Result<std::uint64_t> sent =
+            sender.sendWhole(file, place.parent_path().native(), place.filename().native(),
+                             [](std::uint64_t, std::uint64_t) { return true; });
+        return sent ? Status() : Status(sent.error());
     }
 
     // A list that is none goes to the device all the same: the device judges it. One that the

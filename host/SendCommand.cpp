@@ -186,10 +186,8 @@ class Sending {
                 PackageReader::open(arguments_.file, device_->propertyLists());
             if (package) needed += bytesOnDevice(package->info());
         }
-        if (needed <= *free) return {};
-        return failure(
-            "it needs " + formatBytes(needed) + ", the device has " + formatBytes(*free) + " free",
-            "free space on the device");
+        return needed <= *free ? Status()
+                               : lackOfSpace("it", needed, *free, "free space on the device");
     }
 
     // Nothing is sent. A device that cannot be used is an error, not a failure of this package.
@@ -257,14 +255,15 @@ class Sending {
     // An archive waits where the device unpacks it with the install; any other file is the data.
     Status placeData() {
         const std::filesystem::path archive = Device::restoreDataPath(arguments_.identifier);
-        const Status isArchive = checkDataArchive(arguments_.file);
+        const Status isArchive = verifyDataArchive(arguments_.file);
         if (isArchive) {
             parcel_.directory = archive.parent_path().native();
             parcel_.name = archive.filename().native();
             return {};
         }
         if (beginsAsArchive(arguments_.file)) {
-            return failure(isArchive.error().description(), "send the archive of a whole backup");
+            return failure(arguments_.file + ": " + isArchive.error().description(),
+                           "send the archive of a whole backup");
         }
         parcel_.directory = Device::dataPath(arguments_.identifier);
         parcel_.name = std::filesystem::path(arguments_.file).filename().string();

@@ -44,7 +44,7 @@ ErrorRecord illegalIdentifier() {
 
 ErrorRecord cancelledByDevice() {
     return ErrorRecord::make(kTransferErrorDomain, kTransferCancelled,
-                             "the device cancelled its install: run the command again to have it");
+                             "the device cancelled its install: sync it again to have it");
 }
 
 bool isOfInterruption(const ErrorRecord& error) {

@@ -101,6 +101,8 @@ class SyncRun {
     Status openDevice() {
         DeviceOpenOptions options;
         options.access = arguments_.isDryRun ? DeviceAccess::Look : DeviceAccess::Session;
+        const PlanOptions& plan = arguments_.plan;
+        options.makesRoom = !arguments_.isDryRun && (plan.mirror || !plan.remove.empty());
         Result<std::unique_ptr<Device>> device = Device::open(arguments_.device, options);
         if (!device) return unusable(device.error());
         device_ = *std::move(device);
@@ -248,7 +250,10 @@ class SyncRun {
              [this](const std::string& identifier) {
                  return !standing_.arrived.contains(identifier);
              }});
-        if (arguments_.isStaged && end.isSuccess()) endStagedSession(*device_);
+        if (arguments_.isStaged && end.isSuccess()) {
+            isStagingOver_ = true;
+            endStagedSession(*device_);
+        }
         Result<SessionAftermath> aftermath = aftermathOf(*device_, end, facts_);
         if (aftermath) {
             if (end.isSuccess()) forgetFailures(aftermath->present);
@@ -279,6 +284,7 @@ class SyncRun {
         events_.finishSoon(summary);
         if (const int status = endedWith_; status >= 0) ::_exit(status);
         if (!summary.incomplete) ::_exit(kExitDone);
+        if (isStagingOver_) ::_exit(kExitSomethingFailed);
         leaveAtOnce(console_);
     }
 
@@ -302,7 +308,8 @@ class SyncRun {
         }
         endedWith_ = summary.incomplete ? kExitSomethingFailed : kExitDone;
         events_.finish(summary);
-        const bool isInterrupted = summary.incomplete && signals_->stopRequested();
+        const bool isInterrupted =
+            summary.incomplete && signals_->stopRequested() && !isStagingOver_;
         if (isInterrupted) console_.fail(failure("interrupted", kRunAgain));
         return endedWith_;
     }
@@ -323,9 +330,11 @@ class SyncRun {
     bool mustNotRun_ = false;
     const Clock::time_point begin_ = Clock::now();
     std::atomic<bool> isPlanned_ = false;  // the plan is made, and changes no more
-    std::atomic<int> endedWith_ = -1;      // the status that the session's own end has found
-    std::atomic_flag isDeviceTaken_;       // by whoever closes the device, or leaves it
-    std::optional<StopSignals> signals_;   // not for a dry run
+    // What is left of a staging area whose session has ended, the same command does not do.
+    std::atomic<bool> isStagingOver_ = false;
+    std::atomic<int> endedWith_ = -1;     // the status that the session's own end has found
+    std::atomic_flag isDeviceTaken_;      // by whoever closes the device, or leaves it
+    std::optional<StopSignals> signals_;  // not for a dry run
 };
 
 }  // namespace

@@ -146,6 +146,20 @@ def hostile_packages(folder, identifier="com.example.bad"):
     yield "bomb", write_zip(os.path.join(folder, "bomb.zip"), good + [(bundle + "bomb", bytes(500 << 20))])
 
 
+def damage_contents(path, name):
+    """Alters the packed bytes of an entry, and nothing that the archive says of itself."""
+    with zipfile.ZipFile(path) as archive:
+        found = archive.getinfo(name)
+    with open(path, "r+b") as file:
+        file.seek(found.header_offset + 26)
+        lengths = struct.unpack("<HH", file.read(4))
+        file.seek(sum(lengths) + found.compress_size // 2, os.SEEK_CUR)
+        byte = file.read(1)[0]
+        file.seek(-1, os.SEEK_CUR)
+        file.write(bytes([byte ^ 0xFF]))
+    return path
+
+
 def _with_wrong_crc(data):
     """The CRC of the first entry, changed in both headers."""
     data = bytearray(data)

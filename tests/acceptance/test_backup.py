@@ -367,6 +367,8 @@ def hostile_archives(folder):
     whole = packages.write_zip(os.path.join(folder, "cut.zip"), [("a", b"1")])
     os.truncate(whole, os.path.getsize(whole) - 10)
     yield "cut"
+    packages.damage_contents(packages.write_zip(os.path.join(folder, "crc.zip"), [("a", b"text" * 99)]), "a")
+    yield "crc"
     for label, content in (("empty", b""), ("rubbish", b"rubbish" * 50)):
         with open(os.path.join(folder, label + ".zip"), "wb") as file:
             file.write(content)
@@ -383,6 +385,9 @@ def test_archives_that_no_device_would_unpack_are_named_and_their_applications_i
     write_manifest(backup, manifest)
     entry = {"VessikMetadata": metadata(title="T", bundleVersion="1")}
     change_info(backup, lambda info: info.update({label: entry for label in labels}))
+    faults = appsync.json("backup", "--check", backup, expect=1)["faults"]
+    assert [each["file"] for each in faults] == ["data/%s.zip" % label for label in labels]
+    assert all("no device can unpack it" in each["error"] for each in faults)
     result = restore(fresh, backup, expect=1)
     assert names_of(result["failed"]) == labels
     assert all("comes back without its data" in each["error"] for each in result["failed"])
@@ -397,6 +402,47 @@ def test_archives_that_no_device_would_unpack_are_named_and_their_applications_i
         for label in labels:
             appsync("send", fresh.path, label, os.path.join(library, label + ".zip"), "--restore", "--parts", "3")
     assert sorted(fresh.apps()) == labels
+
+
+@ON_ONE_PATH
+def test_data_that_the_device_has_no_room_for_is_named(appsync, device, store, tmp_path):
+    """It would make each install of its application fail."""
+    device.sync(store)
+    write_data(device, IDS[0], {"zeros": bytes(40 << 20)})
+    write_data(device, IDS[1], {"letter": b"Dear"})
+    appsync("backup", device.path, tmp_path / "b")
+    os.mkdir(tmp_path / "disk")
+    script = ("mount -t tmpfs -o size=20m tmpfs {0}/disk && {1} create {0}/disk/d >&2 && "
+              "{1} restore {0}/disk/d {0}/b --json; echo $? >&2; ls {0}/disk/d/root{2} >&2"
+              ).format(tmp_path, appsync.program, ARCHIVES)
+    done = in_own_mounts(script)
+    result = json.loads(done.stdout)
+    assert sorted(result["restored"]) == IDS and names_of(result["failed"]) == [IDS[0]]
+    assert "needs 40.0 MiB" in result["failed"][0]["error"] and "restore again" in result["failed"][0]["error"]
+    assert done.stderr.splitlines()[-2:] == ["1", IDS[1] + ".zip"]
+
+
+@ON_ONE_PATH
+def test_data_that_is_no_good_is_not_sent(appsync, backup, fresh, store):
+    restore(fresh, backup)
+    appsync("send", fresh.path, IDS[1], os.path.join(store, IDS[1] + ".zip"), "--restore")
+    archive = os.path.join(backup, "data", IDS[1] + ".zip")
+    good = os.path.join(os.path.dirname(backup), "good.zip")
+    shutil.copy(archive, good)
+    packages.damage_contents(archive, "Documents/letter.txt")
+    done = appsync("send", fresh.path, IDS[1], archive, "--restore", "--parts", "2", "--json", expect=1)
+    assert "entry 'Documents/letter.txt'" in stripped(done.stderr) and json.loads(done.stdout)["bytes"] == 0
+    appsync("send", fresh.path, IDS[1], good, "--restore", "--parts", "2")
+    assert data_of(fresh, IDS[1])["Documents/letter.txt"] == b"Dear"
+
+
+@ON_ONE_PATH
+def test_waiting_data_that_is_no_good_is_left_out_of_the_next_backup(appsync, backup, fresh, tmp_path):
+    restore(fresh, backup)
+    packages.damage_contents(fresh.inside(ARCHIVES + "/" + IDS[1] + ".zip"), "Documents/letter.txt")
+    result = appsync.json("backup", fresh.path, tmp_path / "again", expect=1)
+    assert names_of(result["leftOut"]) == [IDS[1]] and result["data"] == [IDS[2]]
+    appsync("backup", "--check", tmp_path / "again")
 
 
 def test_round_trip_keeps_the_modes_of_data(appsync, device, store, tmp_path, coordination):
@@ -553,6 +599,18 @@ def test_send_of_a_restore_killed_at_random_moments_and_run_again(appsync, backu
         assert IDS[1] in device.apps()
         assert data_of(device, IDS[1])["Documents/letter.txt"] == b"Dear"
         assert [each["identifier"] for each in restore(device, backup)["screen"]] == ORDER
+
+
+def test_package_that_turns_out_to_be_damaged_costs_nothing(appsync, used, tmp_path):
+    """Its contents are not as its directory says, which only the install finds out."""
+    before = screen_of(used)
+    for identifier in (IDS[0], IDS[2]):
+        package = packages.make_package(str(tmp_path / "damaged"), identifier, "9.0")
+        packages.damage_contents(package, "%s.app/Resources/data.bin" % identifier.rsplit(".", 1)[-1].title())
+        done = appsync.json("send", used.path, identifier, package, expect=1)
+        assert names_of(done["failed"]) == [identifier] and "CRC" in done["failed"][0]["error"]
+    assert screen_of(used) == before and used.placeholders() == IDS[2:4]
+    assert data_of(used, IDS[2]) == {"notes": b"of an offloaded one"}
 
 
 def test_what_cannot_be_offloaded_is_refused_and_stays(appsync, used):

@@ -92,6 +92,25 @@ def test_an_interrupted_staged_sync_is_taken_up_by_the_same_command(appsync, lar
     assert device.sync(larger_library, "--staged")["requested"] == []
 
 
+@ON_ONE_PATH
+def test_a_staged_sync_that_has_ended_is_not_to_be_run_again(appsync, device, tmp_path):
+    """The signal comes when all was sent, and what fails then has not been interrupted."""
+    library = str(tmp_path / "large")
+    payload = random.Random(3).randbytes(48 << 20)
+    package = packages.make_package(library, "com.example.large", payload=payload)
+    packages.damage_contents(package, "Large.app/Resources/data.bin")
+    stage(device, [install("com.example.large")])
+    process = appsync.start("sync", device.path, library, "--staged", "--json-lines")
+    for line in process.stdout:
+        if json.loads(line).get("phase") == "install":
+            process.send_signal(signal.SIGINT)
+            break
+    printed, complained = process.communicate(timeout=60)
+    assert process.returncode == 1 and "CRC" in json.loads(printed.splitlines()[-1])["failed"][0]["error"]
+    assert "run the same command again" not in complained
+    assert device.sync(library, "--staged")["requested"] == []
+
+
 def test_killed_update_keeps_one_version_or_the_other(appsync, larger_library, device):
     device.sync(larger_library)
     packages.make_library(larger_library, 12, "2.0", payload=random.Random(8).randbytes(400_000))

@@ -54,9 +54,10 @@ class DataArchiveTest : public testing::Test {
     /// What an archive with these entries is refused for, on both sides.
     std::string refusalOf(const std::vector<ZipEntry>& entries) {
         write("bad.zip", ZipBuilder().add(entries).bytes());
-        const Status checked = checkDataArchive(path("bad.zip"));
+        const Status checked = verifyDataArchive(path("bad.zip"));
         const Status unpacked = unpack("bad.zip");
         EXPECT_FALSE(checked.ok());
+        EXPECT_FALSE(checkDataArchive(path("bad.zip")).ok());
         EXPECT_FALSE(unpacked.ok());
         EXPECT_TRUE(fs::is_empty(path("unpacked"))) << "nothing comes of it";
         return checked ? "" : checked.error().description();
@@ -147,7 +148,8 @@ TEST_F(DataArchiveTest, manySmallFilesAndWellCompressedOnesAreFine) {
     for (int i = 0; i < 500; ++i) write("root/data/many/" + std::to_string(i), std::to_string(i));
     write("root/data/zeros", std::string(std::size_t{32} << 20U, '\0'));
     ASSERT_TRUE(archive().ok());
-    EXPECT_TRUE(checkDataArchive(path("data.zip")).ok());
+    EXPECT_EQ(*checkDataArchive(path("data.zip")), (std::size_t{32} << 20U) + 1390U);
+    EXPECT_TRUE(verifyDataArchive(path("data.zip")).ok());
     ASSERT_TRUE(unpack().ok());
     EXPECT_EQ(read("unpacked/many/499"), "499");
     EXPECT_EQ(fs::file_size(path("unpacked/zeros")), std::size_t{32} << 20U);
@@ -167,9 +169,10 @@ TEST_F(DataArchiveTest, noEntryLeadsOutOfTheData) {
 TEST_F(DataArchiveTest, whatIsNoArchiveIsRefused) {
     for (const char* contents : {"", "text", "PK\3\4 cut off"}) {
         write("none.zip", contents);
-        const Status checked = checkDataArchive(path("none.zip"));
+        const Result<std::uint64_t> checked = checkDataArchive(path("none.zip"));
         ASSERT_FALSE(checked.ok());
-        EXPECT_THAT(checked.error().description(), HasSubstr("none.zip"));
+        EXPECT_EQ(checked.error().domain, kInstallerErrorDomain);
+        EXPECT_THAT(checked.error().description(), testing::Not(HasSubstr("; "))) << "no advice";
         EXPECT_FALSE(unpack("none.zip").ok());
     }
     EXPECT_FALSE(checkDataArchive(path("absent.zip")).ok());
@@ -193,6 +196,19 @@ TEST_F(DataArchiveTest, alteredContentsAreNoticedWhileTheyAreUnpacked) {
     const Status status = unpack("bad.zip");
     ASSERT_FALSE(status.ok());
     EXPECT_TRUE(isPackageError(status.error(), PackageErrorCode::DamagedEntry));
+}
+
+TEST_F(DataArchiveTest, contentsThatAreNotWhatTheArchiveSaysAreFoundByReadingThem) {
+    ZipEntry altered = zipFile("altered", "contents");
+    altered.crc = 12345;
+    ZipEntry longer = zipZeros("longer", 1000);
+    longer.size = longer.localSize = 2000;
+    for (const ZipEntry& entry : {altered, longer}) {
+        write("bad.zip", ZipBuilder().add({zipFile("good", "1"), entry}).bytes());
+        const Status verified = verifyDataArchive(path("bad.zip"));
+        ASSERT_FALSE(verified.ok()) << entry.name;
+        EXPECT_THAT(verified.error().description(), HasSubstr("entry '" + entry.name + "': "));
+    }
 }
 
 TEST_F(DataArchiveTest, moreThanThereIsRoomForIsRefusedBeforeTheFirstByte) {

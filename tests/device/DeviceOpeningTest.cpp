@@ -107,6 +107,25 @@ TEST_F(DeviceOpeningTest, aPipeInPlaceOfTheDatabaseIsRefusedWithoutWaitingOnIt) 
     EXPECT_TRUE(unusable(openSession(devicePath()), DeviceErrorCode::NotADevice));
 }
 
+TEST_F(DeviceOpeningTest, whatStandsInThePlaceOfTheTemporaryDirectoryIsToBeRemoved) {
+    const fs::path directory = rootPath("/var/mobile/tmp");
+    const auto refused = [&] {
+        return unusable(openSession(devicePath()), DeviceErrorCode::CannotUse,
+                        "remove what stands there in its place");
+    };
+    fs::remove_all(directory);
+    fs::create_symlink("/nowhere", directory);
+    EXPECT_TRUE(refused());
+    fs::remove(directory);
+    fs::create_symlink("tmp", directory);
+    EXPECT_TRUE(refused());
+    fs::remove(directory);
+    std::ofstream(directory) << "a file";
+    EXPECT_TRUE(refused());
+    fs::remove(directory);
+    EXPECT_TRUE(openSession(devicePath()).ok());
+}
+
 TEST_F(DeviceOpeningTest, theDatabaseOfSomethingElseIsNotADevice) {
     sql("PRAGMA application_id = 1");
     EXPECT_TRUE(unusable(Device::open(devicePath()), DeviceErrorCode::NotADevice));

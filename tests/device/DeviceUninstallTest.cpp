@@ -55,6 +55,51 @@ TEST_F(DeviceUninstallTest, thePlaceholderGoesFirst) {
     EXPECT_FALSE(either(kAtlas));
 }
 
+/// The uninstall that clears up after an install that has failed.
+class UninstallAfterFailure : public DeviceUninstallTest {
+  protected:
+    void failToInstall() {
+        EXPECT_FALSE(installFrom(stagePackage("com.example.other"), kAtlas).ok());
+    }
+};
+
+TEST_F(UninstallAfterFailure, leavesTheApplicationThatWasThere) {
+    ASSERT_TRUE(succeeded(install(kAtlas, "1.0")));
+    makeData();
+    failToInstall();
+    EXPECT_TRUE(refusedBy(uninstall(), RegistryErrorCode::NothingInstalled, kAtlas));
+    EXPECT_EQ(application(kAtlas)->bundleVersion, "1.0");
+    EXPECT_TRUE(exists(data()));
+    EXPECT_TRUE(succeeded(uninstall())) << "the next one is an uninstall like any other";
+    EXPECT_FALSE(either(kAtlas));
+}
+
+TEST_F(UninstallAfterFailure, leavesAnOffloadedOrRestoredApplicationWithItsData) {
+    for (const std::uint64_t type :
+         {kInstallTypeIntentionalDowngrade, kInstallTypeDowngrade, kInstallTypeRestore}) {
+        ASSERT_TRUE(succeeded(installPlaceholder(kAtlas, type)));
+        makeData();
+        failToInstall();
+        EXPECT_FALSE(uninstall().ok());
+        EXPECT_EQ(either(kAtlas)->installType, type);
+        EXPECT_TRUE(exists(data()));
+    }
+}
+
+TEST_F(UninstallAfterFailure, takesThePlaceholderOfTheSync) {
+    ASSERT_TRUE(succeeded(installPlaceholder(kAtlas, kInstallTypeSync)));
+    failToInstall();
+    EXPECT_TRUE(succeeded(uninstall()));
+    EXPECT_FALSE(either(kAtlas));
+}
+
+TEST_F(UninstallAfterFailure, isOneLikeAnyOtherOnceAnInstallHasSucceeded) {
+    failToInstall();
+    ASSERT_TRUE(succeeded(install(kAtlas, "1.0")));
+    EXPECT_TRUE(succeeded(uninstall()));
+    EXPECT_FALSE(either(kAtlas));
+}
+
 TEST_F(DeviceUninstallTest, placeholderOnlyNeverTouchesTheApplication) {
     ASSERT_TRUE(succeeded(install(kAtlas)));
     EXPECT_TRUE(refusedBy(uninstall(placeholderOnly()), RegistryErrorCode::NothingInstalled));

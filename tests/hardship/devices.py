@@ -29,6 +29,7 @@ class Outcome:
         self.status = report["status"]
         self.count = report["count"]
         self.hit = report["hit"]
+        self.calls = report.get("calls")
         self.said = (done.stdout + done.stderr).strip()
         self.error = done.stderr.strip()
 

@@ -122,8 +122,7 @@ def look(runner, _):
     runner.disk.fill()
     check_looks(runner, identifier)
     for arguments in (["set", runner.device, "installation=no"], ["run", runner.device, identifier],
-                      ["sync", runner.device, runner.library],
-                      ["sync", runner.device, runner.library, "--remove", identifier]):
+                      ["sync", runner.device, runner.library]):
         assert "uninstall" in runner.refused(*arguments) or arguments[0] != "sync"
     runner.check_intact()
     check_looks(runner, identifier)
@@ -147,13 +146,14 @@ def remove(runner, _):
     base = os.path.join(runner.folder, "base")
     shutil.copytree(runner.device, base, symlinks=True)
     for arguments in (["uninstall", runner.device, "com.example.app00"], ["reset", runner.device],
+                      ["sync", runner.device, runner.library, "--remove", "com.example.app00"],
                       ["demote", runner.device, "com.example.app01"]):
         shutil.rmtree(runner.device)
         shutil.copytree(base, runner.device, symlinks=True)
         runner.disk.fill()
         runner.ok(*arguments)
         runner.check_intact()
-        if arguments[0] == "uninstall":
+        if arguments[0] in ("uninstall", "sync"):
             assert "com.example.app00" not in runner.ok("apps", runner.device)
         os.remove(os.path.join(runner.disk.where, "ballast"))
         runner.ok("reset", runner.device)  # the end of a session: the device keeps a reserve again

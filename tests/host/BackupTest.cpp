@@ -1,9 +1,13 @@
 #include "host/Backup.h"
 
+#include <sys/stat.h>
+
 #include <filesystem>
 #include <fstream>
 #include <iterator>
 
+#include "device/ArchiveWriter.h"
+#include "device/PackageFolder.h"
 #include "tests/host/HostFixture.h"
 
 namespace appsync {
@@ -32,10 +36,11 @@ class BackupManifestFile : public HostFixture {
   protected:
     BackupManifestFile() {
         fs::create_directories(backup + "/data");
-        for (const char* name : {"RestoreApplications.plist", "DemotedApps.plist",
-                                 "IconOrder.plist", "data/com.example.a.zip"}) {
+        for (const char* name :
+             {"RestoreApplications.plist", "DemotedApps.plist", "IconOrder.plist"}) {
             add(name, std::string("contents of ") + name);
         }
+        addArchive("data/com.example.a.zip");
         manifest.made = "2026-01-02T03:04:05Z";
         manifest.applications = {{"com.example.a", "1.0", "A & é", true},
                                  {"com.example.b", std::nullopt, "B", false}};
@@ -43,6 +48,14 @@ class BackupManifestFile : public HostFixture {
     void add(const std::string& name, const std::string& contents) {
         write(backup + "/" + name, contents);
         manifest.files[name] = *sumOfFile(backup + "/" + name);
+    }
+    void addArchive(const std::string& name) {
+        write(directory.path() + "/letter", "Dear");
+        const std::string file = backup + "/" + name;
+        const Status written =
+            writeArchive({{directory.path() + "/letter", "letter", S_IFREG | 0644, 4}}, file);
+        ASSERT_TRUE(written.ok()) << written.error().description();
+        manifest.files[name] = *sumOfFile(file);
     }
     void writeManifest() {
         const Bytes text = manifestText(manifest);
@@ -158,7 +171,7 @@ TEST_F(BackupManifestFile, TellsEveryFileThatIsNotAsItWas) {
     EXPECT_THAT(
         textsOf(checkBackup(backup, manifest)),
         ElementsAre("DemotedApps.plist: its contents are altered", "IconOrder.plist: it is missing",
-                    "data/com.example.a.zip: it is altered: 5 bytes instead of 34",
+                    HasSubstr("data/com.example.a.zip: it is altered: 5 bytes instead of "),
                     "data/com.example.c.zip: the manifest does not name it",
                     "link: the manifest does not name it"));
 }
@@ -168,6 +181,13 @@ TEST_F(BackupManifestFile, TellsAFileThatBecameADirectory) {
     fs::create_directory(backup + "/DemotedApps.plist");
     EXPECT_THAT(textsOf(checkBackup(backup, manifest)),
                 ElementsAre(HasSubstr("DemotedApps.plist: ")));
+}
+
+TEST_F(BackupManifestFile, TellsAnArchiveThatIsAsItWasAndYetIsNone) {
+    add("data/com.example.a.zip", "no archive");
+    EXPECT_THAT(
+        textsOf(checkBackup(backup, manifest)),
+        ElementsAre("data/com.example.a.zip: no device can unpack it: it is not a zip archive"));
 }
 
 // The layout.
