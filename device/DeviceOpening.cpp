@@ -3,10 +3,7 @@
 #include <signal.h>
 #include <sys/stat.h>
 
-#include <algorithm>
-#include <array>
 #include <cerrno>
-#include <cstdint>
 #include <filesystem>
 
 #include "device/Containers.h"
@@ -126,21 +123,13 @@ Status openFiles(const fs::path& device, OpenedDevice& opened) {
     return {};
 }
 
-// A file, or a link that leads nowhere, has the name of a directory that the device needs.
-std::string adviceFor(const ErrorRecord& cause) {
-    constexpr std::array<std::int64_t, 3> kCodes = {EEXIST, ENOTDIR, ELOOP};
-    const bool isInTheWay = cause.domain == kPosixErrorDomain &&
-                            std::find(kCodes.begin(), kCodes.end(), cause.code) != kCodes.end();
-    return isInTheWay ? "; remove what stands there in its place" : "";
-}
-
 }  // namespace
 
 ErrorRecord cannotUseDevice(const std::string& path, const ErrorRecord& cause) {
     if (cause.domain == kDeviceErrorDomain) return cause;
-    return deviceError(DeviceErrorCode::CannotUse, "cannot use the device " + displayPath(path) +
-                                                       ": " + cause.description() +
-                                                       adviceFor(cause));
+    return deviceError(DeviceErrorCode::CannotUse,
+                       "cannot use the device " + displayPath(path) + ": " + cause.description() +
+                           (isInTheWay(cause) ? "; remove what stands there in its place" : ""));
 }
 
 Result<OpenedDevice> openDevice(const std::string& path, bool session, bool makesRoom) {

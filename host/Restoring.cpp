@@ -22,6 +22,7 @@
 #include "platform/HomeScreenService.h"
 #include "platform/PropertyListSerialization.h"
 #include "platform/SyncClient.h"
+#include "system/PosixError.h"
 
 namespace appsync {
 namespace {
@@ -43,6 +44,16 @@ std::string without(std::string_view subject, const std::string& sentence) {
     return begins ? " " + sentence.substr(subject.size()) : ": " + sentence;
 }
 
+// The failure to put something on the device, with what to do.
+Status advised(const Status& status) {
+    if (status) return status;
+    const ErrorRecord& error = status.error();
+    if (!isInTheWay(error)) return error;
+    return ErrorRecord::make(
+        error.domain, error.code,
+        error.description() + "; remove what stands there in its place and restore again");
+}
+
 // One restore. The restore information is the last file to be placed: without it, nothing has
 // begun, and whatever was placed is placed again the next time.
 class Restoring {
@@ -62,7 +73,8 @@ class Restoring {
         if (status) status = placeDemotedApps();
         if (!status) return status.error();
         noteUnless(placeIconOrder(), kBackupIconOrder, "the order of the home screen stays");
-        if (noteUnless(placeRestoreInfo(), kBackupRestoreInfo, "nothing is restored")) {
+        isPlaced_ = noteUnless(placeRestoreInfo(), kBackupRestoreInfo, "nothing is restored");
+        if (isPlaced_) {
             plugIn_.client().reconcileRestoreOfType(type_, nullptr);
         }
         if (const auto error = device_.databaseFailure()) return unusable(*error);
@@ -206,7 +218,7 @@ class Restoring {
             if (!each.hasData || installed_.contains(each.identifier) || !canUse(name)) continue;
             // An offloaded application has kept its own.
             if (device_.files().itemExists(Device::dataPath(each.identifier))) continue;
-            const Status placed = placeArchive(sender, each.identifier, pathOf(name));
+            const Status placed = advised(placeArchive(sender, each.identifier, pathOf(name)));
             if (placed) {
                 identifiers.push_back(each.identifier);
             } else {
@@ -257,10 +269,14 @@ class Restoring {
     }
 
     Status write(std::string_view path, ByteView contents) {
-        const FileAttributes mobile{"mobile", "mobile"};
-        const Status made = device_.files().createDirectory(directoryOf(path), true, &mobile);
+        const Status made = makeDirectoryFor(path);
         if (!made) return made;
-        return device_.files().writeFileAtomically(std::string(path), contents);
+        return advised(device_.files().writeFileAtomically(std::string(path), contents));
+    }
+
+    Status makeDirectoryFor(std::string_view path) {
+        const FileAttributes mobile{"mobile", "mobile"};
+        return advised(device_.files().createDirectory(directoryOf(path), true, &mobile));
     }
 
     // What stands on the home screen keeps its place; the others come after it.
@@ -289,12 +305,15 @@ class Restoring {
         return failure("the home screen refuses it", "see appsync log");
     }
 
-    // Beside the place where it goes once it has been processed.
+    // Beside the place where it goes once it has been processed. A directory in its own place
+    // would go there, too.
     Status placeRestoreInfo() {
-        const FileAttributes mobile{"mobile", "mobile"};
-        const Status made =
-            device_.files().createDirectory(directoryOf(kProcessedRestoreInfoPath), true, &mobile);
-        return made ? write(kRestoreInfoPath, restoreInfo_) : made;
+        const std::string path(kRestoreInfoPath);
+        const Status made = makeDirectoryFor(kProcessedRestoreInfoPath);
+        if (!made) return made;
+        const Result<ItemAttributes> there = device_.files().attributes(path);
+        if (there && there->isDirectory) device_.files().removeItem(path).ignore();
+        return write(path, restoreInfo_);
     }
 
     Status lookAtScreen() {
@@ -318,6 +337,7 @@ class Restoring {
     }
 
     std::string whyMissing(const std::string& identifier) {
+        if (!isPlaced_) return "the restore information did not reach the device";
         const auto defect = defects_.find(identifier);
         if (defect != defects_.end()) return defect->second;
         const Result<ApplicationStatus> status = device_.status(identifier);
@@ -342,6 +362,7 @@ class Restoring {
     Device& device_;
     PlugIn& plugIn_;
     bool isCoordinated_ = false;
+    bool isPlaced_ = false;  // the restore information has reached the device
     std::set<std::string> installed_;
     std::vector<std::string> wanted_;
     std::map<std::string, std::string> defects_;  // by identifier

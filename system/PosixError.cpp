@@ -1,6 +1,9 @@
 #include "system/PosixError.h"
 
+#include <algorithm>
+#include <array>
 #include <cerrno>
+#include <cstdint>
 #include <cstring>
 
 namespace appsync {
@@ -59,6 +62,12 @@ ErrorRecord posixErrorBetween(int code, std::string_view operation, std::string_
                               std::string_view to) {
     return failure(code, operation, displayPath(from) + " to " + displayPath(to),
                    posixReason(code));
+}
+
+bool isInTheWay(const ErrorRecord& error) {
+    constexpr std::array<std::int64_t, 4> kCodes = {EEXIST, ENOTDIR, EISDIR, ELOOP};
+    return error.domain == kPosixErrorDomain &&
+           std::find(kCodes.begin(), kCodes.end(), error.code) != kCodes.end();
 }
 
 }  // namespace appsync

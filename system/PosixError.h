@@ -26,4 +26,8 @@ namespace appsync {
 [[nodiscard]] ErrorRecord posixErrorBetween(int code, std::string_view operation,
                                             std::string_view from, std::string_view to);
 
+/// Whether it is the error of a call that needed a name which something of another kind has, or a
+/// link that leads nowhere.
+[[nodiscard]] bool isInTheWay(const ErrorRecord& error);
+
 }  // namespace appsync

@@ -673,6 +673,30 @@ def test_identifiers_that_are_too_long_for_placeholders_are_named(appsync, devic
 
 
 @ON_ONE_PATH
+def test_what_stands_in_the_place_of_the_restore_information(appsync, backup, fresh):
+    place = fresh.inside(RESTORE_INFO)
+    os.makedirs(os.path.join(place, "a directory"))
+    assert sorted(restore(fresh, backup)["restored"]) == IDS and not os.path.exists(place)
+
+
+@ON_ONE_PATH
+@pytest.mark.parametrize("path", [RESTORE_INFO, PROCESSED_INFO])
+def test_a_file_where_restore_information_needs_a_directory_is_named(appsync, backup, fresh, path):
+    folder = os.path.dirname(path)
+    shutil.rmtree(fresh.inside(folder), ignore_errors=True)
+    with open(fresh.inside(folder), "w"):
+        pass
+    if path == PROCESSED_INFO:  # else it is the archives of data, too, that have no place
+        failed = {each["identifier"]: each["error"] for each in restore(fresh, backup, expect=1)["failed"]}
+        assert sorted(failed) == sorted(IDS + ["RestoreApplications.plist"])
+        assert failed[IDS[0]] == "the restore information did not reach the device"
+    errors = [each["error"] for each in restore(fresh, backup, expect=1)["failed"]]
+    assert any(folder in each and "remove what stands there in its place" in each for each in errors), errors
+    os.remove(fresh.inside(folder))
+    assert restore(fresh, backup)["failed"] == []
+
+
+@ON_ONE_PATH
 def test_nothing_is_restored_where_the_list_of_offloaded_ones_has_no_place(appsync, backup, fresh):
     preferences = fresh.inside("/var/mobile/Library/Preferences")
     shutil.rmtree(preferences)
