@@ -5,6 +5,7 @@
 
 #include <algorithm>
 #include <cerrno>
+#include <memory>
 #include <span>
 #include <string_view>
 #include <utility>
@@ -40,16 +41,17 @@ class NewFile {
         if (error_ == 0) error_ = writeWhole(descriptor_.get(), bytes).error;
     }
     void keep() { isKept_ = true; }
-    /// Makes it durable and gives it another place, in one step.
-    void moveTo(int directory, const std::string& name) {
+    void sync() {
         if (error_ == 0 && ::fsync(descriptor_.get()) != 0) error_ = errno;
+    }
+    void fail(int error) {
+        if (error_ == 0) error_ = error;
+    }
+    /// Gives it another place, in one step.
+    void moveTo(int directory, const std::string& name) {
         if (error_ != 0) return;
-        if (::renameat(directory_, name_.c_str(), directory, name.c_str()) != 0) {
-            error_ = errno;
-            return;
-        }
-        isKept_ = true;
-        if (::fsync(directory) != 0) error_ = errno;
+        isKept_ = ::renameat(directory_, name_.c_str(), directory, name.c_str()) == 0;
+        if (!isKept_) error_ = errno;
     }
 
   private:
@@ -64,7 +66,7 @@ namespace {
 
 constexpr std::size_t kPieceBytes = std::size_t{1} << 20;
 // In the directory for temporary files, which the opening of each session empties.
-constexpr std::string_view kUnfinishedName = "Arriving";
+constexpr std::string_view kUnfinishedName = "Arriving";  // and a number
 
 ErrorRecord interrupted() {
     return ErrorRecord::make(kTransferErrorDomain, kTransferInterrupted,
@@ -100,7 +102,18 @@ Result<UniqueFd> openTarget(Device& device, const std::string& directory) {
 
 }  // namespace
 
+/// A file that waits for its place.
+struct PackageSender::Aside {
+    std::string directory;
+    std::string name;
+    UniqueFd target;
+    UniqueFd temporary;
+    std::unique_ptr<NewFile> file;
+};
+
 PackageSender::PackageSender(Device& device) : device_(device), piece_(kPieceBytes) {}
+
+PackageSender::~PackageSender() = default;
 
 Result<std::uint64_t> PackageSender::send(const std::string& file, const std::string& directory,
                                           const std::string& name, const Progress& progress) {
@@ -118,17 +131,52 @@ Result<std::uint64_t> PackageSender::send(const std::string& file, const std::st
 Result<std::uint64_t> PackageSender::sendWhole(const std::string& file,
                                                const std::string& directory,
                                                const std::string& name, const Progress& progress) {
+    Result<std::uint64_t> total = sendAside(file, directory, name, progress);
+    if (!total) return total;
+    const std::map<std::string, ErrorRecord> failures = placeAll();
+    return failures.empty() ? total : failures.begin()->second;
+}
+
+Result<std::uint64_t> PackageSender::sendAside(const std::string& file,
+                                               const std::string& directory,
+                                               const std::string& name, const Progress& progress) {
     Result<HostFile> source = HostFile::open(file);
     if (!source) return source.error();
-    const Result<UniqueFd> target = openTarget(device_, directory);
+    Result<UniqueFd> target = openTarget(device_, directory);
     if (!target) return target.error();
-    const Result<UniqueFd> temporary = openTarget(device_, device_.files().temporaryDirectory());
+    Result<UniqueFd> temporary = openTarget(device_, device_.files().temporaryDirectory());
     if (!temporary) return temporary.error();
-    NewFile sent(*temporary, std::string(kUnfinishedName));
-    Result<std::uint64_t> total = copy(*source, file, sent, progress);
-    if (total) sent.moveTo(target->get(), name);
-    if (total && sent.error() != 0) return cannotWrite(sent.error(), directory + "/" + name);
+    auto sent = std::make_unique<NewFile>(
+        *temporary, std::string(kUnfinishedName) + std::to_string(aside_.size()));
+    Result<std::uint64_t> total = copy(*source, file, *sent, progress);
+    if (total && sent->error() != 0) return cannotWrite(sent->error(), directory + "/" + name);
+    if (total) {
+        aside_.push_back(
+            {directory, name, *std::move(target), *std::move(temporary), std::move(sent)});
+    }
     return total;
+}
+
+std::map<std::string, ErrorRecord> PackageSender::placeAll() {
+    const std::vector<Aside> all = std::exchange(aside_, {});
+    if (all.size() == 1) all.front().file->sync();
+    // Opened before the first was written, so it tells of all of them.
+    const bool isSynced = all.size() <= 1 || ::syncfs(all.front().temporary.get()) == 0;
+    const int error = isSynced ? 0 : errno;
+    for (const Aside& each : all) {
+        each.file->fail(error);
+        each.file->moveTo(each.target.get(), each.name);
+    }
+    std::map<std::string, int> syncs;  // of the directories
+    std::map<std::string, ErrorRecord> failures;
+    for (const Aside& each : all) {
+        const auto [sync, isNew] = syncs.try_emplace(each.directory, 0);
+        if (isNew && ::fsync(each.target.get()) != 0) sync->second = errno;
+        each.file->fail(sync->second);
+        const std::string path = each.directory + "/" + each.name;
+        if (each.file->error() != 0) failures.emplace(path, cannotWrite(each.file->error(), path));
+    }
+    return failures;
 }
 
 // Failures to write are the target's to tell.

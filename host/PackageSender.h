@@ -2,7 +2,9 @@
 
 #include <cstdint>
 #include <functional>
+#include <map>
 #include <string>
+#include <vector>
 
 #include "platform/Bytes.h"
 #include "platform/Result.h"
@@ -20,6 +22,9 @@ class PackageSender {
     using Progress = std::function<bool(std::uint64_t done, std::uint64_t total)>;
 
     explicit PackageSender(Device& device);
+    ~PackageSender();
+    PackageSender(const PackageSender&) = delete;
+    PackageSender& operator=(const PackageSender&) = delete;
 
     /// Sends a file to `directory`/`name` of the device, in the place of what stood there. Gives
     /// the number of bytes. On failure nothing stays there. Errors are of `kPosixErrorDomain`, or
@@ -34,12 +39,25 @@ class PackageSender {
                                                   const std::string& name,
                                                   const Progress& progress);
 
+    /// The same for several files, which share what makes them durable: each is sent aside, with
+    /// files of the device open for it, and `placeAll` puts all of them in their places. Without
+    /// it, nothing stays of them.
+    [[nodiscard]] Result<std::uint64_t> sendAside(const std::string& file,
+                                                  const std::string& directory,
+                                                  const std::string& name,
+                                                  const Progress& progress);
+    /// Gives what did not go well, by the device path.
+    [[nodiscard]] std::map<std::string, ErrorRecord> placeAll();
+
   private:
+    struct Aside;
+
     Result<std::uint64_t> copy(HostFile& source, const std::string& file, NewFile& target,
                                const Progress& progress);
 
     Device& device_;
     Bytes piece_;
+    std::vector<Aside> aside_;
 };
 
 }  // namespace appsync

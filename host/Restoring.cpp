@@ -33,6 +33,8 @@ constexpr std::uint64_t kLargestList = std::uint64_t{2} << 30U;
 constexpr std::int64_t kApplicationsToo[] = {2, 3};
 // Where the device's files for a placeholder are named ID.app.
 constexpr std::size_t kLongestIdentifier = 251;
+// Archives that share what makes them durable; several files are open for each.
+constexpr std::size_t kPlacedTogether = 64;
 
 std::string directoryOf(std::string_view path) {
     return std::string(path.substr(0, path.rfind('/')));
@@ -212,29 +214,31 @@ class Restoring {
 
     Status placeData() {
         PackageSender sender(device_);
-        std::vector<std::string> identifiers;
         for (const BackedUpApplication& each : manifest_.applications) {
+            if (!each.hasData || installed_.contains(each.identifier)) continue;
             const std::string name = dataArchiveName(each.identifier);
-            if (!each.hasData || installed_.contains(each.identifier) || !canUse(name)) continue;
             // An offloaded application has kept its own.
-            if (device_.files().itemExists(Device::dataPath(each.identifier))) continue;
-            const Status placed = advised(placeArchive(sender, each.identifier, pathOf(name)));
-            if (placed) {
-                identifiers.push_back(each.identifier);
-            } else {
-                fail(each.identifier,
-                     placed.error().description() + "; until then it comes back without its data");
+            if (!canUse(name) || device_.files().itemExists(Device::dataPath(each.identifier))) {
+                continue;
             }
+            const Status sent = sendArchive(sender, each.identifier, pathOf(name));
+            if (sent) {
+                placing_.push_back(each.identifier);
+            } else {
+                failPlacing(each.identifier, sent);
+            }
+            if (placing_.size() == kPlacedTogether) placeArchives(sender);
         }
+        placeArchives(sender);
         // Where installs are coordinated, nobody sends the data: it counts as there.
-        if (isCoordinated_ || identifiers.empty()) return {};
-        const Status known = device_.expectRestoreData(identifiers);
+        if (isCoordinated_ || placed_.empty()) return {};
+        const Status known = device_.expectRestoreData(placed_);
         return known ? known : Status(unusable(known.error()));
     }
 
     // An install fails for good while data waits that the device has no room for.
-    Status placeArchive(PackageSender& sender, const std::string& identifier,
-                        const std::string& file) {
+    Status sendArchive(PackageSender& sender, const std::string& identifier,
+                       const std::string& file) {
         const fs::path place = Device::restoreDataPath(identifier);
         const Result<std::uint64_t> unpacked = checkDataArchive(file);
         if (!unpacked) return unpacked.error();
@@ -244,9 +248,26 @@ class Restoring {
                                "free space on the device and restore again");
         }
         const Result<std::uint64_t> sent =
-            sender.sendWhole(file, place.parent_path().native(), place.filename().native(),
+            sender.sendAside(file, place.parent_path().native(), place.filename().native(),
                              [](std::uint64_t, std::uint64_t) { return true; });
         return sent ? Status() : Status(sent.error());
+    }
+
+    void placeArchives(PackageSender& sender) {
+        const std::map<std::string, ErrorRecord> failures = sender.placeAll();
+        for (const std::string& identifier : std::exchange(placing_, {})) {
+            const auto failure = failures.find(Device::restoreDataPath(identifier));
+            if (failure == failures.end()) {
+                placed_.push_back(identifier);
+            } else {
+                failPlacing(identifier, failure->second);
+            }
+        }
+    }
+
+    void failPlacing(const std::string& identifier, const Status& status) {
+        fail(identifier,
+             advised(status).error().description() + "; until then it comes back without its data");
     }
 
     // A list that is none goes to the device all the same: the device judges it. One that the
@@ -368,6 +389,8 @@ class Restoring {
     std::map<std::string, std::string> defects_;  // by identifier
     std::map<std::string, std::string> faults_;   // by file of the backup
     Bytes restoreInfo_;
+    std::vector<std::string> placing_;  // whose data is aside
+    std::vector<std::string> placed_;   // whose data waits on the device
     RestoreResult result_;
 };
 

@@ -2,7 +2,7 @@
 
 import pytest
 
-TEMPORARY = "/root/var/mobile/tmp/Arriving"
+TEMPORARY = "/root/var/mobile/tmp/Arriving0"
 FOLDER = "/root/var/mobile/Media/VessikRestore/Data"
 
 

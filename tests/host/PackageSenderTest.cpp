@@ -1,7 +1,10 @@
 #include "host/PackageSender.h"
 
+#include <array>
 #include <filesystem>
 #include <fstream>
+#include <map>
+#include <system_error>
 #include <utility>
 
 #include "host/SyncDaemon.h"
@@ -113,6 +116,57 @@ TEST_F(WholeSending, DoesNotTakeThePlaceOfADirectory) {
     EXPECT_THAT(sent.error().description(),
                 testing::HasSubstr("cannot write " + kDirectory + "/com.a.zip"));
     EXPECT_TRUE(std::filesystem::exists(arrived + "/inside"));
+    EXPECT_THAT(temporaries(), testing::IsEmpty());
+}
+
+/// Several files of that kind at once.
+class SendingSeveral : public WholeSending {
+  protected:
+    void sendAside(PackageSender& sender) {
+        for (const char* name : kNames) {
+            const auto goOn = [](std::uint64_t, std::uint64_t) { return true; };
+            const Result<std::uint64_t> sent = sender.sendAside(file, kDirectory, name, goOn);
+            ASSERT_TRUE(sent.ok()) << sent.error().description();
+        }
+    }
+    [[nodiscard]] std::uintmax_t sizeOf(const std::string& name) const {
+        std::error_code code;
+        const std::uintmax_t size =
+            std::filesystem::file_size(root + kDirectory + "/" + name, code);
+        return code ? 0 : size;
+    }
+    static constexpr std::array kNames = {"com.a.zip", "com.b.zip", "com.c.zip"};
+};
+
+TEST_F(SendingSeveral, GivesThemTheirNamesTogether) {
+    PackageSender sender(*opened);
+    sendAside(sender);
+    EXPECT_EQ(sizeOf("com.a.zip"), 3U) << "the old one stands";
+    EXPECT_EQ(sizeOf("com.b.zip"), 0U);
+    EXPECT_THAT(sender.placeAll(), testing::IsEmpty());
+    for (const char* name : kNames) EXPECT_EQ(sizeOf(name), 2 * kMebibyte + 7) << name;
+    EXPECT_THAT(temporaries(), testing::IsEmpty());
+    EXPECT_THAT(sender.placeAll(), testing::IsEmpty()) << "nothing is left to place";
+}
+
+TEST_F(SendingSeveral, LeavesNothingOfWhatIsNotPlaced) {
+    {
+        PackageSender sender(*opened);
+        sendAside(sender);
+        EXPECT_THAT(temporaries(), testing::SizeIs(3));
+    }
+    EXPECT_THAT(temporaries(), testing::IsEmpty());
+    EXPECT_EQ(sizeOf("com.a.zip"), 3U);
+}
+
+TEST_F(SendingSeveral, NamesTheOneThatHasNoPlace) {
+    write(root + kDirectory + "/com.b.zip/inside", "kept");
+    PackageSender sender(*opened);
+    sendAside(sender);
+    const std::map<std::string, ErrorRecord> failures = sender.placeAll();
+    ASSERT_THAT(failures, testing::SizeIs(1));
+    EXPECT_EQ(failures.begin()->first, kDirectory + "/com.b.zip");
+    EXPECT_EQ(sizeOf("com.c.zip"), 2 * kMebibyte + 7);
     EXPECT_THAT(temporaries(), testing::IsEmpty());
 }
 
