@@ -274,6 +274,16 @@ Result<Bytes> PackageArchive::read(const PackageEntry& entry, std::uint64_t maxi
     return contents;
 }
 
+Status PackageArchive::verify() {
+    Bytes piece(kReadBytes);
+    for (const PackageEntry& entry : entries_) {
+        if (entry.isDirectory) continue;
+        Status status = stream(entry, piece, [](ByteView) { return Status(); });
+        if (!status) return status;
+    }
+    return {};
+}
+
 ErrorRecord PackageArchive::named(const ErrorRecord& error) const {
     // The system's errors say which file they are about.
     if (error.domain != kInstallerErrorDomain) return error;

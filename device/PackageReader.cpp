@@ -93,6 +93,11 @@ Status PackageReader::expectIdentifier(std::string_view identifier) const {
                          ", which was asked for; send the package of that application"));
 }
 
+Status PackageReader::verify() {
+    const Status verified = archive_->verify();
+    return verified ? verified : Status(archive_->named(verified.error()));
+}
+
 Result<Bytes> PackageReader::readFile(std::string_view entryName, std::uint64_t maximumBytes) {
     const PackageEntry* entry = archive_->find(entryName);
     if (entry == nullptr || entry->isDirectory) {

@@ -89,6 +89,9 @@ class PackageReader {
     /// Refuses the package unless it is of this application.
     [[nodiscard]] Status expectIdentifier(std::string_view identifier) const;
 
+    /// Reads all the contents, in pieces, without unpacking them: refuses what `unpackInto` would.
+    [[nodiscard]] Status verify();
+
     /// The contents of VessikMetadata.plist as they stand in the package (not parsed).
     /// `NoSuchEntry` when there is none.
     [[nodiscard]] Result<Bytes> readStoreMetadata();

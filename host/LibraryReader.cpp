@@ -123,6 +123,14 @@ Result<LibraryPackage> packageFor(const Library& library, const std::string& ide
     return packageOf(package->info(), *std::move(file));
 }
 
+Status verifyPackage(const std::string& file, const std::string& identifier,
+                     PropertyListSerialization& propertyLists) {
+    Result<PackageReader> package = PackageReader::open(file, propertyLists);
+    if (!package) return package.error();
+    const Status expected = package->expectIdentifier(identifier);
+    return expected ? package->verify() : expected;
+}
+
 std::uint64_t bytesOnDevice(const PackageInfo& info) {
     return info.unpackedBytes + info.entryCount * kBlockBytes;  // each file fills its last block
 }

@@ -30,6 +30,10 @@ inline constexpr std::string_view kIconOrderFile = "IconOrder.plist";
                                                 const std::string& identifier,
                                                 PropertyListSerialization& propertyLists);
 
+/// Refuses a file that no device would install as that application. Reads all of it, in pieces.
+[[nodiscard]] Status verifyPackage(const std::string& file, const std::string& identifier,
+                                   PropertyListSerialization& propertyLists);
+
 /// Bytes that the application of a package takes on a device, unpacked.
 [[nodiscard]] std::uint64_t bytesOnDevice(const PackageInfo& info);
 

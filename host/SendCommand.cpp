@@ -212,12 +212,9 @@ class Sending {
         parcel_.file = arguments_.file;
     }
 
-    // Nobody has asked for it, so there is no placeholder that would go when the device refuses it:
-    // the application that is installed would.
+    // Nobody has asked for it, so what the device would refuse is not sent.
     Status checkPackage() const {
-        const Result<PackageReader> package =
-            PackageReader::open(arguments_.file, device_->propertyLists());
-        return package ? package->expectIdentifier(arguments_.identifier) : Status(package.error());
+        return verifyPackage(arguments_.file, arguments_.identifier, device_->propertyLists());
     }
 
     Status preparePackage() {

@@ -80,6 +80,9 @@ class Store {
             lacksPackage_ = true;
             return failure("the store has no package of it", "add one to its folder");
         }
+        // An install that fails would take the placeholder away.
+        const Status good = verifyPackage(package->file, identifier, device_.propertyLists());
+        if (!good) return good;
         const std::string name = archiveNameOf(identifier);
         const Result<std::uint64_t> sent =
             sender_.send(package->file, std::string(kPublicStaging), name,

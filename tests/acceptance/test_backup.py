@@ -601,14 +601,19 @@ def test_send_of_a_restore_killed_at_random_moments_and_run_again(appsync, backu
         assert [each["identifier"] for each in restore(device, backup)["screen"]] == ORDER
 
 
-def test_package_that_turns_out_to_be_damaged_costs_nothing(appsync, used, tmp_path):
-    """Its contents are not as its directory says, which only the install finds out."""
+def damaged_package(folder, identifier):
+    """Its contents are not as its directory says, which only shows when they are read."""
+    package = packages.make_package(str(folder), identifier, "9.0")
+    return packages.damage_contents(package, "%s.app/main" % identifier.rsplit(".", 1)[-1].title())
+
+
+def test_damaged_package_is_not_sent_and_costs_nothing(appsync, used, tmp_path):
     before = screen_of(used)
     for identifier in (IDS[0], IDS[2]):
-        package = packages.make_package(str(tmp_path / "damaged"), identifier, "9.0")
-        packages.damage_contents(package, "%s.app/Resources/data.bin" % identifier.rsplit(".", 1)[-1].title())
+        package = damaged_package(tmp_path / "damaged", identifier)
         done = appsync.json("send", used.path, identifier, package, expect=1)
         assert names_of(done["failed"]) == [identifier] and "CRC" in done["failed"][0]["error"]
+        assert done["bytes"] == 0
     assert screen_of(used) == before and used.placeholders() == IDS[2:4]
     assert data_of(used, IDS[2]) == {"notes": b"of an offloaded one"}
 
@@ -645,6 +650,27 @@ def test_store_names_packages_that_it_cannot_read(appsync, backup, fresh, store)
     restore(fresh, backup)
     failed = names_of(appsync.json("store", fresh.path, store, expect=1)["failed"])
     assert failed == [IDS[0], IDS[0] + ".zip"]
+
+
+def test_damaged_package_is_not_delivered_by_the_store(appsync, backup, fresh, store, tmp_path):
+    if not fresh.is_coordinated:
+        pytest.skip("nothing waits for the store there")
+    restore(fresh, backup)
+    damaged_package(tmp_path / "damaged", IDS[1])
+    failed = appsync.json("store", fresh.path, tmp_path / "damaged", expect=1)["failed"]
+    assert "CRC" in {each["identifier"]: each["error"] for each in failed}[IDS[1]]
+    assert fresh.placeholders() == IDS
+    assert appsync.json("store", fresh.path, store)["failed"] == []
+    assert data_of(fresh, IDS[1])["Documents/letter.txt"] == b"Dear"
+
+
+def test_update_that_turns_out_to_be_damaged_leaves_the_old_version(device, store, tmp_path):
+    """A sync finds out with the install only."""
+    device.sync(store)
+    before = screen_of(device)
+    damaged_package(tmp_path / "damaged", IDS[1])
+    assert names_of(device.sync(tmp_path / "damaged", expect=1)["failed"]) == [IDS[1]]
+    assert screen_of(device) == before
 
 
 # Errors that say what to do.

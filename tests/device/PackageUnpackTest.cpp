@@ -101,6 +101,17 @@ TEST_F(PackageUnpackTest, aWrongCrcIsAFailure) {
     EXPECT_TRUE(failedAs(unpack(atlasWith({entry})), Code::DamagedEntry, "'Atlas.app/x'"));
 }
 
+TEST_F(PackageUnpackTest, whatCannotBeUnpackedIsFoundByReadingItToo) {
+    EXPECT_TRUE(open(atlasWith({zipFile("Atlas.app/x", "contents")}))->verify().ok());
+    ZipEntry entry = zipFile("Atlas.app/x", "contents");
+    entry.crc = 7;
+    Result<PackageReader> package = open(atlasWith({entry}));
+    ASSERT_TRUE(package.ok());
+    const Status verified = package->verify();
+    EXPECT_TRUE(failedAs(verified, Code::DamagedEntry, "'Atlas.app/x'"));
+    EXPECT_EQ(verified.error().description(), unpack(atlasWith({entry})).error().description());
+}
+
 TEST_F(PackageUnpackTest, aWrongCrcOfAnEmptyFileIsRefusedWhenOpening) {
     ZipEntry entry = zipFile("Atlas.app/x", "");
     entry.crc = 7;
