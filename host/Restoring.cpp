@@ -47,7 +47,7 @@ std::string without(std::string_view subject, const std::string& sentence) {
 }
 
 // The failure to put something on the device, with what to do.
-Status advised(const Status& status) {
+Status withWhatToDo(const Status& status) {
     if (status) return status;
     const ErrorRecord& error = status.error();
     if (!isInTheWay(error)) return error;
@@ -266,8 +266,8 @@ class Restoring {
     }
 
     void failPlacing(const std::string& identifier, const Status& status) {
-        fail(identifier,
-             advised(status).error().description() + "; until then it comes back without its data");
+        fail(identifier, withWhatToDo(status).error().description() +
+                             "; until then it comes back without its data");
     }
 
     // A list that is none goes to the device all the same: the device judges it. One that the
@@ -292,12 +292,12 @@ class Restoring {
     Status write(std::string_view path, ByteView contents) {
         const Status made = makeDirectoryFor(path);
         if (!made) return made;
-        return advised(device_.files().writeFileAtomically(std::string(path), contents));
+        return withWhatToDo(device_.files().writeFileAtomically(std::string(path), contents));
     }
 
     Status makeDirectoryFor(std::string_view path) {
         const FileAttributes mobile{"mobile", "mobile"};
-        return advised(device_.files().createDirectory(directoryOf(path), true, &mobile));
+        return withWhatToDo(device_.files().createDirectory(directoryOf(path), true, &mobile));
     }
 
     // What stands on the home screen keeps its place; the others come after it.
