@@ -37,6 +37,7 @@ TEST_F(Accounts, HaveTheirIdentifiersInEitherPlace) {
     EXPECT_THAT(client_->korvuIDsForAssets(), ElementsAre("one", "two"));
     EXPECT_TRUE(logged(LogLevel::Default, "getting id's for assets"));
     EXPECT_TRUE(logged(LogLevel::Default, "Returning korvu ID set: (one, two)"));
+    EXPECT_THAT(platform_.messages(), testing::SizeIs(2));
     EXPECT_THAT(platform_.callsTo({"AppRegistry"}), ElementsAre("AppRegistry.enumerateBundles(1)"));
 }
 

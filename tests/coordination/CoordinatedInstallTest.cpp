@@ -8,9 +8,12 @@ namespace {
 using testing::AllOf;
 using testing::Contains;
 using testing::ElementsAre;
+using testing::EndsWith;
 using testing::HasSubstr;
 using testing::IsEmpty;
 using testing::Not;
+using testing::SizeIs;
+using testing::StartsWith;
 using Access = AppsClientTestAccess;
 
 constexpr const char* kBundle = "/tmp/com.korvu.trd.Apps/com.example.a.app";
@@ -192,6 +195,14 @@ TEST_F(CoordinatedInstall, GoesOnWithoutAnIconOfUnknownSize) {
     EXPECT_TRUE(prepare());
     EXPECT_EQ(service().promise(std::string(kA) + "-Icon"), nullptr);
     EXPECT_TRUE(state()->placeholder->configurationComplete);
+    EXPECT_THAT(platform_.messages(), Contains(AllOf(StartsWith("Copied icon from "),
+                                                     HasSubstr("Code=5"), EndsWith("OnDisk:0"))));
+}
+
+TEST_F(CoordinatedInstall, OfAnApplicationWithANameOnlyIsTheServicesToRefuse) {
+    asset_->identifier = "";
+    EXPECT_FALSE(prepare());
+    EXPECT_THAT(platform_.callsTo({"InstallCoordinatorService.coordinator"}), SizeIs(1));
 }
 
 TEST_F(CoordinatedInstall, GoesOnWithoutADirectoryForThePlaceholder) {

@@ -488,6 +488,9 @@ TEST_F(CoordinatedRestore, CancelsOnlyTheCoordinatorWhenTheAppStoreIsRefused) {
                                                "satisfy app data promise for 'com.example.a'")));
     EXPECT_THAT(cancels(), ElementsAre(StartsWith("InstallCoordinator.cancelForReason")));
     expectCoordinatorCancelled();
+    expectFinished(
+        "processing app restore for com.example.a finished with status 0 error Error "
+        "Domain=Coordination Code=7");
 }
 
 TEST_F(CoordinatedRestore, RestoresTheOthersAllTheSame) {

@@ -18,7 +18,7 @@ class KeyIndex : public testing::Test {
         texts_.push_back(text);
     }
     [[nodiscard]] std::optional<std::size_t> find(std::uint32_t hash, std::string_view text) const {
-        return index_.find(hash, text, [this](std::size_t i) { return texts_[i]; });
+        return index_.find(hash, text, [this](std::size_t i) { return texts_.at(i); });
     }
 
     PropertyListKeyIndex index_;
@@ -56,6 +56,7 @@ TEST_F(KeyIndex, KeepsNothingOfWhatIsGone) {
         texts_.pop_back();
     }
     EXPECT_EQ(find(0, "first"), 0U);
+    EXPECT_EQ(find(0, "second"), std::nullopt);
     EXPECT_EQ(find(1000, "second"), std::nullopt);
 }
 

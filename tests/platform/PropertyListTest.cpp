@@ -265,6 +265,12 @@ TEST(PropertyListDepth, EveryEditStopsAtTheLimit) {
     EXPECT_TRUE(array.append(nested(PropertyList::kMaximumDepth - 1)));
 }
 
+TEST(PropertyListDepth, WhatTakesAnothersPlaceCounts) {
+    PropertyList array = PropertyList::array({1});
+    EXPECT_TRUE(array.set(0, nested(4)));
+    EXPECT_EQ(array.depth(), 5U);
+}
+
 TEST(PropertyListDepth, WhatWasTakenOutNoLongerCounts) {
     PropertyList array = PropertyList::array({nested(127), 1});
     EXPECT_EQ(array.depth(), 128U);

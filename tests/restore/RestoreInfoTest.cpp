@@ -111,6 +111,7 @@ TEST_F(RestoreInfo, OfAnApplicationThatHasAPlaceholderIsSkipped) {
                     {"processing vessik restore info for 'com.example.a' demotionStatus :0",
                      "Found placeholder for bundle com.example.a",
                      "placeholder already exists for 'com.example.a' - skiping'"}));
+    EXPECT_THAT(platform_.messageLines(), Not(Contains(StartsWith("8 error"))));
     EXPECT_THAT(platform_.callsTo({"AppRegistry.installPlaceholderBundle"}), SizeIs(1));
     EXPECT_THAT(platform_.callsTo({"AppRegistry.enumerateBundles"}),
                 ElementsAre("AppRegistry.enumerateBundles(1)"));
@@ -124,6 +125,16 @@ TEST_F(RestoreInfo, GivesTheOutcomeOfTheLastApplicationThatWasHandedOn) {
     EXPECT_TRUE(client_->_processVessikRestoreInfo());
     setRestoreInfo(PropertyList::map({{"com.example.d", 1}}));
     EXPECT_TRUE(client_->_processVessikRestoreInfo()) << "none was handed on";
+}
+
+TEST_F(RestoreInfo, GivesTheOutcomeOfTheLastCoordinatorThatWasSetUp) {
+    coordinate();
+    platform_.coordination.makeNoneNext(CoordinationObject::Coordinator, kB);
+    setRestoreInfo(PropertyList::map({{kA, appInfo()}, {kB, appInfo()}}));
+    EXPECT_FALSE(client_->_processVessikRestoreInfo());
+    platform_.coordination.makeNoneNext(CoordinationObject::Coordinator, kB);
+    setRestoreInfo(PropertyList::map({{kB, appInfo()}, {kC, appInfo()}}));
+    EXPECT_TRUE(client_->_processVessikRestoreInfo());
 }
 
 // The demoted-apps list.

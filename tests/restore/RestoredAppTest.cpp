@@ -185,6 +185,9 @@ TEST_F(RestoredAppPlaceholder, SaysWhetherItMayBeStarted) {
     EXPECT_EQ(prohibited(metadata), true);
     metadata.set("RGApplicationLaunchProhibited", false);
     EXPECT_EQ(prohibited(metadata), false) << "the second key is only looked at without the first";
+    metadata.set("launchProhibited", false);
+    metadata.set("RGApplicationLaunchProhibited", true);
+    EXPECT_EQ(prohibited(metadata), true);
 }
 
 TEST_F(RestoredAppPlaceholder, ShowsThePresselFlag) {

@@ -66,6 +66,9 @@ TEST_F(InProgressQuery, LogsWhatItIsToldOfEachInstall) {
     EXPECT_TRUE(logged(LogLevel::Default,
                        "Got install type=RGInstallTypeSync state=RGInstallStateActive "
                        "phase=RGInstallPhaseInstalling for com.example.a"));
+    EXPECT_THAT(platform_.callsTo({"AppRegistry.installProgress"}),
+                ElementsAre(HasSubstr("(com.example.a (placeholder), 0)")))
+        << "of the whole install";
 }
 
 TEST_F(InProgressQuery, NamesAnUnknownType) {
@@ -195,18 +198,30 @@ TEST_F(InProgressQuery, CountsARestoreUntilItsDataIsRestored) {
 
 // A wait that times out: no platform's does today, since there is no limit.
 
+/// Fails after a time in which everything has come that was to come.
 class ImpatientSemaphore : public Semaphore {
   public:
+    explicit ImpatientSemaphore(Scheduler& scheduler) : scheduler_(scheduler) {}
     void signal() override {}
-    [[nodiscard]] bool wait() override { return false; }
+    [[nodiscard]] bool wait() override {
+        scheduler_.runUntilIdle();
+        return false;
+    }
+
+  private:
+    Scheduler& scheduler_;
 };
 
 class ImpatientQueues : public SimulatedWorkQueues {
   public:
-    using SimulatedWorkQueues::SimulatedWorkQueues;
+    explicit ImpatientQueues(Recorder& recorder)
+        : SimulatedWorkQueues(recorder), scheduler_(recorder.scheduler()) {}
     [[nodiscard]] std::unique_ptr<Semaphore> makeSemaphore(std::int64_t) override {
-        return std::make_unique<ImpatientSemaphore>();
+        return std::make_unique<ImpatientSemaphore>(scheduler_);
     }
+
+  private:
+    Scheduler& scheduler_;
 };
 
 class ImpatientQuery : public InProgressQuery {

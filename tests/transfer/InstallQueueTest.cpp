@@ -190,6 +190,9 @@ TEST_F(InstallQueue, FailsOnAPathThatNoURLCanHold) {
     EXPECT_THAT(installs(), IsEmpty());
     EXPECT_EQ(operationOf(kA), "FAILED");
     EXPECT_EQ(client_->_getAndResetNumAppInstallsAttempted(), 0U);
+    EXPECT_EQ(platform_.countMessages("com.example.a install failed unrecoverably: Error "
+                                      "Domain=POSIX Code=22 \"(null)\""),
+              2U);
 }
 
 // Outcomes
