@@ -49,6 +49,15 @@ std::string readBoot() {
     return boot;
 }
 
+/// Whether nothing stands at the path. What cannot be looked at is not gone.
+Result<bool> isGone(RootedFileSystem& files, const std::string& path) {
+    const Result<ItemAttributes> attributes = files.attributes(path);
+    if (attributes) return false;
+    const std::int64_t code = attributes.error().code;
+    if (code == ENOENT || code == ENOTDIR || code == ELOOP) return true;
+    return attributes.error();
+}
+
 }  // namespace
 
 double InstallProgress::fraction() const noexcept {
@@ -185,7 +194,9 @@ Result<std::vector<ApplicationRecord>> Device::applicationsOnDisk() {
     if (!records) return records;
     std::set<std::string> lost;
     for (const ApplicationRecord& each : *records) {
-        if (!state_->files->itemExists(each.container)) lost.insert(each.container);
+        const Result<bool> gone = isGone(*state_->files, each.container);
+        if (!gone) return gone.error();
+        if (*gone) lost.insert(each.container);
     }
     if (lost.empty()) return records;
     records = applications();

@@ -100,7 +100,7 @@ class Device {
     /// the placeholder that covers it.
     [[nodiscard]] Result<std::vector<ApplicationRecord>> applications();
     /// The same as a session that began now would find it: without what has lost its bundle on
-    /// disk.
+    /// disk. An error where that cannot be looked at.
     [[nodiscard]] Result<std::vector<ApplicationRecord>> applicationsOnDisk();
     /// How far an install has come; nothing when none is under way. Cheap; may be polled.
     [[nodiscard]] std::optional<InstallProgress> installProgress(const std::string& identifier);

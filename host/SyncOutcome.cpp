@@ -102,7 +102,8 @@ class Summarizer {
             summary_.skipped.push_back(
                 {identifier, "it was uninstalled on the device meanwhile", false});
         } else {
-            undone(identifier, aftermath_.removalAllowed, kRemovalForbidden, "it is still there");
+            undone(identifier, aftermath_.removalAllowed, kRemovalForbidden,
+                   "it is still there: sync again, or see appsync log");
         }
     }
 

@@ -1,3 +1,6 @@
+#include <sys/resource.h>
+
+#include <cerrno>
 #include <filesystem>
 #include <fstream>
 
@@ -54,6 +57,29 @@ TEST_F(DeviceReconciliationTest, anApplicationWhoseBundleIsGoneIsReportedAndForg
     EXPECT_NE(device().repairs()[0].find(kAtlas), std::string::npos);
     EXPECT_EQ(device().history()->back().identifier, kAtlas);
     EXPECT_FALSE(device().history()->back().success);
+}
+
+TEST_F(DeviceReconciliationTest, aBundleThatIsGoneIsNotOnDisk) {
+    ASSERT_TRUE(succeeded(install(kAtlas)));
+    ASSERT_TRUE(succeeded(install(kBrook)));
+    fs::remove_all(rootPath(application(kAtlas)->bundleContainerPath));
+    const auto present = device().applicationsOnDisk();
+    ASSERT_TRUE(present);
+    ASSERT_EQ(present->size(), 1U);
+    EXPECT_EQ(present->front().identifier, kBrook);
+}
+
+TEST_F(DeviceReconciliationTest, aBundleThatCannotBeLookedAtIsNotTakenForGone) {
+    ASSERT_TRUE(succeeded(install(kAtlas)));
+    ASSERT_TRUE(device().applicationsOnDisk());
+    rlimit before{};
+    ASSERT_EQ(::getrlimit(RLIMIT_NOFILE, &before), 0);
+    const rlimit none{0, before.rlim_max};
+    ASSERT_EQ(::setrlimit(RLIMIT_NOFILE, &none), 0);
+    const auto present = device().applicationsOnDisk();
+    ASSERT_EQ(::setrlimit(RLIMIT_NOFILE, &before), 0);
+    ASSERT_FALSE(present);
+    EXPECT_EQ(present.error().code, EMFILE);
 }
 
 TEST_F(DeviceReconciliationTest, aPlaceholderWhoseBundleIsGoneIsForgotten) {

@@ -153,7 +153,7 @@ TEST_F(SyncOutcome, AnApplicationThatIsStillThereWasNotRemoved) {
     present("com.c", "1");
     EXPECT_THAT(summary().removed, IsEmpty());
     ASSERT_EQ(summary().failed.size(), 1U);
-    EXPECT_EQ(summary().failed[0].error, "it is still there");
+    EXPECT_EQ(summary().failed[0].error, "it is still there: sync again, or see appsync log");
 }
 
 TEST_F(SyncOutcome, RemovalAndInstallOfOneIdentifierAreBothDone) {
