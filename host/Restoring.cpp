@@ -20,8 +20,11 @@
 #include "host/StandingInstalls.h"
 #include "platform/FileSystem.h"
 #include "platform/HomeScreenService.h"
+#include "platform/InstallProgressRecord.h"
 #include "platform/PropertyListSerialization.h"
 #include "platform/SyncClient.h"
+#include "restore/DemotedApps.h"
+#include "restore/RestoredApp.h"
 #include "system/PosixError.h"
 
 namespace appsync {
@@ -90,7 +93,7 @@ class Restoring {
         const Result<std::vector<ApplicationRecord>> records = device_.applications();
         if (!records) return unusable(records.error());
         for (const ApplicationRecord& record : *records) {
-            if (!record.isPlaceholder) installed_.insert(record.identifier);
+            (record.isPlaceholder ? standing_ : installed_).insert(record.identifier);
         }
         const Result<DeviceSettings> settings = device_.settings();
         if (!settings) return unusable(settings.error());
@@ -282,8 +285,9 @@ class Restoring {
                         kConsequence)) {
             return {};
         }
-        const std::string defect = defectOfDemotedApps(device_.propertyLists().parse(*bytes));
-        if (!defect.empty()) {
+        const Result<PropertyList> list = device_.propertyLists().parse(*bytes);
+        if (list) offloaded_ = DemotedApps(*list);
+        if (const std::string defect = defectOfDemotedApps(list); !defect.empty()) {
             noteUnless(failure(defect, "use another backup"), kBackupDemotedApps, kConsequence);
         }
         return write(kDemotedAppsPath, *bytes);
@@ -342,6 +346,10 @@ class Restoring {
         if (!shown) return unusable(shown.error());
         std::set<std::string> present;
         for (const ApplicationRecord& record : *shown) {
+            if (cameBackAsAnother(record)) {
+                if (Status status = takeAway(record.identifier); !status) return status;
+                continue;
+            }
             present.insert(record.identifier);
             result_.screen.push_back({record.identifier, record.name.value_or(record.identifier),
                                       record.version, record.isPlaceholder});
@@ -354,6 +362,23 @@ class Restoring {
                 fail(identifier, whyMissing(identifier));
             }
         }
+        return {};
+    }
+
+    // The device could not look at its list. As it stands it would count as any other, for good.
+    [[nodiscard]] bool cameBackAsAnother(const ApplicationRecord& record) const {
+        return isCoordinated_ && record.isPlaceholder &&
+               record.installType == kInstallTypeRestore &&
+               !standing_.contains(record.identifier) &&
+               offloaded_.statusOf(record.identifier) != kNotDemoted;
+    }
+
+    Status takeAway(const std::string& identifier) {
+        const Status cancelled = device_.cancelCoordinator(identifier, SyncClientID);
+        if (!cancelled) return unusable(cancelled.error());
+        defects_[identifier] =
+            "the device did not see that it was offloaded, and has taken it away again; restore "
+            "again";
         return {};
     }
 
@@ -385,6 +410,8 @@ class Restoring {
     bool isCoordinated_ = false;
     bool isPlaced_ = false;  // the restore information has reached the device
     std::set<std::string> installed_;
+    std::set<std::string> standing_;  // placeholders from before
+    DemotedApps offloaded_{PropertyList()};
     std::vector<std::string> wanted_;
     std::map<std::string, std::string> defects_;  // by identifier
     std::map<std::string, std::string> faults_;   // by file of the backup

@@ -22,8 +22,9 @@ FAULTS = {
     "open-ENFILE": ("open,openat,openat2", "ENFILE"),
     "open-EACCES": ("open,openat,openat2", "EACCES"),
 }
+NOT_SEEN = "the device did not see that it was offloaded"
 # Where the plug-in goes on after a failure it logs it, and what is told is that it leads to.
-SEE_THE_LOG = ("see appsync log", "appsync log tells why", "File exists")
+SEE_THE_LOG = ("see appsync log", "appsync log tells why", "File exists", NOT_SEEN)
 # What an error gives as its reason: the system's words, or those of whoever explains them.
 REASONS = {
     "EIO": ("Input/output error", "I/O error"),
@@ -100,3 +101,15 @@ def test_a_failing_call_is_told_and_survived(meddling, prepared, name, fault, ev
             problems.append("%s --at %d: %s -> %s\n%s\n%s" % (
                 " ".join(options), number, outcome.hit, outcome.status, outcome.said, problem))
     assert not problems, "\n\n".join(problems)
+
+
+def test_an_offloaded_application_does_not_come_back_as_another(meddling, prepared):
+    """The plug-in restores what it can when it cannot look at the list of offloaded applications."""
+    scenario, expected = prepared("coordinated-restore")
+    opens = scenario.meddled("--calls", "openat2", "--list").calls
+    looks = [number for number, (_, path) in enumerate(opens, 1) if path.endswith("DemotedApps.plist")]
+    outcome = scenario.meddled("--calls", "openat2", "--fail", "EMFILE", "--at", looks[-1])
+    assert outcome.hit["path"].endswith("DemotedApps.plist")
+    assert outcome.status == 1 and NOT_SEEN in outcome.said, outcome.said
+    scenario.check(expected)
+    scenario.follow_up()
