@@ -21,7 +21,7 @@ constexpr const char* kRunning = "com.example.running";
 constexpr const char* kRefused = "com.example.refused";
 constexpr const char* kUnwanted = "com.example.unwanted";
 constexpr const char* kRestoring = "com.example.restoring";
-constexpr std::uint64_t kSeeds = 40;
+constexpr std::uint64_t kSeeds = 20;
 /// The answer to a wish of the client's, which is logged whether or not the client is still there.
 constexpr std::string_view kLateAnswer = "Prioritize ";
 
