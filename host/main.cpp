@@ -71,10 +71,10 @@ int afterOutput(const appsync::Console& console, int status) {
 }  // namespace
 
 int main(int argumentCount, char** arguments) {
-    // A reader that goes away (| head) must not end a session in its middle.
+    // Neither a reader that goes away (| head) nor a limit on the size of files may end a session
+    // in its middle: both are errors of the write.
     std::signal(SIGPIPE, SIG_IGN);
-    std::signal(SIGXFSZ,
-                SIG_IGN);  // nor a limit on the size of files: that is an error of the write
+    std::signal(SIGXFSZ, SIG_IGN);
     std::set_terminate(endWithoutMeans);
     keepStandardStreams();
     const appsync::Console console = appsync::processConsole();
