@@ -3,6 +3,7 @@
 #include <sys/statvfs.h>
 
 #include <algorithm>
+#include <array>
 #include <cerrno>
 #include <filesystem>
 #include <fstream>
@@ -49,12 +50,13 @@ std::string readBoot() {
     return boot;
 }
 
-/// Whether nothing stands at the path. What cannot be looked at is not gone.
+/// Whether nothing stands at the path, or nothing can. What cannot be looked at is not gone.
 Result<bool> isGone(RootedFileSystem& files, const std::string& path) {
+    constexpr std::array<std::int64_t, 5> kCodes = {ENOENT, ENOTDIR, ELOOP, EINVAL, ENAMETOOLONG};
     const Result<ItemAttributes> attributes = files.attributes(path);
     if (attributes) return false;
     const std::int64_t code = attributes.error().code;
-    if (code == ENOENT || code == ENOTDIR || code == ELOOP) return true;
+    if (std::ranges::find(kCodes, code) != kCodes.end()) return true;
     return attributes.error();
 }
 

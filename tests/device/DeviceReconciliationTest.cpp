@@ -69,6 +69,16 @@ TEST_F(DeviceReconciliationTest, aBundleThatIsGoneIsNotOnDisk) {
     EXPECT_EQ(present->front().identifier, kBrook);
 }
 
+TEST_F(DeviceReconciliationTest, whereNoBundleCanBeThereIsNone) {
+    ASSERT_TRUE(succeeded(install(kAtlas)));
+    for (const char* container : {"'a' || char(0) || 'b'", "printf('%.*c', 300, 'a')"}) {
+        sql("UPDATE applications SET container = " + std::string(container));
+        const auto present = device().applicationsOnDisk();
+        ASSERT_TRUE(present) << present.error().description();
+        EXPECT_TRUE(present->empty()) << container;
+    }
+}
+
 TEST_F(DeviceReconciliationTest, aBundleThatCannotBeLookedAtIsNotTakenForGone) {
     ASSERT_TRUE(succeeded(install(kAtlas)));
     ASSERT_TRUE(device().applicationsOnDisk());
