@@ -1,4 +1,4 @@
-"""The command where it is denied what every process has: streams, files, room in a file."""
+"""The command where it is denied what every process has: streams, files, room in a file, memory."""
 
 import os
 import resource
@@ -73,3 +73,11 @@ def test_that_files_are_few_is_told_with_what_helps(appsync, place, files):
 def test_small_files_only(appsync, place, size):
     done = sync_with(appsync, place, resource.RLIMIT_FSIZE, size)
     is_told_and_made_good(appsync, place, done, "device.db")
+
+
+@pytest.mark.parametrize("mebibytes", (36, 44, 48, 56, 64))
+def test_little_memory(appsync, place, mebibytes):
+    if appsync.is_sanitized:
+        pytest.skip("the sanitizer takes more by itself")
+    done = sync_with(appsync, place, resource.RLIMIT_AS, mebibytes << 20)
+    is_told_and_made_good(appsync, place, done, "out of means")
