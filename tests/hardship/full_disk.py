@@ -1,6 +1,6 @@
 """What test_full_disk.py runs in a mount namespace of its own, where DISK is a small disk.
 
-    full_disk.py grow|look|remove APPSYNC DISK FOLDER COORDINATION STRIDE
+    full_disk.py grow|look|remove APPSYNC DISK FOLDER COORDINATION each|last
 """
 
 import os
@@ -15,6 +15,7 @@ sys.path.insert(0, os.path.join(os.path.dirname(os.path.abspath(__file__)), ".."
 import packages
 
 PAGE = 4  # KiB
+WIDE = 48
 SAYS_FULL = re.compile("is full|bytes and [0-9]+ are free|No space left|does not fit|do not fit|missing")
 
 
@@ -23,7 +24,15 @@ class Disk:
 
     def __init__(self, where, kib):
         self.where = where
-        subprocess.run(["mount", "-t", "tmpfs", "-o", "size=%dk" % kib, "tmpfs", where], check=True)
+        self.mount(kib)
+
+    def mount(self, kib):
+        subprocess.run(["mount", "-t", "tmpfs", "-o", "size=%dk" % kib, "tmpfs", self.where], check=True)
+
+    def remake(self, kib):
+        """An empty one of that size: tmpfs shrinks only once what was removed has gone."""
+        subprocess.run(["umount", self.where], check=True)
+        self.mount(kib)
 
     def resize(self, kib):
         subprocess.run(["mount", "-o", "remount,size=%dk" % kib, self.where], check=True)
@@ -86,24 +95,27 @@ class Runner:
             database.close()
 
 
-def grow(runner, stride):
+def grow(runner, sizes):
     """The disk grows until a sync fits; at each size it fails in a clear way and leaves the device whole."""
-    base = runner.device + ".base"
+    base = os.path.join(runner.folder, "base")
     shutil.copytree(runner.device, base, symlinks=True)
     start = runner.disk.used()
-    fits = first_fit(runner, start, stride)
-    if stride > PAGE:  # the last steps again, one by one
-        shutil.rmtree(runner.device)
-        shutil.copytree(base, runner.device, symlinks=True)
-        fits = first_fit(runner, fits - stride, PAGE)
+    fits = first_fit(runner, start, WIDE)  # the device of one who tries again and again: its log grows
+    print("the same device fits with %d KiB left" % (fits - start))
+    # By single pages, from the beginning or the last ones, and each time with the device as it was.
+    fits = first_fit(runner, start if sizes == "each" else fits - WIDE, PAGE, base)
     runner.check_intact()
     assert len(runner.ok("apps", runner.device).splitlines()) == 4
     print("fits with %d KiB left" % (fits - start))
 
 
-def first_fit(runner, kib, stride):
+def first_fit(runner, kib, stride, base=None):
     for attempt in range(1000):
-        runner.disk.resize(kib)
+        if base:
+            runner.disk.remake(kib)
+            shutil.copytree(base, runner.device, symlinks=True)
+        else:
+            runner.disk.resize(kib)
         done = runner.run("sync", runner.device, runner.library)
         if done.returncode == 0:
             return kib
@@ -165,9 +177,9 @@ def remove(runner, _):
 
 
 def main():
-    what, program, where, folder, coordination, stride = sys.argv[1:]
+    what, program, where, folder, coordination, sizes = sys.argv[1:]
     disk = Disk(where, 2048 if what == "grow" else 8192)
-    {"grow": grow, "look": look, "remove": remove}[what](Runner(program, disk, folder, coordination), int(stride))
+    {"grow": grow, "look": look, "remove": remove}[what](Runner(program, disk, folder, coordination), sizes)
 
 
 main()

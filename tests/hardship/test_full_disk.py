@@ -8,7 +8,7 @@ import pytest
 
 from conftest import HERE, IS_LONG
 
-STRIDE = 4 if IS_LONG else 48  # KiB
+SIZES = "each" if IS_LONG else "last"  # of the disk, that are tried by single pages
 
 
 @pytest.fixture(scope="session")
@@ -31,6 +31,6 @@ def test_full_disk(appsync, own_mounts, tmp_path, what, coordination):
     disk.mkdir()
     done = subprocess.run(
         [*own_mounts, sys.executable, os.path.join(HERE, "full_disk.py"), what, appsync.program, str(disk),
-         str(tmp_path), coordination, str(STRIDE)], capture_output=True, text=True)
+         str(tmp_path), coordination, SIZES], capture_output=True, text=True)
     print(done.stdout)
     assert done.returncode == 0, done.stderr
