@@ -18,15 +18,15 @@
 
 #include "client/AppsClient.h"
 #include "client/Paths.h"
-#include "device/Containers.h"
-#include "device/Database.h"
 #include "device/Device.h"
-#include "device/DevicePaths.h"
-#include "device/PackageWriter.h"
+#include "device/database/Database.h"
+#include "device/install/Containers.h"
+#include "device/package/PackageWriter.h"
+#include "device/values/DevicePaths.h"
 #include "platform/AppRegistry.h"
 #include "platform/LogFacility.h"
 #include "platform/SyncHost.h"
-#include "system/PropertyListCodec.h"
+#include "system/property_list/PropertyListCodec.h"
 
 // What a device costs: one install on an empty and on a full device, the opening of a session, and
 // many installs at once, and a restore beside the plain writing of the files that it leaves. Run it

@@ -20,8 +20,8 @@
 #include "client/Paths.h"
 #include "client/TodoList.h"
 #include "simulation/SimulatedPlatform.h"
-#include "system/PropertyListCodec.h"
 #include "system/RootedFileSystem.h"
+#include "system/property_list/PropertyListCodec.h"
 
 namespace appsync {
 namespace {

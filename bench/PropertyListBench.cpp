@@ -17,7 +17,7 @@
 #include <pugixml.hpp>
 #include <string>
 
-#include "system/PropertyListCodec.h"
+#include "system/property_list/PropertyListCodec.h"
 
 namespace appsync {
 namespace {

@@ -1,9 +1,9 @@
 # What the CMakeLists.txt of the folders are written with. Each folder globs its own sources, so a new
 # file needs no edit of any CMakeLists.txt.
 
-# Adds the calling folder's sources to the library TARGET.
+# Adds the sources of the calling folder and its rooms to the library TARGET.
 function(appsync_add_folder target)
-    file(GLOB sources CONFIGURE_DEPENDS "${CMAKE_CURRENT_SOURCE_DIR}/*.cpp" "${CMAKE_CURRENT_SOURCE_DIR}/*.h")
+    file(GLOB_RECURSE sources CONFIGURE_DEPENDS "${CMAKE_CURRENT_SOURCE_DIR}/*.cpp" "${CMAKE_CURRENT_SOURCE_DIR}/*.h")
     list(FILTER sources EXCLUDE REGEX "/main\\.cpp$")
     target_sources(${target} PRIVATE "${CMAKE_CURRENT_SOURCE_DIR}/CMakeLists.txt" ${sources})
 endfunction()
@@ -25,11 +25,11 @@ function(appsync_library target)
     target_link_libraries(${target} PUBLIC ${ARGN})
 endfunction()
 
-# The unit tests of the calling folder as one executable test_<folder>, linked with LIBRARIES.
+# The unit tests of the calling folder and its rooms as one executable test_<folder>, linked with LIBRARIES.
 # A folder without a .cpp file has no executable.
 function(appsync_tests)
     get_filename_component(folder "${CMAKE_CURRENT_SOURCE_DIR}" NAME)
-    file(GLOB sources CONFIGURE_DEPENDS "${CMAKE_CURRENT_SOURCE_DIR}/*.cpp")
+    file(GLOB_RECURSE sources CONFIGURE_DEPENDS "${CMAKE_CURRENT_SOURCE_DIR}/*.cpp")
     if(NOT sources)
         return()
     endif()

@@ -9,8 +9,8 @@
 #include <string>
 #include <vector>
 
-#include "device/DeviceRecords.h"
-#include "device/HomeScreenPicture.h"
+#include "device/screen/HomeScreenPicture.h"
+#include "device/values/DeviceRecords.h"
 #include "platform/Bytes.h"
 #include "platform/Platform.h"
 #include "platform/Result.h"

@@ -10,13 +10,13 @@
 #include <filesystem>
 #include <utility>
 
-#include "device/Containers.h"
-#include "device/Database.h"
-#include "device/DeviceError.h"
-#include "device/DevicePaths.h"
-#include "device/DeviceSchema.h"
-#include "device/PackageError.h"
 #include "device/SpaceReserve.h"
+#include "device/database/Database.h"
+#include "device/database/DeviceSchema.h"
+#include "device/install/Containers.h"
+#include "device/values/DeviceError.h"
+#include "device/values/DevicePaths.h"
+#include "device/values/PackageText.h"
 #include "system/PosixError.h"
 #include "system/UniqueFd.h"
 

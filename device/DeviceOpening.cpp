@@ -6,12 +6,12 @@
 #include <cerrno>
 #include <filesystem>
 
-#include "device/Containers.h"
-#include "device/Database.h"
-#include "device/DeviceError.h"
-#include "device/DevicePaths.h"
-#include "device/DeviceSchema.h"
 #include "device/SpaceReserve.h"
+#include "device/database/Database.h"
+#include "device/database/DeviceSchema.h"
+#include "device/install/Containers.h"
+#include "device/values/DeviceError.h"
+#include "device/values/DevicePaths.h"
 #include "system/PosixError.h"
 
 namespace appsync {

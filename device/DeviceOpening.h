@@ -4,8 +4,8 @@
 #include <optional>
 #include <string>
 
-#include "device/DeviceDatabase.h"
 #include "device/SessionLock.h"
+#include "device/database/DeviceDatabase.h"
 #include "platform/Result.h"
 #include "system/RootedFileSystem.h"
 

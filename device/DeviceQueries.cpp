@@ -4,13 +4,13 @@
 #include <functional>
 #include <unordered_map>
 
-#include "device/CoordinationTables.h"
-#include "device/Database.h"
-#include "device/DeviceDatabase.h"
-#include "device/IconDrawing.h"
-#include "device/ProgressBook.h"
-#include "device/RegistryTables.h"
-#include "device/WallClock.h"
+#include "device/database/CoordinationTables.h"
+#include "device/database/Database.h"
+#include "device/database/DeviceDatabase.h"
+#include "device/database/RegistryTables.h"
+#include "device/install/ProgressBook.h"
+#include "device/screen/IconDrawing.h"
+#include "device/values/WallClock.h"
 #include "system/DescriptorIO.h"
 #include "system/RootDirectory.h"
 

@@ -5,8 +5,8 @@
 #include <string>
 #include <vector>
 
-#include "device/DeviceRecords.h"
-#include "device/HomeScreenPicture.h"
+#include "device/screen/HomeScreenPicture.h"
+#include "device/values/DeviceRecords.h"
 #include "platform/Result.h"
 
 namespace appsync {

@@ -7,7 +7,7 @@
 
 #include <limits>
 
-#include "device/DevicePaths.h"
+#include "device/values/DevicePaths.h"
 #include "system/UniqueFd.h"
 
 namespace appsync {

@@ -14,9 +14,9 @@
 #include <system_error>
 #include <vector>
 
-#include "host/CommandLine.h"
-#include "host/Console.h"
-#include "host/Problem.h"
+#include "host/command/CommandLine.h"
+#include "host/console/Console.h"
+#include "host/console/Problem.h"
 
 namespace {
 

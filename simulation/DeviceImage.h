@@ -11,10 +11,10 @@
 #include <vector>
 
 #include "platform/PropertyList.h"
-#include "simulation/DurableChanges.h"
-#include "simulation/FileJournal.h"
-#include "simulation/SimulatedAppRegistry.h"
-#include "simulation/SimulatedCoordination.h"
+#include "simulation/coordination/SimulatedCoordination.h"
+#include "simulation/files/FileJournal.h"
+#include "simulation/recording/DurableChanges.h"
+#include "simulation/services/SimulatedAppRegistry.h"
 
 namespace appsync {
 

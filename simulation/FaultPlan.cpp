@@ -6,8 +6,8 @@
 #include <map>
 #include <utility>
 
-#include "simulation/KnownCalls.h"
 #include "simulation/SimulatedPlatform.h"
+#include "simulation/recording/KnownCalls.h"
 
 namespace appsync {
 

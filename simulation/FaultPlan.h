@@ -9,7 +9,7 @@
 #include <string_view>
 #include <vector>
 
-#include "simulation/Recorder.h"
+#include "simulation/recording/Recorder.h"
 
 namespace appsync {
 

@@ -4,7 +4,7 @@
 #include <utility>
 
 #include "simulation/DeviceImage.h"
-#include "simulation/KnownCalls.h"
+#include "simulation/recording/KnownCalls.h"
 
 namespace appsync {
 namespace {

@@ -1,17 +1,17 @@
-#include "device/CoordinatedInstaller.h"
+#include "device/coordination/CoordinatedInstaller.h"
 
 #include <algorithm>
 #include <system_error>
 #include <utility>
 
-#include "device/ApplicationInstall.h"
-#include "device/CoordinationBook.h"
-#include "device/CoordinationTables.h"
-#include "device/Database.h"
-#include "device/DeviceDatabase.h"
-#include "device/DeviceError.h"
-#include "device/DeviceHomeScreen.h"
-#include "device/LiveCoordinator.h"
+#include "device/coordination/CoordinationBook.h"
+#include "device/coordination/LiveCoordinator.h"
+#include "device/database/CoordinationTables.h"
+#include "device/database/Database.h"
+#include "device/database/DeviceDatabase.h"
+#include "device/install/ApplicationInstall.h"
+#include "device/screen/DeviceHomeScreen.h"
+#include "device/values/DeviceError.h"
 #include "platform/FileURL.h"
 
 namespace appsync {

@@ -10,7 +10,7 @@
 #include <thread>
 #include <vector>
 
-#include "device/InstallContext.h"
+#include "device/install/InstallContext.h"
 #include "platform/Result.h"
 
 namespace appsync {

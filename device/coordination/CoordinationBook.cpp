@@ -1,11 +1,11 @@
-#include "device/CoordinationBook.h"
+#include "device/coordination/CoordinationBook.h"
 
-#include "device/Database.h"
-#include "device/DeviceCoordinator.h"
-#include "device/DeviceDatabase.h"
-#include "device/DeviceError.h"
-#include "device/DeviceRegistry.h"
-#include "device/RegistryTables.h"
+#include "device/coordination/DeviceCoordinator.h"
+#include "device/database/Database.h"
+#include "device/database/DeviceDatabase.h"
+#include "device/database/RegistryTables.h"
+#include "device/registry/DeviceRegistry.h"
+#include "device/values/DeviceError.h"
 
 namespace appsync {
 

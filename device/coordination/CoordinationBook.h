@@ -13,9 +13,9 @@
 #include <unordered_map>
 #include <vector>
 
-#include "device/CoordinationHerald.h"
-#include "device/InstallContext.h"
-#include "device/LiveCoordinator.h"
+#include "device/coordination/CoordinationHerald.h"
+#include "device/coordination/LiveCoordinator.h"
+#include "device/install/InstallContext.h"
 #include "platform/InstallCoordinatorService.h"
 #include "platform/Result.h"
 

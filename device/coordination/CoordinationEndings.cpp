@@ -2,13 +2,13 @@
 
 #include <algorithm>
 
-#include "device/Containers.h"
-#include "device/CoordinationBook.h"
-#include "device/Database.h"
-#include "device/DeviceDatabase.h"
-#include "device/DevicePaths.h"
-#include "device/ProgressBook.h"
-#include "device/WallClock.h"
+#include "device/coordination/CoordinationBook.h"
+#include "device/database/Database.h"
+#include "device/database/DeviceDatabase.h"
+#include "device/install/Containers.h"
+#include "device/install/ProgressBook.h"
+#include "device/values/DevicePaths.h"
+#include "device/values/WallClock.h"
 #include "platform/InstallProgressRecord.h"
 #include "system/RootDirectory.h"
 #include "system/RootedFileSystem.h"

@@ -1,10 +1,10 @@
-#include "device/CoordinationHerald.h"
+#include "device/coordination/CoordinationHerald.h"
 
 #include <algorithm>
 #include <system_error>
 #include <utility>
 
-#include "device/LiveCoordinator.h"
+#include "device/coordination/LiveCoordinator.h"
 
 namespace appsync {
 

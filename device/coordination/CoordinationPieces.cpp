@@ -1,13 +1,13 @@
 // How a coordinator gets its pieces, and what follows from each.
 
-#include "device/CoordinationBook.h"
-#include "device/Database.h"
-#include "device/DeviceDatabase.h"
-#include "device/DeviceError.h"
-#include "device/DevicePlaceholder.h"
-#include "device/PlaceholderInstall.h"
-#include "device/ProgressBook.h"
-#include "device/RegistryTables.h"
+#include "device/coordination/CoordinationBook.h"
+#include "device/coordination/DevicePlaceholder.h"
+#include "device/database/Database.h"
+#include "device/database/DeviceDatabase.h"
+#include "device/database/RegistryTables.h"
+#include "device/install/PlaceholderInstall.h"
+#include "device/install/ProgressBook.h"
+#include "device/values/DeviceError.h"
 #include "platform/AppRegistry.h"
 #include "platform/PropertyListSerialization.h"
 

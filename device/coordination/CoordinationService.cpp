@@ -1,12 +1,12 @@
-#include "device/CoordinationService.h"
+#include "device/coordination/CoordinationService.h"
 
-#include "device/BundleRemoval.h"
-#include "device/DeviceError.h"
-#include "device/DevicePlaceholder.h"
-#include "device/DevicePromise.h"
-#include "device/DeviceRegistry.h"
-#include "device/DeviceServices.h"
-#include "device/PackageIdentifier.h"
+#include "device/coordination/DevicePlaceholder.h"
+#include "device/coordination/DevicePromise.h"
+#include "device/install/BundleRemoval.h"
+#include "device/registry/DeviceRegistry.h"
+#include "device/services/DeviceServices.h"
+#include "device/values/DeviceError.h"
+#include "device/values/PackageIdentifier.h"
 
 namespace appsync {
 

@@ -6,10 +6,10 @@
 #include <string>
 #include <vector>
 
-#include "device/CoordinatedInstaller.h"
-#include "device/CoordinationBook.h"
-#include "device/CoordinationHerald.h"
-#include "device/InstallContext.h"
+#include "device/coordination/CoordinatedInstaller.h"
+#include "device/coordination/CoordinationBook.h"
+#include "device/coordination/CoordinationHerald.h"
+#include "device/install/InstallContext.h"
 #include "platform/InstallCoordinatorService.h"
 
 namespace appsync {

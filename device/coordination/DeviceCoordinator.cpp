@@ -1,9 +1,9 @@
-#include "device/DeviceCoordinator.h"
+#include "device/coordination/DeviceCoordinator.h"
 
-#include "device/CoordinationBook.h"
-#include "device/DevicePlaceholder.h"
-#include "device/DevicePromise.h"
-#include "device/LiveCoordinator.h"
+#include "device/coordination/CoordinationBook.h"
+#include "device/coordination/DevicePlaceholder.h"
+#include "device/coordination/DevicePromise.h"
+#include "device/coordination/LiveCoordinator.h"
 
 namespace appsync {
 

@@ -1,7 +1,7 @@
-#include "device/DevicePlaceholder.h"
+#include "device/coordination/DevicePlaceholder.h"
 
-#include "device/DeviceError.h"
-#include "device/DevicePromise.h"
+#include "device/coordination/DevicePromise.h"
+#include "device/values/DeviceError.h"
 
 namespace appsync {
 

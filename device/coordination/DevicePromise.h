@@ -2,7 +2,7 @@
 
 #include <memory>
 
-#include "device/LivePromise.h"
+#include "device/coordination/LivePromise.h"
 #include "platform/InstallPromises.h"
 
 namespace appsync {

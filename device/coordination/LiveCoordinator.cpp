@@ -1,9 +1,9 @@
-#include "device/LiveCoordinator.h"
+#include "device/coordination/LiveCoordinator.h"
 
 #include <algorithm>
 #include <utility>
 
-#include "device/DeviceError.h"
+#include "device/values/DeviceError.h"
 
 namespace appsync {
 

@@ -8,8 +8,8 @@
 #include <utility>
 #include <vector>
 
-#include "device/CoordinationTables.h"
-#include "device/LivePromise.h"
+#include "device/coordination/LivePromise.h"
+#include "device/database/CoordinationTables.h"
 #include "platform/Bytes.h"
 #include "platform/InstallCoordinator.h"
 #include "platform/Result.h"

@@ -1,4 +1,4 @@
-#include "device/LivePromise.h"
+#include "device/coordination/LivePromise.h"
 
 #include <algorithm>
 #include <cmath>

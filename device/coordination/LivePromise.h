@@ -1,25 +1,13 @@
 #pragma once
 
-#include <cstdint>
 #include <functional>
 #include <mutex>
 #include <optional>
 #include <string>
 
-#include "platform/InstallPromises.h"
+#include "device/values/PromiseValues.h"
 
 namespace appsync {
-
-/// What there is to know of a promise.
-struct PromiseValues {
-    std::string name;
-    CoordinationClient client = 0;
-    std::optional<std::string> path;  // a device path
-    std::uint64_t diskSpaceNeeded = 0;
-    double percent = 0;  // from 0 to 1
-    bool complete = false;
-    bool cancelled = false;
-};
 
 /// A promise, alone or attached to a coordinator or a placeholder; every handle on it shares one.
 /// Callable on any thread.

@@ -1,12 +1,12 @@
-#include "device/CoordinationTables.h"
+#include "device/database/CoordinationTables.h"
 
 #include <algorithm>
 
-#include "device/Database.h"
-#include "device/DeviceError.h"
-#include "device/DeviceRecords.h"
-#include "device/RegistryTables.h"
-#include "device/WallClock.h"
+#include "device/database/Database.h"
+#include "device/database/RegistryTables.h"
+#include "device/values/DeviceError.h"
+#include "device/values/DeviceRecords.h"
+#include "device/values/WallClock.h"
 
 namespace appsync {
 

@@ -5,7 +5,7 @@
 #include <string>
 #include <vector>
 
-#include "device/LivePromise.h"
+#include "device/values/PromiseValues.h"
 #include "platform/Bytes.h"
 #include "platform/Error.h"
 #include "platform/InstallCoordinatorService.h"

@@ -1,4 +1,4 @@
-#include "device/Database.h"
+#include "device/database/Database.h"
 
 #include <sqlite3.h>
 #include <sys/statvfs.h>
@@ -8,7 +8,7 @@
 #include <filesystem>
 #include <utility>
 
-#include "device/DeviceError.h"
+#include "device/values/DeviceError.h"
 #include "system/PosixError.h"
 
 namespace appsync {

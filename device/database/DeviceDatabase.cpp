@@ -1,13 +1,13 @@
-#include "device/DeviceDatabase.h"
+#include "device/database/DeviceDatabase.h"
 
 #include <algorithm>
 #include <chrono>
 #include <iterator>
 #include <system_error>
 
-#include "device/Database.h"
-#include "device/DeviceError.h"
-#include "device/DeviceSchema.h"
+#include "device/database/Database.h"
+#include "device/database/DeviceSchema.h"
+#include "device/values/DeviceError.h"
 
 namespace appsync {
 

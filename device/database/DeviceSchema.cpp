@@ -1,13 +1,13 @@
-#include "device/DeviceSchema.h"
+#include "device/database/DeviceSchema.h"
 
 #include <algorithm>
 #include <set>
 #include <string>
 #include <string_view>
 
-#include "device/Database.h"
-#include "device/DeviceError.h"
-#include "device/PackageError.h"
+#include "device/database/Database.h"
+#include "device/values/DeviceError.h"
+#include "device/values/PackageText.h"
 
 namespace appsync {
 

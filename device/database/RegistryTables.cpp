@@ -1,7 +1,7 @@
-#include "device/RegistryTables.h"
+#include "device/database/RegistryTables.h"
 
-#include "device/Containers.h"
-#include "device/Database.h"
+#include "device/database/Database.h"
+#include "device/values/DevicePaths.h"
 
 namespace appsync {
 
@@ -107,7 +107,7 @@ AppProxy proxyOf(const BundleRow& row, BundleTable table) {
     proxy.applicationIdentifier = row.identifier;
     proxy.bundleVersion = row.version;
     proxy.displayName = row.name;
-    proxy.bundleContainerPath = Containers::pathOf(row.container);
+    proxy.bundleContainerPath = containerPath(row.container);
     proxy.bundlePath = proxy.bundleContainerPath + "/" + row.bundle;
     proxy.applicationType = row.type;
     proxy.installType = row.installType;
@@ -125,7 +125,7 @@ ApplicationRecord recordOf(const BundleRow& row, BundleTable table) {
     record.isPlaceholder = table == BundleTable::Placeholders;
     record.type = row.type;
     record.installType = row.installType;
-    record.container = Containers::pathOf(row.container);
+    record.container = containerPath(row.container);
     record.bundle = record.container + "/" + row.bundle;
     record.iconFile = row.iconFile;
     record.bytes = row.bytes;

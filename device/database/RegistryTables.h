@@ -6,7 +6,7 @@
 #include <string>
 #include <vector>
 
-#include "device/DeviceRecords.h"
+#include "device/values/DeviceRecords.h"
 #include "platform/AppRegistry.h"
 #include "platform/Bytes.h"
 #include "platform/Result.h"

@@ -1,20 +1,20 @@
-#include "device/ApplicationInstall.h"
+#include "device/install/ApplicationInstall.h"
 
 #include <sys/statvfs.h>
 
 #include <cerrno>
 #include <memory>
 
-#include "device/Containers.h"
-#include "device/Database.h"
-#include "device/DeviceDatabase.h"
-#include "device/DeviceError.h"
-#include "device/DurabilityBarrier.h"
-#include "device/InstallContext.h"
-#include "device/PackageReader.h"
-#include "device/ProgressBook.h"
-#include "device/RegistryTables.h"
-#include "device/RestoreData.h"
+#include "device/database/Database.h"
+#include "device/database/DeviceDatabase.h"
+#include "device/database/RegistryTables.h"
+#include "device/install/Containers.h"
+#include "device/install/DurabilityBarrier.h"
+#include "device/install/InstallContext.h"
+#include "device/install/ProgressBook.h"
+#include "device/install/RestoreData.h"
+#include "device/package/PackageReader.h"
+#include "device/values/DeviceError.h"
 #include "platform/FileURL.h"
 #include "system/PosixError.h"
 #include "system/RootDirectory.h"

@@ -1,4 +1,4 @@
-#include "device/Containers.h"
+#include "device/install/Containers.h"
 
 #include <fcntl.h>
 #include <sys/random.h>
@@ -8,7 +8,7 @@
 #include <array>
 #include <cerrno>
 
-#include "device/DevicePaths.h"
+#include "device/values/DevicePaths.h"
 #include "system/PosixError.h"
 #include "system/RootDirectory.h"
 #include "system/RootedFileSystem.h"
@@ -52,7 +52,7 @@ NewContainer::~NewContainer() {
 
 Result<NewContainer> Containers::make() {
     const std::string name = makeUuid();
-    const std::string path = pathOf(name);
+    const std::string path = containerPath(name);
     if (name.empty()) return posixError(errno, "create", path, "no random bytes for its name");
     const Result<ItemPlace> place = files_.root().place(path, "create");
     if (!place) return place.error();
@@ -69,7 +69,7 @@ Result<NewContainer> Containers::make() {
 void Containers::remove(const std::string& name) {
     // Out of a database that somebody has altered it could be the path of anything.
     const bool isPlain = name.find('/') == name.npos && name != "." && name != "..";
-    if (isPlain && !name.empty()) files_.removeItem(pathOf(name)).ignore();
+    if (isPlain && !name.empty()) files_.removeItem(containerPath(name)).ignore();
 }
 
 Result<std::vector<std::string>> Containers::names() const {
@@ -77,10 +77,6 @@ Result<std::vector<std::string>> Containers::names() const {
     const Result<UniqueFd> directory = files_.root().openDirectoryWithoutLinks(path, "list");
     if (!directory) return directory.error();
     return namesIn(directory->get(), path);
-}
-
-std::string Containers::pathOf(std::string_view name) {
-    return std::string(kContainersDirectory).append("/").append(name);
 }
 
 }  // namespace appsync

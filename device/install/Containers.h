@@ -49,9 +49,6 @@ class Containers {
     /// The names of all that is there, in no order.
     [[nodiscard]] Result<std::vector<std::string>> names() const;
 
-    /// The device path of a container.
-    [[nodiscard]] static std::string pathOf(std::string_view name);
-
   private:
     RootedFileSystem& files_;
 };

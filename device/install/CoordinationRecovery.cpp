@@ -1,12 +1,12 @@
-#include "device/CoordinationRecovery.h"
+#include "device/install/CoordinationRecovery.h"
 
 #include <vector>
 
-#include "device/Containers.h"
-#include "device/CoordinationTables.h"
-#include "device/Database.h"
-#include "device/DeviceDatabase.h"
-#include "device/InstallContext.h"
+#include "device/database/CoordinationTables.h"
+#include "device/database/Database.h"
+#include "device/database/DeviceDatabase.h"
+#include "device/install/Containers.h"
+#include "device/install/InstallContext.h"
 #include "platform/InstallProgressRecord.h"
 
 namespace appsync {

@@ -1,4 +1,4 @@
-#include "device/DurabilityBarrier.h"
+#include "device/install/DurabilityBarrier.h"
 
 #include <unistd.h>
 

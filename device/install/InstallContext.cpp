@@ -1,11 +1,11 @@
-#include "device/InstallContext.h"
+#include "device/install/InstallContext.h"
 
 #include <chrono>
 
-#include "device/Database.h"
-#include "device/DeviceDatabase.h"
-#include "device/DeviceError.h"
-#include "device/WallClock.h"
+#include "device/database/Database.h"
+#include "device/database/DeviceDatabase.h"
+#include "device/values/DeviceError.h"
+#include "device/values/WallClock.h"
 
 namespace appsync {
 

@@ -1,20 +1,20 @@
-#include "device/PlaceholderInstall.h"
+#include "device/install/PlaceholderInstall.h"
 
 #include <fcntl.h>
 #include <sys/stat.h>
 
 #include <cerrno>
 
-#include "device/Containers.h"
-#include "device/Database.h"
-#include "device/DeviceDatabase.h"
-#include "device/DeviceError.h"
-#include "device/DurabilityBarrier.h"
-#include "device/IconDrawing.h"
-#include "device/InstallContext.h"
-#include "device/PackageError.h"
-#include "device/ProgressBook.h"
-#include "device/RegistryTables.h"
+#include "device/database/Database.h"
+#include "device/database/DeviceDatabase.h"
+#include "device/database/RegistryTables.h"
+#include "device/install/Containers.h"
+#include "device/install/DurabilityBarrier.h"
+#include "device/install/InstallContext.h"
+#include "device/install/ProgressBook.h"
+#include "device/screen/IconDrawing.h"
+#include "device/values/DeviceError.h"
+#include "device/values/PackageText.h"
 #include "platform/AppRegistry.h"
 #include "platform/PropertyListSerialization.h"
 #include "system/DescriptorIO.h"

@@ -1,10 +1,10 @@
-#include "device/ProgressBook.h"
+#include "device/install/ProgressBook.h"
 
 #include <map>
 #include <mutex>
 
-#include "device/Database.h"
-#include "device/DeviceDatabase.h"
+#include "device/database/Database.h"
+#include "device/database/DeviceDatabase.h"
 
 namespace appsync {
 

@@ -6,7 +6,7 @@
 #include <optional>
 #include <string>
 
-#include "device/DeviceRecords.h"
+#include "device/values/DeviceRecords.h"
 #include "platform/InstallProgressRecord.h"
 #include "platform/Result.h"
 

@@ -1,4 +1,4 @@
-#include "device/Reconciliation.h"
+#include "device/install/Reconciliation.h"
 
 #include <unistd.h>
 
@@ -6,17 +6,17 @@
 #include <optional>
 #include <unordered_set>
 
-#include "device/Containers.h"
-#include "device/CoordinationRecovery.h"
-#include "device/Database.h"
-#include "device/DeviceDatabase.h"
-#include "device/DevicePaths.h"
-#include "device/DurabilityBarrier.h"
-#include "device/InstallContext.h"
-#include "device/PackageIdentifier.h"
-#include "device/RegistryTables.h"
-#include "device/RestoreData.h"
-#include "device/WallClock.h"
+#include "device/database/Database.h"
+#include "device/database/DeviceDatabase.h"
+#include "device/database/RegistryTables.h"
+#include "device/install/Containers.h"
+#include "device/install/CoordinationRecovery.h"
+#include "device/install/DurabilityBarrier.h"
+#include "device/install/InstallContext.h"
+#include "device/install/RestoreData.h"
+#include "device/values/DevicePaths.h"
+#include "device/values/PackageIdentifier.h"
+#include "device/values/WallClock.h"
 #include "platform/InstallProgressRecord.h"
 #include "system/RootDirectory.h"
 #include "system/RootedFileSystem.h"
@@ -249,7 +249,7 @@ void clearTemporariesOfBundles(const InstallContext& context) {
     const Result<std::vector<std::string>> containers = context.containers.names();
     if (!containers) return;
     for (const std::string& container : *containers) {
-        context.files.removeContents(Containers::pathOf(container), isTemporaryName).ignore();
+        context.files.removeContents(containerPath(container), isTemporaryName).ignore();
     }
 }
 

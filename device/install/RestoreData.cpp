@@ -1,12 +1,12 @@
-#include "device/RestoreData.h"
+#include "device/install/RestoreData.h"
 
 #include <cerrno>
 
-#include "device/BundleRemoval.h"
-#include "device/DataArchive.h"
-#include "device/DevicePaths.h"
-#include "device/InstallContext.h"
-#include "device/PackageIdentifier.h"
+#include "device/install/BundleRemoval.h"
+#include "device/install/InstallContext.h"
+#include "device/package/DataArchive.h"
+#include "device/values/DevicePaths.h"
+#include "device/values/PackageIdentifier.h"
 #include "system/PosixError.h"
 #include "system/RootDirectory.h"
 #include "system/RootedFileSystem.h"

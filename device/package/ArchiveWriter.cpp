@@ -1,4 +1,4 @@
-#include "device/ArchiveWriter.h"
+#include "device/package/ArchiveWriter.h"
 
 #include <fcntl.h>
 #include <sys/stat.h>
@@ -11,8 +11,8 @@
 #include <filesystem>
 #include <memory>
 
-#include "device/PackageError.h"
-#include "device/PackageFolder.h"
+#include "device/package/PackageError.h"
+#include "device/package/PackageFolder.h"
 #include "system/PosixError.h"
 #include "system/UniqueFd.h"
 

@@ -1,4 +1,4 @@
-#include "device/DataArchive.h"
+#include "device/package/DataArchive.h"
 
 #include <sys/stat.h>
 #include <sys/statvfs.h>
@@ -10,14 +10,15 @@
 #include <system_error>
 #include <utility>
 
-#include "device/ArchiveWriter.h"
-#include "device/PackageArchive.h"
-#include "device/PackageEntries.h"
-#include "device/PackageError.h"
-#include "device/PackageFile.h"
-#include "device/PackageFolder.h"
-#include "device/PackageLimits.h"
-#include "device/PackageUnpacker.h"
+#include "device/package/ArchiveWriter.h"
+#include "device/package/PackageArchive.h"
+#include "device/package/PackageEntries.h"
+#include "device/package/PackageError.h"
+#include "device/package/PackageFile.h"
+#include "device/package/PackageFolder.h"
+#include "device/package/PackageLimits.h"
+#include "device/package/PackageUnpacker.h"
+#include "device/values/PackageText.h"
 #include "system/PosixError.h"
 #include "system/RootDirectory.h"
 

@@ -1,4 +1,4 @@
-#include "device/PackageArchive.h"
+#include "device/package/PackageArchive.h"
 
 #include <sys/stat.h>
 #include <zip.h>
@@ -8,9 +8,10 @@
 #include <optional>
 #include <utility>
 
-#include "device/PackageArchiveEnd.h"
-#include "device/PackageError.h"
-#include "device/PackageFile.h"
+#include "device/package/PackageArchiveEnd.h"
+#include "device/package/PackageError.h"
+#include "device/package/PackageFile.h"
+#include "device/values/PackageText.h"
 #include "system/PosixError.h"
 
 namespace appsync {

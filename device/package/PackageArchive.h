@@ -9,8 +9,8 @@
 #include <string_view>
 #include <vector>
 
-#include "device/PackageEntries.h"
-#include "device/PackageLimits.h"
+#include "device/package/PackageEntries.h"
+#include "device/package/PackageLimits.h"
 #include "platform/Bytes.h"
 #include "platform/Result.h"
 

@@ -1,4 +1,4 @@
-#include "device/PackageArchiveEnd.h"
+#include "device/package/PackageArchiveEnd.h"
 
 #include <algorithm>
 #include <cstddef>
@@ -8,8 +8,9 @@
 #include <string_view>
 #include <vector>
 
-#include "device/PackageError.h"
-#include "device/PackageFile.h"
+#include "device/package/PackageError.h"
+#include "device/package/PackageFile.h"
+#include "device/values/PackageText.h"
 #include "platform/Bytes.h"
 
 namespace appsync {

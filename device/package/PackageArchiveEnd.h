@@ -2,7 +2,7 @@
 
 #include <cstddef>
 
-#include "device/PackageLimits.h"
+#include "device/package/PackageLimits.h"
 #include "platform/Result.h"
 
 namespace appsync {

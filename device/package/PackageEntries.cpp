@@ -1,13 +1,13 @@
-#include "device/PackageEntries.h"
+#include "device/package/PackageEntries.h"
 
 #include <sys/stat.h>
 
 #include <algorithm>
 #include <cstddef>
 
-#include "device/PackageArchiveEnd.h"
-#include "device/PackageError.h"
-#include "device/PackageText.h"
+#include "device/package/PackageArchiveEnd.h"
+#include "device/package/PackageError.h"
+#include "device/values/PackageText.h"
 
 namespace appsync {
 

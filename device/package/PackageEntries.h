@@ -5,7 +5,7 @@
 #include <string_view>
 #include <vector>
 
-#include "device/PackageLimits.h"
+#include "device/package/PackageLimits.h"
 #include "platform/Result.h"
 
 namespace appsync {

@@ -52,8 +52,4 @@ enum class PackageErrorCode : std::int64_t {
 /// Whether the error is the refusal `code` of a package.
 [[nodiscard]] bool isPackageError(const ErrorRecord& error, PackageErrorCode code) noexcept;
 
-/// A name from a package as people may read it: in quotes, control characters and bytes that are
-/// not valid UTF-8 escaped (\x1b), and cut when it is very long.
-[[nodiscard]] std::string quotedName(std::string_view name);
-
 }  // namespace appsync

@@ -1,4 +1,4 @@
-#include "device/PackageFile.h"
+#include "device/package/PackageFile.h"
 
 #include <fcntl.h>
 #include <sys/stat.h>
@@ -7,7 +7,8 @@
 #include <cerrno>
 #include <utility>
 
-#include "device/PackageError.h"
+#include "device/package/PackageError.h"
+#include "device/values/PackageText.h"
 #include "system/PosixError.h"
 
 namespace appsync {

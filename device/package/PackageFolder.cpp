@@ -1,4 +1,4 @@
-#include "device/PackageFolder.h"
+#include "device/package/PackageFolder.h"
 
 #include <sys/stat.h>
 
@@ -8,7 +8,8 @@
 #include <system_error>
 #include <utility>
 
-#include "device/PackageEntries.h"
+#include "device/package/PackageEntries.h"
+#include "device/values/PackageText.h"
 #include "system/PosixError.h"
 
 namespace appsync {

@@ -5,8 +5,8 @@
 #include <string_view>
 #include <vector>
 
-#include "device/PackageError.h"
-#include "device/PackageLimits.h"
+#include "device/package/PackageError.h"
+#include "device/package/PackageLimits.h"
 #include "platform/Result.h"
 
 namespace appsync {

@@ -1,11 +1,11 @@
-#include "device/PackageInfo.h"
+#include "device/package/PackageInfo.h"
 
 #include <string>
 #include <utility>
 
-#include "device/PackageError.h"
-#include "device/PackageIdentifier.h"
-#include "device/PackageText.h"
+#include "device/package/PackageError.h"
+#include "device/values/PackageIdentifier.h"
+#include "device/values/PackageText.h"
 #include "platform/AppRegistry.h"
 
 namespace appsync {

@@ -2,8 +2,8 @@
 
 #include <string_view>
 
-#include "device/PackageLimits.h"
-#include "device/PackageReader.h"
+#include "device/package/PackageLimits.h"
+#include "device/package/PackageReader.h"
 #include "platform/PropertyList.h"
 #include "platform/Result.h"
 

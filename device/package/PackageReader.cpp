@@ -1,12 +1,13 @@
-#include "device/PackageReader.h"
+#include "device/package/PackageReader.h"
 
 #include <utility>
 
-#include "device/PackageArchive.h"
-#include "device/PackageError.h"
-#include "device/PackageFile.h"
-#include "device/PackageInfo.h"
-#include "device/PackageUnpacker.h"
+#include "device/package/PackageArchive.h"
+#include "device/package/PackageError.h"
+#include "device/package/PackageFile.h"
+#include "device/package/PackageInfo.h"
+#include "device/package/PackageUnpacker.h"
+#include "device/values/PackageText.h"
 #include "platform/PropertyListSerialization.h"
 
 namespace appsync {

@@ -6,7 +6,7 @@
 #include <string>
 #include <string_view>
 
-#include "device/PackageLimits.h"
+#include "device/package/PackageLimits.h"
 #include "platform/Bytes.h"
 #include "platform/PropertyList.h"
 #include "platform/Result.h"

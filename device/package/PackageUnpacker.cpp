@@ -1,4 +1,4 @@
-#include "device/PackageUnpacker.h"
+#include "device/package/PackageUnpacker.h"
 
 #include <fcntl.h>
 #include <sys/stat.h>
@@ -8,8 +8,8 @@
 #include <cerrno>
 #include <utility>
 
-#include "device/PackageArchive.h"
-#include "device/PackageError.h"
+#include "device/package/PackageArchive.h"
+#include "device/package/PackageError.h"
 #include "system/DescriptorIO.h"
 #include "system/PosixError.h"
 

@@ -5,8 +5,8 @@
 #include <string_view>
 #include <vector>
 
-#include "device/PackageEntries.h"
-#include "device/PackageReader.h"
+#include "device/package/PackageEntries.h"
+#include "device/package/PackageReader.h"
 #include "platform/Bytes.h"
 #include "platform/Result.h"
 #include "system/UniqueFd.h"

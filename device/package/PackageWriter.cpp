@@ -1,4 +1,4 @@
-#include "device/PackageWriter.h"
+#include "device/package/PackageWriter.h"
 
 #include <fcntl.h>
 #include <sys/stat.h>
@@ -12,9 +12,10 @@
 #include <utility>
 #include <vector>
 
-#include "device/ArchiveWriter.h"
-#include "device/PackageError.h"
-#include "device/PackageFolder.h"
+#include "device/package/ArchiveWriter.h"
+#include "device/package/PackageError.h"
+#include "device/package/PackageFolder.h"
+#include "device/values/PackageText.h"
 #include "system/PosixError.h"
 #include "system/UniqueFd.h"
 

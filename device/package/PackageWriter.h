@@ -2,7 +2,7 @@
 
 #include <string>
 
-#include "device/PackageReader.h"
+#include "device/package/PackageReader.h"
 #include "platform/Result.h"
 
 namespace appsync {

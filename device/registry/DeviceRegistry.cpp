@@ -1,17 +1,17 @@
-#include "device/DeviceRegistry.h"
+#include "device/registry/DeviceRegistry.h"
 
 #include <vector>
 
-#include "device/ApplicationInstall.h"
-#include "device/BundleRemoval.h"
-#include "device/Database.h"
-#include "device/DeviceDatabase.h"
-#include "device/DeviceError.h"
-#include "device/PackageError.h"
-#include "device/PackageIdentifier.h"
-#include "device/PlaceholderInstall.h"
-#include "device/ProgressBook.h"
-#include "device/RegistryTables.h"
+#include "device/database/Database.h"
+#include "device/database/DeviceDatabase.h"
+#include "device/database/RegistryTables.h"
+#include "device/install/ApplicationInstall.h"
+#include "device/install/BundleRemoval.h"
+#include "device/install/PlaceholderInstall.h"
+#include "device/install/ProgressBook.h"
+#include "device/values/DeviceError.h"
+#include "device/values/PackageIdentifier.h"
+#include "device/values/PackageText.h"
 #include "platform/FileURL.h"
 
 namespace appsync {

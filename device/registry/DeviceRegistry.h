@@ -6,8 +6,8 @@
 #include <set>
 #include <string>
 
-#include "device/InstallContext.h"
-#include "device/RegistryObservers.h"
+#include "device/install/InstallContext.h"
+#include "device/registry/RegistryObservers.h"
 #include "platform/AppRegistry.h"
 
 namespace appsync {

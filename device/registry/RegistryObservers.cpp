@@ -1,4 +1,4 @@
-#include "device/RegistryObservers.h"
+#include "device/registry/RegistryObservers.h"
 
 #include <algorithm>
 #include <chrono>

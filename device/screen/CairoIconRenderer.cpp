@@ -1,11 +1,11 @@
-#include "device/CairoIconRenderer.h"
+#include "device/screen/CairoIconRenderer.h"
 
 #include <optional>
 #include <string>
 #include <utility>
 
-#include "device/IconDrawing.h"
-#include "device/PackageInfo.h"
+#include "device/package/PackageInfo.h"
+#include "device/screen/IconDrawing.h"
 #include "platform/AppRegistry.h"
 #include "platform/PropertyList.h"
 #include "platform/PropertyListSerialization.h"

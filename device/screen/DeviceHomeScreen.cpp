@@ -1,13 +1,13 @@
-#include "device/DeviceHomeScreen.h"
+#include "device/screen/DeviceHomeScreen.h"
 
 #include <unordered_set>
 
-#include "device/Database.h"
-#include "device/DeviceDatabase.h"
-#include "device/DeviceError.h"
-#include "device/PackageIdentifier.h"
-#include "device/RegistryTables.h"
-#include "device/WallClock.h"
+#include "device/database/Database.h"
+#include "device/database/DeviceDatabase.h"
+#include "device/database/RegistryTables.h"
+#include "device/values/DeviceError.h"
+#include "device/values/PackageIdentifier.h"
+#include "device/values/WallClock.h"
 #include "platform/PropertyListSerialization.h"
 
 namespace appsync {

@@ -1,4 +1,4 @@
-#include "device/HomeScreenPicture.h"
+#include "device/screen/HomeScreenPicture.h"
 
 #include <cairo.h>
 
@@ -8,8 +8,8 @@
 #include <numbers>
 #include <string_view>
 
-#include "device/IconCanvas.h"
-#include "device/PackageText.h"
+#include "device/screen/IconCanvas.h"
+#include "device/values/PackageText.h"
 
 namespace appsync {
 

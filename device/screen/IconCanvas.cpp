@@ -1,4 +1,4 @@
-#include "device/IconCanvas.h"
+#include "device/screen/IconCanvas.h"
 
 #include <cairo.h>
 
@@ -8,8 +8,8 @@
 #include <cstring>
 #include <numbers>
 
-#include "device/IconDrawing.h"
-#include "device/PackageText.h"
+#include "device/screen/IconDrawing.h"
+#include "device/values/PackageText.h"
 #include "platform/Error.h"
 
 #if defined(__SANITIZE_ADDRESS__)

@@ -1,6 +1,6 @@
-#include "device/IconDrawing.h"
+#include "device/screen/IconDrawing.h"
 
-#include "device/IconCanvas.h"
+#include "device/screen/IconCanvas.h"
 
 namespace appsync {
 

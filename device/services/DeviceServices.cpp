@@ -1,10 +1,10 @@
-#include "device/DeviceServices.h"
+#include "device/services/DeviceServices.h"
 
 #include <algorithm>
 
-#include "device/Database.h"
-#include "device/DeviceDatabase.h"
-#include "device/WallClock.h"
+#include "device/database/Database.h"
+#include "device/database/DeviceDatabase.h"
+#include "device/values/WallClock.h"
 #include "platform/AppRegistry.h"
 
 namespace appsync {

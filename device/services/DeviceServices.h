@@ -3,7 +3,7 @@
 #include <string>
 #include <vector>
 
-#include "device/DeviceRecords.h"
+#include "device/values/DeviceRecords.h"
 #include "platform/BackupService.h"
 #include "platform/DevicePolicyService.h"
 #include "platform/InstallTransactionLog.h"

@@ -1,4 +1,4 @@
-#include "device/DeviceError.h"
+#include "device/values/DeviceError.h"
 
 namespace appsync {
 

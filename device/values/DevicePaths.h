@@ -1,6 +1,7 @@
 #pragma once
 
 #include <array>
+#include <string>
 #include <string_view>
 
 namespace appsync {
@@ -15,6 +16,10 @@ inline constexpr std::string_view kLogName = "log/system.log";
 // Device paths.
 // The containers of all bundles.
 inline constexpr std::string_view kContainersDirectory = "/var/containers/Bundle/Application";
+/// The device path of the container of that name.
+[[nodiscard]] inline std::string containerPath(std::string_view name) {
+    return std::string(kContainersDirectory).append("/").append(name);
+}
 inline constexpr std::string_view kTemporaryDirectory = "/var/mobile/tmp";
 // Where the plug-in makes the files of placeholders, one directory <identifier>.app each.
 inline constexpr std::string_view kPlaceholderFilesDirectory = "/var/mobile/tmp/com.korvu.trd.Apps";

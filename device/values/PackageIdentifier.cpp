@@ -1,4 +1,4 @@
-#include "device/PackageIdentifier.h"
+#include "device/values/PackageIdentifier.h"
 
 #include <algorithm>
 

@@ -1,4 +1,4 @@
-#include "device/PackageText.h"
+#include "device/values/PackageText.h"
 
 #include <algorithm>
 
@@ -28,6 +28,13 @@ SequenceShape shapeOf(unsigned char first) noexcept {
 
 bool isContinuation(char character) noexcept {
     return (static_cast<unsigned char>(character) & 0xc0U) == 0x80U;
+}
+
+constexpr std::size_t kLongestQuotedName = 200;
+
+std::string escaped(unsigned char byte) {
+    constexpr std::string_view kDigits = "0123456789abcdef";
+    return {'\\', 'x', kDigits[byte >> 4U], kDigits[byte & 15U]};
 }
 
 }  // namespace
@@ -63,6 +70,23 @@ bool holdsControlCharacter(std::string_view text) noexcept {
     return std::any_of(text.begin(), text.end(), [](char character) {
         return isControlCharacter(static_cast<unsigned char>(character));
     });
+}
+
+std::string quotedName(std::string_view name) {
+    const std::string_view shown = utf8Prefix(name, kLongestQuotedName);
+    std::string quoted = "'";
+    for (std::size_t position = 0; position < shown.size();) {
+        const std::size_t length = utf8SequenceLength(shown.substr(position));
+        const auto byte = static_cast<unsigned char>(shown[position]);
+        if (length == 0 || isControlCharacter(byte)) {
+            quoted += escaped(byte);
+            ++position;
+        } else {
+            quoted.append(shown.substr(position, length));
+            position += length;
+        }
+    }
+    return quoted + (shown.size() < name.size() ? "...'" : "'");
 }
 
 }  // namespace appsync

@@ -1,6 +1,7 @@
 #pragma once
 
 #include <cstddef>
+#include <string>
 #include <string_view>
 
 namespace appsync {
@@ -20,5 +21,9 @@ namespace appsync {
 }
 
 [[nodiscard]] bool holdsControlCharacter(std::string_view text) noexcept;
+
+/// A name from a package as people may read it: in quotes, control characters and bytes that are
+/// not valid UTF-8 escaped (\x1b), and cut when it is very long.
+[[nodiscard]] std::string quotedName(std::string_view name);
 
 }  // namespace appsync

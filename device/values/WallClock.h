@@ -3,7 +3,7 @@
 #include <chrono>
 #include <cstdint>
 
-#include "device/DeviceRecords.h"
+#include "device/values/DeviceRecords.h"
 
 namespace appsync {
 

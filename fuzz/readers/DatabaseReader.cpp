@@ -10,7 +10,7 @@
 #include <vector>
 
 #include "device/Device.h"
-#include "device/DeviceError.h"
+#include "device/values/DeviceError.h"
 #include "fuzz/readers/ScratchDirectory.h"
 #include "platform/FileSystem.h"
 

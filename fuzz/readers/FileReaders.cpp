@@ -7,17 +7,17 @@
 #include <filesystem>
 #include <string_view>
 
-#include "device/DataArchive.h"
-#include "device/IconDrawing.h"
-#include "device/PackageIdentifier.h"
-#include "device/PackageReader.h"
+#include "device/package/DataArchive.h"
+#include "device/package/PackageReader.h"
+#include "device/screen/IconDrawing.h"
+#include "device/values/PackageIdentifier.h"
 #include "fuzz/readers/ScratchDirectory.h"
-#include "host/Backup.h"
-#include "host/Versions.h"
-#include "system/PropertyListBinaryReader.h"
-#include "system/PropertyListCodec.h"
-#include "system/PropertyListPlainXmlReader.h"
-#include "system/PropertyListXmlReader.h"
+#include "host/backup/Backup.h"
+#include "host/plan/Versions.h"
+#include "system/property_list/PropertyListBinaryReader.h"
+#include "system/property_list/PropertyListCodec.h"
+#include "system/property_list/PropertyListPlainXmlReader.h"
+#include "system/property_list/PropertyListXmlReader.h"
 
 namespace appsync {
 

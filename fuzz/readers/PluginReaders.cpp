@@ -15,7 +15,7 @@
 #include "client/AppsClient.h"
 #include "client/Paths.h"
 #include "simulation/SimulatedPlatform.h"
-#include "system/PropertyListCodec.h"
+#include "system/property_list/PropertyListCodec.h"
 
 namespace appsync {
 

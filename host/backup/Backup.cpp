@@ -1,4 +1,4 @@
-#include "host/Backup.h"
+#include "host/backup/Backup.h"
 
 #include <algorithm>
 #include <filesystem>
@@ -7,14 +7,14 @@
 
 #include <nlohmann/json.hpp>
 
-#include "device/DataArchive.h"
-#include "device/PackageIdentifier.h"
-#include "host/BackupManifestKeys.h"
-#include "host/BackupManifestReader.h"
-#include "host/HostFile.h"
-#include "host/JsonWriting.h"
-#include "host/Problem.h"
-#include "host/Text.h"
+#include "device/package/DataArchive.h"
+#include "device/values/PackageIdentifier.h"
+#include "host/backup/BackupManifestKeys.h"
+#include "host/backup/BackupManifestReader.h"
+#include "host/console/JsonWriting.h"
+#include "host/console/Problem.h"
+#include "host/console/Text.h"
+#include "host/file/HostFile.h"
 
 namespace appsync {
 namespace {

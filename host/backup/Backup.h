@@ -6,7 +6,7 @@
 #include <string_view>
 #include <vector>
 
-#include "host/Checksum.h"
+#include "host/file/Checksum.h"
 #include "platform/Bytes.h"
 #include "platform/Result.h"
 

@@ -1,4 +1,4 @@
-#include "host/BackupFolder.h"
+#include "host/backup/BackupFolder.h"
 
 #include <fcntl.h>
 #include <sys/file.h>
@@ -13,10 +13,10 @@
 #include <system_error>
 #include <utility>
 
-#include "device/PackageIdentifier.h"
-#include "host/Backup.h"
-#include "host/HostFile.h"
-#include "host/Problem.h"
+#include "device/values/PackageIdentifier.h"
+#include "host/backup/Backup.h"
+#include "host/console/Problem.h"
+#include "host/file/HostFile.h"
 #include "system/DescriptorIO.h"
 
 namespace appsync {

@@ -1,4 +1,4 @@
-#include "host/BackupManifestReader.h"
+#include "host/backup/BackupManifestReader.h"
 
 #include <algorithm>
 #include <array>
@@ -10,10 +10,10 @@
 #include <variant>
 #include <vector>
 
-#include "device/PackageIdentifier.h"
-#include "host/BackupManifestKeys.h"
-#include "host/JsonReading.h"
-#include "host/Text.h"
+#include "device/values/PackageIdentifier.h"
+#include "host/backup/BackupManifestKeys.h"
+#include "host/console/JsonReading.h"
+#include "host/console/Text.h"
 
 namespace appsync {
 namespace {

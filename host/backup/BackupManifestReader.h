@@ -3,7 +3,7 @@
 #include <string>
 #include <string_view>
 
-#include "host/Backup.h"
+#include "host/backup/Backup.h"
 
 namespace appsync {
 

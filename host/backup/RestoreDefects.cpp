@@ -1,4 +1,4 @@
-#include "host/RestoreDefects.h"
+#include "host/backup/RestoreDefects.h"
 
 #include "platform/PropertyList.h"
 #include "platform/PropertyListSerialization.h"

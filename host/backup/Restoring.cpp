@@ -1,4 +1,4 @@
-#include "host/Restoring.h"
+#include "host/backup/Restoring.h"
 
 #include <algorithm>
 #include <filesystem>
@@ -8,16 +8,16 @@
 #include <utility>
 
 #include "client/Paths.h"
-#include "device/DataArchive.h"
 #include "device/Device.h"
-#include "device/PackageIdentifier.h"
-#include "host/Backup.h"
-#include "host/HostFile.h"
-#include "host/PackageSender.h"
-#include "host/PlugIn.h"
-#include "host/Problem.h"
-#include "host/RestoreDefects.h"
-#include "host/StandingInstalls.h"
+#include "device/package/DataArchive.h"
+#include "device/values/PackageIdentifier.h"
+#include "host/backup/Backup.h"
+#include "host/backup/RestoreDefects.h"
+#include "host/console/Problem.h"
+#include "host/file/HostFile.h"
+#include "host/plan/StandingInstalls.h"
+#include "host/session/PackageSender.h"
+#include "host/session/PlugIn.h"
 #include "platform/FileSystem.h"
 #include "platform/HomeScreenService.h"
 #include "platform/InstallProgressRecord.h"

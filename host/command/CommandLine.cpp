@@ -1,4 +1,4 @@
-#include "host/CommandLine.h"
+#include "host/command/CommandLine.h"
 
 #include <algorithm>
 #include <charconv>
@@ -14,9 +14,9 @@
 
 #include <CLI/CLI.hpp>
 
-#include "host/Commands.h"
-#include "host/Console.h"
-#include "host/Problem.h"
+#include "host/command/Commands.h"
+#include "host/console/Console.h"
+#include "host/console/Problem.h"
 
 namespace appsync {
 namespace {

@@ -5,9 +5,9 @@
 #include <string>
 #include <vector>
 
-#include "device/DeviceRecords.h"
-#include "host/SyncDisplays.h"
-#include "host/SyncPlan.h"
+#include "device/values/DeviceRecords.h"
+#include "host/output/SyncDisplays.h"
+#include "host/plan/SyncPlan.h"
 #include "platform/LogFacility.h"
 #include "platform/PropertyListSerialization.h"
 
@@ -16,9 +16,9 @@ namespace appsync {
 struct Console;
 
 // What each command does, once its arguments are understood. Each gives the exit status (see
-// host/Problem.h); errors have then been told on the console.
+// host/console/Problem.h); errors have then been told on the console.
 
-// host/SyncCommand.cpp
+// host/command/SyncCommand.cpp
 
 struct SyncArguments {
     std::string device;
@@ -30,7 +30,7 @@ struct SyncArguments {
 };
 [[nodiscard]] int runSync(const SyncArguments& arguments, const Console& console);
 
-// host/SendCommand.cpp
+// host/command/SendCommand.cpp
 
 struct SendArguments {
     std::string device;
@@ -43,7 +43,7 @@ struct SendArguments {
 };
 [[nodiscard]] int runSend(const SendArguments& arguments, const Console& console);
 
-// host/DeviceCommands.cpp: what changes a device outside a sync.
+// host/command/DeviceCommands.cpp: what changes a device outside a sync.
 
 [[nodiscard]] int runCreate(const std::string& device, bool coordination, const Console& console);
 [[nodiscard]] int runSet(const std::string& device, const std::vector<std::string>& assignments,
@@ -58,7 +58,7 @@ struct SendArguments {
                             const Console& console);
 [[nodiscard]] int runReset(const std::string& device, const Console& console);
 
-// host/LookCommands.cpp: what shows a device.
+// host/command/LookCommands.cpp: what shows a device.
 
 [[nodiscard]] int runApps(const std::string& device, bool asJson, const Console& console);
 [[nodiscard]] int runWhy(const std::string& device, const std::string& identifier, bool asJson,
@@ -68,7 +68,7 @@ struct SendArguments {
 [[nodiscard]] int runScreen(const std::string& device, const std::string& picture,
                             const Console& console);
 
-// host/LogCommand.cpp
+// host/command/LogCommand.cpp
 
 struct LogArguments {
     std::string device;
@@ -80,7 +80,7 @@ struct LogArguments {
 };
 [[nodiscard]] int runLog(const LogArguments& arguments, const Console& console);
 
-// host/CoordinationCommands.cpp
+// host/command/CoordinationCommands.cpp
 
 struct CoordinatorArguments {
     std::string device;
@@ -92,12 +92,12 @@ struct CoordinatorArguments {
 };
 [[nodiscard]] int runCoordinator(const CoordinatorArguments& arguments, const Console& console);
 
-// host/StoreCommand.cpp
+// host/command/StoreCommand.cpp
 
 [[nodiscard]] int runStore(const std::string& device, const std::string& folder, bool asJson,
                            const Console& console);
 
-// host/BackupCommand.cpp
+// host/command/BackupCommand.cpp
 
 struct BackupArguments {
     std::string device;
@@ -107,7 +107,7 @@ struct BackupArguments {
 [[nodiscard]] int runBackup(const BackupArguments& arguments, const Console& console);
 [[nodiscard]] int runBackupCheck(const std::string& backup, bool asJson, const Console& console);
 
-// host/RestoreCommand.cpp
+// host/command/RestoreCommand.cpp
 
 struct RestoreArguments {
     std::string device;
@@ -118,7 +118,7 @@ struct RestoreArguments {
 };
 [[nodiscard]] int runRestore(const RestoreArguments& arguments, const Console& console);
 
-// host/FileCommands.cpp: packages and property lists of this machine.
+// host/command/FileCommands.cpp: packages and property lists of this machine.
 
 [[nodiscard]] int runPackageMake(const std::string& folder, const std::string& package, bool asJson,
                                  const Console& console);

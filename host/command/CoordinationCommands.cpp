@@ -1,13 +1,13 @@
 #include <ostream>
 
-#include "host/Commands.h"
-#include "host/Console.h"
-#include "host/IdentifierArgument.h"
-#include "host/JsonRecords.h"
-#include "host/OpenDevice.h"
-#include "host/Problem.h"
-#include "host/Table.h"
-#include "host/Text.h"
+#include "host/command/Commands.h"
+#include "host/command/IdentifierArgument.h"
+#include "host/command/OpenDevice.h"
+#include "host/console/Console.h"
+#include "host/console/Problem.h"
+#include "host/console/Table.h"
+#include "host/console/Text.h"
+#include "host/output/JsonRecords.h"
 
 namespace appsync {
 namespace {

@@ -4,14 +4,14 @@
 #include <utility>
 
 #include "device/Device.h"
-#include "device/DeviceError.h"
-#include "host/Commands.h"
-#include "host/Console.h"
-#include "host/IdentifierArgument.h"
-#include "host/OpenDevice.h"
-#include "host/PlugIn.h"
-#include "host/Problem.h"
-#include "host/Text.h"
+#include "device/values/DeviceError.h"
+#include "host/command/Commands.h"
+#include "host/command/IdentifierArgument.h"
+#include "host/command/OpenDevice.h"
+#include "host/console/Console.h"
+#include "host/console/Problem.h"
+#include "host/console/Text.h"
+#include "host/session/PlugIn.h"
 #include "platform/SyncClient.h"
 
 namespace appsync {

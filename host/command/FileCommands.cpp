@@ -1,16 +1,16 @@
 #include <ostream>
 #include <string_view>
 
-#include "device/PackageReader.h"
-#include "device/PackageWriter.h"
-#include "host/Commands.h"
-#include "host/Console.h"
-#include "host/HostFile.h"
-#include "host/JsonRecords.h"
-#include "host/Problem.h"
-#include "host/PropertyListOutline.h"
-#include "host/Text.h"
-#include "system/PropertyListCodec.h"
+#include "device/package/PackageReader.h"
+#include "device/package/PackageWriter.h"
+#include "host/command/Commands.h"
+#include "host/console/Console.h"
+#include "host/console/Problem.h"
+#include "host/console/Text.h"
+#include "host/file/HostFile.h"
+#include "host/output/JsonRecords.h"
+#include "host/output/PropertyListOutline.h"
+#include "system/property_list/PropertyListCodec.h"
 
 namespace appsync {
 namespace {

@@ -1,7 +1,7 @@
-#include "host/IdentifierArgument.h"
+#include "host/command/IdentifierArgument.h"
 
-#include "device/PackageIdentifier.h"
-#include "host/Problem.h"
+#include "device/values/PackageIdentifier.h"
+#include "host/console/Problem.h"
 
 namespace appsync {
 

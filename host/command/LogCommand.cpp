@@ -13,12 +13,12 @@
 #include <utility>
 #include <variant>
 
-#include "host/Commands.h"
-#include "host/Console.h"
-#include "host/JsonReading.h"
-#include "host/OpenDevice.h"
-#include "host/Problem.h"
-#include "host/Text.h"
+#include "host/command/Commands.h"
+#include "host/command/OpenDevice.h"
+#include "host/console/Console.h"
+#include "host/console/JsonReading.h"
+#include "host/console/Problem.h"
+#include "host/console/Text.h"
 #include "system/JsonLogFacility.h"
 
 namespace appsync {

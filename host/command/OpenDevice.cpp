@@ -1,7 +1,7 @@
-#include "host/OpenDevice.h"
+#include "host/command/OpenDevice.h"
 
-#include "device/DeviceError.h"
-#include "host/Problem.h"
+#include "device/values/DeviceError.h"
+#include "host/console/Problem.h"
 
 namespace appsync {
 

@@ -5,17 +5,17 @@
 #include <nlohmann/json.hpp>
 
 #include "device/Device.h"
-#include "host/Backup.h"
-#include "host/Commands.h"
-#include "host/Console.h"
-#include "host/IdentifierArgument.h"
-#include "host/JsonWriting.h"
-#include "host/OpenDevice.h"
-#include "host/PlugIn.h"
-#include "host/Problem.h"
-#include "host/Restoring.h"
-#include "host/Table.h"
-#include "host/Text.h"
+#include "host/backup/Backup.h"
+#include "host/backup/Restoring.h"
+#include "host/command/Commands.h"
+#include "host/command/IdentifierArgument.h"
+#include "host/command/OpenDevice.h"
+#include "host/console/Console.h"
+#include "host/console/JsonWriting.h"
+#include "host/console/Problem.h"
+#include "host/console/Table.h"
+#include "host/console/Text.h"
+#include "host/session/PlugIn.h"
 
 namespace appsync {
 namespace {

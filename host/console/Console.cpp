@@ -1,4 +1,4 @@
-#include "host/Console.h"
+#include "host/console/Console.h"
 
 #include <sys/ioctl.h>
 #include <unistd.h>
@@ -7,8 +7,8 @@
 #include <iostream>
 #include <string_view>
 
-#include "host/Problem.h"
-#include "host/Text.h"
+#include "host/console/Problem.h"
+#include "host/console/Text.h"
 
 namespace appsync {
 namespace {

@@ -1,4 +1,4 @@
-#include "host/JsonReading.h"
+#include "host/console/JsonReading.h"
 
 #include <cstddef>
 #include <utility>

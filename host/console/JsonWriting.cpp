@@ -1,4 +1,4 @@
-#include "host/JsonWriting.h"
+#include "host/console/JsonWriting.h"
 
 #include <nlohmann/json.hpp>
 

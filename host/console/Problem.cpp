@@ -1,8 +1,8 @@
-#include "host/Problem.h"
+#include "host/console/Problem.h"
 
 #include <string>
 
-#include "host/Text.h"
+#include "host/console/Text.h"
 
 namespace appsync {
 namespace {

@@ -1,9 +1,9 @@
-#include "host/Table.h"
+#include "host/console/Table.h"
 
 #include <algorithm>
 #include <utility>
 
-#include "host/Text.h"
+#include "host/console/Text.h"
 
 namespace appsync {
 

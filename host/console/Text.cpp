@@ -1,4 +1,4 @@
-#include "host/Text.h"
+#include "host/console/Text.h"
 
 #include <algorithm>
 #include <array>

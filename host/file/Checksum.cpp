@@ -1,4 +1,4 @@
-#include "host/Checksum.h"
+#include "host/file/Checksum.h"
 
 #include <cerrno>
 #include <memory>
@@ -6,7 +6,7 @@
 
 #include <openssl/evp.h>
 
-#include "host/HostFile.h"
+#include "host/file/HostFile.h"
 #include "platform/Bytes.h"
 
 namespace appsync {

@@ -1,4 +1,4 @@
-#include "host/HostFile.h"
+#include "host/file/HostFile.h"
 
 #include <fcntl.h>
 #include <sys/stat.h>

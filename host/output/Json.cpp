@@ -1,9 +1,9 @@
-#include "host/Json.h"
+#include "host/output/Json.h"
 
 #include <nlohmann/json.hpp>
 
-#include "host/JsonWriting.h"
-#include "host/Text.h"
+#include "host/console/JsonWriting.h"
+#include "host/console/Text.h"
 
 namespace appsync {
 namespace {

@@ -2,8 +2,8 @@
 
 #include <string>
 
-#include "host/SyncEvents.h"
-#include "host/SyncPlan.h"
+#include "host/plan/SyncPlan.h"
+#include "host/session/SyncEvents.h"
 
 namespace appsync {
 

@@ -1,15 +1,15 @@
-#include "host/JsonRecords.h"
+#include "host/output/JsonRecords.h"
 
 #include <cmath>
 #include <utility>
 
 #include <nlohmann/json.hpp>
 
-#include "device/PackageReader.h"
-#include "host/JsonWriting.h"
-#include "host/PropertyListOutline.h"
-#include "host/Text.h"
-#include "host/WhyAnswer.h"
+#include "device/package/PackageReader.h"
+#include "host/console/JsonWriting.h"
+#include "host/console/Text.h"
+#include "host/output/PropertyListOutline.h"
+#include "host/output/WhyAnswer.h"
 #include "platform/PropertyList.h"
 
 namespace appsync {

@@ -5,7 +5,7 @@
 #include <string>
 #include <vector>
 
-#include "device/DeviceRecords.h"
+#include "device/values/DeviceRecords.h"
 #include "platform/SyncAccountInfo.h"
 
 namespace appsync {

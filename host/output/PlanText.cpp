@@ -1,8 +1,8 @@
-#include "host/PlanText.h"
+#include "host/output/PlanText.h"
 
 #include <algorithm>
 
-#include "host/Text.h"
+#include "host/console/Text.h"
 
 namespace appsync {
 namespace {

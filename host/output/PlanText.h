@@ -2,7 +2,7 @@
 
 #include <string>
 
-#include "host/SyncPlan.h"
+#include "host/plan/SyncPlan.h"
 
 namespace appsync {
 

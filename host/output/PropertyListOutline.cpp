@@ -1,4 +1,4 @@
-#include "host/PropertyListOutline.h"
+#include "host/output/PropertyListOutline.h"
 
 #include <algorithm>
 #include <array>
@@ -7,7 +7,7 @@
 #include <ctime>
 #include <string_view>
 
-#include "host/Text.h"
+#include "host/console/Text.h"
 
 namespace appsync {
 namespace {

@@ -1,13 +1,13 @@
-#include "host/SyncDisplays.h"
+#include "host/output/SyncDisplays.h"
 
 #include <algorithm>
 #include <array>
 #include <cstdio>
 #include <ostream>
 
-#include "host/Console.h"
-#include "host/Json.h"
-#include "host/Text.h"
+#include "host/console/Console.h"
+#include "host/console/Text.h"
+#include "host/output/Json.h"
 
 namespace appsync {
 namespace {

@@ -4,7 +4,7 @@
 #include <string>
 #include <vector>
 
-#include "host/SyncEvents.h"
+#include "host/session/SyncEvents.h"
 
 namespace appsync {
 

@@ -1,7 +1,7 @@
-#include "host/WhyAnswer.h"
+#include "host/output/WhyAnswer.h"
 
-#include "device/DeviceRecords.h"
-#include "host/Text.h"
+#include "device/values/DeviceRecords.h"
+#include "host/console/Text.h"
 #include "platform/InstallProgressRecord.h"
 
 namespace appsync {

@@ -1,4 +1,4 @@
-#include "host/InterruptedStaging.h"
+#include "host/plan/InterruptedStaging.h"
 
 #include <map>
 #include <set>
@@ -9,7 +9,7 @@
 #include "client/Paths.h"
 #include "client/TodoList.h"
 #include "device/Device.h"
-#include "host/SyncPlan.h"
+#include "host/plan/SyncPlan.h"
 #include "platform/FileSystem.h"
 #include "platform/PropertyListSerialization.h"
 

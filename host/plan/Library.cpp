@@ -1,10 +1,10 @@
-#include "host/Library.h"
+#include "host/plan/Library.h"
 
 #include <algorithm>
 #include <tuple>
 #include <utility>
 
-#include "host/Versions.h"
+#include "host/plan/Versions.h"
 
 namespace appsync {
 namespace {

@@ -1,4 +1,4 @@
-#include "host/LibraryReader.h"
+#include "host/plan/LibraryReader.h"
 
 #include <algorithm>
 #include <array>
@@ -8,10 +8,10 @@
 #include <system_error>
 #include <utility>
 
-#include "device/PackageReader.h"
-#include "host/HostFile.h"
-#include "host/Problem.h"
-#include "host/SyncDaemon.h"
+#include "device/package/PackageReader.h"
+#include "host/console/Problem.h"
+#include "host/file/HostFile.h"
+#include "host/plan/TransferError.h"
 #include "platform/PropertyListSerialization.h"
 
 namespace appsync {

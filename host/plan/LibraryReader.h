@@ -4,7 +4,7 @@
 #include <string>
 #include <string_view>
 
-#include "host/Library.h"
+#include "host/plan/Library.h"
 #include "platform/Result.h"
 
 namespace appsync {

@@ -1,4 +1,4 @@
-#include "host/StagingArea.h"
+#include "host/plan/StagingArea.h"
 
 #include <dirent.h>
 #include <fcntl.h>
@@ -14,11 +14,11 @@
 #include "client/Paths.h"
 #include "client/TodoList.h"
 #include "device/Device.h"
-#include "device/PackageIdentifier.h"
-#include "device/PackageReader.h"
-#include "host/InterruptedStaging.h"
-#include "host/Library.h"
-#include "host/SyncPlan.h"
+#include "device/package/PackageReader.h"
+#include "device/values/PackageIdentifier.h"
+#include "host/plan/InterruptedStaging.h"
+#include "host/plan/Library.h"
+#include "host/plan/SyncPlan.h"
 #include "platform/FileSystem.h"
 #include "platform/PropertyListSerialization.h"
 #include "system/RootDirectory.h"

@@ -1,12 +1,12 @@
-#include "host/StandingInstalls.h"
+#include "host/plan/StandingInstalls.h"
 
 #include <algorithm>
 #include <map>
 #include <string_view>
 
 #include "device/Device.h"
-#include "device/DeviceError.h"
-#include "host/SyncPlan.h"
+#include "device/values/DeviceError.h"
+#include "host/plan/SyncPlan.h"
 #include "platform/InstallProgressRecord.h"
 
 namespace appsync {

@@ -1,4 +1,4 @@
-#include "host/SyncPlan.h"
+#include "host/plan/SyncPlan.h"
 
 #include <algorithm>
 #include <map>
@@ -7,10 +7,10 @@
 #include <utility>
 
 #include "client/TodoList.h"
-#include "device/DeviceRecords.h"
-#include "device/PackageIdentifier.h"
-#include "host/Library.h"
-#include "host/Text.h"
+#include "device/values/DeviceRecords.h"
+#include "device/values/PackageIdentifier.h"
+#include "host/console/Text.h"
+#include "host/plan/Library.h"
 #include "platform/AppRegistry.h"
 #include "platform/InstallProgressRecord.h"
 #include "platform/PropertyList.h"

@@ -7,7 +7,7 @@
 #include <string_view>
 #include <vector>
 
-#include "host/Library.h"
+#include "host/plan/Library.h"
 #include "platform/Result.h"
 
 namespace appsync {

@@ -1,11 +1,11 @@
-#include "host/Interruption.h"
+#include "host/session/Interruption.h"
 
 #include <unistd.h>
 
 #include <ostream>
 
-#include "host/Console.h"
-#include "host/Problem.h"
+#include "host/console/Console.h"
+#include "host/console/Problem.h"
 
 namespace appsync {
 

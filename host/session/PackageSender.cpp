@@ -1,4 +1,4 @@
-#include "host/PackageSender.h"
+#include "host/session/PackageSender.h"
 
 #include <fcntl.h>
 #include <unistd.h>
@@ -11,8 +11,9 @@
 #include <utility>
 
 #include "device/Device.h"
-#include "host/HostFile.h"
-#include "host/SyncDaemon.h"
+#include "host/file/HostFile.h"
+#include "host/plan/TransferError.h"
+#include "host/session/SyncDaemon.h"
 #include "platform/FileSystem.h"
 #include "system/DescriptorIO.h"
 #include "system/RootDirectory.h"

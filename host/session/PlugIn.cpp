@@ -1,4 +1,4 @@
-#include "host/PlugIn.h"
+#include "host/session/PlugIn.h"
 
 #include <fcntl.h>
 #include <sys/stat.h>
@@ -8,9 +8,9 @@
 
 #include "client/AppsClient.h"
 #include "device/Device.h"
-#include "host/HostFile.h"
-#include "host/Problem.h"
-#include "host/SessionWatch.h"
+#include "host/console/Problem.h"
+#include "host/file/HostFile.h"
+#include "host/session/SessionWatch.h"
 #include "platform/Notifications.h"
 #include "system/JsonLogFacility.h"
 

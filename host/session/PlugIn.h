@@ -2,7 +2,7 @@
 
 #include <memory>
 
-#include "host/SyncDaemon.h"
+#include "host/session/SyncDaemon.h"
 #include "platform/Platform.h"
 #include "platform/Result.h"
 

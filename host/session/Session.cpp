@@ -1,4 +1,4 @@
-#include "host/Session.h"
+#include "host/session/Session.h"
 
 #include <algorithm>
 #include <cerrno>
@@ -9,14 +9,15 @@
 
 #include "client/Paths.h"
 #include "device/Device.h"
-#include "device/PackageIdentifier.h"
-#include "host/PlugIn.h"
-#include "host/SessionFacts.h"
-#include "host/SessionWatch.h"
-#include "host/StandingInstalls.h"
-#include "host/SyncDaemon.h"
-#include "host/SyncEvents.h"
-#include "host/TransferQueue.h"
+#include "device/values/PackageIdentifier.h"
+#include "host/plan/StandingInstalls.h"
+#include "host/plan/TransferError.h"
+#include "host/session/PlugIn.h"
+#include "host/session/SessionFacts.h"
+#include "host/session/SessionWatch.h"
+#include "host/session/SyncDaemon.h"
+#include "host/session/SyncEvents.h"
+#include "host/session/TransferQueue.h"
 #include "platform/AppRegistry.h"
 #include "platform/FileSystem.h"
 #include "platform/PropertyListSerialization.h"

@@ -9,7 +9,7 @@
 #include <string>
 #include <vector>
 
-#include "host/PackageSender.h"
+#include "host/session/PackageSender.h"
 #include "platform/Error.h"
 #include "platform/Result.h"
 #include "platform/SyncAsset.h"

@@ -1,4 +1,4 @@
-#include "host/SessionFacts.h"
+#include "host/session/SessionFacts.h"
 
 namespace appsync {
 

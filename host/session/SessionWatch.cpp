@@ -1,13 +1,14 @@
-#include "host/SessionWatch.h"
+#include "host/session/SessionWatch.h"
 
 #include <chrono>
 #include <utility>
 
 #include "device/Device.h"
-#include "host/SessionFacts.h"
-#include "host/SyncDaemon.h"
-#include "host/SyncEvents.h"
-#include "host/WatchedCoordination.h"
+#include "host/plan/TransferError.h"
+#include "host/session/SessionFacts.h"
+#include "host/session/SyncDaemon.h"
+#include "host/session/SyncEvents.h"
+#include "host/session/WatchedCoordination.h"
 #include "platform/Platform.h"
 #include "platform/PropertyList.h"
 

@@ -1,4 +1,4 @@
-#include "host/StopSignals.h"
+#include "host/session/StopSignals.h"
 
 #include <poll.h>
 #include <signal.h>

@@ -1,4 +1,4 @@
-#include "host/SyncEvents.h"
+#include "host/session/SyncEvents.h"
 
 #include <algorithm>
 #include <thread>

@@ -10,7 +10,7 @@
 #include <utility>
 #include <vector>
 
-#include "host/SyncPlan.h"
+#include "host/plan/SyncPlan.h"
 
 namespace appsync {
 

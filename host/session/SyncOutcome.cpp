@@ -1,4 +1,4 @@
-#include "host/SyncOutcome.h"
+#include "host/session/SyncOutcome.h"
 
 #include <algorithm>
 #include <chrono>
@@ -10,12 +10,12 @@
 #include <utility>
 
 #include "device/Device.h"
-#include "host/Interruption.h"
-#include "host/Problem.h"
-#include "host/Session.h"
-#include "host/SessionFacts.h"
-#include "host/StandingInstalls.h"
-#include "host/SyncPlan.h"
+#include "host/console/Problem.h"
+#include "host/plan/StandingInstalls.h"
+#include "host/plan/SyncPlan.h"
+#include "host/session/Interruption.h"
+#include "host/session/Session.h"
+#include "host/session/SessionFacts.h"
 
 namespace appsync {
 namespace {

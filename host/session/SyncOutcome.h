@@ -4,8 +4,8 @@
 #include <string>
 #include <vector>
 
-#include "device/DeviceRecords.h"
-#include "host/SyncEvents.h"
+#include "device/values/DeviceRecords.h"
+#include "host/session/SyncEvents.h"
 #include "platform/Result.h"
 
 namespace appsync {

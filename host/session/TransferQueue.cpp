@@ -1,8 +1,9 @@
-#include "host/TransferQueue.h"
+#include "host/session/TransferQueue.h"
 
 #include <algorithm>
 
-#include "host/SyncDaemon.h"
+#include "host/plan/TransferError.h"
+#include "host/session/SyncDaemon.h"
 #include "platform/Error.h"
 
 namespace appsync {

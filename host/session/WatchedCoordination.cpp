@@ -1,9 +1,9 @@
-#include "host/WatchedCoordination.h"
+#include "host/session/WatchedCoordination.h"
 
 #include <map>
 #include <utility>
 
-#include "host/SessionWatch.h"
+#include "host/session/SessionWatch.h"
 #include "platform/InstallCoordinator.h"
 
 namespace appsync {

@@ -1,16 +1,16 @@
-#include "simulation/SimulatedCoordination.h"
+#include "simulation/coordination/SimulatedCoordination.h"
 
 #include <algorithm>
 #include <array>
 #include <string_view>
 
 #include "platform/AppRegistry.h"
-#include "simulation/RecordedCall.h"
-#include "simulation/SimulatedAppRegistry.h"
-#include "simulation/SimulatedCoordinator.h"
-#include "simulation/SimulatedFileSystem.h"
-#include "simulation/SimulatedPlaceholder.h"
-#include "simulation/SimulatedPromises.h"
+#include "simulation/coordination/SimulatedCoordinator.h"
+#include "simulation/coordination/SimulatedPlaceholder.h"
+#include "simulation/coordination/SimulatedPromises.h"
+#include "simulation/files/SimulatedFileSystem.h"
+#include "simulation/recording/RecordedCall.h"
+#include "simulation/services/SimulatedAppRegistry.h"
 
 namespace appsync {
 namespace {

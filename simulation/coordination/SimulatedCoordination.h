@@ -13,8 +13,8 @@
 #include <vector>
 
 #include "platform/InstallCoordinatorService.h"
-#include "simulation/Recorder.h"
-#include "simulation/SimulatedCoordinationState.h"
+#include "simulation/coordination/SimulatedCoordinationState.h"
+#include "simulation/recording/Recorder.h"
 
 namespace appsync {
 

@@ -1,11 +1,11 @@
-#include "simulation/SimulatedCoordinator.h"
+#include "simulation/coordination/SimulatedCoordinator.h"
 
 #include <string_view>
 
-#include "simulation/RecordedCall.h"
-#include "simulation/SimulatedCoordination.h"
-#include "simulation/SimulatedPlaceholder.h"
-#include "simulation/SimulatedPromises.h"
+#include "simulation/coordination/SimulatedCoordination.h"
+#include "simulation/coordination/SimulatedPlaceholder.h"
+#include "simulation/coordination/SimulatedPromises.h"
+#include "simulation/recording/RecordedCall.h"
 
 namespace appsync {
 namespace {

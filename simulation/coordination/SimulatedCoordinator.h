@@ -7,7 +7,7 @@
 #include <vector>
 
 #include "platform/InstallCoordinator.h"
-#include "simulation/SimulatedCoordinationState.h"
+#include "simulation/coordination/SimulatedCoordinationState.h"
 
 namespace appsync {
 

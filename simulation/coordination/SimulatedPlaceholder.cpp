@@ -1,11 +1,11 @@
-#include "simulation/SimulatedPlaceholder.h"
+#include "simulation/coordination/SimulatedPlaceholder.h"
 
 #include <string_view>
 
-#include "simulation/RecordedCall.h"
-#include "simulation/SimulatedCoordination.h"
-#include "simulation/SimulatedFileSystem.h"
-#include "simulation/SimulatedPromises.h"
+#include "simulation/coordination/SimulatedCoordination.h"
+#include "simulation/coordination/SimulatedPromises.h"
+#include "simulation/files/SimulatedFileSystem.h"
+#include "simulation/recording/RecordedCall.h"
 
 namespace appsync {
 namespace {

@@ -6,7 +6,7 @@
 #include <utility>
 
 #include "platform/InstallPlaceholder.h"
-#include "simulation/SimulatedCoordinationState.h"
+#include "simulation/coordination/SimulatedCoordinationState.h"
 
 namespace appsync {
 

@@ -1,9 +1,9 @@
-#include "simulation/SimulatedPromises.h"
+#include "simulation/coordination/SimulatedPromises.h"
 
 #include <type_traits>
 
-#include "simulation/RecordedCall.h"
-#include "simulation/SimulatedCoordination.h"
+#include "simulation/coordination/SimulatedCoordination.h"
+#include "simulation/recording/RecordedCall.h"
 
 namespace appsync {
 namespace {

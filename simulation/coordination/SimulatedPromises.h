@@ -6,7 +6,7 @@
 #include <string_view>
 
 #include "platform/InstallPromises.h"
-#include "simulation/SimulatedCoordinationState.h"
+#include "simulation/coordination/SimulatedCoordinationState.h"
 
 namespace appsync {
 

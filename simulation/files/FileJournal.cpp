@@ -1,4 +1,4 @@
-#include "simulation/FileJournal.h"
+#include "simulation/files/FileJournal.h"
 
 #include <algorithm>
 #include <cstddef>

@@ -5,7 +5,7 @@
 #include <string>
 #include <vector>
 
-#include "simulation/FileNode.h"
+#include "simulation/files/FileNode.h"
 
 namespace appsync {
 

@@ -7,7 +7,7 @@
 #include <string>
 
 #include "platform/Bytes.h"
-#include "simulation/Scheduler.h"
+#include "simulation/scheduling/Scheduler.h"
 
 namespace appsync {
 

@@ -1,11 +1,11 @@
-#include "simulation/SimulatedFileSystem.h"
+#include "simulation/files/SimulatedFileSystem.h"
 
 #include <algorithm>
 #include <cerrno>
 #include <functional>
 #include <system_error>
 
-#include "simulation/RecordedCall.h"
+#include "simulation/recording/RecordedCall.h"
 
 namespace appsync {
 namespace {

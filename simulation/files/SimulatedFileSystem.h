@@ -13,8 +13,8 @@
 #include <vector>
 
 #include "platform/FileSystem.h"
-#include "simulation/FileJournal.h"
-#include "simulation/Recorder.h"
+#include "simulation/files/FileJournal.h"
+#include "simulation/recording/Recorder.h"
 
 namespace appsync {
 

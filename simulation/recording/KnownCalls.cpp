@@ -1,4 +1,4 @@
-#include "simulation/KnownCalls.h"
+#include "simulation/recording/KnownCalls.h"
 
 #include <algorithm>
 #include <cctype>

@@ -1,4 +1,4 @@
-#include "simulation/RecordedCall.h"
+#include "simulation/recording/RecordedCall.h"
 
 #include <array>
 #include <cstdio>

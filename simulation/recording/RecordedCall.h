@@ -14,7 +14,7 @@
 #include "platform/Bytes.h"
 #include "platform/FileSystem.h"
 #include "platform/Result.h"
-#include "simulation/Recorder.h"
+#include "simulation/recording/Recorder.h"
 
 namespace appsync {
 

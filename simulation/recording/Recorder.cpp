@@ -1,4 +1,4 @@
-#include "simulation/Recorder.h"
+#include "simulation/recording/Recorder.h"
 
 #include <array>
 #include <ostream>
@@ -6,7 +6,7 @@
 #include <variant>
 
 #include "platform/LogRendering.h"
-#include "simulation/KnownCalls.h"
+#include "simulation/recording/KnownCalls.h"
 
 namespace appsync {
 namespace {

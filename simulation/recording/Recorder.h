@@ -13,8 +13,8 @@
 
 #include "platform/Error.h"
 #include "platform/LogFacility.h"
-#include "simulation/DurableChanges.h"
-#include "simulation/Scheduler.h"
+#include "simulation/recording/DurableChanges.h"
+#include "simulation/scheduling/Scheduler.h"
 
 namespace appsync {
 

@@ -1,4 +1,4 @@
-#include "simulation/Fiber.h"
+#include "simulation/scheduling/Fiber.h"
 
 #include <cxxabi.h>
 

@@ -1,4 +1,4 @@
-#include "simulation/Scheduler.h"
+#include "simulation/scheduling/Scheduler.h"
 
 #include <algorithm>
 #include <cstdio>
@@ -7,7 +7,7 @@
 #include <string>
 #include <utility>
 
-#include "simulation/Fiber.h"
+#include "simulation/scheduling/Fiber.h"
 
 namespace appsync {
 namespace {

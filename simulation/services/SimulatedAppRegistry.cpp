@@ -1,12 +1,12 @@
-#include "simulation/SimulatedAppRegistry.h"
+#include "simulation/services/SimulatedAppRegistry.h"
 
 #include <algorithm>
 #include <cerrno>
 #include <utility>
 
 #include "platform/PropertyListSerialization.h"
-#include "simulation/RecordedCall.h"
-#include "simulation/SimulatedFileSystem.h"
+#include "simulation/files/SimulatedFileSystem.h"
+#include "simulation/recording/RecordedCall.h"
 
 namespace appsync {
 namespace {

@@ -12,8 +12,8 @@
 #include <vector>
 
 #include "platform/AppRegistry.h"
-#include "simulation/Recorder.h"
-#include "simulation/SimulatedProgressRecord.h"
+#include "simulation/recording/Recorder.h"
+#include "simulation/services/SimulatedProgressRecord.h"
 
 namespace appsync {
 

@@ -1,7 +1,7 @@
-#include "simulation/SimulatedDeviceServices.h"
+#include "simulation/services/SimulatedDeviceServices.h"
 
-#include "simulation/RecordedCall.h"
-#include "simulation/SimulatedLogFacility.h"
+#include "simulation/recording/RecordedCall.h"
+#include "simulation/services/SimulatedLogFacility.h"
 
 namespace appsync {
 

@@ -11,7 +11,7 @@
 #include "platform/DevicePolicyService.h"
 #include "platform/InstallTransactionLog.h"
 #include "platform/InstallerService.h"
-#include "simulation/Recorder.h"
+#include "simulation/recording/Recorder.h"
 
 // The services that only answer or only take note, each with what the test sets and looks at (that
 // is not recorded).

@@ -1,8 +1,8 @@
-#include "simulation/SimulatedHomeScreen.h"
+#include "simulation/services/SimulatedHomeScreen.h"
 
 #include "platform/PropertyListSerialization.h"
-#include "simulation/RecordedCall.h"
-#include "simulation/SimulatedAppRegistry.h"
+#include "simulation/recording/RecordedCall.h"
+#include "simulation/services/SimulatedAppRegistry.h"
 
 namespace appsync {
 namespace {

@@ -8,7 +8,7 @@
 #include <vector>
 
 #include "platform/HomeScreenService.h"
-#include "simulation/Recorder.h"
+#include "simulation/recording/Recorder.h"
 
 namespace appsync {
 

@@ -1,9 +1,9 @@
-#include "simulation/SimulatedIconRenderer.h"
+#include "simulation/services/SimulatedIconRenderer.h"
 
 #include <string>
 #include <utility>
 
-#include "simulation/RecordedCall.h"
+#include "simulation/recording/RecordedCall.h"
 
 namespace appsync {
 namespace {

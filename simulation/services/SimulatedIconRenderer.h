@@ -3,7 +3,7 @@
 #include <optional>
 
 #include "platform/IconRenderer.h"
-#include "simulation/Recorder.h"
+#include "simulation/recording/Recorder.h"
 
 namespace appsync {
 

@@ -1,6 +1,6 @@
-#include "simulation/SimulatedLogFacility.h"
+#include "simulation/services/SimulatedLogFacility.h"
 
-#include "simulation/RecordedCall.h"
+#include "simulation/recording/RecordedCall.h"
 
 namespace appsync {
 

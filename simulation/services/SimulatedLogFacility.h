@@ -5,7 +5,7 @@
 #include <string_view>
 
 #include "platform/LogFacility.h"
-#include "simulation/Recorder.h"
+#include "simulation/recording/Recorder.h"
 
 namespace appsync {
 

@@ -1,9 +1,9 @@
-#include "simulation/SimulatedNotifications.h"
+#include "simulation/services/SimulatedNotifications.h"
 
 #include <algorithm>
 #include <utility>
 
-#include "simulation/RecordedCall.h"
+#include "simulation/recording/RecordedCall.h"
 
 namespace appsync {
 namespace {

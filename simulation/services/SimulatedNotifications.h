@@ -8,7 +8,7 @@
 #include <vector>
 
 #include "platform/Notifications.h"
-#include "simulation/Recorder.h"
+#include "simulation/recording/Recorder.h"
 
 namespace appsync {
 

@@ -1,9 +1,9 @@
-#include "simulation/SimulatedProgressRecord.h"
+#include "simulation/services/SimulatedProgressRecord.h"
 
 #include <string_view>
 #include <utility>
 
-#include "simulation/RecordedCall.h"
+#include "simulation/recording/RecordedCall.h"
 
 namespace appsync {
 namespace {

@@ -5,7 +5,7 @@
 #include <string>
 
 #include "platform/InstallProgressRecord.h"
-#include "simulation/Recorder.h"
+#include "simulation/recording/Recorder.h"
 
 namespace appsync {
 

@@ -1,8 +1,8 @@
-#include "simulation/SimulatedPropertyLists.h"
+#include "simulation/services/SimulatedPropertyLists.h"
 
 #include <string_view>
 
-#include "simulation/RecordedCall.h"
+#include "simulation/recording/RecordedCall.h"
 
 namespace appsync {
 namespace {

@@ -4,7 +4,7 @@
 #include <utility>
 
 #include "platform/PropertyListSerialization.h"
-#include "simulation/Recorder.h"
+#include "simulation/recording/Recorder.h"
 
 namespace appsync {
 

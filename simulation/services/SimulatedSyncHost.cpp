@@ -1,8 +1,8 @@
-#include "simulation/SimulatedSyncHost.h"
+#include "simulation/services/SimulatedSyncHost.h"
 
 #include <string_view>
 
-#include "simulation/RecordedCall.h"
+#include "simulation/recording/RecordedCall.h"
 
 namespace appsync {
 namespace {

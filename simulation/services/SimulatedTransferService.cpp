@@ -1,10 +1,10 @@
-#include "simulation/SimulatedTransferService.h"
+#include "simulation/services/SimulatedTransferService.h"
 
 #include <optional>
 #include <utility>
 
 #include "platform/SyncAsset.h"
-#include "simulation/RecordedCall.h"
+#include "simulation/recording/RecordedCall.h"
 
 namespace appsync {
 namespace {

@@ -6,7 +6,7 @@
 
 #include "platform/Error.h"
 #include "platform/TransferService.h"
-#include "simulation/Recorder.h"
+#include "simulation/recording/Recorder.h"
 
 namespace appsync {
 

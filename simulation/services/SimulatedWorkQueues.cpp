@@ -1,4 +1,4 @@
-#include "simulation/SimulatedWorkQueues.h"
+#include "simulation/services/SimulatedWorkQueues.h"
 
 #include <algorithm>
 #include <deque>
@@ -8,7 +8,7 @@
 #include <string>
 #include <utility>
 
-#include "simulation/RecordedCall.h"
+#include "simulation/recording/RecordedCall.h"
 
 namespace appsync {
 namespace {

@@ -6,7 +6,7 @@
 #include <string_view>
 
 #include "platform/WorkQueues.h"
-#include "simulation/Recorder.h"
+#include "simulation/recording/Recorder.h"
 
 namespace appsync {
 

@@ -1,4 +1,4 @@
-#include "system/PropertyListBinaryReader.h"
+#include "system/property_list/PropertyListBinaryReader.h"
 
 #include <algorithm>
 #include <array>
@@ -11,9 +11,9 @@
 #include <utility>
 #include <vector>
 
-#include "system/PropertyListBinaryFormat.h"
-#include "system/PropertyListErrors.h"
-#include "system/PropertyListText.h"
+#include "system/property_list/PropertyListBinaryFormat.h"
+#include "system/property_list/PropertyListErrors.h"
+#include "system/property_list/PropertyListText.h"
 
 namespace appsync {
 

@@ -1,4 +1,4 @@
-#include "system/PropertyListBinaryWriter.h"
+#include "system/property_list/PropertyListBinaryWriter.h"
 
 #include <array>
 #include <bit>
@@ -8,9 +8,9 @@
 #include <vector>
 
 #include "platform/PropertyListKeyIndex.h"
-#include "system/PropertyListBinaryFormat.h"
-#include "system/PropertyListErrors.h"
-#include "system/PropertyListText.h"
+#include "system/property_list/PropertyListBinaryFormat.h"
+#include "system/property_list/PropertyListErrors.h"
+#include "system/property_list/PropertyListText.h"
 
 namespace appsync {
 

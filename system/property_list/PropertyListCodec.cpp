@@ -1,17 +1,17 @@
-#include "system/PropertyListCodec.h"
+#include "system/property_list/PropertyListCodec.h"
 
 #include <algorithm>
 #include <new>
 #include <string_view>
 #include <utility>
 
-#include "system/PropertyListBinaryFormat.h"
-#include "system/PropertyListBinaryReader.h"
-#include "system/PropertyListBinaryWriter.h"
-#include "system/PropertyListErrors.h"
-#include "system/PropertyListPlainXmlReader.h"
-#include "system/PropertyListXmlReader.h"
-#include "system/PropertyListXmlWriter.h"
+#include "system/property_list/PropertyListBinaryFormat.h"
+#include "system/property_list/PropertyListBinaryReader.h"
+#include "system/property_list/PropertyListBinaryWriter.h"
+#include "system/property_list/PropertyListErrors.h"
+#include "system/property_list/PropertyListPlainXmlReader.h"
+#include "system/property_list/PropertyListXmlReader.h"
+#include "system/property_list/PropertyListXmlWriter.h"
 
 namespace appsync {
 

@@ -1,4 +1,4 @@
-#include "system/PropertyListErrors.h"
+#include "system/property_list/PropertyListErrors.h"
 
 #include <algorithm>
 

@@ -1,4 +1,4 @@
-#include "system/PropertyListPlainXmlReader.h"
+#include "system/property_list/PropertyListPlainXmlReader.h"
 
 #include <algorithm>
 #include <string>
@@ -6,8 +6,8 @@
 #include <utility>
 #include <vector>
 
-#include "system/PropertyListText.h"
-#include "system/PropertyListXmlValues.h"
+#include "system/property_list/PropertyListText.h"
+#include "system/property_list/PropertyListXmlValues.h"
 
 namespace appsync {
 

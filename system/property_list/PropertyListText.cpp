@@ -1,4 +1,4 @@
-#include "system/PropertyListText.h"
+#include "system/property_list/PropertyListText.h"
 
 #include <array>
 #include <cstring>

@@ -1,4 +1,4 @@
-#include "system/PropertyListXmlReader.h"
+#include "system/property_list/PropertyListXmlReader.h"
 
 #include <algorithm>
 #include <cstring>
@@ -12,9 +12,9 @@
 #include <utility>
 #include <vector>
 
-#include "system/PropertyListErrors.h"
-#include "system/PropertyListText.h"
-#include "system/PropertyListXmlValues.h"
+#include "system/property_list/PropertyListErrors.h"
+#include "system/property_list/PropertyListText.h"
+#include "system/property_list/PropertyListXmlValues.h"
 
 namespace appsync {
 

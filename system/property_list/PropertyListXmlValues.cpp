@@ -1,4 +1,4 @@
-#include "system/PropertyListXmlValues.h"
+#include "system/property_list/PropertyListXmlValues.h"
 
 #include <algorithm>
 #include <array>
@@ -7,7 +7,7 @@
 #include <cmath>
 #include <utility>
 
-#include "system/PropertyListText.h"
+#include "system/property_list/PropertyListText.h"
 
 namespace appsync {
 

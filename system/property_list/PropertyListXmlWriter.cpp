@@ -1,11 +1,11 @@
-#include "system/PropertyListXmlWriter.h"
+#include "system/property_list/PropertyListXmlWriter.h"
 
 #include <string>
 #include <string_view>
 
-#include "system/PropertyListErrors.h"
-#include "system/PropertyListText.h"
-#include "system/PropertyListXmlValues.h"
+#include "system/property_list/PropertyListErrors.h"
+#include "system/property_list/PropertyListText.h"
+#include "system/property_list/PropertyListXmlValues.h"
 
 namespace appsync {
 

@@ -14,7 +14,7 @@
 #include "client/Paths.h"
 #include "client/TodoList.h"
 #include "simulation/SimulatedPlatform.h"
-#include "system/PropertyListCodec.h"
+#include "system/property_list/PropertyListCodec.h"
 #include "tests/client/AppsClientTestAccess.h"
 
 namespace appsync {

@@ -6,11 +6,11 @@
 #include <stdexcept>
 
 #include "device/Device.h"
-#include "device/PackageWriter.h"
+#include "device/package/PackageWriter.h"
 #include "platform/SyncHost.h"
 #include "simulation/SimulatedPlatform.h"
 #include "system/JsonLogFacility.h"
-#include "system/PropertyListCodec.h"
+#include "system/property_list/PropertyListCodec.h"
 #include "tests/contract/DeviceUnderTest.h"
 #include "tests/contract/TemporaryMachineDirectory.h"
 

@@ -5,10 +5,10 @@
 #include <stdexcept>
 
 #include "simulation/SimulatedPlatform.h"
-#include "system/PropertyListCodec.h"
 #include "system/RootedFileSystem.h"
 #include "system/SystemNotifications.h"
 #include "system/SystemWorkQueues.h"
+#include "system/property_list/PropertyListCodec.h"
 #include "tests/contract/SystemUnderTest.h"
 #include "tests/contract/TemporaryMachineDirectory.h"
 

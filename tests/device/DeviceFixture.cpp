@@ -9,10 +9,10 @@
 #include <iterator>
 #include <stdexcept>
 
-#include "device/Containers.h"
-#include "device/Database.h"
-#include "device/DevicePaths.h"
-#include "tests/device/PackageZip.h"
+#include "device/database/Database.h"
+#include "device/install/Containers.h"
+#include "device/values/DevicePaths.h"
+#include "tests/device/package/PackageZip.h"
 
 namespace appsync {
 

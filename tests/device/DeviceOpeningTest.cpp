@@ -4,7 +4,7 @@
 #include <filesystem>
 #include <fstream>
 
-#include "device/Database.h"
+#include "device/database/Database.h"
 #include "tests/device/DeviceFixture.h"
 
 namespace appsync {

@@ -4,9 +4,9 @@
 #include <fstream>
 #include <utility>
 
-#include "device/PackageWriter.h"
-#include "host/CommandLine.h"
-#include "system/PropertyListCodec.h"
+#include "device/package/PackageWriter.h"
+#include "host/command/CommandLine.h"
+#include "system/property_list/PropertyListCodec.h"
 
 namespace appsync {
 namespace {

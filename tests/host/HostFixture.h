@@ -9,7 +9,7 @@
 #include <vector>
 
 #include "device/Device.h"
-#include "host/Console.h"
+#include "host/console/Console.h"
 #include "tests/contract/TemporaryMachineDirectory.h"
 
 namespace appsync {

@@ -6,7 +6,7 @@
 #include <string>
 #include <vector>
 
-#include "simulation/KnownCalls.h"
+#include "simulation/recording/KnownCalls.h"
 #include "tests/reliability/Invariants.h"
 #include "tests/reliability/World.h"
 

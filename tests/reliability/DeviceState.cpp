@@ -1,7 +1,7 @@
 #include "tests/reliability/DeviceState.h"
 
 #include "client/Paths.h"
-#include "simulation/RecordedCall.h"
+#include "simulation/recording/RecordedCall.h"
 
 namespace appsync {
 namespace {

@@ -6,12 +6,12 @@
 
 #include "client/Paths.h"
 #include "client/TodoList.h"
-#include "device/CoordinationTables.h"
-#include "device/DeviceRecords.h"
-#include "host/Library.h"
-#include "host/StagingArea.h"
-#include "host/StandingInstalls.h"
-#include "host/SyncPlan.h"
+#include "device/database/CoordinationTables.h"
+#include "device/values/DeviceRecords.h"
+#include "host/plan/Library.h"
+#include "host/plan/StagingArea.h"
+#include "host/plan/StandingInstalls.h"
+#include "host/plan/SyncPlan.h"
 #include "platform/InstallProgressRecord.h"
 
 namespace appsync {

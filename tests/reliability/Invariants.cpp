@@ -7,7 +7,7 @@
 
 #include "client/Paths.h"
 #include "client/TodoList.h"
-#include "simulation/KnownCalls.h"
+#include "simulation/recording/KnownCalls.h"
 #include "tests/client/AppsClientTestAccess.h"
 
 namespace appsync {

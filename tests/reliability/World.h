@@ -8,7 +8,7 @@
 #include "simulation/DeviceImage.h"
 #include "simulation/FaultPlan.h"
 #include "simulation/SimulatedPlatform.h"
-#include "system/PropertyListCodec.h"
+#include "system/property_list/PropertyListCodec.h"
 
 namespace appsync {
 

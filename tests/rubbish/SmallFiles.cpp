@@ -7,12 +7,12 @@
 #include <string>
 #include <string_view>
 
-#include "device/ArchiveWriter.h"
-#include "device/IconCanvas.h"
-#include "device/PackageFolder.h"
-#include "device/PackageWriter.h"
+#include "device/package/ArchiveWriter.h"
+#include "device/package/PackageFolder.h"
+#include "device/package/PackageWriter.h"
+#include "device/screen/IconCanvas.h"
 #include "fuzz/readers/ScratchDirectory.h"
-#include "system/PropertyListCodec.h"
+#include "system/property_list/PropertyListCodec.h"
 
 namespace appsync {
 

@@ -8,7 +8,7 @@
 #include <string>
 
 #include "simulation/SimulatedPlatform.h"
-#include "system/PropertyListCodec.h"
+#include "system/property_list/PropertyListCodec.h"
 
 namespace appsync {
 

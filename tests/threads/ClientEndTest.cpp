@@ -13,11 +13,11 @@
 #include "client/Paths.h"
 #include "client/TodoList.h"
 #include "device/Device.h"
-#include "device/PackageWriter.h"
+#include "device/package/PackageWriter.h"
 #include "platform/LogFacility.h"
 #include "platform/Notifications.h"
 #include "platform/SyncHost.h"
-#include "system/PropertyListCodec.h"
+#include "system/property_list/PropertyListCodec.h"
 #include "tests/contract/TemporaryMachineDirectory.h"
 
 namespace appsync {

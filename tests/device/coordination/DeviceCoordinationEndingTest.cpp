@@ -2,9 +2,9 @@
 #include <future>
 #include <thread>
 
-#include "device/DevicePaths.h"
+#include "device/values/DevicePaths.h"
 #include "platform/FileURL.h"
-#include "tests/device/DeviceCoordinationFixture.h"
+#include "tests/device/coordination/DeviceCoordinationFixture.h"
 
 namespace appsync {
 namespace {

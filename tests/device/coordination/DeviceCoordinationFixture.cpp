@@ -1,10 +1,10 @@
-#include "tests/device/DeviceCoordinationFixture.h"
+#include "tests/device/coordination/DeviceCoordinationFixture.h"
 
 #include <chrono>
 #include <filesystem>
 #include <thread>
 
-#include "device/DevicePaths.h"
+#include "device/values/DevicePaths.h"
 #include "platform/FileURL.h"
 
 namespace appsync {

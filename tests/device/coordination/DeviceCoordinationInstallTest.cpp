@@ -4,12 +4,12 @@
 #include <random>
 #include <thread>
 
-#include "device/DevicePaths.h"
+#include "device/values/DevicePaths.h"
 #include "platform/FileSystem.h"
 #include "platform/FileURL.h"
 #include "platform/PropertyListSerialization.h"
-#include "tests/device/DeviceCoordinationFixture.h"
-#include "tests/device/PackageZip.h"
+#include "tests/device/coordination/DeviceCoordinationFixture.h"
+#include "tests/device/package/PackageZip.h"
 
 namespace appsync {
 namespace {

@@ -5,8 +5,8 @@
 #include <algorithm>
 #include <functional>
 
-#include "device/DevicePaths.h"
-#include "tests/device/DeviceCoordinationFixture.h"
+#include "device/values/DevicePaths.h"
+#include "tests/device/coordination/DeviceCoordinationFixture.h"
 
 namespace appsync {
 namespace {

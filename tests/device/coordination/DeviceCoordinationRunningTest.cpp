@@ -1,4 +1,4 @@
-#include "tests/device/DeviceCoordinationFixture.h"
+#include "tests/device/coordination/DeviceCoordinationFixture.h"
 
 namespace appsync {
 namespace {

@@ -1,4 +1,4 @@
-#include "device/DeviceDatabase.h"
+#include "device/database/DeviceDatabase.h"
 
 #include <signal.h>
 #include <sys/wait.h>
@@ -8,8 +8,8 @@
 #include <filesystem>
 #include <thread>
 
-#include "device/Database.h"
-#include "device/DevicePaths.h"
+#include "device/database/Database.h"
+#include "device/values/DevicePaths.h"
 #include "tests/device/DeviceFixture.h"
 
 namespace appsync {

@@ -3,15 +3,15 @@
 #include <latch>
 #include <thread>
 
-#include "device/ApplicationInstall.h"
-#include "device/Containers.h"
-#include "device/DeviceDatabase.h"
-#include "device/DevicePaths.h"
-#include "device/DurabilityBarrier.h"
-#include "device/InstallContext.h"
-#include "device/ProgressBook.h"
-#include "system/PropertyListCodec.h"
+#include "device/database/DeviceDatabase.h"
+#include "device/install/ApplicationInstall.h"
+#include "device/install/Containers.h"
+#include "device/install/DurabilityBarrier.h"
+#include "device/install/InstallContext.h"
+#include "device/install/ProgressBook.h"
+#include "device/values/DevicePaths.h"
 #include "system/RootedFileSystem.h"
+#include "system/property_list/PropertyListCodec.h"
 #include "tests/device/DeviceFixture.h"
 
 namespace appsync {

@@ -5,9 +5,9 @@
 #include <filesystem>
 #include <thread>
 
-#include "device/PackageError.h"
+#include "device/package/PackageError.h"
 #include "tests/device/DeviceFixture.h"
-#include "tests/device/PackageZip.h"
+#include "tests/device/package/PackageZip.h"
 
 namespace appsync {
 namespace {

@@ -4,9 +4,8 @@
 #include <filesystem>
 #include <fstream>
 
-#include "device/Containers.h"
-#include "device/DevicePaths.h"
-#include "device/PackageIdentifier.h"
+#include "device/values/DevicePaths.h"
+#include "device/values/PackageIdentifier.h"
 #include "tests/device/DevicePlatformFixture.h"
 
 namespace appsync {
@@ -31,8 +30,8 @@ class DeviceReconciliationTest : public DevicePlatformFixture {
 TEST_F(DeviceReconciliationTest, aContainerThatNoRecordNamesIsRemoved) {
     ASSERT_TRUE(succeeded(install(kAtlas)));
     reopenAfter([&] {
-        fs::create_directories(rootPath(Containers::pathOf("HALF-UNPACKED/App.app/deep")));
-        write(Containers::pathOf("HALF-UNPACKED/App.app/part"), "bytes");
+        fs::create_directories(rootPath(containerPath("HALF-UNPACKED/App.app/deep")));
+        write(containerPath("HALF-UNPACKED/App.app/part"), "bytes");
     });
     EXPECT_EQ(containers().size(), 1U);
     EXPECT_EQ(read(application(kAtlas)->bundlePath + "/main"), "program 1.0");
@@ -41,7 +40,7 @@ TEST_F(DeviceReconciliationTest, aContainerThatNoRecordNamesIsRemoved) {
 
 TEST_F(DeviceReconciliationTest, aLookRemovesNothing) {
     endSession();
-    fs::create_directory(rootPath(Containers::pathOf("STRAY")));
+    fs::create_directory(rootPath(containerPath("STRAY")));
     static_cast<void>(look());
     EXPECT_EQ(containers().size(), 1U);
 }
@@ -105,7 +104,7 @@ TEST_F(DeviceReconciliationTest, theOldContainerOfAnInterruptedUpdateIsRemoved) 
     ASSERT_TRUE(succeeded(install(kAtlas, "2.0")));
     const std::string current = application(kAtlas)->bundleContainerPath;
     reopenAfter([&] {
-        fs::copy(rootPath(current), rootPath(Containers::pathOf("OLD-VERSION")),
+        fs::copy(rootPath(current), rootPath(containerPath("OLD-VERSION")),
                  fs::copy_options::recursive);
     });
     EXPECT_EQ(application(kAtlas)->bundleContainerPath, current);

@@ -1,6 +1,6 @@
 #include <filesystem>
 
-#include "device/DevicePaths.h"
+#include "device/values/DevicePaths.h"
 #include "tests/device/DeviceFixture.h"
 
 namespace appsync {

@@ -1,13 +1,13 @@
-#include "device/RestoreData.h"
+#include "device/install/RestoreData.h"
 
 #include <gmock/gmock.h>
 
 #include <filesystem>
 
-#include "device/DevicePaths.h"
+#include "device/values/DevicePaths.h"
 #include "platform/FileSystem.h"
 #include "tests/device/DeviceFixture.h"
-#include "tests/device/PackageZip.h"
+#include "tests/device/package/PackageZip.h"
 
 namespace appsync {
 

@@ -1,4 +1,4 @@
-#include "device/DataArchive.h"
+#include "device/package/DataArchive.h"
 
 #include <fcntl.h>
 #include <gmock/gmock.h>
@@ -9,10 +9,10 @@
 #include <fstream>
 #include <iterator>
 
-#include "device/PackageError.h"
+#include "device/package/PackageError.h"
 #include "system/RootDirectory.h"
 #include "tests/contract/TemporaryMachineDirectory.h"
-#include "tests/device/PackageZip.h"
+#include "tests/device/package/PackageZip.h"
 
 namespace appsync {
 

@@ -1,4 +1,4 @@
-#include "tests/device/PackageFixture.h"
+#include "tests/device/package/PackageFixture.h"
 
 #include <fcntl.h>
 #include <sys/stat.h>
@@ -9,7 +9,7 @@
 #include <fstream>
 #include <iterator>
 
-#include "system/PropertyListCodec.h"
+#include "system/property_list/PropertyListCodec.h"
 
 namespace appsync {
 

@@ -7,11 +7,11 @@
 #include <string_view>
 #include <vector>
 
-#include "device/PackageError.h"
-#include "device/PackageReader.h"
+#include "device/package/PackageError.h"
+#include "device/package/PackageReader.h"
 #include "platform/PropertyListSerialization.h"
 #include "system/UniqueFd.h"
-#include "tests/device/PackageZip.h"
+#include "tests/device/package/PackageZip.h"
 
 namespace appsync {
 

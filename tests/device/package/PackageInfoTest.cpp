@@ -1,7 +1,7 @@
 #include <fcntl.h>
 #include <gtest/gtest.h>
 
-#include "tests/device/PackageFixture.h"
+#include "tests/device/package/PackageFixture.h"
 
 namespace appsync {
 

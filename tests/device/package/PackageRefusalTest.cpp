@@ -4,7 +4,7 @@
 #include <filesystem>
 #include <limits>
 
-#include "tests/device/PackageFixture.h"
+#include "tests/device/package/PackageFixture.h"
 
 namespace appsync {
 

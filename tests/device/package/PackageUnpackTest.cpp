@@ -9,7 +9,7 @@
 #include <filesystem>
 
 #include "platform/Error.h"
-#include "tests/device/PackageFixture.h"
+#include "tests/device/package/PackageFixture.h"
 
 namespace appsync {
 

@@ -1,11 +1,11 @@
-#include "device/PackageWriter.h"
+#include "device/package/PackageWriter.h"
 
 #include <gtest/gtest.h>
 #include <sys/stat.h>
 
 #include <filesystem>
 
-#include "tests/device/PackageFixture.h"
+#include "tests/device/package/PackageFixture.h"
 
 namespace appsync {
 

@@ -1,4 +1,4 @@
-#include "tests/device/PackageZip.h"
+#include "tests/device/package/PackageZip.h"
 
 #include <cstddef>
 

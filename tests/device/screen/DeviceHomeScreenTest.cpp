@@ -2,8 +2,8 @@
 
 #include <chrono>
 
-#include "device/Database.h"
-#include "device/DevicePaths.h"
+#include "device/database/Database.h"
+#include "device/values/DevicePaths.h"
 #include "platform/PropertyListSerialization.h"
 #include "tests/device/DevicePlatformFixture.h"
 

@@ -1,10 +1,10 @@
-#include "device/HomeScreenPicture.h"
+#include "device/screen/HomeScreenPicture.h"
 
 #include <gtest/gtest.h>
 
 #include <limits>
 
-#include "tests/device/IconPng.h"
+#include "tests/device/screen/IconPng.h"
 
 namespace appsync {
 

@@ -1,9 +1,9 @@
-#include "device/IconDrawing.h"
+#include "device/screen/IconDrawing.h"
 
 #include <gtest/gtest.h>
 #include <sys/resource.h>
 
-#include "tests/device/IconPng.h"
+#include "tests/device/screen/IconPng.h"
 
 namespace appsync {
 

@@ -1,4 +1,4 @@
-#include "tests/device/IconPng.h"
+#include "tests/device/screen/IconPng.h"
 
 #include <cairo.h>
 #include <gtest/gtest.h>

@@ -4,7 +4,7 @@
 #include <string>
 #include <string_view>
 
-#include "device/IconCanvas.h"
+#include "device/screen/IconCanvas.h"
 #include "platform/Bytes.h"
 
 namespace appsync {

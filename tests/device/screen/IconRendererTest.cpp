@@ -3,11 +3,11 @@
 
 #include <filesystem>
 
-#include "device/CairoIconRenderer.h"
-#include "device/IconDrawing.h"
+#include "device/screen/CairoIconRenderer.h"
+#include "device/screen/IconDrawing.h"
 #include "system/RootDirectory.h"
-#include "tests/device/IconPng.h"
-#include "tests/device/PackageFixture.h"
+#include "tests/device/package/PackageFixture.h"
+#include "tests/device/screen/IconPng.h"
 
 namespace appsync {
 

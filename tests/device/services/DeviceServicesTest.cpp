@@ -1,4 +1,4 @@
-#include "device/DeviceServices.h"
+#include "device/services/DeviceServices.h"
 
 #include <array>
 

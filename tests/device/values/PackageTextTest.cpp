@@ -1,10 +1,10 @@
-#include "device/PackageText.h"
+#include "device/values/PackageText.h"
 
 #include <gtest/gtest.h>
 
 #include <string>
 
-#include "device/PackageError.h"
+#include "device/package/PackageError.h"
 
 namespace appsync {
 

@@ -1,4 +1,4 @@
-#include "host/Backup.h"
+#include "host/backup/Backup.h"
 
 #include <sys/stat.h>
 
@@ -6,8 +6,8 @@
 #include <fstream>
 #include <iterator>
 
-#include "device/ArchiveWriter.h"
-#include "device/PackageFolder.h"
+#include "device/package/ArchiveWriter.h"
+#include "device/package/PackageFolder.h"
 #include "tests/host/HostFixture.h"
 
 namespace appsync {

@@ -7,7 +7,7 @@
 
 #include "client/Paths.h"
 #include "device/Device.h"
-#include "host/PlugIn.h"
+#include "host/session/PlugIn.h"
 #include "platform/FileSystem.h"
 #include "platform/PropertyListSerialization.h"
 #include "platform/SyncClient.h"

@@ -1,11 +1,11 @@
-#include "host/CommandLine.h"
+#include "host/command/CommandLine.h"
 
 #include <gmock/gmock.h>
 #include <gtest/gtest.h>
 
 #include <sstream>
 
-#include "host/Console.h"
+#include "host/console/Console.h"
 
 namespace appsync {
 namespace {

@@ -1,9 +1,9 @@
 #include <filesystem>
 #include <fstream>
 
-#include "host/CommandLine.h"
-#include "host/Console.h"
-#include "host/Session.h"
+#include "host/command/CommandLine.h"
+#include "host/console/Console.h"
+#include "host/session/Session.h"
 #include "platform/AppRegistry.h"
 #include "tests/host/HostFixture.h"
 

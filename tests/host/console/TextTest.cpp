@@ -1,8 +1,8 @@
-#include "host/Text.h"
+#include "host/console/Text.h"
 
 #include <gtest/gtest.h>
 
-#include "host/Table.h"
+#include "host/console/Table.h"
 
 namespace appsync {
 namespace {

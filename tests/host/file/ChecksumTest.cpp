@@ -1,4 +1,4 @@
-#include "host/Checksum.h"
+#include "host/file/Checksum.h"
 
 #include <sys/stat.h>
 

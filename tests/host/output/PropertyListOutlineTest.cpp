@@ -1,10 +1,10 @@
-#include "host/PropertyListOutline.h"
+#include "host/output/PropertyListOutline.h"
 
 #include <gtest/gtest.h>
 
 #include <limits>
 
-#include "host/JsonRecords.h"
+#include "host/output/JsonRecords.h"
 
 namespace appsync {
 namespace {

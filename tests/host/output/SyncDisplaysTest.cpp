@@ -1,12 +1,12 @@
-#include "host/SyncDisplays.h"
+#include "host/output/SyncDisplays.h"
 
 #include <gmock/gmock.h>
 #include <gtest/gtest.h>
 
 #include <sstream>
 
-#include "host/Console.h"
-#include "host/Text.h"
+#include "host/console/Console.h"
+#include "host/console/Text.h"
 
 namespace appsync {
 namespace {

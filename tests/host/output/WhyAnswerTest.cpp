@@ -1,9 +1,9 @@
-#include "host/WhyAnswer.h"
+#include "host/output/WhyAnswer.h"
 
 #include <gmock/gmock.h>
 #include <gtest/gtest.h>
 
-#include "device/DeviceRecords.h"
+#include "device/values/DeviceRecords.h"
 #include "platform/InstallProgressRecord.h"
 
 namespace appsync {

@@ -1,10 +1,10 @@
-#include "host/InterruptedStaging.h"
+#include "host/plan/InterruptedStaging.h"
 
 #include <filesystem>
 
 #include "client/Paths.h"
-#include "host/StagingArea.h"
-#include "host/SyncPlan.h"
+#include "host/plan/StagingArea.h"
+#include "host/plan/SyncPlan.h"
 #include "platform/FileSystem.h"
 #include "platform/PropertyListSerialization.h"
 #include "tests/host/HostFixture.h"

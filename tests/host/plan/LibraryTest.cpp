@@ -1,4 +1,4 @@
-#include "host/Library.h"
+#include "host/plan/Library.h"
 
 #include <gmock/gmock.h>
 #include <gtest/gtest.h>

@@ -1,11 +1,11 @@
-#include "host/StandingInstalls.h"
+#include "host/plan/StandingInstalls.h"
 
 #include <gmock/gmock.h>
 #include <gtest/gtest.h>
 
-#include "device/DeviceRecords.h"
-#include "host/StagingArea.h"
-#include "host/SyncPlan.h"
+#include "device/values/DeviceRecords.h"
+#include "host/plan/StagingArea.h"
+#include "host/plan/SyncPlan.h"
 #include "platform/InstallProgressRecord.h"
 #include "platform/PropertyList.h"
 

@@ -1,12 +1,12 @@
-#include "host/SyncPlan.h"
+#include "host/plan/SyncPlan.h"
 
 #include <gmock/gmock.h>
 #include <gtest/gtest.h>
 
 #include <set>
 
-#include "device/DeviceRecords.h"
-#include "host/Library.h"
+#include "device/values/DeviceRecords.h"
+#include "host/plan/Library.h"
 #include "platform/InstallProgressRecord.h"
 #include "platform/PropertyList.h"
 

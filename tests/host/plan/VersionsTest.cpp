@@ -1,4 +1,4 @@
-#include "host/Versions.h"
+#include "host/plan/Versions.h"
 
 #include <gtest/gtest.h>
 

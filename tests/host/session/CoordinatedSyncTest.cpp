@@ -4,8 +4,8 @@
 #include <sstream>
 #include <thread>
 
-#include "device/Database.h"
-#include "host/WatchedCoordination.h"
+#include "device/database/Database.h"
+#include "host/session/WatchedCoordination.h"
 #include "tests/host/HostFixture.h"
 
 namespace appsync {

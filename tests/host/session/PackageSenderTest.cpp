@@ -1,4 +1,4 @@
-#include "host/PackageSender.h"
+#include "host/session/PackageSender.h"
 
 #include <array>
 #include <filesystem>
@@ -7,7 +7,8 @@
 #include <system_error>
 #include <utility>
 
-#include "host/SyncDaemon.h"
+#include "host/plan/TransferError.h"
+#include "host/session/SyncDaemon.h"
 #include "platform/FileSystem.h"
 #include "tests/host/HostFixture.h"
 

@@ -1,4 +1,4 @@
-#include "host/StopSignals.h"
+#include "host/session/StopSignals.h"
 
 #include <gtest/gtest.h>
 #include <signal.h>

@@ -1,9 +1,10 @@
-#include "host/SyncDaemon.h"
+#include "host/session/SyncDaemon.h"
 
 #include <gtest/gtest.h>
 
 #include <cerrno>
 
+#include "host/plan/TransferError.h"
 #include "platform/Error.h"
 
 namespace appsync {

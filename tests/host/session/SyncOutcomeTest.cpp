@@ -1,10 +1,10 @@
-#include "host/SyncOutcome.h"
+#include "host/session/SyncOutcome.h"
 
 #include <gmock/gmock.h>
 #include <gtest/gtest.h>
 
-#include "host/SessionFacts.h"
-#include "host/SyncPlan.h"
+#include "host/plan/SyncPlan.h"
+#include "host/session/SessionFacts.h"
 
 namespace appsync {
 namespace {

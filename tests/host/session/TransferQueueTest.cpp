@@ -1,4 +1,4 @@
-#include "host/TransferQueue.h"
+#include "host/session/TransferQueue.h"
 
 #include <gmock/gmock.h>
 #include <gtest/gtest.h>

@@ -1,4 +1,4 @@
-#include "simulation/Scheduler.h"
+#include "simulation/scheduling/Scheduler.h"
 
 #include <gmock/gmock.h>
 #include <gtest/gtest.h>

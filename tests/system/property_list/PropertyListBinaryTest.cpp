@@ -2,7 +2,7 @@
 
 #include <algorithm>
 
-#include "tests/system/PropertyListSamples.h"
+#include "tests/system/property_list/PropertyListSamples.h"
 
 namespace appsync {
 namespace {

@@ -2,8 +2,8 @@
 
 #include <cmath>
 
-#include "system/PropertyListXmlReader.h"
-#include "tests/system/PropertyListSamples.h"
+#include "system/property_list/PropertyListXmlReader.h"
+#include "tests/system/property_list/PropertyListSamples.h"
 
 namespace appsync {
 namespace {

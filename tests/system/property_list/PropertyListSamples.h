@@ -8,7 +8,7 @@
 #include <utility>
 #include <vector>
 
-#include "system/PropertyListCodec.h"
+#include "system/property_list/PropertyListCodec.h"
 
 namespace appsync {
 

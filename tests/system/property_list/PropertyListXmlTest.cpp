@@ -1,8 +1,8 @@
 #include <gtest/gtest.h>
 
-#include "system/PropertyListPlainXmlReader.h"
-#include "system/PropertyListXmlReader.h"
-#include "tests/system/PropertyListSamples.h"
+#include "system/property_list/PropertyListPlainXmlReader.h"
+#include "system/property_list/PropertyListXmlReader.h"
+#include "tests/system/property_list/PropertyListSamples.h"
 
 namespace appsync {
 namespace {
