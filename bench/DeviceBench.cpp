@@ -20,7 +20,6 @@
 #include "client/Paths.h"
 #include "device/Device.h"
 #include "device/database/Database.h"
-#include "device/install/Containers.h"
 #include "device/package/PackageWriter.h"
 #include "device/values/DevicePaths.h"
 #include "platform/AppRegistry.h"
@@ -97,7 +96,7 @@ class Bench {
         require(database->execute("BEGIN"));
         for (int number = 0; number < count; ++number) {
             const std::string container = "FILLED-" + std::to_string(number);
-            fs::create_directory(root(Containers::pathOf(container)));
+            fs::create_directory(root(containerPath(container)));
             const std::string identifier = "com.example.filled" + std::to_string(number * 7919);
             require(database
                         ->query("INSERT INTO applications VALUES (?, '1.0', ?, 'User', 4, ?,"
