@@ -15,6 +15,7 @@
 #include <CLI/CLI.hpp>
 
 #include "host/command/Commands.h"
+#include "host/command/IdentifierArgument.h"
 #include "host/console/Console.h"
 #include "host/console/Problem.h"
 
@@ -33,7 +34,7 @@ CLI::Validator oneOf(const std::vector<std::string>& words) {
     for (const std::string& word : words) listed += (listed.empty() ? "" : ", ") + word;
     return {[words, listed](const std::string& given) {
                 const bool isKnown = std::find(words.begin(), words.end(), given) != words.end();
-                return isKnown ? std::string() : given + " is none of " + listed;
+                return isKnown ? std::string() : shownArgument(given) + " is none of " + listed;
             },
             ""};
 }
@@ -63,12 +64,17 @@ class Commands {
         addRestore();
         addPackage();
         addPropertyList();
+        app_.add_subcommand("help", "Show the help of a command (= COMMAND --help)");
     }
 
     int run(std::vector<std::string> arguments) {
+        if (!arguments.empty() && arguments.front() == "help") {
+            arguments.erase(arguments.begin());
+            arguments.emplace_back("--help");
+        }
         if (!arguments.empty() && isUnknownCommand(arguments.front())) {
-            return console_.fail(
-                wrongUsage("there is no command " + arguments.front(), "see appsync --help"));
+            return console_.fail(wrongUsage(
+                "there is no command " + shownArgument(arguments.front()), "see appsync --help"));
         }
         std::reverse(arguments.begin(), arguments.end());  // as CLI11 wants them
         try {
@@ -77,8 +83,7 @@ class Commands {
             app_.exit(help, console_.out, console_.err);
             return kExitDone;
         } catch (const CLI::ParseError& error) {
-            console_.complain(std::string(error.what()) + ": see appsync --help");
-            return kExitWrongUsage;
+            return console_.fail(wrongUsage(whatIsWrong(error), "see " + chosen() + " --help"));
         }
         return action_ ? action_() : kExitWrongUsage;
     }
@@ -88,6 +93,29 @@ class Commands {
         const auto known = app_.get_subcommands(
             [&name](const CLI::App* command) { return command->get_name() == name; });
         return !name.starts_with('-') && known.empty();
+    }
+
+    // The command that the arguments name, as it is typed: "appsync package make".
+    [[nodiscard]] std::string chosen() const {
+        std::string typed = app_.get_name();
+        const CLI::App* command = &app_;
+        while (!command->get_subcommands().empty()) {
+            command = command->get_subcommands().front();
+            typed += " " + command->get_name();
+        }
+        return typed;
+    }
+
+    // What nobody knows is told before what is missing, which it may have been meant to be.
+    [[nodiscard]] std::string whatIsWrong(const CLI::ParseError& error) const {
+        const std::vector<std::string> unknown = app_.remaining(true);
+        for (const std::string& word : unknown) {
+            if (word.starts_with('-')) return word + " is not an option of " + chosen();
+        }
+        if (!unknown.empty()) {
+            return shownArgument(unknown.front()) + " is one argument too many for " + chosen();
+        }
+        return error.what();
     }
 
     // A command whose options are parsed into one `Values`.
@@ -118,7 +146,8 @@ class Commands {
         added.add_option("--remove", values.plan.remove, "remove this application")
             ->type_name("ID")
             ->expected(1)
-            ->take_all();
+            ->take_all()
+            ->allow_extra_args(false);  // what follows the identifier is DEVICE or LIBRARY
         added.add_flag("--mirror", values.plan.mirror,
                        "remove every user application that LIBRARY lacks");
         added.add_flag("--staged", values.isStaged,

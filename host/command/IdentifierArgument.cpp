@@ -10,10 +10,10 @@ Status checkIdentifier(const std::string& identifier, std::string_view whatToDo,
     if (isLegalIdentifier(identifier)) return {};
     std::string given(option);
     if (!given.empty()) given += ' ';
-    return wrongUsage(given + shownIdentifier(identifier) + " is not an identifier", whatToDo);
+    return wrongUsage(given + shownArgument(identifier) + " is not an identifier", whatToDo);
 }
 
-std::string shownIdentifier(const std::string& identifier) {
+std::string shownArgument(const std::string& identifier) {
     return identifier.empty() ? "''" : identifier;
 }
 

@@ -17,6 +17,6 @@ inline constexpr std::string_view kUseLegalCharacters = "use letters, digits, '.
                                      std::string_view option = {});
 
 /// The identifier as messages name it: one that is empty can be seen, too.
-[[nodiscard]] std::string shownIdentifier(const std::string& identifier);
+[[nodiscard]] std::string shownArgument(const std::string& identifier);
 
 }  // namespace appsync

@@ -80,7 +80,7 @@ int runRestore(const RestoreArguments& arguments, const Console& console) {
     if (!result) return console.fail(classified(result.error()));
     const double seconds = std::chrono::duration<double>(Clock::now() - begin).count();
     for (const FailedRestore& each : result->failed) {
-        console.complain(shownIdentifier(each.identifier) + ": " + each.error);
+        console.complain(shownArgument(each.identifier) + ": " + each.error);
     }
     (arguments.asJson ? printJson : print)(arguments, *result, seconds, console);
     return result->failed.empty() ? kExitDone : kExitSomethingFailed;

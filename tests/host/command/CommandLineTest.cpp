@@ -68,7 +68,21 @@ INSTANTIATE_TEST_SUITE_P(
                    "--to: json is none of xml, binary"},
         WrongUsage{{"plist", "convert", "file", "--to", "0"}, "--to: 0 is none of xml, binary"},
         WrongUsage{{"log", "device", "--level", "2"}, "2 is none of debug, info, default"},
-        WrongUsage{{"demote", "device", "com.a", "--by", "me"}, "me is none of person, system"}));
+        WrongUsage{{"demote", "device", "com.a", "--by", "me"}, "me is none of person, system"},
+        WrongUsage{{"demote", "device", "com.a", "--by", ""}, "'' is none of person, system"},
+        WrongUsage{{"--verbose"}, "--verbose is not an option of appsync: see appsync --help"},
+        WrongUsage{{"apps", "--jsn"},
+                   "--jsn is not an option of appsync apps: see appsync apps --help"},
+        WrongUsage{{"apps", "device", "too", "many"},
+                   "too is one argument too many for appsync apps: see appsync apps --help"},
+        WrongUsage{{"apps"}, "DEVICE is required: see appsync apps --help"},
+        WrongUsage{{"package", "make", "folder"},
+                   "OUT is required: see appsync package make --help"},
+        WrongUsage{{""}, "there is no command ''"},
+        WrongUsage{{"help", "dance"}, "there is no command dance"},
+        // One identifier for each --remove: what follows is an argument of the command.
+        WrongUsage{{"sync", "device", "library", "--remove", "com.a", "com.b"},
+                   "com.b is one argument too many for appsync sync"}));
 
 class EachCommand : public CommandLine, public testing::WithParamInterface<std::string> {};
 
@@ -88,6 +102,20 @@ INSTANTIATE_TEST_SUITE_P(Help, EachCommand,
                                          "log", "history", "coordinator", "demote", "backup",
                                          "restore", "store", "send", "package", "package make",
                                          "package show", "plist", "plist show", "plist convert"));
+
+TEST_F(CommandLine, HelpShowsTheHelpOfACommand) {
+    EXPECT_EQ(run({"help", "package", "make"}), 0);
+    const std::string shown = out.str();
+    out.str("");
+    EXPECT_EQ(run({"package", "make", "--help"}), 0);
+    EXPECT_EQ(shown, out.str());
+    EXPECT_THAT(shown, HasSubstr("OUT"));
+}
+
+TEST_F(CommandLine, WhatFollowsTheIdentifierToRemoveIsTheDeviceAndTheLibrary) {
+    EXPECT_EQ(run({"plan", "--remove", "com.a", "/nonexistent/device", "library"}), 3);
+    EXPECT_THAT(err.str(), HasSubstr("/nonexistent/device"));
+}
 
 TEST_F(CommandLine, ADeviceThatIsMissingIsStatus3) {
     EXPECT_EQ(run({"apps", "/nonexistent/device"}), 3);
