@@ -18,7 +18,7 @@ struct Console;
 // What each command does, once its arguments are understood. Each gives the exit status (see
 // host/console/Problem.h); errors have then been told on the console.
 
-// host/command/SyncCommand.cpp
+// SyncCommand.cpp
 
 struct SyncArguments {
     std::string device;
@@ -30,7 +30,7 @@ struct SyncArguments {
 };
 [[nodiscard]] int runSync(const SyncArguments& arguments, const Console& console);
 
-// host/command/SendCommand.cpp
+// SendCommand.cpp
 
 struct SendArguments {
     std::string device;
@@ -43,7 +43,8 @@ struct SendArguments {
 };
 [[nodiscard]] int runSend(const SendArguments& arguments, const Console& console);
 
-// host/command/DeviceCommands.cpp: what changes a device outside a sync.
+// What changes a device outside a sync: CreateCommand.cpp, SetCommand.cpp, RunCommand.cpp (and
+// quit), UninstallCommand.cpp, DemoteCommand.cpp, ResetCommand.cpp
 
 [[nodiscard]] int runCreate(const std::string& device, bool coordination, const Console& console);
 [[nodiscard]] int runSet(const std::string& device, const std::vector<std::string>& assignments,
@@ -58,7 +59,8 @@ struct SendArguments {
                             const Console& console);
 [[nodiscard]] int runReset(const std::string& device, const Console& console);
 
-// host/command/LookCommands.cpp: what shows a device.
+// What shows a device: AppsCommand.cpp, WhyCommand.cpp, InventoryCommand.cpp, HistoryCommand.cpp,
+// ScreenCommand.cpp
 
 [[nodiscard]] int runApps(const std::string& device, bool asJson, const Console& console);
 [[nodiscard]] int runWhy(const std::string& device, const std::string& identifier, bool asJson,
@@ -68,7 +70,7 @@ struct SendArguments {
 [[nodiscard]] int runScreen(const std::string& device, const std::string& picture,
                             const Console& console);
 
-// host/command/LogCommand.cpp
+// LogCommand.cpp
 
 struct LogArguments {
     std::string device;
@@ -80,7 +82,7 @@ struct LogArguments {
 };
 [[nodiscard]] int runLog(const LogArguments& arguments, const Console& console);
 
-// host/command/CoordinationCommands.cpp
+// CoordinatorCommand.cpp
 
 struct CoordinatorArguments {
     std::string device;
@@ -92,12 +94,12 @@ struct CoordinatorArguments {
 };
 [[nodiscard]] int runCoordinator(const CoordinatorArguments& arguments, const Console& console);
 
-// host/command/StoreCommand.cpp
+// StoreCommand.cpp
 
 [[nodiscard]] int runStore(const std::string& device, const std::string& folder, bool asJson,
                            const Console& console);
 
-// host/command/BackupCommand.cpp
+// BackupCommand.cpp
 
 struct BackupArguments {
     std::string device;
@@ -107,7 +109,7 @@ struct BackupArguments {
 [[nodiscard]] int runBackup(const BackupArguments& arguments, const Console& console);
 [[nodiscard]] int runBackupCheck(const std::string& backup, bool asJson, const Console& console);
 
-// host/command/RestoreCommand.cpp
+// RestoreCommand.cpp
 
 struct RestoreArguments {
     std::string device;
@@ -118,7 +120,7 @@ struct RestoreArguments {
 };
 [[nodiscard]] int runRestore(const RestoreArguments& arguments, const Console& console);
 
-// host/command/FileCommands.cpp: packages and property lists of this machine.
+// Files of this machine: PackageCommand.cpp, PropertyListCommand.cpp
 
 [[nodiscard]] int runPackageMake(const std::string& folder, const std::string& package, bool asJson,
                                  const Console& console);

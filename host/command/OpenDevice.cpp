@@ -1,6 +1,10 @@
 #include "host/command/OpenDevice.h"
 
+#include <ostream>
+
 #include "device/values/DeviceError.h"
+#include "host/command/IdentifierArgument.h"
+#include "host/console/Console.h"
 #include "host/console/Problem.h"
 
 namespace appsync {
@@ -18,6 +22,26 @@ Result<std::unique_ptr<Device>> openDevice(const std::string& path,
 
 ErrorRecord classified(const ErrorRecord& error) {
     return error.domain == kDeviceErrorDomain ? unusable(error) : error;
+}
+
+int lookAt(const std::string& path, const Console& console, const WorkOnDevice& look) {
+    const Result<std::unique_ptr<Device>> device = openDevice(path, DeviceAccess::Look);
+    if (!device) return console.fail(device.error());
+    const Status status = look(**device);
+    return status ? kExitDone : console.fail(classified(status.error()));
+}
+
+int actOn(const std::string& path, const std::string& identifier, const DeviceOpenOptions& options,
+          std::string_view done, const Console& console, const WorkOnDevice& action) {
+    const Status checked = checkIdentifier(identifier, kGiveAsShown);
+    if (!checked) return console.fail(checked.error());
+    const Result<std::unique_ptr<Device>> device = openDevice(path, options);
+    if (!device) return console.fail(device.error());
+    const Status status = action(**device);
+    if (const auto broken = (*device)->databaseFailure()) return console.fail(unusable(*broken));
+    if (!status) return console.fail(classified(status.error()));
+    console.out << identifier << " " << done << '\n';
+    return kExitDone;
 }
 
 }  // namespace appsync

@@ -1,12 +1,16 @@
 #pragma once
 
+#include <functional>
 #include <memory>
 #include <string>
+#include <string_view>
 
 #include "device/Device.h"
 #include "platform/Result.h"
 
 namespace appsync {
+
+struct Console;
 
 /// Opens a device for a command; the error has the exit status "unusable".
 [[nodiscard]] Result<std::unique_ptr<Device>> openDevice(const std::string& path,
@@ -19,5 +23,16 @@ namespace appsync {
 /// The error of an operation on a device: when it tells that the device itself cannot be used, one
 /// with that exit status; else as it is.
 [[nodiscard]] ErrorRecord classified(const ErrorRecord& error);
+
+/// What a command does with a device that is open.
+using WorkOnDevice = std::function<Status(Device& device)>;
+
+/// Opens a device for looking and hands it on. Gives the exit status.
+[[nodiscard]] int lookAt(const std::string& path, const Console& console, const WorkOnDevice& look);
+
+/// Does something to one application of a device and says that it is `done`. Gives the exit status.
+[[nodiscard]] int actOn(const std::string& path, const std::string& identifier,
+                        const DeviceOpenOptions& options, std::string_view done,
+                        const Console& console, const WorkOnDevice& action);
 
 }  // namespace appsync

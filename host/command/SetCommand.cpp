@@ -1,36 +1,16 @@
 #include <memory>
 #include <ostream>
 #include <string_view>
-#include <utility>
 
 #include "device/Device.h"
-#include "device/values/DeviceError.h"
 #include "host/command/Commands.h"
-#include "host/command/IdentifierArgument.h"
 #include "host/command/OpenDevice.h"
 #include "host/console/Console.h"
 #include "host/console/Problem.h"
 #include "host/console/Text.h"
-#include "host/session/PlugIn.h"
-#include "platform/SyncClient.h"
 
 namespace appsync {
 namespace {
-
-// Does something to one application of a device and says that it is done.
-template <typename Action>
-int actOn(const std::string& path, const std::string& identifier, const DeviceOpenOptions& options,
-          std::string_view done, const Console& console, Action action) {
-    const Status checked = checkIdentifier(identifier, kGiveAsShown);
-    if (!checked) return console.fail(checked.error());
-    const Result<std::unique_ptr<Device>> device = openDevice(path, options);
-    if (!device) return console.fail(device.error());
-    const Status status = action(**device);
-    if (const auto broken = (*device)->databaseFailure()) return console.fail(unusable(*broken));
-    if (!status) return console.fail(classified(status.error()));
-    console.out << identifier << " " << done << '\n';
-    return kExitDone;
-}
 
 Result<PolicyAnswer> parsePolicy(const std::string& name, std::string_view value) {
     if (value == "yes") return PolicyAnswer::Yes;
@@ -85,17 +65,6 @@ int tellWhatEnds(Device& device, const Console& console) {
 
 }  // namespace
 
-int runCreate(const std::string& device, bool coordination, const Console& console) {
-    if (device.empty()) {
-        return console.fail(wrongUsage("cannot create a device at ''",
-                                       "it is no path of a directory; give that of a new one"));
-    }
-    const Status created = Device::create(device, {coordination});
-    if (!created) return console.fail(unusable(created.error()));
-    console.out << printable(device) << " is an empty device\n";
-    return kExitDone;
-}
-
 int runSet(const std::string& device, const std::vector<std::string>& assignments,
            const Console& console) {
     const Result<DeviceSettingsChange> change = parseAssignments(assignments);
@@ -105,41 +74,6 @@ int runSet(const std::string& device, const std::vector<std::string>& assignment
     const Status changed = (*opened)->change(*change);
     if (!changed) return console.fail(classified(changed.error()));
     return change->coordination == false ? tellWhatEnds(**opened, console) : kExitDone;
-}
-
-int runRun(const std::string& device, const std::string& identifier, const Console& console) {
-    return actOn(device, identifier, {}, "runs", console,
-                 [&](Device& opened) { return opened.run(identifier); });
-}
-
-int runQuit(const std::string& device, const std::string& identifier, const Console& console) {
-    return actOn(device, identifier, {}, "does not run any more", console,
-                 [&](Device& opened) { return opened.quit(identifier); });
-}
-
-int runUninstall(const std::string& device, const std::string& identifier, const Console& console) {
-    return actOn(device, identifier, {.makesRoom = true}, "is uninstalled", console,
-                 [&](Device& opened) { return opened.uninstall(identifier); });
-}
-
-int runDemote(const std::string& device, const std::string& identifier, bool bySystem,
-              const Console& console) {
-    const DemotedBy by = bySystem ? DemotedBy::System : DemotedBy::Person;
-    const DeviceOpenOptions options{.access = DeviceAccess::Session, .makesRoom = true};
-    return actOn(device, identifier, options, "is offloaded", console,
-                 [&](Device& opened) { return opened.demote(identifier, by); });
-}
-
-int runReset(const std::string& device, const Console& console) {
-    const Result<std::unique_ptr<Device>> opened =
-        openDevice(device, {.access = DeviceAccess::Session, .makesRoom = true});
-    if (!opened) return console.fail(opened.error());
-    const Result<std::unique_ptr<PlugIn>> plugIn = PlugIn::load(**opened);
-    if (!plugIn) return console.fail(plugIn.error());
-    (*plugIn)->client().clearSyncData();
-    if (const auto error = (*opened)->databaseFailure()) return console.fail(unusable(*error));
-    console.out << printable(device) << " has forgotten what it kept for syncing\n";
-    return kExitDone;
 }
 
 }  // namespace appsync

@@ -10,6 +10,7 @@
 #include "host/console/Text.h"
 #include "host/output/PropertyListOutline.h"
 #include "host/output/WhyAnswer.h"
+#include "host/session/Inventory.h"
 #include "platform/PropertyList.h"
 
 namespace appsync {

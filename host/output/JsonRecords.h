@@ -1,28 +1,16 @@
 #pragma once
 
-#include <cstdint>
-#include <set>
 #include <string>
 #include <vector>
 
 #include "device/values/DeviceRecords.h"
-#include "platform/SyncAccountInfo.h"
 
 namespace appsync {
 
 class PropertyList;
+struct Inventory;
 struct PackageInfo;
 struct WhyAnswer;
-
-/// What the plug-in reports of the device.
-struct Inventory {
-    std::vector<std::string> deleted;
-    std::uint64_t count = 0;
-    std::uint64_t physicalSize = 0;
-    std::uint64_t purgeableSize = 0;
-    std::set<std::string> accountIDs;
-    std::set<SyncAccountInfo> accounts;
-};
 
 // One JSON text each, over several lines, without a line end. Bytes that are not UTF-8 become
 // U+FFFD.

@@ -1,0 +1,44 @@
+#include <ostream>
+
+#include "device/Device.h"
+#include "host/command/Commands.h"
+#include "host/command/OpenDevice.h"
+#include "host/console/Console.h"
+#include "host/console/Problem.h"
+#include "host/console/Table.h"
+#include "host/console/Text.h"
+#include "host/output/JsonRecords.h"
+
+namespace appsync {
+namespace {
+
+std::string stateText(const ApplicationRecord& record) {
+    if (!record.isPlaceholder) return "installed";
+    if (!record.progress) return "placeholder";
+    const auto percent = static_cast<unsigned>(record.progress->fraction() * 100);
+    return "placeholder, " + std::to_string(percent) + " %";
+}
+
+std::string applicationsTable(const std::vector<ApplicationRecord>& records, bool isForTerminal) {
+    Table table({"IDENTIFIER", "VERSION", "NAME", "STATE", "TYPE", "SIZE"});
+    for (const ApplicationRecord& record : records) {
+        table.add({record.identifier, record.version.value_or("-"), record.name.value_or("-"),
+                   stateText(record), record.type, formatBytes(record.bytes)});
+    }
+    if (isForTerminal) table.limit({40, 16, 24});  // a program gets all of it
+    return records.empty() ? "No applications.\n" : table.text();
+}
+
+}  // namespace
+
+int runApps(const std::string& device, bool asJson, const Console& console) {
+    return lookAt(device, console, [&](Device& opened) -> Status {
+        const Result<std::vector<ApplicationRecord>> records = opened.applications();
+        if (!records) return unusable(records.error());
+        console.out << (asJson ? jsonText(*records) + "\n"
+                               : applicationsTable(*records, console.isTerminal));
+        return {};
+    });
+}
+
+}  // namespace appsync

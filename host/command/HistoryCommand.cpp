@@ -1,0 +1,40 @@
+#include <ostream>
+
+#include "device/Device.h"
+#include "host/command/Commands.h"
+#include "host/command/OpenDevice.h"
+#include "host/console/Console.h"
+#include "host/console/Problem.h"
+#include "host/console/Table.h"
+#include "host/console/Text.h"
+#include "host/output/JsonRecords.h"
+
+namespace appsync {
+namespace {
+
+std::string whatText(const HistoryRecord& record) {
+    if (record.kind == HistoryRecord::Kind::Scenario) return record.scenario;
+    return "step " + std::to_string(record.step) + (record.phase == 1 ? " begins" : " ends");
+}
+
+std::string historyTable(const std::vector<HistoryRecord>& records) {
+    Table table({"TIME", "WHAT", "RESULT", "IDENTIFIER", "DESCRIPTION"});
+    for (const HistoryRecord& record : records) {
+        table.add({formatTime(record.time), whatText(record), record.success ? "ok" : "failed",
+                   record.identifier, record.description});
+    }
+    return records.empty() ? "No history.\n" : table.text();
+}
+
+}  // namespace
+
+int runHistory(const std::string& device, bool asJson, const Console& console) {
+    return lookAt(device, console, [&](Device& opened) -> Status {
+        const Result<std::vector<HistoryRecord>> records = opened.history();
+        if (!records) return unusable(records.error());
+        console.out << (asJson ? jsonText(*records) + "\n" : historyTable(*records));
+        return {};
+    });
+}
+
+}  // namespace appsync

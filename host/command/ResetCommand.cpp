@@ -1,0 +1,27 @@
+#include <memory>
+#include <ostream>
+
+#include "device/Device.h"
+#include "host/command/Commands.h"
+#include "host/command/OpenDevice.h"
+#include "host/console/Console.h"
+#include "host/console/Problem.h"
+#include "host/console/Text.h"
+#include "host/session/PlugIn.h"
+#include "platform/SyncClient.h"
+
+namespace appsync {
+
+int runReset(const std::string& device, const Console& console) {
+    const Result<std::unique_ptr<Device>> opened =
+        openDevice(device, {.access = DeviceAccess::Session, .makesRoom = true});
+    if (!opened) return console.fail(opened.error());
+    const Result<std::unique_ptr<PlugIn>> plugIn = PlugIn::load(**opened);
+    if (!plugIn) return console.fail(plugIn.error());
+    (*plugIn)->client().clearSyncData();
+    if (const auto error = (*opened)->databaseFailure()) return console.fail(unusable(*error));
+    console.out << printable(device) << " has forgotten what it kept for syncing\n";
+    return kExitDone;
+}
+
+}  // namespace appsync
