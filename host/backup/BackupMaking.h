@@ -1,0 +1,31 @@
+#pragma once
+
+#include <cstdint>
+#include <string>
+#include <vector>
+
+#include "host/backup/Backup.h"
+#include "platform/Result.h"
+
+namespace appsync {
+
+class BackupFolder;
+class Device;
+
+/// What came of a backup.
+struct BackupResult {
+    BackupManifest manifest;
+    std::vector<std::string> demoted;
+    std::vector<BackupFault> leftOut;  // by identifier
+    std::uint64_t bytes = 0;
+};
+
+/// Refuses a folder that lies in the device: a backup there would be part of what it backs up.
+[[nodiscard]] Status checkBackupPlace(const Device& device, const std::string& backup);
+
+/// Writes what a restore needs of a device into the folder, and finishes it. The device is open for
+/// a session, and the plug-in has prepared it. What of an application's data cannot be read is left
+/// out and named; an error when the backup as a whole does not become one.
+[[nodiscard]] Result<BackupResult> makeBackup(Device& device, BackupFolder& folder);
+
+}  // namespace appsync
