@@ -7,11 +7,8 @@
 #include <system_error>
 #include <utility>
 
-#include "client/Paths.h"
 #include "device/Device.h"
-#include "device/package/DataArchive.h"
 #include "device/package/PackageReader.h"
-#include "device/values/PackageIdentifier.h"
 #include "host/command/Commands.h"
 #include "host/command/IdentifierArgument.h"
 #include "host/command/OpenDevice.h"
@@ -25,13 +22,12 @@
 #include "host/plan/StagingArea.h"
 #include "host/plan/StandingInstalls.h"
 #include "host/session/Interruption.h"
+#include "host/session/Parcels.h"
 #include "host/session/PlugIn.h"
 #include "host/session/Session.h"
 #include "host/session/SessionFacts.h"
 #include "host/session/StopSignals.h"
 #include "host/session/SyncOutcome.h"
-#include "platform/FileSystem.h"
-#include "platform/PropertyListSerialization.h"
 
 namespace appsync {
 namespace {
@@ -46,28 +42,6 @@ Status checkArguments(const SendArguments& arguments) {
                           "only a restore comes in parts");
     }
     return {};
-}
-
-// The version under which the package of a restore waits for its data; nothing when none does, or
-// when a crash has taken the package, or what says that it was installed.
-std::optional<std::string> waitingVersion(Device& device, const std::string& identifier) {
-    const Result<Bytes> bytes = device.files().readFile(std::string(kRestoreStatePath));
-    if (!bytes) return std::nullopt;
-    const Result<PropertyList> state = device.propertyLists().parse(*bytes);
-    if (!state) return std::nullopt;
-    const PropertyList* versions = state->find(identifier);
-    if (versions == nullptr || versions->entries().empty()) return std::nullopt;
-    const PropertyList::Entry& last = versions->entries().back();
-    const std::string* path = last.value.findString("path");
-    if (path == nullptr || !device.files().itemExists(*path)) return std::nullopt;
-    return last.key;
-}
-
-bool beginsAsArchive(const std::string& file) {
-    Result<HostFile> opened = HostFile::open(file);
-    Bytes begin(2);
-    const Result<std::size_t> count = opened ? opened->read(begin) : Result<std::size_t>(0);
-    return count && *count == 2 && begin[0] == 'P' && begin[1] == 'K';
 }
 
 class Sending {
@@ -108,6 +82,9 @@ class Sending {
 
   private:
     [[nodiscard]] bool isData() const { return arguments_.parts == kAssetPartApplicationData; }
+    [[nodiscard]] ParcelContents contents() const {
+        return {arguments_.identifier, arguments_.file, arguments_.isRestore, arguments_.parts};
+    }
 
     // A plug-in that coordinates its installs takes only what it has asked for: the package travels
     // in a session with a staging area of its own.
@@ -201,17 +178,6 @@ class Sending {
         return finish(std::move(summary));
     }
 
-    void makeAsset(const std::string& version) {
-        parcel_.asset = std::make_shared<SyncAsset>();
-        parcel_.asset->identifier = arguments_.identifier;
-        parcel_.asset->dataclass = "Application";
-        parcel_.asset->isRestore = arguments_.isRestore;
-        parcel_.asset->completedParts = arguments_.parts;
-        parcel_.asset->variantOptions.set("AssetParts", arguments_.parts);
-        if (!version.empty()) parcel_.asset->variantOptions.set("Version", version);
-        parcel_.file = arguments_.file;
-    }
-
     // Nobody has asked for it, so what the device would refuse is not sent.
     Status checkPackage() const {
         return verifyPackage(arguments_.file, arguments_.identifier, device_->propertyLists());
@@ -221,9 +187,7 @@ class Sending {
         const Result<PackageReader> package =
             PackageReader::open(arguments_.file, device_->propertyLists());
         const std::string version = package ? package->info().version : "";
-        makeAsset(version);
-        parcel_.directory = kPublicStaging;
-        parcel_.name = archiveNameOf(arguments_.identifier);
+        parcel_ = packageParcel(contents(), version);
         PlannedInstall planned{arguments_.identifier, {}, {}, {}, 0, 0};
         if (package) planned.newVersion = version;
         if (package && package->info().identifier == arguments_.identifier) {
@@ -238,33 +202,16 @@ class Sending {
     }
 
     Status prepareData() {
-        const std::optional<std::string> version = waitingVersion(*device_, arguments_.identifier);
+        const std::optional<std::string> version =
+            versionThatWaitsForData(*device_, arguments_.identifier);
         if (!version) {
             return failure("no package of " + arguments_.identifier + " waits for its data",
                            "send the package first, with --restore --parts 1");
         }
-        makeAsset(*version);
-        parcel_.keepsPath = true;  // the package's, which the plug-in has kept
-        if (const Status placed = placeData(); !placed) return placed;
+        Result<Session::Parcel> parcel = dataParcel(contents(), *version);
+        if (!parcel) return parcel.error();
+        parcel_ = *std::move(parcel);
         return planInstall({arguments_.identifier, {}, {}, *version, 0, 0});
-    }
-
-    // An archive waits where the device unpacks it with the install; any other file is the data.
-    Status placeData() {
-        const std::filesystem::path archive = Device::restoreDataPath(arguments_.identifier);
-        const Status isArchive = verifyDataArchive(arguments_.file);
-        if (isArchive) {
-            parcel_.directory = archive.parent_path().native();
-            parcel_.name = archive.filename().native();
-            return {};
-        }
-        if (beginsAsArchive(arguments_.file)) {
-            return failure(arguments_.file + ": " + isArchive.error().description(),
-                           "send the archive of a whole backup");
-        }
-        parcel_.directory = Device::dataPath(arguments_.identifier);
-        parcel_.name = std::filesystem::path(arguments_.file).filename().string();
-        return {};
     }
 
     Status planInstall(PlannedInstall planned) {
