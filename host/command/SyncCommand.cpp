@@ -1,12 +1,10 @@
 #include <unistd.h>
 
-#include <algorithm>
 #include <atomic>
 #include <chrono>
 #include <memory>
 #include <optional>
 #include <ostream>
-#include <set>
 #include <utility>
 
 #include "device/Device.h"
@@ -17,10 +15,8 @@
 #include "host/console/Text.h"
 #include "host/output/Json.h"
 #include "host/output/PlanText.h"
-#include "host/plan/InterruptedStaging.h"
 #include "host/plan/LibraryReader.h"
-#include "host/plan/StagingArea.h"
-#include "host/plan/StandingInstalls.h"
+#include "host/plan/SyncPreparation.h"
 #include "host/session/Interruption.h"
 #include "host/session/PlugIn.h"
 #include "host/session/Session.h"
@@ -80,12 +76,12 @@ class SyncRun {
         if (!ready) return ready.error();
         if (arguments_.isDryRun) return showPlan();
         isPlanned_ = true;
-        if (mustNotRun_) return refuse(plan_.failed.back().error);
-        if (!space_.fits()) return refuse(space_.description());
-        if (givenUp_ != StagedWork::None) console_.complain(givenUpNote(givenUp_));
-        ready = clearTheWay();
+        if (sync_.staged.isTooLarge) return refuse(sync_.plan.failed.back().error);
+        if (!sync_.space.fits()) return refuse(sync_.space.description());
+        if (sync_.givenUp != StagedWork::None) console_.complain(givenUpNote(sync_.givenUp));
+        ready = makeReady();
         if (!ready) return ready.error();
-        if (signals_->stopRequested()) return finish(summarizeInterrupted(plan_, facts_));
+        if (signals_->stopRequested()) return finish(summarizeInterrupted(sync_.plan, facts_));
         return hold();
     }
 
@@ -94,7 +90,6 @@ class SyncRun {
         Status status = openDevice();
         if (status) status = openLibrary();
         if (status) status = makeThePlan();
-        if (status) status = checkSpace();
         return status;
     }
 
@@ -117,129 +112,46 @@ class SyncRun {
     }
 
     Status makeThePlan() {
-        const Result<std::vector<ApplicationRecord>> present = device_->applicationsOnDisk();
-        if (!present) return unusable(present.error());
-        const Result<DeviceSettings> settings = device_->settings();
-        if (!settings) return unusable(settings.error());
-        if (arguments_.isStaged) {
-            planStaged(*present, *settings);
-        } else {
-            PlanOptions options = arguments_.plan;
-            options.bringsOffloaded = settings->coordination;
-            plan_ = makePlan(library_, *present, options);
-            givenUp_ = stagedWorkOn(*device_);
-            const bool isToNote = arguments_.isDryRun && givenUp_ != StagedWork::None;
-            if (isToNote) plan_.notes.push_back(givenUpNote(givenUp_));  // a sync complains of it
-        }
-        if (!settings->coordination) return {};  // a session begins by dropping what stands
-        const Result<std::vector<CoordinatorRecord>> coordinators = device_->coordinators();
-        if (!coordinators) return unusable(coordinators.error());
-        standing_ = takeUp(plan_, *coordinators, *present, standingRules(*settings));
+        Result<SyncPreparation> sync = arguments_.isStaged
+                                           ? prepareStagedSync(*device_, library_)
+                                           : prepareSync(*device_, library_, arguments_.plan);
+        if (!sync) return sync.error();
+        sync_ = *std::move(sync);
         return {};
     }
 
-    // What cannot be read in a mirrored library may be the package of any application.
-    [[nodiscard]] StandingRules standingRules(const DeviceSettings& settings) const {
-        StandingRules rules;
-        rules.isForbidden = settings.installation == PolicyAnswer::No;
-        if (!arguments_.plan.mirror || !library_.faults.empty()) return rules;
-        rules.isUnwanted = [this](const std::string& identifier) {
-            return library_.find(identifier) == nullptr;
-        };
-        return rules;
-    }
-
-    void planStaged(const std::vector<ApplicationRecord>& present, const DeviceSettings& settings) {
-        staged_ = readStagedTodoList(*device_);
-        StagedPlanOptions options;
-        options.bringsOffloaded = settings.coordination;
-        options.packageOf = [this](const std::string& identifier) {
-            return packageFor(library_, identifier, device_->propertyLists());
-        };
-        plan_ = makeStagedPlan(staged_.list, present, options);
-        plan_.notes = library_.notes;
-        if (staged_.isTakenUp) {
-            plan_.notes.emplace_back("this takes up the session that was interrupted");
+    int showPlan() {
+        if (sync_.givenUp != StagedWork::None) {
+            sync_.allowed.notes.push_back(givenUpNote(sync_.givenUp));
         }
-        mustNotRun_ = staged_.isTooLarge;
-        if (staged_.error) {
-            plan_.failed.push_back(
-                {"ApplicationsSync.plist",
-                 "the todo list of the staging area cannot be used: " + *staged_.error +
-                     (mustNotRun_ ? "; split it, nothing was done"
-                                  : "; write the staging area anew")});
-        }
-    }
-
-    Status checkSpace() {
-        const Result<std::uint64_t> free = device_->freeSpace();
-        if (!free) return unusable(free.error());
-        const Result<DeviceSettings> settings = device_->settings();
-        if (!settings) return unusable(settings.error());
-        allowed_ = allowedBy(*settings, plan_);
-        space_ = {allowed_.needed(), *free, allowed_.reclaimed};
-        return {};
-    }
-
-    int showPlan() const {
         if (arguments_.display == SyncDisplayKind::Text) {
-            console_.out << planText(allowed_, space_) << std::flush;
+            console_.out << planText(sync_.allowed, sync_.space) << std::flush;
         } else {
             const JsonLayout layout = arguments_.display == SyncDisplayKind::Json
                                           ? JsonLayout::Indented
                                           : JsonLayout::EventLine;
-            console_.out << jsonText(allowed_, space_, layout) << '\n' << std::flush;
+            console_.out << jsonText(sync_.allowed, sync_.space, layout) << '\n' << std::flush;
         }
-        if (!space_.fits()) console_.complain(space_.description());
-        return space_.fits() && allowed_.failed.empty() ? kExitDone : kExitSomethingFailed;
+        if (!sync_.space.fits()) console_.complain(sync_.space.description());
+        return sync_.space.fits() && sync_.allowed.failed.empty() ? kExitDone
+                                                                  : kExitSomethingFailed;
     }
 
     // Nothing of the plan is done, for one reason.
     int refuse(const std::string& reason) {
-        SyncSummary summary;
-        summary.failed = allowed_.failed;
-        summary.skipped = allowed_.skipped;
-        for (const auto* installs : {&allowed_.install, &allowed_.update}) {
-            for (const PlannedInstall& each : *installs) {
-                summary.failed.push_back({each.identifier, reason});
-            }
-        }
-        for (const std::string& identifier : allowed_.remove) {
-            summary.failed.push_back({identifier, "nothing is done: " + reason});
-        }
         console_.complain(reason);
-        return finish(std::move(summary));
+        return finish(summarizeRefused(sync_.allowed, reason));
     }
 
-    Status clearTheWay() {
-        Status status = cancelObsolete(*device_, standing_);
-        if (!status) return unusable(status.error());
-        const Result<std::vector<std::string>> placeholders =
-            device_->removeLeftoverSyncPlaceholders();
-        if (!placeholders) return unusable(placeholders.error());
-        status = removeStaleTransfers(*device_, standing_.arrived);
-        if (status) status = stage();
-        if (status) return {};
-        return unusable(status.error().withContext("cannot prepare the device for the sync"));
-    }
-
-    Status stage() {
-        if (!arguments_.isStaged) return writeStagingArea(*device_, plan_, library_);
-        if (staged_.isTakenUp) {
-            const Status again = stageAgain(*device_, staged_.list, plan_);
-            if (!again) return again;
-        }
-        // Where it cannot be noted, as in an area that is a link, an interruption is final.
-        if (staged_.list.isArray()) {
-            beginStagedSession(*device_, std::exchange(staged_.list, {})).ignore();
-        }
-        return {};
+    Status makeReady() {
+        return arguments_.isStaged ? clearTheWayForStaged(*device_, sync_)
+                                   : clearTheWay(*device_, sync_, library_);
     }
 
     Result<int> hold() {
         Result<std::unique_ptr<PlugIn>> plugIn = PlugIn::load(*device_, events_, facts_);
         if (!plugIn) return plugIn.error();
-        for (const auto* installs : {&plan_.install, &plan_.update}) {
+        for (const auto* installs : {&sync_.plan.install, &sync_.plan.update}) {
             for (const PlannedInstall& each : *installs) {
                 if (each.hasArrived) (*plugIn)->watch().setSize(each.identifier, each.bytes);
             }
@@ -248,7 +160,7 @@ class SyncRun {
         const SessionEnd end = session.sync(
             {[this](const std::string& identifier) { return packageFileFor(library_, identifier); },
              [this](const std::string& identifier) {
-                 return !standing_.arrived.contains(identifier);
+                 return !sync_.standing.arrived.contains(identifier);
              }});
         if (arguments_.isStaged && end.isSuccess()) {
             isStagingOver_ = true;
@@ -257,23 +169,16 @@ class SyncRun {
         Result<SessionAftermath> aftermath = aftermathOf(*device_, end, facts_);
         if (aftermath) {
             if (end.isSuccess()) forgetFailures(aftermath->present);
-            return finish(summarize(plan_, facts_, *aftermath));
+            return finish(summarize(sync_.plan, facts_, *aftermath));
         }
-        finish(summarizeFailed(plan_, facts_, aftermath.error()));
+        finish(summarizeFailed(sync_.plan, facts_, aftermath.error()));
         return aftermath.error();
     }
 
     // What is in step with the library, an earlier update may have failed of.
     void forgetFailures(const std::vector<ApplicationRecord>& present) {
         if (arguments_.isStaged) return;
-        std::set<std::string> inStep;
-        for (const ApplicationRecord& each : present) {
-            const LibraryPackage* package = library_.find(each.identifier);
-            const bool isSame = !each.isPlaceholder && package != nullptr &&
-                                package->version == each.version.value_or("");
-            if (isSame) inStep.insert(each.identifier);
-        }
-        device_->forgetFailures(inStep).ignore();
+        device_->forgetFailures(identifiersInStep(library_, present)).ignore();
     }
 
     // On the thread of the signals, whatever the session is at. From here on the plan stays as it
@@ -289,10 +194,10 @@ class SyncRun {
     }
 
     SyncSummary summaryOnLeaving() {
-        if (isDeviceTaken_.test_and_set()) return summarizeInterrupted(plan_, facts_);
+        if (isDeviceTaken_.test_and_set()) return summarizeInterrupted(sync_.plan, facts_);
         const Result<SessionAftermath> aftermath = aftermathOnLeaving(*device_, facts_);
-        return aftermath ? summarize(plan_, facts_, *aftermath)
-                         : summarizeInterrupted(plan_, facts_);
+        return aftermath ? summarize(sync_.plan, facts_, *aftermath)
+                         : summarizeInterrupted(sync_.plan, facts_);
     }
 
     SyncSummary timed(SyncSummary summary) const {
@@ -304,7 +209,9 @@ class SyncRun {
     int finish(SyncSummary summary) {
         summary = timed(std::move(summary));
         if (arguments_.display == SyncDisplayKind::Text) {
-            for (const std::string& note : plan_.notes) console_.out << printable(note) << '\n';
+            for (const std::string& note : sync_.plan.notes) {
+                console_.out << printable(note) << '\n';
+            }
         }
         endedWith_ = summary.incomplete ? kExitSomethingFailed : kExitDone;
         events_.finish(summary);
@@ -321,13 +228,7 @@ class SyncRun {
     SessionFacts facts_;
     std::unique_ptr<Device> device_;
     Library library_;
-    SyncPlan plan_;
-    SyncPlan allowed_;  // what of it policy lets happen
-    StandingInstalls standing_;
-    StagedTodoList staged_;                  // only with --staged, until the session begins
-    StagedWork givenUp_ = StagedWork::None;  // only without
-    SpaceCheck space_;
-    bool mustNotRun_ = false;
+    SyncPreparation sync_;
     const Clock::time_point begin_ = Clock::now();
     std::atomic<bool> isPlanned_ = false;  // the plan is made, and changes no more
     // What is left of a staging area whose session has ended, the same command does not do.

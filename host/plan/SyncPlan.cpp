@@ -278,6 +278,18 @@ SyncPlan makePlan(const Library& library, const std::vector<ApplicationRecord>& 
     return Planner(library, present, options).make();
 }
 
+std::set<std::string> identifiersInStep(const Library& library,
+                                        const std::vector<ApplicationRecord>& present) {
+    std::set<std::string> inStep;
+    for (const ApplicationRecord& each : present) {
+        const LibraryPackage* package = library.find(each.identifier);
+        const bool isSame = !each.isPlaceholder && package != nullptr &&
+                            package->version == each.version.value_or("");
+        if (isSame) inStep.insert(each.identifier);
+    }
+    return inStep;
+}
+
 SyncPlan allowedBy(const DeviceSettings& settings, SyncPlan plan) {
     if (settings.removal == PolicyAnswer::No) {
         for (std::string& identifier : plan.remove) {

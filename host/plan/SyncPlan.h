@@ -105,6 +105,10 @@ struct SpaceCheck {
                                 const std::vector<ApplicationRecord>& present,
                                 const PlanOptions& options);
 
+/// What the device holds in the library's very version.
+[[nodiscard]] std::set<std::string> identifiersInStep(
+    const Library& library, const std::vector<ApplicationRecord>& present);
+
 /// What of the plan can happen: what the device's policy forbids is skipped, what has no good
 /// package has failed.
 [[nodiscard]] SyncPlan allowedBy(const DeviceSettings& settings, SyncPlan plan);

@@ -234,6 +234,21 @@ SyncSummary summarizeInterrupted(const SyncPlan& plan, const SessionFacts& facts
     return summarize(plan, facts, aftermath);
 }
 
+SyncSummary summarizeRefused(const SyncPlan& allowed, const std::string& reason) {
+    SyncSummary summary;
+    summary.failed = allowed.failed;
+    summary.skipped = allowed.skipped;
+    for (const auto* installs : {&allowed.install, &allowed.update}) {
+        for (const PlannedInstall& each : *installs) {
+            summary.failed.push_back({each.identifier, reason});
+        }
+    }
+    for (const std::string& identifier : allowed.remove) {
+        summary.failed.push_back({identifier, "nothing is done: " + reason});
+    }
+    return summary;
+}
+
 SyncSummary summarizeFailed(const SyncPlan& plan, const SessionFacts& facts,
                             const ErrorRecord& error) {
     SessionAftermath aftermath = assumedAftermath(plan, facts);

@@ -48,6 +48,8 @@ struct SessionAftermath {
 
 /// It is left in its middle, or before it began.
 [[nodiscard]] SyncSummary summarizeInterrupted(const SyncPlan& plan, const SessionFacts& facts);
+/// Nothing of what policy would allow is done, for one reason.
+[[nodiscard]] SyncSummary summarizeRefused(const SyncPlan& allowed, const std::string& reason);
 /// The device cannot be looked at any more.
 [[nodiscard]] SyncSummary summarizeFailed(const SyncPlan& plan, const SessionFacts& facts,
                                           const ErrorRecord& error);

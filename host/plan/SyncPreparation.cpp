@@ -1,0 +1,153 @@
+#include "host/plan/SyncPreparation.h"
+
+#include <string>
+#include <utility>
+#include <vector>
+
+#include "device/Device.h"
+#include "host/console/Problem.h"
+#include "host/plan/LibraryReader.h"
+
+namespace appsync {
+namespace {
+
+class Preparing {
+  public:
+    Preparing(Device& device, const Library& library) : device_(device), library_(library) {}
+
+    Result<SyncPreparation> ofLibrary(PlanOptions options) {
+        if (Status looked = look(); !looked) return looked.error();
+        options.bringsOffloaded = settings_.coordination;
+        sync_.plan = makePlan(library_, present_, options);
+        sync_.givenUp = stagedWorkOn(device_);
+        return finish(options.mirror);
+    }
+
+    Result<SyncPreparation> ofStagingArea() {
+        if (Status looked = look(); !looked) return looked.error();
+        sync_.staged = readStagedTodoList(device_);
+        StagedPlanOptions options;
+        options.bringsOffloaded = settings_.coordination;
+        options.packageOf = [this](const std::string& identifier) {
+            return packageFor(library_, identifier, device_.propertyLists());
+        };
+        sync_.plan = makeStagedPlan(sync_.staged.list, present_, options);
+        sync_.plan.notes = library_.notes;
+        if (sync_.staged.isTakenUp) {
+            sync_.plan.notes.emplace_back("this takes up the session that was interrupted");
+        }
+        if (sync_.staged.error) sync_.plan.failed.push_back(unusableList());
+        return finish(false);
+    }
+
+  private:
+    Status look() {
+        Result<std::vector<ApplicationRecord>> present = device_.applicationsOnDisk();
+        if (!present) return unusable(present.error());
+        present_ = *std::move(present);
+        const Result<DeviceSettings> settings = device_.settings();
+        if (!settings) return unusable(settings.error());
+        settings_ = *settings;
+        return {};
+    }
+
+    [[nodiscard]] SyncFailure unusableList() const {
+        return {"ApplicationsSync.plist",
+                "the todo list of the staging area cannot be used: " + *sync_.staged.error +
+                    (sync_.staged.isTooLarge ? "; split it, nothing was done"
+                                             : "; write the staging area anew")};
+    }
+
+    Result<SyncPreparation> finish(bool isMirror) {
+        Status status = takeUpStanding(isMirror);
+        if (status) status = checkSpace();
+        if (!status) return status.error();
+        return std::move(sync_);
+    }
+
+    Status takeUpStanding(bool isMirror) {
+        if (!settings_.coordination) return {};  // a session begins by dropping what stands
+        const Result<std::vector<CoordinatorRecord>> coordinators = device_.coordinators();
+        if (!coordinators) return unusable(coordinators.error());
+        sync_.standing = takeUp(sync_.plan, *coordinators, present_, standingRules(isMirror));
+        return {};
+    }
+
+    // What cannot be read in a mirrored library may be the package of any application.
+    [[nodiscard]] StandingRules standingRules(bool isMirror) const {
+        StandingRules rules;
+        rules.isForbidden = settings_.installation == PolicyAnswer::No;
+        if (!isMirror || !library_.faults.empty()) return rules;
+        rules.isUnwanted = [this](const std::string& identifier) {
+            return library_.find(identifier) == nullptr;
+        };
+        return rules;
+    }
+
+    Status checkSpace() {
+        const Result<std::uint64_t> free = device_.freeSpace();
+        if (!free) return unusable(free.error());
+        sync_.allowed = allowedBy(settings_, sync_.plan);
+        sync_.space = {sync_.allowed.needed(), *free, sync_.allowed.reclaimed};
+        return {};
+    }
+
+    Device& device_;
+    const Library& library_;
+    std::vector<ApplicationRecord> present_;
+    DeviceSettings settings_;
+    SyncPreparation sync_;
+};
+
+Status removeLeftovers(Device& device, const StandingInstalls& standing) {
+    const Status cancelled = cancelObsolete(device, standing);
+    if (!cancelled) return unusable(cancelled.error());
+    const Result<std::vector<std::string>> placeholders = device.removeLeftoverSyncPlaceholders();
+    if (!placeholders) return unusable(placeholders.error());
+    return {};
+}
+
+Status stageInterrupted(Device& device, SyncPreparation& sync) {
+    if (sync.staged.isTakenUp) {
+        const Status again = stageAgain(device, sync.staged.list, sync.plan);
+        if (!again) return again;
+    }
+    // Where it cannot be noted, as in an area that is a link, an interruption is final.
+    if (sync.staged.list.isArray()) {
+        beginStagedSession(device, std::exchange(sync.staged.list, {})).ignore();
+    }
+    return {};
+}
+
+ErrorRecord cannotPrepare(const ErrorRecord& error) {
+    return unusable(error.withContext("cannot prepare the device for the sync"));
+}
+
+}  // namespace
+
+Result<SyncPreparation> prepareSync(Device& device, const Library& library,
+                                    const PlanOptions& options) {
+    return Preparing(device, library).ofLibrary(options);
+}
+
+Result<SyncPreparation> prepareStagedSync(Device& device, const Library& library) {
+    return Preparing(device, library).ofStagingArea();
+}
+
+Status clearTheWay(Device& device, const SyncPreparation& sync, const Library& library) {
+    Status status = removeLeftovers(device, sync.standing);
+    if (!status) return status;
+    status = removeStaleTransfers(device, sync.standing.arrived);
+    if (status) status = writeStagingArea(device, sync.plan, library);
+    return status ? status : cannotPrepare(status.error());
+}
+
+Status clearTheWayForStaged(Device& device, SyncPreparation& sync) {
+    Status status = removeLeftovers(device, sync.standing);
+    if (!status) return status;
+    status = removeStaleTransfers(device, sync.standing.arrived);
+    if (status) status = stageInterrupted(device, sync);
+    return status ? status : cannotPrepare(status.error());
+}
+
+}  // namespace appsync
