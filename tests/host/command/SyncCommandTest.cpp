@@ -83,23 +83,6 @@ TEST_F(SyncCommand, APlanNamesThePackagesThatAreLeftOut) {
     EXPECT_THAT(out.str(), HasSubstr("old.zip is left out"));
 }
 
-TEST_F(SyncCommand, SendingIsRefusedWhereInstallingIsForbidden) {
-    addPackage("com.a", "1");
-    EXPECT_EQ(run({"set", device, "installation=no"}), 0);
-    EXPECT_EQ(run({"send", device, "com.a", library + "/com.a.zip", "--json"}), 1);
-    EXPECT_THAT(err.str(), HasSubstr("policy does not allow installing"));
-    EXPECT_THAT(out.str(), HasSubstr("\"identifier\": \"com.a\""));
-    EXPECT_THAT(applications(), IsEmpty());
-}
-
-TEST_F(SyncCommand, SendingWhatDoesNotFitIsRefusedBeforeTheFirstByte) {
-    write(library + "/huge", "");
-    std::filesystem::resize_file(library + "/huge", std::uint64_t{1} << 42);  // a hole
-    EXPECT_EQ(run({"send", device, "com.a", library + "/huge", "--json"}), 1);
-    EXPECT_THAT(err.str(), HasSubstr("it needs 4.0 TiB, the device has "));
-    EXPECT_THAT(out.str(), HasSubstr("\"bytes\": 0"));
-}
-
 TEST_F(SyncCommand, ATerminalGetsNoCellThatBreaksTheTable) {
     addPackage("com.a", std::string(300, '7'));
     EXPECT_EQ(sync(), 0);
@@ -195,46 +178,6 @@ TEST_F(StagedSync, AListThatAsksForTooMuchIsRefusedBeforeTheDeviceSeesIt) {
     EXPECT_THAT(err.str(), HasSubstr("20001 installs"));
     EXPECT_THAT(out.str(), HasSubstr("ApplicationsSync.plist"));
     EXPECT_TRUE(std::filesystem::exists(root + "/var/mobile/Media/PublicStaging/ApplicationSync"));
-}
-
-using SendCommand = HostFixture;
-
-TEST_F(SendCommand, InstallsAPackageThatNobodyAskedFor) {
-    addPackage("com.a", "1");
-    EXPECT_EQ(run({"send", device, "com.a", library + "/com.a.zip"}), 0);
-    EXPECT_THAT(applications(), ElementsAre("com.a 1"));
-}
-
-TEST_F(SendCommand, ARestoredPackageWaitsForItsData) {
-    addPackage("com.a", "1");
-    write(library + "/data", "the application's data");
-    EXPECT_EQ(run({"send", device, "com.a", library + "/com.a.zip", "--restore"}), 0);
-    EXPECT_THAT(applications(), IsEmpty());
-    EXPECT_EQ(run({"send", device, "com.a", library + "/data", "--restore", "--parts", "2"}), 0);
-    EXPECT_THAT(applications(), ElementsAre("com.a 1"));
-    EXPECT_TRUE(std::filesystem::exists(root + "/var/mobile/Containers/Data/com.a/data"));
-}
-
-TEST_F(SendCommand, ASyncInBetweenKeepsThePackageThatWaits) {
-    addPackage("com.a", "1");
-    write(library + "/data", "the application's data");
-    EXPECT_EQ(run({"send", device, "com.a", library + "/com.a.zip", "--restore"}), 0);
-    std::filesystem::remove(library + "/com.a.zip");
-    EXPECT_EQ(sync(), 0);
-    EXPECT_EQ(run({"send", device, "com.a", library + "/data", "--restore", "--parts", "2"}), 0);
-    EXPECT_THAT(applications(), ElementsAre("com.a 1"));
-}
-
-TEST_F(SendCommand, DataWithoutAPackageThatWaitsIsRefused) {
-    write(library + "/data", "data");
-    EXPECT_EQ(run({"send", device, "com.a", library + "/data", "--restore", "--parts", "2"}), 1);
-    EXPECT_THAT(err.str(), HasSubstr("no package of com.a waits"));
-}
-
-TEST_F(SendCommand, APackageThatIsNoneFailsWithItsReason) {
-    write(library + "/text.zip", "no package");
-    EXPECT_EQ(run({"send", device, "com.a", library + "/text.zip", "--json"}), 1);
-    EXPECT_THAT(out.str(), HasSubstr("\"failed\": [\n    {\n      \"identifier\": \"com.a\""));
 }
 
 }  // namespace

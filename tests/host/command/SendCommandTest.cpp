@@ -1,0 +1,70 @@
+#include <filesystem>
+
+#include "tests/host/HostFixture.h"
+
+namespace appsync {
+namespace {
+
+using testing::ElementsAre;
+using testing::HasSubstr;
+using testing::IsEmpty;
+
+using SendCommand = HostFixture;
+
+TEST_F(SendCommand, InstallsAPackageThatNobodyAskedFor) {
+    addPackage("com.a", "1");
+    EXPECT_EQ(run({"send", device, "com.a", library + "/com.a.zip"}), 0);
+    EXPECT_THAT(applications(), ElementsAre("com.a 1"));
+}
+
+TEST_F(SendCommand, ARestoredPackageWaitsForItsData) {
+    addPackage("com.a", "1");
+    write(library + "/data", "the application's data");
+    EXPECT_EQ(run({"send", device, "com.a", library + "/com.a.zip", "--restore"}), 0);
+    EXPECT_THAT(applications(), IsEmpty());
+    EXPECT_EQ(run({"send", device, "com.a", library + "/data", "--restore", "--parts", "2"}), 0);
+    EXPECT_THAT(applications(), ElementsAre("com.a 1"));
+    EXPECT_TRUE(std::filesystem::exists(root + "/var/mobile/Containers/Data/com.a/data"));
+}
+
+TEST_F(SendCommand, ASyncInBetweenKeepsThePackageThatWaits) {
+    addPackage("com.a", "1");
+    write(library + "/data", "the application's data");
+    EXPECT_EQ(run({"send", device, "com.a", library + "/com.a.zip", "--restore"}), 0);
+    std::filesystem::remove(library + "/com.a.zip");
+    EXPECT_EQ(sync(), 0);
+    EXPECT_EQ(run({"send", device, "com.a", library + "/data", "--restore", "--parts", "2"}), 0);
+    EXPECT_THAT(applications(), ElementsAre("com.a 1"));
+}
+
+TEST_F(SendCommand, DataWithoutAPackageThatWaitsIsRefused) {
+    write(library + "/data", "data");
+    EXPECT_EQ(run({"send", device, "com.a", library + "/data", "--restore", "--parts", "2"}), 1);
+    EXPECT_THAT(err.str(), HasSubstr("no package of com.a waits"));
+}
+
+TEST_F(SendCommand, APackageThatIsNoneFailsWithItsReason) {
+    write(library + "/text.zip", "no package");
+    EXPECT_EQ(run({"send", device, "com.a", library + "/text.zip", "--json"}), 1);
+    EXPECT_THAT(out.str(), HasSubstr("\"failed\": [\n    {\n      \"identifier\": \"com.a\""));
+}
+
+TEST_F(SendCommand, IsRefusedWhereInstallingIsForbidden) {
+    addPackage("com.a", "1");
+    EXPECT_EQ(run({"set", device, "installation=no"}), 0);
+    EXPECT_EQ(run({"send", device, "com.a", library + "/com.a.zip", "--json"}), 1);
+    EXPECT_THAT(err.str(), HasSubstr("policy does not allow installing"));
+    EXPECT_THAT(out.str(), HasSubstr("\"identifier\": \"com.a\""));
+    EXPECT_THAT(applications(), IsEmpty());
+}
+
+TEST_F(SendCommand, WhatDoesNotFitIsRefusedBeforeTheFirstByte) {
+    write(library + "/huge", "");
+    std::filesystem::resize_file(library + "/huge", std::uint64_t{1} << 42);  // a hole
+    EXPECT_EQ(run({"send", device, "com.a", library + "/huge", "--json"}), 1);
+    EXPECT_THAT(err.str(), HasSubstr("it needs 4.0 TiB, the device has "));
+    EXPECT_THAT(out.str(), HasSubstr("\"bytes\": 0"));
+}
+
+}  // namespace
+}  // namespace appsync
