@@ -13,7 +13,7 @@
 #include "host/console/Console.h"
 #include "host/console/Problem.h"
 #include "host/console/Text.h"
-#include "host/output/Json.h"
+#include "host/output/JsonSync.h"
 #include "host/output/PlanText.h"
 #include "host/plan/LibraryReader.h"
 #include "host/plan/SyncPreparation.h"

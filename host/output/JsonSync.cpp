@@ -1,4 +1,4 @@
-#include "host/output/Json.h"
+#include "host/output/JsonSync.h"
 
 #include <nlohmann/json.hpp>
 

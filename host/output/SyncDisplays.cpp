@@ -7,7 +7,7 @@
 
 #include "host/console/Console.h"
 #include "host/console/Text.h"
-#include "host/output/Json.h"
+#include "host/output/JsonSync.h"
 
 namespace appsync {
 namespace {
