@@ -52,7 +52,7 @@ void CrashRecorder::recordsChanged(std::string_view what, Persistence persistenc
     if (hook_) hook_(what);
 }
 
-DeviceRecords CrashRecorder::records() const {
+ServiceRecords CrashRecorder::records() const {
     return {platform_.registry.records(),       platform_.coordination.records(),
             platform_.coordination.isEnabled(), platform_.installer.uninstalled(),
             platform_.backup.restoreData(),     platform_.homeScreen.layout()};

@@ -21,7 +21,7 @@ namespace appsync {
 class SimulatedPlatform;
 
 /// What the services of a device have written down.
-struct DeviceRecords {
+struct ServiceRecords {
     SimulatedAppRegistry::Records registry;
     SimulatedCoordination::Records coordination;
     bool isCoordinated = false;
@@ -33,7 +33,7 @@ struct DeviceRecords {
 /// What a crash has left of a device. A platform takes it over with `SimulatedPlatform::reopen`.
 struct DeviceImage {
     std::shared_ptr<const FileNode> files;
-    DeviceRecords records;
+    ServiceRecords records;
     bool powerWasLost = false;
 };
 
@@ -71,12 +71,12 @@ class CrashRecorder : public DurableChangeListener {
     void recordsChanged(std::string_view what, Persistence persistence) override;
 
   private:
-    [[nodiscard]] DeviceRecords records() const;
+    [[nodiscard]] ServiceRecords records() const;
 
     SimulatedPlatform& platform_;
     Hook hook_;
-    std::vector<DeviceRecords> history_;  // from what is on disk to what there is now
-    std::size_t committed_ = 0;           // which of them is the last that is committed
+    std::vector<ServiceRecords> history_;  // from what is on disk to what there is now
+    std::size_t committed_ = 0;            // which of them is the last that is committed
 };
 
 }  // namespace appsync
