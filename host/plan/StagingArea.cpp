@@ -152,7 +152,7 @@ std::set<std::string> packagesThatWait(Device& device) {
     return paths;
 }
 
-bool isPackageName(const std::string& name) {
+bool isReceivedPackage(const std::string& name) {
     return name.ends_with(".zip") || identifierOfArchive(name);
 }
 
@@ -254,7 +254,7 @@ Status removeStaleTransfers(Device& device, const std::set<std::string>& arrived
     device.files().removeItem(std::string(kUnfinishedStagingArea)).ignore();
     for (const std::string& name : namesIn(device.root(), kPublicStaging)) {
         const std::string path = std::string(kPublicStaging) + "/" + name;
-        if (!isPackageName(name) || waiting.contains(path)) continue;
+        if (!isReceivedPackage(name) || waiting.contains(path)) continue;
         Status removed = device.files().removeItem(path);
         if (!removed) return removed;
     }
