@@ -45,7 +45,9 @@ class HomeScreenService {
     /// The connection; null when the home screen cannot be reached.
     [[nodiscard]] virtual std::shared_ptr<HomeScreenConnection> blockableConnection() = 0;
 
-    /// Asks that the application be ended, if it runs, and kept from running. `reason` is always 0.
+    /// Asks that the application be ended, if it runs, and kept from running. `reason` says who
+    /// asks (the plug-in gives 0, a platform numbers others of its own) and changes nothing in the
+    /// answer.
     [[nodiscard]] virtual TerminationAssertionResult takeTerminationAssertion(
         const std::string& identifier, std::uint64_t reason) = 0;
 };

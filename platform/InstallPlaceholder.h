@@ -45,7 +45,8 @@ class InstallPlaceholder {
     /// How it appears in messages.
     [[nodiscard]] virtual std::string description() const = 0;
 
-    /// The icon. The service takes its own copy of the file of a complete promise.
+    /// The icon. Its file is the service's as with every promise that is kept with a file: it is
+    /// read when the placeholder is put on the home screen.
     virtual Status setIconPromise(const std::shared_ptr<PathTransferPromise>& promise) = 0;
     virtual Status setAttributes(const PlaceholderAttributes& attributes) = 0;
     /// Nothing is allowed, and says that there is no store metadata.

@@ -49,8 +49,9 @@ class Promise {
 class PathTransferPromise : public Promise {
   public:
     [[nodiscard]] virtual std::optional<FileURL> transferPath() const = 0;
-    /// Where the file lies, an absolute device path. The service takes the file for its own once
-    /// the promise is complete: it reads it when it needs it and removes it afterwards.
+    /// Where the file lies, an absolute device path. Once the promise is complete and a coordinator
+    /// or its placeholder has it, the file is the service's own, an icon's too: it reads it when it
+    /// needs it and removes it afterwards (an icon may be left standing).
     virtual void setTransferPath(const FileURL& path) = 0;
 };
 
