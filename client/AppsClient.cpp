@@ -2,12 +2,12 @@
 
 #include <cstddef>
 
-#include "client/Dataclass.h"
 #include "platform/BackupService.h"
 #include "platform/DevicePolicyService.h"
 #include "platform/InstallCoordinatorService.h"
 #include "platform/InstallTransactionLog.h"
 #include "platform/Notifications.h"
+#include "platform/SyncAsset.h"
 #include "platform/SyncHost.h"
 
 namespace appsync {
@@ -16,7 +16,6 @@ namespace {
 
 constexpr std::string_view kSyncAnchor = "NO_APP_SYNC_ANCHOR";
 constexpr std::string_view kDaemonIdentifier = "com.korvu.trd";
-constexpr std::string_view kStartupNotification = "com.korvu.trd.TRStartupCompleteNotification";
 constexpr std::string_view kLogSubsystem = "com.korvu.appinstallation";
 constexpr std::string_view kLogCategory = "trd.appsync";
 constexpr std::string_view kAccessQueueLabel = "com.korvu.qmx.Travend.AppSync";
@@ -31,6 +30,8 @@ void startupDidComplete(void* observer) {
     if (observer == nullptr) return;
     static_cast<AppsClient*>(observer)->setupInstallCoordinatorObserver();
 }
+
+bool isInsideDaemon(SyncHost& host) { return host.mainBundleIdentifier() == kDaemonIdentifier; }
 
 bool isAllowed(DevicePolicyService& policy, PolicyFeature feature) {
     return policy.effectiveValue(feature) != PolicyAnswer::No;
@@ -49,19 +50,6 @@ std::shared_ptr<AppsClient> AppsClient::create(const Platform& platform) {
 void AppsClient::initialize() {
     _installGroup = platform_.queues.makeWaitGroup();
     _restorePlaceHoldersWaitGroup = platform_.queues.makeWaitGroup();
-    makeQueues();
-    platform_.registry.addObserver(weak_from_this());
-    platform_.transactions.initialize(*platform_.log.makeHandle(kLogSubsystem, kLogCategory));
-    _finishedWaitingForPlaceHolderInstalls = false;
-    _useInstallCoordinator = platform_.coordination.isCoordinationEnabled();
-    _restoringPlaceholderCount = 0;
-    if (!isInsideDaemon()) return;
-    // Inside the daemon there is no earlier wait to finish.
-    _finishedWaitingForPlaceHolderInstalls = true;
-    listenForStartup();
-}
-
-void AppsClient::makeQueues() {
     _installOperationQueue = platform_.queues.makeOperationQueue();
     _installOperationQueue->setMaximumConcurrentOperations(kConcurrentInstalls);
     _backupManager = platform_.backup.makeManager();
@@ -69,16 +57,17 @@ void AppsClient::makeQueues() {
     _restoreQueue = platform_.queues.makeSerialQueue(kRestoreQueueLabel);
     todoListLock_ = platform_.queues.makeLock();
     restoreStateLock_ = platform_.queues.makeLock();
-}
-
-void AppsClient::listenForStartup() {
-    platform_.notificationCenter.addObserver(weak_from_this(), kStartupNotification,
+    platform_.registry.addObserver(weak_from_this());
+    platform_.transactions.initialize(*platform_.log.makeHandle(kLogSubsystem, kLogCategory));
+    _finishedWaitingForPlaceHolderInstalls = false;
+    _useInstallCoordinator = platform_.coordination.isCoordinationEnabled();
+    _restoringPlaceholderCount = 0;
+    if (!isInsideDaemon(platform_.host)) return;
+    // Inside the daemon there is no earlier wait to finish.
+    _finishedWaitingForPlaceHolderInstalls = true;
+    platform_.notificationCenter.addObserver(weak_from_this(), kStartupCompleteNotification,
                                              startupDidComplete,
                                              NotificationCenter::SuspensionBehavior::Drop);
-}
-
-bool AppsClient::isInsideDaemon() const {
-    return platform_.host.mainBundleIdentifier() == kDaemonIdentifier;
 }
 
 AppsClient::~AppsClient() {
@@ -98,12 +87,14 @@ AppsClient::~AppsClient() {
     _installGroup.reset();
     _restorePlaceHoldersWaitGroup.reset();
     platform_.registry.removeObserver(this);
-    if (!isInsideDaemon()) return;
-    platform_.notificationCenter.removeObserver(this, kStartupNotification);
+    if (!isInsideDaemon(platform_.host)) return;
+    platform_.notificationCenter.removeObserver(this, kStartupCompleteNotification);
     _appInstallObserver.reset();
 }
 
-std::vector<std::string> AppsClient::supportedDataclasses() { return {std::string(kDataclass)}; }
+std::vector<std::string> AppsClient::supportedDataclasses() {
+    return {std::string(kApplicationDataclass)};
+}
 
 std::string AppsClient::currentSyncAnchor() { return std::string(kSyncAnchor); }
 
@@ -116,7 +107,7 @@ bool AppsClient::prepareForSyncWithHostAnchor(const std::string& /*hostAnchor*/,
 
 std::optional<std::set<std::string>> AppsClient::disabledAssetTypes() {
     if (_appInstallationAllowed() || _appRemovalAllowed()) return std::nullopt;
-    return std::set<std::string>{std::string(kDataclass)};
+    return std::set<std::string>{std::string(kApplicationDataclass)};
 }
 
 bool AppsClient::_appInstallationAllowed() const {

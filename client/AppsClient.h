@@ -24,9 +24,7 @@ namespace appsync {
 class AppInstallObserver;
 class BackupManager;
 class RestoreState;
-enum class CoordinatorKind;
-struct RestoredApp;
-struct TransferItem;
+class WantedTransfers;
 
 /// The plug-in: the one object that the SyncHost sees, for the dataclass "Application".
 ///
@@ -34,7 +32,6 @@ struct TransferItem;
 /// the operations of `SyncClient` in the order given there. Operations whose names begin with an
 /// underscore are the plug-in's own. Those called "class operation" use no member; they are given
 /// the platform.
-///
 /// The declarations stand in groups, one for each file that defines them.
 class AppsClient final : public SyncClient,
                          public AppRegistryObserver,
@@ -47,10 +44,8 @@ class AppsClient final : public SyncClient,
     /// for its whole life. The platform must outlive the client and what it has queued.
     [[nodiscard]] static std::shared_ptr<AppsClient> create(const Platform& platform);
 
-    /// `dealloc`: warns of what is still outstanding, and stops listening. Runs on whatever thread
-    /// lets the client go, an install's for instance.
+    /// `dealloc`: warns of what is outstanding, and stops listening. Any thread, an install's too.
     ~AppsClient() override;
-
     AppsClient(const AppsClient&) = delete;
     AppsClient& operator=(const AppsClient&) = delete;
 
@@ -64,27 +59,22 @@ class AppsClient final : public SyncClient,
                                       ErrorOut error) override;
     /// `disabledAssetTypes`: the dataclass when neither installing nor removing is allowed.
     [[nodiscard]] std::optional<std::set<std::string>> disabledAssetTypes() override;
-
-    /// `_appInstallationAllowed`: false only on the policy service's explicit no.
+    /// `_appInstallationAllowed`, `_appRemovalAllowed`: false only on the policy's explicit no.
     [[nodiscard]] bool _appInstallationAllowed() const;
-    /// `_appRemovalAllowed`: false only on the policy service's explicit no.
     [[nodiscard]] bool _appRemovalAllowed() const;
     /// `_getAndResetNumAppInstallsAttempted`: the installs attempted since this was last asked.
     std::uint32_t _getAndResetNumAppInstallsAttempted();
 
     // client/SyncReconciliation.cpp: taking over the host's todo list, and the end of a session.
 
-    /// `reconcileSync:withNewAnchor:progressCallback:error:`: only the anchor is looked at, and
-    /// only for the log. True also when the todo list is missing or damaged; `error` may be set
-    /// then.
+    /// `reconcileSync:withNewAnchor:progressCallback:error:`: looks at the anchor only, for the
+    /// log. True also when the todo list is missing or damaged; `error` may be set then.
     bool reconcileSync(const PropertyList& request, const std::string& newAnchor,
                        const SyncProgressCallback& progressCallback, ErrorOut error) override;
     /// `syncEndedWithSuccess:`
     void syncEndedWithSuccess(bool success) override;
-
-    /// `_loadPlist:withError:`: class operation. A list, the todo list or the last-sync app state;
-    /// an array whose elements are of any kind. Nothing when the file is missing or empty (not
-    /// logged), damaged or something else (logged).
+    /// `_loadPlist:withError:`: class operation. The todo list or the last-sync app state, an array
+    /// of anything. Nothing when it is missing or empty (not logged), damaged or no array (logged).
     [[nodiscard]] static std::optional<PropertyList> _loadPlist(const Platform& platform,
                                                                 std::string_view path,
                                                                 ErrorOut error);
@@ -95,7 +85,15 @@ class AppsClient final : public SyncClient,
     [[nodiscard]] static std::vector<PropertyList> _orderTheItems(const Platform& platform,
                                                                   ItemMap& items);
 
-    // client/InstalledAssets.cpp: what the device holds.
+    // client/TodoList.cpp: what is to become of an application. Any thread.
+
+    /// `_operationStateForIdentifier:`: the operation of its first entry in the todo list.
+    [[nodiscard]] std::optional<std::string> _operationStateForIdentifier(
+        const std::string& identifier) const;
+    /// `changeAssetID:toDo:`: rewrites the operation of its first entry.
+    void changeAssetID(const std::string& identifier, std::string_view toDo);
+
+    // client/InstalledAssets.cpp, client/BackupPreparation.cpp: what the device holds.
 
     /// `installedAssets`
     [[nodiscard]] PropertyList installedAssets() override;
@@ -107,17 +105,13 @@ class AppsClient final : public SyncClient,
     [[nodiscard]] std::set<std::string> korvuIDsForAssets() override;
     /// `accountsForAssets`: the first application of each account decides its person identifiers.
     [[nodiscard]] std::set<SyncAccountInfo> accountsForAssets() override;
-
-    // client/BackupPreparation.cpp
-
     /// `prepareForBackup`: clears every application's mark of an automatic download. Metadata that
     /// had one is rewritten as XML.
     void prepareForBackup() override;
 
     // transfer/OutstandingTransfers.cpp: which packages to ask for.
 
-    /// `outstandingAssetTransfers`: installs a placeholder for each application that it asks for,
-    /// or prepares its coordinator.
+    /// `outstandingAssetTransfers`: installs a placeholder, or prepares a coordinator, for each.
     [[nodiscard]] std::vector<SyncAssetPointer> outstandingAssetTransfers() override;
 
     // transfer/TransferEvents.cpp: what happens while packages arrive, and then.
@@ -130,7 +124,6 @@ class AppsClient final : public SyncClient,
                                 const ErrorRecord* error) override;
     /// `assetTransferEndedWithSuccess:`
     void assetTransferEndedWithSuccess(bool success) override;
-
     /// `applicationInstallsArePrioritized:arePaused:`: only InProgressAssetQuery needs these lists.
     void applicationInstallsArePrioritized(const std::vector<AppProxy>& prioritized,
                                            const std::vector<AppProxy>& paused) override;
@@ -149,21 +142,16 @@ class AppsClient final : public SyncClient,
     void assetInstallSucceeded(const SyncAssetPointer& asset) override;
     /// `assetInstallFailed:withError:`
     void assetInstallFailed(const SyncAssetPointer& asset, const ErrorRecord& error) override;
-    /// `_isRecoverableError:`: whether the same operation may succeed later. `error` may be null:
-    /// what failed without saying why is not recoverable. Nor is anything where installs are
-    /// coordinated.
+    /// `_isRecoverableError:`: whether the same operation may succeed later. Never after null,
+    /// which is a failure that does not say why, and never where installs are coordinated.
     [[nodiscard]] bool _isRecoverableError(const ErrorRecord* error) const;
-    /// `_progressForAssetIdentifier:`: null when no install is under way for it, and where installs
-    /// are coordinated.
+    /// `_progressForAssetIdentifier:`: null where none is under way or installs are coordinated.
     [[nodiscard]] std::shared_ptr<InstallProgressRecord> _progressForAssetIdentifier(
-        const std::string& identifier) const;
-    /// `_operationStateForIdentifier:`: the operation of its first entry in the todo list.
-    [[nodiscard]] std::optional<std::string> _operationStateForIdentifier(
         const std::string& identifier) const;
 
     // transfer/RestoreState.cpp: what survives an interrupted session. Any thread.
 
-    /// `_restoreStatePropertyForKey:identifier:version:`: nothing when it, or the version, is
+    /// `_restoreStatePropertyForKey:identifier:version:`: nothing when it or the version is
     /// missing.
     [[nodiscard]] std::optional<PropertyList> _restoreStatePropertyForKey(
         std::string_view key, const std::string& identifier, const std::string* version) const;
@@ -173,17 +161,15 @@ class AppsClient final : public SyncClient,
                                        const std::string& identifier, const std::string* version);
     /// `cleanRestoreStateForIdentifier:`: forgets the application; a damaged file goes altogether.
     void cleanRestoreStateForIdentifier(const std::string& identifier);
-    /// `changeAssetID:toDo:`: rewrites the operation of the first entry with the identifier.
-    void changeAssetID(const std::string& identifier, std::string_view toDo);
 
     // coordination/Coordinators.cpp: what an install is coordinated with. Each makes one object, in
     // the plug-in's name (SyncClientID), and gives null when it cannot. Any thread.
 
     /// `_initiatingOrUpdatingAppInstallCoordinatorForBundleIdentifier:existingApp:createIfNotExisting:error:`:
-    /// the coordinator of an update (`existingApp`) or of a first install. Null, without an error,
-    /// also for one that another client has created. `error` gets the service's answer in any case:
-    /// its error, or nothing.
-    [[nodiscard]] std::shared_ptr<InstallCoordinator>
+    /// that of an update (`existingApp`) or of a first install. Null, without an error, also for
+    /// one that another client has created. `error` gets the service's error in any case, or
+    /// nothing.
+    [[nodiscard]] InstallCoordinatorPointer
     _initiatingOrUpdatingAppInstallCoordinatorForBundleIdentifier(const std::string& identifier,
                                                                   bool existingApp,
                                                                   bool createIfNotExisting,
@@ -192,14 +178,13 @@ class AppsClient final : public SyncClient,
     [[nodiscard]] std::shared_ptr<InstallPlaceholder> _placeHolderForBundleIdentifier(
         const std::string& identifier, const std::string& name, std::uint64_t installType);
     /// `_createAppAssetPromiseForBundleIdentifier:atPath:andAddToCoordinatinator:`: without a path
-    /// a promise of a package that is still to come. `coordinator` may be null. `error` is set when
-    /// the coordinator refuses the promise; that is then cancelled.
+    /// a promise of a package that is still to come. The coordinator may be null; when it refuses
+    /// the promise, that is cancelled, and `error` is set.
     std::shared_ptr<PathTransferPromise> _createAppAssetPromiseForBundleIdentifier(
         const std::string& identifier, const std::optional<std::string>& path,
         InstallCoordinator* coordinator, ErrorOut error = nullptr);
     /// `_createIconPromiseForBundleIdentifier:transferPath:diskSpaceNeeded:andAddToPlaceHolder:forAppInstall:`:
-    /// a promise already kept with the file at `path`. `placeholder` may be null. `error` is set
-    /// when the placeholder refuses the promise; that is then cancelled.
+    /// a promise already kept with the file at `path`. `placeholder` and `error` are as above.
     std::shared_ptr<PathTransferPromise> _createIconPromiseForBundleIdentifier(
         const std::string& identifier, const std::string& path, std::uint64_t diskSpaceNeeded,
         InstallPlaceholder* placeholder, bool forAppInstall, ErrorOut error = nullptr);
@@ -207,19 +192,19 @@ class AppsClient final : public SyncClient,
     [[nodiscard]] std::shared_ptr<OutOfBandPromise> _userDataPromiseForBundleIdentifier(
         const std::string& identifier);
 
-    // coordination/CoordinatedInstall.cpp: `AppInstallUsingCoordination`, the beginning and the
-    // undoing of an install.
+    // The next three groups are the `AppInstallUsingCoordination` interface.
+    // coordination/CoordinatedInstall.cpp: the beginning and the undoing of an install.
 
     /// `prepareAppForInstallUsingCoordination:existingApp:`: sets up the application's coordinator,
-    /// whose placeholder then stands on the home screen until the package comes. Adds only what the
-    /// coordinator lacks, so that it may be called again. False when the install cannot go on; the
-    /// coordinator is cancelled then.
+    /// whose placeholder stands on the home screen until the package comes. Adds what is lacking,
+    /// so it may be called again. False when the install cannot go on; the coordinator is
+    /// cancelled.
     bool prepareAppForInstallUsingCoordination(const SyncAsset& asset, bool existingApp);
     /// `uninstallAppUsingCoordination:`: returns at once. The outcome is only logged.
     void uninstallAppUsingCoordination(const std::string& identifier);
 
-    // coordination/CoordinatedProgress.cpp: `AppInstallUsingCoordination`, the package on its way;
-    // and what the coordination service tells, on threads of its own.
+    // coordination/CoordinatedProgress.cpp: the package on its way; and what the coordination
+    // service tells, on threads of its own.
 
     /// `updateTransferProgressForApp:existingApp:`: whether the promise of the package was updated.
     bool updateTransferProgressForApp(const SyncAsset& asset, bool existingApp);
@@ -230,29 +215,23 @@ class AppsClient final : public SyncClient,
     /// `assetSyncFinishedWithStatus:outstandingItems:`: after a sync that failed, cancels the
     /// coordinators of what has not come.
     void assetSyncFinishedWithStatus(bool status, const std::set<std::string>& outstandingItems);
-
     /// `promiseDidBeginFulfillmentWithIdentifier:`
     void promiseDidBeginFulfillmentWithIdentifier(std::uint64_t promise) override;
     /// `coordinatorDidInstallPlaceholder:`
-    void coordinatorDidInstallPlaceholder(
-        const std::shared_ptr<InstallCoordinator>& coordinator) override;
+    void coordinatorDidInstallPlaceholder(const InstallCoordinatorPointer& coordinator) override;
     /// `coordinatorDidCompleteSuccessfully:`: marks the todo entry as installed or failed.
-    void coordinatorDidCompleteSuccessfully(
-        const std::shared_ptr<InstallCoordinator>& coordinator) override;
+    void coordinatorDidCompleteSuccessfully(const InstallCoordinatorPointer& coordinator) override;
     /// `coordinator:canceledWithReason:client:`: has the host stop the transfer, once.
-    void coordinatorCanceledWithReason(const std::shared_ptr<InstallCoordinator>& coordinator,
+    void coordinatorCanceledWithReason(const InstallCoordinatorPointer& coordinator,
                                        const ErrorRecord& reason,
                                        CoordinationClient client) override;
     /// `coordinatorShouldPrioritize:`: has the host send this application before the others.
-    void coordinatorShouldPrioritize(
-        const std::shared_ptr<InstallCoordinator>& coordinator) override;
-
+    void coordinatorShouldPrioritize(const InstallCoordinatorPointer& coordinator) override;
     /// `setupInstallCoordinatorObserver`: from the first call on the client hears of every
     /// coordinator of the plug-in's. Any thread.
     void setupInstallCoordinatorObserver();
 
-    // coordination/CoordinatedRestore.cpp: `AppInstallUsingCoordination`, an application that a
-    // backup brings back.
+    // coordination/CoordinatedRestore.cpp: an application that a backup brings back.
 
     /// `prepareAppForRestoreUsingCoordination:VessikMetadata:sinfData:iconData:demotionStatus:`:
     /// sets up the application's restoring coordinator. Adds only what that lacks. `sinfData` and
@@ -285,8 +264,7 @@ class AppsClient final : public SyncClient,
     /// `placeholderAppPathForBundleIdentifier:`: creates nothing.
     [[nodiscard]] std::string placeholderAppPathForBundleIdentifier(
         const std::string& identifier) const;
-    /// `createPlaceHolderPath:forBundleIdentifier:withAttributes:`: true also when it exists
-    /// already.
+    /// `createPlaceHolderPath:forBundleIdentifier:withAttributes:`: true also when it was there.
     bool createPlaceHolderPath(const std::string& path, const std::string& identifier,
                                const FileAttributes& attributes);
     /// `writeIconData:atPath:returningFileSize:forBundleIdentifier:withAttributes:`: whether the
@@ -297,12 +275,12 @@ class AppsClient final : public SyncClient,
     /// `_createPlaceHolderApplication:`: builds and installs a placeholder from what the host sent
     /// along with the asset. Failures are logged.
     void _createPlaceHolderApplication(const SyncAsset& asset);
-    /// `_makeIconFromBundlePath:saveTo:`: class operation. Renders a bundle's home-screen icon into
-    /// a PNG file.
+    /// `_makeIconFromBundlePath:saveTo:`: class operation. Renders a bundle's icon into a PNG file.
     [[nodiscard]] static bool _makeIconFromBundlePath(const Platform& platform,
                                                       const std::optional<std::string>& bundlePath,
                                                       const std::string& destination);
-    /// `_placeholderExistsForApplication:`: whether the registry has a bundle of this identifier.
+    /// `_placeholderExistsForApplication:`: whether there is a user bundle of this identifier now.
+    /// Costs the same however many there are. Always false where installs are coordinated.
     [[nodiscard]] bool _placeholderExistsForApplication(const std::string& identifier) const;
     /// `_enumeratePlaceholdersWithBlock:`: calls back once for each placeholder on the device.
     void _enumeratePlaceholdersWithBlock(const AppRegistry::ProxyCallback& callback) const;
@@ -314,13 +292,12 @@ class AppsClient final : public SyncClient,
     /// `reconcileRestoreOfType:withError:`: true and no error, whatever happens.
     bool reconcileRestoreOfType(std::int64_t type, ErrorOut error) override;
     /// `_processVessikRestoreInfo`: makes a placeholder for each application of the restore
-    /// information that has none, waits for those that are still to come, and moves the information
-    /// away. The outcome of the last application that was handed on; false also when the
-    /// information cannot be read.
+    /// information that has none, waits for those still to come, and moves the information away.
+    /// The outcome of the last application handed on; false also when the information cannot be
+    /// read.
     bool _processVessikRestoreInfo();
     /// `_processVessikRestoreInfoForApp:vessikMetaData:sinfData:iconData:`: builds and installs a
-    /// placeholder. `sinfData` and `iconData` may be null. True also when the metadata cannot be
-    /// parsed.
+    /// placeholder. True also when the metadata cannot be parsed. The other data may be null.
     bool _processVessikRestoreInfoForApp(const std::string& identifier, const Bytes& vessikMetaData,
                                          const Bytes* sinfData, const Bytes* iconData);
     /// `_loadDemotedAppsPlist:withError:`: class operation. A map. Nothing when the file is missing
@@ -331,15 +308,13 @@ class AppsClient final : public SyncClient,
 
     // restore/RestoringPlaceholders.cpp: the book of the placeholders that a restore waits for. An
     // identifier is in the set exactly when the wait group holds one entry for it and the count
-    // includes it. Any thread; each runs synchronously on _restoreQueue, so never call one from
-    // there.
+    // includes it. Any thread but _restoreQueue's, on which each runs synchronously.
 
     /// `relocantSetPlaceHolderPromiseForRestoreAppBundle:`: its placeholder is awaited from now on.
     void relocantSetPlaceHolderPromiseForRestoreAppBundle(const std::string& identifier);
     /// `relocantCancelledCoordinatorForRestoreAppBundle:`: it is no longer awaited.
     void relocantCancelledCoordinatorForRestoreAppBundle(const std::string& identifier);
-    /// `tsDidInstallPlaceHolderForAppBundle:`: it has come. Changes nothing once the restore has
-    /// stopped waiting.
+    /// `tsDidInstallPlaceHolderForAppBundle:`: it has come. Ignored once the restore waits no more.
     void tsDidInstallPlaceHolderForAppBundle(const std::string& identifier);
 
   private:
@@ -347,146 +322,30 @@ class AppsClient final : public SyncClient,
 
     explicit AppsClient(const Platform& platform);
 
-    // client/AppsClient.cpp
+    // client/
     void initialize();
-    void makeQueues();
-    void listenForStartup();
-    [[nodiscard]] bool isInsideDaemon() const;
-
-    // client/SyncReconciliation.cpp
-    enum class Takeover { Failed, NothingToDo, Done };
     bool reconcile(ErrorOut error);
-    Takeover takeOverStagingArea(ErrorOut error);
-    void performDeletions(const PropertyList& todoList);
-    void deleteApplication(const std::string& identifier);
-    void clearUninstalledApps();
 
-    // client/InstalledAssets.cpp
-    [[nodiscard]] std::optional<std::vector<std::string>> lookUpUninstalled();
-    void uninstallEveryPlaceholder();
-
-    // transfer/OutstandingTransfers.cpp
-    struct Wants;
-    [[nodiscard]] Wants gatherWants() const;
-    void gatherPlaceholders(Wants& wants) const;
-    void gatherTodoEntries(Wants& wants, const PropertyList& todoList) const;
-    void gatherTodoEntry(Wants& wants, const PropertyList& entry) const;
-    void leaveOutInProgress(Wants& wants) const;
-    void emptyIconDirectory() const;
-    [[nodiscard]] SyncAssetPointer prepareAsset(const PropertyList& itemMap, const Wants& wants,
+    // transfer/
+    [[nodiscard]] SyncAssetPointer prepareAsset(const PropertyList& itemMap,
+                                                const WantedTransfers& wants,
                                                 const RestoreState& restoreState);
-    [[nodiscard]] bool isSkipped(const TransferItem& item, const Wants& wants) const;
-    [[nodiscard]] bool isSkippedRestore(const TransferItem& item) const;
-    [[nodiscard]] bool isSkippedSystemApp(const TransferItem& item, const Wants& wants) const;
-    [[nodiscard]] bool isSkippedDemotedApp(const TransferItem& item, const Wants& wants) const;
-    [[nodiscard]] SyncAssetPointer makeAsset(const TransferItem& item,
-                                             const RestoreState& restoreState) const;
-    [[nodiscard]] unsigned assetPartsFor(const TransferItem& item,
-                                         const RestoreState& restoreState) const;
-    bool createMissingPlaceholder(const SyncAsset& asset, const Wants& wants);
     bool prepareCoordinator(const SyncAsset& asset);
-    [[nodiscard]] bool isExistingApp(const std::string& identifier) const;
-
-    // transfer/TransferEvents.cpp
-    struct TransferEnd;
-    void updateProgressRecord(const std::string& identifier, double fraction) const;
-    void transferDidSucceed(const TransferEnd& end);
-    void finishLoading(const TransferEnd& end) const;
-    void resolvePath(SyncAsset& asset) const;
-    void packageDidArrive(const TransferEnd& end);
-    void syncedPackageDidArrive(const TransferEnd& end);
-    void restorePackageDidArrive(const TransferEnd& end);
-    void restoreDataDidArrive(const TransferEnd& end);
-    void transferDidFail(const TransferEnd& end, const ErrorRecord* error);
-    void giveUpInstall(const TransferEnd& end, const ErrorRecord* error);
-    void giveUpRestore(const std::string& identifier) const;
-    void removePlaceholder(const std::string& identifier) const;
-    void closeOutstandingTransfers(const std::set<std::string>& outstanding, bool success);
-
-    // transfer/InstallQueue.cpp
-    bool isGranted(const std::string& identifier, int outcome);
     void runInstall(const SyncAssetPointer& asset);
     void install(const SyncAssetPointer& asset);
     void scheduleRetry(const SyncAssetPointer& asset);
-    void reenqueue(const SyncAssetPointer& asset);
     void installDidFailUnrecoverably(const SyncAsset& asset, const ErrorRecord& error);
-    void giveUpFailedRestore(const std::string& identifier) const;
-    void removeFailedInstall(const SyncAsset& asset);
-    void uninstallFailedInstall(const std::string& identifier);
-    void recordInstall(bool success, const std::string& identifier, std::string_view description);
-    void recordRestore(bool success, const std::string& identifier, std::string_view description);
 
-    // coordination/CoordinatedInstall.cpp
-    struct Preparation;
-    bool prepare(Preparation& preparation);
-    bool addInstallOptions(Preparation& preparation);
-    bool addODRAssetPromises(Preparation& preparation);
-    bool addAppAssetPromise(Preparation& preparation);
-    bool addPlaceholderPromise(Preparation& preparation);
-    void makePlaceholder(Preparation& preparation);
-    void configurePlaceholder(Preparation& preparation);
-    [[nodiscard]] std::uint64_t copyIconForPlaceholder(Preparation& preparation,
-                                                       const std::string& iconPath);
-    bool addIconPromise(Preparation& preparation, const std::string& iconPath, std::uint64_t size);
-    bool setPlaceholderAttributes(Preparation& preparation);
-    bool setPlaceholderMetadata(Preparation& preparation);
-    void setPlaceholderComplete(Preparation& preparation);
-    void cancelPreparation(const Preparation& preparation);
-
-    // coordination/CoordinatedProgress.cpp
-    [[nodiscard]] std::shared_ptr<InstallCoordinator> coordinatorUnderWay(
-        const std::string& identifier, bool existingApp);
-    void cancelForFailedTransfer(InstallCoordinator& coordinator, const ErrorRecord& error);
-    void keepAppAssetPromise(const SyncAsset& asset, InstallCoordinator& coordinator);
-    void prioritizeTransfer(const std::string& identifier);
-
-    // restore/RestoringPlaceholders.cpp
-    void stopAwaitingPlaceholder(const std::string& identifier);
-
-    // restore/PlaceholderBundles.cpp
-    void willCreatePlaceholder(const std::string& identifier, const PropertyList& info) const;
-    bool installPlaceholder(const std::string& directory, const PropertyList& info,
-                            const PropertyList& options);
-    void didFindPlaceholder(const std::string& identifier) const;
-    void copyIcon(const SyncAsset& asset, const std::string& directory) const;
-
-    // restore/RestoreInfo.cpp
-    struct RestoreFacts;
-    [[nodiscard]] std::optional<PropertyList> readRestoreInfo() const;
-    bool restoreApps(const PropertyList& restoreInfo);
-    [[nodiscard]] RestoreFacts gatherRestoreFacts() const;
-    std::optional<bool> restoreApp(const std::string& identifier, const PropertyList& info,
-                                   const RestoreFacts& facts);
+    // restore/
     void waitForRestoringPlaceholders();
-    void putRestoreInfoAway() const;
-    [[nodiscard]] Result<PropertyList> parseVessikMetadata(const std::string& identifier,
-                                                           const Bytes& data,
-                                                           Level failureLevel) const;
-    bool installRestorePlaceholder(const RestoredApp& app, const PropertyList& metadata);
-    bool writeRestorePlaceholderInfo(const std::string& directory, const std::string& identifier,
-                                     const PropertyList& info);
-    void recordAppRestore(bool success, const std::string& identifier,
-                          std::string_view description);
-
-    // coordination/CoordinatedRestore.cpp
-    struct CoordinatedRestore;
-    bool beginRestore(CoordinatedRestore& restore, CoordinatorKind kind);
-    [[nodiscard]] bool isLeftToAppStore(const CoordinatedRestore& restore) const;
-    bool addRestorePromises(CoordinatedRestore& restore);
-    bool addUserDataPromise(CoordinatedRestore& restore);
-    bool addRestorePlaceholder(CoordinatedRestore& restore);
-    bool leaveToAppStore(CoordinatedRestore& restore);
-    void giveRestoreUp(const CoordinatedRestore& restore);
-    bool addRestoreIcon(const std::string& identifier, const std::string& path, std::uint64_t size,
-                        InstallPlaceholder& placeholder);
+    void stopAwaitingPlaceholder(const std::string& identifier);
 
     // In the order in which they are set up. Only the thread of the SyncHost touches a member for
     // which nothing else is said.
 
     std::shared_ptr<WaitGroup> _installGroup;  // guards itself; installs hold it too
     std::unique_ptr<WaitGroup> _restorePlaceHoldersWaitGroup;  // guards itself
-    // The SyncHost's thread meets the registry's here, which reports cancelled installs: the set
-    // guards itself, with a mutex that is never held across a call of the platform.
+    // Guards itself: the SyncHost's thread meets the registry's, which reports cancelled installs.
     SharedIdentifierSet _outstandingHFTTransfers;
     std::set<std::string> _kolmAppsToIgnore;
     std::set<std::string> _placeholdersForRestoringApps;     // only on _restoreQueue
@@ -511,10 +370,9 @@ class AppsClient final : public SyncClient,
     // Who turns it to true makes the observer; nobody else touches that before the destructor.
     std::atomic<bool> isAppInstallObserverSetUp_{false};
 
-    // Each held across a whole edit of its file (read, change, write), so that edits on several
-    // threads lose nothing; the first also while the directory of the todo list is replaced. Who
-    // needs both takes them in this order. Reading needs neither: the files are replaced
-    // atomically.
+    // Each held across a whole edit of its file, so that edits on several threads lose nothing; the
+    // first also while the directory of the todo list is replaced. Who needs both takes them in
+    // this order. Reading needs neither: the files are replaced atomically.
     std::unique_ptr<Lock> todoListLock_;
     std::unique_ptr<Lock> restoreStateLock_;
 };

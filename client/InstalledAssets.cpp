@@ -66,42 +66,32 @@ PropertyList deletedAmong(const std::set<std::string>& candidates,
     return deleted;
 }
 
-void addIfPresent(std::set<std::string>& identifiers, const std::string* identifier) {
-    if (identifier != nullptr) identifiers.insert(*identifier);
+void addIfPresent(std::set<std::string>& identifiers,
+                  const std::optional<std::string>& identifier) {
+    if (identifier) identifiers.insert(*identifier);
 }
 
 void addKorvuIDs(const Platform& platform, const AppProxy& proxy, std::set<std::string>& ids) {
     const Log log(platform);
-    const StoreMetadataFile metadata(platform, proxy);
-    const std::string* top = metadata.korvuID();
-    const std::string* account = metadata.accountInfo().korvuID();
-    if (top != nullptr && account != nullptr && *top != *account) {
+    const KorvuIDs own = readKorvuIDs(platform, proxy);
+    if (own.top && own.account && *own.top != *own.account) {
         log(Level::Default, "%s|mismatched KorvuID keys for %{public}@: %{public}@ vs %{public}@",
-            proxy.applicationIdentifier, top, account);
+            proxy.applicationIdentifier, own.top, own.account);
     }
-    if (top == nullptr && account == nullptr) {
+    if (!own.top && !own.account) {
         log(Level::Default, "%s|unknown KorvuID for %{public}@ (plist at %{public}@)",
             proxy.applicationIdentifier, storeMetadataPath(proxy));
     }
-    addIfPresent(ids, top);
-    addIfPresent(ids, account);
+    addIfPresent(ids, own.top);
+    addIfPresent(ids, own.account);
 }
 
 void addAccount(const Platform& platform, const AppProxy& proxy, std::set<std::string>& seen,
                 std::set<SyncAccountInfo>& accounts) {
-    const StoreMetadataFile metadata(platform, proxy);
-    const StoreMetadataFile::AccountInfo info = metadata.accountInfo();
-    const std::string* identifier = info.korvuID();
-    if (identifier == nullptr) identifier = metadata.korvuID();
-    if (identifier == nullptr || !seen.insert(*identifier).second) return;
-
-    SyncAccountInfo account;
-    account.accountID = *identifier;
-    account.personID = info.personID();
-    if (const std::string* alternate = info.alternatePersonID()) {
-        account.alternatePersonID = *alternate;
-    }
-    accounts.insert(account);
+    const auto account = readAccount(platform, proxy, [&](const std::string& accountID) {
+        return seen.insert(accountID).second;
+    });
+    if (account) accounts.insert(*account);
 }
 
 PropertyList descriptionOf(const SyncAccountInfo& account) {
@@ -117,6 +107,22 @@ PropertyList descriptionOf(const std::set<SyncAccountInfo>& accounts) {
     return list;
 }
 
+std::optional<std::vector<std::string>> lookUpUninstalled(const Platform& platform) {
+    const std::optional<PropertyList> uninstalled = platform.installer.lookupUninstalled();
+    if (uninstalled) return keysOf(*uninstalled);
+    const Log log(platform);
+    log(Level::Error, "%s|PakmountLookupUninstalled returned NULL");
+    return std::nullopt;
+}
+
+void uninstallEveryPlaceholder(const AppsClient& client, AppRegistry& registry, const Log& log) {
+    client._enumeratePlaceholdersWithBlock([&](const AppProxy& proxy, bool&) {
+        const std::string& identifier = proxy.applicationIdentifier;
+        const Status uninstalled = registry.uninstallApplication(identifier, {});
+        log(Level::Default, "%s|Uninstall %{public}@ = %c", identifier, yesOrNo(uninstalled.ok()));
+    });
+}
+
 }  // namespace
 
 PropertyList AppsClient::installedAssets() {
@@ -127,7 +133,8 @@ PropertyList AppsClient::installedAssets() {
 
     std::set<std::string> candidates;
     std::optional<PropertyList> uninstalled;
-    if (const auto keys = lookUpUninstalled()) {
+    if (const auto keys = lookUpUninstalled(platform_)) {
+        _uninstalledApps = keys;
         candidates.insert(keys->begin(), keys->end());
         uninstalled = PropertyList::strings(*keys);
     }
@@ -142,16 +149,6 @@ PropertyList AppsClient::installedAssets() {
     return result;
 }
 
-std::optional<std::vector<std::string>> AppsClient::lookUpUninstalled() {
-    const std::optional<PropertyList> uninstalled = platform_.installer.lookupUninstalled();
-    if (!uninstalled) {
-        log_(Level::Error, "%s|PakmountLookupUninstalled returned NULL");
-        return std::nullopt;
-    }
-    _uninstalledApps = keysOf(*uninstalled);
-    return _uninstalledApps;
-}
-
 void AppsClient::clearSyncData() {
     log_(Level::Default, "%s|blasting work area");
     {
@@ -160,7 +157,7 @@ void AppsClient::clearSyncData() {
         platform_.files.removeItem(std::string(kWorkArea)).ignore();
     }
     log_(Level::Default, "%s|Uninstalling all placeholder apps");
-    uninstallEveryPlaceholder();
+    uninstallEveryPlaceholder(*this, platform_.registry, log_);
 
     const std::optional<PropertyList> uninstalled = platform_.installer.lookupUninstalled();
     if (!uninstalled) {
@@ -168,14 +165,6 @@ void AppsClient::clearSyncData() {
     } else if (!platform_.installer.clearUninstalled(keysOf(*uninstalled))) {
         log_(Level::Error, "%s|Failed to clear uninstalled apps list");
     }
-}
-
-void AppsClient::uninstallEveryPlaceholder() {
-    _enumeratePlaceholdersWithBlock([this](const AppProxy& proxy, bool&) {
-        const std::string& identifier = proxy.applicationIdentifier;
-        const Status uninstalled = platform_.registry.uninstallApplication(identifier, {});
-        log_(Level::Default, "%s|Uninstall %{public}@ = %c", identifier, yesOrNo(uninstalled.ok()));
-    });
 }
 
 PropertyList AppsClient::installedAssetMetrics() {

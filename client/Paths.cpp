@@ -16,4 +16,9 @@ std::string formatPath(std::string_view format, std::initializer_list<std::strin
     return path += format;
 }
 
+std::string receivedFilePath(const std::string& path) {
+    if (path.starts_with('/')) return path;
+    return formatPath(kInDirectoryFormat, {kPublicStaging, path});
+}
+
 }  // namespace appsync

@@ -52,4 +52,8 @@ inline constexpr std::string_view kIconFormat = "%s/%@.png";
 [[nodiscard]] std::string formatPath(std::string_view format,
                                      std::initializer_list<std::string_view> parts);
 
+/// Where a received file lies: a path that does not begin with "/" is relative to the public
+/// staging directory.
+[[nodiscard]] std::string receivedFilePath(const std::string& path);
+
 }  // namespace appsync

@@ -3,6 +3,7 @@
 #include <cstdint>
 #include <utility>
 
+#include "client/Log.h"
 #include "platform/FileSystem.h"
 #include "platform/Platform.h"
 
@@ -30,14 +31,24 @@ std::optional<PropertyList> readMapFile(const Platform& platform, const std::str
     return *std::move(map);
 }
 
-std::optional<Result<PropertyList>> readListFile(const Platform& platform, std::string_view path,
-                                                 ErrorOut error) {
+std::optional<PropertyList> readListFile(const Platform& platform, std::string_view path,
+                                         bool (PropertyList::*isExpected)() const noexcept,
+                                         const ListFileMessages& messages, ErrorOut error) {
     const Result<Bytes> bytes = platform.files.readFile(std::string(path));
     if (!bytes && error != nullptr) *error = bytes.error();
     if (!bytes || bytes->empty()) return std::nullopt;
+    const Log log(platform);
     Result<PropertyList> list = platform.propertyLists.parse(*bytes);
-    if (!list && error != nullptr) *error = list.error();
-    return list;
+    if (!list) {
+        if (error != nullptr) *error = list.error();
+        log(Level::Error, messages.damaged);
+        return std::nullopt;
+    }
+    if (!((*list).*isExpected)()) {
+        log(Level::Error, messages.unexpected);
+        return std::nullopt;
+    }
+    return *std::move(list);
 }
 
 Status writePropertyListFile(const Platform& platform, const std::string& path,

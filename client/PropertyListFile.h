@@ -4,6 +4,7 @@
 #include <string>
 #include <string_view>
 
+#include "client/LogFormat.h"
 #include "platform/Bytes.h"
 #include "platform/PropertyList.h"
 #include "platform/PropertyListSerialization.h"
@@ -17,11 +18,19 @@ struct Platform;
 /// hold something else.
 [[nodiscard]] Result<PropertyList> parseMap(const Platform& platform, ByteView bytes);
 
-/// What a file of the plug-in's own holds: nothing when it is missing or empty, else what the
-/// reader says. An error, of reading the file or its contents, is left in `error` too.
-[[nodiscard]] std::optional<Result<PropertyList>> readListFile(const Platform& platform,
-                                                               std::string_view path,
-                                                               ErrorOut error);
+/// What is logged of a list file that cannot be parsed, and of one that holds something else.
+struct ListFileMessages {
+    LogFormat<true> damaged;
+    LogFormat<true> unexpected;
+};
+/// The value in a file of the plug-in's own. Nothing when the file is missing or empty (not
+/// logged), damaged or not what is expected (logged). `error` gets the error of reading or parsing.
+[[nodiscard]] std::optional<PropertyList> readListFile(const Platform& platform,
+                                                       std::string_view path,
+                                                       bool (PropertyList::*isExpected)()
+                                                           const noexcept,
+                                                       const ListFileMessages& messages,
+                                                       ErrorOut error);
 
 /// The map in a property-list file, either encoding. Nothing when the file is missing, cannot be
 /// read or parsed, or holds something else.

@@ -1,7 +1,10 @@
 #include "client/StoreMetadataFile.h"
 
+#include <cstdint>
 #include <string_view>
+#include <utility>
 
+#include "client/Log.h"
 #include "client/Paths.h"
 #include "client/PropertyListFile.h"
 #include "platform/AppRegistry.h"
@@ -32,10 +35,34 @@ const PropertyList* typedValue(const Log& log, const PropertyList* map, std::str
     return nullptr;
 }
 
-const std::string* typedString(const Log& log, const PropertyList* map, std::string_view key,
-                               std::string_view name) {
+std::optional<std::string> typedString(const Log& log, const PropertyList* map,
+                                       std::string_view key, std::string_view name) {
     const PropertyList* value = typedValue(log, map, key, name, isText);
-    return value != nullptr ? value->asString() : nullptr;
+    return value != nullptr ? std::optional(*value->asString()) : std::nullopt;
+}
+
+std::optional<PropertyList> readStoreMetadata(const Platform& platform, const AppProxy& proxy) {
+    return readMapFile(platform, storeMetadataPath(proxy));
+}
+
+std::optional<std::string> topKorvuID(const Log& log, const PropertyList& metadata) {
+    return typedString(log, &metadata, kKorvuIdKey, kKorvuIdName);
+}
+
+/// What the download information says of the account; null when there is nothing.
+const PropertyList* accountInfoIn(const Log& log, const PropertyList& metadata) {
+    const PropertyList* downloadInfo =
+        typedValue(log, &metadata, kDownloadInfoKey, kDownloadInfoName, isMap);
+    return typedValue(log, downloadInfo, kAccountInfoKey, kAccountInfoKey, isMap);
+}
+
+std::optional<std::string> accountKorvuID(const Log& log, const PropertyList* accountInfo) {
+    return typedString(log, accountInfo, kAccountKorvuIdKey, kAccountKorvuIdKey);
+}
+
+std::optional<std::int64_t> personIDIn(const Log& log, const PropertyList* accountInfo) {
+    const PropertyList* value = typedValue(log, accountInfo, kPersonIdKey, kPersonIdKey, isNumber);
+    return value != nullptr ? value->asInteger() : std::nullopt;
 }
 
 }  // namespace
@@ -44,31 +71,33 @@ std::string storeMetadataPath(const AppProxy& proxy) {
     return formatPath(kStoreMetadataFormat, {proxy.bundleContainerPath});
 }
 
-StoreMetadataFile::StoreMetadataFile(const Platform& platform, const AppProxy& proxy)
-    : log_(platform),
-      map_(readMapFile(platform, storeMetadataPath(proxy)).value_or(PropertyList())) {}
-
-const std::string* StoreMetadataFile::korvuID() const {
-    return typedString(log_, &map_, kKorvuIdKey, kKorvuIdName);
+KorvuIDs readKorvuIDs(const Platform& platform, const AppProxy& proxy) {
+    const std::optional<PropertyList> metadata = readStoreMetadata(platform, proxy);
+    if (!metadata) return {};
+    const Log log(platform);
+    KorvuIDs ids;
+    ids.top = topKorvuID(log, *metadata);
+    ids.account = accountKorvuID(log, accountInfoIn(log, *metadata));
+    return ids;
 }
 
-StoreMetadataFile::AccountInfo StoreMetadataFile::accountInfo() const {
-    const PropertyList* downloadInfo =
-        typedValue(log_, &map_, kDownloadInfoKey, kDownloadInfoName, isMap);
-    return {log_, typedValue(log_, downloadInfo, kAccountInfoKey, kAccountInfoKey, isMap)};
-}
+std::optional<SyncAccountInfo> readAccount(
+    const Platform& platform, const AppProxy& proxy,
+    const std::function<bool(const std::string& accountID)>& isWanted) {
+    const std::optional<PropertyList> metadata = readStoreMetadata(platform, proxy);
+    if (!metadata) return std::nullopt;
+    const Log log(platform);
+    const PropertyList* info = accountInfoIn(log, *metadata);
+    std::optional<std::string> identifier = accountKorvuID(log, info);
+    if (!identifier) identifier = topKorvuID(log, *metadata);
+    if (!identifier || !isWanted(*identifier)) return std::nullopt;
 
-const std::string* StoreMetadataFile::AccountInfo::korvuID() const {
-    return typedString(log_, map_, kAccountKorvuIdKey, kAccountKorvuIdKey);
-}
-
-std::optional<std::int64_t> StoreMetadataFile::AccountInfo::personID() const {
-    const PropertyList* value = typedValue(log_, map_, kPersonIdKey, kPersonIdKey, isNumber);
-    return value != nullptr ? value->asInteger() : std::nullopt;
-}
-
-const std::string* StoreMetadataFile::AccountInfo::alternatePersonID() const {
-    return typedString(log_, map_, kAlternatePersonIdKey, kAlternatePersonIdKey);
+    SyncAccountInfo account;
+    account.accountID = *std::move(identifier);
+    account.personID = personIDIn(log, info);
+    account.alternatePersonID =
+        typedString(log, info, kAlternatePersonIdKey, kAlternatePersonIdKey);
+    return account;
 }
 
 }  // namespace appsync

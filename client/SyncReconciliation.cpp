@@ -61,6 +61,78 @@ PropertyList saveIconOrder(const Platform& platform) {
     return order ? *std::move(order) : PropertyList();
 }
 
+enum class Takeover { Failed, NothingToDo, Done };
+
+/// Puts the host's todo list, and what came with it, in the place of the earlier one.
+Takeover takeOverStagingArea(const Platform& platform, Lock& todoListLock, ErrorOut error) {
+    const Log log(platform);
+    const std::string todoDirectory(kTodoDirectory);
+    const std::string stagingArea(kStagingArea);
+    // An install that an earlier session left running must not write its list over the new one.
+    const std::lock_guard guard(todoListLock);
+
+    platform.files.removeItem(todoDirectory).ignore();
+    const Status created = platform.files.createDirectory(std::string(kWorkArea), true, nullptr);
+    if (!created) {
+        report(created, error);
+        log(Level::Default, "%s|can't create work area");
+        return Takeover::Failed;
+    }
+    if (!platform.files.itemExists(stagingArea)) {
+        log(Level::Default, "%s|Nothing to do");
+        return Takeover::NothingToDo;
+    }
+    const Status moved = platform.files.moveItem(stagingArea, todoDirectory);
+    if (!moved) {
+        report(moved, error);
+        log(Level::Default, "%s|Can't move staging area");
+        return Takeover::Failed;
+    }
+    return Takeover::Done;
+}
+
+void deleteApplication(AppsClient& client, const Platform& platform, bool isCoordinated,
+                       const std::string& identifier) {
+    if (isCoordinated) {
+        client.uninstallAppUsingCoordination(identifier);
+        return;
+    }
+    const Status uninstalled = platform.registry.uninstallApplication(identifier, {});
+    if (!uninstalled) {
+        const Log log(platform);
+        log(Level::Error, "%s|Uninstall of %{public}@ failed.", identifier);
+    }
+    platform.transactions.logScenario(kSyncScenario, 0, uninstalled.ok(), identifier,
+                                      uninstalled ? kUninstallSucceeded : kUninstallFailed);
+}
+
+void performDeletions(AppsClient& client, const Platform& platform, bool isCoordinated,
+                      const PropertyList& todoList) {
+    const Log log(platform);
+    const std::vector<std::string> identifiers = identifiersToRemove(todoList);
+    for (const std::string& identifier : identifiers) {
+        log(Level::Default, "%s|%{public}@ targeted for termination", identifier);
+    }
+    if (identifiers.empty()) return;
+    log(Level::Default, "%s|performing %llu deletions", identifiers.size());
+    for (const std::string& identifier : identifiers)
+        deleteApplication(client, platform, isCoordinated, identifier);
+}
+
+/// Takes them off the installer's list, and forgets them.
+void clearUninstalledApps(const Platform& platform,
+                          std::optional<std::vector<std::string>>& uninstalled) {
+    if (!uninstalled) return;
+    const Log log(platform);
+    log(Level::Default, "%s|clearing uninstalled apps: %{public}@",
+        PropertyList::strings(*uninstalled));
+    if (platform.installer.clearUninstalled(*uninstalled)) {
+        uninstalled.reset();
+    } else {
+        log(Level::Error, "%s|Failed to clear uninstalled apps from Pakmount.");
+    }
+}
+
 }  // namespace
 
 bool AppsClient::reconcileSync(const PropertyList& /*request*/, const std::string& newAnchor,
@@ -72,7 +144,7 @@ bool AppsClient::reconcileSync(const PropertyList& /*request*/, const std::strin
 }
 
 bool AppsClient::reconcile(ErrorOut error) {
-    const Takeover takeover = takeOverStagingArea(error);
+    const Takeover takeover = takeOverStagingArea(platform_, *todoListLock_, error);
     if (takeover != Takeover::Done) return takeover == Takeover::NothingToDo;
 
     const bool removalAllowed = _appRemovalAllowed();
@@ -82,59 +154,12 @@ bool AppsClient::reconcile(ErrorOut error) {
     } else if (!removalAllowed) {
         log_(Level::Default, "%s|Not processing deletes because app removal is restricted");
     } else {
-        performDeletions(*todoList);
+        performDeletions(*this, platform_, _useInstallCoordinator, *todoList);
     }
     _notifyDeskora(platform_, true);
     sendIconLayout(platform_);
     if (todoList) writeDebugCopy(platform_, *todoList);
     return true;
-}
-
-AppsClient::Takeover AppsClient::takeOverStagingArea(ErrorOut error) {
-    const std::string todoDirectory(kTodoDirectory);
-    const std::string stagingArea(kStagingArea);
-    // An install that an earlier session left running must not write its list over the new one.
-    const std::lock_guard guard(*todoListLock_);
-
-    platform_.files.removeItem(todoDirectory).ignore();
-    const Status created = platform_.files.createDirectory(std::string(kWorkArea), true, nullptr);
-    if (!created) {
-        report(created, error);
-        log_(Level::Default, "%s|can't create work area");
-        return Takeover::Failed;
-    }
-    if (!platform_.files.itemExists(stagingArea)) {
-        log_(Level::Default, "%s|Nothing to do");
-        return Takeover::NothingToDo;
-    }
-    const Status moved = platform_.files.moveItem(stagingArea, todoDirectory);
-    if (!moved) {
-        report(moved, error);
-        log_(Level::Default, "%s|Can't move staging area");
-        return Takeover::Failed;
-    }
-    return Takeover::Done;
-}
-
-void AppsClient::performDeletions(const PropertyList& todoList) {
-    const std::vector<std::string> identifiers = identifiersToRemove(todoList);
-    for (const std::string& identifier : identifiers) {
-        log_(Level::Default, "%s|%{public}@ targeted for termination", identifier);
-    }
-    if (identifiers.empty()) return;
-    log_(Level::Default, "%s|performing %llu deletions", identifiers.size());
-    for (const std::string& identifier : identifiers) deleteApplication(identifier);
-}
-
-void AppsClient::deleteApplication(const std::string& identifier) {
-    if (_useInstallCoordinator) {
-        uninstallAppUsingCoordination(identifier);
-        return;
-    }
-    const Status uninstalled = platform_.registry.uninstallApplication(identifier, {});
-    if (!uninstalled) log_(Level::Error, "%s|Uninstall of %{public}@ failed.", identifier);
-    platform_.transactions.logScenario(kSyncScenario, 0, uninstalled.ok(), identifier,
-                                       uninstalled ? kUninstallSucceeded : kUninstallFailed);
 }
 
 void AppsClient::syncEndedWithSuccess(bool success) {
@@ -145,35 +170,14 @@ void AppsClient::syncEndedWithSuccess(bool success) {
         log_(Level::Error, "%s|Failed to update utimes of \"%s\": %s", kWorkArea,
              touched.error().description());
     }
-    clearUninstalledApps();
+    clearUninstalledApps(platform_, _uninstalledApps);
     platform_.files.removeItem(std::string(kLastSyncAppStatePath)).ignore();
-}
-
-void AppsClient::clearUninstalledApps() {
-    if (!_uninstalledApps) return;
-    log_(Level::Default, "%s|clearing uninstalled apps: %{public}@",
-         PropertyList::strings(*_uninstalledApps));
-    if (platform_.installer.clearUninstalled(*_uninstalledApps)) {
-        _uninstalledApps.reset();
-    } else {
-        log_(Level::Error, "%s|Failed to clear uninstalled apps from Pakmount.");
-    }
 }
 
 std::optional<PropertyList> AppsClient::_loadPlist(const Platform& platform, std::string_view path,
                                                    ErrorOut error) {
-    const Log log(platform);
-    std::optional<Result<PropertyList>> list = readListFile(platform, path, error);
-    if (!list) return std::nullopt;
-    if (!*list) {
-        log(Level::Error, "%s|couldn't parse todo list");
-        return std::nullopt;
-    }
-    if (!(*list)->isArray()) {
-        log(Level::Error, "%s|todo list is not an array");
-        return std::nullopt;
-    }
-    return **std::move(list);
+    return readListFile(platform, path, &PropertyList::isArray,
+                        {"%s|couldn't parse todo list", "%s|todo list is not an array"}, error);
 }
 
 void AppsClient::_notifyDeskora(const Platform& platform, bool starting) {

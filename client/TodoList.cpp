@@ -1,5 +1,11 @@
 #include "client/TodoList.h"
 
+#include <mutex>
+#include <utility>
+
+#include "client/AppsClient.h"
+#include "client/Paths.h"
+#include "client/PropertyListFile.h"
 #include "client/SafeIdentifier.h"
 
 namespace appsync {
@@ -7,15 +13,6 @@ namespace appsync {
 bool hasOperation(const PropertyList& entry, std::string_view operation) {
     const std::string* own = entry.findString(kTodoOperationKey);
     return own != nullptr && *own == operation;
-}
-
-std::optional<std::size_t> indexOfEntry(const PropertyList& todoList, std::string_view identifier) {
-    const auto entries = todoList.elements();
-    for (std::size_t index = 0; index < entries.size(); ++index) {
-        const std::string* own = entries[index].findString(kTodoIdentifierKey);
-        if (own != nullptr && *own == identifier) return index;
-    }
-    return std::nullopt;
 }
 
 std::vector<std::string> identifiersToRemove(const PropertyList& todoList) {
@@ -31,17 +28,49 @@ std::vector<std::string> identifiersToRemove(const PropertyList& todoList) {
     return identifiers;
 }
 
-TodoIndex::TodoIndex(const PropertyList& todoList) {
-    entries_.reserve(todoList.size());
-    for (const PropertyList& entry : todoList.elements()) {
-        const std::string* identifier = entry.findString(kTodoIdentifierKey);
-        if (identifier != nullptr) entries_.try_emplace(*identifier, &entry);
+TodoIndex::TodoIndex(const PropertyList& todoList) : todoList_(todoList) {
+    const auto entries = todoList.elements();
+    indexes_.reserve(entries.size());
+    for (std::size_t index = 0; index < entries.size(); ++index) {
+        const std::string* identifier = entries[index].findString(kTodoIdentifierKey);
+        if (identifier != nullptr) indexes_.try_emplace(*identifier, index);
     }
 }
 
+std::optional<std::size_t> TodoIndex::indexOf(std::string_view identifier) const {
+    const auto found = indexes_.find(identifier);
+    return found == indexes_.end() ? std::nullopt : std::optional(found->second);
+}
+
 const PropertyList* TodoIndex::find(std::string_view identifier) const {
-    const auto found = entries_.find(identifier);
-    return found == entries_.end() ? nullptr : found->second;
+    const std::optional<std::size_t> index = indexOf(identifier);
+    return index ? todoList_.at(*index) : nullptr;
+}
+
+std::optional<std::string> AppsClient::_operationStateForIdentifier(
+    const std::string& identifier) const {
+    const std::optional<PropertyList> todoList = _loadPlist(platform_, kTodoListPath, nullptr);
+    if (!todoList) return std::nullopt;
+    const PropertyList* entry = TodoIndex(*todoList).find(identifier);
+    const std::string* operation =
+        entry != nullptr ? entry->findString(kTodoOperationKey) : nullptr;
+    return operation != nullptr ? std::optional(*operation) : std::nullopt;
+}
+
+void AppsClient::changeAssetID(const std::string& identifier, std::string_view toDo) {
+    const std::lock_guard guard(*todoListLock_);
+    std::optional<PropertyList> todoList = _loadPlist(platform_, kTodoListPath, nullptr);
+    if (!todoList) return;
+    const std::optional<std::size_t> index = TodoIndex(*todoList).indexOf(identifier);
+    if (!index) return;
+    PropertyList entry = todoList->take(*index);
+    log_(Level::Default, "%s|Changing %{public}@ from %{public}@ to %{public}@", identifier,
+         entry.find(kTodoOperationKey), toDo);
+    entry.set(kTodoOperationKey, toDo);
+    todoList->set(*index, std::move(entry));
+    writePropertyListFile(platform_, std::string(kTodoListPath), *todoList,
+                          PropertyListFormat::Binary)
+        .ignore();
 }
 
 }  // namespace appsync

@@ -30,10 +30,6 @@ inline constexpr std::string_view kTodoFailed = "FAILED";
 /// Whether the entry's operation is exactly this one.
 [[nodiscard]] bool hasOperation(const PropertyList& entry, std::string_view operation);
 
-/// Where the first entry with this identifier stands.
-[[nodiscard]] std::optional<std::size_t> indexOfEntry(const PropertyList& todoList,
-                                                      std::string_view identifier);
-
 /// The identifiers that the list asks to remove and that are safe, in its order.
 [[nodiscard]] std::vector<std::string> identifiersToRemove(const PropertyList& todoList);
 
@@ -42,11 +38,14 @@ class TodoIndex {
   public:
     explicit TodoIndex(const PropertyList& todoList);
 
-    /// The first entry with this identifier; null when there is none.
+    /// Where the first entry with this identifier stands; nothing when there is none.
+    [[nodiscard]] std::optional<std::size_t> indexOf(std::string_view identifier) const;
+    /// That entry; null when there is none.
     [[nodiscard]] const PropertyList* find(std::string_view identifier) const;
 
   private:
-    std::unordered_map<std::string_view, const PropertyList*> entries_;
+    const PropertyList& todoList_;
+    std::unordered_map<std::string_view, std::size_t> indexes_;
 };
 
 }  // namespace appsync

@@ -1,4 +1,4 @@
-#include <utility>
+#include "coordination/CoordinatedInstall.h"
 
 #include "client/AppsClient.h"
 #include "client/Paths.h"
@@ -10,31 +10,6 @@
 #include "restore/PlaceholderBundle.h"
 
 namespace appsync {
-
-/// One run of `prepareAppForInstallUsingCoordination`.
-struct AppsClient::Preparation {
-    // What the asset says. The info dictionary is absent when it cannot be read.
-    const SyncAsset& asset;
-    const std::optional<PropertyList> info;
-    const StoreMetadata storeMetadata;
-    bool existingApp = false;
-
-    // What has been made so far.
-    std::shared_ptr<InstallCoordinator> coordinator{};
-    // Absent where the coordinator had its install options already.
-    std::optional<StoreMetadata> storeRecord{};
-    std::shared_ptr<InstallPlaceholder> placeholder{};
-    bool isPlaceholderAccepted = false;
-    // The last failure of any step.
-    std::optional<ErrorRecord> lastError{};
-
-    [[nodiscard]] const std::string& identifier() const { return asset.identifier; }
-    /// Whether the step succeeded; if not, keeps its error.
-    bool note(const Status& status) {
-        if (!status) lastError = status.error();
-        return status.ok();
-    }
-};
 
 namespace {
 
@@ -64,123 +39,115 @@ const ErrorRecord* errorOf(const Status& status) { return status ? nullptr : &st
 
 }  // namespace
 
-bool AppsClient::prepareAppForInstallUsingCoordination(const SyncAsset& asset, bool existingApp) {
-    const std::string& identifier = asset.identifier;
-    Preparation preparation{.asset = asset,
-                            .info = readMap(platform_, asset.infoPath),
-                            .storeMetadata = readStoreMetadata(platform_, asset),
-                            .existingApp = existingApp};
+CoordinatedInstall::CoordinatedInstall(AppsClient& client, const Platform& platform,
+                                       const SyncAsset& asset, bool existingApp)
+    : client_(client),
+      platform_(platform),
+      log_(platform),
+      asset_(asset),
+      info_(readMap(platform, asset.infoPath)),
+      storeMetadata_(readStoreMetadata(platform, asset)),
+      existingApp_(existingApp),
+      pieces_(log_, asset.identifier) {}
+
+bool CoordinatedInstall::run() {
+    const std::string& identifier = asset_.identifier;
     log_.applications(
         Level::Default,
         "%s|processing app install for bundle '%{public}@', title %{public}@ assetplist "
         "%{public}@, version %{public}@ with install coordination",
-        identifier, asset.prettyName, preparation.info, asset.version());
+        identifier, asset_.prettyName, info_, asset_.version());
     logStepStart(platform_.transactions, InstallStep::Install, identifier,
-                 existingApp ? kUpdateStarts : kInstallStarts);
-    const bool status = prepare(preparation);
+                 existingApp_ ? kUpdateStarts : kInstallStarts);
+    const bool status = prepare();
     log_(Level::Default,
          "%s|processing app install for bundle %{public}@ finished with status %d error %{public}@",
-         identifier, status, preparation.lastError);
+         identifier, status, pieces_.lastError());
     logStepEnd(platform_.transactions, InstallStep::Install, status, identifier, kInstallEnds);
-    if (!status) cancelPreparation(preparation);
+    if (!status) cancel();
     return status;
 }
 
-bool AppsClient::prepare(Preparation& preparation) {
-    if (hasNoName(preparation.asset)) return false;
-    preparation.coordinator = _initiatingOrUpdatingAppInstallCoordinatorForBundleIdentifier(
-        preparation.identifier(), preparation.existingApp, true, &preparation.lastError);
-    if (preparation.coordinator == nullptr) return false;
-    preparation.coordinator->setObserver(weak_from_this());
-    if (!addInstallOptions(preparation)) return false;
-    if (!addODRAssetPromises(preparation)) return false;
-    if (!addAppAssetPromise(preparation)) return false;
-    if (preparation.coordinator->hasPlaceholderPromise()) {
+bool CoordinatedInstall::prepare() {
+    if (hasNoName(asset_)) return false;
+    coordinator_ = client_._initiatingOrUpdatingAppInstallCoordinatorForBundleIdentifier(
+        asset_.identifier, existingApp_, true, &pieces_.lastError());
+    if (coordinator_ == nullptr) return false;
+    coordinator_->setObserver(client_.weak_from_this());
+    if (!addInstallOptions()) return false;
+    if (!addODRAssetPromises()) return false;
+    if (!addAppAssetPromise()) return false;
+    if (coordinator_->hasPlaceholderPromise()) {
         log_(Level::Default, "%s|coordinator for %{public}@ has a placeholder promise",
-             preparation.identifier());
+             asset_.identifier);
         return true;
     }
-    makePlaceholder(preparation);
-    return addPlaceholderPromise(preparation);
+    makePlaceholder();
+    return addPlaceholderPromise();
 }
 
-bool AppsClient::addInstallOptions(Preparation& preparation) {
-    const std::string& identifier = preparation.identifier();
-    if (preparation.coordinator->hasInstallOptions()) {
-        log_(Level::Default, "%s|coordinator for %{public}@ has install options", identifier);
+bool CoordinatedInstall::addInstallOptions() {
+    if (coordinator_->hasInstallOptions()) {
+        log_(Level::Default, "%s|coordinator for %{public}@ has install options",
+             asset_.identifier);
         return true;
     }
-    preparation.storeRecord = preparation.storeMetadata;
-    const Status set = preparation.coordinator->setInstallOptions(
-        {preparation.storeMetadata, kInstallTypeSync, kInstallTarget});
-    if (preparation.note(set)) {
-        log_(Level::Default, "%s|set install options on coordinator for %{public}@", identifier);
-    } else {
-        log_(Level::Error,
-             "%s|Error %{public}@ setting install options on coordinator for '%{public}@'",
-             set.error(), identifier);
-    }
-    return set.ok();
+    storeRecord_ = storeMetadata_;
+    return pieces_.note(
+        coordinator_->setInstallOptions({storeMetadata_, kInstallTypeSync, kInstallTarget}),
+        "%s|set install options on coordinator for %{public}@",
+        "%s|Error %{public}@ setting install options on coordinator for '%{public}@'");
 }
 
-bool AppsClient::addODRAssetPromises(Preparation& preparation) {
-    const std::string& identifier = preparation.identifier();
-    if (preparation.coordinator->hasInitialODRAssetPromises()) {
+bool CoordinatedInstall::addODRAssetPromises() {
+    if (coordinator_->hasInitialODRAssetPromises()) {
         log_(Level::Default, "%s|coordinator for %{public}@ has an ZEL app asset promise",
-             identifier);
+             asset_.identifier);
         return true;
     }
-    const Status set = preparation.coordinator->setInitialODRAssetPromises({});
-    if (preparation.note(set)) {
-        log_(Level::Default, "%s|set ZEL asset promise to install coordinator for %{public}@",
-             identifier);
-    } else {
-        log_(Level::Error, "%s|Error %{public}@ setting ZEL asset promise for '%{public}@'",
-             set.error(), identifier);
-    }
-    return set.ok();
+    return pieces_.note(coordinator_->setInitialODRAssetPromises({}),
+                        "%s|set ZEL asset promise to install coordinator for %{public}@",
+                        "%s|Error %{public}@ setting ZEL asset promise for '%{public}@'");
 }
 
-bool AppsClient::addAppAssetPromise(Preparation& preparation) {
-    const std::string& identifier = preparation.identifier();
-    if (preparation.coordinator->appAssetPromise() != nullptr) {
-        log_(Level::Default, "%s|coordinator for %{public}@ has an app asset promise", identifier);
+bool CoordinatedInstall::addAppAssetPromise() {
+    if (coordinator_->appAssetPromise() != nullptr) {
+        log_(Level::Default, "%s|coordinator for %{public}@ has an app asset promise",
+             asset_.identifier);
         return true;
     }
     // Without a path: the package comes when its transfer ends.
-    return _createAppAssetPromiseForBundleIdentifier(identifier, std::nullopt,
-                                                     preparation.coordinator.get(),
-                                                     &preparation.lastError) != nullptr;
+    return client_._createAppAssetPromiseForBundleIdentifier(asset_.identifier, std::nullopt,
+                                                             coordinator_.get(),
+                                                             &pieces_.lastError()) != nullptr;
 }
 
-void AppsClient::makePlaceholder(Preparation& preparation) {
-    const std::string& identifier = preparation.identifier();
-    const std::string directory = placeholderAppPathForBundleIdentifier(identifier);
+void CoordinatedInstall::makePlaceholder() {
+    const std::string& identifier = asset_.identifier;
+    const std::string directory = client_.placeholderAppPathForBundleIdentifier(identifier);
     const std::string iconPath = formatPath(kInDirectoryFormat, {directory, kPlaceholderIconFile});
     std::uint64_t iconSize = 0;
-    if (createPlaceHolderPath(directory, identifier, placeholderFileAttributes())) {
-        iconSize = copyIconForPlaceholder(preparation, iconPath);
+    if (client_.createPlaceHolderPath(directory, identifier, placeholderFileAttributes())) {
+        iconSize = copyIcon(iconPath);
     }
-    preparation.placeholder = _placeHolderForBundleIdentifier(
-        identifier, preparation.asset.prettyName.value_or(identifier), kInstallTypeSync);
-    if (preparation.placeholder == nullptr) return;
+    placeholder_ = client_._placeHolderForBundleIdentifier(
+        identifier, asset_.prettyName.value_or(identifier), kInstallTypeSync);
+    if (placeholder_ == nullptr) return;
     if (iconSize != 0) {
-        const auto promise = _createIconPromiseForBundleIdentifier(identifier, iconPath, iconSize,
-                                                                   preparation.placeholder.get(),
-                                                                   true, &preparation.lastError);
+        const auto promise = client_._createIconPromiseForBundleIdentifier(
+            identifier, iconPath, iconSize, placeholder_.get(), true, &pieces_.lastError());
         // A placeholder whose icon is refused goes to the coordinator as it is.
         if (promise == nullptr) return;
     }
-    configurePlaceholder(preparation);
+    configurePlaceholder();
 }
 
 /// The size of the copy; 0 when there is none, or it is not known.
-std::uint64_t AppsClient::copyIconForPlaceholder(Preparation& preparation,
-                                                 const std::string& iconPath) {
-    const SyncAsset& asset = preparation.asset;
-    if (!asset.icon) return 0;
-    logStepStart(platform_.transactions, InstallStep::CopyIcon, asset.identifier, kCopyingIcon);
-    Status outcome = platform_.files.copyItem(asset.icon->path(), iconPath);
+std::uint64_t CoordinatedInstall::copyIcon(const std::string& iconPath) {
+    if (!asset_.icon) return 0;
+    const std::string& identifier = asset_.identifier;
+    logStepStart(platform_.transactions, InstallStep::CopyIcon, identifier, kCopyingIcon);
+    Status outcome = platform_.files.copyItem(asset_.icon->path(), iconPath);
     std::uint64_t size = 0;
     if (outcome) {
         const Result<ItemAttributes> copy = platform_.files.attributes(iconPath);
@@ -189,99 +156,76 @@ std::uint64_t AppsClient::copyIconForPlaceholder(Preparation& preparation,
         } else {
             outcome = copy.error();
         }
-        log_(Level::Default, "%s|icon for %{public}@ at %{public}@ has a size of %llu",
-             asset.identifier, iconPath, size);
+        log_(Level::Default, "%s|icon for %{public}@ at %{public}@ has a size of %llu", identifier,
+             iconPath, size);
     }
-    preparation.note(outcome);
+    report(outcome, &pieces_.lastError());
     log_(Level::Default,
          "%s|Copied icon from %{public}@ to %{public}@ with error %{public}@ for '%{public}@', "
          "sizeOnDisk:%llu",
-         asset.icon->path(), iconPath, errorOf(outcome), asset.identifier, size);
-    logStepEnd(platform_.transactions, InstallStep::CopyIcon, true, asset.identifier, kCopyingIcon);
+         asset_.icon->path(), iconPath, errorOf(outcome), identifier, size);
+    logStepEnd(platform_.transactions, InstallStep::CopyIcon, true, identifier, kCopyingIcon);
     return size;
 }
 
 /// Gives the placeholder what it shows. A refusal is only logged, and what follows it left out.
-void AppsClient::configurePlaceholder(Preparation& preparation) {
-    if (!setPlaceholderAttributes(preparation)) return;
-    if (!setPlaceholderMetadata(preparation)) return;
-    setPlaceholderComplete(preparation);
+void CoordinatedInstall::configurePlaceholder() {
+    if (!setPlaceholderAttributes()) return;
+    if (!setPlaceholderMetadata()) return;
+    setPlaceholderComplete();
 }
 
-bool AppsClient::setPlaceholderAttributes(Preparation& preparation) {
-    const std::string& identifier = preparation.identifier();
+bool CoordinatedInstall::setPlaceholderAttributes() {
     PlaceholderAttributes attributes;
-    attributes.info = preparation.info.value_or(PropertyList::map());
+    attributes.info = info_.value_or(PropertyList::map());
     attributes.launchProhibited = attributes.info.findFlag(kLaunchProhibitedKey);
-    if (const std::string* version = preparation.asset.version()) {
-        attributes.bundleVersion = *version;
-    }
-    const Status set = preparation.placeholder->setAttributes(attributes);
-    if (preparation.note(set)) {
-        log_(Level::Default, "%s|set %{public}@ attributes on placeholder for %{public}@",
-             mapOf(attributes), identifier);
-    } else {
-        log_(Level::Error, "%s|Error %{public}@ setting attributes on placeholder for '%{public}@'",
-             set.error(), identifier);
-    }
-    return set.ok();
+    if (const std::string* version = asset_.version()) attributes.bundleVersion = *version;
+    return pieces_.note(placeholder_->setAttributes(attributes),
+                        "%s|set %{public}@ attributes on placeholder for %{public}@",
+                        "%s|Error %{public}@ setting attributes on placeholder for '%{public}@'",
+                        mapOf(attributes));
 }
 
-bool AppsClient::setPlaceholderMetadata(Preparation& preparation) {
-    const std::string& identifier = preparation.identifier();
-    const Status set = preparation.placeholder->setMetadata(preparation.storeRecord);
-    if (preparation.note(set)) {
-        log_(Level::Default, "%s|set store metadata on placeholder for %{public}@", identifier);
-    } else {
-        log_(Level::Error,
-             "%s|Error %{public}@ setting store metadata on placeholder for '%{public}@'",
-             set.error(), identifier);
-    }
-    return set.ok();
+bool CoordinatedInstall::setPlaceholderMetadata() {
+    return pieces_.note(
+        placeholder_->setMetadata(storeRecord_),
+        "%s|set store metadata on placeholder for %{public}@",
+        "%s|Error %{public}@ setting store metadata on placeholder for '%{public}@'");
 }
 
-void AppsClient::setPlaceholderComplete(Preparation& preparation) {
-    const std::string& identifier = preparation.identifier();
-    const Status set = preparation.placeholder->setConfigurationComplete();
-    if (preparation.note(set)) {
-        log_(Level::Default, "%s|set placeholder configuration as complete for %{public}@",
-             identifier);
-    } else {
-        log_(Level::Error,
-             "%s|Error %{public}@ setting placeholder configuration as complete for '%{public}@'",
-             set.error(), identifier);
-    }
+void CoordinatedInstall::setPlaceholderComplete() {
+    pieces_.note(
+        placeholder_->setConfigurationComplete(),
+        "%s|set placeholder configuration as complete for %{public}@",
+        "%s|Error %{public}@ setting placeholder configuration as complete for '%{public}@'");
 }
 
-bool AppsClient::addPlaceholderPromise(Preparation& preparation) {
-    const std::string& identifier = preparation.identifier();
-    const Status set = preparation.coordinator->setPlaceholderPromise(preparation.placeholder);
-    preparation.isPlaceholderAccepted = preparation.note(set);
-    if (set) {
-        log_(Level::Default, "%s|added placeholder promise to coordinator for %{public}@",
-             identifier);
-    } else {
-        log_(Level::Error,
-             "%s|Error %{public}@ adding placeholder promise to coordinator for '%{public}@'",
-             set.error(), identifier);
-    }
-    return set.ok();
+bool CoordinatedInstall::addPlaceholderPromise() {
+    isPlaceholderAccepted_ = pieces_.note(
+        coordinator_->setPlaceholderPromise(placeholder_),
+        "%s|added placeholder promise to coordinator for %{public}@",
+        "%s|Error %{public}@ adding placeholder promise to coordinator for '%{public}@'");
+    return isPlaceholderAccepted_;
 }
 
 /// The placeholder, if no coordinator has it, then the coordinator.
-void AppsClient::cancelPreparation(const Preparation& preparation) {
-    const std::string& identifier = preparation.identifier();
+void CoordinatedInstall::cancel() {
+    const std::string& identifier = asset_.identifier;
     const ErrorRecord reason = makeInstallError(InstallError::PreparationFailed);
-    if (preparation.placeholder != nullptr && !preparation.isPlaceholderAccepted) {
+    if (placeholder_ != nullptr && !isPlaceholderAccepted_) {
         log_(Level::Default, "%s|Cancelling placeholder for appBundleIdentifier:%{public}@",
              identifier);
-        preparation.placeholder->cancelForReason(reason, SyncClientID);
+        placeholder_->cancelForReason(reason, SyncClientID);
     }
-    if (preparation.coordinator != nullptr) {
+    if (coordinator_ != nullptr) {
         log_(Level::Default, "%s|Cancelling coordinator for appBundleIdentifier:%{public}@",
              identifier);
-        preparation.coordinator->cancelForReason(reason, SyncClientID);
+        coordinator_->cancelForReason(reason, SyncClientID);
     }
+}
+
+bool AppsClient::prepareAppForInstallUsingCoordination(const SyncAsset& asset, bool existingApp) {
+    return CoordinatedInstall(*this, platform_, asset, existingApp).run();
 }
 
 void AppsClient::uninstallAppUsingCoordination(const std::string& identifier) {

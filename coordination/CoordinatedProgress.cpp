@@ -16,10 +16,9 @@ constexpr std::string_view kObserverService = "com.korvu.trd.rlink.tsappobserver
 /// The code of the error that a person sees when a package did not come.
 constexpr std::int64_t kTransferFailedCode = 1;
 
-/// The asset's path, absolute; absent while the host has not said where the file will lie.
-std::optional<std::string> absolutePathOf(const SyncAsset& asset) {
-    if (!asset.path || asset.path->starts_with('/')) return asset.path;
-    return formatPath(kInDirectoryFormat, {kPublicStaging, *asset.path});
+/// Absent while the host has not said where the file will lie.
+std::optional<std::string> filePathOf(const SyncAsset& asset) {
+    return asset.path ? std::optional(receivedFilePath(*asset.path)) : std::nullopt;
 }
 
 // What an observer is handed need not say which application it is about.
@@ -30,20 +29,70 @@ std::optional<ErrorRecord> errorOf(const InstallCoordinator* coordinator) {
     return coordinator != nullptr ? coordinator->error() : std::nullopt;
 }
 
-}  // namespace
-
 /// The coordinator of an install that still goes on; null when there is none.
-std::shared_ptr<InstallCoordinator> AppsClient::coordinatorUnderWay(const std::string& identifier,
-                                                                    bool existingApp) {
-    auto coordinator = _initiatingOrUpdatingAppInstallCoordinatorForBundleIdentifier(
+std::shared_ptr<InstallCoordinator> coordinatorUnderWay(AppsClient& client,
+                                                        const std::string& identifier,
+                                                        bool existingApp) {
+    auto coordinator = client._initiatingOrUpdatingAppInstallCoordinatorForBundleIdentifier(
         identifier, existingApp, false, nullptr);
     if (coordinator == nullptr || coordinator->error()) return nullptr;
     return coordinator;
 }
 
+void cancelForFailedTransfer(const Platform& platform, InstallCoordinator& coordinator,
+                             const ErrorRecord& error) {
+    coordinator.cancelForReason(
+        platform.coordination.userPresentableError(kTransferFailedCode, error), SyncClientID);
+}
+
+void keepAppAssetPromise(AppsClient& client, const Platform& platform, const SyncAsset& asset,
+                         InstallCoordinator& coordinator) {
+    const std::string& identifier = asset.identifier;
+    const Log log(platform);
+    auto promise = coordinator.appAssetPromise();
+    if (promise != nullptr && promise->isComplete()) {
+        log(Level::Default, "%s|Asset promise is already satisfied for %{public}@", identifier);
+        return;
+    }
+    const std::optional<std::string> path = filePathOf(asset);
+    const auto url = FileURL::fromPath(path.value_or(""), false);
+    if (!url) {
+        // Nothing will ever lie at a path that no URL can hold.
+        cancelForFailedTransfer(platform, coordinator,
+                                {std::string(kPosixErrorDomain), kPosixInvalidArgument, {}});
+        return;
+    }
+    if (promise != nullptr) {
+        promise->setTransferPath(*url);
+    } else {
+        promise = client._createAppAssetPromiseForBundleIdentifier(identifier, path, &coordinator);
+    }
+    log(Level::Default, "%s|Satisfying asset promise for %{public}@", identifier);
+    if (promise == nullptr) return;
+    promise->setPercentComplete(1.0);
+    promise->setComplete();
+}
+
+void prioritizeTransfer(const Platform& platform, const std::string& identifier) {
+    const Log log(platform);
+    TransferService* transfers = platform.host.transferService();
+    if (transfers == nullptr || !transfers->canPrioritizeAssets()) {
+        log(Level::Error, "%s|Cannot prioritize %{public}@ as it's not supported", identifier);
+        return;
+    }
+    // The client may have gone when the completion comes; the platform has not.
+    transfers->prioritizeAsset(
+        *makeDownloadAsset(identifier), [log, identifier](const ErrorRecord* error) {
+            log(Level::Default, "%s|Prioritize %{public}@ finished with error %{public}@",
+                identifier, error);
+        });
+}
+
+}  // namespace
+
 bool AppsClient::updateTransferProgressForApp(const SyncAsset& asset, bool existingApp) {
     const std::string& identifier = asset.identifier;
-    const auto coordinator = coordinatorUnderWay(identifier, existingApp);
+    const auto coordinator = coordinatorUnderWay(*this, identifier, existingApp);
     if (coordinator == nullptr) return false;
     auto promise = coordinator->appAssetPromise();
     if (promise != nullptr && promise->isComplete()) {
@@ -51,7 +100,7 @@ bool AppsClient::updateTransferProgressForApp(const SyncAsset& asset, bool exist
         return false;
     }
     if (promise == nullptr) {
-        promise = _createAppAssetPromiseForBundleIdentifier(identifier, absolutePathOf(asset),
+        promise = _createAppAssetPromiseForBundleIdentifier(identifier, filePathOf(asset),
                                                             coordinator.get());
         if (promise == nullptr) return false;
     }
@@ -63,45 +112,13 @@ bool AppsClient::updateTransferProgressForApp(const SyncAsset& asset, bool exist
 
 void AppsClient::transferCompleteForApp(const SyncAsset& asset, const ErrorRecord* error,
                                         bool isExistingApp) {
-    const auto coordinator = coordinatorUnderWay(asset.identifier, isExistingApp);
+    const auto coordinator = coordinatorUnderWay(*this, asset.identifier, isExistingApp);
     if (coordinator == nullptr) return;
     if (error != nullptr) {
-        cancelForFailedTransfer(*coordinator, *error);
+        cancelForFailedTransfer(platform_, *coordinator, *error);
     } else {
-        keepAppAssetPromise(asset, *coordinator);
+        keepAppAssetPromise(*this, platform_, asset, *coordinator);
     }
-}
-
-void AppsClient::cancelForFailedTransfer(InstallCoordinator& coordinator,
-                                         const ErrorRecord& error) {
-    coordinator.cancelForReason(
-        platform_.coordination.userPresentableError(kTransferFailedCode, error), SyncClientID);
-}
-
-void AppsClient::keepAppAssetPromise(const SyncAsset& asset, InstallCoordinator& coordinator) {
-    const std::string& identifier = asset.identifier;
-    auto promise = coordinator.appAssetPromise();
-    if (promise != nullptr && promise->isComplete()) {
-        log_(Level::Default, "%s|Asset promise is already satisfied for %{public}@", identifier);
-        return;
-    }
-    const std::optional<std::string> path = absolutePathOf(asset);
-    const auto url = FileURL::fromPath(path.value_or(""), false);
-    if (!url) {
-        // Nothing will ever lie at a path that no URL can hold.
-        cancelForFailedTransfer(coordinator,
-                                {std::string(kPosixErrorDomain), kPosixInvalidArgument, {}});
-        return;
-    }
-    if (promise != nullptr) {
-        promise->setTransferPath(*url);
-    } else {
-        promise = _createAppAssetPromiseForBundleIdentifier(identifier, path, &coordinator);
-    }
-    log_(Level::Default, "%s|Satisfying asset promise for %{public}@", identifier);
-    if (promise == nullptr) return;
-    promise->setPercentComplete(1.0);
-    promise->setComplete();
 }
 
 void AppsClient::assetSyncFinishedWithStatus(bool status,
@@ -164,21 +181,7 @@ void AppsClient::coordinatorShouldPrioritize(
     const std::optional<std::string> identifier = identifierOf(coordinator.get());
     if (!identifier) return;
     log_(Level::Default, "%s|Prioritize %{public}@", *identifier);
-    prioritizeTransfer(*identifier);
-}
-
-void AppsClient::prioritizeTransfer(const std::string& identifier) {
-    TransferService* transfers = platform_.host.transferService();
-    if (transfers == nullptr || !transfers->canPrioritizeAssets()) {
-        log_(Level::Error, "%s|Cannot prioritize %{public}@ as it's not supported", identifier);
-        return;
-    }
-    // The client may have gone when the completion comes; the platform has not.
-    transfers->prioritizeAsset(
-        *makeDownloadAsset(identifier), [log = log_, identifier](const ErrorRecord* error) {
-            log(Level::Default, "%s|Prioritize %{public}@ finished with error %{public}@",
-                identifier, error);
-        });
+    prioritizeTransfer(platform_, *identifier);
 }
 
 void AppsClient::setupInstallCoordinatorObserver() {

@@ -13,6 +13,7 @@
 namespace appsync {
 
 class InstallCoordinator;
+using InstallCoordinatorPointer = std::shared_ptr<InstallCoordinator>;
 
 /// How the application of a coordinator is to be installed.
 struct InstallOptions {

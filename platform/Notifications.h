@@ -6,6 +6,10 @@
 
 namespace appsync {
 
+/// Posted by the daemon when it has finished starting.
+inline constexpr std::string_view kStartupCompleteNotification =
+    "com.korvu.trd.TRStartupCompleteNotification";
+
 /// System-wide named notifications that carry a 64-bit state. Callable on any thread.
 class NamedNotifications {
   public:

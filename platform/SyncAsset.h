@@ -11,6 +11,9 @@
 
 namespace appsync {
 
+/// The one dataclass that the plug-in owns.
+inline constexpr std::string_view kApplicationDataclass = "Application";
+
 /// Bits of a SyncAsset's "AssetParts" and of its completed parts.
 enum AssetParts : unsigned {
     kAssetPartApplication = 1,
@@ -24,7 +27,7 @@ enum AssetParts : unsigned {
 struct SyncAsset {
     /// The asset's identity within its dataclass; for applications the bundle identifier.
     std::string identifier;
-    /// "Application" for everything of this plug-in.
+    /// `kApplicationDataclass` for everything of this plug-in.
     std::string dataclass;
     /// The name to show to a person.
     std::optional<std::string> prettyName;

@@ -8,6 +8,9 @@
 
 namespace appsync {
 
+class Log;
+struct Platform;
+
 // The names of the files in a placeholder bundle.
 inline constexpr std::string_view kPlaceholderIconFile = "Icon.png";
 inline constexpr std::string_view kPlaceholderInfoFile = "Info.plist";
@@ -26,5 +29,12 @@ inline constexpr std::string_view kPlaceholderNotInstalled = "Failed to install 
 
 /// Whom a placeholder bundle and what is in it belong to.
 [[nodiscard]] inline FileAttributes placeholderFileAttributes() { return {"mobile", "mobile"}; }
+
+/// Logs the info dictionary of a placeholder bundle that is about to be written.
+void willCreatePlaceholder(const Log& log, const std::string& identifier, const PropertyList& info);
+/// Has the registry install the directory, a placeholder bundle with this info dictionary, and logs
+/// whether it did.
+bool installPlaceholder(const Platform& platform, const std::string& directory,
+                        const PropertyList& info, const PropertyList& options);
 
 }  // namespace appsync

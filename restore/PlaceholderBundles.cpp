@@ -38,17 +38,22 @@ PropertyList placeholderInfo(const SyncAsset& asset, const PropertyList& assetIn
     return info;
 }
 
+void copyIcon(const Platform& platform, const SyncAsset& asset, const std::string& directory) {
+    if (!asset.icon) return;
+    const std::string& source = asset.icon->path();
+    const std::string destination =
+        formatPath(kInDirectoryFormat, {directory, kPlaceholderIconFile});
+    const Status copied = platform.files.copyItem(source, destination);
+    if (copied) return;
+    const Log log(platform);
+    log(Level::Error, "%s|Copying icon from %{public}@ to %{public}@ failed: %{public}@", source,
+        destination, copied.error());
+}
+
 PropertyList installOptions(const std::string& identifier) {
     return PropertyList::map({{PackageTypeKey, PackageTypePlaceholder},
                               {BundleIdentifierKey, identifier},
                               {InstallTypeKey, std::uint64_t{kInstallTypeSync}}});
-}
-
-Status installDirectory(AppRegistry& registry, const std::string& directory,
-                        const PropertyList& options) {
-    const auto url = FileURL::fromPath(directory, true);
-    if (!url) return ErrorRecord{std::string(kPosixErrorDomain), kPosixInvalidArgument, {}};
-    return registry.installPlaceholderBundle(*url, options);
 }
 
 /// The icon as a PNG image; nothing, and a message, when a step fails.
@@ -87,6 +92,18 @@ std::unique_ptr<IconImage> renderIcon(IconRenderer& icons,
     auto image = icons.homeScreenIcon(*bundle);
     if (image == nullptr) log(Level::Error, "%s|couldn't create DK icon from bundle");
     return image;
+}
+
+bool isUserBundle(const AppProxy& proxy) { return proxy.applicationType != kApplicationTypeSystem; }
+
+/// Whether a walk over the user bundles would meet the identifier, asked by key.
+bool hasUserBundle(AppRegistry& registry, const std::string& identifier) {
+    using Placeholders = AppRegistry::Placeholders;
+    const auto proxy = registry.proxyForIdentifier(identifier, Placeholders::Included);
+    if (!proxy || isUserBundle(*proxy)) return proxy.has_value();
+    // A system placeholder may cover a user application.
+    const auto covered = registry.proxyForIdentifier(identifier, Placeholders::Excluded);
+    return covered && isUserBundle(*covered);
 }
 
 }  // namespace
@@ -138,55 +155,18 @@ void AppsClient::_createPlaceHolderApplication(const SyncAsset& asset) {
 
     const std::string directory = placeholderAppPathForBundleIdentifier(asset.identifier);
     if (!createPlaceHolderPath(directory, asset.identifier, placeholderFileAttributes())) return;
-    copyIcon(asset, directory);
+    copyIcon(platform_, asset, directory);
     const PropertyList info = placeholderInfo(asset, assetInfo);
     const Status written = writePropertyListFile(
         platform_, formatPath(kInDirectoryFormat, {directory, kPlaceholderInfoFile}), info,
         PropertyListFormat::Xml);
     if (!written) return;
-    willCreatePlaceholder(asset.identifier, info);
-    const bool installed = installPlaceholder(directory, info, installOptions(asset.identifier));
+    willCreatePlaceholder(log_, asset.identifier, info);
+    const bool installed =
+        installPlaceholder(platform_, directory, info, installOptions(asset.identifier));
     platform_.transactions.logScenario(
         kPlaceholderScenario, 0, installed, asset.identifier,
         installed ? kPlaceholderInstalled : kPlaceholderNotInstalled);
-}
-
-void AppsClient::copyIcon(const SyncAsset& asset, const std::string& directory) const {
-    if (!asset.icon) return;
-    const std::string& source = asset.icon->path();
-    const std::string destination =
-        formatPath(kInDirectoryFormat, {directory, kPlaceholderIconFile});
-    const Status copied = platform_.files.copyItem(source, destination);
-    if (copied) return;
-    log_(Level::Error, "%s|Copying icon from %{public}@ to %{public}@ failed: %{public}@", source,
-         destination, copied.error());
-}
-
-void AppsClient::willCreatePlaceholder(const std::string& identifier,
-                                       const PropertyList& info) const {
-    log_(Level::Default, "%s|creating placeholder for '%{public}@'. info.plist=%{public}@",
-         identifier, info);
-}
-
-bool AppsClient::installPlaceholder(const std::string& directory, const PropertyList& info,
-                                    const PropertyList& options) {
-    const bool installed = installDirectory(platform_.registry, directory, options).ok();
-    const std::string* title = info.findString(BundleDisplayNameKey);
-    const std::string* identifier = info.findString(BundleIdentifierKey);
-    const std::string* version = info.findString(BundleVersionKey);
-    const PropertyList* isPressel = info.find(kPresselKey);
-    if (installed) {
-        log_(Level::Default,
-             "%s|Installed Placeholder app from path %{public}@: %{public}@ [%{public}@ "
-             "%{public}@] [isPressel: %{public}@]",
-             directory, title, identifier, version, isPressel);
-    } else {
-        log_(Level::Error,
-             "%s|Placeholder app install failed from path %{public}@: %{public}@ [%{public}@ "
-             "%{public}@] [isPressel: %{public}@]",
-             directory, title, identifier, version, isPressel);
-    }
-    return installed;
 }
 
 bool AppsClient::_makeIconFromBundlePath(const Platform& platform,
@@ -203,20 +183,9 @@ bool AppsClient::_makeIconFromBundlePath(const Platform& platform,
 }
 
 bool AppsClient::_placeholderExistsForApplication(const std::string& identifier) const {
-    if (_useInstallCoordinator) return false;
-    bool found = false;
-    platform_.registry.enumerateBundles(AppRegistry::kUserBundles,
-                                        [&](const AppProxy& proxy, bool& stop) {
-                                            if (proxy.applicationIdentifier != identifier) return;
-                                            found = true;
-                                            didFindPlaceholder(identifier);
-                                            stop = true;
-                                        });
-    return found;
-}
-
-void AppsClient::didFindPlaceholder(const std::string& identifier) const {
+    if (_useInstallCoordinator || !hasUserBundle(platform_.registry, identifier)) return false;
     log_(Level::Default, "%s|Found placeholder for bundle %{public}@", identifier);
+    return true;
 }
 
 void AppsClient::_enumeratePlaceholdersWithBlock(const AppRegistry::ProxyCallback& callback) const {

@@ -1,6 +1,5 @@
 #include <chrono>
 #include <cstdint>
-#include <unordered_set>
 
 #include "client/AppsClient.h"
 #include "client/Paths.h"
@@ -62,14 +61,124 @@ PropertyList installOptions(const RestoredApp& app) {
                               {AppSinfKey, valueOrNullMarker(app.sinf)}});
 }
 
-}  // namespace
+std::optional<PropertyList> readRestoreInfo(const Platform& platform) {
+    const Log log(platform);
+    const Result<Bytes> bytes = platform.files.readFile(std::string(kRestoreInfoPath));
+    if (!bytes) {
+        log(Level::Default, "%s|failed to read vessik app restore info. err=%{public}@",
+            bytes.error());
+        return std::nullopt;
+    }
+    log(Level::Default, "%s|processing vessik restore info");
+    Result<PropertyList> restoreInfo = parseMap(platform, *bytes);
+    if (!restoreInfo) {
+        log(Level::Default, "%s|failed to parse vessik app restore info. err=%{public}@",
+            restoreInfo.error());
+        return std::nullopt;
+    }
+    return *std::move(restoreInfo);
+}
 
-/// What is asked for every application; each answer takes the same time however many there are.
-struct AppsClient::RestoreFacts {
-    DemotedApps demotedApps;
-    /// Whose placeholder, or application, the registry had before the restore.
-    std::unordered_set<std::string> existing;
-};
+void putRestoreInfoAway(const Platform& platform) {
+    const std::string processed(kProcessedRestoreInfoPath);
+    platform.files.removeItem(processed).ignore();
+    const Status moved = platform.files.moveItem(std::string(kRestoreInfoPath), processed);
+    if (moved) return;
+    const Log log(platform);
+    log(Level::Default, "%s|failed to copy vessik metadata. err=%{public}@", moved.error());
+}
+
+DemotedApps readDemotedApps(const Platform& platform) {
+    const std::optional<PropertyList> list =
+        AppsClient::_loadDemotedAppsPlist(platform, kDemotedAppsPath, nullptr);
+    const Log log(platform);
+    log.applications(Level::Default, "%s|Demoted Apps: %{public}@", list);
+    return DemotedApps(list.value_or(PropertyList()));
+}
+
+void recordAppRestore(const Platform& platform, bool success, const std::string& identifier,
+                      std::string_view description) {
+    platform.transactions.logScenario(kAppRestoreScenario, 0, success, identifier, description);
+}
+
+bool writeRestorePlaceholderInfo(const Platform& platform, const std::string& directory,
+                                 const std::string& identifier, const PropertyList& info) {
+    const Log log(platform);
+    willCreatePlaceholder(log, identifier, info);
+    const std::string path = formatPath(kInDirectoryFormat, {directory, kPlaceholderInfoFile});
+    if (writePropertyListFile(platform, path, info, PropertyListFormat::Xml)) return true;
+    log(Level::Default, "%s|failed to create placeholder info at %{public}@ with info %{public}@",
+        path, info);
+    recordAppRestore(platform, false, identifier, kInfoFailed);
+    return false;
+}
+
+bool installRestorePlaceholder(AppsClient& client, const Platform& platform, const RestoredApp& app,
+                               const PropertyList& metadata) {
+    const std::string& identifier = app.identifier;
+    const std::string directory = client.placeholderAppPathForBundleIdentifier(identifier);
+    if (!client.createPlaceHolderPath(directory, identifier, placeholderFileAttributes())) {
+        const Log log(platform);
+        log(Level::Default, "%s|failed to create app directory for '%{public}@'. err=%{public}@",
+            identifier, nullptr);
+        recordAppRestore(platform, false, identifier, kPlaceholderDirectoryFailed);
+        return false;
+    }
+    // One without an icon is a placeholder still.
+    client.writeIconData(app.icon,
+                         formatPath(kInDirectoryFormat, {directory, kPlaceholderIconFile}), nullptr,
+                         identifier, placeholderFileAttributes());
+    const PropertyList info = placeholderInfo(identifier, metadata);
+    if (!writeRestorePlaceholderInfo(platform, directory, identifier, info)) return false;
+    const bool installed = installPlaceholder(platform, directory, info, installOptions(app));
+    recordAppRestore(platform, installed, identifier,
+                     installed ? kPlaceholderInstalled : kPlaceholderNotInstalled);
+    return installed;
+}
+
+/// Nothing for an application that is passed over.
+std::optional<bool> restoreApp(AppsClient& client, const Log& log, bool isCoordinated,
+                               const std::string& identifier, const PropertyList& info,
+                               std::uint64_t demotionStatus) {
+    log(Level::Default, "%s|processing vessik restore info for '%{public}@' demotionStatus :%lu",
+        identifier, demotionStatus);
+    if (client._placeholderExistsForApplication(identifier)) {
+        log(Level::Default, "%s|placeholder already exists for '%{public}@' - skiping'",
+            identifier);
+        return std::nullopt;
+    }
+    if (!info.isMap()) {
+        log(Level::Default, "%s|no vessik restore info for '%{public}@' - skipping", identifier);
+        return std::nullopt;
+    }
+    const Bytes* metadata = dataAt(info, kMetadataKey);
+    if (metadata == nullptr) {
+        log(Level::Default, "%s|no VessikMetadata for '%{public}@' - ignoring", identifier);
+        return std::nullopt;
+    }
+    const Bytes* sinf = dataAt(info, kSinfKey);
+    const Bytes* icon = dataAt(info, kIconKey);
+    if (!isCoordinated) {
+        return client._processVessikRestoreInfoForApp(identifier, *metadata, sinf, icon);
+    }
+    return client.prepareAppForRestoreUsingCoordination(identifier, *metadata, sinf, icon,
+                                                        demotionStatus);
+}
+
+bool restoreApps(AppsClient& client, const Platform& platform, bool isCoordinated,
+                 const PropertyList& restoreInfo) {
+    const Log log(platform);
+    const DemotedApps demotedApps = readDemotedApps(platform);
+    bool result = true;
+    for (const auto& [identifier, info] : restoreInfo.entries()) {
+        result = restoreApp(client, log, isCoordinated, identifier, info,
+                            demotedApps.statusOf(identifier))
+                     .value_or(result);
+    }
+    return result;
+}
+
+}  // namespace
 
 bool AppsClient::reconcileRestoreOfType(std::int64_t type, ErrorOut error) {
     log_(Level::Default, "%s|reconcileRestoreOfType %d", type);
@@ -88,81 +197,12 @@ bool AppsClient::_processVessikRestoreInfo() {
         return true;
     }
     bool result = false;
-    if (const std::optional<PropertyList> restoreInfo = readRestoreInfo()) {
-        result = restoreApps(*restoreInfo);
+    if (const std::optional<PropertyList> restoreInfo = readRestoreInfo(platform_)) {
+        result = restoreApps(*this, platform_, _useInstallCoordinator, *restoreInfo);
         waitForRestoringPlaceholders();
     }
-    putRestoreInfoAway();
+    putRestoreInfoAway(platform_);
     return result;
-}
-
-std::optional<PropertyList> AppsClient::readRestoreInfo() const {
-    const Result<Bytes> bytes = platform_.files.readFile(std::string(kRestoreInfoPath));
-    if (!bytes) {
-        log_(Level::Default, "%s|failed to read vessik app restore info. err=%{public}@",
-             bytes.error());
-        return std::nullopt;
-    }
-    log_(Level::Default, "%s|processing vessik restore info");
-    Result<PropertyList> restoreInfo = parseMap(platform_, *bytes);
-    if (!restoreInfo) {
-        log_(Level::Default, "%s|failed to parse vessik app restore info. err=%{public}@",
-             restoreInfo.error());
-        return std::nullopt;
-    }
-    return *std::move(restoreInfo);
-}
-
-bool AppsClient::restoreApps(const PropertyList& restoreInfo) {
-    const RestoreFacts facts = gatherRestoreFacts();
-    bool result = true;
-    for (const auto& [identifier, info] : restoreInfo.entries()) {
-        result = restoreApp(identifier, info, facts).value_or(result);
-    }
-    return result;
-}
-
-AppsClient::RestoreFacts AppsClient::gatherRestoreFacts() const {
-    const std::optional<PropertyList> list =
-        _loadDemotedAppsPlist(platform_, kDemotedAppsPath, nullptr);
-    log_.applications(Level::Default, "%s|Demoted Apps: %{public}@", list);
-    RestoreFacts facts{DemotedApps(list.value_or(PropertyList())), {}};
-    // Walked once: asking for each application by itself would walk all of them each time.
-    if (!_useInstallCoordinator) {
-        platform_.registry.enumerateBundles(AppRegistry::kUserBundles,
-                                            [&facts](const AppProxy& proxy, bool&) {
-                                                facts.existing.insert(proxy.applicationIdentifier);
-                                            });
-    }
-    return facts;
-}
-
-std::optional<bool> AppsClient::restoreApp(const std::string& identifier, const PropertyList& info,
-                                           const RestoreFacts& facts) {
-    const std::uint64_t demotionStatus = facts.demotedApps.statusOf(identifier);
-    log_(Level::Default, "%s|processing vessik restore info for '%{public}@' demotionStatus :%lu",
-         identifier, demotionStatus);
-    if (facts.existing.contains(identifier)) {
-        didFindPlaceholder(identifier);
-        log_(Level::Default, "%s|placeholder already exists for '%{public}@' - skiping'",
-             identifier);
-        return std::nullopt;
-    }
-    if (!info.isMap()) {
-        log_(Level::Default, "%s|no vessik restore info for '%{public}@' - skipping", identifier);
-        return std::nullopt;
-    }
-    const Bytes* metadata = dataAt(info, kMetadataKey);
-    if (metadata == nullptr) {
-        log_(Level::Default, "%s|no VessikMetadata for '%{public}@' - ignoring", identifier);
-        return std::nullopt;
-    }
-    const Bytes* sinf = dataAt(info, kSinfKey);
-    const Bytes* icon = dataAt(info, kIconKey);
-    if (!_useInstallCoordinator) {
-        return _processVessikRestoreInfoForApp(identifier, *metadata, sinf, icon);
-    }
-    return prepareAppForRestoreUsingCoordination(identifier, *metadata, sinf, icon, demotionStatus);
 }
 
 void AppsClient::waitForRestoringPlaceholders() {
@@ -178,28 +218,18 @@ void AppsClient::waitForRestoringPlaceholders() {
     });
 }
 
-void AppsClient::putRestoreInfoAway() const {
-    const std::string processed(kProcessedRestoreInfoPath);
-    platform_.files.removeItem(processed).ignore();
-    const Status moved = platform_.files.moveItem(std::string(kRestoreInfoPath), processed);
-    if (!moved) {
-        log_(Level::Default, "%s|failed to copy vessik metadata. err=%{public}@", moved.error());
-    }
-}
-
 bool AppsClient::_processVessikRestoreInfoForApp(const std::string& identifier,
                                                  const Bytes& vessikMetaData, const Bytes* sinfData,
                                                  const Bytes* iconData) {
     log_(Level::Default, "%s|processing app restore info for '%{public}@'", identifier);
     const Result<PropertyList> metadata =
-        parseVessikMetadata(identifier, vessikMetaData, Level::Default);
+        parseRestoredMetadata(platform_, identifier, vessikMetaData, Level::Default);
     if (!metadata) {
-        recordAppRestore(false, identifier, kParsingFailed);
+        recordAppRestore(platform_, false, identifier, kParsingFailed);
         return true;  // on purpose: only what fails later counts as a failure
     }
-    if (installRestorePlaceholder({identifier, vessikMetaData, sinfData, iconData}, *metadata)) {
-        return true;
-    }
+    const RestoredApp app{identifier, vessikMetaData, sinfData, iconData};
+    if (installRestorePlaceholder(*this, platform_, app, *metadata)) return true;
     log_(Level::Default,
          "%s|failed to process app restore info for '%{public}@'. "
          "vessikMetadataDictionary=%{public}@",
@@ -207,68 +237,12 @@ bool AppsClient::_processVessikRestoreInfoForApp(const std::string& identifier,
     return false;
 }
 
-Result<PropertyList> AppsClient::parseVessikMetadata(const std::string& identifier,
-                                                     const Bytes& data, Level failureLevel) const {
-    Result<PropertyList> metadata = parseMap(platform_, data);
-    if (!metadata) {
-        log_(failureLevel, "%s|failed to parse vessik metadata for '%{public}@'. err=%{public}@",
-             identifier, metadata.error());
-    }
-    return metadata;
-}
-
-bool AppsClient::installRestorePlaceholder(const RestoredApp& app, const PropertyList& metadata) {
-    const std::string& identifier = app.identifier;
-    const std::string directory = placeholderAppPathForBundleIdentifier(identifier);
-    if (!createPlaceHolderPath(directory, identifier, placeholderFileAttributes())) {
-        log_(Level::Default, "%s|failed to create app directory for '%{public}@'. err=%{public}@",
-             identifier, nullptr);
-        recordAppRestore(false, identifier, kPlaceholderDirectoryFailed);
-        return false;
-    }
-    // One without an icon is a placeholder still.
-    writeIconData(app.icon, formatPath(kInDirectoryFormat, {directory, kPlaceholderIconFile}),
-                  nullptr, identifier, placeholderFileAttributes());
-    const PropertyList info = placeholderInfo(identifier, metadata);
-    if (!writeRestorePlaceholderInfo(directory, identifier, info)) return false;
-    const bool installed = installPlaceholder(directory, info, installOptions(app));
-    recordAppRestore(installed, identifier,
-                     installed ? kPlaceholderInstalled : kPlaceholderNotInstalled);
-    return installed;
-}
-
-bool AppsClient::writeRestorePlaceholderInfo(const std::string& directory,
-                                             const std::string& identifier,
-                                             const PropertyList& info) {
-    willCreatePlaceholder(identifier, info);
-    const std::string path = formatPath(kInDirectoryFormat, {directory, kPlaceholderInfoFile});
-    if (writePropertyListFile(platform_, path, info, PropertyListFormat::Xml)) return true;
-    log_(Level::Default, "%s|failed to create placeholder info at %{public}@ with info %{public}@",
-         path, info);
-    recordAppRestore(false, identifier, kInfoFailed);
-    return false;
-}
-
-void AppsClient::recordAppRestore(bool success, const std::string& identifier,
-                                  std::string_view description) {
-    platform_.transactions.logScenario(kAppRestoreScenario, 0, success, identifier, description);
-}
-
 std::optional<PropertyList> AppsClient::_loadDemotedAppsPlist(const Platform& platform,
                                                               std::string_view path,
                                                               ErrorOut error) {
-    const Log log(platform);
-    std::optional<Result<PropertyList>> list = readListFile(platform, path, error);
-    if (!list) return std::nullopt;
-    if (!*list) {
-        log(Level::Error, "%s|couldn't parse demoted apps list");
-        return std::nullopt;
-    }
-    if (!(*list)->isMap()) {
-        log(Level::Error, "%s|demoted apps list is not a dictionary");
-        return std::nullopt;
-    }
-    return **std::move(list);
+    return readListFile(
+        platform, path, &PropertyList::isMap,
+        {"%s|couldn't parse demoted apps list", "%s|demoted apps list is not a dictionary"}, error);
 }
 
 }  // namespace appsync

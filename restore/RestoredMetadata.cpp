@@ -2,21 +2,34 @@
 
 #include <string_view>
 
+#include "client/Log.h"
+#include "client/PropertyListFile.h"
 #include "restore/PlaceholderBundle.h"
 
 namespace appsync {
 
 namespace {
 
-constexpr std::string_view kVersionKey = "bundleVersion";
+constexpr std::string_view kBundleVersionKey = "bundleVersion";
 constexpr std::string_view kTitleKey = "title";
 constexpr std::string_view kItemNameKey = "itemName";
 constexpr std::string_view kLaunchProhibitedFallbackKey = "launchProhibited";
 
 }  // namespace
 
+Result<PropertyList> parseRestoredMetadata(const Platform& platform, const std::string& identifier,
+                                           const Bytes& data, LogLevel failureLevel) {
+    Result<PropertyList> metadata = parseMap(platform, data);
+    if (!metadata) {
+        const Log log(platform);
+        log(failureLevel, "%s|failed to parse vessik metadata for '%{public}@'. err=%{public}@",
+            identifier, metadata.error());
+    }
+    return metadata;
+}
+
 const std::string* bundleVersionOf(const PropertyList& metadata) {
-    return metadata.findString(kVersionKey);
+    return metadata.findString(kBundleVersionKey);
 }
 
 const std::string* displayTitleOf(const PropertyList& metadata) {

@@ -3,7 +3,6 @@
 #include <memory>
 #include <string>
 
-#include "client/Dataclass.h"
 #include "platform/SyncAsset.h"
 
 namespace appsync {
@@ -13,7 +12,7 @@ namespace appsync {
 [[nodiscard]] inline SyncAssetPointer makeDownloadAsset(const std::string& identifier) {
     auto asset = std::make_shared<SyncAsset>();
     asset->identifier = identifier;
-    asset->dataclass = kDataclass;
+    asset->dataclass = kApplicationDataclass;
     asset->isDownload = true;
     return asset;
 }

@@ -5,6 +5,9 @@
 #include <span>
 #include <string_view>
 
+#include "platform/LogFacility.h"
+#include "platform/LogRendering.h"
+
 namespace appsync {
 
 namespace {
@@ -33,8 +36,9 @@ constexpr std::string_view kUnknownPhase = "Unknown Install Phase: %lu";
 std::string nameOf(std::uint64_t number, std::span<const std::string_view> names,
                    std::string_view unknownFormat) {
     if (number < names.size()) return std::string(names[static_cast<std::size_t>(number)]);
-    const std::string_view beforeNumber = unknownFormat.substr(0, unknownFormat.find('%'));
-    return std::string(beforeNumber) + std::to_string(number);
+    const std::array<LogArgument, 1> arguments{number};
+    return renderLogMessage(
+        {LogCategory::Coordination, LogLevel::Default, unknownFormat, arguments});
 }
 
 }  // namespace

@@ -1,12 +1,11 @@
 #include <utility>
 
 #include "client/AppsClient.h"
-#include "client/Paths.h"
 #include "client/TodoList.h"
-#include "platform/BackupService.h"
 #include "platform/HomeScreenService.h"
 #include "platform/InstallTransactionLog.h"
 #include "platform/SyncHost.h"
+#include "transfer/GivenUpRestore.h"
 #include "transfer/InstallRetry.h"
 
 namespace appsync {
@@ -31,15 +30,51 @@ ErrorRecord invalidArgument() {
     return {std::string(kPosixErrorDomain), kPosixInvalidArgument, {}};
 }
 
-/// Has the registry install the asset's package. A path that no URL can hold is an invalid
-/// argument, with which the installer is not called.
-Status installPackage(AppRegistry& registry, const SyncAsset& asset, bool& wasCalled) {
-    const auto package = FileURL::fromPath(asset.path.value_or(""), false);
-    wasCalled = package.has_value();
-    if (!package) return invalidArgument();
-    return registry.installPackage(*package,
-                                   PropertyList::map({{PackageTypeKey, PackageTypeCustomer},
-                                                      {BundleIdentifierKey, asset.identifier}}));
+void recordInstall(const Platform& platform, bool success, const std::string& identifier,
+                   std::string_view description) {
+    platform.transactions.logScenario(kInstallScenario, 0, success, identifier, description);
+}
+
+void recordRestore(const Platform& platform, bool success, const std::string& identifier,
+                   std::string_view description) {
+    platform.transactions.logScenario(kRestoreScenario, 0, success, identifier, description);
+}
+
+enum class AfterAssertion { Install, Retry, GiveUp };
+
+/// What follows from the home screen's answer, which is logged and recorded.
+AfterAssertion noteAssertion(const Platform& platform, const std::string& identifier, int outcome) {
+    const Log log(platform);
+    switch (outcome) {
+        case TerminationAssertionResult::kNoSuchApplication:
+            log(Level::Default, "%s|Assertion not found for %{public}@, installing anyway...",
+                identifier);
+            recordInstall(platform, true, identifier, kAssertionNotFound);
+            return AfterAssertion::Install;
+        case TerminationAssertionResult::kGranted:
+            log(Level::Default, "%s|Assertion succeeded for %{public}@", identifier);
+            recordInstall(platform, true, identifier, kAssertionSucceeded);
+            return AfterAssertion::Install;
+        case TerminationAssertionResult::kDenied:
+            log(Level::Error, "%s|Assertion denied for %{public}@", identifier);
+            recordInstall(platform, true, identifier, kAssertionDenied);
+            return AfterAssertion::Retry;
+        default:
+            log(Level::Error, "%s|Unknown error %d getting assertion for %{public}@", outcome,
+                identifier);
+            recordInstall(platform, false, identifier, kAssertionUnknownError);
+            return AfterAssertion::GiveUp;
+    }
+}
+
+void uninstallFailedInstall(const Platform& platform, const std::string& identifier) {
+    const Status uninstalled = platform.registry.uninstallApplication(identifier, {});
+    if (!uninstalled) {
+        const Log log(platform);
+        log(Level::Error, "%s|Uninstall of %{public}@ failed.", identifier);
+    }
+    recordRestore(platform, uninstalled.ok(), identifier,
+                  uninstalled ? kPlaceholderRemoved : kPlaceholderNotRemoved);
 }
 
 }  // namespace
@@ -68,73 +103,56 @@ void AppsClient::_performAssetInstall(const SyncAssetPointer& asset) {
     log_(Level::Default, "%s|Grabbing assertion for %{public}@", asset->identifier);
     TerminationAssertionResult grabbed =
         platform_.homeScreen.takeTerminationAssertion(asset->identifier, kAssertionReason);
-    if (isGranted(asset->identifier, grabbed.outcome)) {
-        install(asset);
-    } else if (grabbed.outcome == TerminationAssertionResult::kDenied) {
-        grabbed.assertion.reset();
-        scheduleRetry(asset);
-        return;
-    } else {
-        assetInstallFailed(asset, invalidArgument());
+    switch (noteAssertion(platform_, asset->identifier, grabbed.outcome)) {
+        case AfterAssertion::Install:
+            install(asset);
+            break;
+        case AfterAssertion::Retry:
+            grabbed.assertion.reset();
+            scheduleRetry(asset);
+            return;
+        case AfterAssertion::GiveUp:
+            assetInstallFailed(asset, invalidArgument());
     }
     grabbed.assertion.reset();
     if (asset->path) platform_.files.removeItem(*asset->path).ignore();
 }
 
-bool AppsClient::isGranted(const std::string& identifier, int outcome) {
-    switch (outcome) {
-        case TerminationAssertionResult::kNoSuchApplication:
-            log_(Level::Default, "%s|Assertion not found for %{public}@, installing anyway...",
-                 identifier);
-            recordInstall(true, identifier, kAssertionNotFound);
-            return true;
-        case TerminationAssertionResult::kGranted:
-            log_(Level::Default, "%s|Assertion succeeded for %{public}@", identifier);
-            recordInstall(true, identifier, kAssertionSucceeded);
-            return true;
-        case TerminationAssertionResult::kDenied:
-            log_(Level::Error, "%s|Assertion denied for %{public}@", identifier);
-            recordInstall(true, identifier, kAssertionDenied);
-            return false;
-        default:
-            log_(Level::Error, "%s|Unknown error %d getting assertion for %{public}@", outcome,
-                 identifier);
-            recordInstall(false, identifier, kAssertionUnknownError);
-            return false;
-    }
-}
-
 void AppsClient::install(const SyncAssetPointer& asset) {
-    bool wasCalled = false;
-    const Status installed = installPackage(platform_.registry, *asset, wasCalled);
+    const auto package = FileURL::fromPath(asset->path.value_or(""), false);
+    if (!package) {
+        // With a path that no URL can hold the installer is not called.
+        assetInstallFailed(asset, invalidArgument());
+        return;
+    }
+    const Status installed = platform_.registry.installPackage(
+        *package, PropertyList::map({{PackageTypeKey, PackageTypeCustomer},
+                                     {BundleIdentifierKey, asset->identifier}}));
     if (installed) {
         assetInstallSucceeded(asset);
     } else {
         assetInstallFailed(asset, installed.error());
     }
-    if (wasCalled) _numAppInstallsAttempted.fetch_add(1, std::memory_order_relaxed);
+    _numAppInstallsAttempted.fetch_add(1, std::memory_order_relaxed);
 }
 
 void AppsClient::scheduleRetry(const SyncAssetPointer& asset) {
     log_(Level::Error, "%s|Will retry installation of %{public}@ in %d seconds", asset->identifier,
          kInstallRetryDelay.count());
-    recordInstall(true, asset->identifier, kRetrying);
+    recordInstall(platform_, true, asset->identifier, kRetrying);
     _installGroup->enter();
     // Held weakly: a client that is let go meanwhile, although installs wait, takes them with it.
     Task retry = [weakly = weak_from_this(), asset] {
         std::shared_ptr<AppsClient> client = weakly.lock();
         if (client == nullptr) return;
         const std::shared_ptr<WaitGroup> group = client->_installGroup;
-        client->reenqueue(asset);
+        client->log_(Level::Error, "%s|Re-enqueue installation request for %{public}@",
+                     asset->identifier);
+        client->_enqueueAssetInstall(asset);
         client.reset();
         group->leave();
     };
     platform_.queues.runAfter(kInstallRetryDelay, std::move(retry));
-}
-
-void AppsClient::reenqueue(const SyncAssetPointer& asset) {
-    log_(Level::Error, "%s|Re-enqueue installation request for %{public}@", asset->identifier);
-    _enqueueAssetInstall(asset);
 }
 
 void AppsClient::assetInstallSucceeded(const SyncAssetPointer& asset) {
@@ -150,7 +168,7 @@ void AppsClient::assetInstallFailed(const SyncAssetPointer& asset, const ErrorRe
     if (recoverable || asset->isRestore) {
         log_(Level::Default, "%s|%{public}@ install failed but was recoverable: %{public}@",
              identifier, error);
-        recordRestore(false, identifier, kFailedRecoverably);
+        recordRestore(platform_, false, identifier, kFailedRecoverably);
     } else {
         installDidFailUnrecoverably(*asset, error);
     }
@@ -162,39 +180,20 @@ void AppsClient::installDidFailUnrecoverably(const SyncAsset& asset, const Error
     log_(Level::Default, "%s|%{public}@ install failed unrecoverably: %{public}@", identifier,
          error);
     changeAssetID(identifier, kTodoFailed);
-    if (asset.isRestore) giveUpFailedRestore(identifier);
-    removeFailedInstall(asset);
-}
-
-// No restore comes here today; one that did would have its restore given up.
-void AppsClient::giveUpFailedRestore(const std::string& identifier) const {
-    if (_useInstallCoordinator) {
-        log_(Level::Default,
-             "%s|not asking backup manager to cancel app restore for %{public}@ as install "
-             "coordination is enabled",
-             identifier);
-        return;
+    if (asset.isRestore) {
+        giveUpRestore(*_backupManager, _useInstallCoordinator, log_, identifier,
+                      "%s|not asking backup manager to cancel app restore for %{public}@ as "
+                      "install coordination is enabled");
     }
-    _backupManager->cancelApplicationRestore(identifier);
-}
-
-void AppsClient::removeFailedInstall(const SyncAsset& asset) {
     if (!_useInstallCoordinator) {
-        uninstallFailedInstall(asset.identifier);
+        uninstallFailedInstall(platform_, identifier);
     } else if (!asset.isRestore) {
-        uninstallAppUsingCoordination(asset.identifier);
+        uninstallAppUsingCoordination(identifier);
     } else {
         log_(Level::Default,
              "%s|not uninstalling restore asset %{public}@ as install coordination is enabled",
-             asset.identifier);
+             identifier);
     }
-}
-
-void AppsClient::uninstallFailedInstall(const std::string& identifier) {
-    const Status uninstalled = platform_.registry.uninstallApplication(identifier, {});
-    if (!uninstalled) log_(Level::Error, "%s|Uninstall of %{public}@ failed.", identifier);
-    recordRestore(uninstalled.ok(), identifier,
-                  uninstalled ? kPlaceholderRemoved : kPlaceholderNotRemoved);
 }
 
 bool AppsClient::_isRecoverableError(const ErrorRecord* error) const {
@@ -221,26 +220,6 @@ std::shared_ptr<InstallProgressRecord> AppsClient::_progressForAssetIdentifier(
         progress != nullptr ? std::optional(progress->description()) : std::nullopt;
     log_(Level::Error, "%s|Returning %{public}@ progress for %{public}@", description, identifier);
     return progress;
-}
-
-std::optional<std::string> AppsClient::_operationStateForIdentifier(
-    const std::string& identifier) const {
-    const std::optional<PropertyList> todoList = _loadPlist(platform_, kTodoListPath, nullptr);
-    if (!todoList) return std::nullopt;
-    const std::optional<std::size_t> index = indexOfEntry(*todoList, identifier);
-    if (!index) return std::nullopt;
-    const std::string* operation = todoList->at(*index)->findString(kTodoOperationKey);
-    return operation != nullptr ? std::optional(*operation) : std::nullopt;
-}
-
-void AppsClient::recordInstall(bool success, const std::string& identifier,
-                               std::string_view description) {
-    platform_.transactions.logScenario(kInstallScenario, 0, success, identifier, description);
-}
-
-void AppsClient::recordRestore(bool success, const std::string& identifier,
-                               std::string_view description) {
-    platform_.transactions.logScenario(kRestoreScenario, 0, success, identifier, description);
 }
 
 }  // namespace appsync

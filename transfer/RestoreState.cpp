@@ -6,7 +6,6 @@
 #include "client/AppsClient.h"
 #include "client/Paths.h"
 #include "client/PropertyListFile.h"
-#include "client/TodoList.h"
 
 namespace appsync {
 
@@ -87,22 +86,6 @@ void AppsClient::cleanRestoreStateForIdentifier(const std::string& identifier) {
     } else {
         state.write(platform_);
     }
-}
-
-void AppsClient::changeAssetID(const std::string& identifier, std::string_view toDo) {
-    const std::lock_guard guard(*todoListLock_);
-    std::optional<PropertyList> todoList = _loadPlist(platform_, kTodoListPath, nullptr);
-    if (!todoList) return;
-    const std::optional<std::size_t> index = indexOfEntry(*todoList, identifier);
-    if (!index) return;
-    PropertyList entry = todoList->take(*index);
-    log_(Level::Default, "%s|Changing %{public}@ from %{public}@ to %{public}@", identifier,
-         entry.find(kTodoOperationKey), toDo);
-    entry.set(kTodoOperationKey, toDo);
-    todoList->set(*index, std::move(entry));
-    writePropertyListFile(platform_, std::string(kTodoListPath), *todoList,
-                          PropertyListFormat::Binary)
-        .ignore();
 }
 
 }  // namespace appsync

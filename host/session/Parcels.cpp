@@ -26,7 +26,7 @@ Session::Parcel parcelOf(const ParcelContents& contents, const std::string& vers
     Session::Parcel parcel;
     parcel.asset = std::make_shared<SyncAsset>();
     parcel.asset->identifier = contents.identifier;
-    parcel.asset->dataclass = "Application";
+    parcel.asset->dataclass = kApplicationDataclass;
     parcel.asset->isRestore = contents.isRestore;
     parcel.asset->completedParts = contents.parts;
     parcel.asset->variantOptions.set("AssetParts", contents.parts);

@@ -17,9 +17,6 @@
 namespace appsync {
 namespace {
 
-// Says that the daemon has started up.
-constexpr std::string_view kStartupNotification = "com.korvu.trd.TRStartupCompleteNotification";
-
 Platform watched(const Platform& platform, SessionWatch& watch) {
     return {platform.host,          platform.log,           watch.registry(),
             platform.installer,     watch.coordination(),   watch.policy(),
@@ -96,7 +93,7 @@ Result<std::unique_ptr<PlugIn>> PlugIn::load(Device& device, SyncEvents& events,
     plugIn.watch_ = std::make_unique<SessionWatch>(device, plugIn.platform(), events, facts);
     plugIn.registry_ = &plugIn.watch_->registry();
     plugIn.client_ = AppsClient::create(watched(plugIn.platform(), *plugIn.watch_));
-    plugIn.platform().notificationCenter.post(kStartupNotification);
+    plugIn.platform().notificationCenter.post(kStartupCompleteNotification);
     return loaded;
 }
 

@@ -26,8 +26,6 @@
 namespace appsync {
 namespace {
 
-constexpr std::string_view kDataclass = "Application";
-
 // How often a wait looks whether it is to stop.
 constexpr std::chrono::milliseconds kStopInterval{50};
 
@@ -73,8 +71,8 @@ Session::Session(Device& device, PlugIn& plugIn, SyncEvents& events, SessionFact
 
 SessionEnd Session::sync(const Order& order) {
     const auto disabled = client_.disabledAssetTypes();
-    end_.isDisabled =
-        !owns(client_, kDataclass) || (disabled && disabled->contains(std::string(kDataclass)));
+    end_.isDisabled = !owns(client_, kApplicationDataclass) ||
+                      (disabled && disabled->contains(std::string(kApplicationDataclass)));
     if (end_.isDisabled) return end_;
     takeUpDelivered(order);
     const std::vector<std::string> known =

@@ -41,10 +41,6 @@ struct AppsClientTestAccess {
     static bool hasUninstalledApps(const AppsClient& client) {
         return client._uninstalledApps.has_value();
     }
-    static unsigned assetPartsFor(const AppsClient& client, const TransferItem& item,
-                                  const RestoreState& restoreState) {
-        return client.assetPartsFor(item, restoreState);
-    }
 };
 
 }  // namespace appsync

@@ -163,7 +163,7 @@ void Invariants::checkMarksAreMade() {
             entry.text.substr(entry.text.rfind(' ') + 1);
     }
     for (const auto& [identifier, mark] : marks) {
-        const auto index = indexOfEntry(todoList_, identifier);
+        const auto index = TodoIndex(todoList_).indexOf(identifier);
         if (index && textAt(*todoList_.at(*index), kTodoOperationKey) == mark) continue;
         violate(identifier + " is not marked as " + mark);
     }

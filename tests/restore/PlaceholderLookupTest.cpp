@@ -25,10 +25,21 @@ TEST_F(PlaceholderLookup, FindsAUserBundleByItsExactIdentifier) {
     EXPECT_TRUE(logged(LogLevel::Default, "Found placeholder for bundle com.example.a"));
     EXPECT_TRUE(client_->_placeholderExistsForApplication(kB)) << "no further state is looked at";
     EXPECT_FALSE(client_->_placeholderExistsForApplication("com.example.A"));
-    EXPECT_THAT(platform_.calls(), testing::Each("AppRegistry.enumerateBundles(1)"));
+    EXPECT_THAT(platform_.calls(),
+                testing::Each(testing::StartsWith("AppRegistry.proxyForIdentifier(com.example.")));
 }
 
-TEST_F(PlaceholderLookup, EndsTheWalkAtTheFirstMatch) {
+TEST_F(PlaceholderLookup, PassesOverSystemBundles) {
+    addSystemPlaceholder(kA, true);
+    addSystemPlaceholder(kB, false);
+    EXPECT_FALSE(client_->_placeholderExistsForApplication(kA));
+    EXPECT_FALSE(client_->_placeholderExistsForApplication(kB));
+    EXPECT_THAT(platform_.messages(), IsEmpty());
+    platform_.registry.addApplication(kA);
+    EXPECT_TRUE(client_->_placeholderExistsForApplication(kA)) << "the placeholder covers it";
+}
+
+TEST_F(PlaceholderLookup, TellsOnceOfAnApplicationAndItsPlaceholder) {
     platform_.registry.addApplication(kA);
     platform_.registry.addPlaceholder(kA, kInstallTypeSync);
     EXPECT_TRUE(client_->_placeholderExistsForApplication(kA));

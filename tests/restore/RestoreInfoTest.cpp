@@ -113,8 +113,27 @@ TEST_F(RestoreInfo, OfAnApplicationThatHasAPlaceholderIsSkipped) {
                      "placeholder already exists for 'com.example.a' - skiping'"}));
     EXPECT_THAT(platform_.messageLines(), Not(Contains(StartsWith("8 error"))));
     EXPECT_THAT(platform_.callsTo({"AppRegistry.installPlaceholderBundle"}), SizeIs(1));
-    EXPECT_THAT(platform_.callsTo({"AppRegistry.enumerateBundles"}),
-                ElementsAre("AppRegistry.enumerateBundles(1)"));
+}
+
+TEST_F(RestoreInfo, AsksForEachApplicationByKeyWhenItsTurnComes) {
+    setRestoreInfo(PropertyList::map({{kA, appInfo()}, {kB, appInfo()}}));
+    restore();
+    EXPECT_THAT(platform_.callsTo({"AppRegistry"}),
+                ElementsAre(StartsWith("AppRegistry.proxyForIdentifier(com.example.a"),
+                            StartsWith("AppRegistry.installPlaceholderBundle"),
+                            StartsWith("AppRegistry.proxyForIdentifier(com.example.b"),
+                            StartsWith("AppRegistry.installPlaceholderBundle")));
+}
+
+TEST_F(RestoreInfo, SeesAPlaceholderThatAppearsMeanwhile) {
+    setRestoreInfo(PropertyList::map({{kA, appInfo()}, {kB, appInfo()}}));
+    platform_.onCall("AppRegistry.installPlaceholderBundle", [this](const RecordEntry&) {
+        platform_.registry.addPlaceholder(kB, kInstallTypeStoreDownload, "0.9");
+    });
+    restore();
+    EXPECT_TRUE(
+        logged(LogLevel::Default, "placeholder already exists for 'com.example.b' - skiping'"));
+    EXPECT_EQ(platform_.registry.placeholder(kB)->bundleVersion, "0.9");
 }
 
 TEST_F(RestoreInfo, GivesTheOutcomeOfTheLastApplicationThatWasHandedOn) {

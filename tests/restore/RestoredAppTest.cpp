@@ -45,8 +45,8 @@ FileSystem.readFile(INFO)
 8 default processing vessik restore info
 FileSystem.readFile(/var/mobile/Library/Preferences/com.korvu.Bakvia.DemotedApps.plist)
 14 default Demoted Apps: {IntentionalDowngrades = (B);}
-AppRegistry.enumerateBundles(1)
 8 default processing vessik restore info for 'A' demotionStatus :0
+AppRegistry.proxyForIdentifier(A, placeholders included)
 8 default processing app restore info for 'A'
 FileSystem.temporaryDirectory()
 FileSystem.createDirectory(APPS/A.app, with intermediates, mobile:mobile)
@@ -60,6 +60,7 @@ AppRegistry.installPlaceholderBundle(APPS/A.app, {PackageType = Placeholder; Bun
 8 default Installed Placeholder app from path APPS/A.app: Shown [A 1.0] [isPressel: 0]
 InstallTransactionLog.logScenario(Vessik App Restore, 0, yes, A, Installed placeholder)
 8 default processing vessik restore info for 'B' demotionStatus :1
+AppRegistry.proxyForIdentifier(B, placeholders included)
 8 default processing app restore info for 'B'
 FileSystem.temporaryDirectory()
 FileSystem.createDirectory(APPS/B.app, with intermediates, mobile:mobile)

@@ -2,6 +2,7 @@
 
 #include "tests/client/AppsClientFixture.h"
 #include "transfer/RestoreState.h"
+#include "transfer/TransferAsset.h"
 #include "transfer/TransferItem.h"
 
 namespace appsync {
@@ -297,7 +298,7 @@ class AssetPartsToAskFor : public OutstandingTransfers,
         item.identifier = kA;
         item.version = "1.0";
         item.isRestore = isRestore;
-        return Access::assetPartsFor(*client_, item, RestoreState(platform_.services()));
+        return assetPartsFor(platform_.services(), item, RestoreState(platform_.services()));
     }
     void expectMessage() const {
         const std::string begin = GetParam().message;
