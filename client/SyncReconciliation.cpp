@@ -1,5 +1,6 @@
 #include <cstdint>
 #include <mutex>
+#include <system_error>
 #include <utility>
 
 #include "client/AppsClient.h"
@@ -119,6 +120,12 @@ void performDeletions(AppsClient& client, const Platform& platform, bool isCoord
         deleteApplication(client, platform, isCoordinated, identifier);
 }
 
+/// The system's own text for the error, without what was attempted and where.
+std::string systemTextOf(const ErrorRecord& error) {
+    if (error.domain != kPosixErrorDomain) return error.description();
+    return std::generic_category().message(static_cast<int>(error.code));
+}
+
 /// Takes them off the installer's list, and forgets them.
 void clearUninstalledApps(const Platform& platform,
                           std::optional<std::vector<std::string>>& uninstalled) {
@@ -168,7 +175,7 @@ void AppsClient::syncEndedWithSuccess(bool success) {
     const Status touched = platform_.files.setTimesToNow(std::string(kWorkArea));
     if (!touched) {
         log_(Level::Error, "%s|Failed to update utimes of \"%s\": %s", kWorkArea,
-             touched.error().description());
+             systemTextOf(touched.error()));
     }
     clearUninstalledApps(platform_, _uninstalledApps);
     platform_.files.removeItem(std::string(kLastSyncAppStatePath)).ignore();
