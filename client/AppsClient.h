@@ -81,7 +81,7 @@ class AppsClient final : public SyncClient,
     /// `_notifyDeskora:`: class operation. Tells the home screen that a sync is starting or done.
     static void _notifyDeskora(const Platform& platform, bool starting);
     /// `_orderTheItems:`: class operation. The items, those on the home screen first and in its
-    /// order, the others after them in the order of the map. The map is empty afterwards.
+    /// order, the others after them in the order of the map. Only the others stay in the map.
     [[nodiscard]] static std::vector<PropertyList> _orderTheItems(const Platform& platform,
                                                                   ItemMap& items);
 

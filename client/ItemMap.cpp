@@ -26,12 +26,10 @@ std::optional<PropertyList> ItemMap::take(const std::string& identifier) {
     return std::exchange(slot.item, PropertyList());
 }
 
-void ItemMap::takeAll(const Visitor& visitor) {
-    for (Slot& slot : slots_) {
-        if (slot.identifier != nullptr) visitor(*slot.identifier, std::move(slot.item));
+void ItemMap::forEach(const Visitor& visitor) const {
+    for (const Slot& slot : slots_) {
+        if (slot.identifier != nullptr) visitor(*slot.identifier, slot.item);
     }
-    slots_.clear();
-    places_.clear();
 }
 
 PropertyList ItemMap::description() const {

@@ -12,10 +12,10 @@
 namespace appsync {
 
 /// Items by application identifier, in the order in which they came. No call's cost grows with the
-/// number of items, but for `takeAll` and `description`, which visit each. One thread at a time.
+/// number of items, but for `forEach` and `description`, which visit each. One thread at a time.
 class ItemMap {
   public:
-    using Visitor = std::function<void(const std::string& identifier, PropertyList item)>;
+    using Visitor = std::function<void(const std::string& identifier, const PropertyList& item)>;
 
     explicit ItemMap(std::size_t capacity = 0);
 
@@ -24,8 +24,8 @@ class ItemMap {
     [[nodiscard]] bool contains(const std::string& identifier) const;
     /// Removes the item and hands it over; nothing when there is none.
     std::optional<PropertyList> take(const std::string& identifier);
-    /// Hands every item over, in order; the map is empty afterwards.
-    void takeAll(const Visitor& visitor);
+    /// Shows every item, in order.
+    void forEach(const Visitor& visitor) const;
 
     [[nodiscard]] std::size_t size() const { return places_.size(); }
     /// The map as a value, for messages.

@@ -215,9 +215,9 @@ std::vector<PropertyList> AppsClient::_orderTheItems(const Platform& platform, I
         log(Level::Default, "%s|prioritize %{public}@", *identifier);
         ordered.push_back(*std::move(item));
     }
-    items.takeAll([&](const std::string& identifier, PropertyList item) {
+    items.forEach([&](const std::string& identifier, const PropertyList& item) {
         log(Level::Default, "%s|lastly %{public}@", identifier);
-        ordered.push_back(std::move(item));
+        ordered.push_back(item);
     });
     return ordered;
 }

@@ -67,6 +67,14 @@ TEST_F(IconOrder, PutsItemsInHomeScreenOrderFirst) {
                     "8 default prioritize com.example.b", "8 default lastly com.example.a"));
 }
 
+TEST_F(IconOrder, LeavesInTheMapWhatItDidNotPlace) {
+    platform_.homeScreen.setLayout({kC, kA});
+    EXPECT_THAT(ordered(), ElementsAre(kC, kA, kB));
+    EXPECT_FALSE(items_.contains(kA));
+    EXPECT_TRUE(items_.contains(kB));
+    EXPECT_FALSE(items_.contains(kC));
+}
+
 TEST_F(IconOrder, KeepsTheOrderOfTheMapWithoutAnAnswer) {
     platform_.homeScreen.setFlattenedIconState(std::nullopt);
     EXPECT_THAT(ordered(), ElementsAre(kA, kB, kC));

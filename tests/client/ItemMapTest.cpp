@@ -12,12 +12,12 @@ namespace {
 using testing::ElementsAre;
 using testing::IsEmpty;
 
-std::vector<std::string> takeAll(ItemMap& map) {
-    std::vector<std::string> taken;
-    map.takeAll([&](const std::string& identifier, const PropertyList& item) {
-        taken.push_back(identifier + "=" + std::to_string(item.asInteger().value_or(-1)));
+std::vector<std::string> itemsOf(const ItemMap& map) {
+    std::vector<std::string> items;
+    map.forEach([&](const std::string& identifier, const PropertyList& item) {
+        items.push_back(identifier + "=" + std::to_string(item.asInteger().value_or(-1)));
     });
-    return taken;
+    return items;
 }
 
 TEST(ItemMap, KeepsTheOrderInWhichItemsCame) {
@@ -26,9 +26,9 @@ TEST(ItemMap, KeepsTheOrderInWhichItemsCame) {
     EXPECT_TRUE(map.add("a", 2));
     EXPECT_TRUE(map.add("b", 3));
     EXPECT_EQ(map.size(), 3U);
-    EXPECT_THAT(takeAll(map), ElementsAre("c=1", "a=2", "b=3"));
-    EXPECT_EQ(map.size(), 0U);
-    EXPECT_THAT(takeAll(map), IsEmpty());
+    EXPECT_THAT(itemsOf(map), ElementsAre("c=1", "a=2", "b=3"));
+    EXPECT_EQ(map.size(), 3U) << "they are only shown";
+    EXPECT_THAT(itemsOf(ItemMap()), IsEmpty());
 }
 
 TEST(ItemMap, KeepsTheFirstItemOfAnIdentifier) {
@@ -55,7 +55,7 @@ TEST(ItemMap, PutsAnItemThatWasTakenAtTheEndWhenItComesBack) {
     map.add("b", 2);
     ASSERT_TRUE(map.take("a"));
     map.add("a", 3);
-    EXPECT_THAT(takeAll(map), ElementsAre("b=2", "a=3"));
+    EXPECT_THAT(itemsOf(map), ElementsAre("b=2", "a=3"));
 }
 
 }  // namespace
