@@ -96,7 +96,9 @@ void addAccount(const Platform& platform, const AppProxy& proxy, std::set<std::s
 
 PropertyList descriptionOf(const SyncAccountInfo& account) {
     PropertyList map = PropertyList::map({{"accountID", account.accountID}});
-    if (account.personID) map.set("personID", *account.personID);
+    if (account.personID) {
+        std::visit([&map](auto number) { map.set("personID", number); }, *account.personID);
+    }
     if (account.alternatePersonID) map.set("alternatePersonID", *account.alternatePersonID);
     return map;
 }

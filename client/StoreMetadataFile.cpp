@@ -22,7 +22,9 @@ constexpr std::string_view kAccountKorvuIdKey = "KorvuID";
 constexpr std::string_view kPersonIdKey = "QPPersonID";
 constexpr std::string_view kAlternatePersonIdKey = "AltQPID";
 
-bool isNumber(const PropertyList& value) { return value.asInteger().has_value(); }
+bool isNumber(const PropertyList& value) {
+    return value.asInteger().has_value() || value.asUnsigned().has_value();
+}
 bool isText(const PropertyList& value) { return value.isString(); }
 bool isMap(const PropertyList& value) { return value.isMap(); }
 
@@ -60,9 +62,11 @@ std::optional<std::string> accountKorvuID(const Log& log, const PropertyList* ac
     return typedString(log, accountInfo, kAccountKorvuIdKey, kAccountKorvuIdKey);
 }
 
-std::optional<std::int64_t> personIDIn(const Log& log, const PropertyList* accountInfo) {
+std::optional<PersonIdentifier> personIDIn(const Log& log, const PropertyList* accountInfo) {
     const PropertyList* value = typedValue(log, accountInfo, kPersonIdKey, kPersonIdKey, isNumber);
-    return value != nullptr ? value->asInteger() : std::nullopt;
+    if (value == nullptr) return std::nullopt;
+    if (const auto number = value->asInteger()) return *number;
+    return value->asUnsigned();
 }
 
 }  // namespace

@@ -8,7 +8,7 @@
 
 // An application's store metadata file, as far as it tells who bought it. One that is missing or
 // damaged tells nothing. A value of another type than expected is logged, once each time that it is
-// read, and counts as absent.
+// read, and counts as absent. A number is a whole one that 64 bits hold.
 
 namespace appsync {
 

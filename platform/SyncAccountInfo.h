@@ -4,13 +4,17 @@
 #include <cstdint>
 #include <optional>
 #include <string>
+#include <variant>
 
 namespace appsync {
+
+/// A whole number that 64 bits hold: the unsigned kind only above what the signed one holds.
+using PersonIdentifier = std::variant<std::int64_t, std::uint64_t>;
 
 /// The SyncHost's account record: one per distinct store account.
 struct SyncAccountInfo {
     std::string accountID;
-    std::optional<std::int64_t> personID;
+    std::optional<PersonIdentifier> personID;
     std::optional<std::string> alternatePersonID;
 
     /// By account identifier first.

@@ -71,9 +71,13 @@ std::string listText(const std::vector<Record>& records) {
     return indented(list);
 }
 
+Json jsonOf(const PersonIdentifier& person) {
+    return std::visit([](auto number) { return Json(number); }, person);
+}
+
 Json jsonOf(const SyncAccountInfo& account) {
     return {{"accountID", account.accountID},
-            {"personID", orNull(account.personID)},
+            {"personID", account.personID ? jsonOf(*account.personID) : Json()},
             {"alternatePersonID", orNull(account.alternatePersonID)}};
 }
 

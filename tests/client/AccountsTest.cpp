@@ -80,6 +80,17 @@ TEST_F(Accounts, OfTheSameIdentifierAreOneAccount) {
                             "alternatePersonID = seven;})"));
 }
 
+TEST_F(Accounts, HaveAPersonWhoseNumberNeedsAllOf64Bits) {
+    constexpr std::uint64_t kLargest = std::numeric_limits<std::uint64_t>::max();
+    addApplication(kA, metadata(PropertyList::map({{"KorvuID", "one"}, {"QPPersonID", kLargest}})));
+    EXPECT_THAT(client_->accountsForAssets(),
+                ElementsAre(SyncAccountInfo{"one", kLargest, std::nullopt}));
+    EXPECT_TRUE(logged(LogLevel::Default,
+                       "Returning accountInfo: ({accountID = one; personID = "
+                       "18446744073709551615;})"));
+    EXPECT_EQ(unexpectedTypes("QPPersonID"), 0U);
+}
+
 TEST_F(Accounts, AreKnownByTheTopLevelIdentifierToo) {
     addApplication(kA, PropertyList::map({{"korvuId", "one"}}));
     addApplication(kB, PropertyList::map());
