@@ -9,6 +9,7 @@
 #include "platform/Notifications.h"
 #include "platform/SyncAsset.h"
 #include "platform/SyncHost.h"
+#include "transfer/RestoreState.h"
 
 namespace appsync {
 
@@ -39,7 +40,10 @@ bool isAllowed(DevicePolicyService& policy, PolicyFeature feature) {
 
 }  // namespace
 
-AppsClient::AppsClient(const Platform& platform) : platform_(platform), log_(platform) {}
+AppsClient::AppsClient(const Platform& platform)
+    : platform_(platform),
+      log_(platform),
+      restoreStateReader_(std::make_unique<RestoreStateReader>()) {}
 
 std::shared_ptr<AppsClient> AppsClient::create(const Platform& platform) {
     std::shared_ptr<AppsClient> client(new AppsClient(platform));

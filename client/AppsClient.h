@@ -23,7 +23,7 @@ namespace appsync {
 
 class AppInstallObserver;
 class BackupManager;
-class RestoreState;
+class RestoreStateReader;
 class WantedTransfers;
 
 /// The plug-in: the one object that the SyncHost sees, for the dataclass "Application".
@@ -328,8 +328,7 @@ class AppsClient final : public SyncClient,
 
     // transfer/
     [[nodiscard]] SyncAssetPointer prepareAsset(const PropertyList& itemMap,
-                                                const WantedTransfers& wants,
-                                                const RestoreState& restoreState);
+                                                const WantedTransfers& wants);
     bool prepareCoordinator(const SyncAsset& asset);
     void runInstall(const SyncAssetPointer& asset);
     void install(const SyncAssetPointer& asset);
@@ -375,6 +374,7 @@ class AppsClient final : public SyncClient,
     // this order. Reading needs neither: the files are replaced atomically.
     std::unique_ptr<Lock> todoListLock_;
     std::unique_ptr<Lock> restoreStateLock_;
+    const std::unique_ptr<RestoreStateReader> restoreStateReader_;  // guards itself
 };
 
 }  // namespace appsync

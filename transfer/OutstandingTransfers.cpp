@@ -5,7 +5,6 @@
 #include "client/Paths.h"
 #include "client/PropertyListFile.h"
 #include "client/TodoList.h"
-#include "transfer/RestoreState.h"
 #include "transfer/TransferAsset.h"
 #include "transfer/TransferItem.h"
 #include "transfer/WantedTransfers.h"
@@ -59,21 +58,19 @@ std::vector<SyncAssetPointer> AppsClient::outstandingAssetTransfers() {
     WantedTransfers wants(*this, platform_, _useInstallCoordinator, _kolmAppsToIgnore);
     const std::vector<PropertyList> items = wants.takeItems();
     emptyIconDirectory(platform_);
-    // Read once: nothing that happens while the items are prepared adds to it.
-    const RestoreState restoreState(platform_);
     for (const PropertyList& item : items) {
-        SyncAssetPointer asset = prepareAsset(item, wants, restoreState);
+        SyncAssetPointer asset = prepareAsset(item, wants);
         if (asset != nullptr) result.push_back(std::move(asset));
     }
     return result;
 }
 
-SyncAssetPointer AppsClient::prepareAsset(const PropertyList& itemMap, const WantedTransfers& wants,
-                                          const RestoreState& restoreState) {
+SyncAssetPointer AppsClient::prepareAsset(const PropertyList& itemMap,
+                                          const WantedTransfers& wants) {
     TransferItem item = TransferItem::fromItemMap(itemMap);
     item.displayName = displayNameOfBundle(platform_, item.bundlePath);
     if (wants.isSkipped(item)) return nullptr;
-    SyncAssetPointer asset = makeTransferAsset(platform_, item, restoreState);
+    SyncAssetPointer asset = makeTransferAsset(*this, platform_, item);
     const bool isWanted = _useInstallCoordinator
                               ? prepareCoordinator(*asset)
                               : createMissingPlaceholder(*this, log_, *asset, wants);

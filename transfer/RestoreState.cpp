@@ -19,14 +19,16 @@ PropertyList takeMap(PropertyList& parent, std::string_view key) {
 
 }  // namespace
 
-RestoreState::RestoreState(const Platform& platform) {
-    const Result<Bytes> bytes = platform.files.readFile(std::string(kRestoreStatePath));
-    wasRead_ = bytes.ok();
-    if (!bytes) {
+RestoreState::RestoreState(const Platform& platform)
+    : RestoreState(platform, platform.files.readFile(std::string(kRestoreStatePath))) {}
+
+RestoreState::RestoreState(const Platform& platform, const Result<Bytes>& file)
+    : wasRead_(file.ok()) {
+    if (!file) {
         root_ = PropertyList::map();
         return;
     }
-    Result<PropertyList> root = platform.propertyLists.parse(*bytes);
+    Result<PropertyList> root = platform.propertyLists.parse(*file);
     if (root && root->isMap()) root_ = *std::move(root);
 }
 
@@ -58,10 +60,26 @@ void RestoreState::write(const Platform& platform) const {
         .ignore();
 }
 
+std::shared_ptr<const RestoreState> RestoreStateReader::read(const Platform& platform) {
+    Result<Bytes> file = platform.files.readFile(std::string(kRestoreStatePath));
+    if (!file) return std::make_shared<const RestoreState>(platform, file);
+    if (auto known = parsedFrom(*file)) return known;
+    auto state = std::make_shared<const RestoreState>(platform, file);
+    const std::lock_guard guard(mutex_);
+    bytes_ = *std::move(file);
+    state_ = state;
+    return state;
+}
+
+std::shared_ptr<const RestoreState> RestoreStateReader::parsedFrom(const Bytes& bytes) const {
+    const std::lock_guard guard(mutex_);
+    return state_ != nullptr && bytes_ == bytes ? state_ : nullptr;
+}
+
 std::optional<PropertyList> AppsClient::_restoreStatePropertyForKey(
     std::string_view key, const std::string& identifier, const std::string* version) const {
-    const RestoreState state(platform_);
-    const PropertyList* value = state.property(key, identifier, version);
+    const std::shared_ptr<const RestoreState> state = restoreStateReader_->read(platform_);
+    const PropertyList* value = state->property(key, identifier, version);
     return value != nullptr ? std::optional(*value) : std::nullopt;
 }
 

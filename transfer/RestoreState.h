@@ -1,10 +1,14 @@
 #pragma once
 
+#include <memory>
+#include <mutex>
 #include <optional>
 #include <string>
 #include <string_view>
 
+#include "platform/Bytes.h"
 #include "platform/PropertyList.h"
+#include "platform/Result.h"
 
 namespace appsync {
 
@@ -23,6 +27,8 @@ class RestoreState {
   public:
     /// Reads the file, uncached.
     explicit RestoreState(const Platform& platform);
+    /// What reading the file gave.
+    RestoreState(const Platform& platform, const Result<Bytes>& file);
 
     /// Whether there was a file that could be read.
     [[nodiscard]] bool wasRead() const { return wasRead_; }
@@ -45,6 +51,23 @@ class RestoreState {
   private:
     bool wasRead_ = false;
     std::optional<PropertyList> root_;
+};
+
+/// Reads RestoreState.plist for those who ask it again and again: each time the file, but it is
+/// parsed again only when its bytes are others. Any thread. Nothing outside is called under the
+/// mutex.
+class RestoreStateReader {
+  public:
+    /// The state at this moment.
+    [[nodiscard]] std::shared_ptr<const RestoreState> read(const Platform& platform);
+
+  private:
+    [[nodiscard]] std::shared_ptr<const RestoreState> parsedFrom(const Bytes& bytes) const;
+
+    mutable std::mutex mutex_;
+    // Protected by mutex_: what was parsed last, and from what.
+    Bytes bytes_;
+    std::shared_ptr<const RestoreState> state_;
 };
 
 }  // namespace appsync

@@ -37,16 +37,15 @@ std::optional<std::string> textOf(const std::optional<FileURL>& url) {
 
 }  // namespace
 
-SyncAssetPointer makeTransferAsset(const Platform& platform, const TransferItem& item,
-                                   const RestoreState& restoreState) {
+SyncAssetPointer makeTransferAsset(const AppsClient& client, const Platform& platform,
+                                   const TransferItem& item) {
     auto asset = std::make_shared<SyncAsset>();
     asset->identifier = item.identifier;
     asset->dataclass = kApplicationDataclass;
     asset->prettyName = prettyNameOf(item);
     asset->icon = FileURL::fromPath(makeIcon(platform, item), false);
     asset->isRestore = item.isRestore;
-    asset->variantOptions =
-        variantOptions(assetPartsFor(platform, item, restoreState), item.version);
+    asset->variantOptions = variantOptions(assetPartsFor(client, platform, item), item.version);
     asset->storeMetadataPath = formatPath(kStoreMetadataFormat, {item.container});
     asset->infoPath = formatPath(kInfoFormat, {item.container});
     const Log log(platform);
@@ -60,13 +59,13 @@ SyncAssetPointer makeTransferAsset(const Platform& platform, const TransferItem&
     return asset;
 }
 
-unsigned assetPartsFor(const Platform& platform, const TransferItem& item,
-                       const RestoreState& restoreState) {
+unsigned assetPartsFor(const AppsClient& client, const Platform& platform,
+                       const TransferItem& item) {
     const Log log(platform);
     const std::string* version = item.version ? &*item.version : nullptr;
-    const PropertyList* recorded =
-        restoreState.property(kRestoreStatePathKey, item.identifier, version);
-    const std::string* path = recorded != nullptr ? recorded->asString() : nullptr;
+    const std::optional<PropertyList> recorded =
+        client._restoreStatePropertyForKey(kRestoreStatePathKey, item.identifier, version);
+    const std::string* path = recorded ? recorded->asString() : nullptr;
     const bool isThere = path != nullptr && platform.files.itemExists(*path);
     if (isThere) {
         log(Level::Default, "%s|Recovered download path for %{public}@ at %{public}@",

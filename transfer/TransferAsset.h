@@ -4,17 +4,17 @@
 
 namespace appsync {
 
-class RestoreState;
+class AppsClient;
 struct Platform;
 struct TransferItem;
 
 /// The asset by which the host is asked for an application: its icon is made, and the parts to ask
 /// for depend on what an interrupted session has left.
-[[nodiscard]] SyncAssetPointer makeTransferAsset(const Platform& platform, const TransferItem& item,
-                                                 const RestoreState& restoreState);
+[[nodiscard]] SyncAssetPointer makeTransferAsset(const AppsClient& client, const Platform& platform,
+                                                 const TransferItem& item);
 
 /// The `AssetParts` to ask for.
-[[nodiscard]] unsigned assetPartsFor(const Platform& platform, const TransferItem& item,
-                                     const RestoreState& restoreState);
+[[nodiscard]] unsigned assetPartsFor(const AppsClient& client, const Platform& platform,
+                                     const TransferItem& item);
 
 }  // namespace appsync

@@ -275,6 +275,19 @@ TEST_F(OutstandingTransfers, GoOnWithoutAnIconDirectory) {
     EXPECT_EQ(assets_.front()->icon->path(), staged(kA) + "/VessikArtwork");
 }
 
+TEST_F(OutstandingTransfers, SeeARecordedDownloadThatIsForgottenMeanwhile) {
+    setTodoList(PropertyList::array({todoEntry(kA, "install"), todoEntry(kB, "install")}));
+    setPath(kA, packagePath(kA));
+    setPath(kB, packagePath(kB));
+    platform_.files.addFile(packagePath(kA), "package");
+    platform_.onCall("AppRegistry.installPlaceholderBundle",
+                     [this](const RecordEntry&) { client_->cleanRestoreStateForIdentifier(kB); });
+    transfers();
+    EXPECT_TRUE(logged(LogLevel::Default,
+                       "Recovered download path for com.example.a at " + packagePath(kA)));
+    EXPECT_THAT(platform_.messages(), Not(Contains(HasSubstr("but the file is missing"))));
+}
+
 // The parts that are asked for. A restore comes from a placeholder that stands, so that none is
 // returned; the parts are what the client would ask for.
 
@@ -298,7 +311,7 @@ class AssetPartsToAskFor : public OutstandingTransfers,
         item.identifier = kA;
         item.version = "1.0";
         item.isRestore = isRestore;
-        return assetPartsFor(platform_.services(), item, RestoreState(platform_.services()));
+        return assetPartsFor(*client_, platform_.services(), item);
     }
     void expectMessage() const {
         const std::string begin = GetParam().message;
@@ -358,7 +371,7 @@ TEST(LongTodoList, IsPlannedWithoutTouchingWhatIsNotWanted) {
     std::size_t skipped = 0;
     platform.onCall("FileSystem.readFile", [&](const RecordEntry&) { ++skipped; });
     EXPECT_THAT(client->outstandingAssetTransfers(), IsEmpty());
-    EXPECT_EQ(skipped, 10'000U + 2U) << "each wanted one's info, the list and the restore state";
+    EXPECT_EQ(skipped, 10'000U + 1U) << "each wanted one's info, and the list";
 }
 
 }  // namespace

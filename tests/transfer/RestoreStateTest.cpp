@@ -165,5 +165,15 @@ TEST_F(RestoreStateStore, ThatIsDamagedIsLeftAsItIs) {
     EXPECT_THAT(writes(), IsEmpty());
 }
 
+TEST_F(RestoreStateStore, IsParsedAgainOnlyWhenItsBytesAreOthers) {
+    setPath(kA, kOne, "/a.zip");
+    platform_.clearRecording();
+    EXPECT_TRUE(path(kA, kOne));
+    EXPECT_TRUE(path(kA, kOne));
+    EXPECT_THAT(platform_.callsTo({"PropertyListSerialization.parse"}), testing::SizeIs(1));
+    setPath(kA, kOne, "/b.zip");
+    EXPECT_EQ(path(kA, kOne), "/b.zip");
+}
+
 }  // namespace
 }  // namespace appsync

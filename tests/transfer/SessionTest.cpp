@@ -65,7 +65,6 @@ FileSystem.writeFileAtomically(AREA/AssetSortOrder.plist)
 8 default prioritize A
 FileSystem.removeItem(AREA/Icons)
 FileSystem.createDirectory(AREA/Icons, alone, (null))
-FileSystem.readFile(AREA/RestoreState.plist)
 FileSystem.readFile(TODO/A/Info.plist)
 IconRenderer.openBundle(TODO/A)
 IconRenderer.homeScreenIcon(TODO/A)
@@ -73,6 +72,7 @@ IconRenderer.createImageDestination(public.png, 1)
 ImageDestination.addImage(TODO/A)
 ImageDestination.finalize()
 FileSystem.writeFileAtomically(AREA/Icons/A.png)
+FileSystem.readFile(AREA/RestoreState.plist)
 8 default Asset A (pretty=Shown, version=1.0) prepped with icon file://AREA/Icons/A.png, at TODO/A, meta at TODO/A/VessikMetadata.plist, info at TODO/A/Info.plist, storePid=0, isRestore=n
 8 default plist TODO/A/Info.plist
 FileSystem.readFile(TODO/A/Info.plist)
