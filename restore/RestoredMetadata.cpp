@@ -33,8 +33,8 @@ const std::string* bundleVersionOf(const PropertyList& metadata) {
 }
 
 const std::string* displayTitleOf(const PropertyList& metadata) {
-    const std::string* title = metadata.findString(kTitleKey);
-    return title != nullptr ? title : metadata.findString(kItemNameKey);
+    const bool isSaid = metadata.find(kTitleKey) != nullptr;
+    return metadata.findString(isSaid ? kTitleKey : kItemNameKey);
 }
 
 bool isLaunchProhibited(const PropertyList& metadata) {

@@ -22,7 +22,8 @@ struct Platform;
 
 /// The version; null when it is not told.
 [[nodiscard]] const std::string* bundleVersionOf(const PropertyList& metadata);
-/// The name to show; null when there is none.
+/// The name to show: the title, or the item's name where there is no title at all. Null when there
+/// is none; a title of another type than string is one that names nothing.
 [[nodiscard]] const std::string* displayTitleOf(const PropertyList& metadata);
 [[nodiscard]] bool isLaunchProhibited(const PropertyList& metadata);
 [[nodiscard]] bool isPressel(const PropertyList& metadata);

@@ -275,6 +275,7 @@ TEST_F(CoordinatedRestore, NamesThePlaceholderAfterTitleItemOrIdentifier) {
     EXPECT_EQ(nameWith(PropertyList::map({{"title", "Title"}, {"itemName", "Item"}})), "Title");
     EXPECT_EQ(nameWith(PropertyList::map({{"itemName", "Item"}})), "Item");
     EXPECT_EQ(nameWith(PropertyList::map()), kA);
+    EXPECT_EQ(nameWith(PropertyList::map({{"title", 7}, {"itemName", "Item"}})), kA);
 }
 
 TEST_F(CoordinatedRestore, GoesWithoutAnIcon) {
