@@ -123,6 +123,10 @@ bool CoordinatedRestore::begin(CoordinatorKind kind) {
         InstallCoordinatorService::Creation::CreateIfNotExisting);
     coordinator_ = std::move(found.coordinator);
     pieces_.lastError() = std::move(found.error);
+    // One of another client's is not touched: it counts as none.
+    if (coordinator_ != nullptr && coordinator_->creatorIdentifier() != SyncClientID) {
+        coordinator_.reset();
+    }
     if (coordinator_ != nullptr) return true;
     log_(Level::Error, "%s|Error %{public}@ creating restore coordinator for %{public}@",
          pieces_.lastError(), app_.identifier);

@@ -3,6 +3,7 @@
 #include <utility>
 
 #include "coordination/InstallErrors.h"
+#include "restore/RestoredApp.h"
 #include "tests/restore/RestoreFixture.h"
 
 namespace appsync {
@@ -92,6 +93,7 @@ FileSystem.readFile(/var/mobile/Library/Preferences/com.korvu.Bakvia.DemotedApps
 8 default processing app restore for non demoted bundle 'A' with install coordination
 InstallTransactionLog.logStep(2, 1, 1, yes, A, Restore app)
 InstallCoordinatorService.coordinator(restoring, A, 3, create if not existing)
+InstallCoordinator.creatorIdentifier(A)
 InstallCoordinator.appAssetPromiseResponsibleClient(A)
 InstallCoordinator.setObserver(A)
 InstallCoordinator.hasUserDataPromise(A)
@@ -137,6 +139,7 @@ InstallTransactionLog.logStep(2, 1, 2, yes, A, Restore app)
 8 default processing app restore for demoted bundle 'B' with install coordination
 InstallTransactionLog.logStep(2, 1, 1, yes, B, Restore demoted app)
 InstallCoordinatorService.coordinator(restoring demoted, B, 3, create if not existing)
+InstallCoordinator.creatorIdentifier(B)
 InstallCoordinator.setObserver(B)
 InstallCoordinator.hasUserDataPromise(B)
 InstallCoordinatorService.makeOutOfBandPromise(B-UserData, 3, 0)
@@ -327,6 +330,7 @@ TEST_F(CoordinatedRestore, TouchesNothingThatIsLeftToTheAppStoreAlready) {
             StartsWith("PropertyListSerialization.parse("),
             "InstallCoordinatorService.coordinator(restoring, com.example.a, 3, create if not "
             "existing) -> com.example.a, existing",
+            "InstallCoordinator.creatorIdentifier(com.example.a) -> 3",
             "InstallCoordinator.appAssetPromiseResponsibleClient(com.example.a) -> 1",
             "8 default App asset DRI for com.example.a is set to 1 - nothing more for trd to do",
             "InstallTransactionLog.logStep(2, 1, 2, yes, com.example.a, Restore app)"));
@@ -378,6 +382,23 @@ TEST_F(CoordinatedRestore, OfDamagedMetadataIsGivenUpWithoutACoordinator) {
 TEST_F(CoordinatedRestore, OfMetadataThatIsNoMapIsGivenUp) {
     EXPECT_FALSE(prepare(0, PropertyList::array({1})));
     expectFinished("processing app restore for com.example.a finished with status 0 error Error");
+}
+
+TEST_F(CoordinatedRestore, TakesACoordinatorOfAnotherClientForNone) {
+    for (const std::uint64_t status : {kNotDemoted, kIntentionallyDemoted}) {
+        const bool isDemoted = status != kNotDemoted;
+        makeClient();
+        service().addCoordinator(
+            isDemoted ? CoordinatorKind::RestoringDemoted : CoordinatorKind::Restoring, kA, 2);
+        platform_.clearRecording();
+        EXPECT_FALSE(prepare(status));
+        EXPECT_TRUE(
+            logged(LogLevel::Error, "Error (null) creating restore coordinator for com.example.a"));
+        EXPECT_EQ(service().state(kA)->cancelled, std::nullopt);
+        EXPECT_THAT(platform_.callsTo({"InstallCoordinator"}),
+                    ElementsAre(StartsWith("InstallCoordinator.creatorIdentifier")));
+        service().cancel(kA, refusal_, 2);
+    }
 }
 
 TEST_F(CoordinatedRestore, NeedsACoordinator) {
