@@ -12,6 +12,7 @@
 #include <sys/syscall.h>
 #include <unistd.h>
 
+#include "system/MachinePath.h"
 #include "system/PosixError.h"
 
 namespace appsync {
@@ -23,8 +24,9 @@ constexpr int kResolutionTries = 1000;
 
 bool isWorthRepeating(int code) { return code == EAGAIN || code == EINTR; }
 
-UniqueFd openInRoot(int root, const char* path, int flags, mode_t mode,
+UniqueFd openInRoot(int root, const std::string& path, int flags, mode_t mode,
                     std::uint64_t resolution = 0) {
+    const std::string kept = machinePath(path);
     open_how how{};
     how.flags = static_cast<std::uint64_t>(flags | O_CLOEXEC | O_NOCTTY);
     if ((flags & O_PATH) != 0) how.flags = static_cast<std::uint64_t>(flags | O_CLOEXEC);
@@ -33,7 +35,8 @@ UniqueFd openInRoot(int root, const char* path, int flags, mode_t mode,
     how.resolve = RESOLVE_IN_ROOT | RESOLVE_NO_MAGICLINKS | resolution;
     UniqueFd opened;
     for (int tries = 0; tries < kResolutionTries; ++tries) {
-        opened.reset(static_cast<int>(::syscall(SYS_openat2, root, path, &how, sizeof how)));
+        opened.reset(
+            static_cast<int>(::syscall(SYS_openat2, root, kept.c_str(), &how, sizeof how)));
         if (opened || !isWorthRepeating(errno)) break;
     }
     return opened;
@@ -70,7 +73,7 @@ Result<UniqueFd> RootDirectory::openFile(const std::string& path, int flags, mod
     if (const auto complaint = complaintAbout(path)) {
         return posixError(EINVAL, operation, path, *complaint);
     }
-    UniqueFd opened = openInRoot(descriptor_.get(), path.c_str(), flags, mode);
+    UniqueFd opened = openInRoot(descriptor_.get(), path, flags, mode);
     if (!opened) return posixError(errno, operation, path);
     return opened;
 }
@@ -86,7 +89,7 @@ Result<UniqueFd> RootDirectory::openDirectoryWithoutLinks(const std::string& pat
         return posixError(EINVAL, operation, path, *complaint);
     }
     UniqueFd opened =
-        openInRoot(descriptor_.get(), path.c_str(), O_RDONLY | O_DIRECTORY, 0, RESOLVE_NO_SYMLINKS);
+        openInRoot(descriptor_.get(), path, O_RDONLY | O_DIRECTORY, 0, RESOLVE_NO_SYMLINKS);
     if (!opened) return posixError(errno, operation, path);
     return opened;
 }
@@ -111,12 +114,12 @@ Result<ItemPlace> RootDirectory::place(const std::string& path, std::string_view
     }
     const std::size_t end = path.find_last_not_of('/') + 1;
     const std::size_t start = end == 0 ? 0 : path.rfind('/', end - 1) + 1;
-    std::string name = path.substr(start, end - start);
+    std::string name = machinePath(path.substr(start, end - start));
     if (name.empty() || name == "." || name == "..") {
         return posixError(EINVAL, operation, path, "the path does not end in a name");
     }
     UniqueFd directory =
-        openInRoot(descriptor_.get(), path.substr(0, start).c_str(), O_PATH | O_DIRECTORY, 0);
+        openInRoot(descriptor_.get(), path.substr(0, start), O_PATH | O_DIRECTORY, 0);
     if (!directory) return posixError(errno, operation, path);
     return ItemPlace{std::move(directory), std::move(name), end < path.size()};
 }

@@ -18,6 +18,7 @@
 #include "platform/AppRegistry.h"
 #include "platform/PropertyListSerialization.h"
 #include "system/DescriptorIO.h"
+#include "system/MachinePath.h"
 #include "system/PosixError.h"
 #include "system/RootDirectory.h"
 #include "system/RootedFileSystem.h"
@@ -30,6 +31,7 @@ constexpr std::uint64_t kLargestInfo = std::uint64_t{1} << 20U;
 constexpr std::string_view kInfoName = "Info.plist";
 constexpr std::string_view kMetadataName = "VessikMetadata.plist";
 constexpr std::string_view kDefaultIconName = "Icon.png";
+constexpr std::string_view kBundleSuffix = ".app";
 
 using AlsoCommitted = std::function<Status(Database&)>;
 
@@ -64,8 +66,15 @@ std::string lastComponent(std::string_view path) {
     return std::string(path.substr(path.rfind('/') + 1));
 }
 
+// Alone in its container, so a name that had to be cut is as good.
+std::string nameOnMachine(std::string name) {
+    if (name.size() <= kLongestMachineName) return name;
+    name.resize(kLongestMachineName - kBundleSuffix.size());
+    return name.append(kBundleSuffix);
+}
+
 bool isPlainName(std::string_view name) {
-    return !name.empty() && name.size() <= 255 && name != "." && name != ".." &&
+    return !name.empty() && name.size() <= kLongestMachineName && name != "." && name != ".." &&
            name != kInfoName && name.find_first_of(std::string_view("/\0", 2)) == name.npos;
 }
 
@@ -98,7 +107,7 @@ Status readInfo(const InstallContext& context, const PlaceholderSource& source, 
 Result<Bundle> readBundle(const InstallContext& context, const PlaceholderSource& source) {
     Bundle bundle;
     if (Status status = readInfo(context, source, bundle); !status) return status.error();
-    bundle.directoryName = lastComponent(source.bundle);
+    bundle.directoryName = nameOnMachine(lastComponent(source.bundle));
     if (!isPlainName(bundle.directoryName)) {
         return refused(source.identifier, "its directory has no name").error();
     }
@@ -225,8 +234,7 @@ Result<Bundle> makeBundle(const InstallContext& context, const PlaceholderConten
     Result<Bytes> info = context.propertyLists.serialize(contents.info, PropertyListFormat::Binary);
     if (!info) return refused(contents.identifier, info.error().description()).error();
     Bundle bundle;
-    // Alone in its container, so a name that had to be cut is as good.
-    bundle.directoryName = contents.identifier.substr(0, 251) + ".app";
+    bundle.directoryName = nameOnMachine(contents.identifier + std::string(kBundleSuffix));
     bundle.version = textAt(contents.info, BundleVersionKey);
     bundle.name = textAt(contents.info, BundleDisplayNameKey);
     bundle.iconName = kDefaultIconName;

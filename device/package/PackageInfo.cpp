@@ -55,9 +55,9 @@ Result<std::string> identifierIn(const PropertyList& info) {
                        "is missing or is not a string");
     }
     if (isLegalIdentifier(*identifier)) return *identifier;
-    return illegal(PackageErrorCode::IllegalIdentifier, BundleIdentifierKey,
-                   "is " + quotedName(*identifier) +
-                       ", which is not 1 to 255 letters, digits, '.', '-' and '_'");
+    return illegal(
+        PackageErrorCode::IllegalIdentifier, BundleIdentifierKey,
+        "is " + quotedName(*identifier) + ", which is not " + std::string(kIdentifierRule));
 }
 
 }  // namespace

@@ -110,9 +110,8 @@ Status placeholdersUnderWay(Database& database, std::vector<AppProxy>& proxies) 
 Status requireLegalIdentifier(const std::string& identifier) {
     if (isLegalIdentifier(identifier)) return {};
     return registryError(RegistryErrorCode::IllegalIdentifier,
-                         quotedName(identifier) +
-                             " is not the identifier of an application: 1 to 255 letters, digits, "
-                             "'.', '-' and '_'");
+                         quotedName(identifier) + " is not the identifier of an application: " +
+                             std::string(kIdentifierRule));
 }
 
 DeviceRegistry::DeviceRegistry(const InstallContext& context)

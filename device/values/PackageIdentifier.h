@@ -10,6 +10,9 @@ namespace appsync {
 /// The longest identifier of an application, in bytes.
 inline constexpr std::size_t kMaximumIdentifierLength = 255;
 
+/// What a legal identifier consists of, for the sentences that refuse one.
+inline constexpr std::string_view kIdentifierRule = "1 to 255 letters, digits, '.', '-' and '_'";
+
 /// Whether a device accepts the text as the identifier of an application: 1 to 255 bytes of
 /// letters, digits, '.', '-' and '_', and neither "." nor "..". Such a text is safe as the name of
 /// a file.

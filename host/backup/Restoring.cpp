@@ -34,8 +34,6 @@ namespace fs = std::filesystem;
 
 constexpr std::uint64_t kLargestList = std::uint64_t{2} << 30U;
 constexpr std::int64_t kApplicationsToo[] = {2, 3};
-// Where the device's files for a placeholder are named ID.app.
-constexpr std::size_t kLongestIdentifier = 251;
 // Archives that share what makes them durable; several files are open for each.
 constexpr std::size_t kPlacedTogether = 64;
 
@@ -127,8 +125,8 @@ class Restoring {
         PropertyList taken = PropertyList::map();
         for (const auto& [identifier, entry] : info.entries()) {
             if (!isLegalIdentifier(identifier)) {
-                fail(identifier,
-                     "this is not an identifier, so it is left out; use another backup");
+                fail(identifier, "this is not an identifier (" + std::string(kIdentifierRule) +
+                                     "), so it is left out; use another backup");
             } else if (installed_.contains(identifier)) {
                 result_.kept.push_back(identifier);
             } else {
@@ -161,12 +159,6 @@ class Restoring {
         wanted_.push_back(identifier);
         if (!defect.empty()) {
             defects_[identifier] = defect + "; use another backup, or install it with appsync sync";
-        }
-        if (identifier.size() > kLongestIdentifier) {
-            defects_[identifier] =
-                "its identifier is too long for the files of the device; give "
-                "the application one of at most " +
-                std::to_string(kLongestIdentifier) + " bytes";
         }
     }
 

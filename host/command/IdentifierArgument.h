@@ -9,7 +9,8 @@ namespace appsync {
 
 // What to do about an identifier that is none: of an application that is to be there, and of any.
 inline constexpr std::string_view kGiveAsShown = "give one as appsync apps shows it";
-inline constexpr std::string_view kUseLegalCharacters = "use letters, digits, '.', '-' and '_'";
+inline constexpr std::string_view kUseLegalCharacters =
+    "use 1 to 255 letters, digits, '.', '-' and '_'";
 
 /// Refuses an argument that is no legal identifier: the command is used wrongly. `option` is what
 /// it was given with, if it was.

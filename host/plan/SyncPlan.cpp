@@ -175,7 +175,7 @@ class StagedPlanner {
         if (identifier == nullptr) return fail(entryName, "its identifier is not a string");
         if (!isLegalIdentifier(*identifier)) {
             return fail(identifier->empty() ? entryName : *identifier,
-                        "it is not a legal identifier");
+                        "it is not a legal identifier: " + std::string(kIdentifierRule));
         }
         if (isInstall) {
             if (installs_.insert(*identifier).second) asked_.push_back(*identifier);

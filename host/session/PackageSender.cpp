@@ -81,17 +81,9 @@ ErrorRecord cutShort(const std::string& file) {
 
 ErrorRecord cannotWrite(int errorNumber, const std::string& path) {
     ErrorRecord error = systemError(errorNumber, "cannot write " + path);
-    std::string advice;
-    if (errorNumber == ENOSPC || errorNumber == EDQUOT) {
-        advice = "; free space on the device and send it again";
-    } else if (errorNumber == ENAMETOOLONG) {
-        advice =
-            "; the device has no room for names that long: give the application an identifier of "
-            "at most 251 bytes";
-    } else {
-        return error;
-    }
-    return ErrorRecord::make(error.domain, error.code, error.description() + advice);
+    if (errorNumber != ENOSPC && errorNumber != EDQUOT) return error;
+    return ErrorRecord::make(error.domain, error.code,
+                             error.description() + "; free space on the device and send it again");
 }
 
 Result<UniqueFd> openTarget(Device& device, const std::string& directory) {

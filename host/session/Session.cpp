@@ -38,7 +38,8 @@ bool owns(SyncClient& client, std::string_view dataclass) {
 
 ErrorRecord illegalIdentifier() {
     return ErrorRecord::make(kTransferErrorDomain, kTransferIllegalName,
-                             "it is not a legal identifier: take it off the todo list");
+                             "it is not a legal identifier (" + std::string(kIdentifierRule) +
+                                 "): take it off the todo list");
 }
 
 ErrorRecord cancelledByDevice() {

@@ -290,12 +290,12 @@ def test_each_defect_of_an_entry_is_named_and_the_rest_restored(appsync, backup,
     good = metadata(title="T", bundleVersion="1")
     broken = {"e.array": [1], "e.text": "x", "e.nothing": {}, "e.number": {"VessikMetadata": 5},
               "e.map": {"VessikMetadata": {"title": "x"}}, "e.rubbish": {"VessikMetadata": b"xx"},
-              "e.empty": {"VessikMetadata": b""}, "e.list": {"VessikMetadata": plistlib.dumps([1])},
-              "a" * 252: {"VessikMetadata": good}, "b" * 255: {"VessikMetadata": good}}
+              "e.empty": {"VessikMetadata": b""}, "e.list": {"VessikMetadata": plistlib.dumps([1])}}
     nameless = {"n.title": {"VessikMetadata": metadata(bundleVersion="1")},
                 "n.number": {"VessikMetadata": metadata(title=5, bundleVersion="1")},
                 "n.version": {"VessikMetadata": metadata(title="T")}}
     fine = {"f.item": {"VessikMetadata": metadata(itemName="It", bundleVersion="1")},
+            "a" * 252: {"VessikMetadata": good}, "b" * 255: {"VessikMetadata": good},
             "f.noicon": {"VessikMetadata": good}, "f.texticon": {"VessikMetadata": good, "PlaceholderIcon": "x"},
             "f.badicon": {"VessikMetadata": good, "PlaceholderIcon": b"\x89PNG\r\n\x1a\nno picture"},
             "f.emptyicon": {"VessikMetadata": good, "PlaceholderIcon": b""},
@@ -682,20 +682,6 @@ def test_errors_about_files_say_what_to_do(appsync, used, backup):
                     ["plist", "convert", os.path.join(backup, "IconOrder.plist"), "--to", "xml", "--out", "/nope/x"]):
         assert "; name a file" in stripped(appsync(*command, expect=1).stderr)
     assert "path" in stripped(appsync("create", "", expect=2).stderr)
-
-
-def test_identifiers_that_are_too_long_for_placeholders_are_named(appsync, device, fresh, tmp_path):
-    folder = str(tmp_path / "long")
-    identifiers = ["a" * (length - 2) + ".b" for length in (251, 252, 255)]
-    for number, identifier in enumerate(identifiers):
-        packages.make_package(folder, identifier, file_name="%d.zip" % number)
-    assert sorted(device.sync(folder)["installed"]) == sorted(identifiers)
-    backup = str(tmp_path / "of long identifiers")
-    device.appsync.json("backup", device.path, backup)
-    result = restore(fresh, backup, expect=1)
-    assert result["restored"] == identifiers[:1]
-    assert names_of(result["failed"]) == sorted(identifiers[1:])
-    assert all("at most 251 bytes" in each["error"] for each in result["failed"]), result["failed"]
 
 
 @ON_ONE_PATH

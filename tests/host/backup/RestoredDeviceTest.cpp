@@ -20,6 +20,7 @@ namespace fs = std::filesystem;
 using testing::Contains;
 using testing::ElementsAre;
 using testing::HasSubstr;
+using testing::UnorderedElementsAreArray;
 
 class RestoredDevice : public HostFixture, public testing::WithParamInterface<bool> {
   protected:
@@ -92,13 +93,20 @@ TEST_P(RestoredDevice, SurvivesRestoreInformationThatIsNone) {
     EXPECT_THAT(applications(), testing::IsEmpty());
 }
 
-TEST_P(RestoredDevice, NamesAnApplicationWhoseIdentifierIsTooLongForAPlaceholder) {
-    const std::string longest(255, 'x');
-    restore({longest, "com.example.a"});
-    EXPECT_THAT(applications(), ElementsAre("com.example.a placeholder"));
-    ASSERT_EQ(run({"log", device, "--json"}), 0);
-    EXPECT_THAT(out.str(), HasSubstr("Created app directory for '" + longest));
-    EXPECT_THAT(out.str(), HasSubstr("File name too long"));
+// The directories of their placeholders are `<identifier>.app`.
+TEST_P(RestoredDevice, BringsBackApplicationsOfTheLongestIdentifiers) {
+    std::vector<std::string> identifiers;
+    for (const std::size_t length : {250U, 251U, 252U, 255U}) {
+        identifiers.push_back(std::string(length, 'x'));
+        identifiers.push_back(std::string(length - 4, 'x') + ".app");
+    }
+    restore(identifiers);
+    std::vector<std::string> expected;
+    for (const std::string& each : identifiers) expected.push_back(each + " placeholder");
+    EXPECT_THAT(applications(), UnorderedElementsAreArray(expected));
+    static_cast<void>(open(DeviceAccess::Session));
+    EXPECT_TRUE(fs::is_empty(root + "/var/mobile/tmp"));
+    EXPECT_THAT(applications(), UnorderedElementsAreArray(expected));
 }
 
 INSTANTIATE_TEST_SUITE_P(Each, RestoredDevice, testing::Bool(),
