@@ -121,7 +121,11 @@ class Sending {
         if (!present) return unusable(present.error());
         const Result<std::vector<CoordinatorRecord>> coordinators = device_->coordinators();
         if (!coordinators) return unusable(coordinators.error());
-        standing_ = takeUp(plan_, *coordinators, *present);
+        StandingRules rules;
+        rules.arrivedVersion = [this](const std::string& identifier) {
+            return versionOfArrived(*device_, identifier);
+        };
+        standing_ = takeUp(plan_, *coordinators, *present, rules);
         std::erase_if(standing_.obsolete, [this](const std::string& identifier) {
             return identifier != arguments_.identifier;
         });

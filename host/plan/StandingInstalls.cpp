@@ -4,10 +4,14 @@
 #include <map>
 #include <string_view>
 
+#include "client/Paths.h"
 #include "device/Device.h"
+#include "device/package/PackageReader.h"
 #include "device/values/DeviceError.h"
+#include "device/values/PackageIdentifier.h"
 #include "host/plan/SyncPlan.h"
 #include "platform/InstallProgressRecord.h"
+#include "system/RootDirectory.h"
 
 namespace appsync {
 namespace {
@@ -79,7 +83,14 @@ class TakingUp {
         const PlannedInstall* planned = find(identifier);
         if (!hasPackage(coordinator)) return planned != nullptr;
         if (planned == nullptr) return !isUnwanted(identifier);
-        return planned->newVersion.empty() || expectedVersions_[identifier] == planned->newVersion;
+        return planned->newVersion.empty() || versionOf(identifier) == planned->newVersion;
+    }
+
+    // Of a package that has arrived.
+    std::string versionOf(const std::string& identifier) {
+        const auto arrived =
+            rules_.arrivedVersion ? rules_.arrivedVersion(identifier) : std::nullopt;
+        return arrived ? *arrived : expectedVersions_[identifier];
     }
 
     [[nodiscard]] bool isUnwanted(const std::string& identifier) const {
@@ -90,7 +101,7 @@ class TakingUp {
     void addLeftOver(const std::string& identifier) {
         PlannedInstall planned;
         planned.identifier = identifier;
-        planned.newVersion = expectedVersions_[identifier];
+        planned.newVersion = versionOf(identifier);
         planned.hasArrived = planned.isInstalledUnasked = planned.isLeftOver = true;
         const auto installed = installed_.find(identifier);
         const bool isUpdate = installed != installed_.end();
@@ -121,6 +132,16 @@ std::string heldSentence(CoordinationClient client) {
     return "client " + std::to_string(client) +
            " of the coordination service has its install in hand: wait for that, or cancel it "
            "with appsync coordinator";
+}
+
+std::optional<std::string> versionOfArrived(Device& device, const std::string& identifier) {
+    const std::string path = std::string(kPublicStaging) + "/" + archiveNameOf(identifier);
+    const Result<RegularFile> file = device.root().openRegularFile(path);
+    if (!file) return std::nullopt;
+    const Result<PackageReader> package =
+        PackageReader::open(file->descriptor.get(), path, device.propertyLists());
+    if (!package || package->info().identifier != identifier) return std::nullopt;
+    return package->info().version;
 }
 
 StandingInstalls takeUp(SyncPlan& plan, const std::vector<CoordinatorRecord>& coordinators,

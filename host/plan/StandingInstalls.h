@@ -1,6 +1,7 @@
 #pragma once
 
 #include <functional>
+#include <optional>
 #include <set>
 #include <string>
 #include <vector>
@@ -30,7 +31,16 @@ struct StandingRules {
     bool isForbidden = false;
     /// Whether an application that the plan does not name must not come either. Nothing: none is.
     std::function<bool(const std::string& identifier)> isUnwanted = nullptr;
+    /// The version of the package that has arrived for an application. Nothing, or where it gives
+    /// nothing: the one that the placeholder shows, which the todo list may have left out.
+    std::function<std::optional<std::string>(const std::string& identifier)> arrivedVersion =
+        nullptr;
 };
+
+/// The version that the package says which waits on the device for an application; nothing when
+/// there is none that can be read.
+[[nodiscard]] std::optional<std::string> versionOfArrived(Device& device,
+                                                          const std::string& identifier);
 
 /// Why an application is left to another client.
 [[nodiscard]] std::string heldSentence(CoordinationClient client);

@@ -77,6 +77,9 @@ class Preparing {
     [[nodiscard]] StandingRules standingRules(bool isMirror) const {
         StandingRules rules;
         rules.isForbidden = settings_.installation == PolicyAnswer::No;
+        rules.arrivedVersion = [this](const std::string& identifier) {
+            return versionOfArrived(device_, identifier);
+        };
         if (!isMirror || !library_.faults.empty()) return rules;
         rules.isUnwanted = [this](const std::string& identifier) {
             return library_.find(identifier) == nullptr;

@@ -371,6 +371,24 @@ def test_send_waits_for_what_an_interrupted_staged_sync_has_left(appsync, device
     assert sorted(device.apps()) == [A, B, other]
 
 
+@pytest.mark.parametrize("entry", [{}, {"version": "0.9"}], ids=["no version", "another version"])
+def test_a_staged_package_that_had_arrived_is_not_sent_again(appsync, device, large_library, entry):
+    """Its version is that of the package, whatever the todo list says."""
+    todo = [{"identifier": each, "operation": "install", **entry} for each in (A, B)]
+    stage(device, todo, side_files=[A, B])
+    sync = appsync.start("sync", device.path, large_library, "--staged", "--json-lines")
+    for line in sync.stdout:
+        if json.loads(line)["event"] == "progress":
+            break
+    sync.kill()
+    sync.communicate()
+    deliver(device, large_library, B)
+    result = device.sync(large_library, "--staged")
+    assert names_of(result["requested"]) == [A] and names_of(result["installed"]) == [A, B]
+    assert result["bytes"] == os.path.getsize(os.path.join(large_library, A + ".zip"))
+    assert device.placeholders() == [] and coordinators(device) == {}
+
+
 def test_turning_coordination_off_drops_what_stands_and_says_so(appsync, device, interrupted):
     told = appsync("set", device.path, "coordination=off").stdout
     assert "what has a coordinator: %s %s\n" % (A, B) in told

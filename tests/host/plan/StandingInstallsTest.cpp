@@ -3,11 +3,15 @@
 #include <gmock/gmock.h>
 #include <gtest/gtest.h>
 
+#include <fstream>
+#include <iterator>
+
 #include "device/values/DeviceRecords.h"
 #include "host/plan/StagingArea.h"
 #include "host/plan/SyncPlan.h"
 #include "platform/InstallProgressRecord.h"
 #include "platform/PropertyList.h"
+#include "tests/host/HostFixture.h"
 
 namespace appsync {
 namespace {
@@ -33,7 +37,7 @@ class StandingInstallsTest : public testing::Test {
     void placeholder(const char* identifier, const char* version) {
         ApplicationRecord record;
         record.identifier = identifier;
-        record.version = version;
+        if (version != nullptr) record.version = version;
         record.isPlaceholder = true;
         record.installType = kInstallTypeSync;
         present.push_back(record);
@@ -84,6 +88,34 @@ TEST_F(StandingInstallsTest, APackageOfAnotherVersionIsObsolete) {
     stands("com.a", true);
     EXPECT_THAT(taken().obsolete, ElementsAre("com.a"));
     EXPECT_EQ(plan.bytes(), 100U);
+}
+
+TEST_F(StandingInstallsTest, ThePackageThatArrivedSaysItsVersionWhereTheTodoListSaidNone) {
+    for (const char* identifier : {"com.a", "com.b", "com.c"}) {
+        planInstall(identifier, "2");
+        placeholder(identifier, nullptr);
+        stands(identifier, true);
+    }
+    rules.arrivedVersion = [](const std::string& identifier) {
+        return identifier == "com.c"
+                   ? std::nullopt
+                   : std::optional<std::string>(identifier == "com.a" ? "2" : "1");
+    };
+    const StandingInstalls standing = taken();
+    EXPECT_THAT(standing.arrived, ElementsAre("com.a"));
+    EXPECT_THAT(standing.obsolete, ElementsAre("com.b", "com.c"));
+}
+
+TEST_F(StandingInstallsTest, ThePackageThatArrivedSaysItsVersionWhateverTheTodoListSaid) {
+    planInstall("com.a", "2");
+    placeholder("com.a", "5");
+    stands("com.a", true);
+    placeholder("com.b", nullptr);
+    stands("com.b", true);
+    rules.arrivedVersion = [](const std::string&) { return std::optional<std::string>("2"); };
+    EXPECT_THAT(taken().arrived, ElementsAre("com.a", "com.b"));
+    ASSERT_EQ(plan.install.size(), 2U);
+    EXPECT_EQ(plan.install[1].newVersion, "2");
 }
 
 TEST_F(StandingInstallsTest, WhatIsStillToBeSentGoesOnWhateverTheVersion) {
@@ -198,6 +230,35 @@ TEST_F(StandingInstallsTest, ARestoreIsLeftAlone) {
     const StandingInstalls standing = taken();
     EXPECT_THAT(standing.obsolete, IsEmpty());
     EXPECT_THAT(standing.arrived, IsEmpty());
+}
+
+class ArrivedPackage : public HostFixture {
+  protected:
+    ArrivedPackage() : HostFixture(true) {}
+    /// What stands where the package of com.a arrives.
+    void arrives(const std::string& contents) {
+        write(root + "/var/mobile/Media/PublicStaging/com.a.zip", contents);
+    }
+    [[nodiscard]] std::string packageOf(const std::string& identifier) {
+        addPackage(identifier, "3.1");
+        std::ifstream file(library + "/" + identifier + ".zip", std::ios::binary);
+        return {std::istreambuf_iterator<char>(file), {}};
+    }
+};
+
+TEST_F(ArrivedPackage, SaysItsVersion) {
+    const std::unique_ptr<Device> opened = open(DeviceAccess::Look);
+    EXPECT_EQ(versionOfArrived(*opened, "com.a"), std::nullopt);
+    arrives(packageOf("com.a"));
+    EXPECT_EQ(versionOfArrived(*opened, "com.a"), "3.1");
+}
+
+TEST_F(ArrivedPackage, OfAnotherApplicationOrNoneSaysNothing) {
+    const std::unique_ptr<Device> opened = open(DeviceAccess::Look);
+    for (const std::string& contents : {packageOf("com.b"), std::string("no package")}) {
+        arrives(contents);
+        EXPECT_EQ(versionOfArrived(*opened, "com.a"), std::nullopt);
+    }
 }
 
 }  // namespace
