@@ -185,8 +185,10 @@ class Commands {
         added.add_option("FILE", values->file, "the package, or the data")->required();
         added.add_flag("--restore", values->isRestore, "it belongs to a restore");
         added
-            .add_option("--parts", values->parts,
-                        "1: the package, its data follows; 2: the data; 3: all at once")
+            .add_option(
+                "--parts", values->parts,
+                "1: the package, its data follows; 2: the data; 3: all at once; without it: 1 "
+                "where the device knows of data, else 3")
             ->type_name("N")
             ->check(CLI::Range(1U, 3U));
         addDisplay(added, values->display);

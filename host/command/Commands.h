@@ -37,8 +37,8 @@ struct SendArguments {
     std::string identifier;
     std::string file;
     bool isRestore = false;
-    /// 1, 2 or 3, see AssetParts.
-    unsigned parts = 1;
+    /// 1, 2 or 3, see AssetParts. Nothing: of a restore, what the device knows decides.
+    std::optional<unsigned> parts;
     SyncDisplayKind display = SyncDisplayKind::Text;
 };
 [[nodiscard]] int runSend(const SendArguments& arguments, const Console& console);

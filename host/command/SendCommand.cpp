@@ -19,6 +19,7 @@
 #include "host/plan/InterruptedStaging.h"
 #include "host/plan/Library.h"
 #include "host/plan/LibraryReader.h"
+#include "host/plan/RestoredParts.h"
 #include "host/plan/StagingArea.h"
 #include "host/plan/StandingInstalls.h"
 #include "host/session/Interruption.h"
@@ -37,8 +38,9 @@ using Clock = std::chrono::steady_clock;
 Status checkArguments(const SendArguments& arguments) {
     const Status legal = checkIdentifier(arguments.identifier, kUseLegalCharacters);
     if (!legal) return legal;
-    if (!arguments.isRestore && arguments.parts != kAssetPartApplication) {
-        return wrongUsage("--parts " + std::to_string(arguments.parts) + " without --restore",
+    const unsigned parts = arguments.parts.value_or(kAssetPartApplication);
+    if (!arguments.isRestore && parts != kAssetPartApplication) {
+        return wrongUsage("--parts " + std::to_string(parts) + " without --restore",
                           "only a restore comes in parts");
     }
     return {};
@@ -66,10 +68,11 @@ class Sending {
         const Result<DeviceSettings> settings = device_->settings();
         if (!settings) return unusable(settings.error());
         if (settings->installation == PolicyAnswer::No) return refuse(forbidden());
-        Status ready = checkFile();
+        isCoordinated_ = settings->coordination;
+        Status ready = decideParts();
+        if (ready) ready = checkFile();
         if (ready) ready = checkSpace();
         if (!ready) return refuse(ready.error());
-        isCoordinated_ = settings->coordination;
         if (isCoordinated_) ready = checkCoordinated();
         if (ready && !isData()) ready = checkPackage();
         if (ready) ready = isData() ? prepareData() : preparePackage();
@@ -81,15 +84,26 @@ class Sending {
     }
 
   private:
-    [[nodiscard]] bool isData() const { return arguments_.parts == kAssetPartApplicationData; }
+    [[nodiscard]] bool isData() const { return parts_ == kAssetPartApplicationData; }
+
     [[nodiscard]] ParcelContents contents() const {
-        return {arguments_.identifier, arguments_.file, arguments_.isRestore, arguments_.parts};
+        return {arguments_.identifier, arguments_.file, isRestore_, parts_};
+    }
+
+    Status decideParts() {
+        if (!isRestore_ || arguments_.parts) return {};
+        const Result<unsigned> parts = partsOfRestored(*device_, arguments_.identifier);
+        if (!parts) return unusable(parts.error());
+        parts_ = *parts;
+        // Where installs are coordinated, what waits for nothing is a package like any other.
+        if (isCoordinated_) isRestore_ = parts_ == kAssetPartApplication;
+        return {};
     }
 
     // A plug-in that coordinates its installs takes only what it has asked for: the package travels
     // in a session with a staging area of its own.
     Status checkCoordinated() const {
-        if (arguments_.isRestore) {
+        if (isRestore_) {
             return failure(
                 "the installs of this device are coordinated, and restored packages "
                 "are the store's to bring",
@@ -199,7 +213,7 @@ class Sending {
                                          package->info().displayName, arguments_.file,
                                          package->info().packedBytes, 0});
         }
-        if (arguments_.isRestore && arguments_.parts == kAssetPartApplication) {
+        if (isRestore_ && parts_ == kAssetPartApplication) {
             plansInstall_ = false;  // it waits for the data that is still to come
         }
         return planInstall(std::move(planned));
@@ -219,7 +233,7 @@ class Sending {
     }
 
     Status planInstall(PlannedInstall planned) {
-        if (arguments_.isRestore && !isData()) {
+        if (isRestore_ && !isData()) {
             const Status known =
                 device_->setRestoreDataExpected(arguments_.identifier, !plansInstall_);
             if (!known) return known;
@@ -283,6 +297,8 @@ class Sending {
     Library library_;  // the one package
     StandingInstalls standing_;
     bool isCoordinated_ = false;
+    bool isRestore_ = arguments_.isRestore;
+    unsigned parts_ = arguments_.parts.value_or(kAssetPartApplication);
     bool plansInstall_ = true;
     const Clock::time_point begin_ = Clock::now();
     std::atomic<bool> isPlanned_ = false;  // the plan is made, and changes no more

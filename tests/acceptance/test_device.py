@@ -325,13 +325,21 @@ def test_restore_in_two_parts_on_a_device_that_was_never_synced(appsync, device,
     package = os.path.join(library, "com.example.app00.zip")
     if device.is_coordinated:
         # The plug-in takes no restored package where the store brings them.
-        one_line(appsync("send", device.path, "com.example.app00", package, "--restore", expect=1))
+        one_line(appsync("send", device.path, "com.example.app00", package, "--restore", "--parts", "1",
+                         expect=1))
         assert device.apps() == {} and device.placeholders() == []
         return
     appsync("send", device.path, "com.example.app00", package, "--restore", "--parts", "1")
     assert device.apps() == {}
     appsync("send", device.path, "com.example.app00", tmp_path / "data.bin", "--restore", "--parts", "2")
     assert sorted(device.apps()) == ["com.example.app00"]
+
+
+def test_restored_package_of_an_application_without_data_is_installed_at_once(appsync, device, library):
+    package = os.path.join(library, "com.example.app00.zip")
+    appsync("send", device.path, "com.example.app00", package, "--restore")
+    assert sorted(device.apps()) == ["com.example.app00"]
+    assert appsync.json("why", device.path, "com.example.app00")["waitsFor"] is None
 
 
 def test_output_that_cannot_be_written_is_a_failure(appsync, device, library):

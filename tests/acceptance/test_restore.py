@@ -371,6 +371,22 @@ def test_package_and_data_at_once(appsync, backup, fresh, store):
     assert data_of(fresh, IDS[1])["Documents/letter.txt"] == b"Dear"
 
 
+def test_without_parts_the_device_says_whether_a_package_waits(appsync, backup, fresh, store):
+    """The backup holds data of one of the two."""
+    restore(fresh, backup)
+    for identifier in (IDS[0], IDS[1]):
+        done = appsync("send", fresh.path, identifier, os.path.join(store, identifier + ".zip"), "--restore",
+                       "--json", expect=None)
+        assert done.returncode == (1 if fresh.is_coordinated else 0)
+        if fresh.is_coordinated:
+            assert "appsync store" in done.stderr
+    if fresh.is_coordinated:
+        assert sorted(appsync.json("store", fresh.path, store)["kept"]) == [IDS[0], IDS[1], IDS[4], IDS[5]]
+        return
+    assert list(fresh.apps()) == [IDS[0]]
+    assert appsync.json("why", fresh.path, IDS[1])["waitsFor"]["what"] == "restore data"
+
+
 def test_store_says_which_promises_it_cannot_keep(appsync, backup, fresh, store):
     if not fresh.is_coordinated:
         assert appsync.json("store", fresh.path, store) == {"kept": [], "failed": []}

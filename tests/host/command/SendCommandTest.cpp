@@ -20,7 +20,8 @@ TEST_F(SendCommand, InstallsAPackageThatNobodyAskedFor) {
 TEST_F(SendCommand, ARestoredPackageWaitsForItsData) {
     addPackage("com.a", "1");
     write(library + "/data", "the application's data");
-    EXPECT_EQ(run({"send", device, "com.a", library + "/com.a.zip", "--restore"}), 0);
+    EXPECT_EQ(run({"send", device, "com.a", library + "/com.a.zip", "--restore", "--parts", "1"}),
+              0);
     EXPECT_THAT(applications(), IsEmpty());
     EXPECT_EQ(run({"send", device, "com.a", library + "/data", "--restore", "--parts", "2"}), 0);
     EXPECT_THAT(applications(), ElementsAre("com.a 1"));
@@ -30,11 +31,56 @@ TEST_F(SendCommand, ARestoredPackageWaitsForItsData) {
 TEST_F(SendCommand, ASyncInBetweenKeepsThePackageThatWaits) {
     addPackage("com.a", "1");
     write(library + "/data", "the application's data");
-    EXPECT_EQ(run({"send", device, "com.a", library + "/com.a.zip", "--restore"}), 0);
+    EXPECT_EQ(run({"send", device, "com.a", library + "/com.a.zip", "--restore", "--parts", "1"}),
+              0);
     std::filesystem::remove(library + "/com.a.zip");
     EXPECT_EQ(sync(), 0);
     EXPECT_EQ(run({"send", device, "com.a", library + "/data", "--restore", "--parts", "2"}), 0);
     EXPECT_THAT(applications(), ElementsAre("com.a 1"));
+}
+
+TEST_F(SendCommand, ARestoredPackageWithoutDataIsInstalledAtOnce) {
+    addPackage("com.a", "1");
+    EXPECT_EQ(run({"send", device, "com.a", library + "/com.a.zip", "--restore"}), 0);
+    EXPECT_THAT(applications(), ElementsAre("com.a 1"));
+}
+
+TEST_F(SendCommand, ARestoredPackageWaitsForDataThatIsAnnounced) {
+    addPackage("com.a", "1");
+    ASSERT_TRUE(open(DeviceAccess::Session)->setRestoreDataExpected("com.a", true));
+    EXPECT_EQ(run({"send", device, "com.a", library + "/com.a.zip", "--restore", "--json"}), 0);
+    EXPECT_THAT(out.str(), HasSubstr("its package waits for its data"));
+    EXPECT_THAT(applications(), IsEmpty());
+}
+
+TEST_F(SendCommand, ARestoredPackageWaitsForDataThatWaitsItself) {
+    addPackage("com.a", "1");
+    write(root + Device::restoreDataPath("com.a"), "an archive");
+    EXPECT_EQ(run({"send", device, "com.a", library + "/com.a.zip", "--restore"}), 0);
+    EXPECT_THAT(applications(), IsEmpty());
+    EXPECT_TRUE(open(DeviceAccess::Look)->status("com.a")->awaitsRestoreData);
+}
+
+class CoordinatedSendCommand : public HostFixture {
+  protected:
+    CoordinatedSendCommand() : HostFixture(true) {}
+};
+
+TEST_F(CoordinatedSendCommand, ARestoredPackageWithoutDataIsInstalledAtOnce) {
+    addPackage("com.a", "1");
+    EXPECT_EQ(run({"send", device, "com.a", library + "/com.a.zip", "--restore"}), 0) << err.str();
+    EXPECT_THAT(applications(), ElementsAre("com.a 1"));
+}
+
+TEST_F(CoordinatedSendCommand, ARestoredPackageInPartsIsTheStores) {
+    addPackage("com.a", "1");
+    const std::string package = library + "/com.a.zip";
+    EXPECT_EQ(run({"send", device, "com.a", package, "--restore", "--parts", "1"}), 1);
+    EXPECT_THAT(err.str(), HasSubstr("appsync store"));
+    write(root + Device::restoreDataPath("com.a"), "an archive");
+    EXPECT_EQ(run({"send", device, "com.a", package, "--restore"}), 1);
+    EXPECT_THAT(err.str(), HasSubstr("appsync store"));
+    EXPECT_THAT(applications(), IsEmpty());
 }
 
 TEST_F(SendCommand, DataWithoutAPackageThatWaitsIsRefused) {
