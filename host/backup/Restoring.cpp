@@ -9,10 +9,10 @@
 
 #include "client/Paths.h"
 #include "device/Device.h"
-#include "device/package/DataArchive.h"
 #include "device/values/PackageIdentifier.h"
 #include "host/backup/Backup.h"
 #include "host/backup/RestoreDefects.h"
+#include "host/backup/RestoredData.h"
 #include "host/console/Problem.h"
 #include "host/file/HostFile.h"
 #include "host/plan/StandingInstalls.h"
@@ -34,6 +34,8 @@ namespace fs = std::filesystem;
 
 constexpr std::uint64_t kLargestList = std::uint64_t{2} << 30U;
 constexpr std::int64_t kApplicationsToo[] = {2, 3};
+// What is named where nothing of a restore is done.
+constexpr std::string_view kWholeRestore = "restore";
 // Archives that share what makes them durable; several files are open for each.
 constexpr std::size_t kPlacedTogether = 64;
 
@@ -69,7 +71,10 @@ class Restoring {
     Result<RestoreResult> run() {
         Status status = findPresent();
         if (status) status = readRestoreInfo();
-        if (status) status = clearTheWay();
+        if (!status) return status.error();
+        listData();
+        if (const Status room = checkRoom(); !room) return refuse(room.error());
+        status = clearTheWay();
         if (!status) return status.error();
         checkFiles();
         status = placeData();
@@ -162,6 +167,42 @@ class Restoring {
         }
     }
 
+    void listData() {
+        for (const BackedUpApplication& each : manifest_.applications) {
+            if (!each.hasData || installed_.contains(each.identifier)) continue;
+            const std::string name = dataArchiveName(each.identifier);
+            // An offloaded application has kept its own.
+            if (!canUse(name) || device_.files().itemExists(Device::dataPath(each.identifier))) {
+                continue;
+            }
+            data_.push_back({each.identifier, pathOf(name)});
+        }
+    }
+
+    // An install fails for good while data waits that the device has no room for.
+    Status checkRoom() {
+        const Result<std::uint64_t> free = device_.freeSpace();
+        if (!free || data_.empty()) return {};  // what fails then is named alone
+        const std::uint64_t needed = bytesNeededFor(data_, device_);
+        if (needed <= *free) return {};
+        return lackOfSpace("the data of all applications together", needed, *free,
+                           "nothing is restored; free space on the device and restore again");
+    }
+
+    // Nothing has been changed.
+    Result<RestoreResult> refuse(const ErrorRecord& reason) {
+        const Result<std::vector<ApplicationRecord>> shown = device_.homeScreenApplications();
+        if (!shown) return unusable(shown.error());
+        for (const ApplicationRecord& record : *shown) show(record);
+        fail(std::string(kWholeRestore), reason.description());
+        return std::move(result_);
+    }
+
+    void show(const ApplicationRecord& record) {
+        result_.screen.push_back({record.identifier, record.name.value_or(record.identifier),
+                                  record.version, record.isPlaceholder});
+    }
+
     // What an interrupted sync was about to bring would go with the next sync, not stay restored.
     Status clearTheWay() {
         if (!bringsApplications(type_)) return {};
@@ -209,14 +250,8 @@ class Restoring {
 
     Status placeData() {
         PackageSender sender(device_);
-        for (const BackedUpApplication& each : manifest_.applications) {
-            if (!each.hasData || installed_.contains(each.identifier)) continue;
-            const std::string name = dataArchiveName(each.identifier);
-            // An offloaded application has kept its own.
-            if (!canUse(name) || device_.files().itemExists(Device::dataPath(each.identifier))) {
-                continue;
-            }
-            const Status sent = sendArchive(sender, each.identifier, pathOf(name));
+        for (const DataToPlace& each : data_) {
+            const Status sent = sendArchive(sender, each);
             if (sent) {
                 placing_.push_back(each.identifier);
             } else {
@@ -231,19 +266,10 @@ class Restoring {
         return known ? known : Status(unusable(known.error()));
     }
 
-    // An install fails for good while data waits that the device has no room for.
-    Status sendArchive(PackageSender& sender, const std::string& identifier,
-                       const std::string& file) {
-        const fs::path place = Device::restoreDataPath(identifier);
-        const Result<std::uint64_t> unpacked = checkDataArchive(file);
-        if (!unpacked) return unpacked.error();
-        const Result<std::uint64_t> free = device_.freeSpace();
-        if (free && *unpacked > *free) {
-            return lackOfSpace("its data", *unpacked, *free,
-                               "free space on the device and restore again");
-        }
+    static Status sendArchive(PackageSender& sender, const DataToPlace& data) {
+        const fs::path place = Device::restoreDataPath(data.identifier);
         const Result<std::uint64_t> sent =
-            sender.sendAside(file, place.parent_path().native(), place.filename().native(),
+            sender.sendAside(data.file, place.parent_path().native(), place.filename().native(),
                              [](std::uint64_t, std::uint64_t) { return true; });
         return sent ? Status() : Status(sent.error());
     }
@@ -343,8 +369,7 @@ class Restoring {
                 continue;
             }
             present.insert(record.identifier);
-            result_.screen.push_back({record.identifier, record.name.value_or(record.identifier),
-                                      record.version, record.isPlaceholder});
+            show(record);
         }
         if (!bringsApplications(type_)) return {};
         for (const std::string& identifier : wanted_) {
@@ -408,6 +433,7 @@ class Restoring {
     std::map<std::string, std::string> defects_;  // by identifier
     std::map<std::string, std::string> faults_;   // by file of the backup
     Bytes restoreInfo_;
+    std::vector<DataToPlace> data_;
     std::vector<std::string> placing_;  // whose data is aside
     std::vector<std::string> placed_;   // whose data waits on the device
     RestoreResult result_;

@@ -13,7 +13,8 @@ class Device;
 class PlugIn;
 struct BackupManifest;
 
-/// An application that a restore does not bring back, or a file of the backup that is no good.
+/// An application that a restore does not bring back, a file of the backup that is no good, or
+/// "restore", when nothing of it is done.
 struct FailedRestore {
     std::string identifier;
     std::string error;

@@ -404,22 +404,28 @@ def test_archives_that_no_device_would_unpack_are_named_and_their_applications_i
     assert sorted(fresh.apps()) == labels
 
 
-@ON_ONE_PATH
-def test_data_that_the_device_has_no_room_for_is_named(appsync, device, store, tmp_path):
-    """It would make each install of its application fail."""
+def test_data_that_together_has_no_room_is_refused_before_anything_is_changed(appsync, device, store, tmp_path, coordination):
+    """Each alone would fit; the last of their installs would fail."""
     device.sync(store)
-    write_data(device, IDS[0], {"zeros": bytes(40 << 20)})
-    write_data(device, IDS[1], {"letter": b"Dear"})
+    for number in (0, 1):  # 5 MiB, as an archive and unpacked
+        write_data(device, IDS[number], {"noise": random.Random(number).randbytes(5 << 20)})
     appsync("backup", device.path, tmp_path / "b")
     os.mkdir(tmp_path / "disk")
-    script = ("mount -t tmpfs -o size=20m tmpfs {0}/disk && {1} create {0}/disk/d >&2 && "
-              "{1} restore {0}/disk/d {0}/b --json; echo $? >&2; ls {0}/disk/d/root{2} >&2"
-              ).format(tmp_path, appsync.program, ARCHIVES)
+    script = ("mount -t tmpfs -o size=16m tmpfs {0}/disk && {1} create {0}/disk/d --coordination {2} >&2 && "
+              "{1} send {0}/disk/d {3} {4} >&2 && cp -a {0}/disk/d/root {0}/before && "
+              "{1} restore {0}/disk/d {0}/b --json; echo $? >&2; diff -r {0}/before {0}/disk/d/root >&2; echo $? >&2; "
+              "mount -o remount,size=24m {0}/disk && {1} restore {0}/disk/d {0}/b >&2; echo $? >&2; "
+              "{1} restore {0}/disk/d {0}/b >&2; echo $? >&2"
+              ).format(tmp_path, appsync.program, coordination, IDS[5], os.path.join(store, IDS[5] + ".zip"))
     done = in_own_mounts(script)
     result = json.loads(done.stdout)
-    assert sorted(result["restored"]) == IDS and names_of(result["failed"]) == [IDS[0]]
-    assert "needs 40.0 MiB" in result["failed"][0]["error"] and "restore again" in result["failed"][0]["error"]
-    assert done.stderr.splitlines()[-2:] == ["1", IDS[1] + ".zip"]
+    assert result["restored"] == [] and names_of(result["failed"]) == ["restore"], done.stderr
+    assert names_of(result["screen"]) == [IDS[5]]
+    error = result["failed"][0]["error"]
+    assert "needs 20.0 MiB, the device has" in error and "free space on the device and restore again" in error
+    # Nothing was changed; with room it works, also again while the archives wait there already.
+    assert [line for line in done.stderr.splitlines() if line.isdigit()] == ["1", "0", "0", "0"], done.stderr
+    assert done.stderr.count("needs 20.0 MiB") == 1
 
 
 @ON_ONE_PATH
