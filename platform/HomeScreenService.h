@@ -20,7 +20,7 @@ class TerminationAssertion {
 struct TerminationAssertionResult {
     enum Outcome : int { kGranted = 0, kDenied = 1, kNoSuchApplication = 2 };
     int outcome = kNoSuchApplication;
-    /// Null when none was created.
+    /// Null when none was created. One may have been whatever the outcome; it is to be released.
     std::unique_ptr<TerminationAssertion> assertion;
 };
 

@@ -63,7 +63,7 @@ TerminationAssertionResult SimulatedHomeScreen::takeTerminationAssertion(
     if (reason != 0) throw SimulationFailure("the reason of a termination assertion is always 0");
     TerminationAssertionResult result;
     result.outcome = outcomeFor(identifier);
-    if (result.outcome == TerminationAssertionResult::kGranted) {
+    if (result.outcome != TerminationAssertionResult::kNoSuchApplication) {
         result.assertion = std::make_unique<Assertion>(recorder_, held_, identifier);
     }
     const std::string text = std::to_string(result.outcome);

@@ -17,7 +17,8 @@ class SimulatedAppRegistry;
 
 /// The home screen in memory. A layout is taken when it is a property list whose root is an array
 /// of strings. A termination assertion is denied while the application runs, otherwise granted for
-/// whatever is installed (a placeholder is not), unless the test scripts it.
+/// whatever is installed (a placeholder is not), unless the test scripts it. Who asks gets an
+/// assertion to release whatever the outcome, except for an application that there is not.
 class SimulatedHomeScreen : public HomeScreenService {
   public:
     /// All are only borrowed.

@@ -175,6 +175,24 @@ TEST_F(InstallQueue, ReleasesTheAssertionWhateverHappens) {
     }
 }
 
+TEST_F(InstallQueue, ReleasesAnAssertionThatWasNotGranted) {
+    for (const int outcome : {kDenied, 17}) {
+        script({outcome});
+        install();
+        EXPECT_THAT(platform_.homeScreen.heldAssertions(), IsEmpty()) << outcome;
+    }
+    EXPECT_THAT(platform_.callsTo({"TerminationAssertion"}), testing::SizeIs(2));
+}
+
+TEST_F(InstallQueue, ReleasesADeniedAssertionBeforeItSchedulesTheRetry) {
+    script({kDenied});
+    install();
+    EXPECT_THAT(
+        platform_.callsTo({"TerminationAssertion", "InstallTransactionLog", "WorkQueues"}),
+        ElementsAre(HasSubstr("assertion denied"), "TerminationAssertion.release(com.example.a)",
+                    HasSubstr("retrying asset install"), "WorkQueues.runAfter(30000 ms)"));
+}
+
 TEST_F(InstallQueue, IgnoresThatThePackageCannotBeDeleted) {
     platform_.files.failNext(FileOperation::RemoveItem, packagePath(kA), EIO);
     install();
@@ -270,6 +288,12 @@ TEST_F(InstallQueue, TakesEveryFailureOfARestoreForRecoverable) {
     EXPECT_THAT(platform_.messages(),
                 Contains(StartsWith("com.example.a install failed but was recoverable: ")));
     EXPECT_THAT(platform_.backup.cancelled(), IsEmpty());
+}
+
+TEST_F(InstallQueue, AsksTheHostAboutTheFailureOfARestoreToo) {
+    refuse("Other");
+    install(restoreAsset());
+    EXPECT_THAT(platform_.callsTo({"SyncHost.isRecoverableError"}), testing::SizeIs(1));
 }
 
 TEST_F(InstallQueue, ForgetsTheRestoreStateOfAnInstalledApplication) {

@@ -43,6 +43,15 @@ TEST_F(SimulatedServicesTest, HeldAssertionsAreKnownUntilTheyAreReleased) {
     EXPECT_EQ(platform_.calls().back(), "TerminationAssertion.release(com.example.a)");
 }
 
+TEST_F(SimulatedServicesTest, AnAssertionIsMadeUnlessThereIsNoSuchApplication) {
+    for (const int outcome : {0, 1, 77}) {
+        platform_.homeScreen.scriptTermination(kA, {outcome});
+        EXPECT_NE(platform_.homeScreen.takeTerminationAssertion(kA, 0).assertion, nullptr);
+    }
+    platform_.homeScreen.scriptTermination(kA, {2});
+    EXPECT_EQ(platform_.homeScreen.takeTerminationAssertion(kA, 0).assertion, nullptr);
+}
+
 TEST_F(SimulatedServicesTest, ArgumentsThatAreAlwaysTheSameAreChecked) {
     EXPECT_NE(failureOf([&] { (void)platform_.homeScreen.takeTerminationAssertion(kA, 1); }),
               "no failure");
