@@ -44,7 +44,8 @@ std::string callText(const std::vector<AppProxy>& value) {
 
 std::string callText(const SyncAsset& value) {
     return value.identifier + ", " + value.dataclass +
-           (value.isDownload ? ", download" : ", upload");
+           (value.isDownload ? ", download" : ", upload") +
+           (value.prettyName ? ", named " + *value.prettyName : "");
 }
 
 std::string callText(const StoreMetadata& value) { return callText(value.metadata); }

@@ -43,7 +43,7 @@ std::string callText(const FileAttributes& value);
 /// "com.example.a", or "com.example.a (placeholder)".
 std::string callText(const AppProxy& value);
 std::string callText(const std::vector<AppProxy>& value);
-/// "com.example.a, Application, download".
+/// "com.example.a, Application, download", and ", named Example" where the asset has a name.
 std::string callText(const SyncAsset& value);
 std::string callText(const StoreMetadata& value);
 std::string callText(const InstallOptions& value);

@@ -190,6 +190,17 @@ TEST_F(CoordinatedInstall, GoesOnWithoutAnIconThatCannotBeCopied) {
                 Contains(AllOf(HasSubstr("finished with status 1 error"), HasSubstr("Code=2"))));
 }
 
+TEST_F(CoordinatedInstall, GoesOnWithoutAnIconWhereOneIsLeftOver) {
+    const std::string leftOver = std::string(kBundle) + "/Icon.png";
+    platform_.files.addFile(leftOver, "left over");
+    EXPECT_TRUE(prepare());
+    EXPECT_EQ(platform_.files.text(leftOver), "left over");
+    EXPECT_EQ(service().promise(std::string(kA) + "-Icon"), nullptr);
+    EXPECT_THAT(platform_.messages(), Contains(AllOf(StartsWith("Copied icon from "),
+                                                     HasSubstr("Code=17"), EndsWith("OnDisk:0"))));
+    EXPECT_TRUE(state()->placeholder->configurationComplete);
+}
+
 TEST_F(CoordinatedInstall, GoesOnWithoutAnIconOfUnknownSize) {
     platform_.files.failNext(FileOperation::Attributes, std::string(kBundle) + "/Icon.png", EIO);
     EXPECT_TRUE(prepare());

@@ -223,5 +223,13 @@ TEST_F(CoordinatedSyncEnd, WithFailureCancelsWhatIsOutstanding) {
                             "Code=30 \"(null)\" for com.example.b"));
 }
 
+TEST_F(CoordinatedSyncEnd, WithFailureCancelsWhatIsOutstandingWhoeverBeganIt) {
+    service().addCoordinator(CoordinatorKind::Initiating, kA, AppStoreClientID);
+    client_->assetSyncFinishedWithStatus(false, {kA});
+    EXPECT_EQ(service().state(kA), nullptr);
+    ASSERT_NE(service().ended(kA), nullptr);
+    EXPECT_EQ(service().ended(kA)->cancelled, (SimulatedCancel{{"TRError", 30, {}}, 3}));
+}
+
 }  // namespace
 }  // namespace appsync
