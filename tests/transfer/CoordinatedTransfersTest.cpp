@@ -93,6 +93,23 @@ TEST_F(CoordinatedOutstandingTransfers, AskAgainForWhatStillHasItsPlaceholder) {
         logged(LogLevel::Default, "coordinator for com.example.a has a placeholder promise"));
 }
 
+TEST_F(CoordinatedOutstandingTransfers, LeaveOutWhatIsInProgress) {
+    addPlaceholder(kA, kInstallTypeStoreDownload);
+    platform_.registry.setProgress(kA, {kInstallStateActive, kInstallPhaseLoading, 0, 0});
+    request({kA, kB});
+    EXPECT_THAT(transfers(), ElementsAre(kB));
+    EXPECT_THAT(platform_.coordination.identifiers(), ElementsAre(kB));
+    EXPECT_EQ(operationOf(kA), "install");
+}
+
+TEST_F(CoordinatedOutstandingTransfers, ShowTheIconOfThePlaceholdersBundle) {
+    addPlaceholder(kA, kInstallTypeDowngrade);
+    request({kA});
+    EXPECT_THAT(transfers(), ElementsAre(kA));
+    EXPECT_EQ(platform_.files.contents(assets_.front()->icon->path()),
+              SimulatedIconRenderer::imageOf("/containers/com.example.a/Example.app"));
+}
+
 TEST_F(CoordinatedOutstandingTransfers, LeaveRestoresToTheStore) {
     addPlaceholder(kA, kInstallTypeRestore);
     request({kA});
@@ -366,6 +383,7 @@ TEST_F(CoordinatedTransferEvents, CancelNothingAfterASuccessfulPhase) {
     EXPECT_TRUE(logged(LogLevel::Error,
                        "Called with success == YES but with 1 outstanding HFT transfers!"));
     EXPECT_THAT(outstanding(), IsEmpty());
+    EXPECT_THAT(Access::updatingApps(*client_), IsEmpty());
 }
 
 TEST_F(CoordinatedTransferEvents, KeepTheSetsOfAPhaseWithNothingOutstanding) {
@@ -403,7 +421,9 @@ TEST_F(CoordinatedInstallOutcome, OfAFailedRestoreChangesOnlyTheRestoreState) {
     EXPECT_EQ(operationOf(kB), "install");
     EXPECT_THAT(platform_.callsTo({"InstallCoordinatorService.uninstallApp", "BackupManager"}),
                 IsEmpty());
-    EXPECT_THAT(platform_.messages(), Contains(HasSubstr("install failed but was recoverable")));
+    EXPECT_THAT(platform_.messageLines(),
+                ElementsAre(HasSubstr("Tessarin is enabled - treating error Error Domain="),
+                            HasSubstr("install failed but was recoverable")));
     EXPECT_EQ(client_->_restoreStatePropertyForKey("path", kB, &version), std::nullopt);
 }
 

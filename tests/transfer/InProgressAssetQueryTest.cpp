@@ -129,6 +129,20 @@ TEST_F(InProgressQuery, CountsOnlyTheFirstReport) {
     EXPECT_THAT(platform_.callsTo({"Semaphore#1.signal"}), IsEmpty());
 }
 
+TEST_F(InProgressQuery, AnswersWithTheFirstReportAlthoughAnotherComesBeforeItIsRead) {
+    addInstall(kA, kInstallTypeSync, kInstallStateActive, kInstallPhaseInstalling);
+    addInstall(kB, kInstallTypeSync, kInstallStateActive, kInstallPhaseInstalling);
+    addInstall(kC, kInstallTypeRestore, kInstallStateActive, kInstallPhaseLoading);
+    report({kA, kC});
+    const std::vector<AppProxy> second = proxies({kB});
+    platform_.onCall("Semaphore.signal",
+                     [&](const RecordEntry&) { platform_.registry.setReport(second, {}); });
+    query();
+    EXPECT_THAT(platform_.callsTo({"AppRegistryObserver"}), testing::SizeIs(2));
+    EXPECT_THAT(inProgress_, Optional(ElementsAre(kA)));
+    EXPECT_THAT(restoring_, Optional(ElementsAre(kC)));
+}
+
 TEST_F(InProgressQuery, WaitsForAReportThatComesLate) {
     addInstall(kA, kInstallTypeSync, kInstallStateActive, kInstallPhaseInstalling);
     platform_.registry.withholdReports(true);

@@ -37,8 +37,13 @@ class OutstandingTransfers : public AppsClientFixture {
         proxy.state.placeholder = true;
         platform_.registry.add(proxy);
     }
-    void setPath(const std::string& identifier, const std::string& path) {
-        const std::string version = "1.0";
+    void requestVersion(std::string_view version) {
+        PropertyList entry = todoEntry(kA, "install");
+        entry.set(kTodoVersionKey, version);
+        setTodoList(PropertyList::array({entry}));
+    }
+    void setPath(const std::string& identifier, const std::string& path,
+                 const std::string& version = "1.0") {
         client_->_setRestoreStatePropertyValue(path, "path", identifier, &version);
     }
 
@@ -75,6 +80,30 @@ TEST_F(OutstandingTransfers, SayAllThatTheHostNeeds) {
     EXPECT_EQ(asset.infoPath, staged(kA) + "/Info.plist");
     EXPECT_FALSE(asset.isRestore);
     EXPECT_EQ(asset.storeProductID, 0);
+}
+
+TEST_F(OutstandingTransfers, AreOfTheVersionThatTheHostNames) {
+    requestVersion("2.5");
+    EXPECT_THAT(transfers(), ElementsAre(kA));
+    EXPECT_EQ(assets_.front()->variantOptions,
+              PropertyList::map({{"AssetParts", 1}, {"Version", "2.5"}}));
+}
+
+TEST_F(OutstandingTransfers, RecoverTheDownloadOfTheirOwnVersion) {
+    setPath(kA, "/old.zip", "1.0");
+    setPath(kA, "/new.zip", "2.5");
+    for (const char* path : {"/old.zip", "/new.zip"}) platform_.files.addFile(path, "package");
+    requestVersion("2.5");
+    EXPECT_THAT(transfers(), ElementsAre(kA));
+    EXPECT_TRUE(logged(LogLevel::Default, "Recovered download path for com.example.a at /new.zip"));
+}
+
+TEST_F(OutstandingTransfers, RecoverNoDownloadOfAnotherVersion) {
+    setPath(kA, "/old.zip", "1.0");
+    platform_.files.addFile("/old.zip", "package");
+    requestVersion("2.5");
+    EXPECT_THAT(transfers(), ElementsAre(kA));
+    EXPECT_THAT(platform_.messages(), Not(Contains(HasSubstr("ownload path"))));
 }
 
 TEST_F(OutstandingTransfers, LogEachAssetThatIsPrepared) {
@@ -200,7 +229,9 @@ TEST_F(OutstandingTransfers, LeaveOutWhatIsInProgressWhicheverSourceItComesFrom)
         logged(LogLevel::Default,
                "Assets already in progress (not returning these): (com.example.a, com.example.b)"));
     EXPECT_TRUE(logged(LogLevel::Default, "Assets currently restoring: ()"));
-    EXPECT_THAT(platform_.messages(), Not(Contains(StartsWith("Asset com.example.a"))));
+    for (const std::string identifier : {kA, kB}) {
+        EXPECT_THAT(platform_.messages(), Not(Contains(StartsWith("Asset " + identifier))));
+    }
 }
 
 TEST_F(OutstandingTransfers, AreNotHeldUpByRestores) {

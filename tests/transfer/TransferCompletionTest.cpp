@@ -79,6 +79,14 @@ TEST_F(TransferCompletion, RefuseAPathThatIsNotSafe) {
     EXPECT_THAT(installs(), IsEmpty());
 }
 
+TEST_F(TransferCompletion, FinishTheInstallPhaseBeforeThePathIsLookedAt) {
+    auto asset = receivedAsset(kA);
+    asset->path = "/a/../b";
+    succeed(asset);
+    EXPECT_THAT(platform_.callsTo({"AppRegistry.finishInstallPhase"}),
+                ElementsAre("AppRegistry.finishInstallPhase(com.example.a)"));
+}
+
 TEST_F(TransferCompletion, RefuseAMissingPath) {
     auto asset = receivedAsset(kA);
     asset->path.reset();
@@ -94,6 +102,17 @@ TEST_F(TransferCompletion, TakeAMissingPathFromTheRestoreState) {
     succeed(asset);
     EXPECT_EQ(asset->path, packagePath(kA));
     EXPECT_EQ(operationOf(kA), "INSTALLED");
+}
+
+TEST_F(TransferCompletion, TakeTheMissingPathOfTheirOwnVersion) {
+    const std::string version = "2.5";
+    client_->_setRestoreStatePropertyValue("/old.zip", "path", kA, &kOneZero);
+    client_->_setRestoreStatePropertyValue(packagePath(kA), "path", kA, &version);
+    auto asset = receivedAsset(kA);
+    asset->path.reset();
+    asset->variantOptions.set("Version", version);
+    succeed(asset);
+    EXPECT_EQ(asset->path, packagePath(kA));
 }
 
 TEST_F(TransferCompletion, DoNotTakeAPathThatIsNoString) {
@@ -128,6 +147,17 @@ TEST_F(TransferCompletion, ParkARestoreWhoseDataIsStillToCome) {
               PropertyList(packagePath(kA)));
     EXPECT_EQ(operationOf(kA), "DOWNLOADED");
     EXPECT_TRUE(platform_.files.exists(packagePath(kA)));
+}
+
+TEST_F(TransferCompletion, ParkARestoreUnderItsVersion) {
+    const std::string version = "2.5";
+    platform_.backup.addRestoreData(kA);
+    auto asset = restoreAsset(kAssetPartApplication);
+    asset->variantOptions.set("Version", version);
+    succeed(asset);
+    EXPECT_EQ(client_->_restoreStatePropertyForKey("path", kA, &version),
+              PropertyList(packagePath(kA)));
+    EXPECT_FALSE(client_->_restoreStatePropertyForKey("path", kA, &kOneZero));
 }
 
 TEST_F(TransferCompletion, ParkARestoreWithoutAProgressRecordToo) {

@@ -71,5 +71,14 @@ TEST_F(TransferEnd, ReportsASuccessWithOutstandingTransfers) {
     EXPECT_THAT(outstanding(), IsEmpty());
 }
 
+TEST_F(TransferEnd, ForgetsUpdatesAndCancelsAfterASuccessWithOutstandingTransfers) {
+    progress(0.5);
+    Access::updatingApps(*client_) = {kB};
+    Access::userCancelledApps(*client_) = {kC};
+    client_->assetTransferEndedWithSuccess(true);
+    EXPECT_THAT(Access::updatingApps(*client_), IsEmpty());
+    EXPECT_THAT(Access::userCancelledApps(*client_), IsEmpty());
+}
+
 }  // namespace
 }  // namespace appsync

@@ -56,6 +56,23 @@ TEST_F(TransferFailure, DoNotCancelAnInstallThatIsOver) {
     EXPECT_FALSE(platform_.registry.placeholder(kA));
 }
 
+/// The state that the record is in when the transfer fails.
+class TransferFailureInState : public TransferFailure,
+                               public testing::WithParamInterface<std::uint64_t> {};
+
+TEST_P(TransferFailureInState, CancelTheRecordUnlessItIsOver) {
+    platform_.registry.setProgress(kA, {GetParam(), kInstallPhaseLoading, 0, 0});
+    fail(receivedAsset(kA));
+    const bool isOver = GetParam() >= kInstallStateCanceled;
+    EXPECT_THAT(platform_.callsTo({"InstallProgressRecord.cancel"}),
+                testing::SizeIs(isOver ? 0 : 1));
+    EXPECT_FALSE(platform_.registry.placeholder(kA));
+}
+
+INSTANTIATE_TEST_SUITE_P(EveryState, TransferFailureInState,
+                         testing::Range(std::uint64_t{kInstallStateWaiting},
+                                        std::uint64_t{kInstallStateFinished} + 1));
+
 TEST_F(TransferFailure, SayThatThePlaceholderCannotBeRemoved) {
     platform_.registry.removeProgress(kA);
     platform_.registry.failNextUninstall(kA, ErrorRecord::make(kRegistryErrorDomain, 1, "no"));
