@@ -25,6 +25,15 @@ TEST_F(ClearSyncData, LeavesNothingToSyncWith) {
                                                       "8 default Uninstall com.example.a = y"));
 }
 
+TEST_F(ClearSyncData, RemovesTheWorkAreaUnderBothLocks) {
+    platform_.files.addDirectory(std::string(kWorkArea));
+    client_->clearSyncData();
+    EXPECT_THAT(platform_.callsTo({"Lock", "FileSystem"}),
+                ElementsAre("Lock#1.lock()", "Lock#2.lock()",
+                            "FileSystem.removeItem(" + std::string(kWorkArea) + ") -> ok",
+                            "Lock#2.unlock()", "Lock#1.unlock()"));
+}
+
 TEST_F(ClearSyncData, GoesOnAfterAFailedUninstall) {
     platform_.registry.addPlaceholder(kA, kInstallTypeSync);
     platform_.registry.addPlaceholder(kB, kInstallTypeRestore);

@@ -97,6 +97,21 @@ TEST_F(ClientObject, WarnsOfAwaitedPlaceholdersWhenItIsDestroyed) {
                        "placeholder install complete notifications"));
 }
 
+TEST_F(ClientObject, WarnsInOrderBeforeItStopsListening) {
+    client_->assetTransferUpdatedProgress(receivedAsset(kA), 0.5);
+    Access::placeholdersForRestoringApps(*client_) = {kB};
+    platform_.clearRecording();
+    client_.reset();
+    EXPECT_THAT(
+        platform_.lines(),
+        ElementsAre("8 error <AppsClient> getting dealloc'd with 1 outstanding HFT transfers!",
+                    "8 error <AppsClient> getting dealloc'd with (com.example.b)pending "
+                    "placeholder install complete notifications",
+                    "AppRegistry.removeObserver()",
+                    "SyncHost.mainBundleIdentifier() -> com.korvu.trd",
+                    "NotificationCenter.removeObserver(" + std::string(kStartup) + ")"));
+}
+
 TEST_F(ClientObject, AsksOnceWhetherInstallsAreCoordinated) {
     platform_.coordination.setEnabled(true);
     client_->assetTransferUpdatedProgress(receivedAsset(kA), 0.5);

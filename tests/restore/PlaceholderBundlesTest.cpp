@@ -41,6 +41,16 @@ TEST_F(PlaceholderBundles, RecordADirectoryThatCannotBeMade) {
                                                 kBundle + " with err=Error Domain=POSIX")));
 }
 
+TEST_F(PlaceholderBundles, RecordADirectoryThatCannotBeMadeBeforeTheyLogIt) {
+    platform_.files.failNext(FileOperation::CreateDirectory, kBundle, EROFS);
+    EXPECT_FALSE(client_->createPlaceHolderPath(kBundle, kA, kMobile));
+    EXPECT_THAT(platform_.lines(),
+                ElementsAre(HasSubstr("FileSystem.createDirectory("),
+                            "InstallTransactionLog.logScenario(Vessik App Restore, 0, no, "
+                            "com.example.a, Failed to create app directory)",
+                            testing::StartsWith("8 default Created app directory for ")));
+}
+
 // writeIconData
 
 class IconData : public PlaceholderBundles {
