@@ -10,30 +10,23 @@
 #include <vector>
 
 #include "device/package/PackageEntries.h"
+#include "device/package/PackageFile.h"
 #include "device/package/PackageLimits.h"
 #include "platform/Bytes.h"
 #include "platform/Result.h"
 
-struct zip;
-
 namespace appsync {
 
-class PackageFile;
-
-/// A package as an archive: its entries, checked and arranged as a tree, and their contents. The
-/// one place that knows libzip's reader. One thread at a time. Errors do not name the package;
-/// `name` does.
+/// A package as an archive: its entries, checked and arranged as a tree, and their contents. One
+/// thread at a time. Errors do not name the package; `name` does.
 class PackageArchive {
   public:
     /// Opens and checks everything but what the bundle says of itself.
     [[nodiscard]] static Result<std::unique_ptr<PackageArchive>> open(PackageFile file,
                                                                       const PackageLimits& limits);
-    ~PackageArchive();
-    PackageArchive(const PackageArchive&) = delete;
-    PackageArchive& operator=(const PackageArchive&) = delete;
 
-    [[nodiscard]] const std::string& name() const noexcept;
-    [[nodiscard]] std::uint64_t packedBytes() const noexcept;
+    [[nodiscard]] const std::string& name() const noexcept { return file_.name(); }
+    [[nodiscard]] std::uint64_t packedBytes() const noexcept { return file_.size(); }
     [[nodiscard]] std::uint64_t unpackedBytes() const noexcept;
     /// In tree order.
     [[nodiscard]] const std::vector<PackageEntry>& entries() const noexcept { return entries_; }
@@ -56,16 +49,11 @@ class PackageArchive {
     [[nodiscard]] ErrorRecord named(const ErrorRecord& error) const;
 
   private:
-    class Source;
-    explicit PackageArchive(std::unique_ptr<Source> source);
+    explicit PackageArchive(PackageFile file);
 
-    [[nodiscard]] Status openArchive();
     [[nodiscard]] Status listEntries(const PackageLimits& limits);
-    [[nodiscard]] Result<PackageEntry> entryAt(std::uint64_t index, const PackageLimits& limits);
 
-    // The archive reads from the source, and is closed before it goes.
-    std::unique_ptr<Source> source_;
-    zip* archive_ = nullptr;
+    PackageFile file_;
     std::vector<PackageEntry> entries_;
 };
 

@@ -1,6 +1,6 @@
 #pragma once
 
-#include <cstddef>
+#include <cstdint>
 
 #include "device/package/PackageLimits.h"
 #include "platform/Result.h"
@@ -9,13 +9,23 @@ namespace appsync {
 
 class PackageFile;
 
-/// What the header before the contents of an entry takes at least, beside the name.
-inline constexpr std::size_t kLocalHeaderBytes = 30;
+/// Where the central directory lies, as the end of the archive has it.
+struct ArchiveDirectoryPlace {
+    std::uint64_t offset = 0;
+    std::uint64_t size = 0;
+    std::uint64_t count = 0;
+    /// The count of what no larger number has been kept for.
+    bool countIsModulo65536 = false;
+};
 
-/// Checks where the archive says how large its central directory is, and walks that directory once,
-/// before libzip sets memory aside for what they claim. Refuses what has no end, or more than one
-/// that could be it; too many entries; a count that is not true; names that hold a NUL. Memory is
-/// bounded by the limits. Errors do not name the package.
-[[nodiscard]] Status checkArchiveEnd(const PackageFile& file, const PackageLimits& limits);
+/// Finds the end of the archive, which ends the file, and what it says. Refuses what has no end, or
+/// more than one that could be it; ends that contradict each other; a directory that does not lie
+/// right before its end, or is larger than the limits allow; archives in several parts. Errors do
+/// not name the package.
+[[nodiscard]] Result<ArchiveDirectoryPlace> findArchiveDirectory(const PackageFile& file,
+                                                                 const PackageLimits& limits);
+
+/// The refusal of more entries than the limits allow.
+[[nodiscard]] ErrorRecord tooManyEntries(const PackageLimits& limits);
 
 }  // namespace appsync

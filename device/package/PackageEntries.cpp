@@ -5,7 +5,7 @@
 #include <algorithm>
 #include <cstddef>
 
-#include "device/package/PackageArchiveEnd.h"
+#include "device/package/PackageArchiveFormat.h"
 #include "device/package/PackageError.h"
 #include "device/values/PackageText.h"
 
@@ -156,7 +156,9 @@ Result<PackageEntry> checkedEntry(const RawPackageEntry& raw, const PackageLimit
                         .mode = deviceMode(raw.mode, isDirectory),
                         .size = raw.size,
                         .packedSize = raw.packedSize,
-                        .index = raw.index};
+                        .contentsAt = raw.contentsAt,
+                        .crc = raw.crc,
+                        .isDeflated = raw.isDeflated};
 }
 
 Status arrangeAsTree(std::vector<PackageEntry>& entries) {

@@ -24,8 +24,11 @@ struct PackageEntry {
     std::uint32_t mode = 0;
     std::uint64_t size = 0;
     std::uint64_t packedSize = 0;
-    /// Where it stands in the archive.
-    std::uint64_t index = 0;
+    /// Where its contents begin in the archive.
+    std::uint64_t contentsAt = 0;
+    std::uint32_t crc = 0;
+    /// Or else stored as it is.
+    bool isDeflated = false;
 };
 
 /// An entry as the archive has it.
@@ -35,7 +38,9 @@ struct RawPackageEntry {
     std::uint32_t mode = 0;
     std::uint64_t size = 0;
     std::uint64_t packedSize = 0;
-    std::uint64_t index = 0;
+    std::uint64_t contentsAt = 0;
+    std::uint32_t crc = 0;
+    bool isDeflated = false;
 };
 
 /// The order in which a directory comes right before everything in it. Entries of a package are

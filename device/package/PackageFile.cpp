@@ -56,4 +56,13 @@ Result<std::size_t> PackageFile::readAt(std::uint64_t offset, std::span<std::uin
     return done;
 }
 
+Result<Bytes> PackageFile::readExactly(std::uint64_t offset, std::uint64_t size) const {
+    Bytes bytes(static_cast<std::size_t>(size));
+    const Result<std::size_t> count = readAt(offset, bytes);
+    if (!count) return count.error();
+    if (*count == bytes.size()) return bytes;
+    return packageError(PackageErrorCode::Inconsistent,
+                        "it became shorter while it was read; copy it or make it again");
+}
+
 }  // namespace appsync

@@ -6,6 +6,7 @@
 #include <string>
 #include <string_view>
 
+#include "platform/Bytes.h"
 #include "platform/Result.h"
 #include "system/UniqueFd.h"
 
@@ -29,6 +30,9 @@ class PackageFile {
     /// Reads at an offset; fewer bytes than asked for only at the end of the file.
     [[nodiscard]] Result<std::size_t> readAt(std::uint64_t offset,
                                              std::span<std::uint8_t> bytes) const;
+
+    /// Those bytes, which were there when the file was opened; refused when it became shorter.
+    [[nodiscard]] Result<Bytes> readExactly(std::uint64_t offset, std::uint64_t size) const;
 
   private:
     PackageFile(UniqueFd descriptor, std::uint64_t size, std::string_view name);

@@ -1,0 +1,124 @@
+#include "device/package/PackageArchiveContents.h"
+
+#include <zlib.h>
+
+#include <algorithm>
+#include <cerrno>
+#include <string>
+#include <string_view>
+
+#include "device/package/PackageEntries.h"
+#include "device/package/PackageError.h"
+#include "device/package/PackageFile.h"
+#include "system/PosixError.h"
+
+namespace appsync {
+
+namespace {
+
+constexpr std::uint64_t kPackedPieceBytes = std::uint64_t{64} << 10;
+/// The window of deflate; negative, as there is no header around it.
+constexpr int kRawDeflate = -MAX_WBITS;
+
+ErrorRecord damaged(std::string_view reason) {
+    return packageError(PackageErrorCode::DamagedEntry,
+                        std::string(reason) + "; copy the package or make it again");
+}
+
+}  // namespace
+
+PackageArchiveContents::PackageArchiveContents(const PackageFile& file, const PackageEntry& entry)
+    : file_(file), entry_(entry) {}
+
+PackageArchiveContents::~PackageArchiveContents() {
+    if (stream_) ::inflateEnd(stream_.get());
+}
+
+Result<std::size_t> PackageArchiveContents::read(std::span<std::uint8_t> buffer) {
+    // One byte more than the entry says, to notice that there is more.
+    const std::uint64_t left = entry_.size - done_;
+    const auto piece = buffer.first(
+        static_cast<std::size_t>(std::min<std::uint64_t>(buffer.size() - 1, left) + 1));
+    const Result<std::size_t> count = entry_.isDeflated ? inflate(piece) : copy(piece);
+    if (!count) return count;
+    if (*count > left) return damaged("it unpacks to more bytes than it says");
+    crc_ = static_cast<std::uint32_t>(::crc32_z(crc_, piece.data(), *count));
+    done_ += *count;
+    if (*count > 0) return count;
+    if (Status status = checkEnd(); !status) return status.error();
+    return count;
+}
+
+Status PackageArchiveContents::checkEnd() const {
+    if (done_ < entry_.size) return damaged("it unpacks to fewer bytes than it says");
+    const bool isAllUsed = !stream_ || stream_->avail_in == 0;
+    if (packedDone_ < entry_.packedSize || !isAllUsed) {
+        return damaged("it has more packed bytes than it needs");
+    }
+    if (crc_ != entry_.crc) return damaged("its CRC is wrong");
+    return {};
+}
+
+Result<std::size_t> PackageArchiveContents::copy(std::span<std::uint8_t> buffer) {
+    const std::uint64_t left = entry_.packedSize - packedDone_;
+    const auto piece =
+        buffer.first(static_cast<std::size_t>(std::min<std::uint64_t>(buffer.size(), left)));
+    if (Status status = readPacked(piece); !status) return status.error();
+    return piece.size();
+}
+
+Result<std::size_t> PackageArchiveContents::inflate(std::span<std::uint8_t> buffer) {
+    if (Status status = startInflating(); !status) return status.error();
+    stream_->next_out = buffer.data();
+    stream_->avail_out = static_cast<uInt>(buffer.size());
+    while (stream_->avail_out > 0 && !isInflated_) {
+        if (Status status = refill(); !status) return status.error();
+        switch (::inflate(stream_.get(), Z_NO_FLUSH)) {
+            case Z_STREAM_END:
+                isInflated_ = true;
+                break;
+            case Z_OK:
+                break;
+            case Z_BUF_ERROR:
+                return damaged("its packed bytes end too early");
+            case Z_MEM_ERROR:
+                return posixError(ENOMEM, "read", file_.name());
+            default:
+                return damaged("its packed bytes are damaged");
+        }
+    }
+    return buffer.size() - stream_->avail_out;
+}
+
+Status PackageArchiveContents::startInflating() {
+    if (stream_) return {};
+    auto stream = std::make_unique<z_stream_s>();
+    if (::inflateInit2(stream.get(), kRawDeflate) != Z_OK) {
+        return posixError(ENOMEM, "read", file_.name());
+    }
+    stream_ = std::move(stream);
+    packed_.resize(static_cast<std::size_t>(std::min(entry_.packedSize, kPackedPieceBytes)));
+    return {};
+}
+
+/// Gives the stream more, once it has used what it had.
+Status PackageArchiveContents::refill() {
+    if (stream_->avail_in > 0) return {};
+    const auto size = static_cast<std::size_t>(
+        std::min<std::uint64_t>(packed_.size(), entry_.packedSize - packedDone_));
+    const auto piece = std::span(packed_).first(size);
+    if (Status status = readPacked(piece); !status) return status;
+    stream_->next_in = piece.data();
+    stream_->avail_in = static_cast<uInt>(size);
+    return {};
+}
+
+Status PackageArchiveContents::readPacked(std::span<std::uint8_t> bytes) {
+    const Result<std::size_t> count = file_.readAt(entry_.contentsAt + packedDone_, bytes);
+    if (!count) return count.error();
+    if (*count < bytes.size()) return damaged("it became shorter while it was read");
+    packedDone_ += *count;
+    return {};
+}
+
+}  // namespace appsync
