@@ -76,37 +76,56 @@ std::string extraOf(const ZipEntry& entry) {
     return extra + *entry.unicodeName;
 }
 
-/// What both headers have in common.
-void putShared(std::string& header, const ZipEntry& entry, std::size_t packedSize,
-               std::uint32_t size, std::size_t nameSize) {
+/// What the two headers say each for itself.
+struct Claims {
+    std::uint16_t method = 0;
+    std::uint32_t crc = 0;
+    std::uint64_t packedSize = 0;
+    std::uint32_t size = 0;
+};
+
+void putShared(std::string& header, std::uint16_t flags, const Claims& claims, std::size_t nameSize,
+               std::size_t extraSize) {
     put(header, 20, 2);
-    put(header, entry.flags, 2);
-    put(header, entry.method, 2);
+    put(header, flags, 2);
+    put(header, claims.method, 2);
     put(header, 0, 2);
     put(header, 0x21, 2);
-    put(header, entry.crc.value_or(crcOf(entry.contents)), 4);
-    put(header, packedSize, 4);
-    put(header, size, 4);
+    put(header, claims.crc, 4);
+    put(header, claims.packedSize, 4);
+    put(header, claims.size, 4);
     put(header, nameSize, 2);
-    put(header, extraOf(entry).size(), 2);
+    put(header, extraSize, 2);
 }
+
+std::uint32_t crcClaim(const ZipEntry& entry) { return entry.crc.value_or(crcOf(entry.contents)); }
 
 std::string localHeader(const ZipEntry& entry, std::size_t packedSize, std::uint32_t size) {
     const std::string& name = entry.localName ? *entry.localName : entry.name;
+    const std::string extra = extraOf(entry) + entry.localExtra;
+    const Claims claims = {.method = entry.localMethod.value_or(entry.method),
+                           .crc = entry.localCrc.value_or(crcClaim(entry)),
+                           .packedSize = entry.localPackedSize.value_or(packedSize),
+                           .size = entry.localSize.value_or(size)};
     std::string header = "PK\3\4";
-    putShared(header, entry, packedSize, entry.localSize.value_or(size), name.size());
-    return header + name + extraOf(entry);
+    putShared(header, entry.flags, claims, name.size(), extra.size());
+    return header + name + extra;
 }
 
 std::string centralHeader(const ZipEntry& entry, std::size_t packedSize, std::uint32_t size,
                           std::uint32_t offset) {
+    const std::string extra = extraOf(entry) + entry.centralExtra;
+    const Claims claims = {.method = entry.method,
+                           .crc = crcClaim(entry),
+                           .packedSize = entry.centralPackedSize.value_or(packedSize),
+                           .size = entry.centralSize.value_or(size)};
     std::string header = "PK\1\2";
     put(header, kUnixVersion, 2);
-    putShared(header, entry, packedSize, size, entry.name.size());
+    putShared(header, entry.flags, claims, entry.name.size(), extra.size());
     put(header, 0, 2 + 2 + 2);
     put(header, entry.mode << 16U, 4);
     put(header, offset, 4);
-    return header + entry.name + extraOf(entry);
+    return header + entry.name + extra;
 }
 
 }  // namespace
@@ -128,14 +147,35 @@ ZipEntry zipZeros(std::string_view name, std::uint32_t size) {
     return entry;
 }
 
+ZipEntry zipStreamed(ZipEntry entry, ZipDescriptorForm form) {
+    constexpr std::uint16_t kHasDescriptor = 8;
+    entry.flags = kHasDescriptor;
+    entry.localCrc = entry.localPackedSize = entry.localSize = 0;
+    const std::size_t width = form.isLarge ? 8 : 4;
+    entry.descriptor = form.hasSignature ? "PK\7\10" : "";
+    put(entry.descriptor, crcOf(entry.contents), 4);
+    put(entry.descriptor, entry.packed.value_or(entry.contents).size(), width);
+    put(entry.descriptor, entry.contents.size(), width);
+    return entry;
+}
+
+std::string zipLargeSizes(const std::vector<std::uint64_t>& sizes) {
+    std::string extra;
+    put(extra, 1, 2);
+    put(extra, 8 * sizes.size(), 2);
+    for (const std::uint64_t size : sizes) put(extra, size, 8);
+    return extra;
+}
+
 ZipBuilder& ZipBuilder::add(const ZipEntry& entry) {
     const std::string& packed = entry.packed ? *entry.packed : entry.contents;
     const std::uint32_t size =
         entry.size.value_or(static_cast<std::uint32_t>(entry.contents.size()));
     if (!entry.overlapsLast) {
         lastOffset_ = static_cast<std::uint32_t>(files_.size());
-        files_ += localHeader(entry, packed.size(), size) + packed;
+        files_ += localHeader(entry, packed.size(), size) + packed + entry.descriptor;
     }
+    if (entry.isHidden) return *this;
     directory_ += centralHeader(entry, packed.size(), size, lastOffset_);
     ++count_;
     return *this;
@@ -153,6 +193,11 @@ ZipBuilder& ZipBuilder::claimCount(std::uint16_t count) {
 
 ZipBuilder& ZipBuilder::claimExtraDirectoryBytes(std::uint32_t bytes) {
     extraDirectoryBytes_ = bytes;
+    return *this;
+}
+
+ZipBuilder& ZipBuilder::gap(std::string_view bytes) {
+    files_ += bytes;
     return *this;
 }
 
