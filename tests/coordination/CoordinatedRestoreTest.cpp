@@ -394,6 +394,7 @@ TEST_F(CoordinatedRestore, TakesACoordinatorOfAnotherClientForNone) {
         EXPECT_FALSE(prepare(status));
         EXPECT_TRUE(
             logged(LogLevel::Error, "Error (null) creating restore coordinator for com.example.a"));
+        ASSERT_NE(service().state(kA), nullptr);
         EXPECT_EQ(service().state(kA)->cancelled, std::nullopt);
         EXPECT_THAT(platform_.callsTo({"InstallCoordinator"}),
                     ElementsAre(StartsWith("InstallCoordinator.creatorIdentifier")));
