@@ -1,5 +1,6 @@
 #include "client/TodoList.h"
 
+#include <algorithm>
 #include <mutex>
 #include <utility>
 
@@ -9,6 +10,15 @@
 #include "client/SafeIdentifier.h"
 
 namespace appsync {
+
+namespace {
+
+/// What an entry is found by; null when it has none.
+const std::string* identifierOf(const PropertyList& entry) {
+    return entry.findString(kTodoIdentifierKey);
+}
+
+}  // namespace
 
 bool hasOperation(const PropertyList& entry, std::string_view operation) {
     const std::string* own = entry.findString(kTodoOperationKey);
@@ -28,11 +38,21 @@ std::vector<std::string> identifiersToRemove(const PropertyList& todoList) {
     return identifiers;
 }
 
+std::optional<std::size_t> indexOfEntry(const PropertyList& todoList, std::string_view identifier) {
+    const auto entries = todoList.elements();
+    const auto found = std::find_if(entries.begin(), entries.end(), [&](const PropertyList& entry) {
+        const std::string* own = identifierOf(entry);
+        return own != nullptr && *own == identifier;
+    });
+    if (found == entries.end()) return std::nullopt;
+    return static_cast<std::size_t>(found - entries.begin());
+}
+
 TodoIndex::TodoIndex(const PropertyList& todoList) : todoList_(todoList) {
     const auto entries = todoList.elements();
     indexes_.reserve(entries.size());
     for (std::size_t index = 0; index < entries.size(); ++index) {
-        const std::string* identifier = entries[index].findString(kTodoIdentifierKey);
+        const std::string* identifier = identifierOf(entries[index]);
         if (identifier != nullptr) indexes_.try_emplace(*identifier, index);
     }
 }
@@ -51,9 +71,9 @@ std::optional<std::string> AppsClient::_operationStateForIdentifier(
     const std::string& identifier) const {
     const std::optional<PropertyList> todoList = _loadPlist(platform_, kTodoListPath, nullptr);
     if (!todoList) return std::nullopt;
-    const PropertyList* entry = TodoIndex(*todoList).find(identifier);
+    const std::optional<std::size_t> index = indexOfEntry(*todoList, identifier);
     const std::string* operation =
-        entry != nullptr ? entry->findString(kTodoOperationKey) : nullptr;
+        index ? todoList->at(*index)->findString(kTodoOperationKey) : nullptr;
     return operation != nullptr ? std::optional(*operation) : std::nullopt;
 }
 
@@ -61,7 +81,7 @@ void AppsClient::changeAssetID(const std::string& identifier, std::string_view t
     const std::lock_guard guard(*todoListLock_);
     std::optional<PropertyList> todoList = _loadPlist(platform_, kTodoListPath, nullptr);
     if (!todoList) return;
-    const std::optional<std::size_t> index = TodoIndex(*todoList).indexOf(identifier);
+    const std::optional<std::size_t> index = indexOfEntry(*todoList, identifier);
     if (!index) return;
     PropertyList entry = todoList->take(*index);
     log_(Level::Default, "%s|Changing %{public}@ from %{public}@ to %{public}@", identifier,

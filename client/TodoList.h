@@ -33,6 +33,11 @@ inline constexpr std::string_view kTodoFailed = "FAILED";
 /// The identifiers that the list asks to remove and that are safe, in its order.
 [[nodiscard]] std::vector<std::string> identifiersToRemove(const PropertyList& todoList);
 
+/// Where the first entry with this identifier stands; nothing when there is none. Goes through the
+/// list: for many look-ups in one list there is `TodoIndex`.
+[[nodiscard]] std::optional<std::size_t> indexOfEntry(const PropertyList& todoList,
+                                                      std::string_view identifier);
+
 /// Finds first entries by identifier, at a cost that does not grow with the list. Borrows the list.
 class TodoIndex {
   public:
