@@ -1,5 +1,22 @@
 #pragma once
 
+// device: a whole device in a directory of this machine (docs/device-format.md): it is made
+// (DeviceCreation.h), opened (DeviceOpening.h), asked (DeviceQueries.h), held by one session at a
+// time (SessionLock.h), and keeps space back for a full disk (SpaceReserve.h). The work is done in
+// the rooms:
+//
+//     values         records, errors, paths and names that all rooms speak of
+//     database       SQLite: connections, schema, the statements of each table
+//     package        reading, checking, unpacking and writing archives
+//     screen         icons, the home screen and its picture
+//     services       the services that are little more than a table
+//     install        installing and removing: containers, placeholders, progress, putting in order
+//     registry       the platform's registry, over `install`
+//     coordination   the platform's install-coordination service, over `install`
+//
+// `Device` alone wires them into a `Platform`. Of all this host/ sees `Device`, values, package and
+// screen.
+
 #include <chrono>
 #include <cstdint>
 #include <map>

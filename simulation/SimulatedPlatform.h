@@ -1,5 +1,20 @@
 #pragma once
 
+// simulation: every service of platform/ in memory, on one thread, by a virtual clock: what the
+// tests of the plug-in run on. `SimulatedPlatform` (this header) makes the services of the rooms
+// below and wires them:
+//
+//     scheduling     fibers, turns, virtual time
+//     recording      every call across platform/, and every message, as entries that tests look at
+//     files          the file system, with links, owners and a journal of what is durable
+//     services       the small services, registry and home screen among them
+//     coordination   the install-coordination service
+//
+// FaultPlan.h lets any call fail in each way that its contract allows; DeviceImage.h says what a
+// crash leaves, and lets the next process begin with it (docs/reliability.md). Includes platform/
+// only, so that a port can use it for its own tests; what reads property lists is borrowed. Called
+// by tests/, bench/ and fuzz/readers/.
+
 #include <functional>
 #include <initializer_list>
 #include <optional>

@@ -1,5 +1,18 @@
 #pragma once
 
+// system: the parts of a platform that any device on POSIX can use, each one service of platform/
+// or what several need:
+//
+//     files           RootedFileSystem.h, over RootDirectory.h, which no path leads out of;
+//                     TreeWalk.h, TemporaryFile.h, DescriptorIO.h, UniqueFd.h, PosixError.h
+//     work            SystemWorkQueues.h, with ThreadedOperationQueue.h and DelayedWork.h
+//     log             JsonLogFacility.h
+//     notifications   SystemNotifications.h
+//     property_list/  both encodings, a room of its own
+//
+// Includes platform/ and POSIX; knows no device, no database, no plug-in. Called by device/ and
+// host/; a port to another POSIX device takes it as it is (docs/porting.md).
+
 #include <functional>
 #include <map>
 #include <memory>

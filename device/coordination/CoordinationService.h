@@ -1,5 +1,20 @@
 #pragma once
 
+// device/coordination: the platform's install-coordination service, the one part of a device with a
+// life of its own.
+//
+//     service   CoordinationService.h: what clients call; wires everything below
+//     handles   DeviceCoordinator.h, DevicePlaceholder.h, DevicePromise.h: what clients hold
+//     book      CoordinationBook.h: which coordinators there are, their pieces
+//               (CoordinationPieces.cpp), their ends (CoordinationEndings.cpp), each in memory
+//               (LiveCoordinator.h, LivePromise.h)
+//     threads   CoordinatedInstaller.h installs, CoordinationHerald.h calls observers
+//
+// A call goes from a handle to the book, from there to the database (CoordinationTables) and, when
+// a coordinator is complete, to the installer, which works with device/install; the herald tells.
+// No lock is held across a transaction or a call of an observer. Includes install, registry,
+// screen, services, database and values; made by `Device` alone.
+
 #include <chrono>
 #include <memory>
 #include <set>

@@ -1,5 +1,20 @@
 #pragma once
 
+// device/install: how applications come to a device and go. Each operation is a function over an
+// `InstallContext` (this header), and ends in one transaction, before which nothing has changed:
+//
+//     ApplicationInstall.h   a package becomes an application, with RestoreData.h that of a backup
+//     PlaceholderInstall.h   a bundle becomes a placeholder
+//     BundleRemoval.h        what goes, and what stays
+//
+// They share Containers.h (the directories of bundles), DurabilityBarrier.h (syncs that threads
+// share) and ProgressBook.h (how far each install is).
+//
+// After a crash or a session that was cut off, Reconciliation.h and CoordinationRecovery.h remove
+// what neither database nor disk can account for (docs/device-format.md). Who may call it when is
+// for the callers to know: registry (the plug-in's direct path), coordination (its threads) and
+// `Device` (people). Includes database, package, screen, values and system/.
+
 #include <string>
 
 #include "platform/Result.h"

@@ -1,5 +1,17 @@
 #pragma once
 
+// device/package: archives, all of them foreign. `PackageReader` (this header) opens, checks and
+// unpacks an application's package; `writePackage` makes one (PackageWriter.h); DataArchive.h has
+// the archives of an application's data, which backups hold. Behind the reader: PackageFile.h (the
+// bytes), PackageArchiveEnd.h (what is checked before libzip may allocate), PackageArchive.h
+// (libzip's reader), PackageEntries.h (names, kinds, the tree), PackageInfo.h (Info.plist),
+// PackageUnpacker.h (writing the tree); PackageLimits.h says what a package may claim,
+// PackageError.h why one is refused. Behind the writers: PackageFolder.h (what goes in) and
+// ArchiveWriter.h (libzip's writer).
+//
+// Includes device/values, system/ and libzip: no database and no device. Called by install and by
+// host/. What reads foreign bytes here is fuzzed (fuzz/readers/).
+
 #include <cstdint>
 #include <functional>
 #include <memory>

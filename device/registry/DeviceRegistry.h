@@ -1,5 +1,11 @@
 #pragma once
 
+// device/registry: the platform's `AppRegistry`. `DeviceRegistry` (this header) answers from the
+// database what is installed and turns installs, placeholders and removals into operations of
+// device/install; `RegistryObservers` (RegistryObservers.h) tells observers, on a thread of its
+// own, of installs that are under way. Includes install, database and values. Called by the plug-in
+// through platform/ and by `Device`; coordination judges identifiers by it.
+
 #include <memory>
 #include <mutex>
 #include <optional>

@@ -1,5 +1,15 @@
 #pragma once
 
+// device/screen: what a person sees. `DeviceHomeScreen` (this header) is the platform's home
+// screen: the layout, which application runs, and whether its termination is granted. IconDrawing.h
+// makes the icon of an application from its file or its name, with IconCanvas.h, the one place that
+// knows cairo, and CairoIconRenderer.h gives the plug-in the same as a service. HomeScreenPicture.h
+// draws the whole screen (`appsync screen`).
+//
+// Includes device/database, device/values, and of device/package only the name that an icon has by
+// default. Called by install (icons of placeholders), coordination (terminations), `Device` and the
+// command.
+
 #include <chrono>
 #include <memory>
 #include <optional>

@@ -1,5 +1,11 @@
 #pragma once
 
+// device/services: the platform's services that are little more than a table of the database: the
+// list of uninstalled applications, policy, data that a restore expects, the transaction log. All
+// of them are in this header. A new service of that kind goes here; one that has threads or files
+// of its own gets a room. Includes device/database and device/values. Made by `Device`;
+// coordination asks the policy.
+
 #include <string>
 #include <vector>
 

@@ -1,5 +1,13 @@
 #pragma once
 
+// device/values: what every room of a device, and whoever looks at one, speaks of: records of what
+// it holds (this header), errors that tell that a device cannot be used (DeviceError.h), where
+// things stand in it (DevicePaths.h), what is a legal identifier and what file name belongs to one
+// (PackageIdentifier.h), how names of foreign archives may look and are quoted (PackageText.h),
+// promises (PromiseValues.h), the time of day (WallClock.h). Plain values and functions without a
+// state: this room opens no file and no database, and includes platform/ only. Every other room of
+// device/ may include it, and so may host/.
+
 #include <chrono>
 #include <cstdint>
 #include <optional>

@@ -1,5 +1,17 @@
 #pragma once
 
+// host/command: `appsync`, command by command. CommandLine.cpp declares the commands and their
+// options; what one does, once its arguments are understood, is a function of this header, in a
+// file of its own: <Name>Command.cpp. Such a file holds what is the command's own: which arguments
+// go together, what it opens, in which order it asks other rooms, what it prints. What could serve
+// another command stands elsewhere: host/plan (what is to be done), host/session (doing it with the
+// plug-in), host/backup, host/output (texts and JSON). OpenDevice.h and IdentifierArgument.h are
+// what commands share.
+//
+// A new command: a function here, its file, its options in CommandLine.cpp, a line in
+// docs/commands.md and in tests/host/command/CommandLineTest.cpp. Includes every other room of
+// host/; called by host/main.cpp only.
+
 #include <cstdint>
 #include <optional>
 #include <string>

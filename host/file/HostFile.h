@@ -1,5 +1,9 @@
 #pragma once
 
+// host/file: files of this machine, beside the device: read and written whole or in pieces (this
+// header), and their sums (Checksum.h). Includes system/ and platform/. Called by plan, session,
+// backup and the commands.
+
 #include <cstdint>
 #include <string>
 #include <utility>

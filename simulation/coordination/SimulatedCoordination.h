@@ -1,5 +1,12 @@
 #pragma once
 
+// simulation/coordination: the install-coordination service in memory. `SimulatedCoordination`
+// (this header) keeps the coordinators, installs through the simulated registry and calls
+// observers; SimulatedCoordinator.h, SimulatedPlaceholder.h and SimulatedPromises.h are the handles
+// that clients hold; SimulatedCoordinationState.h is what they share. Tests script refusals
+// (`CoordinationStep`), nulls (`CoordinationObject`) and what other clients do. Includes services,
+// files, recording and platform/; the same contract as device/coordination (tests/contract/).
+
 #include <cstddef>
 #include <deque>
 #include <functional>

@@ -1,5 +1,10 @@
 #pragma once
 
+// simulation/files: a device's files in memory. `SimulatedFileSystem` (this header) is the service,
+// and what tests set up and look at; FileNode.h is a file, a directory or a link; FileJournal.h
+// keeps what is on disk apart from what only looks so, for crashes. Includes recording, scheduling
+// and platform/; the registry and the coordination service read packages and placeholders from it.
+
 #include <cstddef>
 #include <cstdint>
 #include <limits>

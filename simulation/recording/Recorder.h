@@ -1,5 +1,12 @@
 #pragma once
 
+// simulation/recording: what crosses platform/. Every simulated service tells `Recorder` (this
+// header) of each call, by way of `RecordedCall` (RecordedCall.h): there it becomes an entry, may
+// be refused by a `CallInterceptor` (faults), runs the test's hooks, and lets the scheduler change
+// turns. KnownCalls.h are the names of all calls: a test that asks for another has a slip of the
+// pen. DurableChanges.h is how services tell what a crash would leave. Includes scheduling and
+// platform/.
+
 #include <cstddef>
 #include <functional>
 #include <iosfwd>

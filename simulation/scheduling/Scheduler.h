@@ -1,5 +1,11 @@
 #pragma once
 
+// simulation/scheduling: who runs, and what time it is. `Scheduler` (this header) gives turns to
+// tasks and to the test, which is the host, in an order that follows from a seed; each task is a
+// `Fiber` (Fiber.h: a stack of its own on the one thread). Whatever blocks in the simulation waits
+// here, and time passes here only. The lowest room of simulation/: all others wait and wake through
+// it, most of them through the recorder. Includes platform/ and what fibers need to switch stacks.
+
 #include <chrono>
 #include <cstddef>
 #include <cstdint>

@@ -1,5 +1,12 @@
 #pragma once
 
+// simulation/services: one file for each service of platform/ that is neither files nor
+// coordination; those that only answer or only take note (policy, backup, installer, transaction
+// log) share this one. Each is the interface, which is recorded, and below it what a test sets and
+// looks at, which is not. SimulatedAppRegistry.h is the large one: it installs, keeps progress and
+// calls observers. A new service of platform/ gets its file here, its member in SimulatedPlatform.h
+// and its names in KnownCalls.cpp. Includes files, recording and platform/.
+
 #include <map>
 #include <memory>
 #include <optional>

@@ -1,5 +1,14 @@
 #pragma once
 
+// system/property_list: the two encodings of property lists. This header is all that others need:
+// it looks at the bytes and hands them to PropertyListBinaryReader.h, or to
+// PropertyListXmlReader.h, for which pugixml parses, or, where lists are plain,
+// PropertyListPlainXmlReader.h, which is faster. PropertyListXmlValues.h and PropertyListText.h are
+// what the XML side shares, PropertyListBinaryFormat.h what the binary side does,
+// PropertyListErrors.h says where and why. Every byte may be foreign: what an input claims is
+// bounded by what it could hold (fuzz/readers/). The value itself is platform/PropertyList.h.
+// Includes platform/ and pugixml.
+
 #include "platform/PropertyListSerialization.h"
 
 namespace appsync {
