@@ -35,8 +35,8 @@ PackageLimits dataLimits() {
     limits.unpackedBytes = std::uint64_t{1} << 44U;
     limits.directoryBytes = std::uint64_t{256} << 20U;
     limits.ratioFreeBytes = limits.unpackedBytes;
-    limits.nameBytes = 4096;
-    limits.components = 128;
+    // What lies deeper has no path that the system takes.
+    limits.nameBytes = 4000;
     return limits;
 }
 
@@ -45,14 +45,12 @@ class DataListing {
   public:
     explicit DataListing(fs::path top) : top_(std::move(top)) {}
 
-    Status addContents(const std::string& prefix) {
-        std::error_code code;
-        fs::directory_iterator place(top_ / prefix, code);
-        for (; !code && place != fs::directory_iterator(); place.increment(code)) {
-            const std::string name = prefix + place->path().filename().native();
-            if (Status status = add(name); !status) return status;
+    Status addAll() {
+        while (!waiting_.empty()) {
+            const std::string prefix = std::move(waiting_.back());
+            waiting_.pop_back();
+            if (Status status = addContents(prefix); !status) return status;
         }
-        if (code) return posixError(code.value(), "read", prefix.empty() ? "." : prefix);
         return {};
     }
 
@@ -65,10 +63,24 @@ class DataListing {
     std::vector<std::string> takeLeftOut() { return std::move(leftOut_); }
 
   private:
+    Status addContents(const std::string& prefix) {
+        std::error_code code;
+        fs::directory_iterator place(top_ / prefix, code);
+        for (; !code && place != fs::directory_iterator(); place.increment(code)) {
+            const std::string name = prefix + place->path().filename().native();
+            if (Status status = add(name); !status) return status;
+        }
+        if (code) return posixError(code.value(), "read", prefix.empty() ? "." : prefix);
+        return {};
+    }
+
     Status add(std::string name) {
         const std::string path = (top_ / name).native();
         struct stat status = {};
-        if (::lstat(path.c_str(), &status) != 0) return posixError(errno, "examine", name);
+        // A name that is too long for the system is so for an archive, too, and left out.
+        if (::lstat(path.c_str(), &status) != 0 && errno != ENAMETOOLONG) {
+            return posixError(errno, "examine", name);
+        }
         const bool isDirectory = S_ISDIR(status.st_mode);
         if (isDirectory) name += '/';
         const auto size = isDirectory ? 0 : static_cast<std::uint64_t>(status.st_size);
@@ -80,11 +92,14 @@ class DataListing {
         }
         const std::uint32_t kind = isDirectory ? S_IFDIR : S_IFREG;
         items_.push_back({path, name, kind | entry->mode, size});
-        return isDirectory ? addContents(name) : Status();
+        if (isDirectory) waiting_.push_back(std::move(name));
+        return {};
     }
 
     const fs::path top_;
     const PackageLimits limits_ = dataLimits();
+    /// Directories whose contents are still to be added: not a recursion, however deep they lie.
+    std::vector<std::string> waiting_ = {""};
     std::vector<PackageItem> items_;
     std::vector<std::string> leftOut_;
 };
@@ -131,7 +146,7 @@ Result<DataArchiveContents> writeDataArchive(const RootDirectory& root,
     }
     // By descriptor, so that no link leads out of the device.
     DataListing listing("/proc/self/fd/" + std::to_string(top->get()));
-    if (Status status = listing.addContents(""); !status) {
+    if (Status status = listing.addAll(); !status) {
         return status.error().withContext(directory);
     }
     contents.leftOut = listing.takeLeftOut();

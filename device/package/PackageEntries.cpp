@@ -38,13 +38,11 @@ const char* defectOfCharacters(std::string_view name) noexcept {
 }
 
 const char* defectOfComponents(std::string_view name, const PackageLimits& limits) noexcept {
-    std::size_t count = 0;
     for (std::size_t begin = 0; begin <= name.size();) {
         const std::size_t end = std::min(name.find('/', begin), name.size());
         if (const char* defect = defectOfComponent(name.substr(begin, end - begin), limits)) {
             return defect;
         }
-        if (++count > limits.components) return "lies too deep in directories";
         begin = end + 1;
     }
     return nullptr;

@@ -28,6 +28,44 @@ class FolderListing {
   public:
     explicit FolderListing(const PackageLimits& limits) : limits_(limits) {}
 
+    Status addContentsOf(const fs::path& folder) {
+        waiting_.push_back({folder, ""});
+        return addWaiting();
+    }
+
+    Status addWithContents(const fs::path& path) {
+        if (Status status = add(path, path.filename().native()); !status) return status;
+        return addWaiting();
+    }
+
+    Result<std::vector<PackageItem>> finish(const fs::path& folder) {
+        Status status = arrangeAsTree(entries_);
+        if (!status) return refusal(status.error(), folder);
+        const Result<std::string> bundle = bundleDirectoryOf(entries_);
+        if (!bundle) return refusal(bundle.error(), folder);
+        std::sort(items_.begin(), items_.end(), [](const PackageItem& a, const PackageItem& b) {
+            return precedesInTree(a.entryName, b.entryName);
+        });
+        return std::move(items_);
+    }
+
+  private:
+    /// A folder whose contents are still to be added.
+    struct Waiting {
+        fs::path folder;
+        std::string prefix;
+    };
+
+    // Not a recursion, as folders may lie deep.
+    Status addWaiting() {
+        while (!waiting_.empty()) {
+            const Waiting next = std::move(waiting_.back());
+            waiting_.pop_back();
+            if (Status status = addContents(next.folder, next.prefix); !status) return status;
+        }
+        return {};
+    }
+
     Status addContents(const fs::path& folder, const std::string& prefix) {
         std::error_code error;
         fs::directory_iterator place(folder, error);
@@ -51,21 +89,10 @@ class FolderListing {
         if (entries_.size() >= limits_.entries) return tooMany(path);
         entries_.push_back(*std::move(entry));
         items_.push_back({path.native(), entryName, packedMode(status.st_mode), size});
-        return isDirectory ? addContents(path, entryName) : Status();
+        if (isDirectory) waiting_.push_back({path, entryName});
+        return {};
     }
 
-    Result<std::vector<PackageItem>> finish(const fs::path& folder) {
-        Status status = arrangeAsTree(entries_);
-        if (!status) return refusal(status.error(), folder);
-        const Result<std::string> bundle = bundleDirectoryOf(entries_);
-        if (!bundle) return refusal(bundle.error(), folder);
-        std::sort(items_.begin(), items_.end(), [](const PackageItem& a, const PackageItem& b) {
-            return precedesInTree(a.entryName, b.entryName);
-        });
-        return std::move(items_);
-    }
-
-  private:
     static ErrorRecord refusal(const ErrorRecord& error, const fs::path& path) {
         return cannotPack(static_cast<PackageErrorCode>(error.code), path.native(),
                           error.description());
@@ -80,6 +107,7 @@ class FolderListing {
     const PackageLimits& limits_;
     std::vector<PackageEntry> entries_;
     std::vector<PackageItem> items_;
+    std::vector<Waiting> waiting_;
 };
 
 }  // namespace
@@ -96,8 +124,8 @@ Result<std::vector<PackageItem>> listPackageFolder(const std::string& folder,
     }
     if (error) return posixError(error.value(), "open", folder);
     FolderListing listing(limits);
-    Status status = path.extension() == ".app" ? listing.add(path, path.filename().native())
-                                               : listing.addContents(path, "");
+    Status status =
+        path.extension() == ".app" ? listing.addWithContents(path) : listing.addContentsOf(path);
     if (!status) return status.error();
     return listing.finish(path);
 }

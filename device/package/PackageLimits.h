@@ -17,10 +17,11 @@ struct PackageLimits {
     std::uint64_t ratioFreeBytes = std::uint64_t{16} << 20;
     std::uint64_t ratio = 200;
 
-    /// The whole name of an entry, in bytes; one component of it; and how many components it has.
+    /// The whole name of an entry, in bytes, and one component of it. How deep it lies is bounded
+    /// by that alone: 512 components of one letter each. What stands on the device under such a
+    /// name has a path well below the 4096 bytes that the system takes.
     std::size_t nameBytes = 1024;
     std::size_t componentBytes = 255;
-    std::size_t components = 32;
 
     /// Info.plist, and the store metadata.
     std::uint64_t propertyListBytes = std::uint64_t{1} << 20;

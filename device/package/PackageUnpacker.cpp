@@ -19,6 +19,8 @@ namespace {
 
 constexpr std::uint64_t kPieceBytes = std::uint64_t{256} << 10;
 constexpr std::uint32_t kUsualDirectoryMode = 0755;
+/// More than packages nest, but for those that mean it.
+constexpr std::size_t kMostOpen = 16;
 
 std::string_view parentOf(std::string_view name) noexcept {
     const std::size_t slash = name.rfind('/');
@@ -82,7 +84,7 @@ Status PackageUnpacker::finishFile(const PackageEntry& entry, UniqueFd file) {
 }
 
 Status PackageUnpacker::enter(std::string_view directory, std::uint32_t mode) {
-    leaveUntil(directory);
+    if (Status status = leaveUntil(directory); !status) return status;
     while (path_.size() < directory.size()) {
         const std::size_t begin = path_.empty() ? 0 : path_.size() + 1;
         const std::size_t end = std::min(directory.find('/', begin), directory.size());
@@ -94,11 +96,33 @@ Status PackageUnpacker::enter(std::string_view directory, std::uint32_t mode) {
     return {};
 }
 
-void PackageUnpacker::leaveUntil(std::string_view directory) {
-    while (!open_.empty() && !isInside(directory, path_)) {
-        open_.pop_back();
+Status PackageUnpacker::leaveUntil(std::string_view directory) {
+    while (!path_.empty() && !isInside(directory, path_)) {
+        if (!open_.empty()) open_.pop_back();
         path_.resize(parentOf(path_).size());
     }
+    return open_.empty() ? reopen() : Status();
+}
+
+Status PackageUnpacker::reopen() {
+    for (std::size_t begin = 0; begin < path_.size();) {
+        const std::size_t end = std::min(path_.find('/', begin), path_.size());
+        UniqueFd directory = openDirectory(path_.substr(begin, end - begin));
+        if (!directory) return failed(errno, "open directory", path_.substr(0, end));
+        push(std::move(directory));
+        begin = end + 1;
+    }
+    return {};
+}
+
+UniqueFd PackageUnpacker::openDirectory(const std::string& name) const {
+    return UniqueFd(
+        ::openat(innermost(), name.c_str(), O_RDONLY | O_DIRECTORY | O_NOFOLLOW | O_CLOEXEC));
+}
+
+void PackageUnpacker::push(UniqueFd directory) {
+    if (open_.size() == kMostOpen) open_.erase(open_.begin());
+    open_.push_back(std::move(directory));
 }
 
 Status PackageUnpacker::makeDirectory(std::string_view directory, std::uint32_t mode) {
@@ -106,12 +130,11 @@ Status PackageUnpacker::makeDirectory(std::string_view directory, std::uint32_t 
     if (::mkdirat(innermost(), name.c_str(), 0700) != 0) {
         return failed(errno, "create directory", directory);
     }
-    UniqueFd made(
-        ::openat(innermost(), name.c_str(), O_RDONLY | O_DIRECTORY | O_NOFOLLOW | O_CLOEXEC));
+    UniqueFd made = openDirectory(name);
     if (!made || ::fchmod(made.get(), mode) != 0) {
         return failed(errno, "open directory", directory);
     }
-    open_.push_back(std::move(made));
+    push(std::move(made));
     path_ = directory;
     return {};
 }

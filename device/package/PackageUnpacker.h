@@ -32,8 +32,12 @@ class PackageUnpacker {
     [[nodiscard]] Status finishFile(const PackageEntry& entry, UniqueFd file);
     /// Makes the directory and those it lies in, unless they are open; `mode` is for the last one.
     [[nodiscard]] Status enter(std::string_view directory, std::uint32_t mode);
-    /// Closes directories until the innermost one is, or holds, that directory.
-    void leaveUntil(std::string_view directory);
+    /// Leaves directories until the innermost one is, or holds, that directory.
+    [[nodiscard]] Status leaveUntil(std::string_view directory);
+    /// Opens the innermost directory again, once those that were open have been left.
+    [[nodiscard]] Status reopen();
+    [[nodiscard]] UniqueFd openDirectory(const std::string& name) const;
+    void push(UniqueFd directory);
     [[nodiscard]] Status makeDirectory(std::string_view directory, std::uint32_t mode);
     [[nodiscard]] int innermost() const noexcept;
     [[nodiscard]] Status reportProgress() const;
@@ -46,7 +50,8 @@ class PackageUnpacker {
     const std::uint64_t total_;
     std::uint64_t done_ = 0;
     Bytes buffer_;
-    /// The directories from the top to the innermost open one, whose whole name `path_` is.
+    /// The innermost directories; not all the way to the top, as it may be longer than a process
+    /// may have files open. `path_` is the whole name of the last.
     std::vector<UniqueFd> open_;
     std::string path_;
 };

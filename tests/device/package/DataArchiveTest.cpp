@@ -155,6 +155,36 @@ TEST_F(DataArchiveTest, manySmallFilesAndWellCompressedOnesAreFine) {
     EXPECT_EQ(fs::file_size(path("unpacked/zeros")), std::size_t{32} << 20U);
 }
 
+TEST_F(DataArchiveTest, dataThatLiesDeepComesBack) {
+    std::string deep;
+    for (int i = 0; i < 700; ++i) deep += "d/";
+    write("root/data/" + deep + "file", "deep");
+    ASSERT_TRUE(archive().ok());
+    ASSERT_TRUE(unpack().ok());
+    EXPECT_EQ(read("unpacked/" + deep + "file"), "deep");
+}
+
+TEST_F(DataArchiveTest, whatLiesTooDeepForAnyPathIsLeftOutAndNamed) {
+    write("root/data/kept", "kept");
+    const std::string component(230, 'd');
+    const UniqueFd top(::open(path("root/data").c_str(), O_RDONLY | O_DIRECTORY | O_CLOEXEC));
+    int parent = top.get();
+    std::vector<UniqueFd> made;
+    for (int i = 0; i < 25; ++i) {
+        ASSERT_EQ(::mkdirat(parent, component.c_str(), 0755), 0);
+        made.emplace_back(::openat(parent, component.c_str(), O_RDONLY | O_DIRECTORY | O_CLOEXEC));
+        parent = made.back().get();
+    }
+    const Result<DataArchiveContents> contents = archive();
+    ASSERT_TRUE(contents.ok()) << contents.error().description();
+    EXPECT_EQ(contents->entries, 18U) << "17 directories, and the file beside them";
+    EXPECT_THAT(contents->leftOut, ElementsAre(HasSubstr("has a name that is too long")));
+    EXPECT_TRUE(unpack().ok());
+    for (std::size_t i = made.size() - 1; i > 0; --i) {
+        ::unlinkat(made[i - 1].get(), component.c_str(), AT_REMOVEDIR);
+    }
+}
+
 // Archives that came from somewhere.
 
 TEST_F(DataArchiveTest, noEntryLeadsOutOfTheData) {

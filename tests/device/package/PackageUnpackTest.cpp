@@ -214,6 +214,70 @@ TEST_F(PackageUnpackTest, aFileThatIsNotTakenStopsIt) {
     EXPECT_EQ(status.error().description(), "cannot sync");
 }
 
+std::string nested(int depth) {
+    std::string name;
+    for (int i = 0; i < depth; ++i) name += "d/";
+    return name;
+}
+
+/// The deepest name that there is room for, of 1,024 bytes, and others on the way to it.
+std::vector<ZipEntry> deepEntries() {
+    return {zipFile("Atlas.app/" + nested(506) + "xx", "deepest"),
+            zipFile("Atlas.app/" + nested(480) + "e/x", "deep"),
+            zipFile("Atlas.app/" + nested(40) + "f/g/x", "40"),
+            zipFile("Atlas.app/" + nested(40) + "h", "beside")};
+}
+
+class PackageDepthTest : public PackageFixture {
+  protected:
+    void expectAllUnpacked() {
+        for (const ZipEntry& entry : deepEntries()) {
+            EXPECT_EQ(read("target/" + entry.name), entry.contents) << entry.name.size();
+        }
+    }
+
+    /// In a process of its own, as the limit stays.
+    [[noreturn]] void unpackWithFewFilesOpen() {
+        Result<PackageReader> package = open(atlasWith(deepEntries()));
+        makeDirectory("target");
+        const rlimit limit = {.rlim_cur = 64, .rlim_max = 64};
+        ::setrlimit(RLIMIT_NOFILE, &limit);
+        ::_exit(package->unpackInto(openDirectory("target").get()).ok() ? 0 : 1);
+    }
+};
+
+TEST_F(PackageDepthTest, isBoundedByTheLengthOfNamesAlone) {
+    ASSERT_EQ(deepEntries().front().name.size(), 1024U);
+    const Status status = unpack(atlasWith(deepEntries()));
+    ASSERT_TRUE(status.ok()) << status.error().description();
+    expectAllUnpacked();
+}
+
+TEST_F(PackageDepthTest, needsFewOpenFiles) {
+    EXPECT_EXIT(unpackWithFewFilesOpen(), ::testing::ExitedWithCode(0), "");
+    expectAllUnpacked();
+}
+
+TEST_F(PackageDepthTest, aLinkThatStandsThereDeepDownIsNotFollowed) {
+    const std::string middle = "Atlas.app/" + nested(200);
+    makeDirectory("elsewhere");
+    Result<PackageReader> package = open(atlasWith(deepEntries()));
+    makeDirectory("target");
+    PackageUnpackOptions options;
+    // After the deepest file the way back up has been closed; somebody puts a link into it.
+    options.fileWritten = [&](int) {
+        const std::string place = path("target/" + middle);
+        if (!std::filesystem::exists(place)) return Status();
+        const std::string link = place.substr(0, place.size() - 1);
+        if (std::filesystem::is_symlink(link)) return Status();
+        std::filesystem::rename(link, path("moved"));
+        std::filesystem::create_symlink(path("elsewhere"), link);
+        return Status();
+    };
+    EXPECT_FALSE(package->unpackInto(openDirectory("target").get(), options).ok());
+    EXPECT_TRUE(list("elsewhere").empty());
+}
+
 class PackageFailingWriteTest : public PackageFixture {
   protected:
     /// In a process of its own, as the limit stays: whether unpacking fails as it should.
