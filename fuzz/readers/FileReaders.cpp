@@ -2,6 +2,7 @@
 
 #include <algorithm>
 #include <array>
+#include <cmath>
 #include <compare>
 #include <cstdint>
 #include <filesystem>
@@ -26,6 +27,22 @@ namespace {
 constexpr std::uint64_t kMostUnpacked = std::uint64_t{1} << 20U;
 constexpr std::uint64_t kMostEntries = 100;
 
+/// The value with its dates rounded down to the second, as XML has them.
+PropertyList inWholeSeconds(const PropertyList& value) {
+    if (const auto date = value.asDate()) {
+        return PropertyList::Date{std::floor(date->secondsSince2001)};
+    }
+    if (value.isArray()) {
+        PropertyList array = PropertyList::array();
+        for (const PropertyList& element : value.elements()) array.append(inWholeSeconds(element));
+        return array;
+    }
+    if (!value.isMap()) return value;
+    PropertyList map = PropertyList::map();
+    for (const auto& [key, inner] : value.entries()) map.set(key, inWholeSeconds(inner));
+    return map;
+}
+
 /// In binary always; in XML when XML can carry it.
 bool isReadBackEqual(const PropertyList& value) {
     SystemPropertyLists codec;
@@ -36,7 +53,7 @@ bool isReadBackEqual(const PropertyList& value) {
     const auto xml = codec.serialize(value, PropertyListFormat::Xml);
     if (!xml) return true;
     const auto fromXml = codec.parse(*xml);
-    return fromXml.ok() && *fromXml == value;
+    return fromXml.ok() && *fromXml == inWholeSeconds(value);
 }
 
 Reading readList(const Result<PropertyList>& value, std::string_view placeKey) {

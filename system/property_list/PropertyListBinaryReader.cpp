@@ -3,6 +3,7 @@
 #include <algorithm>
 #include <array>
 #include <bit>
+#include <cmath>
 #include <cstring>
 #include <memory>
 #include <string>
@@ -201,7 +202,11 @@ class BinaryReader {
     bool readDate(std::size_t at, PropertyList& value) {
         if (!checkSize(at + 1, 8)) return false;
         const std::uint64_t bits = bigEndian(bytes_.data() + at + 1, 8);
-        value = PropertyList::Date{std::bit_cast<double>(bits)};
+        const auto seconds = std::bit_cast<double>(bits);
+        if (!std::isfinite(seconds)) {
+            return refuse(at, "expected a date, found one that is no point in time");
+        }
+        value = PropertyList::Date{seconds};
         return true;
     }
 

@@ -2,6 +2,7 @@
 
 #include <array>
 #include <bit>
+#include <cmath>
 #include <optional>
 #include <string_view>
 #include <utility>
@@ -141,8 +142,7 @@ class BinaryWriter {
             case Kind::Real:
                 return writeReal(*value.asReal()), true;
             case Kind::Date:
-                putByte(kBinaryDate);
-                return putBits(value.asDate()->secondsSince2001), true;
+                return writeDate(value.asDate()->secondsSince2001);
             case Kind::Data:
                 putMarker(kBinaryData, value.asData()->size());
                 return putBytes(*value.asData()), true;
@@ -173,6 +173,15 @@ class BinaryWriter {
         const std::size_t width = widthOf(value);
         putByte(static_cast<std::uint8_t>(kBinaryInteger | exponentOf(width)));
         putNumber(value, width);
+    }
+
+    bool writeDate(double seconds) {
+        if (!std::isfinite(seconds)) {
+            problem_ = kNoTime;
+            return false;
+        }
+        putByte(kBinaryDate);
+        return putBits(seconds), true;
     }
 
     void writeReal(double value) {

@@ -26,6 +26,9 @@ enum class PropertyListErrorCode { Unreadable = 1, Unwritable = 2 };
 [[nodiscard]] ErrorRecord writeError(const PropertyList& root, const void* part,
                                      std::string_view problem);
 
+/// Why neither encoding carries a date that is not finite.
+inline constexpr std::string_view kNoTime = "the date is no point in time; remove it";
+
 [[nodiscard]] ErrorRecord outOfMemoryError(PropertyListErrorCode code);
 
 }  // namespace appsync

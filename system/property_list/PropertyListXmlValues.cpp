@@ -171,7 +171,6 @@ class DateReader {
         const int minute = number(2, 59);
         expect(':');
         const int second = number(2, 59);
-        const double decimals = readDecimals();
         expect('Z');
         if (at_ != text_.size()) wrong_ = true;
         const auto date = std::chrono::year(year) / month / day;
@@ -179,7 +178,7 @@ class DateReader {
         if (wrong_) return {std::nullopt, offset()};
         const Seconds whole = (Days(date) - kEpochDay) + std::chrono::hours(hour) +
                               std::chrono::minutes(minute) + Seconds(second);
-        return {PropertyList::Date{static_cast<double>(whole.count()) + decimals}, 0};
+        return {PropertyList::Date{static_cast<double>(whole.count())}, 0};
     }
 
   private:
@@ -208,17 +207,6 @@ class DateReader {
         }
     }
 
-    /// A point and what follows it, as a number below 1; 0 when there is none.
-    double readDecimals() {
-        if (wrong_ || next() != '.') return 0;
-        const std::size_t begin = at_++;
-        while (isDigit(next())) ++at_;
-        if (at_ == begin + 1) return wrong_ = true, 0;
-        double value = 0;
-        std::from_chars(text_.data() + begin, text_.data() + at_, value);
-        return value;
-    }
-
     std::string_view text_;
     std::string_view whole_;
     std::size_t at_ = 0;
@@ -231,16 +219,7 @@ void appendDigits(std::int64_t value, std::size_t width, std::string& text) {
     text += digits;
 }
 
-/// ".25" for 0.25, nothing for 0: the shortest that reads as the same number.
-std::string decimalsOf(double part) {
-    if (part == 0) return "";
-    std::array<char, 1100> text{};  // no double has more decimals
-    const auto result =
-        std::to_chars(text.data(), text.data() + text.size(), part, std::chars_format::fixed);
-    return {text.data() + 1, result.ptr};
-}
-
-std::string spelled(Seconds sinceEpoch, double part) {
+std::string spelled(Seconds sinceEpoch) {
     const auto time = kEpochDay + sinceEpoch;
     const auto day = std::chrono::floor<std::chrono::days>(time);
     const std::chrono::year_month_day date(day);
@@ -252,7 +231,7 @@ std::string spelled(Seconds sinceEpoch, double part) {
     appendDigits(clock.hours().count(), 2, text += 'T');
     appendDigits(clock.minutes().count(), 2, text += ':');
     appendDigits(clock.seconds().count(), 2, text += ':');
-    return text + decimalsOf(part) + "Z";
+    return text + "Z";
 }
 
 }  // namespace
@@ -264,10 +243,7 @@ std::optional<std::string> dateToXml(PropertyList::Date date) {
     constexpr auto end = static_cast<double>(Seconds(kDayAfterLast - kEpochDay).count());
     const double seconds = date.secondsSince2001;
     if (!(seconds >= first && seconds < end)) return std::nullopt;  // what is not a number neither
-    const double whole = std::floor(seconds);
-    const double part = seconds - whole;
-    if (part >= 1 || whole + part != seconds) return std::nullopt;
-    return spelled(Seconds(static_cast<std::int64_t>(whole)), part);
+    return spelled(Seconds(static_cast<std::int64_t>(std::floor(seconds))));
 }
 
 namespace {

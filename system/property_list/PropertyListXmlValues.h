@@ -41,11 +41,12 @@ struct XmlValue {
 /// The shortest text that reads as the same number: "0.1", "inf", "-inf", "nan".
 [[nodiscard]] std::string realToXml(double value);
 
-/// "YYYY-MM-DDTHH:MM:SSZ" in the Gregorian calendar, years 0001 to 9999, "SS" with decimals or not.
+/// "YYYY-MM-DDTHH:MM:SSZ" in the Gregorian calendar, years 0001 to 9999. A fraction of a second is
+/// refused: no writer of the format has one, and it could not be written back.
 [[nodiscard]] XmlValue<PropertyList::Date> dateFromXml(std::string_view text);
 
-/// The date with as many decimals of a second as it has, none for whole seconds; nothing when the
-/// year is not in 0001 to 9999 or the text could not be read back as the same date.
+/// The date, rounded down to the second, as the format has no fractions; nothing when the year is
+/// not in 0001 to 9999.
 [[nodiscard]] std::optional<std::string> dateToXml(PropertyList::Date date);
 
 /// Base64 with padding, white space anywhere.

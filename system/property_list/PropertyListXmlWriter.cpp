@@ -1,5 +1,6 @@
 #include "system/property_list/PropertyListXmlWriter.h"
 
+#include <cmath>
 #include <string>
 #include <string_view>
 
@@ -71,10 +72,12 @@ class XmlWriter {
 
     bool writeDate(const PropertyList& value, std::size_t depth) {
         const auto spelled = dateToXml(*value.asDate());
+        if (!std::isfinite(value.asDate()->secondsSince2001)) {
+            return refuse(&value, std::string(kNoTime));
+        }
         if (!spelled) {
-            return refuse(&value,
-                          "XML cannot carry this date exactly (years 0001 to 9999 only); write it "
-                          "as binary");
+            return refuse(
+                &value, "XML cannot carry this date (years 0001 to 9999 only); write it as binary");
         }
         return element("date", *spelled, depth), true;
     }

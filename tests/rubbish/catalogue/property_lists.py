@@ -72,6 +72,7 @@ XML = [
     xml("base64 of two megabytes", plist("<data>" + "QUJD" * 500_000 + "</data>"), "", 0),
     xml("date without a day", plist("<date>2024-01</date>"), "date"),
     xml("date that is none", plist("<date>2024-02-30T00:00:00Z</date>"), "date"),
+    xml("date with a fraction", plist("<date>2024-02-29T12:30:09.25Z</date>"), "expected a date"),
     xml("date with letters", plist("<date>now</date>"), "date"),
     xml("date of a far year", plist("<date>99999999999-01-01T00:00:00Z</date>"), "date"),
     xml("integer of 65 bits", plist("<integer>18446744073709551616</integer>"), "integer"),
@@ -128,7 +129,7 @@ GOOD = binary_list([INTEGER])
 
 BINARY = [
     binary("magic only", b"bplist00", "offset"),
-    binary("other version", binary_list([INTEGER], magic=b"bplist15"), "offset"),
+    binary("other version", binary_list([INTEGER], magic=b"bplist99"), "offset"),
     binary("trailer cut off", GOOD[:-1], "offset"),
     binary("trailer alone", b"bplist00" + GOOD[-32:], "offset"),
     binary("an array in itself", binary_list([array_of(0)]), "itself"),
@@ -165,7 +166,10 @@ BINARY = [
     binary("integer of 32 bytes", binary_list([b"\x15" + bytes(32)]), "offset"),
     binary("integer of 128 bits", binary_list([b"\x14\1" + bytes(15)]), "offset"),
     binary("real of one byte", binary_list([b"\x20\0"]), "offset"),
-    binary("date that is not a number", binary_list([b"\x33\x7f\xf8" + bytes(6)]), "", 0),
+    *[binary("date that is " + name, binary_list([b"\x33" + bits + bytes(6)]), "offset 8: expected a date")
+      for name, bits in (("not a number", b"\x7f\xf8"), ("not a number, negative", b"\xff\xf8"),
+                         ("infinite", b"\x7f\xf0"), ("infinitely long ago", b"\xff\xf0"))],
+    binary("date in a far year", binary_list([b"\x33" + struct.pack(">d", 1e300)]), "", 0),
     binary("text that is not ASCII", binary_list([text(b"\xff\xfe")]), "offset"),
     binary("half a pair of UTF-16", binary_list([b"\x61\xd8\0"]), "offset"),
     binary("key that is no text", binary_list([map_of([1], [1]), INTEGER]), "offset"),
@@ -189,6 +193,10 @@ ENTRIES = XML + BINARY + [
     Entry("500 GiB of nothing", lambda place: (place.device.mkdir(), (place.device / "big").touch(),
                                                os.truncate(place.device / "big", 500 << 30))[3:] or None,
           ("plist", "show", "{device}/big"), 1, "too large", device=None),
+    Entry("binary date in a far year, converted",
+          lambda place: binary_list([b"\x33" + struct.pack(">d", 1e300)]),
+          ("plist", "convert", "{input}", "--to", "xml", "--out", "{out}"), 1,
+          "XML cannot carry this date (years 0001 to 9999 only); write it as binary"),
     Entry("converted in its own place while damaged", lambda place: b"<plist>",
           ("plist", "convert", "{input}", "--to", "binary", "--out", "{input}"), 1, "line 1", device=None),
 ]

@@ -8,6 +8,7 @@ namespace appsync {
 namespace {
 
 using namespace std::string_literals;
+using namespace std::string_view_literals;
 
 std::string problem(const Bytes& bytes) {
     const std::string all = refusal(bytes);
@@ -146,8 +147,33 @@ TEST(BinaryPropertyListReader, RefusesTheGreatestReferenceAsAKey) {
 }
 
 TEST(BinaryPropertyListReader, RefusesOtherVersions) {
-    EXPECT_EQ(refusal("bplist15xxxxxxxxxxxxxxxxxxxxxxxxxxxxxxxxxxxxxxxxxxx"),
+    EXPECT_EQ(refusal("bplist99xxxxxxxxxxxxxxxxxxxxxxxxxxxxxxxxxxxxxxxxxxx"),
               "binary property list, offset 6: expected version 0 ('bplist00')");
+}
+
+TEST(BinaryPropertyListReader, KeepsFractionsOfTheSecondsOfDates) {
+    for (const double seconds : {730000000.25, 0.1, 1e-7, -0.3}) {
+        const PropertyList date = PropertyList::Date{seconds};
+        EXPECT_EQ(roundTrip(date, PropertyListFormat::Binary), date) << seconds;
+    }
+}
+
+TEST(BinaryPropertyListReader, RefusesDatesThatAreNoPointInTime) {
+    for (const std::string_view bits : {"\x7f\xf8"sv, "\xff\xf8"sv, "\x7f\xf0"sv, "\xff\xf0"sv}) {
+        EXPECT_EQ(problem(single("\x33" + std::string(bits) + std::string(6, '\0'))),
+                  "offset 8: expected a date, found one that is no point in time");
+    }
+}
+
+TEST(BinaryPropertyListWriter, RefusesDatesThatAreNoPointInTime) {
+    for (const double seconds :
+         {std::numeric_limits<double>::quiet_NaN(), -std::numeric_limits<double>::infinity()}) {
+        const auto result = serialize(PropertyList::array({PropertyList::Date{seconds}}),
+                                      PropertyListFormat::Binary);
+        ASSERT_FALSE(result.ok()) << seconds;
+        EXPECT_EQ(result.error().description(),
+                  "the value at [0]: the date is no point in time; remove it");
+    }
 }
 
 TEST(BinaryPropertyListReader, RefusesObjectsThatAreNoValues) {

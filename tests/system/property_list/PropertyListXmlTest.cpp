@@ -64,17 +64,18 @@ TEST(XmlPropertyListWriter, RefusesCharactersThatXmlCannotCarry) {
 }
 
 TEST(XmlPropertyListWriter, RefusesDatesThatXmlCannotCarry) {
-    const double nan = std::numeric_limits<double>::quiet_NaN();
-    for (const double seconds : {-63113904001.0, 252423993600.0, 1e300, nan, -0.3}) {
+    for (const double seconds : {-63113904001.0, -63113904000.5, 252423993600.0, 1e300}) {
         const PropertyList date = PropertyList::Date{seconds};
         const auto result = serialize(date, PropertyListFormat::Xml);
         ASSERT_FALSE(result.ok()) << seconds;
-        EXPECT_NE(result.error().description().find("write it as binary"), std::string::npos);
+        EXPECT_EQ(result.error().description(),
+                  "the outermost value: XML cannot carry this date (years 0001 to 9999 only); "
+                  "write it as binary");
         EXPECT_EQ(roundTrip(date, PropertyListFormat::Binary), date);
     }
 }
 
-TEST(XmlPropertyListDates, AreWrittenInUtcWithFractionsOnlyWhenThereAreAny) {
+TEST(XmlPropertyListDates, AreWrittenInUtcRoundedDownToTheSecond) {
     const auto spelled = [](double seconds) {
         const std::string text = written(PropertyList::Date{seconds});
         const std::size_t begin = text.find("<date>") + 6;
@@ -83,9 +84,29 @@ TEST(XmlPropertyListDates, AreWrittenInUtcWithFractionsOnlyWhenThereAreAny) {
     EXPECT_EQ(spelled(0), "2001-01-01T00:00:00Z");
     EXPECT_EQ(spelled(-1), "2000-12-31T23:59:59Z");
     EXPECT_EQ(spelled(730902645), "2024-02-29T12:30:45Z");
-    EXPECT_EQ(spelled(730902645.25), "2024-02-29T12:30:45.25Z");
+    EXPECT_EQ(spelled(730902645.25), "2024-02-29T12:30:45Z");
+    EXPECT_EQ(spelled(730902645.999999), "2024-02-29T12:30:45Z");
+    EXPECT_EQ(spelled(-0.25), "2000-12-31T23:59:59Z");
     EXPECT_EQ(spelled(-63113904000.0), "0001-01-01T00:00:00Z");
     EXPECT_EQ(spelled(252423993599.0), "9999-12-31T23:59:59Z");
+    EXPECT_EQ(spelled(252423993599.75), "9999-12-31T23:59:59Z");
+}
+
+TEST(XmlPropertyListDates, ThatWereReadAreWrittenBackAsTheyWere) {
+    for (const char* date : {"0001-01-01T00:00:00Z", "1900-02-28T23:59:59Z", "2000-02-29T00:00:01Z",
+                             "2009-02-13T23:31:09Z", "9999-12-31T23:59:59Z"}) {
+        const std::string element = "<date>" + std::string(date) + "</date>";
+        EXPECT_NE(written(content(element)).find(element), std::string::npos) << date;
+    }
+}
+
+TEST(XmlPropertyListDates, ThatAreNoPointInTimeAreNotWritten) {
+    for (const double seconds :
+         {std::numeric_limits<double>::quiet_NaN(), std::numeric_limits<double>::infinity()}) {
+        const auto result = serialize(PropertyList::Date{seconds}, PropertyListFormat::Xml);
+        ASSERT_FALSE(result.ok()) << seconds;
+        EXPECT_NE(result.error().description().find("no point in time"), std::string::npos);
+    }
 }
 
 TEST(XmlPropertyListDates, AreReadStrictly) {
@@ -95,7 +116,8 @@ TEST(XmlPropertyListDates, AreReadStrictly) {
          {"2001-02-29T00:00:00Z", "2001-13-01T00:00:00Z", "2001-00-01T00:00:00Z",
           "2001-01-01T24:00:00Z", "2001-01-01T00:60:00Z", "2001-01-01T00:00:60Z",
           "0000-01-01T00:00:00Z", "2001-01-01T00:00:00", "2001-01-01 00:00:00Z", "2001-01-01",
-          "01-01-01T00:00:00Z", "2001-01-01T00:00:00.Z", "2001-01-01T00:00:00+0", "", "x"}) {
+          "01-01-01T00:00:00Z", "2001-01-01T00:00:00.Z", "2001-01-01T00:00:09.25Z",
+          "2001-01-01T00:00:00+0", "", "x"}) {
         EXPECT_NE(problem("<date>" + bad + "</date>").find("expected a date"), std::string::npos)
             << bad;
     }
