@@ -1,4 +1,4 @@
-#include "device/package/ArchiveWriter.h"
+#include "device/archive/ArchiveWriter.h"
 
 #include <fcntl.h>
 #include <sys/stat.h>
@@ -11,8 +11,8 @@
 #include <filesystem>
 #include <memory>
 
-#include "device/package/PackageError.h"
-#include "device/package/PackageFolder.h"
+#include "device/archive/PackageError.h"
+#include "device/archive/PackageFolder.h"
 #include "system/PosixError.h"
 #include "system/UniqueFd.h"
 

@@ -1,11 +1,11 @@
-#include "device/package/PackageArchive.h"
+#include "device/archive/PackageArchive.h"
 
 #include <algorithm>
 #include <utility>
 
-#include "device/package/PackageArchiveContents.h"
-#include "device/package/PackageArchiveDirectory.h"
-#include "device/package/PackageError.h"
+#include "device/archive/PackageArchiveContents.h"
+#include "device/archive/PackageArchiveDirectory.h"
+#include "device/archive/PackageError.h"
 #include "device/values/PackageText.h"
 
 namespace appsync {

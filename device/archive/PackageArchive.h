@@ -1,5 +1,14 @@
 #pragma once
 
+// device/archive: zip archives, all of them foreign. Read in this order: PackageFile.h (the bytes),
+// PackageArchiveEnd.h (where the list of entries is), PackageArchiveDirectory.h (the list, held
+// against the headers before the contents, PackageArchiveHeaders.h), PackageEntries.h (names,
+// kinds, the tree), PackageArchive.h (all of it), PackageArchiveContents.h (what is in a file).
+// PackageLimits.h says what an archive may claim, PackageError.h why one is refused. Written by
+// ArchiveWriter.h, with libzip, from what PackageFolder.h finds.
+//
+// Includes device/values, system/, libzip and zlib. Called by device/package.
+
 #include <cstddef>
 #include <cstdint>
 #include <functional>
@@ -9,9 +18,9 @@
 #include <string_view>
 #include <vector>
 
-#include "device/package/PackageEntries.h"
-#include "device/package/PackageFile.h"
-#include "device/package/PackageLimits.h"
+#include "device/archive/PackageEntries.h"
+#include "device/archive/PackageFile.h"
+#include "device/archive/PackageLimits.h"
 #include "platform/Bytes.h"
 #include "platform/Result.h"
 

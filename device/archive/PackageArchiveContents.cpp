@@ -1,4 +1,4 @@
-#include "device/package/PackageArchiveContents.h"
+#include "device/archive/PackageArchiveContents.h"
 
 #include <zlib.h>
 
@@ -7,9 +7,9 @@
 #include <string>
 #include <string_view>
 
-#include "device/package/PackageEntries.h"
-#include "device/package/PackageError.h"
-#include "device/package/PackageFile.h"
+#include "device/archive/PackageEntries.h"
+#include "device/archive/PackageError.h"
+#include "device/archive/PackageFile.h"
 #include "system/PosixError.h"
 
 namespace appsync {

@@ -1,4 +1,4 @@
-#include "device/package/PackageArchiveDirectory.h"
+#include "device/archive/PackageArchiveDirectory.h"
 
 #include <algorithm>
 #include <array>
@@ -10,11 +10,11 @@
 #include <string_view>
 #include <utility>
 
-#include "device/package/PackageArchiveEnd.h"
-#include "device/package/PackageArchiveFormat.h"
-#include "device/package/PackageArchiveHeaders.h"
-#include "device/package/PackageError.h"
-#include "device/package/PackageFile.h"
+#include "device/archive/PackageArchiveEnd.h"
+#include "device/archive/PackageArchiveFormat.h"
+#include "device/archive/PackageArchiveHeaders.h"
+#include "device/archive/PackageError.h"
+#include "device/archive/PackageFile.h"
 #include "device/values/PackageText.h"
 
 namespace appsync {

@@ -2,8 +2,8 @@
 
 #include <vector>
 
-#include "device/package/PackageEntries.h"
-#include "device/package/PackageLimits.h"
+#include "device/archive/PackageEntries.h"
+#include "device/archive/PackageLimits.h"
 #include "platform/Bytes.h"
 #include "platform/Result.h"
 

@@ -1,13 +1,13 @@
-#include "device/package/PackageArchiveEnd.h"
+#include "device/archive/PackageArchiveEnd.h"
 
 #include <algorithm>
 #include <cstddef>
 #include <optional>
 #include <string>
 
-#include "device/package/PackageArchiveFormat.h"
-#include "device/package/PackageError.h"
-#include "device/package/PackageFile.h"
+#include "device/archive/PackageArchiveFormat.h"
+#include "device/archive/PackageError.h"
+#include "device/archive/PackageFile.h"
 #include "platform/Bytes.h"
 
 namespace appsync {

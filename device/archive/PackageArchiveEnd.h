@@ -2,7 +2,7 @@
 
 #include <cstdint>
 
-#include "device/package/PackageLimits.h"
+#include "device/archive/PackageLimits.h"
 #include "platform/Result.h"
 
 namespace appsync {

@@ -3,7 +3,7 @@
 #include <cstddef>
 #include <cstdint>
 
-#include "device/package/PackageError.h"
+#include "device/archive/PackageError.h"
 #include "platform/Bytes.h"
 
 namespace appsync {

@@ -1,4 +1,4 @@
-#include "device/package/PackageArchiveHeaders.h"
+#include "device/archive/PackageArchiveHeaders.h"
 
 #include <zlib.h>
 
@@ -8,7 +8,7 @@
 #include <span>
 #include <string>
 
-#include "device/package/PackageArchiveFormat.h"
+#include "device/archive/PackageArchiveFormat.h"
 #include "device/values/PackageText.h"
 
 namespace appsync {

@@ -1,12 +1,12 @@
-#include "device/package/PackageEntries.h"
+#include "device/archive/PackageEntries.h"
 
 #include <sys/stat.h>
 
 #include <algorithm>
 #include <cstddef>
 
-#include "device/package/PackageArchiveFormat.h"
-#include "device/package/PackageError.h"
+#include "device/archive/PackageArchiveFormat.h"
+#include "device/archive/PackageError.h"
 #include "device/values/PackageText.h"
 
 namespace appsync {

@@ -5,7 +5,7 @@
 #include <string_view>
 #include <vector>
 
-#include "device/package/PackageLimits.h"
+#include "device/archive/PackageLimits.h"
 #include "platform/Result.h"
 
 namespace appsync {

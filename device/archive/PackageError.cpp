@@ -1,4 +1,4 @@
-#include "device/package/PackageError.h"
+#include "device/archive/PackageError.h"
 
 #include "device/values/PackageText.h"
 

@@ -1,4 +1,4 @@
-#include "device/package/PackageFile.h"
+#include "device/archive/PackageFile.h"
 
 #include <fcntl.h>
 #include <sys/stat.h>
@@ -7,7 +7,7 @@
 #include <cerrno>
 #include <utility>
 
-#include "device/package/PackageError.h"
+#include "device/archive/PackageError.h"
 #include "device/values/PackageText.h"
 #include "system/PosixError.h"
 

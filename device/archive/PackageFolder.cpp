@@ -1,4 +1,4 @@
-#include "device/package/PackageFolder.h"
+#include "device/archive/PackageFolder.h"
 
 #include <sys/stat.h>
 
@@ -8,7 +8,7 @@
 #include <system_error>
 #include <utility>
 
-#include "device/package/PackageEntries.h"
+#include "device/archive/PackageEntries.h"
 #include "device/values/PackageText.h"
 #include "system/PosixError.h"
 

@@ -5,8 +5,8 @@
 #include <string_view>
 #include <vector>
 
-#include "device/package/PackageError.h"
-#include "device/package/PackageLimits.h"
+#include "device/archive/PackageError.h"
+#include "device/archive/PackageLimits.h"
 #include "platform/Result.h"
 
 namespace appsync {

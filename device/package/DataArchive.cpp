@@ -10,13 +10,13 @@
 #include <system_error>
 #include <utility>
 
-#include "device/package/ArchiveWriter.h"
-#include "device/package/PackageArchive.h"
-#include "device/package/PackageEntries.h"
-#include "device/package/PackageError.h"
-#include "device/package/PackageFile.h"
-#include "device/package/PackageFolder.h"
-#include "device/package/PackageLimits.h"
+#include "device/archive/ArchiveWriter.h"
+#include "device/archive/PackageArchive.h"
+#include "device/archive/PackageEntries.h"
+#include "device/archive/PackageError.h"
+#include "device/archive/PackageFile.h"
+#include "device/archive/PackageFolder.h"
+#include "device/archive/PackageLimits.h"
 #include "device/package/PackageUnpacker.h"
 #include "device/values/PackageText.h"
 #include "system/PosixError.h"

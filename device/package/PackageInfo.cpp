@@ -3,7 +3,7 @@
 #include <string>
 #include <utility>
 
-#include "device/package/PackageError.h"
+#include "device/archive/PackageError.h"
 #include "device/values/PackageIdentifier.h"
 #include "device/values/PackageText.h"
 #include "platform/AppRegistry.h"

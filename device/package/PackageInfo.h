@@ -2,7 +2,7 @@
 
 #include <string_view>
 
-#include "device/package/PackageLimits.h"
+#include "device/archive/PackageLimits.h"
 #include "device/package/PackageReader.h"
 #include "platform/PropertyList.h"
 #include "platform/Result.h"

@@ -2,9 +2,9 @@
 
 #include <utility>
 
-#include "device/package/PackageArchive.h"
-#include "device/package/PackageError.h"
-#include "device/package/PackageFile.h"
+#include "device/archive/PackageArchive.h"
+#include "device/archive/PackageError.h"
+#include "device/archive/PackageFile.h"
 #include "device/package/PackageInfo.h"
 #include "device/package/PackageUnpacker.h"
 #include "device/values/PackageText.h"

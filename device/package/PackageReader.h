@@ -1,16 +1,12 @@
 #pragma once
 
-// device/package: archives, all of them foreign. `PackageReader` (this header) opens, checks and
-// unpacks an application's package; `writePackage` makes one (PackageWriter.h); DataArchive.h has
-// the archives of an application's data, which backups hold. Behind the reader: PackageFile.h (the
-// bytes), PackageArchiveEnd.h (what is checked before libzip may allocate), PackageArchive.h
-// (libzip's reader), PackageEntries.h (names, kinds, the tree), PackageInfo.h (Info.plist),
-// PackageUnpacker.h (writing the tree); PackageLimits.h says what a package may claim,
-// PackageError.h why one is refused. Behind the writers: PackageFolder.h (what goes in) and
-// ArchiveWriter.h (libzip's writer).
+// device/package: what an application's package and the archive of its data are. `PackageReader`
+// (this header) opens, checks and unpacks a package; `writePackage` makes one (PackageWriter.h);
+// DataArchive.h has the archives of an application's data, which backups hold. Behind the reader:
+// PackageInfo.h (Info.plist) and PackageUnpacker.h (writing the tree).
 //
-// Includes device/values, system/ and libzip: no database and no device. Called by install and by
-// host/. What reads foreign bytes here is fuzzed (fuzz/readers/).
+// Includes device/archive, device/values and system/: no database and no device. Called by install
+// and by host/. What reads foreign bytes here is fuzzed (fuzz/readers/).
 
 #include <cstdint>
 #include <functional>
@@ -18,7 +14,7 @@
 #include <string>
 #include <string_view>
 
-#include "device/package/PackageLimits.h"
+#include "device/archive/PackageLimits.h"
 #include "platform/Bytes.h"
 #include "platform/PropertyList.h"
 #include "platform/Result.h"

@@ -8,8 +8,8 @@
 #include <cerrno>
 #include <utility>
 
-#include "device/package/PackageArchive.h"
-#include "device/package/PackageError.h"
+#include "device/archive/PackageArchive.h"
+#include "device/archive/PackageError.h"
 #include "system/DescriptorIO.h"
 #include "system/PosixError.h"
 

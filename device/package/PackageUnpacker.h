@@ -5,7 +5,7 @@
 #include <string_view>
 #include <vector>
 
-#include "device/package/PackageEntries.h"
+#include "device/archive/PackageEntries.h"
 #include "device/package/PackageReader.h"
 #include "platform/Bytes.h"
 #include "platform/Result.h"

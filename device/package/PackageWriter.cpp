@@ -12,9 +12,9 @@
 #include <utility>
 #include <vector>
 
-#include "device/package/ArchiveWriter.h"
-#include "device/package/PackageError.h"
-#include "device/package/PackageFolder.h"
+#include "device/archive/ArchiveWriter.h"
+#include "device/archive/PackageError.h"
+#include "device/archive/PackageFolder.h"
 #include "device/values/PackageText.h"
 #include "system/PosixError.h"
 #include "system/UniqueFd.h"

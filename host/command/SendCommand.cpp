@@ -26,9 +26,9 @@
 #include "host/session/Parcels.h"
 #include "host/session/PlugIn.h"
 #include "host/session/Session.h"
-#include "host/session/SessionFacts.h"
 #include "host/session/StopSignals.h"
 #include "host/session/SyncOutcome.h"
+#include "host/watch/SessionFacts.h"
 
 namespace appsync {
 namespace {

@@ -20,10 +20,10 @@
 #include "host/session/Interruption.h"
 #include "host/session/PlugIn.h"
 #include "host/session/Session.h"
-#include "host/session/SessionFacts.h"
-#include "host/session/SessionWatch.h"
 #include "host/session/StopSignals.h"
 #include "host/session/SyncOutcome.h"
+#include "host/watch/SessionFacts.h"
+#include "host/watch/SessionWatch.h"
 
 namespace appsync {
 namespace {

@@ -3,7 +3,7 @@
 #include <string>
 
 #include "host/plan/SyncPlan.h"
-#include "host/session/SyncEvents.h"
+#include "host/watch/SyncEvents.h"
 
 namespace appsync {
 

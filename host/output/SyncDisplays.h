@@ -12,7 +12,7 @@
 #include <string>
 #include <vector>
 
-#include "host/session/SyncEvents.h"
+#include "host/watch/SyncEvents.h"
 
 namespace appsync {
 

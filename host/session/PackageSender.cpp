@@ -13,7 +13,7 @@
 #include "device/Device.h"
 #include "host/file/HostFile.h"
 #include "host/plan/TransferError.h"
-#include "host/session/SyncDaemon.h"
+#include "host/watch/SyncDaemon.h"
 #include "platform/FileSystem.h"
 #include "system/DescriptorIO.h"
 #include "system/RootDirectory.h"

@@ -10,7 +10,7 @@
 #include "device/Device.h"
 #include "host/console/Problem.h"
 #include "host/file/HostFile.h"
-#include "host/session/SessionWatch.h"
+#include "host/watch/SessionWatch.h"
 #include "platform/Notifications.h"
 #include "system/JsonLogFacility.h"
 

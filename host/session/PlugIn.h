@@ -2,7 +2,7 @@
 
 #include <memory>
 
-#include "host/session/SyncDaemon.h"
+#include "host/watch/SyncDaemon.h"
 #include "platform/Platform.h"
 #include "platform/Result.h"
 

@@ -2,17 +2,15 @@
 
 // host/session: the desktop host's and the sync daemon's side of one session with the plug-in.
 //
-//     Session.h         the order of calls; sends with PackageSender.h what TransferQueue.h holds
-//     PlugIn.h          loads the plug-in on a device, for the daemon that SyncDaemon.h plays
-//     SessionWatch.h    stands between plug-in and device (with WatchedCoordination.h), sees what
-//                       becomes of each application, keeps SessionFacts.h, tells SyncEvents.h
+//     Session.h         the order of calls; sends with PackageSender.h
+//     PlugIn.h          loads the plug-in on a device
 //     SyncOutcome.h     holds plan, facts and device against each other: what failed, and why
 //     StopSignals.h     Ctrl-C; Interruption.h is what is said then
 //     Parcels.h, AppStore.h, Inventory.h    what `send`, `store` and `inventory` are about
 //
-// What is to be done comes from host/plan, where nothing runs; how it is shown is for host/output,
-// which implements SyncDisplay. Called by the commands and by host/backup (a restore is a session
-// too).
+// What is to be done comes from host/plan, where nothing runs; what becomes of it is seen by
+// host/watch, which includes nothing of this; how it is shown is for host/output. Called by the
+// commands and by host/backup (a restore is a session too).
 
 #include <atomic>
 #include <cstdint>

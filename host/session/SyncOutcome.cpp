@@ -15,7 +15,7 @@
 #include "host/plan/SyncPlan.h"
 #include "host/session/Interruption.h"
 #include "host/session/Session.h"
-#include "host/session/SessionFacts.h"
+#include "host/watch/SessionFacts.h"
 
 namespace appsync {
 namespace {

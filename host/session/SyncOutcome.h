@@ -5,7 +5,7 @@
 #include <vector>
 
 #include "device/values/DeviceRecords.h"
-#include "host/session/SyncEvents.h"
+#include "host/watch/SyncEvents.h"
 #include "platform/Result.h"
 
 namespace appsync {

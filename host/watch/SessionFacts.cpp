@@ -1,4 +1,4 @@
-#include "host/session/SessionFacts.h"
+#include "host/watch/SessionFacts.h"
 
 namespace appsync {
 

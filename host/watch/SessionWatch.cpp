@@ -1,14 +1,14 @@
-#include "host/session/SessionWatch.h"
+#include "host/watch/SessionWatch.h"
 
 #include <chrono>
 #include <utility>
 
 #include "device/Device.h"
 #include "host/plan/TransferError.h"
-#include "host/session/SessionFacts.h"
-#include "host/session/SyncDaemon.h"
-#include "host/session/SyncEvents.h"
-#include "host/session/WatchedCoordination.h"
+#include "host/watch/SessionFacts.h"
+#include "host/watch/SyncDaemon.h"
+#include "host/watch/SyncEvents.h"
+#include "host/watch/WatchedCoordination.h"
 #include "platform/Platform.h"
 #include "platform/PropertyList.h"
 

@@ -1,5 +1,17 @@
 #pragma once
 
+// host/watch: what stands between the plug-in and the device in a session, and sees what becomes of
+// each application.
+//
+//     SessionWatch.h    the plug-in's calls, with WatchedCoordination.h those of the coordination
+//                       service; keeps what it sees as SessionFacts.h and tells SyncEvents.h
+//     SyncEvents.h      one order for the events of all threads; a SyncDisplay shows them
+//     SyncDaemon.h      the daemon that the plug-in is told of; TransferQueue.h is what it has
+//     still
+//                       to send
+//
+// Includes host/plan and the device. host/session drives, host/output implements SyncDisplay.
+
 #include <atomic>
 #include <chrono>
 #include <condition_variable>

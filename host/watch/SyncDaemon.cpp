@@ -1,4 +1,4 @@
-#include "host/session/SyncDaemon.h"
+#include "host/watch/SyncDaemon.h"
 
 #include <algorithm>
 #include <array>

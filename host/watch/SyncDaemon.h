@@ -3,7 +3,7 @@
 #include <string>
 #include <string_view>
 
-#include "host/session/TransferQueue.h"
+#include "host/watch/TransferQueue.h"
 #include "platform/SyncHost.h"
 
 namespace appsync {

@@ -1,4 +1,4 @@
-#include "host/session/SyncEvents.h"
+#include "host/watch/SyncEvents.h"
 
 #include <algorithm>
 #include <thread>

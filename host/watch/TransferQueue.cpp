@@ -1,9 +1,9 @@
-#include "host/session/TransferQueue.h"
+#include "host/watch/TransferQueue.h"
 
 #include <algorithm>
 
 #include "host/plan/TransferError.h"
-#include "host/session/SyncDaemon.h"
+#include "host/watch/SyncDaemon.h"
 #include "platform/Error.h"
 
 namespace appsync {

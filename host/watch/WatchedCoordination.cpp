@@ -1,9 +1,9 @@
-#include "host/session/WatchedCoordination.h"
+#include "host/watch/WatchedCoordination.h"
 
 #include <map>
 #include <utility>
 
-#include "host/session/SessionWatch.h"
+#include "host/watch/SessionWatch.h"
 #include "platform/InstallCoordinator.h"
 
 namespace appsync {

@@ -7,8 +7,8 @@
 #include <string>
 #include <string_view>
 
-#include "device/package/ArchiveWriter.h"
-#include "device/package/PackageFolder.h"
+#include "device/archive/ArchiveWriter.h"
+#include "device/archive/PackageFolder.h"
 #include "device/package/PackageWriter.h"
 #include "device/screen/IconCanvas.h"
 #include "fuzz/readers/ScratchDirectory.h"

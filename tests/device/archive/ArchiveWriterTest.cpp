@@ -1,4 +1,4 @@
-#include "device/package/ArchiveWriter.h"
+#include "device/archive/ArchiveWriter.h"
 
 #include <fcntl.h>
 #include <gtest/gtest.h>
@@ -8,8 +8,8 @@
 #include <fstream>
 #include <iterator>
 
+#include "device/archive/PackageFolder.h"
 #include "device/package/DataArchive.h"
-#include "device/package/PackageFolder.h"
 #include "system/UniqueFd.h"
 #include "tests/contract/TemporaryMachineDirectory.h"
 

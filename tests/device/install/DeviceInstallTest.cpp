@@ -5,7 +5,7 @@
 #include <filesystem>
 #include <thread>
 
-#include "device/package/PackageError.h"
+#include "device/archive/PackageError.h"
 #include "tests/device/DeviceFixture.h"
 #include "tests/device/package/PackageZip.h"
 

@@ -9,7 +9,7 @@
 #include <fstream>
 #include <iterator>
 
-#include "device/package/PackageError.h"
+#include "device/archive/PackageError.h"
 #include "system/RootDirectory.h"
 #include "tests/contract/TemporaryMachineDirectory.h"
 #include "tests/device/package/PackageZip.h"

@@ -7,7 +7,7 @@
 #include <string_view>
 #include <vector>
 
-#include "device/package/PackageError.h"
+#include "device/archive/PackageError.h"
 #include "device/package/PackageReader.h"
 #include "platform/PropertyListSerialization.h"
 #include "system/UniqueFd.h"

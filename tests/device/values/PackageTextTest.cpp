@@ -4,7 +4,7 @@
 
 #include <string>
 
-#include "device/package/PackageError.h"
+#include "device/archive/PackageError.h"
 
 namespace appsync {
 

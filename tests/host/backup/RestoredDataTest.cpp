@@ -4,8 +4,8 @@
 
 #include <filesystem>
 
-#include "device/package/ArchiveWriter.h"
-#include "device/package/PackageFolder.h"
+#include "device/archive/ArchiveWriter.h"
+#include "device/archive/PackageFolder.h"
 #include "tests/host/HostFixture.h"
 
 namespace appsync {

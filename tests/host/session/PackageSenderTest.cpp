@@ -8,7 +8,7 @@
 #include <utility>
 
 #include "host/plan/TransferError.h"
-#include "host/session/SyncDaemon.h"
+#include "host/watch/SyncDaemon.h"
 #include "platform/FileSystem.h"
 #include "tests/host/HostFixture.h"
 

@@ -4,7 +4,7 @@
 #include <gtest/gtest.h>
 
 #include "host/plan/SyncPlan.h"
-#include "host/session/SessionFacts.h"
+#include "host/watch/SessionFacts.h"
 
 namespace appsync {
 namespace {

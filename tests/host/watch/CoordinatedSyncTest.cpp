@@ -5,7 +5,7 @@
 #include <thread>
 
 #include "device/database/Database.h"
-#include "host/session/WatchedCoordination.h"
+#include "host/watch/WatchedCoordination.h"
 #include "tests/host/HostFixture.h"
 
 namespace appsync {

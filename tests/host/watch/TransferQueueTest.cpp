@@ -1,4 +1,4 @@
-#include "host/session/TransferQueue.h"
+#include "host/watch/TransferQueue.h"
 
 #include <gmock/gmock.h>
 #include <gtest/gtest.h>
