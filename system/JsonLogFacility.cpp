@@ -1,12 +1,13 @@
 #include "system/JsonLogFacility.h"
 
 #include <array>
+#include <cerrno>
 #include <cstdio>
 #include <ctime>
 #include <utility>
 
 #include "platform/LogRendering.h"
-#include "system/DescriptorIO.h"
+#include "system/PosixError.h"
 
 namespace appsync {
 
@@ -105,10 +106,6 @@ std::string isoTime(std::chrono::system_clock::time_point time) {
     return text.data();
 }
 
-ByteView bytesOf(std::string_view text) {
-    return {reinterpret_cast<const std::uint8_t*>(text.data()), text.size()};
-}
-
 }  // namespace
 
 std::string_view nameOf(LogLevel level) noexcept {
@@ -143,9 +140,8 @@ void JsonLogFacility::write(const LogMessage& message) noexcept {
     try {
         append(message);
     } catch (...) {
-        // Out of memory, or a listener that broke its word: the plug-in is not to hear of either.
         const std::lock_guard guard(mutex_);
-        ++droppedLines_;
+        drop(ENOMEM);
     }
 }
 
@@ -155,16 +151,38 @@ void JsonLogFacility::append(const LogMessage& message) {
     // The time is taken where the order is settled, so that the times in a log never go back.
     const LogLine line{std::chrono::system_clock::now(), message.category, message.level, text,
                        message.format};
-    if (!writeWhole(toJson(line))) ++droppedLines_;
-    if (listener_) listener_(line);
+    const int error = tellLoss() ? file_.append(toJson(line)) : lastError_;
+    if (error != 0) drop(error);
+    tellListener(line);
 }
 
-bool JsonLogFacility::writeWhole(std::string_view text) {
-    std::string line = lineIsCutOff_ ? "\n" : "";
-    line.append(text).append("\n");
-    const WriteOutcome outcome = appsync::writeWhole(file_.get(), bytesOf(line));
-    if (outcome.written > 0) lineIsCutOff_ = outcome.written < line.size();
-    return outcome.error == 0;
+void JsonLogFacility::tellListener(const LogLine& line) const {
+    try {
+        if (listener_) listener_(line);
+    } catch (...) {
+        // It broke its word: the plug-in is not to hear of that.
+        return;
+    }
+}
+
+// Whether the log tells of all that was dropped.
+bool JsonLogFacility::tellLoss() {
+    if (dropped_ == toldDropped_) return true;
+    const std::string text = std::to_string(dropped_ - toldDropped_) +
+                             " messages could not be written: " + posixReason(lastError_);
+    const LogLine line{std::chrono::system_clock::now(), LogCategory::General, LogLevel::Error,
+                       text, "%llu messages could not be written: %s"};
+    if (const int error = file_.append(toJson(line)); error != 0) {
+        lastError_ = error;
+        return false;
+    }
+    toldDropped_ = dropped_;
+    return true;
+}
+
+void JsonLogFacility::drop(int error) {
+    ++dropped_;
+    lastError_ = error;
 }
 
 std::unique_ptr<LogHandle> JsonLogFacility::makeHandle(std::string_view /*subsystem*/,
@@ -177,9 +195,9 @@ void JsonLogFacility::setListener(Listener listener) {
     listener_.swap(listener);
 }
 
-std::uint64_t JsonLogFacility::droppedLines() const {
+JsonLogFacility::Loss JsonLogFacility::loss() const {
     const std::lock_guard guard(mutex_);
-    return droppedLines_;
+    return {dropped_, lastError_ == 0 ? std::string() : posixReason(lastError_)};
 }
 
 }  // namespace appsync

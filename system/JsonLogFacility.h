@@ -9,7 +9,7 @@
 #include <string_view>
 
 #include "platform/LogFacility.h"
-#include "system/UniqueFd.h"
+#include "system/LogFile.h"
 
 namespace appsync {
 
@@ -29,16 +29,15 @@ struct LogLine {
 /// (the number), "level" (the name), "message", "format". Bytes that are not UTF-8 become U+FFFD.
 [[nodiscard]] std::string toJson(const LogLine& line);
 
-/// A log that appends one JSON object a line to a file. Callable on any thread; nothing throws.
-/// Each line is one write, so several processes may share a file that was opened with O_APPEND. A
-/// line that cannot be written is dropped and counted.
+/// A log that appends one JSON object a line to a file, which several processes may share. Callable
+/// on any thread; nothing throws. A message that cannot be written is dropped and counted; before
+/// the next one that can be, the log says how many were, and why.
 class JsonLogFacility : public LogFacility {
   public:
     /// Gets each message, on the thread that logs it, one call at a time. It must not log.
     using Listener = std::function<void(const LogLine& line)>;
 
-    /// Appends to `file`, opened for writing with O_APPEND.
-    explicit JsonLogFacility(UniqueFd file) : file_(std::move(file)) {}
+    explicit JsonLogFacility(LogFile file) : file_(std::move(file)) {}
 
     void write(const LogMessage& message) noexcept override;
     [[nodiscard]] std::unique_ptr<LogHandle> makeHandle(std::string_view subsystem,
@@ -48,19 +47,26 @@ class JsonLogFacility : public LogFacility {
     /// listener is under way when this returns.
     void setListener(Listener listener);
 
-    /// How many messages could not be written.
-    [[nodiscard]] std::uint64_t droppedLines() const;
+    /// Messages that were dropped, and the reason of the last of them.
+    struct Loss {
+        std::uint64_t messages = 0;
+        std::string reason;
+    };
+    [[nodiscard]] Loss loss() const;
 
   private:
     void append(const LogMessage& message);
-    [[nodiscard]] bool writeWhole(std::string_view text);
+    void tellListener(const LogLine& line) const;
+    bool tellLoss();
+    void drop(int error);
 
     mutable std::mutex mutex_;
     // Protected by mutex_.
-    const UniqueFd file_;
+    LogFile file_;
     Listener listener_;
-    std::uint64_t droppedLines_ = 0;
-    bool lineIsCutOff_ = false;  // the last write ended inside a line
+    std::uint64_t dropped_ = 0;
+    std::uint64_t toldDropped_ = 0;  // as many of them as the log tells of
+    int lastError_ = 0;
 };
 
 }  // namespace appsync

@@ -95,7 +95,7 @@ int runBackup(const BackupArguments& arguments, const Console& console) {
     const Result<std::unique_ptr<Device>> device =
         openDevice(arguments.device, DeviceAccess::Session);
     if (!device) return console.fail(device.error());
-    const Result<std::unique_ptr<PlugIn>> plugIn = PlugIn::load(**device);
+    const Result<std::unique_ptr<PlugIn>> plugIn = PlugIn::load(**device, console);
     if (!plugIn) return console.fail(plugIn.error());
     if (const Status good = checkBackupPlace(**device, arguments.backup); !good) {
         return console.fail(good.error());

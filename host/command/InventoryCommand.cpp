@@ -31,7 +31,7 @@ std::string inventoryText(const Inventory& inventory) {
 
 int runInventory(const std::string& device, bool asJson, const Console& console) {
     return lookAt(device, console, [&](Device& opened) -> Status {
-        const Result<std::unique_ptr<PlugIn>> plugIn = PlugIn::load(opened);
+        const Result<std::unique_ptr<PlugIn>> plugIn = PlugIn::load(opened, console);
         if (!plugIn) return plugIn.error();
         const Inventory inventory = inventoryOf((*plugIn)->client());
         if (const auto error = opened.databaseFailure()) return unusable(*error);

@@ -1,14 +1,15 @@
+#include <fcntl.h>
+#include <sys/stat.h>
+#include <unistd.h>
+
 #include <array>
 #include <chrono>
 #include <cstddef>
 #include <cstdint>
-#include <filesystem>
-#include <fstream>
 #include <optional>
 #include <ostream>
 #include <string>
 #include <string_view>
-#include <system_error>
 #include <thread>
 #include <utility>
 #include <variant>
@@ -20,6 +21,8 @@
 #include "host/console/Problem.h"
 #include "host/console/Text.h"
 #include "system/JsonLogFacility.h"
+#include "system/LogFile.h"
+#include "system/UniqueFd.h"
 
 namespace appsync {
 namespace {
@@ -120,7 +123,7 @@ void showLine(const std::string& text, const LogArguments& arguments, const Cons
 class LogLines {
   public:
     LogLines(std::string path, const LogArguments& arguments, const Console& console)
-        : path_(std::move(path)), arguments_(arguments), console_(console) {}
+        : path_(std::move(path)), arguments_(&arguments), console_(&console) {}
 
     void add(std::string_view piece) {
         for (std::size_t end = piece.find('\n'); end != piece.npos; end = piece.find('\n')) {
@@ -140,46 +143,112 @@ class LogLines {
     void endLine() {
         ++number_;
         if (isTooLong_) {
-            console_.complain("line " + std::to_string(number_) + " of " + path_ +
-                              " is left out: it is longer than any that a device writes");
+            console_->complain("line " + std::to_string(number_) + " of " + path_ +
+                               " is left out: it is longer than any that a device writes");
         } else {
-            showLine(begun_, arguments_, console_);
+            showLine(begun_, *arguments_, *console_);
         }
         begun_.clear();
         isTooLong_ = false;
     }
 
-    const std::string path_;
-    const LogArguments& arguments_;
-    const Console& console_;
+    std::string path_;
+    const LogArguments* arguments_;
+    const Console* console_;
     std::string begun_;  // the line that is still being written
     bool isTooLong_ = false;
     std::uint64_t number_ = 0;
 };
 
-// Shows the whole lines that the file has from where the stream stands.
-void showWhatIsThere(std::ifstream& file, LogLines& lines, const Console& console) {
-    std::string piece(kPieceSize, '\0');
-    while (console.out.good() && file.good()) {
-        file.read(piece.data(), static_cast<std::streamsize>(piece.size()));
-        lines.add(std::string_view(piece).substr(0, static_cast<std::size_t>(file.gcount())));
+// One file of the log, as far as it has been read; none where there is no regular file.
+class LogPart {
+  public:
+    LogPart() = default;
+    // A pipe in its place would be waited on.
+    explicit LogPart(const std::string& path)
+        : file_(::open(path.c_str(), O_RDONLY | O_CLOEXEC | O_NONBLOCK)) {
+        const bool isRegular =
+            file_ && ::fstat(file_.get(), &opened_) == 0 && S_ISREG(opened_.st_mode);
+        if (!isRegular) file_.reset();
     }
-    file.clear();
-    console.out.flush();
-}
 
-void follow(const std::string& path, const LogArguments& arguments, const Console& console) {
-    std::ifstream file;
-    LogLines lines(path, arguments, console);
-    std::error_code ignored;
-    do {
-        // A pipe in its place would be waited on.
-        const bool isThere = file.is_open() || std::filesystem::is_regular_file(path, ignored);
-        if (isThere && !file.is_open()) file.open(path, std::ios::binary);
-        if (file.is_open()) showWhatIsThere(file, lines, console);
-        if (arguments.follows) std::this_thread::sleep_for(kFollowInterval);
-    } while (arguments.follows && console.out.good());
-}
+    [[nodiscard]] bool isThere() const { return file_.valid(); }
+    [[nodiscard]] bool isSameAs(const LogPart& other) const {
+        return isThere() && other.isThere() && isSameAs(other.opened_);
+    }
+    [[nodiscard]] bool standsAt(const std::string& path) const {
+        struct stat now {};
+        return isThere() && ::stat(path.c_str(), &now) == 0 && isSameAs(now);
+    }
+    // The next bytes of it; empty where there are none yet.
+    [[nodiscard]] std::string_view read(std::string& buffer) const {
+        if (!isThere()) return {};
+        const ssize_t count = ::read(file_.get(), buffer.data(), buffer.size());
+        return std::string_view(buffer).substr(0, count > 0 ? static_cast<std::size_t>(count) : 0);
+    }
+
+  private:
+    [[nodiscard]] bool isSameAs(const struct stat& other) const {
+        return opened_.st_dev == other.st_dev && opened_.st_ino == other.st_ino;
+    }
+
+    UniqueFd file_;
+    struct stat opened_ {};
+};
+
+// Shows a log: its older part, then what lines are appended to, whichever file that is.
+class LogReader {
+  public:
+    LogReader(std::string path, const LogArguments& arguments, const Console& console)
+        : path_(std::move(path)),
+          arguments_(arguments),
+          console_(console),
+          lines_(path_, arguments, console) {}
+
+    void show() {
+        begin();
+        bool isPutAside = false;
+        while (arguments_.follows && console_.out.good()) {
+            std::this_thread::sleep_for(kFollowInterval);
+            showRest();
+            // Who was writing when it was put aside has had this round to end the line.
+            if (isPutAside) begin();
+            isPutAside = !part_.standsAt(path_);
+        }
+    }
+
+  private:
+    // Shows what of both parts has not been shown.
+    void begin() {
+        LogPart next(path_);  // before the older part, which it may become in between
+        LogPart older(olderPartOf(path_));
+        if (!older.isSameAs(next)) turnTo(std::move(older), olderPartOf(path_));
+        turnTo(std::move(next), path_);
+    }
+
+    void turnTo(LogPart part, const std::string& path) {
+        if (!part.isThere() || part.isSameAs(part_)) return;
+        part_ = std::move(part);
+        lines_ = LogLines(path, arguments_, console_);
+        showRest();
+    }
+
+    void showRest() {
+        std::string_view piece = part_.read(buffer_);
+        while (!piece.empty() && console_.out.good()) {
+            lines_.add(piece);
+            piece = part_.read(buffer_);
+        }
+        console_.out.flush();
+    }
+
+    const std::string path_;
+    const LogArguments& arguments_;
+    const Console& console_;
+    std::string buffer_ = std::string(kPieceSize, '\0');
+    LogPart part_;  // which is being shown
+    LogLines lines_;
+};
 
 }  // namespace
 
@@ -188,7 +257,7 @@ int runLog(const LogArguments& arguments, const Console& console) {
     if (!device) return console.fail(device.error());
     const std::string path = (*device)->logPath();
     device->reset();  // whoever watches the log has no use for the database
-    follow(path, arguments, console);
+    LogReader(path, arguments, console).show();
     return kExitDone;
 }
 

@@ -16,7 +16,7 @@ int runReset(const std::string& device, const Console& console) {
     const Result<std::unique_ptr<Device>> opened =
         openDevice(device, {.access = DeviceAccess::Session, .makesRoom = true});
     if (!opened) return console.fail(opened.error());
-    const Result<std::unique_ptr<PlugIn>> plugIn = PlugIn::load(**opened);
+    const Result<std::unique_ptr<PlugIn>> plugIn = PlugIn::load(**opened, console);
     if (!plugIn) return console.fail(plugIn.error());
     (*plugIn)->client().clearSyncData();
     if (const auto error = (*opened)->databaseFailure()) return console.fail(unusable(*error));

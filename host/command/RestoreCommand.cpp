@@ -73,7 +73,7 @@ int runRestore(const RestoreArguments& arguments, const Console& console) {
     const Result<std::unique_ptr<Device>> device =
         openDevice(arguments.device, DeviceAccess::Session);
     if (!device) return console.fail(device.error());
-    const Result<std::unique_ptr<PlugIn>> plugIn = PlugIn::loadForRestore(**device);
+    const Result<std::unique_ptr<PlugIn>> plugIn = PlugIn::loadForRestore(**device, console);
     if (!plugIn) return console.fail(plugIn.error());
     const Result<RestoreResult> result =
         restoreBackup(arguments.backup, *manifest, arguments.type, **device, **plugIn);

@@ -251,7 +251,7 @@ class Sending {
     }
 
     Result<int> hold() {
-        Result<std::unique_ptr<PlugIn>> plugIn = PlugIn::load(*device_, events_, facts_);
+        Result<std::unique_ptr<PlugIn>> plugIn = PlugIn::load(*device_, events_, facts_, console_);
         if (!plugIn) return plugIn.error();
         Session session(*device_, **plugIn, events_, facts_, signals_.stopRequested());
         const SessionEnd end = holdSession(session);

@@ -48,7 +48,7 @@ int runStore(const std::string& device, const std::string& folder, bool asJson,
     if (!opened) return console.fail(opened.error());
     const Result<Library> library = readLibrary(folder, (*opened)->propertyLists());
     if (!library) return console.fail(library.error());
-    const Result<std::unique_ptr<PlugIn>> plugIn = PlugIn::load(**opened);
+    const Result<std::unique_ptr<PlugIn>> plugIn = PlugIn::load(**opened, console);
     if (!plugIn) return console.fail(plugIn.error());
     const Result<StoreResult> result =
         keepPromises(**opened, *library, (*plugIn)->platform().coordination);

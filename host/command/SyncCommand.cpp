@@ -149,7 +149,7 @@ class SyncRun {
     }
 
     Result<int> hold() {
-        Result<std::unique_ptr<PlugIn>> plugIn = PlugIn::load(*device_, events_, facts_);
+        Result<std::unique_ptr<PlugIn>> plugIn = PlugIn::load(*device_, events_, facts_, console_);
         if (!plugIn) return plugIn.error();
         for (const auto* installs : {&sync_.plan.install, &sync_.plan.update}) {
             for (const PlannedInstall& each : *installs) {

@@ -1,15 +1,13 @@
 #include "host/session/PlugIn.h"
 
-#include <fcntl.h>
-#include <sys/stat.h>
-
-#include <cerrno>
+#include <optional>
+#include <string>
 #include <utility>
 
 #include "client/AppsClient.h"
 #include "device/Device.h"
+#include "host/console/Console.h"
 #include "host/console/Problem.h"
-#include "host/file/HostFile.h"
 #include "host/watch/SessionWatch.h"
 #include "platform/Notifications.h"
 #include "system/JsonLogFacility.h"
@@ -27,7 +25,8 @@ Platform watched(const Platform& platform, SessionWatch& watch) {
 
 }  // namespace
 
-PlugIn::PlugIn(SyncDaemon::Process process) : daemon_(process) {}
+PlugIn::PlugIn(SyncDaemon::Process process, const Console& console)
+    : daemon_(process), console_(console) {}
 
 // The device may be in the middle of telling the client something.
 PlugIn::~PlugIn() {
@@ -38,32 +37,31 @@ PlugIn::~PlugIn() {
     }
     // Or else the client might go on the registry's thread, after what it stands on.
     if (client_ != nullptr) registry_->removeObserver(client_.get());
+    client_.reset();  // its last messages come now
+    tellLogLoss();
 }
 
 Status PlugIn::openLog(Device& device) {
     const std::string path = device.logPath();
-    const std::size_t slash = path.rfind('/');
-    const std::string directory = path.substr(0, slash);
-    ::mkdir(directory.c_str(), 0755);  // it may have been tidied away
-    // Nothing is written outside the device, and a pipe is not waited on.
-    constexpr int kFlags = O_WRONLY | O_APPEND | O_CREAT | O_CLOEXEC | O_NOFOLLOW | O_NONBLOCK;
-    const UniqueFd folder(
-        ::open(directory.c_str(), O_RDONLY | O_DIRECTORY | O_NOFOLLOW | O_CLOEXEC));
-    UniqueFd file;
-    if (folder) file = UniqueFd(::openat(folder.get(), path.c_str() + slash + 1, kFlags, 0644));
+    std::optional<LogFile> file = LogFile::open(path);
     if (!file) {
-        return unusable(systemError(errno, "cannot write the device's log " + path));
-    }
-    struct stat attributes {};
-    if (::fstat(file.get(), &attributes) != 0 || !S_ISREG(attributes.st_mode)) {
         return unusable("the device's log " + path + " is not a regular file", "remove it");
     }
-    log_ = std::make_unique<JsonLogFacility>(std::move(file));
+    log_ = std::make_unique<JsonLogFacility>(*std::move(file));
     return {};
 }
 
-Result<std::unique_ptr<PlugIn>> PlugIn::loadIn(SyncDaemon::Process process, Device& device) {
-    std::unique_ptr<PlugIn> plugIn(new PlugIn(process));
+void PlugIn::tellLogLoss() const {
+    if (log_ == nullptr) return;
+    const JsonLogFacility::Loss loss = log_->loss();
+    if (loss.messages == 0) return;
+    console_.complain(std::to_string(loss.messages) +
+                      " messages could not be written to the device's log: " + loss.reason);
+}
+
+Result<std::unique_ptr<PlugIn>> PlugIn::loadIn(SyncDaemon::Process process, Device& device,
+                                               const Console& console) {
+    std::unique_ptr<PlugIn> plugIn(new PlugIn(process, console));
     plugIn->device_ = &device;
     const Status status = plugIn->openLog(device);
     if (!status) return status.error();
@@ -73,21 +71,21 @@ Result<std::unique_ptr<PlugIn>> PlugIn::loadIn(SyncDaemon::Process process, Devi
     return plugIn;
 }
 
-Result<std::unique_ptr<PlugIn>> PlugIn::load(Device& device) {
-    Result<std::unique_ptr<PlugIn>> plugIn = loadIn(SyncDaemon::Process::Daemon, device);
+Result<std::unique_ptr<PlugIn>> PlugIn::load(Device& device, const Console& console) {
+    Result<std::unique_ptr<PlugIn>> plugIn = loadIn(SyncDaemon::Process::Daemon, device, console);
     if (plugIn) (*plugIn)->client_ = AppsClient::create((*plugIn)->platform());
     return plugIn;
 }
 
-Result<std::unique_ptr<PlugIn>> PlugIn::loadForRestore(Device& device) {
-    Result<std::unique_ptr<PlugIn>> plugIn = loadIn(SyncDaemon::Process::Restore, device);
+Result<std::unique_ptr<PlugIn>> PlugIn::loadForRestore(Device& device, const Console& console) {
+    Result<std::unique_ptr<PlugIn>> plugIn = loadIn(SyncDaemon::Process::Restore, device, console);
     if (plugIn) (*plugIn)->client_ = AppsClient::create((*plugIn)->platform());
     return plugIn;
 }
 
 Result<std::unique_ptr<PlugIn>> PlugIn::load(Device& device, SyncEvents& events,
-                                             SessionFacts& facts) {
-    Result<std::unique_ptr<PlugIn>> loaded = loadIn(SyncDaemon::Process::Daemon, device);
+                                             SessionFacts& facts, const Console& console) {
+    Result<std::unique_ptr<PlugIn>> loaded = loadIn(SyncDaemon::Process::Daemon, device, console);
     if (!loaded) return loaded;
     PlugIn& plugIn = **loaded;
     plugIn.watch_ = std::make_unique<SessionWatch>(device, plugIn.platform(), events, facts);

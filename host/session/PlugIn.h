@@ -2,6 +2,7 @@
 
 #include <memory>
 
+#include "host/console/Console.h"
 #include "host/watch/SyncDaemon.h"
 #include "platform/Platform.h"
 #include "platform/Result.h"
@@ -18,16 +19,20 @@ class SyncClient;
 class SyncEvents;
 
 /// The plug-in, loaded on a device: what the sync daemon does at its start. Its log is the
-/// device's. The device must outlive it.
+/// device's; what cannot be written to it is told on the console, at the end. The device and the
+/// console's streams must outlive it.
 class PlugIn {
   public:
-    [[nodiscard]] static Result<std::unique_ptr<PlugIn>> load(Device& device);
+    [[nodiscard]] static Result<std::unique_ptr<PlugIn>> load(Device& device,
+                                                              const Console& console);
     /// For a session: with a watch between plug-in and device, and told that the daemon has started
     /// up, upon which it attaches to the coordination service. Events and facts must outlive it.
     [[nodiscard]] static Result<std::unique_ptr<PlugIn>> load(Device& device, SyncEvents& events,
-                                                              SessionFacts& facts);
+                                                              SessionFacts& facts,
+                                                              const Console& console);
     /// In the process that restores backups, which is not the sync daemon.
-    [[nodiscard]] static Result<std::unique_ptr<PlugIn>> loadForRestore(Device& device);
+    [[nodiscard]] static Result<std::unique_ptr<PlugIn>> loadForRestore(Device& device,
+                                                                        const Console& console);
     ~PlugIn();
 
     [[nodiscard]] SyncClient& client();
@@ -40,13 +45,16 @@ class PlugIn {
     [[nodiscard]] TransferQueue& transfers() { return daemon_.transfers(); }
 
   private:
-    explicit PlugIn(SyncDaemon::Process process);
+    PlugIn(SyncDaemon::Process process, const Console& console);
     [[nodiscard]] static Result<std::unique_ptr<PlugIn>> loadIn(SyncDaemon::Process process,
-                                                                Device& device);
+                                                                Device& device,
+                                                                const Console& console);
     Status openLog(Device& device);
 
+    void tellLogLoss() const;
     SyncDaemon daemon_;
     Device* device_ = nullptr;
+    const Console console_;
     AppRegistry* registry_ = nullptr;  // the one that the client observes
     std::unique_ptr<JsonLogFacility> log_;
     std::unique_ptr<const Platform> platform_;

@@ -3,6 +3,7 @@
 import json
 import os
 import plistlib
+import re
 import sqlite3
 import subprocess
 import time
@@ -412,3 +413,95 @@ def test_every_command_calls_a_damaged_database_unusable(appsync, device, librar
         file.write(os.urandom(16384))
     for command in ("uninstall", "run", "quit", "why"):
         one_line(appsync(command, device.path, "com.example.app00", expect=3))
+
+
+PART = 16 << 20  # bytes of one part of the log
+LINE = '{"time":"T","category":8,"level":"info","message":"%s","format":""}\n'
+
+
+def log_path(device, suffix=""):
+    return os.path.join(device.path, "log", "system.log" + suffix)
+
+
+def fill_log(device, first="the first"):
+    """Ends the log of a device just short of its limit."""
+    with open(log_path(device), "w") as file:
+        file.write(LINE % first)
+        while file.tell() < PART - 200_000:
+            file.write(LINE % ("x" * 100_000))
+        file.write(LINE % ("y" * (PART - file.tell() - 200)))
+
+
+def test_log_goes_on_in_a_second_part_and_both_are_shown(appsync, device, library):
+    os.makedirs(os.path.dirname(log_path(device)), exist_ok=True)
+    fill_log(device)
+    device.sync(library)
+    assert os.path.getsize(log_path(device, ".1")) <= PART
+    assert os.path.getsize(log_path(device)) < 1 << 20
+    shown = appsync("log", device.path).stdout.splitlines()
+    assert shown[0].endswith("the first") and "y" * 50 in shown[-len(open(log_path(device)).readlines()) - 1]
+    assert len(shown) == sum(len(open(log_path(device, part)).readlines()) for part in ("", ".1"))
+
+
+def test_log_keeps_one_older_part(appsync, device, library):
+    device.sync(library)
+    with open(log_path(device, ".1"), "w") as file:
+        file.write(LINE % "too old")
+    fill_log(device)
+    device.sync(library)
+    shown = appsync("log", device.path).stdout.splitlines()
+    assert shown[0].endswith("the first")
+    assert sorted(os.listdir(os.path.dirname(log_path(device)))) == ["system.log", "system.log.1"]
+
+
+def test_log_follows_to_the_next_part(appsync, device, library):
+    device.sync(library)
+    with open(log_path(device), "w") as first:
+        first.write(LINE % "one")
+        first.flush()
+        following = appsync.start("log", device.path, "--follow")
+        try:
+            assert following.stdout.readline().rstrip().endswith("one")
+            os.rename(log_path(device), log_path(device, ".1"))
+            first.write(LINE % "two")  # by a process that has not noticed yet
+            first.flush()
+            assert following.stdout.readline().rstrip().endswith("two")
+            with open(log_path(device), "w") as second:
+                second.write(LINE % "three")
+            assert following.stdout.readline().rstrip().endswith("three")
+        finally:
+            following.kill()
+            following.communicate()
+
+
+def test_log_of_many_commands_at_once_is_whole_over_its_parts(appsync, device, library):
+    device.sync(library)
+    os.unlink(log_path(device))
+    appsync("inventory", device.path)
+    with open(log_path(device)) as file:
+        of_one = len(file.readlines())
+    fill_log(device)
+    with open(log_path(device)) as file:
+        before = len(file.readlines())
+    commands = [appsync.start("inventory", device.path) for _ in range(8)]
+    for command in commands:
+        command.communicate()
+        assert command.returncode == 0
+    records = [json.loads(line) for part in (".1", "") for line in open(log_path(device, part))]
+    assert os.path.getsize(log_path(device)) < 1 << 20
+    assert records[0]["message"] == "the first"
+    assert of_one > 0 and len(records) == before + 8 * of_one
+
+
+def test_log_that_cannot_be_written_stops_no_session_and_says_so(appsync, device, library):
+    device.sync(library)
+    os.unlink(log_path(device))
+    os.mkdir(log_path(device, ".1"))  # nothing can be put aside
+    fill_log(device)
+    done = device.sync(library) and appsync("inventory", device.path)
+    lost = [line for line in done.stderr.splitlines() if "could not be written to the device's log" in line]
+    assert len(lost) == 1 and re.match(r"appsync: \d+ messages could not be .*: Is a directory", lost[0])
+    assert os.path.getsize(log_path(device)) <= PART
+    os.rmdir(log_path(device, ".1"))
+    appsync("inventory", device.path)
+    assert os.path.getsize(log_path(device, ".1")) > 1 << 20

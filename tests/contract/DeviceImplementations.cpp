@@ -1,4 +1,3 @@
-#include <fcntl.h>
 #include <stdlib.h>
 
 #include <filesystem>
@@ -68,7 +67,7 @@ class FixedSyncHost : public SyncHost {
 /// device/: a device in a directory of this machine.
 class ReferenceDevice : public DeviceUnderTest {
   public:
-    ReferenceDevice() : log_(openLog(directory_.path() + "/log")) {
+    ReferenceDevice() : log_(LogFile::open(directory_.path() + "/log").value()) {
         require(Device::create(devicePath()));
         auto opened = Device::open(devicePath(), {.access = DeviceAccess::Session});
         if (!opened) throw std::runtime_error(opened.error().description());
@@ -119,9 +118,6 @@ class ReferenceDevice : public DeviceUnderTest {
     }
 
   private:
-    static UniqueFd openLog(const std::string& path) {
-        return UniqueFd(::open(path.c_str(), O_WRONLY | O_CREAT | O_APPEND | O_CLOEXEC, 0600));
-    }
     static void require(const Status& status) {
         if (!status) throw std::runtime_error(status.error().description());
     }

@@ -49,6 +49,7 @@ int FailingCall::failures() const { return plan.failures; }
 // The linker sends every call of `name` to __wrap_name, and of __real_name to the system.
 using appsync::testing::Call;
 using appsync::testing::fails;
+using appsync::testing::plan;
 
 extern "C" {
 
@@ -126,6 +127,9 @@ int __wrap_utimensat(int directory, const char* path, const timespec* times, int
 
 ssize_t __real_write(int descriptor, const void* source, size_t size);
 ssize_t __wrap_write(int descriptor, const void* source, size_t size) {
+    if (fails(Call::CutOffWrite)) {
+        return plan.failures == 1 ? __real_write(descriptor, source, size / 2) : -1;
+    }
     return fails(Call::Write) ? -1 : __real_write(descriptor, source, size);
 }
 

@@ -19,6 +19,7 @@ enum class Call {
     RemoveDirectory,  // unlinkat of a directory
     Utimensat,
     Write,
+    CutOffWrite,  // the first writes half of it
 };
 
 inline constexpr int kForever = 1 << 30;

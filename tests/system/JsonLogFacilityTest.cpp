@@ -1,12 +1,9 @@
 #include "system/JsonLogFacility.h"
 
-#include <array>
 #include <cerrno>
 #include <fstream>
 #include <stdexcept>
 #include <thread>
-
-#include <fcntl.h>
 
 #include "tests/system/DeviceFilesTest.h"
 #include "tests/system/FailingCalls.h"
@@ -78,12 +75,8 @@ TEST(LogLineTest, BytesThatAreNoCharacterAreReplacedOneByOne) {
 
 class JsonLogFacilityTest : public ::testing::Test {
   protected:
-    JsonLogFacilityTest() : log_(open()) {}
+    JsonLogFacilityTest() : log_(LogFile::open(path()).value()) {}
 
-    [[nodiscard]] UniqueFd open() const {
-        const int flags = O_WRONLY | O_APPEND | O_CREAT | O_CLOEXEC;
-        return UniqueFd(::open(path().c_str(), flags, 0600));
-    }
     [[nodiscard]] std::filesystem::path path() const { return scratch_.path() / "system.log"; }
     [[nodiscard]] std::vector<std::string> lines() const {
         std::vector<std::string> result;
@@ -115,7 +108,7 @@ TEST_F(JsonLogFacilityTest, WritesEachLineInOneCall) {
     // A second call would fail.
     const FailingCall failing(Call::Write, EIO, kForever, 1);
     log(std::string(10'000, 'x'));
-    EXPECT_EQ(log_.droppedLines(), 0U);
+    EXPECT_EQ(log_.loss().messages, 0U);
     EXPECT_EQ(failing.failures(), 0);
 }
 
@@ -134,33 +127,52 @@ TEST_F(JsonLogFacilityTest, LinesOfManyThreadsStayWhole) {
     }
 }
 
-TEST_F(JsonLogFacilityTest, AMessageThatCannotBeWrittenIsCounted) {
+TEST_F(JsonLogFacilityTest, TellsOfTheMessagesThatCouldNotBeWritten) {
     {
         const FailingCall failing(Call::Write, ENOSPC);
         log("lost");
+        log("lost, too");
     }
     log("kept");
-    EXPECT_EQ(log_.droppedLines(), 1U);
-    ASSERT_EQ(lines().size(), 1U);
-    EXPECT_NE(lines()[0].find("kept"), std::string::npos);
+    log("kept, too");
+    EXPECT_EQ(log_.loss().messages, 2U);
+    EXPECT_EQ(log_.loss().reason, "No space left on device");
+    const auto found = lines();
+    ASSERT_EQ(found.size(), 3U);
+    EXPECT_TRUE(found[0].ends_with(
+        R"("category":0,"level":"error","message":"2 messages could not be written: )"
+        R"(No space left on device","format":"%llu messages could not be written: %s"})"))
+        << found[0];
+    EXPECT_NE(found[1].find("\"says kept\""), std::string::npos);
+    EXPECT_NE(found[2].find("\"says kept, too\""), std::string::npos);
 }
 
-TEST(JsonLogCutOffTest, ALineAfterOneThatWasCutOffIsWhole) {
-    std::array<int, 2> ends{};
-    ASSERT_EQ(::pipe2(ends.data(), O_NONBLOCK | O_CLOEXEC), 0);
-    const UniqueFd reader(ends[0]);
-    ASSERT_EQ(::fcntl(ends[1], F_SETPIPE_SZ, 4096), 4096);
-    JsonLogFacility log{UniqueFd(ends[1])};
-    std::array<char, 8192> buffer{};
-    log.write({LogCategory::General, LogLevel::Info, std::string(6000, 'x'), {}});
-    ASSERT_EQ(::read(reader.get(), buffer.data(), buffer.size()), 4096);
-    log.write({LogCategory::General, LogLevel::Info, "next", {}});
-    EXPECT_EQ(log.droppedLines(), 1U);
-    const ssize_t count = ::read(reader.get(), buffer.data(), buffer.size());
-    ASSERT_GT(count, 0);
-    const std::string_view text(buffer.data(), static_cast<std::size_t>(count));
-    EXPECT_TRUE(text.starts_with("\n{\"time\"")) << text;
-    EXPECT_TRUE(text.ends_with("}\n")) << text;
+TEST_F(JsonLogFacilityTest, AMessageIsLostWithTheLineThatWouldTellOfAnother) {
+    {
+        const FailingCall failing(Call::Write, ENOSPC, 2);
+        log("lost");
+        log("lost, too");
+        EXPECT_EQ(failing.failures(), 2);
+    }
+    EXPECT_EQ(log_.loss().messages, 2U);
+    log("kept");
+    EXPECT_EQ(log_.loss().messages, 2U);
+    ASSERT_EQ(lines().size(), 2U);
+    EXPECT_NE(lines()[0].find("\"2 messages could not"), std::string::npos);
+}
+
+TEST_F(JsonLogFacilityTest, ALineAfterOneThatWasCutOffIsWhole) {
+    {
+        const FailingCall failing(Call::CutOffWrite, ENOSPC);
+        log("cut off");
+    }
+    log("next");
+    EXPECT_EQ(log_.loss().messages, 1U);
+    const auto found = lines();
+    ASSERT_EQ(found.size(), 3U);
+    EXPECT_FALSE(found[0].ends_with("}"));
+    EXPECT_TRUE(found[1].starts_with("{\"time\"")) << found[1];
+    EXPECT_NE(found[2].find("\"says next\""), std::string::npos);
 }
 
 TEST_F(JsonLogFacilityTest, TheListenerGetsWhatIsWritten) {
@@ -182,6 +194,7 @@ TEST_F(JsonLogFacilityTest, AListenerThatThrowsHarmsNobody) {
     log("one");
     log("two");
     EXPECT_EQ(lines().size(), 2U);
+    EXPECT_EQ(log_.loss().messages, 0U);
 }
 
 TEST_F(JsonLogFacilityTest, MakesHandles) {

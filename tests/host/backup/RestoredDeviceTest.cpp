@@ -4,9 +4,11 @@
 #include <filesystem>
 #include <fstream>
 #include <iterator>
+#include <sstream>
 
 #include "client/Paths.h"
 #include "device/Device.h"
+#include "host/console/Console.h"
 #include "host/session/PlugIn.h"
 #include "platform/FileSystem.h"
 #include "platform/PropertyListSerialization.h"
@@ -52,7 +54,9 @@ class RestoredDevice : public HostFixture, public testing::WithParamInterface<bo
     }
     void restoreBytes(Device& opened, const std::string& bytes) {
         write(root + std::string(kRestoreInfoPath), bytes);
-        const Result<std::unique_ptr<PlugIn>> plugIn = PlugIn::loadForRestore(opened);
+        std::ostringstream said;
+        const Console console{said, said};
+        const Result<std::unique_ptr<PlugIn>> plugIn = PlugIn::loadForRestore(opened, console);
         ASSERT_TRUE(plugIn.ok());
         EXPECT_TRUE((*plugIn)->client().reconcileRestoreOfType(2, nullptr));
     }
