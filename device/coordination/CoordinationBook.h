@@ -68,6 +68,11 @@ class CoordinationBook : public std::enable_shared_from_this<CoordinationBook> {
     Status setResponsible(const Coordinator& coordinator, CoordinationClient client);
     Status setPlaceholder(const Coordinator& coordinator,
                           const std::shared_ptr<DevicePlaceholder>& placeholder);
+    /// Has the observers of a coordinator that restores hear nothing of it until `tellNews`: its
+    /// client books the placeholder once it has handed it in, and news that overtook that would be
+    /// lost.
+    void holdNews(const LiveCoordinator& coordinator);
+    void tellNews(const LiveCoordinator& coordinator);
 
     // Ending.
 

@@ -17,10 +17,6 @@ namespace appsync {
 
 namespace {
 
-/// A client that restores notes that it waits for a placeholder after it has handed that in. News
-/// that overtook it would be lost, and it would wait until its patience ends.
-constexpr std::chrono::milliseconds kBookingTime{20};
-
 Status storeFailure(Database& database, const std::string& identifier, const ErrorRecord& error) {
     return database
         .query(
@@ -170,15 +166,9 @@ void CoordinationBook::tellLast(const Coordinator& coordinator, CoordinationHera
 }
 
 void CoordinationBook::tellPlaceholder(const Coordinator& coordinator) {
-    if (access_ == Access::Look) return;
-    const bool restoring = coordinator->kind == CoordinatorKind::Restoring ||
-                           coordinator->kind == CoordinatorKind::RestoringDemoted;
-    herald_.tell(
-        coordinator,
-        [handle = handle(coordinator)](InstallCoordinatorObserver& observer) {
-            observer.coordinatorDidInstallPlaceholder(handle);
-        },
-        {}, restoring ? kBookingTime : std::chrono::milliseconds(0));
+    tell(coordinator, [handle = handle(coordinator)](InstallCoordinatorObserver& observer) {
+        observer.coordinatorDidInstallPlaceholder(handle);
+    });
 }
 
 void CoordinationBook::tellCompletion(const Coordinator& coordinator) {

@@ -1,6 +1,7 @@
 #include "device/coordination/CoordinationHerald.h"
 
 #include <algorithm>
+#include <iterator>
 #include <system_error>
 #include <utility>
 
@@ -86,11 +87,32 @@ std::shared_ptr<AppInstallObserver> CoordinationHerald::observe(
 }
 
 void CoordinationHerald::tell(std::shared_ptr<LiveCoordinator> coordinator, Call call,
-                              std::function<void()> told, std::chrono::milliseconds delay) {
+                              std::function<void()> told) {
     const std::lock_guard lock(mutex_);
     if (closing_) return;
-    news_.push_back(
-        {std::move(coordinator), std::move(call), std::move(told), Clock::now() + delay});
+    const auto held = held_.find(coordinator->id);
+    News news{std::move(coordinator), std::move(call), std::move(told)};
+    if (held != held_.end()) return held->second.push_back(std::move(news));
+    news_.push_back(std::move(news));
+    wake();
+}
+
+void CoordinationHerald::hold(const LiveCoordinator& coordinator) {
+    const std::lock_guard lock(mutex_);
+    held_.try_emplace(coordinator.id);
+}
+
+void CoordinationHerald::release(const LiveCoordinator& coordinator) {
+    const std::lock_guard lock(mutex_);
+    const auto held = held_.find(coordinator.id);
+    if (held == held_.end()) return;
+    std::move(held->second.begin(), held->second.end(), std::back_inserter(news_));
+    held_.erase(held);
+    if (!closing_ && !news_.empty()) wake();
+}
+
+// With the lock held.
+void CoordinationHerald::wake() {
     wakes_.notify_all();
     if (thread_.joinable()) return;
     try {
@@ -103,10 +125,12 @@ void CoordinationHerald::tell(std::shared_ptr<LiveCoordinator> coordinator, Call
 
 void CoordinationHerald::close() {
     std::deque<News> dropped;
+    std::map<std::int64_t, std::vector<News>> droppedToo;
     {
         const std::lock_guard lock(mutex_);
         closing_ = true;
         dropped.swap(news_);
+        droppedToo.swap(held_);
         wakes_.notify_all();
     }
     if (thread_.joinable()) thread_.join();
@@ -117,12 +141,6 @@ void CoordinationHerald::work() {
     while (true) {
         wakes_.wait(lock, [this] { return closing_ || !news_.empty(); });
         if (closing_) return;
-        const Clock::time_point notBefore = news_.front().notBefore;
-        if (wakes_.wait_until(lock, notBefore,
-                              [&] { return closing_ || Clock::now() >= notBefore; }) &&
-            closing_) {
-            return;
-        }
         {
             const News news = std::move(news_.front());
             news_.pop_front();

@@ -1,9 +1,10 @@
 #pragma once
 
-#include <chrono>
 #include <condition_variable>
+#include <cstdint>
 #include <deque>
 #include <functional>
+#include <map>
 #include <memory>
 #include <mutex>
 #include <set>
@@ -36,25 +37,27 @@ class CoordinationHerald {
         std::weak_ptr<InstallCoordinatorObserver> delegate);
 
     /// Has the observers of the coordinator called; then, also when there are none, calls `told`.
-    /// News that has a delay is not told before, and holds up what comes after it.
     void tell(std::shared_ptr<LiveCoordinator> coordinator, Call call,
-              std::function<void()> told = {},
-              std::chrono::milliseconds delay = std::chrono::milliseconds(0));
+              std::function<void()> told = {});
+
+    /// From now on nothing is told of the coordinator; other news is.
+    void hold(const LiveCoordinator& coordinator);
+    /// Tells what was held back. Does nothing where nothing is held.
+    void release(const LiveCoordinator& coordinator);
 
     /// No call begins any more; waits for one that has begun. Not to be called by an observer.
     void close();
 
   private:
-    using Clock = std::chrono::steady_clock;
     class Registration;
     class Registrations;
     struct News {
         std::shared_ptr<LiveCoordinator> coordinator;
         Call call;
         std::function<void()> told;
-        Clock::time_point notBefore;
     };
 
+    void wake();
     void work();
     void deliver(const News& news);
 
@@ -64,6 +67,7 @@ class CoordinationHerald {
     // Protected by mutex_.
     std::condition_variable wakes_;
     std::deque<News> news_;
+    std::map<std::int64_t, std::vector<News>> held_;  // by the ids of their coordinators
     bool closing_ = false;
     std::thread thread_;  // started with the first news
 };

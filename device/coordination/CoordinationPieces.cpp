@@ -249,6 +249,16 @@ Status CoordinationBook::setPlaceholder(const Coordinator& coordinator,
     return {};
 }
 
+void CoordinationBook::holdNews(const LiveCoordinator& coordinator) {
+    const bool restores = coordinator.kind == CoordinatorKind::Restoring ||
+                          coordinator.kind == CoordinatorKind::RestoringDemoted;
+    if (restores && !closed_) herald_.hold(coordinator);
+}
+
+void CoordinationBook::tellNews(const LiveCoordinator& coordinator) {
+    if (!closed_) herald_.release(coordinator);
+}
+
 Status CoordinationBook::show(const Coordinator& coordinator,
                               const DevicePlaceholder& placeholder) {
     Status status = putOnHomeScreen(coordinator, placeholder);

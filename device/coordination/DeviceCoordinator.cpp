@@ -7,6 +7,8 @@
 
 namespace appsync {
 
+DeviceCoordinator::~DeviceCoordinator() { tellNews(); }
+
 std::optional<std::string> DeviceCoordinator::bundleIdentifier() const {
     return coordinator_->identifier;
 }
@@ -62,6 +64,7 @@ std::optional<CoordinationClient> DeviceCoordinator::appAssetPromiseResponsibleC
 }
 
 Status DeviceCoordinator::setAppAssetPromiseResponsibleClient(CoordinationClient client) {
+    tellNews();
     return book_->setResponsible(coordinator_, client);
 }
 
@@ -79,8 +82,14 @@ bool DeviceCoordinator::hasPlaceholderPromise() const {
 
 Status DeviceCoordinator::setPlaceholderPromise(
     const std::shared_ptr<InstallPlaceholder>& placeholder) {
+    holdsNews_ = true;
+    book_->holdNews(*coordinator_);
     return book_->setPlaceholder(coordinator_,
                                  std::dynamic_pointer_cast<DevicePlaceholder>(placeholder));
+}
+
+void DeviceCoordinator::tellNews() {
+    if (holdsNews_.exchange(false)) book_->tellNews(*coordinator_);
 }
 
 void DeviceCoordinator::cancelForReason(const ErrorRecord& reason, CoordinationClient client) {

@@ -1,5 +1,6 @@
 #pragma once
 
+#include <atomic>
 #include <memory>
 
 #include "platform/InstallCoordinator.h"
@@ -9,12 +10,17 @@ namespace appsync {
 class CoordinationBook;
 class LiveCoordinator;
 
-/// A handle on a coordinator of a device's coordination service.
+/// A handle on a coordinator of a device's coordination service. One of a restore that was given a
+/// placeholder holds back what the service has to tell of it, until whoever holds the handle has
+/// done what it does next: makes somebody responsible for the package, or lets the handle go.
 class DeviceCoordinator final : public InstallCoordinator {
   public:
     DeviceCoordinator(std::shared_ptr<CoordinationBook> book,
                       std::shared_ptr<LiveCoordinator> coordinator)
         : book_(std::move(book)), coordinator_(std::move(coordinator)) {}
+    DeviceCoordinator(const DeviceCoordinator&) = delete;
+    DeviceCoordinator& operator=(const DeviceCoordinator&) = delete;
+    ~DeviceCoordinator() override;
 
     [[nodiscard]] std::optional<std::string> bundleIdentifier() const override;
     [[nodiscard]] CoordinationClient creatorIdentifier() const override;
@@ -41,8 +47,11 @@ class DeviceCoordinator final : public InstallCoordinator {
     void cancelForReason(const ErrorRecord& reason, CoordinationClient client) override;
 
   private:
+    void tellNews();
+
     const std::shared_ptr<CoordinationBook> book_;
     const std::shared_ptr<LiveCoordinator> coordinator_;
+    std::atomic<bool> holdsNews_ = false;
 };
 
 }  // namespace appsync

@@ -195,15 +195,43 @@ TEST_F(DeviceCoordinationInstallTest,
 
 TEST_F(DeviceCoordinationInstallTest,
        theRestoreOfADemotedApplicationIsDoneWhenItsPlaceholderStands) {
-    const auto made = coordinator(kAtlas, CoordinatorKind::RestoringDemoted);
+    auto made = coordinator(kAtlas, CoordinatorKind::RestoringDemoted);
     const auto shown =
         service().makeAppPlaceholder("Atlas", kAtlas, kInstallTypeDowngrade, SyncClientID);
     ASSERT_TRUE(shown->setConfigurationComplete());
     ASSERT_TRUE(made->setPlaceholderPromise(shown));
+    made.reset();
     EXPECT_EQ(listener_->waitFor(2),
               (Texts{"placeholder com.example.atlas", "complete com.example.atlas"}));
     EXPECT_TRUE(hasPlaceholder(kAtlas));
     EXPECT_FALSE(recordOf(kAtlas));
+}
+
+TEST_F(DeviceCoordinationInstallTest, newsOfARestoreComesOnceItsClientLetsGoOfTheCoordinator) {
+    auto made = coordinator(kAtlas, CoordinatorKind::RestoringDemoted);
+    const auto shown =
+        service().makeAppPlaceholder("Atlas", kAtlas, kInstallTypeDowngrade, SyncClientID);
+    ASSERT_TRUE(shown->setConfigurationComplete());
+    ASSERT_TRUE(made->setPlaceholderPromise(shown));
+    // News comes in the order in which things happened, but for what is held back.
+    const auto later = prepare(kBoat);
+    EXPECT_EQ(listener_->waitFor(1), Texts{"placeholder com.example.boat"});
+    made.reset();
+    EXPECT_EQ(listener_->waitFor(3),
+              (Texts{"placeholder com.example.boat", "placeholder com.example.atlas",
+                     "complete com.example.atlas"}));
+}
+
+TEST_F(DeviceCoordinationInstallTest, newsOfARestoreComesOnceSomebodyIsResponsible) {
+    const auto made = coordinator(kAtlas, CoordinatorKind::Restoring);
+    const auto shown = placeholder(kAtlas);
+    ASSERT_TRUE(shown->setConfigurationComplete());
+    ASSERT_TRUE(made->setPlaceholderPromise(shown));
+    const auto later = prepare(kBoat);
+    EXPECT_EQ(listener_->waitFor(1), Texts{"placeholder com.example.boat"});
+    ASSERT_TRUE(made->setAppAssetPromiseResponsibleClient(AppStoreClientID));
+    EXPECT_EQ(listener_->waitFor(2),
+              (Texts{"placeholder com.example.boat", "placeholder com.example.atlas"}));
 }
 
 // Failures.
