@@ -280,6 +280,10 @@ bool Device::waitForCoordinatedInstalls(std::chrono::milliseconds longest) {
     return state_->coordination.waitForInstalls(longest);
 }
 
+void Device::holdCoordinatedInstalls() { state_->coordination.holdInstalls(); }
+
+void Device::letCoordinatedInstallsGo() { state_->coordination.letInstallsGo(); }
+
 Status Device::run(const std::string& identifier) {
     const bool stale = !SessionLock::isHeld(state_->path);
     return state_->database->change(Durability::OnDisk, [&](Database& database) {

@@ -159,8 +159,14 @@ class Device {
     /// install has not ended, observers included; ordered. Those that wait for a running
     /// application to end are among them: `status` tells of the denial.
     [[nodiscard]] std::vector<std::string> coordinatedInstallsUnderWay();
-    /// Waits until there are no such applications. False when the time is over before that.
+    /// Waits until there are no such applications. False when the time is over before that, or
+    /// while installs are held.
     [[nodiscard]] bool waitForCoordinatedInstalls(std::chrono::milliseconds longest);
+    /// From now on no coordinated install begins; those that could count as under way, for whoever
+    /// asks the registry, all the same. So none ends while a client makes up its mind what it
+    /// wants.
+    void holdCoordinatedInstalls();
+    void letCoordinatedInstallsGo();
 
     // What a person does on the device. An identifier under which there is nothing is refused.
 

@@ -45,6 +45,25 @@ void CoordinatedInstaller::install(const Coordinator& coordinator) {
     wakes_.notify_one();
 }
 
+void CoordinatedInstaller::hold() {
+    const std::lock_guard lock(mutex_);
+    held_ = true;
+}
+
+void CoordinatedInstaller::letGo() {
+    const std::lock_guard lock(mutex_);
+    held_ = false;
+    wakes_.notify_all();
+}
+
+bool CoordinatedInstaller::isHeld() const {
+    const std::lock_guard lock(mutex_);
+    return held_;
+}
+
+// With the lock held.
+bool CoordinatedInstaller::mayInstall() const { return !held_ && !installs_.empty(); }
+
 void CoordinatedInstaller::post(std::function<void()> task) {
     {
         const std::lock_guard lock(mutex_);
@@ -88,7 +107,7 @@ void CoordinatedInstaller::close() {
 void CoordinatedInstaller::work() {
     std::unique_lock lock(mutex_);
     while (true) {
-        wakes_.wait(lock, [this] { return closing_ || !tasks_.empty() || !installs_.empty(); });
+        wakes_.wait(lock, [this] { return closing_ || !tasks_.empty() || mayInstall(); });
         std::function<void()> job;
         if (!tasks_.empty()) {
             job = std::move(tasks_.front());

@@ -43,6 +43,10 @@ class CoordinatedInstaller {
     void start();
     /// Installs the application of a coordinator that has all its pieces.
     void install(const Coordinator& coordinator);
+    /// From now on no install begins.
+    void hold();
+    void letGo();
+    [[nodiscard]] bool isHeld() const;
     /// Has something done. It is done in any case, at the latest by `close`.
     void post(std::function<void()> task);
 
@@ -63,6 +67,7 @@ class CoordinatedInstaller {
     void watch();
     void retryDenied();
     [[nodiscard]] std::vector<Coordinator> takeRetries();
+    [[nodiscard]] bool mayInstall() const;
     [[nodiscard]] bool runs(const std::string& identifier);
 
     void installNow(const Coordinator& coordinator);
@@ -73,7 +78,7 @@ class CoordinatedInstaller {
     DeviceHomeScreen& homeScreen_;
     const std::chrono::seconds retryInterval_;
 
-    std::mutex mutex_;
+    mutable std::mutex mutex_;
     // Protected by mutex_.
     std::condition_variable wakes_;
     std::condition_variable watcherWakes_;
@@ -82,6 +87,7 @@ class CoordinatedInstaller {
     std::vector<Denied> denied_;
     std::vector<std::thread> workers_;
     std::thread watcher_;
+    bool held_ = false;
     bool closing_ = false;
 };
 

@@ -164,7 +164,8 @@ std::vector<std::string> CoordinationService::installsUnderWay() {
 }
 
 bool CoordinationService::waitForInstalls(std::chrono::milliseconds longest) {
-    return book_->waitForInstalls(longest);
+    const auto patience = installer_.isHeld() ? std::chrono::milliseconds(0) : longest;
+    return book_->waitForInstalls(patience);
 }
 
 }  // namespace appsync

@@ -74,6 +74,8 @@ class CoordinationService final : public InstallCoordinatorService {
     Status cancel(const std::string& identifier, CoordinationClient client);
     [[nodiscard]] std::vector<std::string> installsUnderWay();
     [[nodiscard]] bool waitForInstalls(std::chrono::milliseconds longest);
+    void holdInstalls() { installer_.hold(); }
+    void letInstallsGo() { installer_.letGo(); }
 
     /// No call of an observer begins any more, and no thread is left.
     void close();

@@ -91,6 +91,8 @@ Result<std::unique_ptr<PlugIn>> PlugIn::load(Device& device, SyncEvents& events,
     plugIn.watch_ = std::make_unique<SessionWatch>(device, plugIn.platform(), events, facts);
     plugIn.registry_ = &plugIn.watch_->registry();
     plugIn.client_ = AppsClient::create(watched(plugIn.platform(), *plugIn.watch_));
+    // What an interrupted session has delivered must not end while the plug-in looks what there is.
+    device.holdCoordinatedInstalls();
     plugIn.platform().notificationCenter.post(kStartupCompleteNotification);
     return loaded;
 }

@@ -26,7 +26,8 @@ class PlugIn {
     [[nodiscard]] static Result<std::unique_ptr<PlugIn>> load(Device& device,
                                                               const Console& console);
     /// For a session: with a watch between plug-in and device, and told that the daemon has started
-    /// up, upon which it attaches to the coordination service. Events and facts must outlive it.
+    /// up, upon which it attaches to the coordination service. Coordinated installs are held: the
+    /// session lets them go. Events and facts must outlive it.
     [[nodiscard]] static Result<std::unique_ptr<PlugIn>> load(Device& device, SyncEvents& events,
                                                               SessionFacts& facts,
                                                               const Console& console);
@@ -50,11 +51,11 @@ class PlugIn {
                                                                 Device& device,
                                                                 const Console& console);
     Status openLog(Device& device);
-
     void tellLogLoss() const;
+
     SyncDaemon daemon_;
-    Device* device_ = nullptr;
     const Console console_;
+    Device* device_ = nullptr;
     AppRegistry* registry_ = nullptr;  // the one that the client observes
     std::unique_ptr<JsonLogFacility> log_;
     std::unique_ptr<const Platform> platform_;

@@ -86,6 +86,7 @@ SessionEnd Session::sync(const Order& order) {
         facts_.requested(asset->identifier);
         assets.push_back(std::move(asset));
     }
+    device_.letCoordinatedInstallsGo();
     transferAll(assets, order.packages);
     return end(known);
 }
@@ -138,6 +139,7 @@ SessionEnd Session::deliver(const Parcel& parcel) {
         end_.error = ready.error();
         return end_;
     }
+    device_.letCoordinatedInstallsGo();
     client_.prepareForSyncWithHostAnchor(client_.currentSyncAnchor(), ignoreProgress, nullptr);
     facts_.reconciled();
     facts_.requested(parcel.asset->identifier);
@@ -228,6 +230,7 @@ void Session::reportFailure(const SyncAssetPointer& asset, const ErrorRecord& er
 
 // A stop that comes when nothing is left to do interrupts nothing.
 const SessionEnd& Session::end(const std::vector<std::string>& known) {
+    device_.letCoordinatedInstallsGo();
     client_.assetTransferEndedWithSuccess(!isCutShort_ && !end_.error);
     if (watch_.isCoordinated()) {
         cancelWhere([this](const CoordinatorRecord& each) {
@@ -253,8 +256,9 @@ const SessionEnd& Session::end(const std::vector<std::string>& known) {
 //
 // - The plug-in looks for something on the device before it cancels the coordinator of a package
 //   that does not come; the placeholder may have come to stand there after it looked.
-// - It may see the placeholder of an install that was taken up in its last moment, and prepare
-//   another coordinator for it.
+// - Somebody may cancel an install that was taken up, after the plug-in has seen its placeholder
+// and
+//   before it prepares what that stands for.
 void Session::cancelWhere(const std::function<bool(const CoordinatorRecord&)>& isToGo) {
     if (givenUp_.empty() && takenUp_.empty()) return;
     const Result<std::vector<CoordinatorRecord>> coordinators = device_.coordinators();
