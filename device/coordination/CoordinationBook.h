@@ -80,7 +80,8 @@ class CoordinationBook : public std::enable_shared_from_this<CoordinationBook> {
                 CoordinationClient client);
     /// Its install was committed, and the coordinator went with that.
     void installed(const Coordinator& coordinator);
-    /// Its install failed: the placeholder goes, an installed version stays.
+    /// Its install failed: the placeholder goes, an installed version stays. That of a restore
+    /// stands on, with another coordinator that waits for a package again.
     void failed(const Coordinator& coordinator, const ErrorRecord& error);
     /// Tells of what others have cancelled through the database. Cheap when that is nothing.
     void hearOfOthers();

@@ -26,6 +26,13 @@ Status storeFailure(Database& database, const std::string& identifier, const Err
         .run();
 }
 
+// Nothing but a restore brings back what stands there.
+bool restores(const LiveCoordinator& coordinator) {
+    const bool isRestore = coordinator.kind == CoordinatorKind::Restoring ||
+                           coordinator.kind == CoordinatorKind::RestoringDemoted;
+    return isRestore && coordinator.snapshot().placeholder == PlaceholderState::Stands;
+}
+
 }  // namespace
 
 void CoordinationBook::cancel(const Coordinator& coordinator, const ErrorRecord& reason,
@@ -64,8 +71,11 @@ void CoordinationBook::fail(const Coordinator& coordinator, const ErrorRecord& e
                             FailureOf what) {
     if (!coordinator->beginEnding()) return;
     RemovedCoordinator removed;
+    const bool isKept = what == FailureOf::Install && restores(*coordinator);
+    const StoredCoordinator known = coordinator->snapshot();
     const Status status = context_.database.change(Durability::Soon, [&](Database& database) {
-        Status done = removeCoordinator(database, coordinator->id, removed);
+        Status done = isKept ? renewRestore(database, known, removed)
+                             : removeCoordinator(database, coordinator->id, removed);
         if (!done || !removed.existed) return done;
         return storeFailure(database, coordinator->identifier, error);
     });

@@ -7,6 +7,7 @@
 #include "device/values/DeviceError.h"
 #include "device/values/DeviceRecords.h"
 #include "device/values/WallClock.h"
+#include "platform/InstallProgressRecord.h"
 
 namespace appsync {
 
@@ -256,6 +257,37 @@ Status removeCoordinator(Database& database, std::int64_t id, RemovedCoordinator
     if (!status || placeholder != PlaceholderState::Stands) return status;
     removed.hadPlaceholder = true;
     return forgetBundle(database, BundleTable::Placeholders, identifier, removed.container);
+}
+
+Status renewRestore(Database& database, const StoredCoordinator& failed,
+                    RemovedCoordinator& removed) {
+    removed = {};
+    const Result<bool> forgotten = forgetCoordinator(database, failed.id);
+    if (!forgotten) return forgotten.error();
+    removed.existed = *forgotten;
+    if (!removed.existed) return {};
+    Status status =
+        database.query("DELETE FROM denials WHERE identifier = ?").bind(failed.identifier).run();
+    if (!status) return status;
+    const Result<std::int64_t> id =
+        insertCoordinator(database, failed.identifier, failed.kind, failed.client);
+    if (!id) return id.error();
+    StoredCoordinator renewed = failed;
+    renewed.id = *id;
+    const Result<bool> updated = updateCoordinator(database, renewed);
+    if (!updated) return updated.error();
+    for (const StoredPromise& promise : failed.promises) {
+        if (promise.role == PromiseRole::Asset) continue;  // its package is gone
+        status = storePromise(database, renewed.id, promise);
+        if (!status) return status;
+    }
+    return database
+        .query(
+            "UPDATE progress SET state = ?, phase = ?, completed = 0, unpacked = 0"
+            " WHERE identifier = ?")
+        .bind(static_cast<std::uint64_t>(kInstallStateWaiting),
+              static_cast<std::uint64_t>(kInstallPhaseLoading), failed.identifier)
+        .run();
 }
 
 Status announceCancellation(Database& database, const Cancellation& cancellation) {

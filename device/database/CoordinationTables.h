@@ -112,6 +112,12 @@ Status storePromise(Database& database, std::int64_t coordinator, const StoredPr
 /// Takes it away with the placeholder that is its own, and with what tells of a denial.
 Status removeCoordinator(Database& database, std::int64_t id, RemovedCoordinator& removed);
 
+/// Takes the coordinator of a restore away whose install failed, with what tells of a denial, and
+/// puts another in its place that waits for a package anew. The placeholder goes on standing.
+/// Nothing changes where the coordinator is not there.
+Status renewRestore(Database& database, const StoredCoordinator& failed,
+                    RemovedCoordinator& removed);
+
 /// Tells the session that a coordinator was cancelled.
 Status announceCancellation(Database& database, const Cancellation& cancellation);
 /// Those that came after the one with that id, oldest first.

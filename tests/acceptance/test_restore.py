@@ -625,3 +625,50 @@ def test_restore_killed_at_random_moments_and_run_again(appsync, tmp_path, coord
         assert sorted(os.listdir(device.inside(archives))) == sorted(os.listdir(folder / "data"))
         shutil.rmtree(device.path)
     assert interrupted > 5
+
+
+@ON_ONE_PATH
+def test_install_of_a_restore_that_fails_leaves_its_placeholder_to_the_store(appsync, store, backup, tmp_path):
+    device = Device(appsync, tmp_path / "coordinated", "on")
+    restore(device, backup)
+    before = device.placeholders()
+    archive = pathlib.Path(device.inside("/var/mobile/Media/VessikRestore/Data")) / (IDS[1] + ".zip")
+    whole = archive.read_bytes()
+    archive.write_bytes(b"no archive")
+    result = appsync.json("store", device.path, store, expect=1)
+    assert [each["identifier"] for each in result["failed"]] == [IDS[1]]
+    assert IDS[1] in device.placeholders() and IDS[1] not in device.apps()
+    why = appsync.json("why", device.path, IDS[1])
+    assert why["state"] == "placeholder" and why["waitsFor"]["what"] == "store" and why["lastError"]
+    archive.write_bytes(whole)
+    assert appsync.json("store", device.path, store) == {"kept": [IDS[1]], "failed": []}
+    assert IDS[1] in device.apps() and set(device.placeholders()) < set(before)
+    assert appsync.json("why", device.path, IDS[1])["lastError"] is None
+
+
+@pytest.mark.parametrize("way", ["send", "store"])
+def test_offloaded_application_of_the_system_is_brought_back(appsync, device, store, way):
+    if way == "store" and not device.is_coordinated:
+        pytest.skip("the store brings packages only where installs are coordinated")
+    device.sync(store)
+    write_data(device, IDS[0], {"notes": b"kept"})
+    with sqlite3.connect(os.path.join(device.path, "device.db")) as database:
+        database.execute("UPDATE applications SET type = 'System' WHERE identifier = ?", (IDS[0],))
+    database.close()
+    appsync("demote", device.path, IDS[0])
+    assert IDS[0] in device.placeholders()
+    waits = appsync.json("why", device.path, IDS[0])["waitsFor"]
+    assert waits["what"] == ("store" if device.is_coordinated else "transfer")
+    appsync("sync", device.path, store, expect=None)
+    assert IDS[0] in device.placeholders()  # the plug-in never asks for it
+    if way == "send":
+        sent = appsync.json("send", device.path, IDS[0], os.path.join(store, IDS[0] + ".zip"))
+        assert sent["installed"] == [IDS[0]] and sent["failed"] == [] and sent["bytes"] > 0
+    else:
+        assert appsync.json("store", device.path, store) == {"kept": [IDS[0]], "failed": []}
+    assert device.apps()[IDS[0]]["type"] == "System" and IDS[0] not in device.placeholders()
+    assert appsync.json("why", device.path, IDS[0])["waitsFor"] is None
+    assert pathlib.Path(device.inside(DATA), IDS[0], "notes").read_bytes() == b"kept"
+    appsync("store", device.path, store)
+    if device.is_coordinated:
+        assert appsync.json("coordinator", device.path, "list") == []

@@ -236,6 +236,42 @@ TEST_F(DeviceCoordinationInstallTest, newsOfARestoreComesOnceSomebodyIsResponsib
 
 // Failures.
 
+TEST_F(DeviceCoordinationInstallTest, aFailedRestoreKeepsItsPlaceholderAndWaitsForItsPackageAgain) {
+    auto made = coordinator(kAtlas, CoordinatorKind::Restoring);
+    const auto data = service().makeOutOfBandPromise("data", SyncClientID, 0);
+    data->setComplete();
+    ASSERT_TRUE(made->setUserDataPromise(data));
+    const auto shown = placeholder(kAtlas);
+    ASSERT_TRUE(shown->setConfigurationComplete());
+    ASSERT_TRUE(made->setPlaceholderPromise(shown));
+    ASSERT_TRUE(made->setAppAssetPromiseResponsibleClient(AppStoreClientID));
+    ASSERT_TRUE(made->setAppAssetPromise(pathPromise("package")));
+    const std::string package = stagePackage(kAtlas, "2.0");
+    write(package, "no package at all");
+    deliver(*made, package);
+    EXPECT_EQ(listener_->waitFor(2).back(), "failed com.example.atlas");
+    EXPECT_TRUE(made->error());
+    EXPECT_TRUE(hasPlaceholder(kAtlas));
+    EXPECT_EQ(number("SELECT state = 0 AND phase = 0 FROM progress"), 1);
+    const Result<ApplicationStatus> status = device().status(kAtlas);
+    ASSERT_TRUE(status.ok());
+    EXPECT_TRUE(status->lastFailure);
+    ASSERT_TRUE(status->coordinator);
+    EXPECT_EQ(status->coordinator->waitsForClient, AppStoreClientID);
+    EXPECT_EQ(status->coordinator->promises.size(), 1U);
+    // Also in the next session.
+    made.reset();
+    endAndForget();
+    const auto again = service().existingCoordinator(kAtlas, AppStoreClientID);
+    ASSERT_NE(again, nullptr);
+    EXPECT_FALSE(again->error());
+    ASSERT_TRUE(again->setAppAssetPromise(pathPromise("package")));
+    deliver(*again, stagePackage(kAtlas, "2.0"));
+    EXPECT_TRUE(device().waitForCoordinatedInstalls(std::chrono::seconds(60)));
+    EXPECT_EQ(application(kAtlas)->bundleVersion, "2.0");
+    EXPECT_FALSE(recordOf(kAtlas));
+}
+
 TEST_F(DeviceCoordinationInstallTest, aFailedUpdateKeepsTheOldVersionAndTheReason) {
     ASSERT_TRUE(install(kAtlas, "1.0"));
     const auto made = prepare(kAtlas, CoordinatorKind::Updating);
