@@ -27,13 +27,20 @@
 #include "host/session/PlugIn.h"
 #include "host/session/Session.h"
 #include "host/session/StopSignals.h"
+#include "host/session/StoreDelivery.h"
 #include "host/session/SyncOutcome.h"
 #include "host/watch/SessionFacts.h"
+#include "platform/InstallCoordinator.h"
+#include "platform/InstallCoordinatorService.h"
+#include "platform/Platform.h"
 
 namespace appsync {
 namespace {
 
 using Clock = std::chrono::steady_clock;
+
+// How often a wait for the device looks whether it is to stop.
+constexpr std::chrono::milliseconds kWaitInterval{50};
 
 Status checkArguments(const SendArguments& arguments) {
     const Status legal = checkIdentifier(arguments.identifier, kUseLegalCharacters);
@@ -102,7 +109,7 @@ class Sending {
 
     // A plug-in that coordinates its installs takes only what it has asked for: the package travels
     // in a session with a staging area of its own.
-    Status checkCoordinated() const {
+    Status checkCoordinated() {
         if (isRestore_) {
             return failure(
                 "the installs of this device are coordinated, and restored packages "
@@ -111,6 +118,10 @@ class Sending {
         }
         const Result<ApplicationStatus> status = device_->status(arguments_.identifier);
         if (!status) return unusable(status.error());
+        if (status->placeholder && isOffloadedSystemApplication(*status->placeholder)) {
+            offloaded_ = status->placeholder;
+            return {};
+        }
         if (status->coordinator && status->coordinator->kind.starts_with("restoring")) {
             return failure("a restore brought " + arguments_.identifier +
                                " back, and its package is the store's to bring",
@@ -146,11 +157,13 @@ class Sending {
         Status status = cancelObsolete(*device_, standing_);
         if (!status) return unusable(status.error());
         status = removeStaleTransfers(*device_, standing_.arrived);
-        if (status && isCoordinated_) status = writeStagingArea(*device_, plan_, library_);
+        if (status && isCoordinated_ && !offloaded_)
+            status = writeStagingArea(*device_, plan_, library_);
         return status;
     }
 
-    SessionEnd holdSession(Session& session) {
+    SessionEnd holdSession(Session& session, InstallCoordinatorService& service) {
+        if (offloaded_) return bringBack(service);
         if (!isCoordinated_) return session.deliver(parcel_);
         return session.sync(
             {[this](const std::string&) { return Result<std::string>(arguments_.file); },
@@ -159,6 +172,43 @@ class Sending {
                         !standing_.arrived.contains(identifier);
              },
              false});
+    }
+
+    // The plug-in never asks for an application of the system, so it comes as the store's do.
+    SessionEnd bringBack(InstallCoordinatorService& service) {
+        const std::string& identifier = arguments_.identifier;
+        device_->letCoordinatedInstallsGo();
+        facts_.reconciled();
+        facts_.requested(identifier);
+        if (const Status sent = sendAsStore(service); !sent) {
+            facts_.failed(identifier, sent.error().description());
+            device_->cancelCoordinator(identifier, SyncClientID).ignore();
+            return {};
+        }
+        while (!device_->waitForCoordinatedInstalls(kWaitInterval)) {
+            if (signals_.stopRequested()) return {};
+        }
+        const Result<ApplicationStatus> status = device_->status(identifier);
+        if (status && status->lastFailure) {
+            facts_.failed(identifier, status->lastFailure->error.description());
+        }
+        return {};
+    }
+
+    Status sendAsStore(InstallCoordinatorService& service) {
+        if (Status awaited = awaitPackage(service, *offloaded_); !awaited) return awaited;
+        const auto coordinator = service.existingCoordinator(arguments_.identifier, SyncClientID);
+        const LibraryPackage* package = library_.find(arguments_.identifier);
+        if (coordinator == nullptr || package == nullptr) {
+            return failure("its install was cancelled", "send it again");
+        }
+        PackageSender sender(*device_);
+        const Result<std::uint64_t> sent = deliverFromStore(
+            service, *coordinator, *package, sender,
+            [this](std::uint64_t, std::uint64_t) { return !signals_.stopRequested(); });
+        if (!sent) return sent.error();
+        facts_.sent(*sent);
+        return {};
     }
 
     static ErrorRecord forbidden() {
@@ -254,7 +304,7 @@ class Sending {
         Result<std::unique_ptr<PlugIn>> plugIn = PlugIn::load(*device_, events_, facts_, console_);
         if (!plugIn) return plugIn.error();
         Session session(*device_, **plugIn, events_, facts_, signals_.stopRequested());
-        const SessionEnd end = holdSession(session);
+        const SessionEnd end = holdSession(session, (*plugIn)->platform().coordination);
         const Result<SessionAftermath> aftermath = aftermathOf(*device_, end, facts_);
         if (!aftermath) {
             finish(summarizeFailed(plan_, facts_, aftermath.error()));
@@ -299,6 +349,7 @@ class Sending {
     bool isCoordinated_ = false;
     bool isRestore_ = arguments_.isRestore;
     unsigned parts_ = arguments_.parts.value_or(kAssetPartApplication);
+    std::optional<ApplicationRecord> offloaded_;  // only an application of the system
     bool plansInstall_ = true;
     const Clock::time_point begin_ = Clock::now();
     std::atomic<bool> isPlanned_ = false;  // the plan is made, and changes no more

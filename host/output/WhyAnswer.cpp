@@ -2,6 +2,7 @@
 
 #include "device/values/DeviceRecords.h"
 #include "host/console/Text.h"
+#include "platform/AppRegistry.h"
 #include "platform/InstallProgressRecord.h"
 
 namespace appsync {
@@ -67,7 +68,12 @@ AwaitedThing awaitedOfSync(const ApplicationRecord& placeholder, bool sessionUnd
                      : awaited("install", "device", "for its install, which is under way");
 }
 
-AwaitedThing awaitedOfOffloaded(bool isCoordinated) {
+AwaitedThing awaitedOfOffloaded(const ApplicationRecord& placeholder, bool isCoordinated) {
+    if (isCoordinated && placeholder.type == kApplicationTypeSystem) {
+        return awaited("store", "store",
+                       "for the store, as it is an offloaded application of the system (appsync "
+                       "store), or send it (appsync send)");
+    }
     if (isCoordinated) {
         return awaited("sync", "host",
                        "for its package, as it is offloaded: run appsync sync with a library that "
@@ -84,7 +90,7 @@ std::optional<AwaitedThing> awaitedOfPlaceholder(const ApplicationRecord& placeh
             return awaitedOfSync(placeholder, sessionUnderWay);
         case kInstallTypeDowngrade:
         case kInstallTypeIntentionalDowngrade:
-            return awaitedOfOffloaded(isCoordinated);
+            return awaitedOfOffloaded(placeholder, isCoordinated);
         case kInstallTypeRestore:
             return awaited("transfer", "host",
                            "for its package, as a restore brought it back: send it (appsync send "

@@ -6,12 +6,11 @@
 #include <string_view>
 #include <utility>
 
-#include "client/Paths.h"
 #include "device/Device.h"
-#include "device/values/PackageIdentifier.h"
 #include "host/console/Problem.h"
 #include "host/plan/LibraryReader.h"
 #include "host/session/PackageSender.h"
+#include "host/session/StoreDelivery.h"
 #include "platform/InstallCoordinator.h"
 #include "platform/InstallCoordinatorService.h"
 
@@ -28,6 +27,7 @@ class Store {
     Result<StoreResult> run() {
         // What was delivered to an earlier session goes on.
         if (Status started = device_.startCoordination(); !started) return started.error();
+        if (Status awaited = awaitSystemApplications(); !awaited) return awaited.error();
         const Result<std::vector<CoordinatorRecord>> coordinators = device_.coordinators();
         if (!coordinators) return unusable(coordinators.error());
         for (const CoordinatorRecord& each : *coordinators) serve(each.identifier);
@@ -40,6 +40,22 @@ class Store {
     }
 
   private:
+    // Nobody asks for offloaded applications of the system.
+    Status awaitSystemApplications() {
+        if (!service_.isCoordinationEnabled()) return {};
+        const Result<std::vector<ApplicationRecord>> records = device_.applications();
+        if (!records) return unusable(records.error());
+        for (const ApplicationRecord& record : *records) {
+            const bool isServed =
+                isOffloadedSystemApplication(record) && library_.find(record.identifier) != nullptr;
+            if (!isServed) continue;
+            const Status awaited = awaitPackage(service_, record);
+            if (awaited) continue;
+            result_.failed.push_back({record.identifier, awaited.error().description()});
+        }
+        return {};
+    }
+
     void serve(const std::string& identifier) {
         const auto coordinator = service_.existingCoordinator(identifier, AppStoreClientID);
         if (coordinator == nullptr) return;
@@ -62,24 +78,10 @@ class Store {
         // An install that fails would take the placeholder away.
         const Status good = verifyPackage(package->file, identifier, device_.propertyLists());
         if (!good) return good;
-        const std::string name = archiveNameOf(identifier);
         const Result<std::uint64_t> sent =
-            sender_.send(package->file, std::string(kPublicStaging), name,
-                         [](std::uint64_t, std::uint64_t) { return true; });
-        if (!sent) return sent.error();
-        const auto path = FileURL::fromPath(std::string(kPublicStaging) + "/" + name, false);
-        auto promise = coordinator.appAssetPromise();
-        if (promise == nullptr) {
-            promise = service_.makePathTransferPromise(identifier + "-Asset", AppStoreClientID,
-                                                       path, package->bytes);
-            const Status set = coordinator.setAppAssetPromise(promise);
-            if (!set) return set;
-        } else {
-            promise->setTransferPath(*path);
-        }
-        promise->setPercentComplete(1.0);
-        promise->setComplete();
-        return {};
+            deliverFromStore(service_, coordinator, *package, sender_,
+                             [](std::uint64_t, std::uint64_t) { return true; });
+        return sent ? Status() : Status(sent.error());
     }
 
     // A package that cannot be read may be the one that is missed.

@@ -412,11 +412,11 @@ def test_data_that_together_has_no_room_is_refused_before_anything_is_changed(ap
     appsync("backup", device.path, tmp_path / "b")
     os.mkdir(tmp_path / "disk")
     script = ("mount -t tmpfs -o size=16m tmpfs {0}/disk && {1} create {0}/disk/d --coordination {2} >&2 && "
-              "{1} send {0}/disk/d {3} {4} >&2 && cp -a {0}/disk/d/root {0}/before && "
+              "{1} send {0}/disk/d {3} {4}/{3}.zip >&2 && {1} store {0}/disk/d {4} >&2 && cp -a {0}/disk/d/root {0}/before && "
               "{1} restore {0}/disk/d {0}/b --json; echo $? >&2; diff -r {0}/before {0}/disk/d/root >&2; echo $? >&2; "
               "mount -o remount,size=24m {0}/disk && {1} restore {0}/disk/d {0}/b >&2; echo $? >&2; "
               "{1} restore {0}/disk/d {0}/b >&2; echo $? >&2"
-              ).format(tmp_path, appsync.program, coordination, IDS[5], os.path.join(store, IDS[5] + ".zip"))
+              ).format(tmp_path, appsync.program, coordination, IDS[5], store)
     done = in_own_mounts(script)
     result = json.loads(done.stdout)
     assert result["restored"] == [] and names_of(result["failed"]) == ["restore"], done.stderr

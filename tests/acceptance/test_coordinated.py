@@ -373,9 +373,8 @@ def test_send_waits_for_what_an_interrupted_staged_sync_has_left(appsync, device
 
 @pytest.mark.parametrize("entry", [{}, {"version": "0.9"}], ids=["no version", "another version"])
 def test_a_staged_package_that_had_arrived_is_not_sent_again(appsync, device, large_library, entry):
-    """Its version is that of the package, whatever the todo list says."""
-    todo = [{"identifier": each, "operation": "install", **entry} for each in (A, B)]
-    stage(device, todo, side_files=[A, B])
+    """Its version is that of the package, whatever the todo list says; no Info.plist stands in the area."""
+    stage(device, [{"identifier": each, "operation": "install", **entry} for each in (A, B)])
     sync = appsync.start("sync", device.path, large_library, "--staged", "--json-lines")
     for line in sync.stdout:
         if json.loads(line)["event"] == "progress":

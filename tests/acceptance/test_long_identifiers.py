@@ -14,7 +14,8 @@ from test_restore import DATA, data_of, tmp_path, write_data
 
 LENGTHS = (250, 251, 252, 255)
 LONG = sorted("x" * (length - 4) + ending for length in LENGTHS for ending in (".one", ".app", ".zip"))
-TOO_LONG = "x" * 256
+EACH_LENGTH = LONG[2::3]  # those that end in ".zip"
+TOO_LONG = "x" * 251 + ".more"
 
 
 @pytest.fixture
@@ -55,12 +56,12 @@ def test_they_are_staged(device, long_library):
 
 
 def test_they_are_sent_run_and_uninstalled(appsync, device, long_library):
-    for identifier in LONG[-3:]:
+    for identifier in EACH_LENGTH:
         appsync("send", device.path, identifier, package_of(long_library, identifier))
-    assert sorted(device.apps()) == LONG[-3:]
-    appsync("run", device.path, LONG[-1])
-    appsync("quit", device.path, LONG[-1])
-    for identifier in LONG[-3:]:
+    assert sorted(device.apps()) == EACH_LENGTH
+    appsync("run", device.path, EACH_LENGTH[-1])
+    appsync("quit", device.path, EACH_LENGTH[-1])
+    for identifier in EACH_LENGTH:
         appsync("uninstall", device.path, identifier)
     assert appsync.json("apps", device.path) == []
 
@@ -103,7 +104,7 @@ def test_restored_packages_wait_for_data_that_is_sent(appsync, device, long_libr
     if device.is_coordinated:
         pytest.skip("there the store brings restored packages")
     (tmp_path / "mine").write_bytes(b"mine")
-    for identifier in LONG[-3:]:
+    for identifier in EACH_LENGTH:
         package = package_of(long_library, identifier)
         appsync("send", device.path, identifier, package, "--restore", "--parts", "1")
         assert identifier not in device.apps()
@@ -122,7 +123,7 @@ def test_one_byte_more_is_refused_wherever_it_enters(appsync, device, tmp_path):
     stage(device, [install(TOO_LONG)])
     errors = [each["error"] for each in device.sync(folder, "--staged", expect=1)["failed"]
               if each["identifier"] == TOO_LONG]
-    assert len(errors) == 1 and limit in errors[0]
+    assert errors and all(limit in each for each in errors)
     assert limit in appsync("send", device.path, TOO_LONG, package, expect=2).stderr
     assert appsync.json("apps", device.path) == []
 

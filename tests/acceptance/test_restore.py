@@ -7,6 +7,7 @@ import pathlib
 import plistlib
 import random
 import shutil
+import sqlite3
 import tempfile
 import time
 import zipfile
