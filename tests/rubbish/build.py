@@ -74,7 +74,10 @@ class Zip:
         self.body, self.directory, self.count = b"", b"", 0
 
     def add(self, name, content=b"", mode=0o100644, packed=None, method=0, local_name=None, crc=None,
-            size=None, packed_size=None, flags=0, extra=b"", version=20, offset=None, system=3):
+            size=None, packed_size=None, flags=0, extra=b"", version=20, offset=None, system=3,
+            local=None, local_extra=None, after=b"", listed=True):
+        """`local` is what the local header says of CRC, packed size and size instead; `after` stands after
+        the contents."""
         name = name if isinstance(name, bytes) else name.encode()
         local_name = name if local_name is None else local_name
         packed = content if packed is None else packed
@@ -84,8 +87,12 @@ class Zip:
         at = len(self.body) if offset is None else offset
         head = struct.pack("<HHHHHIII", version, flags, method, 0, 0x21, crc, packed_size, size)
         if offset is None:
-            self.body += b"PK\3\4" + head + struct.pack("<HH", len(local_name), len(extra))
-            self.body += local_name + extra + packed
+            local_extra = extra if local_extra is None else local_extra
+            local_head = head if local is None else head[:10] + struct.pack("<III", *local)
+            self.body += b"PK\3\4" + local_head + struct.pack("<HH", len(local_name), len(local_extra))
+            self.body += local_name + local_extra + packed + after
+        if not listed:
+            return self
         self.directory += b"PK\1\2" + struct.pack("<BB", 20, system) + head + struct.pack(
             "<HHHHHII", len(name), len(extra), 0, 0, 0, mode << 16, at) + name + extra
         self.count += 1
@@ -106,6 +113,13 @@ class Zip:
         large = b"PK\6\6" + struct.pack("<QHHIIQQQQ", 44, 45, 45, 0, 0, count, count, size, at)
         locator = b"PK\6\7" + struct.pack("<IQI", 0, len(self.body) + len(self.directory), 1)
         return self.end(count=0xFFFF, size=0xFFFFFFFF, at=0xFFFFFFFF, before=large + locator)
+
+
+def descriptor(content, packed=None, signature=b"PK\7\10", width="I", **lies):
+    """What follows the contents of an entry that was streamed."""
+    packed = content if packed is None else packed
+    told = {"crc": zlib.crc32(content), "packed_size": len(packed), "size": len(content), **lies}
+    return signature + struct.pack("<I" + 2 * width, told["crc"], told["packed_size"], told["size"])
 
 
 def zip_of(items):

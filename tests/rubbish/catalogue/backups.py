@@ -5,7 +5,7 @@ import os
 import plistlib
 import shutil
 
-from build import Zip, array_of, binary_list, text, zeros, zip_of
+from build import Zip, array_of, binary_list, descriptor, text, zeros, zip_of
 from conftest import APPS
 from entry import Entry
 
@@ -243,6 +243,10 @@ DATA = [
     data("the same name twice", Zip().add("a", b"x").add("a", b"y").end(), "twice"),
     data("a file as a directory", Zip().add("a", b"x").add("a/b", b"y").end(), "a"),
     data("a wrong CRC", Zip().add("a", b"x", crc=1).end(), "a"),
+    data("streamed", Zip().add("a", b"x", flags=8, local=(0, 0, 0), after=descriptor(b"x")).end(), status=0),
+    data("another CRC in the descriptor",
+         Zip().add("a", b"x", flags=8, local=(0, 0, 0), after=descriptor(b"x", crc=7)).end(), "'a'"),
+    data("an entry that the directory hides", Zip().add("a", b"x").add("b", b"y", listed=False).end(), "no entry"),
     data("encrypted", Zip().add("a", b"x", flags=1).end(), "encrypted"),
     data("more bytes than told", Zip().add("a", bytes(10), packed=zeros(1 << 20), method=8).end(), "a"),
     data("more bytes than there is room for",
@@ -252,7 +256,7 @@ DATA = [
     data("2^64 - 1 entries told", Zip().add("a", b"x").end64(count=2**64 - 1)),
     data("NUL in a name", Zip().add(b"a\0b", b"x").end()),
     data("a name of 300 bytes", Zip().add("n" * 300, b"x").end()),
-    data("a name 1,900 deep", Zip().add("d/" * 1900 + "f", b"x").end(), status=0),
+    data("a name 400 deep", Zip().add("d/" * 400 + "f", b"x").end(), status=0),
     data("a name longer than any path", Zip().add("d/" * 2001 + "f", b"x").end()),
     data("setuid", Zip().add("a", b"x", mode=0o104777).end(), status=0),
 ]

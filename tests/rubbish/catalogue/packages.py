@@ -6,7 +6,7 @@ import struct
 import zlib
 
 import packages
-from build import Zip, zeros, zip_of
+from build import Zip, descriptor, zeros, zip_of
 from entry import Entry, both_are_there
 
 BAD = "com.example.bad"
@@ -125,6 +125,64 @@ ARCHIVES = [
     shown("an extra field cut off",
           bundle(dict(name="Bad.app/a", content=b"x", extra=struct.pack("<HH", 1, 400))).end(), ""),
     shown("100,001 entries", lambda place: many(100_001), "more files than"),
+]
+
+
+def streamed(after, **more):
+    """An entry whose CRC and sizes stand after its contents."""
+    return bundle({"name": "Bad.app/a", "content": b"x", "flags": 8, "local": (0, 0, 0), "after": after, **more},
+                  ("Bad.app/b", b"y")).end()
+
+
+def large(*sizes):
+    return struct.pack("<HH%dQ" % len(sizes), 1, 8 * len(sizes), *sizes)
+
+
+ELSEWHERE = 0xFFFFFFFF
+FORMS = [("signed", {}), ("bare", {"signature": b""}), ("large and signed", {"width": "Q"}),
+         ("large and bare", {"width": "Q", "signature": b""})]
+
+HEADERS = [
+    *[shown("a descriptor, " + form, streamed(descriptor(b"x", **more)), "", 0) for form, more in FORMS],
+    *[shown("a descriptor, %s, with another %s" % (form, lie), streamed(descriptor(b"x", **more, **{lie: 7})), "Bad.app/a")
+      for form, more in FORMS for lie in ("crc", "packed_size", "size")],
+    shown("a descriptor that is not announced", bundle(
+        dict(name="Bad.app/a", content=b"x", after=descriptor(b"x"))).end(), "belong to no entry"),
+    shown("a descriptor that is missing", streamed(b""), "Bad.app/a"),
+    shown("two descriptors", streamed(2 * descriptor(b"x")), "belong to no entry"),
+    shown("another size beside a descriptor", streamed(descriptor(b"x"), local=(0, 0, 2)), "another size"),
+    shown("another packed size beside a descriptor", streamed(descriptor(b"x"), local=(0, 9, 0)), "another packed size"),
+    shown("another CRC beside a descriptor", streamed(descriptor(b"x"), local=(9, 0, 0)), "another CRC"),
+    shown("no sizes and no descriptor", bundle(dict(name="Bad.app/a", content=b"x", local=(0, 0, 0))).end(), "Bad.app/a"),
+    shown("large sizes that are not needed",
+          bundle(dict(name="Bad.app/a", content=b"x", extra=large(1, 1))).end(), "", 0),
+    shown("large sizes in the local header alone",
+          bundle(dict(name="Bad.app/a", content=b"x", local=(zlib.crc32(b"x"), ELSEWHERE, ELSEWHERE),
+                      local_extra=large(1, 1))).end(), "", 0),
+    shown("large sizes that are not needed and not true",
+          bundle(dict(name="Bad.app/a", content=b"x", extra=large(1, 2))).end(), "Bad.app/a"),
+    shown("large sizes in the local header that are not true",
+          bundle(dict(name="Bad.app/a", content=b"x", local=(zlib.crc32(b"x"), ELSEWHERE, ELSEWHERE),
+                      local_extra=large(1 + 2**32, 1))).end(), "another size"),
+    shown("large sizes twice", bundle(dict(name="Bad.app/a", content=b"x", size=ELSEWHERE, packed_size=ELSEWHERE,
+                                           extra=large(1, 1) + large(9, 9))).end(), "Bad.app/a"),
+    shown("large sizes that are missing",
+          bundle(dict(name="Bad.app/a", content=b"x", size=ELSEWHERE)).end(), "Bad.app/a"),
+    shown("extra fields of the local header alone",
+          bundle(dict(name="Bad.app/a", content=b"x", local_extra=b"UT\5\0\1abcd")).end(), "", 0),
+    shown("extra fields of the local header that are cut off",
+          bundle(dict(name="Bad.app/a", content=b"x", local_extra=b"UT\5\0\1")).end(), "Bad.app/a"),
+    shown("an entry that the directory hides",
+          bundle(dict(name="Bad.app/hidden", content=b"x", listed=False), ("Bad.app/b", b"y")).end(), "belong to no entry"),
+    shown("an entry that the directory hides at the end",
+          bundle(dict(name="Bad.app/hidden", content=b"x", listed=False)).end(), "belong to no entry"),
+    shown("an entry that the directory hides in front",
+          Zip().add("Bad.app/hidden", b"x", listed=False).add("Bad.app/Info.plist", INFO).end(), "belong to no entry"),
+    shown("an entry that reaches into the next",
+          bundle(dict(name="Bad.app/a", content=b"x", packed_size=2, size=2), ("Bad.app/b", b"y")).end(), "overlaps"),
+    shown("an entry that reaches into the directory",
+          bundle(dict(name="Bad.app/a", content=b"x", packed_size=2, size=2)).end(), "overlaps"),
+    shown("a gap before the end", bundle().end(before=b"gap"), ""),
 ]
 
 BOMBS = [
@@ -292,4 +350,4 @@ SYNCED = [
           1, "archive", "com.example.app00", also=both_are_there),
 ]
 
-ENTRIES = NAMES + KINDS + ARCHIVES + BOMBS + CONTENTS + SYNCED
+ENTRIES = NAMES + KINDS + ARCHIVES + HEADERS + BOMBS + CONTENTS + SYNCED
