@@ -5,10 +5,11 @@
 
 namespace appsync {
 
-/// Holds a reading to its limits: a second of the processor, and 64 MiB of memory. In a release
-/// build that is what the process has grown by since it began; under AddressSanitizer what the
-/// reading has asked for and not given back at any time; under ThreadSanitizer, whose own memory
-/// grows with what the program has ever touched, nothing.
+/// Holds a reading to its limits: a second of the processor, and 64 MiB of memory. The second holds
+/// where no sanitizer adds to it. In a release build the memory is what the process has grown by
+/// since it began; under AddressSanitizer what the reading has asked for and not given back at any
+/// time; under ThreadSanitizer, whose own memory grows with what the program has ever touched,
+/// nothing.
 class Limits {
   public:
     /// Begins the measurement of one reading.

@@ -8,7 +8,8 @@ import os
 import pathlib
 import shutil
 import sqlite3
-from typing import Callable, Optional
+import stat
+from typing import Callable, Optional, Union
 
 from conftest import APPS, DEEP
 
@@ -23,7 +24,7 @@ class Entry:
     name: str
     make: Callable
     command: tuple  # words; "{input}" and the like are paths of the place
-    status: Optional[int]  # None: 0 or 1, as it comes
+    status: Union[int, tuple]  # more than one only where docs/reliability.md says why
     says: str = ""  # a piece of what standard error, or the failure, says
     identifier: Optional[str] = None  # of the failure in the JSON object that is printed
     device: str = "used-direct"  # which template the device is a copy of
@@ -47,6 +48,7 @@ class Place:
         self.hostile = self.deep / "hostile"  # a library of the entry's own
         self.backup = self.deep / "backup"
         self.out = self.deep / "device" / "out"
+        self.before = {}  # the device's tree before the command
         if device:
             shutil.copytree(self.templates / device, self.device, symlinks=True)
 
@@ -92,24 +94,36 @@ class Place:
                  for name in ("input", "device", "library", "hostile", "backup", "out", "outside")}
         return [word.format(**paths) if "{" in word else word for word in command]
 
-    def tree(self):
+    def outside_tree(self):
         """Everything outside the device: kind, mode, time of change and content of each path."""
+        return {path: appearance(path) for path in self.paths_below(self.top)}
+
+    def device_tree(self):
+        """The kind and content of each file and directory that the device keeps."""
         found = {}
-        for base, folders, files in os.walk(self.top):
+        for path in self.paths_below(self.device / "root"):
+            mode, _, content = appearance(path)
+            found[os.path.relpath(path, self.device / "root")] = (stat.S_IFMT(mode), content)
+        return found
+
+    def paths_below(self, folder):
+        for base, folders, files in os.walk(folder):
             if pathlib.Path(base) == self.deep and "device" in folders:
                 folders.remove("device")
             for name in folders + files:
-                path = os.path.join(base, name)
-                status = os.lstat(path)
-                content = b""
-                if os.path.islink(path):
-                    content = os.readlink(path).encode()
-                elif os.path.isfile(path):
-                    with open(path, "rb") as file:
-                        content = hashlib.sha256(file.read()).digest()
-                changed = 0 if os.path.isdir(path) else status.st_mtime_ns
-                found[path] = (status.st_mode, changed, content)
-        return found
+                yield os.path.join(base, name)
+
+
+def appearance(path):
+    status = os.lstat(path)
+    content = b""
+    if os.path.islink(path):
+        content = os.readlink(path).encode()
+    elif os.path.isfile(path):
+        with open(path, "rb") as file:
+            content = hashlib.sha256(file.read()).digest()
+    changed = 0 if os.path.isdir(path) else status.st_mtime_ns
+    return status.st_mode, changed, content
 
 
 def both_are_there(place, done):

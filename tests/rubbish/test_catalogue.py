@@ -38,7 +38,8 @@ def note_costs(kind, entry, done):
     """One line for each entry, where somebody asks for them."""
     if file := os.environ.get("APPSYNC_RUBBISH_COSTS"):
         with open(file, "a") as costs:
-            costs.write("%.3f s %7d KiB  %s: %s\n" % (done.seconds, done.kilobytes, kind, entry.name))
+            costs.write("%.3f s %7d KiB  status %d  %s: %s\n" % (
+                done.seconds, done.kilobytes, done.status, kind, entry.name))
 
 
 @pytest.mark.parametrize("kind, entry", ENTRIES,
@@ -49,25 +50,25 @@ def test_outcome(kind, entry, appsync, templates, scratch, base):
         made = entry.make(place)
         if made is not None:
             place.input.write_bytes(made)
-        before = place.tree()
+        outside, place.before = place.outside_tree(), place.device_tree()
         done = appsync(*place.words(entry.command), directory=place.deep)
         note_costs(kind, entry, done)
         assert not done.late, "it hangs"
-        if entry.status is not None:
-            assert done.status == entry.status, done.out[-2000:] + done.err[-2000:]
-        assert place.tree() == before
+        right = entry.status if isinstance(entry.status, tuple) else (entry.status,)
+        assert done.status in right, (done.status, done.out[-2000:] + done.err[-2000:])
+        assert place.outside_tree() == outside
         if entry.identifier is not None:
             told = [error for identifier, error in failures_in(done) if identifier == entry.identifier]
             assert told, done.out
             assert any(entry.says in error for error in told), told
         else:
             assert entry.says in done.err, done.err
-        assert done.status in (0, 1, 2, 3), done.err
         if done.status in (2, 3):
             assert done.err.count("\n") == 1, done.err
         if entry.also:
             entry.also(place, done)
-        assert done.seconds <= SECONDS
+        if not appsync.is_sanitized:  # there it is the sanitizer's time, and enough that it ends
+            assert done.seconds <= SECONDS
         # A sanitizer's own memory is there before anything is read.
         limit = KILOBYTES + (base if appsync.is_sanitized else 0)
         assert done.kilobytes <= limit, done.kilobytes

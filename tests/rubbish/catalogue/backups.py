@@ -148,9 +148,20 @@ def restored(name, file, content, status=0, identifier=None, says="", also=both_
 
 def info(name, content, also, **more):
     """On both paths."""
-    return [restored("restore information, " + name + suffix, "RestoreApplications.plist", content, also=also,
-                     device=device, **more)
-            for suffix, device in (("", "empty-direct"), (", coordinated", "empty-coordinated"))]
+    return direct_info(name, content, also, **more) + coordinated_info(name, content, also, **more)
+
+
+def direct_info(name, content, also, **more):
+    return [restored("restore information, " + name, "RestoreApplications.plist", content, also=also, **more)]
+
+
+def coordinated_info(name, content, also, **more):
+    return [restored("restore information, " + name + ", coordinated", "RestoreApplications.plist", content, also=also,
+                     device="empty-coordinated", **more)]
+
+
+def titled(title, version="1"):
+    return entry_with(VessikMetadata=plistlib.dumps({"title": title, "bundleVersion": version}))
 
 
 def entry_with(**parts):
@@ -173,13 +184,12 @@ RESTORE_INFOS = [
     *info("metadata that is an array", entry_with(VessikMetadata=plistlib.dumps([1])), a_came, status=1, identifier=B),
     *info("metadata nested deeply", entry_with(VessikMetadata=b"<plist>" + b"<dict><key>a</key>" * 10_000), a_came,
           status=1, identifier=B),
-    *info("a title that is a number",
-          entry_with(VessikMetadata=plistlib.dumps({"title": 7, "bundleVersion": "1"})), a_came, status=None),
-    *info("a title of a megabyte",
-          entry_with(VessikMetadata=plistlib.dumps({"title": "x" * 1_000_000, "bundleVersion": "1"})), a_came, status=None),
-    *info("a title that climbs",
-          entry_with(VessikMetadata=plistlib.dumps({"title": "../../../evil", "bundleVersion": "../../x"})), a_came,
-          status=None),
+    # Directly the title names a placeholder's bundle, and must be fit for that.
+    *direct_info("a title that is a number", titled(7), a_came, status=1, identifier=B),
+    *coordinated_info("a title that is a number", titled(7), both_came),
+    *direct_info("a title of a megabyte", titled("x" * 1_000_000), a_came, status=1, identifier=B),
+    *coordinated_info("a title of a megabyte", titled("x" * 1_000_000), both_came),
+    *info("a title that climbs", titled("../../../evil", "../../x"), both_came),
     *info("an icon that is no picture", entry_with(PlaceholderIcon=b"\xff" * 1000), both_came),
     *info("an icon that is text", entry_with(PlaceholderIcon="text"), both_came),
     *info("an icon of eight megabytes", entry_with(PlaceholderIcon=bytes(8 << 20)), both_came),
@@ -205,10 +215,11 @@ LISTS = [
       for name, content, device in (
           ("identifiers that climb", {"AutomaticDowngrades": ["../../x", ""]}, "empty-coordinated"),
           ("50,000 identifiers", {"AutomaticDowngrades": ["n%d" % n for n in range(50_000)]}, "empty-coordinated"))],
-    *[restored("icon order, " + name, "IconOrder.plist", content, status=None)
-      for name, content in (
-          ("empty", b""), ("not a property list", b"\xff" * 50), ("a map", {"a": 1}), ("odd things", [1, [A], {}]),
-          ("identifiers that climb", ["../../x", "", "a\n", A]), ("50,000 of one", [A] * 50_000))],
+    *[restored("icon order, " + name, "IconOrder.plist", content, status=1, identifier="IconOrder.plist")
+      for name, content in (("empty", b""), ("not a property list", b"\xff" * 50), ("a map", {"a": 1}))],
+    *[restored("icon order, " + name, "IconOrder.plist", content)
+      for name, content in (("odd things", [1, [A], {}]), ("identifiers that climb", ["../../x", "", "a\n", A]),
+                            ("50,000 of one", [A] * 50_000))],
 ]
 
 

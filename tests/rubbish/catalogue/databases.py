@@ -14,12 +14,18 @@ LOOKS = (("apps", "{device}", "--json"), ("history", "{device}", "--json"), ("wh
          ("inventory", "{device}", "--json"), ("coordinator", "{device}", "list", "--json"))
 SYNC = ("sync", "{device}", "{library}", "--json")
 LARGEST, SMALLEST = 2**63 - 1, -(2**63)
+# What each session clears: the work area and what is there for a while.
+PASSING = ("var/mobile/Library/ApplicationSync/", "var/mobile/tmp/")
+# Where damage lies in what the command reads it is refused; else it is not seen. Which, the content decides.
+SEEN_OR_NOT = (0, 3)
 
 
-def unharmed(place, done):
-    """Nothing of the device's files has gone."""
-    assert place.inside("/var/mobile/Media/PublicStaging").is_dir()
-    assert place.inside("/var/containers/Bundle/Application").is_dir()
+def unharmed(place, done, but=()):
+    """Nothing of the device's files has gone or changed, but for what lies below some paths."""
+    now = place.device_tree()
+    lost = sorted(path for path, what in place.before.items()
+                  if now.get(path) != what and not path.startswith((*PASSING, *but)))
+    assert lost == [], lost
 
 
 def unusable(name, make, says, command=SYNC, status=3, also=unharmed):
@@ -88,23 +94,23 @@ FILES = [
              "not a file"),
     unusable("missing", written(lambda path, place: None), "device.db"),
     unusable("cut in half", changed(lambda whole: whole[:len(whole) // 2]), "damaged"),
-    unusable("cut off in a page", changed(lambda whole: whole[:-1000]), "", status=None),
+    unusable("cut off in a page", changed(lambda whole: whole[:-1000]), "", status=0),
     unusable("one page", changed(lambda whole: whole[:4096]), "damaged"),
     unusable("zeros after the first page", changed(lambda whole: whole[:4096] + bytes(len(whole) - 4096)), "damaged"),
     unusable("a page size of 3", changed(put(16, b"\0\3")), "damaged"),
     unusable("a format of a far future", changed(put(18, b"\x09\x09")), ""),
-    unusable("2^32 - 1 pages", changed(put(28, b"\xff" * 4)), "", status=None),
+    unusable("2^32 - 1 pages", changed(put(28, b"\xff" * 4)), ""),
     unusable("a free list that goes in a circle", changed(put(32, b"\0\0\0\1\0\0\0\xff")), ""),
-    unusable("text as UTF-16", changed(put(56, b"\0\0\0\3")), "", status=None),
+    unusable("text as UTF-16", changed(put(56, b"\0\0\0\3")), ""),
     unusable("a wal of rubbish", lambda place: (place.device / "device.db-wal").write_bytes(b"\xff" * 10_000) and None,
-             "", status=None),
+             "", status=0),
     unusable("a journal that is not its own",
              lambda place: (place.device / "device.db-journal").write_bytes(b"\xd9\xd5\x05\xf9 \xa1c\xd7" + bytes(600))
-             and None, "", status=None),
+             and None, "", status=0),
     unusable("a wal that is a link out of the device", lambda place: [
         (place.device / each).unlink() for each in ("device.db-wal", "device.db-shm")
         if (place.device / each).exists()] and None or (place.device / "device.db-wal").symlink_to(
-            place.outside / "secret"), "", status=None),
+            place.outside / "secret"), ""),
 ]
 
 
@@ -119,7 +125,7 @@ def flipped(number):
     return changed(change)
 
 
-PAGES = [unusable("pages of rubbish, choice %d" % number, flipped(number), "", command, None)
+PAGES = [unusable("pages of rubbish, choice %d" % number, flipped(number), "", command, SEEN_OR_NOT)
          for number, command in enumerate((SYNC,) * 4 + LOOKS)]
 
 SCHEMAS = [
@@ -157,7 +163,20 @@ SCHEMAS = [
 
 
 def container(value):
-    return altered(("UPDATE applications SET container = ? WHERE identifier = ?", (value, A)))
+    """A's record names another container than its own, which no record names then."""
+    def make(place):
+        place.forgotten = os.path.relpath(place.container_of(A), place.device / "root")
+        place.alter(("UPDATE applications SET container = ? WHERE identifier = ?", (value, A)))
+
+    return make
+
+
+def unharmed_but_the_forgotten_container(place, done):
+    unharmed(place, done, [place.forgotten])
+
+
+def unharmed_but_the_data_of_a(place, done):
+    unharmed(place, done, ["var/mobile/Containers/Data/" + A])
 
 
 def with_bytes_that_are_no_text(column):
@@ -165,11 +184,12 @@ def with_bytes_that_are_no_text(column):
 
 
 VALUES = [
-    *[Entry("a container %r, %s" % (value[:20], command[0]), container(value), command, None, also=unharmed)
+    *[Entry("a container %r, %s" % (value[:20], command[0]), container(value), command, 0, also=also)
       for value in ("../../../mobile", "..", ".", "", "/", "../../../../../../../../outside")
-      for command in (("uninstall", "{device}", A), SYNC, ("apps", "{device}"))],
+      for command, also in ((("uninstall", "{device}", A), unharmed_but_the_data_of_a),
+                            (SYNC, unharmed_but_the_forgotten_container), (("apps", "{device}"), unharmed))],
     Entry("a bundle that climbs, backup", altered(("UPDATE applications SET bundle = ?", ("../" * 14 + "outside",))),
-          ("backup", "{device}", "{device}/backup"), None, also=unharmed),
+          ("backup", "{device}", "{device}/backup"), 3, also=unharmed),
     Entry("an icon that climbs, screen", altered(("UPDATE applications SET icon = ?", ("../" * 14 + "outside/secret",))),
           ("screen", "{device}", "{out}"), 0, also=unharmed),
     Entry("an icon that is absolute, screen", altered("UPDATE applications SET icon = '/etc/passwd'"),
@@ -177,12 +197,12 @@ VALUES = [
     Entry("a name of a megabyte, screen", altered(("UPDATE applications SET name = ?", ("\u00e9" * 500_000,))),
           ("screen", "{device}", "{out}"), 0),
     Entry("an identifier that climbs, uninstall", altered("UPDATE applications SET identifier = '../../mobile'"
-                                                          " WHERE identifier = '%s'" % A), SYNC, None, also=unharmed),
-    *[Entry("%s of bytes that are no text, %s" % (column, " ".join(command[::2])), with_bytes_that_are_no_text(column), command, None)
+                                                          " WHERE identifier = '%s'" % A), SYNC, 0, also=unharmed),
+    *[Entry("%s of bytes that are no text, %s" % (column, " ".join(command[::2])), with_bytes_that_are_no_text(column), command, 0)
       for column in ("name", "version", "type") for command in (LOOKS[0], ("apps", "{device}"))],
     Entry("a name that takes over the terminal", altered("UPDATE applications SET name = char(27) || '[2J' || char(10)"),
           ("apps", "{device}"), 0, also=lambda place, done: both_lines(done)),
-    Entry("a type that nobody knows", altered("UPDATE applications SET type = 'x'"), SYNC, None),
+    Entry("a type that nobody knows", altered("UPDATE applications SET type = 'x'"), SYNC, 0),
 ]
 
 
@@ -214,7 +234,7 @@ ROWS = ("INSERT OR IGNORE INTO session VALUES (1, 1, 1)",
 def numbers(table, value, command, device):
     sets = ", ".join("%s = %d" % (column, value) for column in TABLES[table])
     return Entry("%s full of %d, %s%s" % (table, value, command[0], "" if device == "used-direct" else ", coordinated"),
-                 altered(*ROWS, "UPDATE OR IGNORE %s SET %s" % (table, sets)), command, None, device=device, also=unharmed)
+                 altered(*ROWS, "UPDATE OR IGNORE %s SET %s" % (table, sets)), command, 0, device=device, also=unharmed)
 
 
 NUMBERS = [numbers(table, value, command, device)
@@ -230,20 +250,20 @@ NUMBERS = [numbers(table, value, command, device)
 
 BLOBS = [
     Entry("an icon layout of rubbish", altered(("INSERT OR REPLACE INTO icon_layout VALUES (1, ?)", (b"\xff" * 100,))),
-          SYNC, None, also=unharmed),
+          SYNC, 0, also=unharmed),
     Entry("an icon layout of rubbish, screen",
           altered(("INSERT OR REPLACE INTO icon_layout VALUES (1, ?)", (b"bplist00" + b"\xff" * 100,))),
           ("screen", "{device}", "{out}"), 0),
     Entry("install options of rubbish", altered(*ROWS, ("UPDATE coordinators SET options = ?", (b"bplist00\xff",))),
-          SYNC, None, device="used-coordinated", also=unharmed),
+          SYNC, 0, device="used-coordinated", also=unharmed),
     Entry("the path of a promise that climbs",
           altered(*ROWS, ("UPDATE promises SET path = ?, complete = 1", ("../" * 14 + "outside/secret",)),
                   "UPDATE coordinators SET options = X'62706c697374', initial_assets = 1, placeholder = 2"),
-          SYNC, None, device="used-coordinated", also=unharmed),
+          SYNC, 0, device="used-coordinated", also=unharmed),
     Entry("the path of a promise to a file of the device",
           altered(*ROWS, ("UPDATE promises SET path = ?, complete = 1", ("/var/mobile/Media/PublicStaging",)),
                   "UPDATE coordinators SET options = X'62706c697374', initial_assets = 1, placeholder = 2"),
-          SYNC, None, device="used-coordinated", also=unharmed),
+          SYNC, 0, device="used-coordinated", also=unharmed),
 ]
 
 

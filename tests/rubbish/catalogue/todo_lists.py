@@ -107,9 +107,10 @@ LEGAL = ["-rf"]
 
 IDENTIFIERS = [
     *[staged("install of " + repr(each)[:30], [install(each)], also=nothing_was_done) for each in HOSTILE],
-    *[staged("removal of " + repr(each)[:30], [remove(each)], status=None, also=nothing_was_done) for each in HOSTILE],
+    *[staged("removal of " + repr(each)[:30], [remove(each)], status=0 if each in LEGAL else 1, also=nothing_was_done)
+      for each in HOSTILE],
     staged("install of an identifier with NUL", [install(A + "\0x")], also=nothing_was_done),
-    staged("removal of an identifier with NUL", [remove(A + "\0x")], status=None, also=nothing_was_done),
+    staged("removal of an identifier with NUL", [remove(A + "\0x")], also=nothing_was_done),
     *[Entry("%s %r" % (words[0], words[-1]), lambda place: None, words, 2, "identifier", also=both_are_there)
       for each in ("../x", "a/b", "..", "x" * 256, "a\x1bb")
       for words in (("uninstall", "{device}", each), ("run", "{device}", each), ("why", "{device}", each))],
@@ -170,13 +171,13 @@ def area_outside(place):
 
 LINKS = [
     linked("the todo list is one that leads outside", LIST, lambda place: area_outside(place) / "ApplicationsSync.plist",
-           None),
-    linked("the staging area is one that leads outside", AREA, area_outside, None),
+           1),
+    linked("the staging area is one that leads outside", AREA, area_outside, 1),
     linked("the public staging directory is one that leads outside", "/var/mobile/Media/PublicStaging",
-           lambda place: place.outside, None),
+           lambda place: place.outside, 0),
     linked("the work area is one that leads outside", "/var/mobile/Library/ApplicationSync",
-           lambda place: place.outside, None),
-    linked("the todo list is one to itself", LIST, lambda place: "ApplicationsSync.plist", None),
+           lambda place: place.outside, 1),
+    linked("the todo list is one to itself", LIST, lambda place: "ApplicationsSync.plist", 1),
 ]
 
 ENTRIES = UNUSABLE + ENTRIES_OF_LISTS + IDENTIFIERS + ORDERS + LINKS
