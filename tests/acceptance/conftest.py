@@ -7,13 +7,19 @@ import subprocess
 import pytest
 
 import packages
+from processes import leave_out_what_measures, with_default_signals
 
 TIMEOUT = float(os.environ.get("APPSYNC_TEST_TIMEOUT", "120"))
+
+
+def pytest_collection_modifyitems(config, items):
+    leave_out_what_measures(config, items)
 
 
 class Command:
     def __init__(self, program):
         self.program = program
+        self.started = []
 
     def __call__(self, *arguments, expect=0, timeout=TIMEOUT, text=True):
         """Runs the command to its end; `expect` is the exit status that must come (None: any)."""
@@ -23,6 +29,7 @@ class Command:
             capture_output=True,
             text=text,
             timeout=timeout,
+            preexec_fn=with_default_signals,
         )
         if expect is not None:
             assert done.returncode == expect, "%s -> %s\n%s\n%s" % (
@@ -32,10 +39,19 @@ class Command:
     def json(self, *arguments, expect=0, **more):
         return json.loads(self(*arguments, "--json", expect=expect, **more).stdout)
 
-    def start(self, *arguments):
-        return subprocess.Popen(
-            [self.program, *map(str, arguments)],
-            stdin=subprocess.DEVNULL, stdout=subprocess.PIPE, stderr=subprocess.PIPE, text=True)
+    def start(self, *arguments, stdout=subprocess.PIPE):
+        process = subprocess.Popen(
+            [self.program, *map(str, arguments)], stdin=subprocess.DEVNULL, stdout=stdout,
+            stderr=subprocess.PIPE, text=True, preexec_fn=with_default_signals)
+        self.started.append(process)
+        return process
+
+    def end_all(self):
+        """What a test that failed has left running."""
+        for process in self.started:
+            process.kill()
+            process.wait()
+        self.started.clear()
 
 
 class Device:
@@ -85,6 +101,12 @@ def appsync():
     return Command(os.path.abspath(program))
 
 
+@pytest.fixture(autouse=True)
+def nothing_runs_on(appsync):
+    yield
+    appsync.end_all()
+
+
 @pytest.fixture(params=["off", "on"])
 def coordination(request):
     """Every scenario runs on both paths: direct, and through coordinators."""
@@ -93,6 +115,9 @@ def coordination(request):
 
 # For what is the same on both paths, and takes long.
 ON_ONE_PATH = pytest.mark.parametrize("coordination", ["off"], indirect=True)
+# For what one of the paths alone has.
+DIRECTLY = ON_ONE_PATH
+COORDINATED = pytest.mark.parametrize("coordination", ["on"], indirect=True)
 
 
 @pytest.fixture

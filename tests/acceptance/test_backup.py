@@ -14,7 +14,7 @@ import zipfile
 import pytest
 
 import packages
-from conftest import ON_ONE_PATH, Device, names_of
+from conftest import COORDINATED, DIRECTLY, ON_ONE_PATH, Device, names_of
 from test_device import in_own_mounts
 from test_restore import (DATA, IDS, ORDER, PROCESSED_INFO, RESTORE_INFO, backup, data_of, fresh, resign,
                           restore, screen_of, store, tmp_path, used, write_data)
@@ -504,9 +504,8 @@ def test_restore_takes_over_what_an_interrupted_sync_was_about_to_bring(appsync,
     assert restored[left[-1]] != "9.0"
 
 
+@COORDINATED
 def test_application_that_another_client_installs_is_named(appsync, backup, fresh):
-    if not fresh.is_coordinated:
-        pytest.skip("nobody else installs there")
     appsync("coordinator", fresh.path, "create", IDS[0])
     result = restore(fresh, backup, expect=1)
     assert names_of(result["failed"]) == [IDS[0]] and "client 2" in result["failed"][0]["error"]
@@ -547,9 +546,8 @@ def test_files_that_cannot_be_sent_are_named_and_nothing_is_sent(appsync, backup
     stripped(appsync("send", fresh.path, "", package, expect=2).stderr)
 
 
+@COORDINATED
 def test_what_is_the_stores_to_bring_is_not_sent(appsync, backup, fresh, store):
-    if not fresh.is_coordinated:
-        pytest.skip("there it is the host's")
     restore(fresh, backup)
     package = os.path.join(store, IDS[0] + ".zip")
     for options in ([], ["--restore"], ["--restore", "--parts", "2"], ["--restore", "--parts", "3"]):
@@ -567,9 +565,8 @@ def test_data_without_a_package_that_waits_is_refused(appsync, backup, fresh):
     assert names_of(json.loads(done.stdout)["failed"]) == [IDS[1]]
 
 
+@COORDINATED
 def test_store_killed_at_random_moments_and_run_again(appsync, backup, store, tmp_path, coordination):
-    if coordination == "off":
-        pytest.skip("nothing waits for the store there")
     wanted = sorted(each for each in IDS if each not in IDS[2:4])
     choose = random.Random(8)
     for attempt in range(5):
@@ -585,9 +582,8 @@ def test_store_killed_at_random_moments_and_run_again(appsync, backup, store, tm
         assert [each["identifier"] for each in restore(device, backup)["screen"]] == ORDER
 
 
+@DIRECTLY
 def test_send_of_a_restore_killed_at_random_moments_and_run_again(appsync, backup, store, tmp_path, coordination):
-    if coordination == "on":
-        pytest.skip("there the store brings restored packages")
     package = os.path.join(store, IDS[1] + ".zip")
     archive = os.path.join(backup, "data", IDS[1] + ".zip")
     choose = random.Random(9)
@@ -658,9 +654,8 @@ def test_store_names_packages_that_it_cannot_read(appsync, backup, fresh, store)
     assert failed == [IDS[0], IDS[0] + ".zip"]
 
 
+@COORDINATED
 def test_damaged_package_is_not_delivered_by_the_store(appsync, backup, fresh, store, tmp_path):
-    if not fresh.is_coordinated:
-        pytest.skip("nothing waits for the store there")
     restore(fresh, backup)
     damaged_package(tmp_path / "damaged", IDS[1])
     failed = appsync.json("store", fresh.path, tmp_path / "damaged", expect=1)["failed"]

@@ -399,7 +399,7 @@ def test_turning_coordination_off_drops_what_stands_and_says_so(appsync, device,
 
 def test_interrupt_while_a_coordinated_install_waits(appsync, device, library, waiting_update):
     waiting_update.send_signal(signal.SIGINT)
-    out, err = waiting_update.communicate(timeout=15)
+    out, err = waiting_update.communicate(timeout=60)
     assert waiting_update.returncode == 1
     assert "interrupted" in err and names_of(json.loads(out)["failed"]) == [A]
     appsync("quit", device.path, A)

@@ -15,7 +15,7 @@ import zipfile
 import pytest
 
 import packages
-from conftest import ON_ONE_PATH, Device, names_of
+from conftest import DIRECTLY, ON_ONE_PATH, Device, names_of
 from test_device import in_own_mounts
 
 DATA = "/var/mobile/Containers/Data"
@@ -318,9 +318,8 @@ def test_other_types_of_restore_bring_nothing_back(appsync, backup, fresh):
 # Packages and data afterwards.
 
 
+@DIRECTLY
 def test_parked_package_survives_a_kill_and_its_data_installs_it(appsync, backup, fresh, store):
-    if fresh.is_coordinated:
-        pytest.skip("there the store brings restored packages")
     restore(fresh, backup)
     package = os.path.join(store, IDS[1] + ".zip")
     appsync("send", fresh.path, IDS[1], package, "--restore")
@@ -336,10 +335,9 @@ def test_parked_package_survives_a_kill_and_its_data_installs_it(appsync, backup
     assert data_of(fresh, IDS[1])["Documents/letter.txt"] == b"Dear"
 
 
+@DIRECTLY
 def test_data_is_not_sent_for_a_package_that_is_gone(appsync, backup, fresh, store):
     """A loss of power can take the package, and leave what says that it waits."""
-    if fresh.is_coordinated:
-        pytest.skip("there the store brings restored packages")
     restore(fresh, backup)
     package = os.path.join(store, IDS[1] + ".zip")
     data = os.path.join(backup, "data", IDS[1] + ".zip")
@@ -352,9 +350,8 @@ def test_data_is_not_sent_for_a_package_that_is_gone(appsync, backup, fresh, sto
     assert data_of(fresh, IDS[1])["Documents/letter.txt"] == b"Dear"
 
 
+@DIRECTLY
 def test_damaged_data_is_not_sent(appsync, backup, fresh, store):
-    if fresh.is_coordinated:
-        pytest.skip("there the store brings restored packages")
     restore(fresh, backup)
     appsync("send", fresh.path, IDS[1], os.path.join(store, IDS[1] + ".zip"), "--restore")
     archive = os.path.join(backup, "data", IDS[1] + ".zip")
@@ -364,9 +361,8 @@ def test_damaged_data_is_not_sent(appsync, backup, fresh, store):
     assert IDS[1] not in fresh.apps()
 
 
+@DIRECTLY
 def test_package_and_data_at_once(appsync, backup, fresh, store):
-    if fresh.is_coordinated:
-        pytest.skip("there the store brings restored packages")
     restore(fresh, backup)
     appsync("send", fresh.path, IDS[1], os.path.join(store, IDS[1] + ".zip"), "--restore", "--parts", "3")
     assert data_of(fresh, IDS[1])["Documents/letter.txt"] == b"Dear"

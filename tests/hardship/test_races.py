@@ -15,6 +15,7 @@ import pytest
 import packages
 from conftest import HERE, IS_LONG, SEED, acceptance
 from devices import check_intact
+from processes import with_default_signals
 
 SESSIONS = 200 if IS_LONG else 4
 COLLISIONS = 20 if IS_LONG else 1
@@ -142,7 +143,8 @@ def start(appsync, lines):
     """Runs the command lines one after the other, as a process of its own."""
     script = "; ".join('"$A" %s; echo "status $?"' % " ".join("'%s'" % word for word in line) for line in lines)
     return subprocess.Popen(["sh", "-c", script], env=dict(os.environ, A=appsync.program), text=True,
-                            stdout=subprocess.PIPE, stderr=subprocess.PIPE, start_new_session=True)
+                            stdout=subprocess.PIPE, stderr=subprocess.PIPE, start_new_session=True,
+                            preexec_fn=with_default_signals)
 
 
 def finish(process, name):

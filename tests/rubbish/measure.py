@@ -18,6 +18,8 @@ def run(order):
                                     (2, order["err"], os.O_WRONLY)):
             os.dup2(os.open(path, flags | (os.O_CREAT | os.O_TRUNC if number else 0)), number)
         os.chdir(order["directory"])
+        for each in (signal.SIGHUP, signal.SIGINT, signal.SIGQUIT, signal.SIGTERM, signal.SIGPIPE):
+            signal.signal(each, signal.SIG_DFL)
         try:
             os.execve(order["command"][0], order["command"], order["environment"])
         finally:

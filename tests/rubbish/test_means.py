@@ -49,20 +49,15 @@ def is_told_and_made_good(appsync, place, done, says):
     assert [each["version"] for each in appsync.good("apps", place.device, "--json").json()] == ["2.0"] * 4
 
 
-@pytest.fixture
-def few_files(appsync):
-    if appsync.is_sanitized:
-        pytest.skip("the sanitizer looks at objects through a pipe, and without one takes them for bad")
-
-
-@pytest.mark.usefixtures("few_files")
+# A sanitizer looks at objects through a pipe, and without one takes them for bad.
+@pytest.mark.plain_build
 @pytest.mark.parametrize("files", (4, 6, 8, 10, 11, 12, 13, 14, 16, 18, 20, 24, 30, 40))
 def test_few_open_files(appsync, place, files):
     done = sync_with(appsync, place, resource.RLIMIT_NOFILE, files)
     is_told_and_made_good(appsync, place, done, "")
 
 
-@pytest.mark.usefixtures("few_files")
+@pytest.mark.plain_build
 @pytest.mark.parametrize("files", (6, 11, 13))
 def test_that_files_are_few_is_told_with_what_helps(appsync, place, files):
     done = sync_with(appsync, place, resource.RLIMIT_NOFILE, files)
@@ -75,9 +70,8 @@ def test_small_files_only(appsync, place, size):
     is_told_and_made_good(appsync, place, done, "device.db")
 
 
+@pytest.mark.plain_build  # a sanitizer takes more by itself
 @pytest.mark.parametrize("mebibytes", (36, 44, 48, 56, 64))
 def test_little_memory(appsync, place, mebibytes):
-    if appsync.is_sanitized:
-        pytest.skip("the sanitizer takes more by itself")
     done = sync_with(appsync, place, resource.RLIMIT_AS, mebibytes << 20)
     is_told_and_made_good(appsync, place, done, "out of means")
