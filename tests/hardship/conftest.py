@@ -30,6 +30,12 @@ def pytest_report_header():
     return "hardship: the %s form, APPSYNC_SEED=%d" % (form, SEED)
 
 
+def pytest_collection_modifyitems(items):
+    if IS_LONG:  # one test makes thousands of runs
+        for item in items:
+            item.add_marker(pytest.mark.timeout(8 * 3600))
+
+
 @pytest.fixture(scope="session")
 def meddling():
     """Skips where the machine does not let a process be traced."""

@@ -65,6 +65,13 @@ class Scenario:
         assert done.returncode == 0 and text, done.stderr
         return Outcome(done, json.loads(text))
 
+    def logged(self):
+        """What the device has logged since it was fresh."""
+        before, log = (os.path.join(each, "log", "system.log") for each in (self.base, self.device))
+        with open(log, errors="replace") as file:
+            file.seek(os.path.getsize(before) if os.path.exists(before) else 0)
+            return file.read()
+
     def again(self):
         self.appsync(*self.command(), timeout=LIMIT)
 
@@ -90,8 +97,8 @@ class Scenario:
 
 
     @staticmethod
-    def what_a_kill_leaves(seen):
-        """What must be the same after a kill and a second run as after one run that nothing disturbs."""
+    def what_an_end_leaves(seen):
+        """What must be the same after a kill, or a failure, and a second run as after one run that nothing disturbs."""
         return seen
 
     def follow_up(self):
@@ -140,9 +147,12 @@ class Restore(Scenario):
         return ["restore", self.device, self.backup]
 
     @staticmethod
-    def what_a_kill_leaves(seen):
+    def what_an_end_leaves(seen):
         # The coordinator of the offloaded application may stand yet, and what it was made from; the next sync goes on.
-        return leave_out(seen, tables=["coordinators", "promises"], paths="^root/var/mobile/tmp/")
+        seen = leave_out(seen, paths="^root/var/mobile/tmp/")
+        for table in ("coordinators", "promises"):
+            seen["tables"][table] = [row for row in seen["tables"][table] if row["identifier"] != UPDATED]
+        return seen
 
     def follow_up(self):
         if self.coordination == "off":
@@ -197,12 +207,16 @@ def without_session(seen):
 
 def rows_of(database):
     tables = [row[0] for row in database.execute("SELECT name FROM sqlite_master WHERE type = 'table'")]
+    whose = {row["id"]: row["identifier"] for row in database.execute("SELECT id, identifier FROM coordinators")}
     result = {}
     for table in tables:
         if table in ("history", "sqlite_sequence"):
             continue
         rows = [{name: value for name, value in dict(row).items() if name not in PASSING}
                 for row in database.execute("SELECT * FROM " + table)]
+        if table == "promises":
+            rows = [{**row, "identifier": whose[coordinator]} for row, (coordinator,) in zip(
+                rows, database.execute("SELECT coordinator FROM promises"))]
         result[table] = sorted(rows, key=repr)
     return result
 

@@ -30,7 +30,7 @@ def test_a_kill_at_any_call_loses_nothing(meddling, prepared, name):
         killed += outcome.hit is not None
         try:
             assert outcome.status == (0 if outcome.hit is None else -9), outcome.said
-            scenario.check(expected, scenario.what_a_kill_leaves)
+            scenario.check(expected, scenario.what_an_end_leaves)
             scenario.follow_up()
         except AssertionError as problem:
             problems.append("--kill %d: %s\n%s" % (number, outcome.hit, problem))
