@@ -104,12 +104,14 @@ std::optional<Bytes> SimulatedHomeScreen::flattened() {
     return *std::move(bytes);
 }
 
-void SimulatedHomeScreen::setRunning(const std::string& identifier, bool running) {
+bool SimulatedHomeScreen::setRunning(const std::string& identifier, bool running) {
+    if (running && held_->contains(identifier)) return false;
     if (running) {
         running_.insert(identifier);
     } else {
         running_.erase(identifier);
     }
+    return true;
 }
 
 void SimulatedHomeScreen::scriptTermination(const std::string& identifier,

@@ -43,7 +43,8 @@ class SimulatedHomeScreen : public HomeScreenService {
         scriptedState_.emplace(std::move(bytes));
     }
 
-    void setRunning(const std::string& identifier, bool running);
+    /// What an assertion holds does not begin to run: false then, and nothing has changed.
+    bool setRunning(const std::string& identifier, bool running);
     /// The outcomes of the next requests for the identifier, one by one; afterwards as usual.
     void scriptTermination(const std::string& identifier, std::vector<int> outcomes);
     /// The identifiers whose assertions are held, one entry for each assertion.

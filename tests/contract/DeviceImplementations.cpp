@@ -35,8 +35,11 @@ class SimulatedDevice : public DeviceUnderTest {
         platform_.addPropertyList(path, infoDictionary(info));
         return path;
     }
-    void setRunning(const std::string& identifier, bool running) override {
-        platform_.homeScreen.setRunning(identifier, running);
+    bool run(const std::string& identifier) override {
+        return platform_.homeScreen.setRunning(identifier, true);
+    }
+    void quit(const std::string& identifier) override {
+        platform_.homeScreen.setRunning(identifier, false);
     }
     void uninstallAsPerson(const std::string& identifier) override {
         if (!platform_.registry.uninstallApplication(identifier, {})) {
@@ -90,9 +93,8 @@ class ReferenceDevice : public DeviceUnderTest {
         if (!written) throw std::runtime_error(written.error().description());
         return path;
     }
-    void setRunning(const std::string& identifier, bool running) override {
-        require(running ? device_->run(identifier) : device_->quit(identifier));
-    }
+    bool run(const std::string& identifier) override { return device_->run(identifier).ok(); }
+    void quit(const std::string& identifier) override { require(device_->quit(identifier)); }
     void uninstallAsPerson(const std::string& identifier) override {
         require(device_->uninstall(identifier));
     }

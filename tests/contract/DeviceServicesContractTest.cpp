@@ -77,9 +77,9 @@ TEST_P(HomeScreenContract, AnApplicationThatDoesNotRunIsHeld) {
 
 TEST_P(HomeScreenContract, ARunningApplicationIsNotHeldUntilItEnds) {
     ASSERT_TRUE(installPackage({kA}));
-    device_->setRunning(kA, true);
+    ASSERT_TRUE(device_->run(kA));
     EXPECT_EQ(services_.homeScreen.takeTerminationAssertion(kA, 0).outcome, Outcome::kDenied);
-    device_->setRunning(kA, false);
+    device_->quit(kA);
     EXPECT_EQ(services_.homeScreen.takeTerminationAssertion(kA, 0).outcome, Outcome::kGranted);
 }
 
@@ -89,8 +89,22 @@ TEST_P(HomeScreenContract, AReleasedAssertionCanBeTakenAgain) {
         const auto result = services_.homeScreen.takeTerminationAssertion(kA, 0);
         EXPECT_EQ(result.outcome, Outcome::kGranted);
     }
-    device_->setRunning(kA, true);
+    ASSERT_TRUE(device_->run(kA));
     EXPECT_EQ(services_.homeScreen.takeTerminationAssertion(kA, 0).outcome, Outcome::kDenied);
+}
+
+TEST_P(HomeScreenContract, WhatIsHeldDoesNotRunUntilTheLastAssertionIsReleased) {
+    ASSERT_TRUE(installPackage({kA}));
+    ASSERT_TRUE(installPackage({kB}));
+    auto first = services_.homeScreen.takeTerminationAssertion(kA, 0);
+    auto second = services_.homeScreen.takeTerminationAssertion(kA, 0);
+    EXPECT_EQ(second.outcome, Outcome::kGranted);
+    EXPECT_FALSE(device_->run(kA));
+    EXPECT_TRUE(device_->run(kB)) << "another application is not held";
+    first.assertion.reset();
+    EXPECT_FALSE(device_->run(kA));
+    second.assertion.reset();
+    EXPECT_TRUE(device_->run(kA));
 }
 
 class DeviceServicesContract : public DeviceContract {};

@@ -47,7 +47,9 @@ class DeviceUnderTest {
     virtual std::string addPackage(const BundleInfo& info) = 0;
 
     // What a person or a manager does on the device.
-    virtual void setRunning(const std::string& identifier, bool running) = 0;
+    /// Starts an application that is installed. False when something keeps it from running.
+    virtual bool run(const std::string& identifier) = 0;
+    virtual void quit(const std::string& identifier) = 0;
     virtual void uninstallAsPerson(const std::string& identifier) = 0;
     virtual void setPolicy(PolicyFeature feature, PolicyAnswer answer) = 0;
     virtual void addRestoreData(const std::string& identifier) = 0;

@@ -80,9 +80,42 @@ TEST_P(FileSystemContract, AFileInTheWayOfADirectoryIsAFailure) {
 }
 
 TEST_P(FileSystemContract, NewItemsBelongToWhomTheyAreGiven) {
-    const FileAttributes mobile{"mobile", "mobile"};
-    EXPECT_EQ(codeOf(files_.createDirectory("/d/e/f", true, &mobile)), 0);
-    EXPECT_EQ(codeOf(files_.createFile("/d/file", bytes("x"), mobile)), 0);
+    for (const std::string& account : system_->accounts()) {
+        const FileAttributes given{account, account};
+        const std::string directory = "/d/" + account;
+        EXPECT_EQ(codeOf(files_.createDirectory(directory + "/e", true, &given)), 0);
+        EXPECT_EQ(codeOf(files_.createDirectory(directory + "/e/f", false, &given)), 0);
+        EXPECT_EQ(codeOf(files_.createFile(directory + "/file", bytes("x"), given)), 0);
+        for (const char* item : {"", "/e", "/e/f", "/file"}) {
+            EXPECT_TRUE(system_->belongsTo(directory + item, given)) << directory << item;
+        }
+    }
+}
+
+TEST_P(FileSystemContract, OwnerAndGroupAreGivenEachByItself) {
+    const std::vector<std::string> accounts = system_->accounts();
+    if (accounts.size() < 2) GTEST_SKIP() << "this process may give items to nobody else";
+    const std::string& one = accounts[0];
+    const std::string& other = accounts[1];
+    for (const FileAttributes& given :
+         {FileAttributes{one, other}, FileAttributes{other, one},
+          FileAttributes{other, std::nullopt}, FileAttributes{std::nullopt, other}}) {
+        EXPECT_EQ(codeOf(files_.createDirectory("/d/e", false, &given)), 0);
+        EXPECT_EQ(codeOf(files_.createFile("/d/e/file", bytes("x"), given)), 0);
+        for (const char* item : {"/d/e", "/d/e/file"}) {
+            EXPECT_TRUE(system_->belongsTo(item, given)) << item;
+            EXPECT_FALSE(system_->belongsTo(item, {given.group, given.owner})) << item;
+        }
+        EXPECT_EQ(codeOf(files_.removeItem("/d/e")), 0);
+    }
+}
+
+TEST_P(FileSystemContract, AFileThatIsReplacedIsGivenToo) {
+    for (const std::string& account : system_->accounts()) {
+        const FileAttributes given{account, account};
+        EXPECT_EQ(codeOf(files_.createFile("/d/file", bytes("x"), given)), 0);
+        EXPECT_TRUE(system_->belongsTo("/d/file", given)) << account;
+    }
 }
 
 TEST_P(FileSystemContract, AnUnknownAccountIsRefusedAndNothingMade) {

@@ -1,4 +1,5 @@
 #include <sys/stat.h>
+#include <unistd.h>
 
 #include <algorithm>
 #include <filesystem>
@@ -29,6 +30,13 @@ class SimulatedSystem : public SystemUnderTest {
         platform_.files.addLink(path, target);
     }
     void addPipe(const std::string& path) override { platform_.files.addPipe(path); }
+    std::vector<std::string> accounts() override { return {"mobile", "root"}; }
+    bool belongsTo(const std::string& path, const FileAttributes& accounts) override {
+        const std::string ownership = platform_.files.ownership(path).value_or("nobody:nobody");
+        const std::size_t colon = ownership.find(':');
+        return accounts.owner.value_or(ownership.substr(0, colon)) == ownership.substr(0, colon) &&
+               accounts.group.value_or(ownership.substr(colon + 1)) == ownership.substr(colon + 1);
+    }
     std::vector<std::string> names(const std::string& directory) override {
         return platform_.files.names(directory);
     }
@@ -50,7 +58,7 @@ class SimulatedSystem : public SystemUnderTest {
 class PosixSystem : public SystemUnderTest {
   public:
     PosixSystem() {
-        auto opened = RootedFileSystem::open(directory_.path());
+        auto opened = RootedFileSystem::open(directory_.path(), {.accounts = accounts_});
         if (!opened) throw std::runtime_error(opened.error().description());
         files_ = *std::move(opened);
     }
@@ -70,6 +78,17 @@ class PosixSystem : public SystemUnderTest {
             throw std::runtime_error("cannot make a pipe at " + machinePath);
         }
     }
+    std::vector<std::string> accounts() override {
+        std::vector<std::string> names;
+        for (const auto& [name, account] : accounts_) names.push_back(name);
+        return names;
+    }
+    bool belongsTo(const std::string& path, const FileAttributes& accounts) override {
+        struct stat status {};
+        if (::lstat((directory_.path() + path).c_str(), &status) != 0) return false;
+        return (!accounts.owner || accounts_.at(*accounts.owner).user == status.st_uid) &&
+               (!accounts.group || accounts_.at(*accounts.group).group == status.st_gid);
+    }
     std::vector<std::string> names(const std::string& directory) override {
         std::vector<std::string> names;
         for (const auto& entry :
@@ -88,7 +107,15 @@ class PosixSystem : public SystemUnderTest {
     }
 
   private:
+    /// The superuser gives items to anybody, nobody else does.
+    static AccountMap machineAccounts() {
+        AccountMap accounts{{"mobile", {::geteuid(), ::getegid()}}};
+        if (::geteuid() == 0) accounts.emplace("somebody", MachineAccount{4711, 4712});
+        return accounts;
+    }
+
     const TemporaryMachineDirectory directory_;
+    const AccountMap accounts_ = machineAccounts();
     std::unique_ptr<RootedFileSystem> files_;
     SystemPropertyLists propertyLists_;
     SystemNotifications notifications_;

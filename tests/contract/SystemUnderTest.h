@@ -35,6 +35,11 @@ class SystemUnderTest {
     // What a host or another process leaves on the device.
     virtual void addLink(const std::string& path, const std::string& target) = 0;
     virtual void addPipe(const std::string& path) = 0;
+    /// Accounts that items can be given to and that are not the same: "mobile", and another one
+    /// where this process may give items away.
+    virtual std::vector<std::string> accounts() = 0;
+    /// Whether an item belongs to these accounts; to one that is not named it always does.
+    virtual bool belongsTo(const std::string& path, const FileAttributes& accounts) = 0;
     /// The names in a directory of the device, sorted.
     virtual std::vector<std::string> names(const std::string& directory) = 0;
 
