@@ -461,6 +461,11 @@ void SimulatedCoordination::goOn(const State& state) {
 }
 
 void SimulatedCoordination::showPlaceholder(const State& state) {
+    if (placeholderDuration_ > SimulatedTime::zero()) {
+        recorder_.scheduler().waitFor("the placeholder of " + *state->identifier,
+                                      placeholderDuration_, [] { return false; });
+        if (state->ended) return;  // cancelled meanwhile
+    }
     const Result<Persistence> shown = registry_.showPlaceholder(proxyOf(*state->placeholder));
     state->placeholderShown = shown.ok();
     if (!shown) end(state, shown.error());

@@ -67,7 +67,8 @@ enum class CoordinationObject {
 ///
 /// What the service does by itself, observers' callbacks included, is done by tasks named
 /// "coordination", at most `kThreads` at once; of one coordinator the placeholder is reported
-/// before the completion. Coordination is off until the test turns it on.
+/// before the completion. A placeholder takes no time, unless the test says otherwise.
+/// Coordination is off until the test turns it on.
 ///
 /// The methods below the interface are the test's: they are not recorded.
 class SimulatedCoordination : public InstallCoordinatorService {
@@ -101,6 +102,8 @@ class SimulatedCoordination : public InstallCoordinatorService {
 
     void setEnabled(bool enabled) { enabled_ = enabled; }
     [[nodiscard]] bool isEnabled() const { return enabled_; }
+    /// How long the service takes from now on to show a placeholder.
+    void setPlaceholderDuration(SimulatedTime duration) { placeholderDuration_ = duration; }
 
     // What other clients do.
     /// A client creates a coordinator (the store: 1, another: any number) where there is none.
@@ -120,8 +123,10 @@ class SimulatedCoordination : public InstallCoordinatorService {
     /// Takes records over as the service does when the device is opened, after the registry has:
     /// coordinators whose placeholder stood and is lost go, and so do a sync's placeholders without
     /// a coordinator; without coordination everything goes, except placeholders. Who observed is
-    /// gone. What is left goes on once somebody observes installs.
+    /// gone. What is left goes on once somebody observes installs, or `start` is called.
     void reopen(const Records& records);
+    /// Goes on with what was left.
+    void start() { resume(); }
 
     // What the test looks at. Null when there is none.
     [[nodiscard]] const SimulatedCoordinatorState* state(const std::string& identifier) const;
@@ -242,6 +247,7 @@ class SimulatedCoordination : public InstallCoordinatorService {
     SimulatedFileSystem& files_;
     bool enabled_ = false;
     bool isReopened_ = false;
+    SimulatedTime placeholderDuration_{0};
     std::map<std::string, State> coordinators_;
     std::map<std::string, State> ended_;
     std::map<std::string, std::shared_ptr<SimulatedPromiseState>> promises_;
