@@ -71,6 +71,7 @@ class LeftSession {
             end_ = world_.platform.recording().size();
         });
         invariants_.clientGoes();
+        invariants_.sessionHasEnded();
         return made == calls;
     }
 

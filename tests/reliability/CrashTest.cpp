@@ -117,12 +117,13 @@ class Camera {
 struct Stage {
     explicit Stage(const Scenario& scenario) {
         world.hostPlans = true;
-        world.coordinated = scenario.coordinated;
+        scenario.setUp(world);
         scenario.arrange(world);
         world.platform.coordination.setEnabled(scenario.coordinated);
     }
-    explicit Stage(const DeviceImage& image) {
+    Stage(const Scenario& scenario, const DeviceImage& image) {
         world.hostPlans = true;
+        scenario.setUp(world);
         world.reopen(image);
     }
 
@@ -214,14 +215,15 @@ void keepInstalled(const Scenario& scenario, const Expectation& expectation,
     }
 }
 
-void recoverThrowing(const Scenario& scenario, const Expectation& expectation, World& world,
-                     Violations& violations, std::vector<Crashed>& pictures, const SeedsOf& seeds) {
+void recoverThrowing(const Scenario& scenario, const Expectation& expectation,
+                     const Action& recovery, World& world, Violations& violations,
+                     std::vector<Crashed>& pictures, const SeedsOf& seeds) {
     {
         Camera camera(world.platform, seeds);
         Invariants invariants(world);
         keepInstalled(scenario, expectation, invariants);
         checkAtomicFiles(world, invariants);
-        perform(scenario, recoveryOf(scenario), world, invariants);
+        perform(scenario, recovery, world, invariants);
         violations = invariants.violations();
         pictures = camera.pictures();
     }
@@ -237,14 +239,25 @@ void recoverThrowing(const Scenario& scenario, const Expectation& expectation, W
     add("after one more sync: ", differencesBetween(expectation.synced, stateOf(world)));
 }
 
+/// The loss of a package that lay on a placeholder which was there before costs a sync.
+Action recoveryOf(const Scenario& scenario, const DeviceImage& image) {
+    const Action recovery = recoveryOf(scenario);
+    if (!scenario.mayLosePackage || !image.powerWasLost) return recovery;
+    return [recovery](World& world, Invariants& invariants) {
+        recovery(world, invariants);
+        recovery(world, invariants);
+    };
+}
+
 /// A new process on what a crash has left; gives what is wrong, and keeps what crashes of it leave.
 Violations recover(const Scenario& scenario, const Expectation& expectation,
                    const DeviceImage& image, std::vector<Crashed>& pictures,
                    const SeedsOf& seeds = never()) {
     Violations violations;
-    Stage stage(image);
+    Stage stage(scenario, image);
     try {
-        recoverThrowing(scenario, expectation, stage.world, violations, pictures, seeds);
+        recoverThrowing(scenario, expectation, recoveryOf(scenario, image), stage.world, violations,
+                        pictures, seeds);
     } catch (const std::exception& failure) {
         violations.emplace_back(failure.what());
     }
@@ -353,7 +366,7 @@ DeviceImage afterEndOfProcess(const Scenario& scenario, std::string_view operati
 TEST(Crash, LeavesAPlaceholderForWhichThePlugInAsksNothingUntilTheHostHasTakenItAway) {
     const Scenario& scenario = scenarioNamed("DirectSync");
     const DeviceImage image = afterEndOfProcess(scenario, "the placeholder of com.example.a");
-    Stage unplanned(image);
+    Stage unplanned(scenario, image);
     unplanned.world.hostPlans = false;
     Invariants invariants(unplanned.world);
     sync(unplanned.world, invariants, scenario.wanted);
@@ -361,7 +374,7 @@ TEST(Crash, LeavesAPlaceholderForWhichThePlugInAsksNothingUntilTheHostHasTakenIt
     EXPECT_TRUE(unplanned.world.platform.registry.placeholder("com.example.a"));
     unplanned.world.client.reset();
 
-    Stage planned(image);
+    Stage planned(scenario, image);
     Invariants others(planned.world);
     sync(planned.world, others, scenario.wanted);
     EXPECT_TRUE(planned.world.platform.registry.installed("com.example.a"));
@@ -371,7 +384,7 @@ TEST(Crash, LeavesAPlaceholderForWhichThePlugInAsksNothingUntilTheHostHasTakenIt
 
 TEST(Crash, LeavesADeliveredPackageThatIsInstalledWithoutBeingSentAgain) {
     const Scenario& scenario = scenarioNamed("CoordinatedSync");
-    Stage stage(afterEndOfProcess(scenario, "a promise kept of com.example.a-Asset"));
+    Stage stage(scenario, afterEndOfProcess(scenario, "a promise kept of com.example.a-Asset"));
     EXPECT_FALSE(stage.world.platform.registry.installed("com.example.a"));
     Invariants invariants(stage.world);
     sync(stage.world, invariants, scenario.wanted);

@@ -45,14 +45,18 @@ void goThroughAgain(const Scenario& scenario, World& world, Outcome& outcome) {
         world.client->clearSyncData();
     }
     Invariants invariants(world);
-    scenario.run(world, invariants);
-    invariants.clientGoes();
-    outcome.shortcomings = scenario.shortcomings(world);
+    goThrough(scenario, world, invariants);
+    for (const std::string& each : invariants.violations()) {
+        outcome.shortcomings.push_back(each);
+    }
+    for (std::string& each : scenario.shortcomings(world)) {
+        outcome.shortcomings.push_back(std::move(each));
+    }
 }
 
 void tryOut(const Scenario& scenario, const std::optional<Aim>& aim, Outcome& outcome) {
     World world;
-    world.coordinated = scenario.coordinated;
+    scenario.setUp(world);
     scenario.arrange(world);
     Invariants invariants(world);
     if (aim) world.faults.failAt(aim->call, aim->way, aim->extent);

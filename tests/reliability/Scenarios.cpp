@@ -1,9 +1,12 @@
 #include "tests/reliability/Scenarios.h"
 
+#include <chrono>
+#include <map>
 #include <optional>
 
 #include "client/Paths.h"
 #include "client/TodoList.h"
+#include "platform/InstallProgressRecord.h"
 #include "tests/reliability/HostPlan.h"
 
 namespace appsync {
@@ -12,6 +15,9 @@ namespace {
 constexpr const char* kA = "com.example.a";
 constexpr const char* kB = "com.example.b";
 constexpr const char* kC = "com.example.c";
+constexpr const char* kD = "com.example.d";
+/// How long placeholders take, where it is to be waited for them.
+constexpr std::chrono::seconds kPlaceholderDuration{3};
 
 using Shortcomings = std::vector<std::string>;
 
@@ -74,6 +80,36 @@ void restore(World& world, Invariants& invariants, const std::vector<std::string
     expect(invariants, world.client->reconcileRestoreOfType(2, &error), "a restore was refused");
     expect(invariants, !error, "a restore gave an error");
     world.settle();
+}
+
+/// By the same client, of a backup that holds more.
+void restoreTwice(World& world, Invariants& invariants) {
+    restore(world, invariants, {kA});
+    restore(world, invariants, {kA, kC});
+}
+
+void prepareRestore(World& world, const char* identifier, const Bytes& metadata) {
+    const std::shared_ptr<AppsClient> client = world.client;
+    client->prepareAppForRestoreUsingCoordination(identifier, metadata, nullptr, nullptr, 0);
+}
+
+/// While it is waited for the placeholders of two applications, the store cancels one of them, the
+/// other is given up, and at the last moment a third one is promised.
+void restoreDisturbed(World& world, Invariants& invariants) {
+    world.platform.onCall("WaitGroup.waitFor", [&world](const RecordEntry&) {
+        Scheduler& scheduler = world.platform.scheduler;
+        scheduler.spawnAfter(std::chrono::seconds(1), "store", [&world] {
+            if (world.platform.coordination.state(kA) == nullptr) return;
+            world.platform.coordination.cancel(kA, ErrorRecord::make("Person", 1, "cancelled"),
+                                               AppStoreClientID);
+        });
+        scheduler.spawnAfter(std::chrono::seconds(2), "another restore",
+                             [&world] { prepareRestore(world, kC, {}); });
+        scheduler.spawnAfter(std::chrono::seconds(9), "another restore",
+                             [&world] { prepareRestore(world, kD, world.restoreMetadata()); });
+    });
+    restore(world, invariants, {kA, kC});
+    world.platform.onCall("WaitGroup.waitFor", {});
 }
 
 /// The package of a restoring application, then its data.
@@ -154,6 +190,29 @@ auto leaving(std::vector<std::string> installed, std::vector<std::string> placeh
     return [=](World& world) { return differences(world, installed, placeholders); };
 }
 
+/// Whether the list of offloaded applications could not be read once. They are restored like all
+/// others then, and stay so.
+bool wasDemotedListLost(const World& world) {
+    return world.faults.hasInjected("FileSystem.readFile(" + std::string(kDemotedAppsPath)) ||
+           world.faults.hasInjected("PropertyListSerialization.parse(");
+}
+
+/// The same, and these placeholders are those of offloaded applications.
+auto leavingOffloaded(std::vector<std::string> installed, std::vector<std::string> placeholders,
+                      const std::map<std::string, std::uint64_t>& installTypes) {
+    return [=](World& world) {
+        Shortcomings result = differences(world, installed, placeholders);
+        // On the direct path they are restored like all others.
+        if (!world.coordinated || wasDemotedListLost(world)) return result;
+        for (const auto& [identifier, installType] : installTypes) {
+            const auto placeholder = world.platform.registry.placeholder(identifier);
+            if (placeholder && placeholder->installType == installType) continue;
+            result.push_back(identifier + " is not offloaded as it was");
+        }
+        return result;
+    };
+}
+
 /// The same, and every application of the list is marked as installed.
 auto marking(std::vector<std::string> installed) {
     return [=](World& world) {
@@ -224,6 +283,46 @@ void addRestoring(World& world) {
             {{kC, PropertyList::map({{"1.0", PropertyList::map({{"path", "/c"}})}})}}));
 }
 
+/// Offloaded applications that the host wants back, wants removed, and says nothing of.
+void addOffloaded(World& world) {
+    world.platform.registry.addPlaceholder(kA, kInstallTypeDowngrade);
+    world.platform.registry.addPlaceholder(kB, kInstallTypeIntentionalDowngrade);
+    world.platform.registry.addPlaceholder(kC, kInstallTypeIntentionalDowngrade);
+}
+
+void addBackup(World& world) {
+    install(world, {kB});
+    world.stageDemoted({kC}, {kD});
+}
+
+void addSlowBackup(World& world) {
+    addBackup(world);
+    world.platform.coordination.setPlaceholderDuration(kPlaceholderDuration);
+}
+
+/// All of them are coordinated; there is nothing to wait for else.
+void addSlowRestores(std::vector<Scenario>& all) {
+    Scenario slow;
+    slow.name = "CoordinatedRestoreOutsideTheDaemon";
+    slow.coordinated = true;
+    slow.isInDaemon = false;
+    slow.arrange = addSlowBackup;
+    slow.run = [](World& world, Invariants& invariants) {
+        restore(world, invariants, {kA, kC, kD});
+    };
+    slow.shortcomings = leavingOffloaded(
+        {kB}, {kA, kC, kD}, {{kC, kInstallTypeDowngrade}, {kD, kInstallTypeIntentionalDowngrade}});
+    all.push_back(slow);
+    slow.name = "CoordinatedSecondRestore";
+    slow.run = restoreTwice;
+    slow.shortcomings = leavingOffloaded({kB}, {kA, kC}, {{kC, kInstallTypeDowngrade}});
+    all.push_back(slow);
+    slow.name = "CoordinatedDisturbedRestore";
+    slow.run = restoreDisturbed;
+    slow.shortcomings = leaving({kB}, {kC, kD});
+    all.push_back(slow);
+}
+
 std::vector<Scenario> inBothModes(const Scenario& scenario) {
     Scenario direct = scenario;
     Scenario coordinated = scenario;
@@ -251,7 +350,13 @@ std::vector<Scenario> make() {
          syncing(updates())});
     // A placeholder that a coordinator has promised stays until the store keeps its promise; what
     // is given up once has lost its restore information.
-    add({"Restore", false, withB, restoring, leaving({kB}, {kA, kC}), true});
+    add({"Restore", false, addBackup, restoring,
+         leavingOffloaded({kB}, {kA, kC}, {{kC, kInstallTypeDowngrade}}), true});
+    addSlowRestores(all);
+    all.push_back({"DirectSecondRestore", false, addBackup, restoreTwice, leaving({kB}, {kA, kC})});
+    all.push_back({"CoordinatedOffloaded", true, addOffloaded, syncing(oneOfEach()),
+                   leaving({kA}, {kC}), true, oneOfEach()});
+    all.back().mayLosePackage = true;
     add({"Backup", false, addMarks, backUp, unclearedMarks});
     add({"SessionEnd", false, addUninstalled, endSession, uncleared});
     add({"Clearing", false,
@@ -266,6 +371,11 @@ std::vector<Scenario> make() {
 }
 
 }  // namespace
+
+void Scenario::setUp(World& world) const {
+    world.coordinated = coordinated;
+    world.isInDaemon = isInDaemon;
+}
 
 void sync(World& world, Invariants& invariants, const PropertyList& wanted) {
     const HostPlan plan = begin(world, invariants, wanted);

@@ -26,6 +26,13 @@ struct Scenario {
     PropertyList wanted{};
     /// What the host does after an interruption, where that is not the same again.
     std::function<void(World&, Invariants&)> resume{};
+    bool isInDaemon = true;
+    /// Whether a loss of power may take a package of which it is on record that it has come. Its
+    /// install fails then, and the sync after that brings it.
+    bool mayLosePackage = false;
+
+    /// Says to a new world what it has to know of the scenario. What is on it comes after that.
+    void setUp(World& world) const;
 };
 
 /// A whole sync that brings the device in step with what is wanted. A host that plans stages what

@@ -15,7 +15,8 @@ constexpr std::chrono::minutes kSettling{4};
 
 }  // namespace
 
-World::World(Scheduling scheduling) : platform(codec, scheduling), faults(platform) {
+World::World(Scheduling scheduling)
+    : platform(codec, scheduling), faults(platform), isInterleaved(scheduling.interleaved) {
     platform.scheduler.setTimeLimit(kLongestRun);
     platform.files.addDirectory("/var/mobile/Library/Logs/MediaServices");
 }
@@ -24,7 +25,10 @@ World::~World() { faults.stop(); }
 
 void World::startClient() {
     platform.coordination.setEnabled(coordinated);
+    if (!isInDaemon) platform.host.setMainBundleIdentifier("com.example.other");
     client = AppsClient::create(platform.services());
+    // There is a daemon all the same, and something in it observes installs.
+    if (!isInDaemon) platform.coordination.start();
     platform.notificationCenter.post(kStartUp);
     platform.runUntilIdle();
 }
@@ -70,8 +74,7 @@ void World::stage(const PropertyList& todoList, const PropertyList& order) {
 }
 
 void World::stageRestore(const std::vector<std::string>& identifiers) {
-    const auto metadata = *codec.serialize(
-        PropertyList::map({{"title", "Shown"}, {"bundleVersion", "1.0"}}), PropertyListFormat::Xml);
+    const Bytes metadata = restoreMetadata();
     PropertyList info = PropertyList::map();
     for (const std::string& identifier : identifiers) {
         info.set(identifier, PropertyList::map({{"VessikMetadata", metadata},
@@ -79,6 +82,19 @@ void World::stageRestore(const std::vector<std::string>& identifiers) {
                                                 {"PlaceholderIcon", Bytes{1, 2, 3, 4}}}));
     }
     platform.addPropertyList(std::string(kRestoreInfoPath), info, PropertyListFormat::Binary);
+}
+
+Bytes World::restoreMetadata() {
+    return *codec.serialize(PropertyList::map({{"title", "Shown"}, {"bundleVersion", "1.0"}}),
+                            PropertyListFormat::Xml);
+}
+
+void World::stageDemoted(const std::vector<std::string>& automatically,
+                         const std::vector<std::string>& intentionally) {
+    platform.addPropertyList(
+        std::string(kDemotedAppsPath),
+        PropertyList::map({{"AutomaticDowngrades", PropertyList::strings(automatically)},
+                           {"IntentionalDowngrades", PropertyList::strings(intentionally)}}));
 }
 
 void World::receive(const SyncAssetPointer& asset) {

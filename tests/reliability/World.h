@@ -37,13 +37,21 @@ struct World {
     void stage(const PropertyList& todoList, const PropertyList& order);
     /// What a backup has brought along.
     void stageRestore(const std::vector<std::string>& identifiers);
+    /// The store metadata of each of them.
+    [[nodiscard]] Bytes restoreMetadata();
+    /// Which of them had been offloaded: by the system, by their user.
+    void stageDemoted(const std::vector<std::string>& automatically,
+                      const std::vector<std::string>& intentionally);
     /// The package has come to the device whole.
     void receive(const SyncAssetPointer& asset);
 
     SystemPropertyLists codec;
     SimulatedPlatform platform;
     FaultPlan faults;
+    const bool isInterleaved;
     bool coordinated = false;
+    /// Whether it is the daemon that holds the client.
+    bool isInDaemon = true;
     /// Whether the host looks at the device before it stages a list, as the desktop host does;
     /// otherwise it stages what the scenario wants as it is.
     bool hostPlans = false;
