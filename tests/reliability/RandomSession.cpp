@@ -4,6 +4,7 @@
 #include <exception>
 
 #include "client/Paths.h"
+#include "platform/InstallProgressRecord.h"
 
 namespace appsync {
 namespace {
@@ -11,6 +12,8 @@ namespace {
 constexpr std::uint64_t kIdentifiers = 6;
 constexpr std::size_t kChangePoints = 4;
 constexpr std::uint64_t kLongestDelay = 90;  // seconds: some retries
+constexpr std::uint64_t kLongestShortDelay = 15;
+constexpr std::uint64_t kLongestPlaceholder = 12;
 constexpr CoordinationClient kAnotherClient = 9;
 
 ErrorRecord somebodysReason() { return ErrorRecord::make("Person", 1, "cancelled"); }
@@ -23,7 +26,10 @@ Scheduling RandomSession::schedulingOf(std::uint64_t seed) {
 }
 
 RandomSession::RandomSession(std::uint64_t seed)
-    : random_(seed), world_(schedulingOf(seed)), invariants_(world_) {}
+    : random_(seed),
+      world_(schedulingOf(seed)),
+      invariants_(world_),
+      demands_(world_, invariants_) {}
 
 std::vector<std::string> RandomSession::run() {
     try {
@@ -38,14 +44,22 @@ void RandomSession::runThrowing() {
     arrange();
     world_.startClient();
     if (oneIn(2)) world_.faults.failSometimes(random_(), 10 + random_() % 90);
-    if (oneIn(3)) restore();
+    if (oneIn(3)) {
+        restore();
+        if (oneIn(3)) restore();
+    }
     leaves_ = oneIn(10);
     sync();
     if (!leaves_ && oneIn(3)) sync();
     if (oneIn(8)) world_.client->prepareForBackup();
-    if (!leaves_) world_.settle();
-    // A host that leaves in the middle takes retries with it, and so their packages stay.
-    if (!leaves_) invariants_.sessionHasEnded();
+    if (leaves_) {
+        invariants_.clientGoes();
+        invariants_.sessionHasEnded();
+        return;
+    }
+    world_.settle();
+    invariants_.sessionHasEnded();
+    demands_.sessionHasEnded();
     invariants_.clientGoes();
 }
 
@@ -57,9 +71,14 @@ std::chrono::seconds RandomSession::anyDelay() {
     return std::chrono::seconds(random_() % kLongestDelay);
 }
 
+/// Within the time that it is waited for a few placeholders.
+std::chrono::seconds RandomSession::shortDelay() {
+    return std::chrono::seconds(random_() % kLongestShortDelay);
+}
+
 void RandomSession::arrange() {
     world_.coordinated = oneIn(2);
-    if (oneIn(4)) world_.platform.host.setMainBundleIdentifier("com.example.other");
+    world_.isInDaemon = !oneIn(4);
     for (std::uint64_t i = random_() % kIdentifiers; i > 0; --i) {
         const std::string identifier = anyIdentifier();
         world_.platform.registry.addApplication(identifier, "0.9");
@@ -72,13 +91,38 @@ void RandomSession::arrange() {
     if (oneIn(6)) world_.platform.transfers.setCanCancelTransfers(false);
     if (oneIn(6)) world_.platform.host.setTransferService(nullptr);
     arrangePolicy();
+    arrangeOffloaded();
 }
 
 void RandomSession::arrangePolicy() {
     if (oneIn(10)) {
         world_.platform.policy.set(PolicyFeature::AppInstallationAllowed, PolicyAnswer::No);
+        demands_.forbidInstalls();
     }
-    if (oneIn(10)) world_.platform.policy.set(PolicyFeature::AppRemovalAllowed, PolicyAnswer::No);
+    if (oneIn(10)) {
+        world_.platform.policy.set(PolicyFeature::AppRemovalAllowed, PolicyAnswer::No);
+        demands_.forbidRemovals();
+    }
+}
+
+/// Applications that are offloaded, on the device and in the backup.
+void RandomSession::arrangeOffloaded() {
+    std::vector<std::string> automatically;
+    std::vector<std::string> intentionally;
+    for (std::uint64_t i = 0; i < kIdentifiers; ++i) {
+        if (!oneIn(3)) continue;
+        const std::string identifier = "com.example.app" + std::to_string(i);
+        const bool isIntentional = oneIn(2);
+        (isIntentional ? intentionally : automatically).push_back(identifier);
+        if (oneIn(2) || world_.platform.registry.installed(identifier)) continue;
+        world_.platform.registry.addPlaceholder(
+            identifier, isIntentional ? kInstallTypeIntentionalDowngrade : kInstallTypeDowngrade);
+    }
+    world_.stageDemoted(automatically, intentionally);
+    if (oneIn(2)) {
+        world_.platform.coordination.setPlaceholderDuration(
+            std::chrono::seconds(random_() % kLongestPlaceholder));
+    }
 }
 
 void RandomSession::restore() {
@@ -88,10 +132,35 @@ void RandomSession::restore() {
     }
     world_.stageRestore(identifiers);
     invariants_.restoreBegins();
+    if (world_.coordinated && oneIn(2)) disturbRestore();
     std::optional<ErrorRecord> error;
     if (!world_.client->reconcileRestoreOfType(2, &error) || error) {
         invariants_.violate("a restore was refused");
     }
+    world_.platform.onCall("WaitGroup.waitFor", {});
+    demands_.restored(identifiers);
+}
+
+/// While it is waited for placeholders others cancel, promise one more, and give one up.
+void RandomSession::disturbRestore() {
+    world_.platform.onCall("WaitGroup.waitFor", [this](const RecordEntry&) {
+        if (oneIn(2)) cancelByAnother(anyIdentifier(), shortDelay());
+        if (oneIn(2)) restoreAnother(anyIdentifier(), true);
+        if (oneIn(2)) restoreAnother(anyIdentifier(), false);
+    });
+}
+
+void RandomSession::restoreAnother(const std::string& identifier, bool isSound) {
+    demands_.leaveOut(identifier);
+    const Bytes metadata = isSound ? world_.restoreMetadata() : Bytes{};
+    const std::uint64_t demotionStatus = random_() % 3;
+    world_.platform.scheduler.spawnAfter(
+        shortDelay(), "another restore", [this, identifier, metadata, demotionStatus] {
+            const std::shared_ptr<AppsClient> client = world_.client;
+            if (client == nullptr) return;
+            client->prepareAppForRestoreUsingCoordination(identifier, metadata, nullptr, nullptr,
+                                                          demotionStatus);
+        });
 }
 
 void RandomSession::sync() {
@@ -99,6 +168,7 @@ void RandomSession::sync() {
     if (!oneIn(12)) {
         world_.stage(list);
         invariants_.sessionBegins(list);
+        demands_.willReconcile(list);
     } else {
         invariants_.sessionBeginsWithoutList();
     }
@@ -107,14 +177,19 @@ void RandomSession::sync() {
     std::optional<ErrorRecord> error;
     if (!world_.client->reconcileSync({}, "anchor 1", {}, &error)) return;
     static_cast<void>(world_.client->installedAssets());
-    for (const SyncAssetPointer& asset : world_.client->outstandingAssetTransfers()) {
-        transfer(asset);
-    }
+    for (const SyncAssetPointer& asset : assetsToSend()) transfer(asset);
     if (!world_.coordinated && oneIn(3)) transferRestore();
     if (leaves_) return;
     const bool success = !oneIn(4);
     world_.client->assetTransferEndedWithSuccess(success);
     world_.client->syncEndedWithSuccess(success);
+}
+
+std::vector<SyncAssetPointer> RandomSession::assetsToSend() {
+    demands_.willAsk();
+    std::vector<SyncAssetPointer> assets = world_.client->outstandingAssetTransfers();
+    demands_.wereAskedFor(assets);
+    return assets;
 }
 
 /// No identifier twice: of two entries only the first is marked.
@@ -137,23 +212,27 @@ void RandomSession::disturb() {
             world_.platform.homeScreen.setRunning(identifier, false);
         });
     }
-    if (oneIn(3)) cancelByAnother(anyIdentifier());
+    if (oneIn(3)) cancelByAnother(anyIdentifier(), anyDelay());
     if (world_.coordinated && oneIn(6)) {
         const std::string identifier = anyIdentifier();
         if (world_.platform.coordination.state(identifier) == nullptr) {
+            demands_.leaveOut(identifier);
             world_.platform.coordination.addCoordinator(CoordinatorKind::Initiating, identifier,
                                                         kAnotherClient);
         }
     }
     if (world_.coordinated && oneIn(4)) world_.platform.coordination.prioritize(anyIdentifier());
     if (oneIn(4)) {
+        const std::string identifier = anyIdentifier();
+        demands_.leaveOut(identifier);
         world_.platform.registry.failNextInstall(
-            anyIdentifier(), ErrorRecord::make(kInstallerErrorDomain, 1, "refused"));
+            identifier, ErrorRecord::make(kInstallerErrorDomain, 1, "refused"));
     }
 }
 
-void RandomSession::cancelByAnother(const std::string& identifier) {
-    world_.platform.scheduler.spawnAfter(anyDelay(), "another client", [this, identifier] {
+void RandomSession::cancelByAnother(const std::string& identifier, std::chrono::seconds delay) {
+    demands_.leaveOut(identifier);
+    world_.platform.scheduler.spawnAfter(delay, "another client", [this, identifier] {
         if (world_.platform.coordination.state(identifier) != nullptr) {
             world_.platform.coordination.cancel(identifier, somebodysReason(), AppStoreClientID);
         } else if (world_.platform.registry.progress(identifier)) {
@@ -167,6 +246,7 @@ void RandomSession::transfer(const SyncAssetPointer& asset) {
     world_.client->assetTransferUpdatedProgress(asset, 0.5);
     if (oneIn(4)) world_.platform.advance(anyDelay());
     if (oneIn(6)) {
+        demands_.notDelivered(asset->identifier);
         loseTransfer(asset);
     } else if (oneIn(20)) {
         asset->path = "../" + asset->identifier + ".zip";
@@ -177,7 +257,10 @@ void RandomSession::transfer(const SyncAssetPointer& asset) {
         world_.client->assetTransferSucceeded(asset, true, nullptr);
     } else if (!oneIn(8)) {
         world_.receive(asset);
+        if (!asset->isRestore) demands_.delivered(asset->identifier);
         world_.client->assetTransferSucceeded(asset, true, nullptr);
+    } else {
+        demands_.notDelivered(asset->identifier);
     }
 }
 
