@@ -41,9 +41,11 @@ constexpr const char* kCrashedTwice[] = {"DirectSync", "CoordinatedSync"};
 // Sanitizers take ten times as long, and look for something else.
 #ifdef APPSYNC_SANITIZED
 constexpr std::uint64_t kSeeds = 4;
+constexpr std::uint64_t kSeedsOfVariants = 4;
 constexpr std::uint64_t kSeedsOfPairs = 1;
 #else
 constexpr std::uint64_t kSeeds = 32;
+constexpr std::uint64_t kSeedsOfVariants = 12;
 constexpr std::uint64_t kSeedsOfPairs = 3;
 #endif
 
@@ -287,7 +289,8 @@ void expectRecovery(const Scenario& scenario, const Expectation& expectation,
 class EveryInstant : public testing::TestWithParam<Scenario> {};
 
 TEST_P(EveryInstant, OfACrashIsRecoveredFrom) {
-    const std::uint64_t seeds = numberIn(kManySeeds, kSeeds);
+    const std::uint64_t seeds =
+        numberIn(kManySeeds, GetParam().isVariant ? kSeedsOfVariants : kSeeds);
     const std::uint64_t first = numberIn(kFirstSeed, 0);
     const Expectation expectation = runPlainly(GetParam(), seedsFrom(first, seeds));
     EXPECT_GT(expectation.operations, 0U);

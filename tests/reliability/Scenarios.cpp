@@ -306,6 +306,7 @@ void addSlowRestores(std::vector<Scenario>& all) {
     slow.name = "CoordinatedRestoreOutsideTheDaemon";
     slow.coordinated = true;
     slow.isInDaemon = false;
+    slow.isVariant = true;
     slow.arrange = addSlowBackup;
     slow.run = [](World& world, Invariants& invariants) {
         restore(world, invariants, {kA, kC, kD});

@@ -27,6 +27,8 @@ struct Scenario {
     /// What the host does after an interruption, where that is not the same again.
     std::function<void(World&, Invariants&)> resume{};
     bool isInDaemon = true;
+    /// Another scenario with other waits: a few crashes at each instant are enough.
+    bool isVariant = false;
     /// Whether a loss of power may take a package of which it is on record that it has come. Its
     /// install fails then, and the sync after that brings it.
     bool mayLosePackage = false;
