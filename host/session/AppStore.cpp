@@ -9,6 +9,7 @@
 #include "device/Device.h"
 #include "host/console/Problem.h"
 #include "host/plan/LibraryReader.h"
+#include "host/plan/SyncPlan.h"
 #include "host/session/PackageSender.h"
 #include "host/session/StoreDelivery.h"
 #include "platform/InstallCoordinator.h"
@@ -18,6 +19,10 @@ namespace appsync {
 namespace {
 
 constexpr std::chrono::milliseconds kWaitInterval{100};
+
+ErrorRecord installationForbidden() {
+    return failure(kInstallationForbidden, "allow it with appsync set DEVICE installation=yes");
+}
 
 class Store {
   public:
@@ -42,14 +47,18 @@ class Store {
   private:
     // Nobody asks for offloaded applications of the system.
     Status awaitSystemApplications() {
-        if (!service_.isCoordinationEnabled()) return {};
+        const Result<DeviceSettings> settings = device_.settings();
+        if (!settings) return unusable(settings.error());
+        if (!settings->coordination) return {};
         const Result<std::vector<ApplicationRecord>> records = device_.applications();
         if (!records) return unusable(records.error());
         for (const ApplicationRecord& record : *records) {
             const bool isServed =
                 isOffloadedSystemApplication(record) && library_.find(record.identifier) != nullptr;
             if (!isServed) continue;
-            const Status awaited = awaitPackage(service_, record);
+            const bool isForbidden = settings->installation == PolicyAnswer::No;
+            const Status awaited =
+                isForbidden ? Status(installationForbidden()) : awaitPackage(service_, record);
             if (awaited) continue;
             result_.failed.push_back({record.identifier, awaited.error().description()});
         }
