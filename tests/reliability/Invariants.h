@@ -64,6 +64,7 @@ class Invariants {
     void checkWaitGroups();
     void checkRestoreWaits();
     void checkRestoreWait(std::size_t announced);
+    [[nodiscard]] std::int64_t countAwaited(std::size_t before) const;
     void checkAwaitedPlaceholders();
     void checkRestoreInfoIsKept();
     void checkPackages();

@@ -78,6 +78,16 @@ TEST(Seeds, MakeSessionsThatDiffer) {
     EXPECT_NE(firstDifference(first.trace(), second.trace()), "");
 }
 
+TEST(Seeds, DemandThatThePlugInGetsThingsDone) {
+    std::size_t demands = 0;
+    for (std::uint64_t seed = 0; seed < 40; ++seed) {
+        RandomSession session(seed);
+        EXPECT_THAT(session.run(), IsEmpty());
+        demands += session.demands();
+    }
+    EXPECT_GT(demands, 40U);
+}
+
 TEST(Seeds, LetCallsFail) {
     std::size_t faults = 0;
     for (std::uint64_t seed = 0; seed < 20; ++seed) {
