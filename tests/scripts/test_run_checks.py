@@ -1,4 +1,5 @@
 import json
+import re
 import subprocess
 import sys
 
@@ -81,4 +82,4 @@ def test_a_test_that_does_not_end_is_named(capsys, tmp_path):
 
 def test_the_last_line_is_the_counts_alone():
     done = subprocess.run([sys.executable, FOLDER / "run_checks", "layers"], capture_output=True, text=True, check=True)
-    assert done.stdout.splitlines()[-1] == "2 passed, 0 failed"
+    assert re.fullmatch(r"[1-9]\d* passed, 0 failed", done.stdout.splitlines()[-1])
