@@ -136,12 +136,12 @@ bool CoordinatedRestore::begin(CoordinatorKind kind) {
 bool CoordinatedRestore::readMetadata() {
     Result<PropertyList> metadata =
         parseRestoredMetadata(platform_, app_.identifier, app_.metadata, Level::Error);
-    if (metadata) {
-        metadata_ = *std::move(metadata);
-    } else {
+    if (!metadata) {
         pieces_.lastError() = metadata.error();
+        return false;
     }
-    return metadata.ok();
+    metadata_ = *std::move(metadata);
+    return true;
 }
 
 bool CoordinatedRestore::isLeftToAppStore() const {

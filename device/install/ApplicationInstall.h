@@ -1,16 +1,14 @@
 #pragma once
 
 #include <cstdint>
-#include <functional>
 #include <string>
 
+#include "device/install/InstallContext.h"
 #include "platform/Result.h"
 
 namespace appsync {
 
-class Database;
 class FileURL;
-struct InstallContext;
 
 /// Installs a package under an identifier that is legal, in place of what was installed, and takes
 /// the placeholder away. The commit of one transaction is the last step: before it nothing has
@@ -19,9 +17,6 @@ struct InstallContext;
 /// says how the application comes. Any thread; several installs share their syncs and commits.
 Status installApplication(const InstallContext& context, const std::string& identifier,
                           const FileURL& package, std::uint64_t installType);
-
-/// What goes into the same transaction as an install; when it fails, nothing is installed.
-using AlsoCommitted = std::function<Status(Database&)>;
 
 /// The same, for who keeps the failure himself: nothing is left of one but the error.
 Status installApplicationWith(const InstallContext& context, const std::string& identifier,

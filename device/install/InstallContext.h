@@ -15,6 +15,7 @@
 // for the callers to know: registry (the plug-in's direct path), coordination (its threads) and
 // `Device` (people). Includes database, package, screen, values and system/.
 
+#include <functional>
 #include <string>
 
 #include "platform/Result.h"
@@ -22,6 +23,7 @@
 namespace appsync {
 
 class Containers;
+class Database;
 class DeviceDatabase;
 class DurabilityBarrier;
 class ProgressBook;
@@ -39,6 +41,9 @@ struct InstallContext {
     /// Names this boot of the machine; empty when it is not known.
     const std::string& boot;
 };
+
+/// What goes into the same transaction as an install; when it fails, nothing is installed.
+using AlsoCommitted = std::function<Status(Database&)>;
 
 /// A failure of the device's database as the registry tells it; other failures, and success, as
 /// they are.

@@ -33,8 +33,6 @@ constexpr std::string_view kMetadataName = "VessikMetadata.plist";
 constexpr std::string_view kDefaultIconName = "Icon.png";
 constexpr std::string_view kBundleSuffix = ".app";
 
-using AlsoCommitted = std::function<Status(Database&)>;
-
 /// A placeholder bundle as it was read.
 struct Bundle {
     std::string directoryName;

@@ -33,7 +33,7 @@ std::string hexText(const Bytes& bytes) {
 }
 
 // What breaks a line, and what would look like it, stands as in most programming languages.
-std::string quoted(std::string_view text) {
+std::string inQuotes(std::string_view text) {
     constexpr std::string_view kEscaped = "\n\r\t\\\"";
     constexpr std::string_view kLetters = "nrt\\\"";
     std::string escaped = "\"";
@@ -64,7 +64,7 @@ std::string scalarText(const PropertyList& value) {
             return "data of " + formatBytes(value.asData()->size()) + " <" +
                    hexText(*value.asData()) + ">";
         case PropertyList::Kind::String:
-            return quoted(*value.asString());
+            return inQuotes(*value.asString());
         default:
             return "null";
     }
