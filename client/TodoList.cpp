@@ -57,14 +57,9 @@ TodoIndex::TodoIndex(const PropertyList& todoList) : todoList_(todoList) {
     }
 }
 
-std::optional<std::size_t> TodoIndex::indexOf(std::string_view identifier) const {
-    const auto found = indexes_.find(identifier);
-    return found == indexes_.end() ? std::nullopt : std::optional(found->second);
-}
-
 const PropertyList* TodoIndex::find(std::string_view identifier) const {
-    const std::optional<std::size_t> index = indexOf(identifier);
-    return index ? todoList_.at(*index) : nullptr;
+    const auto found = indexes_.find(identifier);
+    return found == indexes_.end() ? nullptr : todoList_.at(found->second);
 }
 
 std::optional<std::string> AppsClient::_operationStateForIdentifier(

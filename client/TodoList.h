@@ -43,9 +43,7 @@ class TodoIndex {
   public:
     explicit TodoIndex(const PropertyList& todoList);
 
-    /// Where the first entry with this identifier stands; nothing when there is none.
-    [[nodiscard]] std::optional<std::size_t> indexOf(std::string_view identifier) const;
-    /// That entry; null when there is none.
+    /// The first entry with this identifier; null when there is none.
     [[nodiscard]] const PropertyList* find(std::string_view identifier) const;
 
   private:

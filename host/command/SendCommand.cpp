@@ -39,9 +39,6 @@ namespace {
 
 using Clock = std::chrono::steady_clock;
 
-// How often a wait for the device looks whether it is to stop.
-constexpr std::chrono::milliseconds kWaitInterval{50};
-
 Status checkArguments(const SendArguments& arguments) {
     const Status legal = checkIdentifier(arguments.identifier, kUseLegalCharacters);
     if (!legal) return legal;
@@ -74,7 +71,7 @@ class Sending {
         device_ = *std::move(device);
         const Result<DeviceSettings> settings = device_->settings();
         if (!settings) return unusable(settings.error());
-        if (settings->installation == PolicyAnswer::No) return refuse(forbidden());
+        if (settings->installation == PolicyAnswer::No) return refuse(installationForbidden());
         isCoordinated_ = settings->coordination;
         Status ready = decideParts();
         if (ready) ready = checkFile();
@@ -163,7 +160,8 @@ class Sending {
     }
 
     SessionEnd holdSession(Session& session, InstallCoordinatorService& service) {
-        if (offloaded_) return bringBack(service);
+        // The plug-in never asks for an application of the system, so it comes as the store's do.
+        if (offloaded_) return holdAsStore(service);
         if (!isCoordinated_) return session.deliver(parcel_);
         return session.sync(
             {[this](const std::string&) { return Result<std::string>(arguments_.file); },
@@ -174,45 +172,13 @@ class Sending {
              false});
     }
 
-    // The plug-in never asks for an application of the system, so it comes as the store's do.
-    SessionEnd bringBack(InstallCoordinatorService& service) {
-        const std::string& identifier = arguments_.identifier;
-        device_->letCoordinatedInstallsGo();
-        facts_.reconciled();
-        facts_.requested(identifier);
-        if (const Status sent = sendAsStore(service); !sent) {
-            facts_.failed(identifier, sent.error().description());
-            device_->cancelCoordinator(identifier, SyncClientID).ignore();
+    SessionEnd holdAsStore(InstallCoordinatorService& service) {
+        if (plan_.install.empty()) {  // another client has it in hand
+            facts_.reconciled();
             return {};
         }
-        while (!device_->waitForCoordinatedInstalls(kWaitInterval)) {
-            if (signals_.stopRequested()) return {};
-        }
-        const Result<ApplicationStatus> status = device_->status(identifier);
-        if (status && status->lastFailure) {
-            facts_.failed(identifier, status->lastFailure->error.description());
-        }
-        return {};
-    }
-
-    Status sendAsStore(InstallCoordinatorService& service) {
-        if (Status awaited = awaitPackage(service, *offloaded_); !awaited) return awaited;
-        const auto coordinator = service.existingCoordinator(arguments_.identifier, SyncClientID);
-        const LibraryPackage* package = library_.find(arguments_.identifier);
-        if (coordinator == nullptr || package == nullptr) {
-            return failure("its install was cancelled", "send it again");
-        }
-        PackageSender sender(*device_);
-        const Result<std::uint64_t> sent = deliverFromStore(
-            service, *coordinator, *package, sender,
-            [this](std::uint64_t, std::uint64_t) { return !signals_.stopRequested(); });
-        if (!sent) return sent.error();
-        facts_.sent(*sent);
-        return {};
-    }
-
-    static ErrorRecord forbidden() {
-        return failure(kInstallationForbidden, "allow it with appsync set DEVICE installation=yes");
+        return bringBack(*device_, service, *offloaded_, library_.packages.front(), facts_,
+                         [this] { return signals_.stopRequested().load(); });
     }
 
     Status checkFile() const {

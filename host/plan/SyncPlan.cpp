@@ -9,6 +9,7 @@
 #include "client/TodoList.h"
 #include "device/values/DeviceRecords.h"
 #include "device/values/PackageIdentifier.h"
+#include "host/console/Problem.h"
 #include "host/console/Text.h"
 #include "host/plan/Library.h"
 #include "platform/AppRegistry.h"
@@ -319,6 +320,10 @@ SyncPlan allowedBy(const DeviceSettings& settings, SyncPlan plan) {
 SyncPlan makeStagedPlan(const PropertyList& todoList, const std::vector<ApplicationRecord>& present,
                         const StagedPlanOptions& options) {
     return StagedPlanner(present, options).make(todoList);
+}
+
+ErrorRecord installationForbidden() {
+    return failure(kInstallationForbidden, "allow it with appsync set DEVICE installation=yes");
 }
 
 }  // namespace appsync

@@ -58,6 +58,9 @@ inline constexpr std::string_view kInstallationForbidden =
 inline constexpr std::string_view kRemovalForbidden =
     "device policy does not allow removing applications";
 
+/// The refusal of what policy keeps from being installed, with what to do.
+[[nodiscard]] ErrorRecord installationForbidden();
+
 /// Something that is left alone.
 struct PlannedSkip {
     std::string identifier;

@@ -20,10 +20,6 @@ namespace {
 
 constexpr std::chrono::milliseconds kWaitInterval{100};
 
-ErrorRecord installationForbidden() {
-    return failure(kInstallationForbidden, "allow it with appsync set DEVICE installation=yes");
-}
-
 class Store {
   public:
     Store(Device& device, const Library& library, InstallCoordinatorService& service)

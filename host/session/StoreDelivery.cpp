@@ -1,12 +1,17 @@
 #include "host/session/StoreDelivery.h"
 
+#include <chrono>
 #include <memory>
 #include <optional>
 
 #include "client/Paths.h"
+#include "device/Device.h"
 #include "device/values/DeviceRecords.h"
 #include "device/values/PackageIdentifier.h"
+#include "host/console/Problem.h"
 #include "host/plan/Library.h"
+#include "host/plan/StandingInstalls.h"
+#include "host/watch/SessionFacts.h"
 #include "platform/AppRegistry.h"
 #include "platform/FileURL.h"
 #include "platform/InstallCoordinator.h"
@@ -17,6 +22,9 @@ namespace {
 
 // A number of the platform's, as every install gives it.
 constexpr std::uint64_t kInstallTargetType = 1;
+
+// How often a wait for the device looks whether it is to stop.
+constexpr std::chrono::milliseconds kWaitInterval{50};
 
 Status handInPlaceholder(InstallCoordinatorService& service, InstallCoordinator& coordinator,
                          const ApplicationRecord& application) {
@@ -43,7 +51,14 @@ Status awaitPackage(InstallCoordinatorService& service, const ApplicationRecord&
         service.coordinator(CoordinatorKind::Initiating, application.identifier, SyncClientID,
                             InstallCoordinatorService::Creation::CreateIfNotExisting);
     if (found.error) return *found.error;
+    if (found.coordinator == nullptr) {
+        return failure("the device coordinates no install of it", "see appsync why");
+    }
     InstallCoordinator& coordinator = *found.coordinator;
+    if (coordinator.creatorIdentifier() != SyncClientID) {
+        return ErrorRecord::make(kCommandErrorDomain, kExitSomethingFailed,
+                                 heldSentence(coordinator.creatorIdentifier()));
+    }
     Status status;
     if (!coordinator.hasInstallOptions()) {
         status = coordinator.setInstallOptions({{}, kInstallTypeSync, kInstallTargetType});
@@ -78,6 +93,49 @@ Result<std::uint64_t> deliverFromStore(InstallCoordinatorService& service,
     promise->setPercentComplete(1.0);
     promise->setComplete();
     return sent;
+}
+
+namespace {
+
+Result<std::uint64_t> sendAsStore(Device& device, InstallCoordinatorService& service,
+                                  const LibraryPackage& package,
+                                  const std::function<bool()>& stopRequested) {
+    const auto coordinator = service.existingCoordinator(package.identifier, SyncClientID);
+    if (coordinator == nullptr) return failure("its install was cancelled", "send it again");
+    PackageSender sender(device);
+    return deliverFromStore(
+        service, *coordinator, package, sender,
+        [&stopRequested](std::uint64_t, std::uint64_t) { return !stopRequested(); });
+}
+
+}  // namespace
+
+SessionEnd bringBack(Device& device, InstallCoordinatorService& service,
+                     const ApplicationRecord& application, const LibraryPackage& package,
+                     SessionFacts& facts, const std::function<bool()>& stopRequested) {
+    const std::string& identifier = application.identifier;
+    device.letCoordinatedInstallsGo();
+    facts.reconciled();
+    facts.requested(identifier);
+    if (const Status awaited = awaitPackage(service, application); !awaited) {
+        facts.failed(identifier, awaited.error().description());
+        return {};
+    }
+    const Result<std::uint64_t> sent = sendAsStore(device, service, package, stopRequested);
+    if (!sent) {
+        facts.failed(identifier, sent.error().description());
+        device.cancelCoordinator(identifier, SyncClientID).ignore();
+        return {};
+    }
+    facts.sent(*sent);
+    while (!device.waitForCoordinatedInstalls(kWaitInterval)) {
+        if (stopRequested()) return {};
+    }
+    const Result<ApplicationStatus> status = device.status(identifier);
+    if (status && status->lastFailure) {
+        facts.failed(identifier, status->lastFailure->error.description());
+    }
+    return {};
 }
 
 }  // namespace appsync

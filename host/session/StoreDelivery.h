@@ -1,14 +1,18 @@
 #pragma once
 
+#include <functional>
 #include <string>
 
 #include "host/session/PackageSender.h"
+#include "host/session/Session.h"
 #include "platform/Result.h"
 
 namespace appsync {
 
+class Device;
 class InstallCoordinator;
 class InstallCoordinatorService;
+class SessionFacts;
 struct ApplicationRecord;
 struct LibraryPackage;
 
@@ -19,7 +23,8 @@ struct LibraryPackage;
 [[nodiscard]] bool isOffloadedSystemApplication(const ApplicationRecord& application);
 
 /// Has a coordinator wait for the package of an offloaded application, as the store's task. Its
-/// placeholder goes on standing, whatever comes of it.
+/// placeholder goes on standing, whatever comes of it. An error, and nothing changed, when another
+/// client has its install in hand.
 Status awaitPackage(InstallCoordinatorService& service, const ApplicationRecord& application);
 
 /// Sends a package and keeps the promise of it that the coordinator has, or gets now. Gives the
@@ -29,5 +34,12 @@ Status awaitPackage(InstallCoordinatorService& service, const ApplicationRecord&
                                                      const LibraryPackage& package,
                                                      PackageSender& sender,
                                                      const PackageSender::Progress& progress);
+
+/// Brings one offloaded application of the system back as the store would, in the place of a
+/// session with the plug-in, and waits for its install; `facts` hears what becomes of it.
+/// `stopRequested` is asked now and then.
+SessionEnd bringBack(Device& device, InstallCoordinatorService& service,
+                     const ApplicationRecord& application, const LibraryPackage& package,
+                     SessionFacts& facts, const std::function<bool()>& stopRequested);
 
 }  // namespace appsync

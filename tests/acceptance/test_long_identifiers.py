@@ -8,7 +8,7 @@ import plistlib
 import pytest
 
 import packages
-from conftest import Device, names_of
+from conftest import DIRECTLY, Device, names_of
 from staging import install, stage
 from test_restore import DATA, data_of, tmp_path, write_data
 
@@ -100,9 +100,8 @@ def test_they_are_backed_up_and_restored_with_their_data(appsync, device, long_l
         assert data_of(fresh, identifier) == {"letter": identifier.encode()}
 
 
+@DIRECTLY  # where installs are coordinated the store brings restored packages
 def test_restored_packages_wait_for_data_that_is_sent(appsync, device, long_library, tmp_path):
-    if device.is_coordinated:
-        pytest.skip("there the store brings restored packages")
     (tmp_path / "mine").write_bytes(b"mine")
     for identifier in EACH_LENGTH:
         package = package_of(long_library, identifier)

@@ -15,7 +15,7 @@ import zipfile
 import pytest
 
 import packages
-from conftest import DIRECTLY, ON_ONE_PATH, Device, names_of
+from conftest import COORDINATED, DIRECTLY, ON_ONE_PATH, Device, names_of
 from test_device import in_own_mounts
 
 DATA = "/var/mobile/Containers/Data"
@@ -643,10 +643,8 @@ def test_install_of_a_restore_that_fails_leaves_its_placeholder_to_the_store(app
     assert appsync.json("why", device.path, IDS[1])["lastError"] is None
 
 
-@pytest.mark.parametrize("way", ["send", "store"])
-def test_offloaded_application_of_the_system_is_brought_back(appsync, device, store, way):
-    if way == "store" and not device.is_coordinated:
-        pytest.skip("the store brings packages only where installs are coordinated")
+def offload_system_application(appsync, device, store):
+    """IDS[0], with data, of which the placeholder is left."""
     device.sync(store)
     write_data(device, IDS[0], {"notes": b"kept"})
     with sqlite3.connect(os.path.join(device.path, "device.db")) as database:
@@ -654,6 +652,11 @@ def test_offloaded_application_of_the_system_is_brought_back(appsync, device, st
     database.close()
     appsync("demote", device.path, IDS[0])
     assert IDS[0] in device.placeholders()
+
+
+@pytest.mark.parametrize("coordination, way", [("off", "send"), ("on", "send"), ("on", "store")], indirect=["coordination"])
+def test_offloaded_application_of_the_system_is_brought_back(appsync, device, store, way):
+    offload_system_application(appsync, device, store)
     waits = appsync.json("why", device.path, IDS[0])["waitsFor"]
     assert waits["what"] == ("store" if device.is_coordinated else "transfer")
     appsync("sync", device.path, store, expect=None)
@@ -669,3 +672,32 @@ def test_offloaded_application_of_the_system_is_brought_back(appsync, device, st
     appsync("store", device.path, store)
     if device.is_coordinated:
         assert appsync.json("coordinator", device.path, "list") == []
+
+
+@COORDINATED
+@pytest.mark.parametrize("way", ["send", "store"])
+def test_offloaded_application_of_the_system_is_left_to_another_client(appsync, device, store, way):
+    offload_system_application(appsync, device, store)
+    appsync("coordinator", device.path, "create", IDS[0], "--client", "2")
+    before = appsync.json("coordinator", device.path, "list")
+    if way == "send":
+        package = os.path.join(store, IDS[0] + ".zip")
+        sent = appsync.json("send", device.path, IDS[0], package, expect=1)
+        assert [each["identifier"] for each in sent["skipped"]] == [IDS[0]] and "client 2" in sent["skipped"][0]["why"]
+        assert sent["installed"] == [] and sent["bytes"] == 0
+    else:
+        served = appsync.json("store", device.path, store, expect=1)
+        assert [each["identifier"] for each in served["failed"]] == [IDS[0]] and served["kept"] == []
+        assert "client 2" in served["failed"][0]["error"]
+    assert appsync.json("coordinator", device.path, "list") == before
+    assert IDS[0] not in device.apps()
+
+
+@COORDINATED
+def test_store_leaves_offloaded_applications_of_the_system_where_policy_forbids_installing(appsync, device, store):
+    offload_system_application(appsync, device, store)
+    appsync("set", device.path, "installation=no")
+    served = appsync.json("store", device.path, store, expect=1)
+    assert [each["identifier"] for each in served["failed"]] == [IDS[0]] and served["kept"] == []
+    assert "policy does not allow" in served["failed"][0]["error"]
+    assert IDS[0] in device.placeholders() and appsync.json("coordinator", device.path, "list") == []

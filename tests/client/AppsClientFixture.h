@@ -60,7 +60,7 @@ class AppsClientFixture : public testing::Test {
     }
     [[nodiscard]] std::optional<std::string> operationOf(std::string_view identifier) {
         const auto todoList = platform_.propertyListAt(std::string(kTodoListPath));
-        const auto index = todoList ? TodoIndex(*todoList).indexOf(identifier) : std::nullopt;
+        const auto index = todoList ? indexOfEntry(*todoList, identifier) : std::nullopt;
         const std::string* operation =
             index ? todoList->at(*index)->findString(kTodoOperationKey) : nullptr;
         return operation != nullptr ? std::optional(*operation) : std::nullopt;

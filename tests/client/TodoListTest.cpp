@@ -17,8 +17,8 @@ TEST(TodoList, FindsTheFirstEntryOfAnIdentifier) {
     const auto list =
         PropertyList::array({entry("com.example.b", "install"), entry("com.example.a", "remove"),
                              entry("com.example.a", "install")});
-    EXPECT_EQ(TodoIndex(list).indexOf("com.example.a"), 1U);
-    EXPECT_EQ(TodoIndex(list).indexOf("com.example.c"), std::nullopt);
+    EXPECT_EQ(indexOfEntry(list, "com.example.a"), 1U);
+    EXPECT_EQ(indexOfEntry(list, "com.example.c"), std::nullopt);
     EXPECT_EQ(TodoIndex(list).find("com.example.a"), list.at(1));
     EXPECT_EQ(TodoIndex(list).find("com.example.c"), nullptr);
 }
@@ -26,7 +26,7 @@ TEST(TodoList, FindsTheFirstEntryOfAnIdentifier) {
 TEST(TodoList, PassesOverWhatIsNoEntry) {
     const auto list = PropertyList::array(
         {"com.example.a", 7, entry(7, "remove"), PropertyList::array(), entry("com.example.a", 3)});
-    EXPECT_EQ(TodoIndex(list).indexOf("com.example.a"), 4U);
+    EXPECT_EQ(indexOfEntry(list, "com.example.a"), 4U);
     EXPECT_EQ(TodoIndex(list).find("com.example.a"), list.at(4));
     EXPECT_THAT(identifiersToRemove(list), IsEmpty());
 }

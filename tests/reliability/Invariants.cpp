@@ -236,7 +236,7 @@ void Invariants::checkMarksAreMade() {
             entry.text.substr(entry.text.rfind(' ') + 1);
     }
     for (const auto& [identifier, mark] : marks) {
-        const auto index = TodoIndex(todoList_).indexOf(identifier);
+        const auto index = indexOfEntry(todoList_, identifier);
         if (index && textAt(*todoList_.at(*index), kTodoOperationKey) == mark) continue;
         violate(identifier + " is not marked as " + mark);
     }
