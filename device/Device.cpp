@@ -33,6 +33,7 @@
 #include "device/services/DeviceServices.h"
 #include "device/values/DeviceError.h"
 #include "device/values/DevicePaths.h"
+#include "device/values/PackageIdentifier.h"
 #include "system/PosixError.h"
 #include "system/RootedFileSystem.h"
 #include "system/SystemNotifications.h"

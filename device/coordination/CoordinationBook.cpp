@@ -4,8 +4,8 @@
 #include "device/database/Database.h"
 #include "device/database/DeviceDatabase.h"
 #include "device/database/RegistryTables.h"
-#include "device/registry/DeviceRegistry.h"
 #include "device/values/DeviceError.h"
+#include "device/values/PackageIdentifier.h"
 
 namespace appsync {
 

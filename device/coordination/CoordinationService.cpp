@@ -3,7 +3,6 @@
 #include "device/coordination/DevicePlaceholder.h"
 #include "device/coordination/DevicePromise.h"
 #include "device/install/BundleRemoval.h"
-#include "device/registry/DeviceRegistry.h"
 #include "device/services/DeviceServices.h"
 #include "device/values/DeviceError.h"
 #include "device/values/PackageIdentifier.h"

@@ -12,8 +12,8 @@
 //
 // A call goes from a handle to the book, from there to the database (CoordinationTables) and, when
 // a coordinator is complete, to the installer, which works with device/install; the herald tells.
-// No lock is held across a transaction or a call of an observer. Includes install, registry,
-// screen, services, database and values; made by `Device` alone.
+// No lock is held across a transaction or a call of an observer. Includes install, screen,
+// services, database, values and system/; made by `Device` alone.
 
 #include <chrono>
 #include <memory>

@@ -11,7 +11,6 @@
 #include "device/install/ProgressBook.h"
 #include "device/values/DeviceError.h"
 #include "device/values/PackageIdentifier.h"
-#include "device/values/PackageText.h"
 #include "platform/FileURL.h"
 
 namespace appsync {
@@ -106,13 +105,6 @@ Status placeholdersUnderWay(Database& database, std::vector<AppProxy>& proxies) 
 }
 
 }  // namespace
-
-Status requireLegalIdentifier(const std::string& identifier) {
-    if (isLegalIdentifier(identifier)) return {};
-    return registryError(RegistryErrorCode::IllegalIdentifier,
-                         quotedName(identifier) + " is not the identifier of an application: " +
-                             std::string(kIdentifierRule));
-}
 
 DeviceRegistry::DeviceRegistry(const InstallContext& context)
     : context_(context), observers_([this] { return installsUnderWay(); }) {}

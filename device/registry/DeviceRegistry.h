@@ -4,7 +4,7 @@
 // database what is installed and turns installs, placeholders and removals into operations of
 // device/install; `RegistryObservers` (RegistryObservers.h) tells observers, on a thread of its
 // own, of installs that are under way. Includes install, database and values. Called by the plug-in
-// through platform/ and by `Device`; coordination judges identifiers by it.
+// through platform/ and by `Device`.
 
 #include <memory>
 #include <mutex>
@@ -60,8 +60,5 @@ class DeviceRegistry final : public AppRegistry {
     /// Whose last install has failed, until an uninstall follows. Guarded by `mutex_`.
     std::set<std::string> failedInstalls_;
 };
-
-/// A registry error unless the identifier is a legal one.
-Status requireLegalIdentifier(const std::string& identifier);
 
 }  // namespace appsync

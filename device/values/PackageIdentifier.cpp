@@ -2,6 +2,9 @@
 
 #include <algorithm>
 
+#include "device/values/DeviceError.h"
+#include "device/values/PackageText.h"
+
 namespace appsync {
 
 namespace {
@@ -23,6 +26,13 @@ bool isLegalIdentifier(std::string_view text) noexcept {
     if (text.empty() || text.size() > kMaximumIdentifierLength) return false;
     if (text == "." || text == "..") return false;
     return std::all_of(text.begin(), text.end(), isIdentifierCharacter);
+}
+
+Status requireLegalIdentifier(const std::string& identifier) {
+    if (isLegalIdentifier(identifier)) return {};
+    return registryError(RegistryErrorCode::IllegalIdentifier,
+                         quotedName(identifier) + " is not the identifier of an application: " +
+                             std::string(kIdentifierRule));
 }
 
 std::string archiveNameOf(const std::string& identifier) {

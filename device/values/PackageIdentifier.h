@@ -5,6 +5,8 @@
 #include <string>
 #include <string_view>
 
+#include "platform/Result.h"
+
 namespace appsync {
 
 /// The longest identifier of an application, in bytes.
@@ -17,6 +19,9 @@ inline constexpr std::string_view kIdentifierRule = "1 to 255 letters, digits, '
 /// letters, digits, '.', '-' and '_', and neither "." nor "..". Such a text is safe as the name of
 /// a file.
 [[nodiscard]] bool isLegalIdentifier(std::string_view text) noexcept;
+
+/// An error of `kRegistryErrorDomain` unless the identifier is a legal one.
+Status requireLegalIdentifier(const std::string& identifier);
 
 /// The name of the file in which the package of an application, or its data, travels and waits: the
 /// identifier and ".zip". No file name is longer than 255 bytes: where that would be, it is the
