@@ -1,7 +1,6 @@
 #pragma once
 
 #include <memory>
-#include <string>
 
 #include "client/Log.h"
 #include "coordination/PieceLog.h"

@@ -5,7 +5,6 @@
 #include <algorithm>
 #include <array>
 #include <cerrno>
-#include <filesystem>
 #include <fstream>
 #include <map>
 #include <set>
@@ -16,7 +15,6 @@
 #include "device/SessionLock.h"
 #include "device/SpaceReserve.h"
 #include "device/coordination/CoordinationService.h"
-#include "device/database/CoordinationTables.h"
 #include "device/database/Database.h"
 #include "device/database/DeviceDatabase.h"
 #include "device/install/BundleRemoval.h"

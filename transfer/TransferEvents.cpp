@@ -5,7 +5,6 @@
 
 #include "client/AppsClient.h"
 #include "coordination/InstallErrors.h"
-#include "platform/BackupService.h"
 #include "transfer/DownloadAsset.h"
 #include "transfer/InstallNames.h"
 #include "transfer/TransferEnd.h"

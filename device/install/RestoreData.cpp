@@ -7,7 +7,6 @@
 #include "device/package/DataArchive.h"
 #include "device/values/DevicePaths.h"
 #include "device/values/PackageIdentifier.h"
-#include "system/PosixError.h"
 #include "system/RootDirectory.h"
 #include "system/RootedFileSystem.h"
 

@@ -13,7 +13,6 @@
 #include "device/archive/ArchiveWriter.h"
 #include "device/archive/PackageArchive.h"
 #include "device/archive/PackageEntries.h"
-#include "device/archive/PackageError.h"
 #include "device/archive/PackageFile.h"
 #include "device/archive/PackageFolder.h"
 #include "device/archive/PackageLimits.h"

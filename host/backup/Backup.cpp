@@ -13,7 +13,6 @@
 #include "host/backup/BackupManifestReader.h"
 #include "host/console/JsonWriting.h"
 #include "host/console/Problem.h"
-#include "host/console/Text.h"
 #include "host/file/HostFile.h"
 
 namespace appsync {

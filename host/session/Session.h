@@ -13,9 +13,7 @@
 // commands and by host/backup (a restore is a session too).
 
 #include <atomic>
-#include <cstdint>
 #include <functional>
-#include <memory>
 #include <optional>
 #include <set>
 #include <string>

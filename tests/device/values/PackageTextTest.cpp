@@ -4,8 +4,6 @@
 
 #include <string>
 
-#include "device/archive/PackageError.h"
-
 namespace appsync {
 
 namespace {
