@@ -1,11 +1,8 @@
-#include <atomic>
 #include <filesystem>
 #include <fstream>
 #include <sstream>
-#include <thread>
 
 #include "device/database/Database.h"
-#include "host/watch/WatchedCoordination.h"
 #include "tests/host/HostFixture.h"
 
 namespace appsync {
@@ -128,32 +125,6 @@ TEST_F(CoordinatedSync, LookingAtTheDeviceStartsNothing) {
     EXPECT_EQ(run({"inventory", device}), 0);
     EXPECT_EQ(run({"apps", device}), 0);
     EXPECT_THAT(coordinators(), ElementsAre("com.a"));
-}
-
-// The gate and what stands in it.
-
-TEST(CallGateTest, LetsNobodyInOnceItIsClosed) {
-    CallGate gate;
-    EXPECT_TRUE(gate.enter());
-    gate.leave();
-    gate.close();
-    EXPECT_FALSE(gate.enter());
-    gate.close();
-}
-
-TEST(CallGateTest, ClosesWhenTheLastOneHasLeft) {
-    CallGate gate;
-    ASSERT_TRUE(gate.enter());
-    std::atomic<bool> isClosed = false;
-    std::thread closer([&] {
-        gate.close();
-        isClosed = true;
-    });
-    while (gate.enter()) gate.leave();  // until the other thread has begun to close it
-    EXPECT_FALSE(isClosed);
-    gate.leave();
-    closer.join();
-    EXPECT_TRUE(isClosed);
 }
 
 }  // namespace
