@@ -7,7 +7,8 @@
 //
 //     values         records, errors, paths and names that all rooms speak of
 //     database       SQLite: connections, schema, the statements of each table
-//     package        reading, checking, unpacking and writing archives
+//     archive        reading, checking and writing zip archives
+//     package        packages and archives of data: looked into, unpacked and made
 //     screen         icons, the home screen and its picture
 //     services       the services that are little more than a table
 //     install        installing and removing: containers, placeholders, progress, putting in order

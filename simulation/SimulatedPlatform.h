@@ -46,7 +46,7 @@ struct DeviceImage;
 
 /// A whole platform in memory, on one thread, by a virtual clock.
 ///
-///     PropertyListCodec codec;                        // whatever reads and writes property lists
+///     SystemPropertyLists codec;                      // whatever reads and writes property lists
 ///     SimulatedPlatform platform(codec);              // or (codec, Scheduling::seeded(7))
 ///     platform.registry.addApplication("com.example.a", "1.0");
 ///     platform.homeScreen.scriptTermination("com.example.a", {1, 0});     // denied, then granted

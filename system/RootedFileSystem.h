@@ -4,9 +4,10 @@
 // or what several need:
 //
 //     files           RootedFileSystem.h, over RootDirectory.h, which no path leads out of;
-//                     TreeWalk.h, TemporaryFile.h, DescriptorIO.h, UniqueFd.h, PosixError.h
+//                     MachinePath.h, TreeWalk.h, TemporaryFile.h, DescriptorIO.h, UniqueFd.h,
+//                     PosixError.h
 //     work            SystemWorkQueues.h, with ThreadedOperationQueue.h and DelayedWork.h
-//     log             JsonLogFacility.h
+//     log             JsonLogFacility.h, over LogFile.h, which bounds it
 //     notifications   SystemNotifications.h
 //     property_list/  both encodings, a room of its own
 //

@@ -4,6 +4,7 @@
 // PackageArchiveEnd.h (where the list of entries is), PackageArchiveDirectory.h (the list, held
 // against the headers before the contents, PackageArchiveHeaders.h), PackageEntries.h (names,
 // kinds, the tree), PackageArchive.h (all of it), PackageArchiveContents.h (what is in a file).
+// PackageArchiveFormat.h has the records and numbers that several of them read.
 // PackageLimits.h says what an archive may claim, PackageError.h why one is refused. Written by
 // ArchiveWriter.h, with libzip, from what PackageFolder.h finds.
 //

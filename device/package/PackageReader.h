@@ -5,8 +5,9 @@
 // DataArchive.h has the archives of an application's data, which backups hold. Behind the reader:
 // PackageInfo.h (Info.plist) and PackageUnpacker.h (writing the tree).
 //
-// Includes device/archive, device/values and system/: no database and no device. Called by install
-// and by host/. What reads foreign bytes here is fuzzed (fuzz/readers/).
+// Includes device/archive, device/values and system/: no database and no device. Called by
+// install, screen (the usual name of an icon) and host/. What reads foreign bytes here is fuzzed
+// (fuzz/readers/).
 
 #include <cstdint>
 #include <functional>

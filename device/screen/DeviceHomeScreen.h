@@ -6,9 +6,9 @@
 // knows cairo, and CairoIconRenderer.h gives the plug-in the same as a service. HomeScreenPicture.h
 // draws the whole screen (`appsync screen`).
 //
-// Includes device/database, device/values, and of device/package only the name that an icon has by
-// default. Called by install (icons of placeholders), coordination (terminations), `Device` and the
-// command.
+// Includes device/database, device/values, system/, cairo, and of device/package only the name that
+// an icon has by default. Called by install (icons of placeholders), coordination (terminations),
+// `Device` and the command.
 
 #include <chrono>
 #include <memory>

@@ -5,9 +5,9 @@
 // BackupManifestKeys.h) and the check of it against its files. BackupFolder.h makes a folder that
 // is a whole backup or known to be none; BackupMaking.h fills it from a device; Restoring.h places
 // it on a device, has the plug-in make the placeholders, and says what came of it, RestoreDefects.h
-// what of it a device would refuse. The format: docs/device-format.md. Includes session (a restore
-// is one), plan, file, console, device and restore/ (what the plug-in reads of a backup); called by
-// the commands.
+// what of it a device would refuse, RestoredData.h what space its data takes. The format:
+// docs/device-format.md. Includes session (a restore is one), plan, file, console, device, system/,
+// client/ (paths) and restore/ (what the plug-in reads of a backup); called by the commands.
 
 #include <map>
 #include <optional>

@@ -5,8 +5,8 @@
 // and summaries too; JsonRecords.h has the JSON of what a device holds; WhyAnswer.h answers what an
 // application waits for; PropertyListOutline.h shows a property list. All of them make text of
 // values that others have gathered: nothing here asks a device or decides anything. Contracts with
-// programs that read it: docs/commands.md. Includes session, plan and console; called by the
-// commands.
+// programs that read it: docs/commands.md. Includes session, watch, plan, console, and of
+// the device its values and packages; called by the commands.
 
 #include <memory>
 #include <string>

@@ -5,11 +5,12 @@
 // lacks, StandingInstalls.h what an earlier coordinated session has left and goes on, StagingArea.h
 // and InterruptedStaging.h the staging area that a host has written or an interrupted session left.
 // SyncPreparation.h puts these together for `sync` and `plan`, and makes the device ready for the
-// session; TransferError.h are the errors of what travels.
+// session. For `send`, RestoredParts.h is what a package of a restore comes with;
+// TransferError.h are the errors of what travels.
 //
 // The plan itself is plain: device records in, `SyncPlan` out, no file and no device touched.
-// Called by session (which judges its outcome by the plan), output, backup and the commands.
-// Includes console, file, device and client/ (paths).
+// Called by session (which judges its outcome by the plan), watch, output, backup and the commands.
+// Includes console, file, device, system/ and client/ (paths, the todo list).
 
 #include <cstdint>
 #include <functional>

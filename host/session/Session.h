@@ -7,10 +7,11 @@
 //     SyncOutcome.h     holds plan, facts and device against each other: what failed, and why
 //     StopSignals.h     Ctrl-C; Interruption.h is what is said then
 //     Parcels.h, AppStore.h, Inventory.h    what `send`, `store` and `inventory` are about
+//     StoreDelivery.h   how the app store keeps the promise of one package
 //
 // What is to be done comes from host/plan, where nothing runs; what becomes of it is seen by
 // host/watch, which includes nothing of this; how it is shown is for host/output. Called by the
-// commands and by host/backup (a restore is a session too).
+// commands, by host/output and by host/backup (a restore is a session too).
 
 #include <atomic>
 #include <functional>

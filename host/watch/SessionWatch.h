@@ -6,9 +6,8 @@
 //     SessionWatch.h    the plug-in's calls, with WatchedCoordination.h those of the coordination
 //                       service; keeps what it sees as SessionFacts.h and tells SyncEvents.h
 //     SyncEvents.h      one order for the events of all threads; a SyncDisplay shows them
-//     SyncDaemon.h      the daemon that the plug-in is told of; TransferQueue.h is what it has
-//     still
-//                       to send
+//     SyncDaemon.h      the daemon that the plug-in is told of, with TransferQueue.h, which is
+//                       what it has still to send
 //
 // Includes host/plan and the device. host/session drives, host/output implements SyncDisplay.
 

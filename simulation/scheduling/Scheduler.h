@@ -4,7 +4,7 @@
 // tasks and to the test, which is the host, in an order that follows from a seed; each task is a
 // `Fiber` (Fiber.h: a stack of its own on the one thread). Whatever blocks in the simulation waits
 // here, and time passes here only. The lowest room of simulation/: all others wait and wake through
-// it, most of them through the recorder. Includes platform/ and what fibers need to switch stacks.
+// it, most of them through the recorder. Includes only what fibers need to switch stacks.
 
 #include <chrono>
 #include <cstddef>
