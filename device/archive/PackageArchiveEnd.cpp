@@ -26,6 +26,10 @@ constexpr std::size_t kLargeEndBytes = 56;
 /// What the large end does not count in its own size.
 constexpr std::uint64_t kLargeEndHead = 12;
 
+/// Archivers that write to a pipe fill up their last record with zeros; a record is at most so
+/// long.
+constexpr std::size_t kLongestPadding = 10240;
+
 /// A package may hold archives of its own, whose ends are seen too. With many, one that is not the
 /// end is likely meant to be taken for it by somebody.
 constexpr std::size_t kMostEnds = 16;
@@ -44,14 +48,14 @@ class EndSearch {
     EndSearch(const PackageFile& file, const PackageLimits& limits, const Bytes& tail)
         : file_(file), limits_(limits), tail_(tail) {}
 
-    /// The one whose comment ends where the file ends.
+    /// The one whose comment ends where the file ends, but for padding.
     Result<ArchiveDirectoryPlace> run() {
         std::optional<std::size_t> found;
         std::size_t count = 0;
         for (std::size_t at = 0; at + kEndBytes <= tail_.size(); ++at) {
             if (tail_[at] != 'P' || u32(tail_, at) != kEndSignature) continue;
             if (++count > kMostEnds) return inconsistentArchive("it has too many ends");
-            if (at + kEndBytes + u16(tail_, at + 20) != tail_.size()) continue;
+            if (!isPaddingFrom(at + kEndBytes + u16(tail_, at + 20))) continue;
             if (found) return inconsistentArchive("it has two ends");
             found = at;
         }
@@ -62,6 +66,12 @@ class EndSearch {
   private:
     [[nodiscard]] std::uint64_t fileOffset(std::size_t at) const {
         return file_.size() - tail_.size() + at;
+    }
+
+    [[nodiscard]] bool isPaddingFrom(std::size_t at) const {
+        if (at > tail_.size() || tail_.size() - at >= kLongestPadding) return false;
+        return std::all_of(tail_.begin() + static_cast<std::ptrdiff_t>(at), tail_.end(),
+                           [](std::uint8_t byte) { return byte == 0; });
     }
 
     [[nodiscard]] bool isLarge(std::size_t at) const {
@@ -151,7 +161,8 @@ class EndSearch {
 
 Result<ArchiveDirectoryPlace> findArchiveDirectory(const PackageFile& file,
                                                    const PackageLimits& limits) {
-    constexpr std::uint64_t kTailBytes = kLongestComment + 1 + kEndBytes + kLocatorBytes;
+    constexpr std::uint64_t kTailBytes =
+        kLongestComment + 1 + kEndBytes + kLocatorBytes + kLongestPadding;
     const std::uint64_t size = std::min(file.size(), kTailBytes);
     const Result<Bytes> tail = file.readExactly(file.size() - size, size);
     if (!tail) return tail.error();

@@ -87,6 +87,7 @@ ARCHIVERS = {
     "bsdtar": shell("bsdtar -c --format zip -f {out} *"),
     "bsdtar, stored": shell("bsdtar -c --format zip --options zip:compression=store -f {out} *"),
     "bsdtar, large sizes": shell("bsdtar -c --format zip --options zip:zip64 -f {out} *"),
+    "bsdtar, into a pipe": shell("bsdtar -c --format zip -f - * | cat > {out}"),
     "7z": shell("7z a -tzip {out} *"),
     "as jar writes": as_jar_writes,
     # A whole JDK brings it, which nobody has to install for this.

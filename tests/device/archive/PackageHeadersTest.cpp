@@ -281,6 +281,15 @@ TEST_F(PackageHeadersTest, bytesThatBelongToNoEntryAreRefused) {
     }
 }
 
+TEST_F(PackageHeadersTest, zerosThatFillUpTheLastRecordOfAPipeAreNothing) {
+    const std::string whole = atlasWith({one()}).bytes();
+    EXPECT_TRUE(open(whole + std::string(2, '\0')).ok());
+    EXPECT_TRUE(open(whole + std::string(10239, '\0')).ok());
+    EXPECT_FALSE(open(whole + std::string(10240, '\0')).ok());
+    EXPECT_FALSE(open(whole + std::string(100, '\0') + "x").ok());
+    EXPECT_FALSE(open(whole + "x" + std::string(100, '\0')).ok());
+}
+
 TEST_F(PackageHeadersTest, aGapThatLooksLikeADescriptorIsRefusedWhereNoneIsAnnounced) {
     EXPECT_TRUE(refused(open(atlasWith({one()}).gap(zipStreamed(one()).descriptor)),
                         Code::Inconsistent, "16 bytes after entry 'Atlas.app/one'"));
