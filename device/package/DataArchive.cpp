@@ -16,6 +16,7 @@
 #include "device/archive/PackageFile.h"
 #include "device/archive/PackageFolder.h"
 #include "device/archive/PackageLimits.h"
+#include "device/package/PackageReader.h"
 #include "device/package/PackageUnpacker.h"
 #include "device/values/PackageText.h"
 #include "system/PosixError.h"
@@ -122,14 +123,19 @@ Result<std::unique_ptr<PackageArchive>> openArchive(Result<PackageFile> file) {
     return archive;
 }
 
+std::uint64_t bytesOnDevice(const PackageArchive& archive) {
+    return archive.unpackedBytes() + archive.entries().size() * kBlockBytes;
+}
+
 Status checkSpace(int directory, const PackageArchive& archive) {
     struct statvfs space = {};
     if (::fstatvfs(directory, &space) != 0) return {};  // the writes will tell
     const std::uint64_t free = std::uint64_t{space.f_bavail} * space.f_frsize;
-    if (archive.unpackedBytes() <= free) return {};
+    const std::uint64_t needed = bytesOnDevice(archive);
+    if (needed <= free) return {};
     return posixError(ENOSPC, "unpack", archive.name(),
-                      "it needs " + std::to_string(archive.unpackedBytes()) + " bytes and " +
-                          std::to_string(free) + " are free; remove something from the device");
+                      "it needs " + std::to_string(needed) + " bytes and " + std::to_string(free) +
+                          " are free; remove something from the device");
 }
 
 }  // namespace
@@ -159,7 +165,7 @@ Result<DataArchiveContents> writeDataArchive(const RootDirectory& root,
 Result<std::uint64_t> checkDataArchive(const std::string& file) {
     const auto archive = openArchive(PackageFile::open(file));
     if (!archive) return archive.error();
-    return (*archive)->unpackedBytes();
+    return bytesOnDevice(**archive);
 }
 
 Status verifyDataArchive(const std::string& file) {

@@ -25,7 +25,8 @@ struct DataArchiveContents {
                                                            const std::string& file);
 
 /// Refuses a file of this machine that is no archive of data, or one that no device would unpack.
-/// Takes what the archive says of its contents for true, and gives the bytes that they unpack to.
+/// Takes what the archive says of its contents for true, and gives the bytes that they take
+/// on a device, in whole blocks.
 /// Errors say what is wrong with the archive; which it is, and what to do, is for the caller to
 /// say.
 [[nodiscard]] Result<std::uint64_t> checkDataArchive(const std::string& file);

@@ -26,6 +26,9 @@ class PackageArchive;
 class PackageFile;
 class PropertyListSerialization;
 
+/// A file fills its last block of the device's disk, and a directory takes one.
+inline constexpr std::uint64_t kBlockBytes = 4096;
+
 /// What a package says of itself. Every text is valid UTF-8 without control characters.
 struct PackageInfo {
     /// "BundleIdentifier": a legal identifier.

@@ -2,16 +2,9 @@
 
 #include "platform/PropertyList.h"
 #include "platform/PropertyListSerialization.h"
+#include "restore/RestoredMetadata.h"
 
 namespace appsync {
-namespace {
-
-bool hasText(const PropertyList& metadata, std::string_view key) {
-    return metadata.findString(key) != nullptr;
-}
-
-}  // namespace
-
 std::string defectOfRestoreEntry(const PropertyList& entry,
                                  PropertyListSerialization& propertyLists, bool isCoordinated) {
     if (!entry.isMap()) return "its entry in the restore information is no map";
@@ -23,10 +16,8 @@ std::string defectOfRestoreEntry(const PropertyList& entry,
     if (!metadata) return "its store metadata is damaged";
     if (!metadata->isMap()) return "its store metadata is no map";
     if (isCoordinated) return "";
-    if (!hasText(*metadata, "title") && !hasText(*metadata, "itemName")) {
-        return "its store metadata has no title";
-    }
-    return hasText(*metadata, "bundleVersion") ? "" : "its store metadata has no version";
+    if (displayTitleOf(*metadata) == nullptr) return "its store metadata has no title";
+    return bundleVersionOf(*metadata) != nullptr ? "" : "its store metadata has no version";
 }
 
 std::string defectOfDemotedApps(const Result<PropertyList>& list) {

@@ -17,7 +17,6 @@
 namespace appsync {
 namespace {
 
-constexpr std::uint64_t kBlockBytes = 4096;
 constexpr std::uint64_t kMaximumIconOrderBytes = std::uint64_t{16} << 20;
 
 // "A.ZIP" counts too: a package that is passed over would look like one to remove.
