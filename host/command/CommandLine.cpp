@@ -70,6 +70,9 @@ class Commands {
     int run(std::vector<std::string> arguments) {
         if (!arguments.empty() && arguments.front() == "help") {
             arguments.erase(arguments.begin());
+            if (const Status known = checkCommands(arguments); !known) {
+                return console_.fail(known.error());
+            }
             arguments.emplace_back("--help");
         }
         if (!arguments.empty() && isUnknownCommand(arguments.front())) {
@@ -93,6 +96,22 @@ class Commands {
         const auto known = app_.get_subcommands(
             [&name](const CLI::App* command) { return command->get_name() == name; });
         return !name.starts_with('-') && known.empty();
+    }
+
+    // Whether the words are a command, and a command of that one.
+    [[nodiscard]] Status checkCommands(const std::vector<std::string>& words) const {
+        const CLI::App* command = &app_;
+        for (const std::string& word : words) {
+            const auto known = command->get_subcommands(
+                [&word](const CLI::App* each) { return each->get_name() == word; });
+            if (known.empty()) {
+                const std::string of = command == &app_ ? "" : " of " + command->get_name();
+                return wrongUsage("there is no command " + shownArgument(word) + of,
+                                  "see appsync --help");
+            }
+            command = known.front();
+        }
+        return {};
     }
 
     // The command that the arguments name, as it is typed: "appsync package make".

@@ -107,8 +107,10 @@ std::string dateText(const PropertyList::Date& date) {
     gmtime_r(&seconds, &parts);
     std::array<char, 64> buffer{};
     const std::size_t length =
-        std::strftime(buffer.data(), buffer.size(), "%Y-%m-%dT%H:%M:%SZ", &parts);
-    return {buffer.data(), length};
+        std::strftime(buffer.data(), buffer.size(), "-%m-%dT%H:%M:%SZ", &parts);
+    std::string year = std::to_string(parts.tm_year + 1900);
+    if (parts.tm_year + 1900 >= 0 && year.size() < 4) year.insert(0, 4 - year.size(), '0');
+    return year.append(buffer.data(), length);
 }
 
 std::string base64Text(ByteView bytes) {

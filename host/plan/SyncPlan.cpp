@@ -52,14 +52,20 @@ bool isOffloaded(const ApplicationRecord& placeholder) {
            placeholder.installType == kInstallTypeIntentionalDowngrade;
 }
 
-std::string whyNot(const Present& present) {
-    if (present.isSystem()) return "it belongs to the system";
+std::string whyNot(const Present& present, bool isCoordinated) {
+    if (present.isSystem()) {
+        const bool comesBack = present.placeholder != nullptr && isOffloaded(*present.placeholder);
+        return comesBack ? "it belongs to the system, and is offloaded: appsync send brings it back"
+                         : "it belongs to the system";
+    }
     if (isOffloaded(*present.placeholder)) {
         return "it is offloaded on the device: appsync send brings it back";
     }
     if (present.placeholder->installType == kInstallTypeRestore) {
-        return "a restore brought it back, and its package is the store's to bring, or that of "
-               "appsync send --restore";
+        return isCoordinated
+                   ? "a restore brought it back, and its package is the store's to bring: "
+                     "see appsync store"
+                   : "a restore brought it back: appsync send --restore brings its package";
     }
     return "another install of it is under way on the device";
 }
@@ -113,7 +119,7 @@ class Planner {
         if (isAskedFor) {
             plan_.install.push_back(plannedInstall(package, {}));
         } else if (present.isSystem() || present.placeholder != nullptr) {
-            skip(package.identifier, whyNot(present), true);
+            skip(package.identifier, whyNot(present, options_.bringsOffloaded), true);
         } else if (present.application->version.value_or("") != package.version) {
             plan_.update.push_back(
                 plannedInstall(package, present.application->version.value_or("")));
@@ -189,7 +195,8 @@ class StagedPlanner {
         const auto found = present_.find(identifier);
         const bool isThere = found != present_.end() && !removals_.contains(identifier);
         if (isThere && isNotAskedFor(found->second)) {
-            plan_.skipped.push_back({identifier, whyNot(found->second), true});
+            plan_.skipped.push_back(
+                {identifier, whyNot(found->second, options_.bringsOffloaded), true});
             return;
         }
         const bool isInstalled = found != present_.end() && found->second.application != nullptr;

@@ -80,6 +80,8 @@ INSTANTIATE_TEST_SUITE_P(
                    "OUT is required: see appsync package make --help"},
         WrongUsage{{""}, "there is no command ''"},
         WrongUsage{{"help", "dance"}, "there is no command dance"},
+        WrongUsage{{"help", "package", "dance"}, "there is no command dance of package"},
+        WrongUsage{{"help", "sync", "extra"}, "there is no command extra of sync"},
         // One identifier for each --remove: what follows is an argument of the command.
         WrongUsage{{"sync", "device", "library", "--remove", "com.a", "com.b"},
                    "com.b is one argument too many for appsync sync"}));

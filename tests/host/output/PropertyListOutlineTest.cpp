@@ -39,6 +39,7 @@ TEST(DateText, SurvivesDatesThatNoCalendarHolds) {
     EXPECT_EQ(dateText({1e300}), "1.0000000000000001e+300 s since 2001");
     EXPECT_EQ(dateText({std::numeric_limits<double>::quiet_NaN()}), "nan s since 2001");
     EXPECT_EQ(dateText({-0.5}), "2000-12-31T23:59:59Z");
+    EXPECT_EQ(dateText({-63'113'904'000.0}), "0001-01-01T00:00:00Z");
 }
 
 TEST(Base64Text, PadsToWholeGroups) {

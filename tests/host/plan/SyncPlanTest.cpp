@@ -16,6 +16,7 @@ namespace {
 using testing::ElementsAre;
 using testing::HasSubstr;
 using testing::IsEmpty;
+using testing::Not;
 
 Library libraryOf(std::initializer_list<std::pair<const char*, const char*>> packages) {
     Library library;
@@ -118,6 +119,24 @@ TEST(SyncPlan, MirrorKeepsEverythingWhileAPackageCannotBeRead) {
     EXPECT_THAT(plan.remove, IsEmpty());
     ASSERT_EQ(plan.failed.size(), 1U);
     EXPECT_EQ(plan.failed[0].identifier, "broken.zip");
+}
+
+TEST(SyncPlan, NamesTheOneCommandThatBringsWhatItLeavesAlone) {
+    ApplicationRecord system = placeholder("com.system", kInstallTypeDowngrade);
+    system.type = "System";
+    const Library library = libraryOf({{"com.restoring", "2"}, {"com.system", "2"}});
+    const std::vector<ApplicationRecord> present = {
+        placeholder("com.restoring", kInstallTypeRestore), system};
+    const SyncPlan direct = makePlan(library, present, {});
+    ASSERT_EQ(direct.skipped.size(), 2U);
+    EXPECT_THAT(direct.skipped[0].why, HasSubstr("appsync send --restore"));
+    EXPECT_THAT(direct.skipped[1].why, HasSubstr("appsync send brings it back"));
+    PlanOptions options;
+    options.bringsOffloaded = true;
+    const SyncPlan coordinated = makePlan(library, present, options);
+    ASSERT_EQ(coordinated.skipped.size(), 2U);
+    EXPECT_THAT(coordinated.skipped[0].why, HasSubstr("see appsync store"));
+    EXPECT_THAT(coordinated.skipped[0].why, Not(HasSubstr("--restore")));
 }
 
 TEST(SyncPlan, LeavesSystemAndOffloadedApplicationsAlone) {
