@@ -24,7 +24,7 @@ namespace {
 constexpr std::uint64_t kInstallTargetType = 1;
 
 // How often a wait for the device looks whether it is to stop.
-constexpr std::chrono::milliseconds kWaitInterval{50};
+constexpr std::chrono::milliseconds kLookInterval{50};
 
 Status handInPlaceholder(InstallCoordinatorService& service, InstallCoordinator& coordinator,
                          const ApplicationRecord& application) {
@@ -128,7 +128,7 @@ SessionEnd bringBack(Device& device, InstallCoordinatorService& service,
         return {};
     }
     facts.sent(*sent);
-    while (!device.waitForCoordinatedInstalls(kWaitInterval)) {
+    while (!device.waitForCoordinatedInstalls(kLookInterval)) {
         if (stopRequested()) return {};
     }
     const Result<ApplicationStatus> status = device.status(identifier);
