@@ -1,5 +1,6 @@
 #pragma once
 
+#include <algorithm>
 #include <chrono>
 #include <cstdint>
 
@@ -12,8 +13,11 @@ namespace appsync {
     return std::chrono::duration_cast<std::chrono::milliseconds>(time.time_since_epoch()).count();
 }
 
+/// What lies beyond the clock's range, as in a database that somebody has altered, becomes its end.
 [[nodiscard]] inline WallTime wallTime(std::int64_t milliseconds) {
-    return WallTime(std::chrono::milliseconds(milliseconds));
+    constexpr std::int64_t kFarthest =
+        std::chrono::duration_cast<std::chrono::milliseconds>(WallTime::duration::max()).count();
+    return WallTime(std::chrono::milliseconds(std::clamp(milliseconds, -kFarthest, kFarthest)));
 }
 
 [[nodiscard]] inline WallTime wallNow() { return std::chrono::system_clock::now(); }
