@@ -14,7 +14,6 @@
 #include "host/command/OpenDevice.h"
 #include "host/console/Console.h"
 #include "host/console/Problem.h"
-#include "host/console/Text.h"
 #include "host/file/HostFile.h"
 #include "host/plan/InterruptedStaging.h"
 #include "host/plan/Library.h"
@@ -30,7 +29,6 @@
 #include "host/session/StoreDelivery.h"
 #include "host/session/SyncOutcome.h"
 #include "host/watch/SessionFacts.h"
-#include "platform/InstallCoordinator.h"
 #include "platform/InstallCoordinatorService.h"
 #include "platform/Platform.h"
 
