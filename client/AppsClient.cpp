@@ -2,6 +2,7 @@
 
 #include <cstddef>
 
+#include "client/TodoListFile.h"
 #include "platform/BackupService.h"
 #include "platform/DevicePolicyService.h"
 #include "platform/InstallCoordinatorService.h"
@@ -43,6 +44,7 @@ bool isAllowed(DevicePolicyService& policy, PolicyFeature feature) {
 AppsClient::AppsClient(const Platform& platform)
     : platform_(platform),
       log_(platform),
+      todoListFile_(std::make_unique<TodoListFile>()),
       restoreStateReader_(std::make_unique<RestoreStateReader>()) {}
 
 std::shared_ptr<AppsClient> AppsClient::create(const Platform& platform) {

@@ -24,6 +24,7 @@ namespace appsync {
 class AppInstallObserver;
 class BackupManager;
 class RestoreStateReader;
+class TodoListFile;
 class WantedTransfers;
 
 /// The plug-in: the one object that the SyncHost sees, for the dataclass "Application".
@@ -374,6 +375,7 @@ class AppsClient final : public SyncClient,
     // this order. Reading needs neither: the files are replaced atomically.
     std::unique_ptr<Lock> todoListLock_;
     std::unique_ptr<Lock> restoreStateLock_;
+    const std::unique_ptr<TodoListFile> todoListFile_;              // under todoListLock_
     const std::unique_ptr<RestoreStateReader> restoreStateReader_;  // guards itself
 };
 

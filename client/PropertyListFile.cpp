@@ -37,8 +37,14 @@ std::optional<PropertyList> readListFile(const Platform& platform, std::string_v
     const Result<Bytes> bytes = platform.files.readFile(std::string(path));
     if (!bytes && error != nullptr) *error = bytes.error();
     if (!bytes || bytes->empty()) return std::nullopt;
+    return parseListFile(platform, *bytes, isExpected, messages, error);
+}
+
+std::optional<PropertyList> parseListFile(const Platform& platform, ByteView bytes,
+                                          bool (PropertyList::*isExpected)() const noexcept,
+                                          const ListFileMessages& messages, ErrorOut error) {
     const Log log(platform);
-    Result<PropertyList> list = platform.propertyLists.parse(*bytes);
+    Result<PropertyList> list = platform.propertyLists.parse(bytes);
     if (!list) {
         if (error != nullptr) *error = list.error();
         log(Level::Error, messages.damaged);

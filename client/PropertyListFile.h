@@ -32,6 +32,13 @@ struct ListFileMessages {
                                                        const ListFileMessages& messages,
                                                        ErrorOut error);
 
+/// The same of bytes that were read already and are not empty.
+[[nodiscard]] std::optional<PropertyList> parseListFile(const Platform& platform, ByteView bytes,
+                                                        bool (PropertyList::*isExpected)()
+                                                            const noexcept,
+                                                        const ListFileMessages& messages,
+                                                        ErrorOut error);
+
 /// The map in a property-list file, either encoding. Nothing when the file is missing, cannot be
 /// read or parsed, or holds something else.
 [[nodiscard]] std::optional<PropertyList> readMapFile(const Platform& platform,

@@ -7,6 +7,7 @@
 #include "client/Paths.h"
 #include "client/PropertyListFile.h"
 #include "client/TodoList.h"
+#include "client/TodoListFile.h"
 #include "platform/HomeScreenService.h"
 #include "platform/InstallTransactionLog.h"
 #include "platform/InstallerService.h"
@@ -183,8 +184,7 @@ void AppsClient::syncEndedWithSuccess(bool success) {
 
 std::optional<PropertyList> AppsClient::_loadPlist(const Platform& platform, std::string_view path,
                                                    ErrorOut error) {
-    return readListFile(platform, path, &PropertyList::isArray,
-                        {"%s|couldn't parse todo list", "%s|todo list is not an array"}, error);
+    return readListFile(platform, path, &PropertyList::isArray, kTodoListMessages, error);
 }
 
 void AppsClient::_notifyDeskora(const Platform& platform, bool starting) {

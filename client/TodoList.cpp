@@ -6,8 +6,8 @@
 
 #include "client/AppsClient.h"
 #include "client/Paths.h"
-#include "client/PropertyListFile.h"
 #include "client/SafeIdentifier.h"
+#include "client/TodoListFile.h"
 
 namespace appsync {
 
@@ -74,18 +74,12 @@ std::optional<std::string> AppsClient::_operationStateForIdentifier(
 
 void AppsClient::changeAssetID(const std::string& identifier, std::string_view toDo) {
     const std::lock_guard guard(*todoListLock_);
-    std::optional<PropertyList> todoList = _loadPlist(platform_, kTodoListPath, nullptr);
-    if (!todoList) return;
-    const std::optional<std::size_t> index = indexOfEntry(*todoList, identifier);
-    if (!index) return;
-    PropertyList entry = todoList->take(*index);
+    if (!todoListFile_->read(platform_)) return;
+    const std::optional<const PropertyList*> operation = todoListFile_->operationOf(identifier);
+    if (!operation) return;
     log_(Level::Default, "%s|Changing %{public}@ from %{public}@ to %{public}@", identifier,
-         entry.find(kTodoOperationKey), toDo);
-    entry.set(kTodoOperationKey, toDo);
-    todoList->set(*index, std::move(entry));
-    writePropertyListFile(platform_, std::string(kTodoListPath), *todoList,
-                          PropertyListFormat::Binary)
-        .ignore();
+         *operation, toDo);
+    todoListFile_->setOperation(platform_, identifier, toDo);
 }
 
 }  // namespace appsync
