@@ -113,6 +113,18 @@ CoordinatorState copyOf(const SimulatedCoordinatorState& state) {
     return copy;
 }
 
+/// Nothing but a restore brings back what stands there.
+bool restores(const SimulatedCoordinatorState& state) {
+    return state.kind == CoordinatorKind::Restoring && state.placeholderShown;
+}
+
+/// What waits for its package again after an install that failed.
+CoordinatorState withoutPackage(const SimulatedCoordinatorState& state) {
+    CoordinatorState copy = copyOf(state);
+    copy->appAsset.reset();
+    return copy;
+}
+
 void endPromise(const std::shared_ptr<SimulatedPromiseState>& promise) {
     if (promise != nullptr) promise->over = true;
 }
@@ -478,8 +490,10 @@ void SimulatedCoordination::install(const State& state) {
     Status status;
     if (state->kind != CoordinatorKind::RestoringDemoted) status = installPackage(*state);
     if (state->ended) return;  // cancelled meanwhile
+    const State again = !status && restores(*state) ? withoutPackage(*state) : nullptr;
     end(state, status ? std::nullopt : std::optional(status.error()));
-    if (!status) takePlaceholderAway(*state);
+    if (again != nullptr) coordinators_[*again->identifier] = again;
+    if (!status && again == nullptr) takePlaceholderAway(*state);
     const bool isInstalled = status.ok() && state->kind != CoordinatorKind::RestoringDemoted;
     tell("the end", *state->identifier, isInstalled ? Persistence::OnDisk : Persistence::Committed);
     reportCompletion(state);

@@ -394,6 +394,34 @@ TEST_P(CoordinationContract, AFailedInstallKeepsTheOldVersionAndTakesThePlacehol
     EXPECT_EQ(service_.existingCoordinator(kA, SyncClientID), nullptr);
 }
 
+// Nothing but a restore brings it back, so it waits for another package.
+TEST_P(CoordinationContract, AFailedInstallOfARestoredApplicationKeepsItsPlaceholder) {
+    const auto coordinator = create(Kind::Restoring, kA);
+    const auto data = dataPromise(kA);
+    data->setComplete();
+    ASSERT_TRUE(coordinator->setUserDataPromise(data));
+    ASSERT_TRUE(coordinator->setPlaceholderPromise(placeholder(kA)));
+    ASSERT_TRUE(coordinator->setAppAssetPromiseResponsibleClient(AppStoreClientID));
+    observer_->waitForOne();
+    const auto theirs = service_.existingCoordinator(kA, AppStoreClientID);
+    ASSERT_TRUE(theirs->setAppAssetPromise(assetPromise(kA)));
+    keepAsset(*theirs, "/var/mobile/missing.zip");
+    observer_->waitForOne();
+    EXPECT_THAT(observer_->heard(),
+                ElementsAre("placeholder com.example.a", "complete com.example.a, failed"));
+    EXPECT_THAT(bundles(AppRegistry::kEveryBundle), ElementsAre(kA));
+    EXPECT_FALSE(application(kA));
+    const auto again = service_.existingCoordinator(kA, AppStoreClientID);
+    ASSERT_NE(again, nullptr);
+    EXPECT_FALSE(again->error());
+    ASSERT_TRUE(again->setAppAssetPromise(assetPromise(kA)));
+    again->setObserver(observer_);
+    keepAsset(*again, device_->addPackage({kA}));
+    observer_->waitForOne();
+    EXPECT_EQ(observer_->heard().back(), "complete com.example.a");
+    EXPECT_TRUE(application(kA));
+}
+
 TEST_P(CoordinationContract, APackageOfAnotherApplicationIsNotInstalled) {
     const auto coordinator = prepared(Kind::Initiating, kA);
     keepAsset(*coordinator, device_->addPackage({kB}));
