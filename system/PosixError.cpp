@@ -40,6 +40,7 @@ std::string posixReason(int code) {
 }
 
 std::string displayPath(std::string_view path) {
+    if (path.empty()) return "''";
     std::string text;
     const bool tooLong = path.size() > kLongestShown;
     for (const char c : tooLong ? path.substr(0, kLongestShown / 2) : path) appendReadable(text, c);

@@ -11,7 +11,8 @@ namespace appsync {
 [[nodiscard]] std::string posixReason(int code);
 
 /// A path as it stands in a message: control characters are written as \xNN, and the middle of a
-/// very long path is left out, so that a message stays one readable line.
+/// very long path is left out, so that a message stays one readable line. An empty one is '', which
+/// can be seen.
 [[nodiscard]] std::string displayPath(std::string_view path);
 
 /// The error of a failed system call, in `kPosixErrorDomain`: "cannot <operation> <path>:

@@ -10,7 +10,9 @@
 #include <cstdio>
 #include <filesystem>
 #include <memory>
+#include <utility>
 
+#include "device/archive/PackageArchiveFormat.h"
 #include "device/archive/PackageError.h"
 #include "device/archive/PackageFolder.h"
 #include "system/PosixError.h"
@@ -109,10 +111,30 @@ ErrorRecord archiveFailure(zip_error_t* error, const std::string& path) {
     return cannotPack(PackageErrorCode::Inconsistent, path, ::zip_error_strerror(error));
 }
 
-Status addItem(zip_t* archive, const PackageItem& item) {
+// The extra field that says when an item was changed last; empty when no archive can.
+Bytes timesField(const PackageItem& item) {
+    if (!item.modified || !std::in_range<std::int32_t>(*item.modified)) return {};
+    const auto seconds = static_cast<std::uint32_t>(*item.modified);
+    Bytes field = {kHasModificationTime};
+    for (unsigned shift = 0; shift < 32; shift += 8) {
+        field.push_back(static_cast<std::uint8_t>(seconds >> shift));
+    }
+    return field;
+}
+
+bool setTimes(zip_t* archive, zip_uint64_t place, const PackageItem& item) {
     // The first day that an archive can hold: packages of the same files are the same.
     constexpr zip_uint16_t kDosTime = 0;
     constexpr zip_uint16_t kDosDate = (1U << 5U) | 1U;
+    if (::zip_file_set_dostime(archive, place, kDosTime, kDosDate, 0) != 0) return false;
+    const Bytes field = timesField(item);
+    return field.empty() ||
+           ::zip_file_extra_field_set(archive, place, kTimesField, ZIP_EXTRA_FIELD_NEW,
+                                      field.data(), static_cast<zip_uint16_t>(field.size()),
+                                      ZIP_FL_LOCAL | ZIP_FL_CENTRAL) == 0;
+}
+
+Status addItem(zip_t* archive, const PackageItem& item) {
     zip_int64_t index = -1;
     if (S_ISDIR(item.mode)) {
         index = ::zip_dir_add(archive, item.entryName.c_str(), ZIP_FL_ENC_UTF_8);
@@ -121,7 +143,7 @@ Status addItem(zip_t* archive, const PackageItem& item) {
         if (index < 0) ::zip_source_free(source);
     }
     const auto place = static_cast<zip_uint64_t>(index);
-    if (index < 0 || ::zip_file_set_dostime(archive, place, kDosTime, kDosDate, 0) != 0 ||
+    if (index < 0 || !setTimes(archive, place, item) ||
         ::zip_file_set_external_attributes(archive, place, 0, ZIP_OPSYS_UNIX, item.mode << 16U) !=
             0) {
         return archiveFailure(::zip_get_error(archive), item.path);
@@ -137,13 +159,14 @@ std::string workPathOf(const std::string& path) {
     return (target.parent_path() / (".archive-" + std::to_string(::getpid()))).native();
 }
 
-Status writeAt(const std::vector<PackageItem>& items, const std::string& path) {
+Status writeAt(const std::vector<PackageItem>& items, const std::string& path,
+               const std::string& name) {
     zip_error_t error = {};
     int code = 0;
     Archive archive(::zip_open(path.c_str(), ZIP_CREATE | ZIP_TRUNCATE, &code));
     if (!archive) {
         ::zip_error_init_with_code(&error, code);
-        const ErrorRecord failure = archiveFailure(&error, path);
+        const ErrorRecord failure = archiveFailure(&error, name);
         ::zip_error_fini(&error);
         return failure;
     }
@@ -151,21 +174,26 @@ Status writeAt(const std::vector<PackageItem>& items, const std::string& path) {
         if (Status status = addItem(archive.get(), item); !status) return status;
     }
     if (::zip_close(archive.get()) != 0)
-        return archiveFailure(::zip_get_error(archive.get()), path);
+        return archiveFailure(::zip_get_error(archive.get()), name);
     static_cast<void>(archive.release());
     return {};
 }
 
 }  // namespace
 
-Status writeArchive(const std::vector<PackageItem>& items, const std::string& path) {
+Status writeArchive(const std::vector<PackageItem>& items, const std::string& path,
+                    const std::string& name) {
     const std::string work = workPathOf(path);
-    Status status = writeAt(items, work);
+    Status status = writeAt(items, work, name);
     if (!status || work == path) return status;
     if (::rename(work.c_str(), path.c_str()) == 0) return {};
     const int error = errno;
     ::unlink(work.c_str());
-    return posixError(error, "pack", path);
+    return posixError(error, "pack", name);
+}
+
+Status writeArchive(const std::vector<PackageItem>& items, const std::string& path) {
+    return writeArchive(items, path, path);
 }
 
 }  // namespace appsync

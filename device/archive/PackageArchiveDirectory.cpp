@@ -104,7 +104,8 @@ class ContentsCheck {
                                .packedSize = header.packedSize,
                                .contentsAt = place->contentsAt,
                                .crc = header.crc,
-                               .isDeflated = header.method == kDeflated});
+                               .isDeflated = header.method == kDeflated,
+                               .modified = header.modified});
         }
         if (Status status = checkGaps(); !status) return status.error();
         return entries;

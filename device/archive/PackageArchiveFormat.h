@@ -17,6 +17,14 @@ inline constexpr std::size_t kLocalHeaderBytes = 30;
 inline constexpr std::uint32_t kCentralHeaderSignature = 0x02014b50;
 inline constexpr std::size_t kCentralHeaderBytes = 46;
 
+// An extra field of an entry: what it is and its length, of two bytes each, and what it says.
+inline constexpr std::size_t kExtraFieldHead = 4;
+/// When the contents were changed last: a byte whose lowest bit says so, and seconds since 1970 in
+/// UTC, signed, of four bytes.
+inline constexpr std::uint16_t kTimesField = 0x5455;
+inline constexpr std::size_t kTimesFieldBytes = 5;
+inline constexpr std::uint8_t kHasModificationTime = 1;
+
 // What says that a number of that width stands elsewhere, as it is too large.
 inline constexpr std::uint16_t kElsewhere16 = 0xffff;
 inline constexpr std::uint32_t kElsewhere32 = 0xffffffff;

@@ -23,8 +23,6 @@ constexpr std::uint16_t kMasked = 1U << 13U;
 /// The method that says that an extra field has the method, and how it is encrypted.
 constexpr std::uint16_t kMethodOfEncrypted = 99;
 
-// Extra fields: an identifier and a length of two bytes each, and what they say.
-constexpr std::size_t kExtraHead = 4;
 constexpr std::uint16_t kLargeNumbers = 0x0001;
 constexpr std::uint16_t kUnicodeName = 0x7075;
 
@@ -34,24 +32,34 @@ std::string_view textOf(ByteView bytes) noexcept {
     return {reinterpret_cast<const char*>(bytes.data()), bytes.size()};
 }
 
-/// The extra fields that change what a header says.
+/// The extra fields that change or add to what a header says.
 struct ExtraFields {
     std::optional<ByteView> largeNumbers;
     std::optional<ByteView> unicodeName;
+    std::optional<std::int64_t> modified;
 };
+
+/// Nothing when the field tells of other times only.
+std::optional<std::int64_t> modificationTimeOf(ByteView field) noexcept {
+    if (field.size() < kTimesFieldBytes || (field[0] & kHasModificationTime) == 0) return {};
+    return static_cast<std::int32_t>(u32(field, 1));
+}
 
 /// Nothing when they are cut off, or have something twice.
 std::optional<ExtraFields> parseExtraFields(ByteView bytes) noexcept {
     ExtraFields fields;
-    while (bytes.size() >= kExtraHead) {
+    while (bytes.size() >= kExtraFieldHead) {
         const std::uint16_t kind = u16(bytes, 0);
         const std::size_t length = u16(bytes, 2);
-        bytes = bytes.subspan(kExtraHead);
+        bytes = bytes.subspan(kExtraFieldHead);
         if (length > bytes.size()) return std::nullopt;
         if (kind == kLargeNumbers || kind == kUnicodeName) {
             auto& field = kind == kLargeNumbers ? fields.largeNumbers : fields.unicodeName;
             if (field) return std::nullopt;
             field = bytes.first(length);
+        }
+        if (kind == kTimesField && !fields.modified) {
+            fields.modified = modificationTimeOf(bytes.first(length));
         }
         bytes = bytes.subspan(length);
     }
@@ -105,6 +113,7 @@ bool takeExtraFields(ArchiveHeader& header, ByteView extra, std::span<const Larg
     if (fields->unicodeName) {
         header.unicodeName = unicodeNameFor(header.name, *fields->unicodeName);
     }
+    header.modified = fields->modified;
     return takeLargeNumbers(numbers, fields->largeNumbers.value_or(ByteView()));
 }
 

@@ -2,6 +2,7 @@
 
 #include <cstddef>
 #include <cstdint>
+#include <optional>
 #include <string_view>
 
 #include "platform/Bytes.h"
@@ -21,6 +22,8 @@ struct ArchiveHeader {
     std::uint16_t method = 0;
     /// Time and date, as they stand.
     std::uint32_t time = 0;
+    /// Seconds since 1970 in UTC, where an extra field tells when the contents were changed last.
+    std::optional<std::int64_t> modified;
     std::uint32_t crc = 0;
     std::uint64_t packedSize = 0;
     std::uint64_t size = 0;

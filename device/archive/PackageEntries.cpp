@@ -156,7 +156,8 @@ Result<PackageEntry> checkedEntry(const RawPackageEntry& raw, const PackageLimit
                         .packedSize = raw.packedSize,
                         .contentsAt = raw.contentsAt,
                         .crc = raw.crc,
-                        .isDeflated = raw.isDeflated};
+                        .isDeflated = raw.isDeflated,
+                        .modified = raw.modified};
 }
 
 Status arrangeAsTree(std::vector<PackageEntry>& entries) {

@@ -1,6 +1,7 @@
 #pragma once
 
 #include <cstdint>
+#include <optional>
 #include <string>
 #include <string_view>
 #include <vector>
@@ -29,6 +30,8 @@ struct PackageEntry {
     std::uint32_t crc = 0;
     /// Or else stored as it is.
     bool isDeflated = false;
+    /// When its contents were changed last, in seconds since 1970; nothing where nobody has said.
+    std::optional<std::int64_t> modified = std::nullopt;
 };
 
 /// An entry as the archive has it.
@@ -41,6 +44,7 @@ struct RawPackageEntry {
     std::uint64_t contentsAt = 0;
     std::uint32_t crc = 0;
     bool isDeflated = false;
+    std::optional<std::int64_t> modified = std::nullopt;
 };
 
 /// The order in which a directory comes right before everything in it. Entries of a package are

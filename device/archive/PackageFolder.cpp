@@ -33,8 +33,15 @@ class FolderListing {
         return addWaiting();
     }
 
-    Status addWithContents(const fs::path& path) {
-        if (Status status = add(path, path.filename().native()); !status) return status;
+    /// A bundle, and the store metadata beside it.
+    Status addBundle(const fs::path& bundle) {
+        if (Status status = add(bundle, bundle.filename().native()); !status) return status;
+        const fs::path metadata = bundle.parent_path() / kStoreMetadataName;
+        struct stat found = {};
+        if (::lstat(metadata.c_str(), &found) == 0) {
+            Status status = add(metadata, std::string(kStoreMetadataName));
+            if (!status) return status;
+        }
         return addWaiting();
     }
 
@@ -125,7 +132,7 @@ Result<std::vector<PackageItem>> listPackageFolder(const std::string& folder,
     if (error) return posixError(error.value(), "open", folder);
     FolderListing listing(limits);
     Status status =
-        path.extension() == ".app" ? listing.addWithContents(path) : listing.addContentsOf(path);
+        path.extension() == ".app" ? listing.addBundle(path) : listing.addContentsOf(path);
     if (!status) return status.error();
     return listing.finish(path);
 }

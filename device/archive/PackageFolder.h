@@ -1,6 +1,7 @@
 #pragma once
 
 #include <cstdint>
+#include <optional>
 #include <string>
 #include <string_view>
 #include <vector>
@@ -20,6 +21,8 @@ struct PackageItem {
     /// The mode it gets in the package, its type included.
     std::uint32_t mode = 0;
     std::uint64_t size = 0;
+    /// When its contents were changed last, in seconds since 1970, if the archive is to say so.
+    std::optional<std::int64_t> modified = std::nullopt;
 };
 
 /// What goes into the package of a folder (see writePackage), in tree order. Refuses what no

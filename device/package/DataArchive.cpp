@@ -1,7 +1,9 @@
 #include "device/package/DataArchive.h"
 
+#include <fcntl.h>
 #include <sys/stat.h>
 #include <sys/statvfs.h>
+#include <unistd.h>
 
 #include <algorithm>
 #include <cerrno>
@@ -40,6 +42,16 @@ PackageLimits dataLimits() {
     return limits;
 }
 
+// The reason alone: an archive of data is no package, and what packages are advised to is no advice
+// for it.
+ErrorRecord bare(const ErrorRecord& error, const std::string& name) {
+    if (error.domain != kInstallerErrorDomain) return error;
+    std::string reason = error.description();
+    const std::string subject = "package " + quotedName(name) + ": ";
+    if (reason.starts_with(subject)) reason.erase(0, subject.size());
+    return ErrorRecord::make(error.domain, error.code, reason.substr(0, reason.rfind("; ")));
+}
+
 /// Collects what a directory holds. Everything is named from there.
 class DataListing {
   public:
@@ -60,7 +72,7 @@ class DataListing {
         });
         return std::move(items_);
     }
-    std::vector<std::string> takeLeftOut() { return std::move(leftOut_); }
+    std::vector<LeftOutItem> takeLeftOut() { return std::move(leftOut_); }
 
   private:
     Status addContents(const std::string& prefix) {
@@ -70,8 +82,14 @@ class DataListing {
             const std::string name = prefix + place->path().filename().native();
             if (Status status = add(name); !status) return status;
         }
-        if (code) return posixError(code.value(), "read", prefix.empty() ? "." : prefix);
+        if (!code) return {};
+        if (prefix.empty()) return posixError(code.value(), "read", ".");
+        leaveOut(prefix, posixError(code.value(), "read", prefix));
         return {};
+    }
+
+    void leaveOut(const std::string& name, const ErrorRecord& error) {
+        leftOut_.push_back({name, error.description()});
     }
 
     Status add(std::string name) {
@@ -87,11 +105,16 @@ class DataListing {
         const Result<PackageEntry> entry =
             checkedEntry({.name = name, .mode = status.st_mode, .size = size}, limits_);
         if (!entry) {
-            leftOut_.push_back(entry.error().description());
+            leaveOut(name, bare(entry.error(), name));
+            return {};
+        }
+        if (!isDirectory && ::faccessat(AT_FDCWD, path.c_str(), R_OK, AT_EACCESS) != 0) {
+            leaveOut(name, posixError(errno, "read", name));
             return {};
         }
         const std::uint32_t kind = isDirectory ? S_IFDIR : S_IFREG;
-        items_.push_back({path, name, kind | entry->mode, size});
+        items_.push_back({path, name, kind | entry->mode, size, {}});
+        if (!isDirectory) items_.back().modified = status.st_mtim.tv_sec;
         if (isDirectory) waiting_.push_back(std::move(name));
         return {};
     }
@@ -101,18 +124,8 @@ class DataListing {
     /// Directories whose contents are still to be added: not a recursion, however deep they lie.
     std::vector<std::string> waiting_ = {""};
     std::vector<PackageItem> items_;
-    std::vector<std::string> leftOut_;
+    std::vector<LeftOutItem> leftOut_;
 };
-
-// The reason alone: an archive of data is no package, and what packages are advised to is no advice
-// for it.
-ErrorRecord bare(const ErrorRecord& error, const std::string& name) {
-    if (error.domain != kInstallerErrorDomain) return error;
-    std::string reason = error.description();
-    const std::string subject = "package " + quotedName(name) + ": ";
-    if (reason.starts_with(subject)) reason.erase(0, subject.size());
-    return ErrorRecord::make(error.domain, error.code, reason.substr(0, reason.rfind("; ")));
-}
 
 Result<std::unique_ptr<PackageArchive>> openArchive(Result<PackageFile> file) {
     if (!file) return file.error();
@@ -179,7 +192,8 @@ Status unpackDataArchive(int archive, std::string_view name, int directory) {
     const auto opened = openArchive(PackageFile::duplicate(archive, name));
     if (!opened) return opened.error();
     if (Status status = checkSpace(directory, **opened); !status) return status;
-    const PackageUnpackOptions options;
+    PackageUnpackOptions options;
+    options.keepsTimes = true;
     const Status unpacked = PackageUnpacker(**opened, directory, options).run();
     return unpacked ? unpacked : Status(bare(unpacked.error(), (*opened)->name()));
 }

@@ -11,11 +11,18 @@ namespace appsync {
 
 class RootDirectory;
 
+/// Something that an archive of data does not hold: a link, a pipe, a name that no archive may
+/// hold, what may not be read.
+struct LeftOutItem {
+    std::string name;
+    /// One sentence, the name included.
+    std::string why;
+};
+
 /// What went into the archive of an application's data.
 struct DataArchiveContents {
     std::uint64_t entries = 0;  // files and directories; with none, no archive was written
-    /// Why something was left out, one sentence each: links, pipes, names that no archive may hold.
-    std::vector<std::string> leftOut;
+    std::vector<LeftOutItem> leftOut;
 };
 
 /// Archives what a directory of the device holds, in pieces, as a new file of this machine. What is

@@ -65,6 +65,9 @@ struct PackageUnpackOptions {
     /// its descriptor is closed; whoever wants to sync or start write-back does so here. May be
     /// empty. An error stops the unpacking.
     std::function<Status(int fileDescriptor)> fileWritten;
+
+    /// Files get the modification times that the archive gives.
+    bool keepsTimes = false;
 };
 
 /// An application package, opened and checked.

@@ -5,6 +5,7 @@
 #include <unistd.h>
 
 #include <algorithm>
+#include <array>
 #include <cerrno>
 #include <utility>
 
@@ -76,6 +77,12 @@ Status PackageUnpacker::writePiece(const PackageEntry& entry, int fileDescriptor
 Status PackageUnpacker::finishFile(const PackageEntry& entry, UniqueFd file) {
     // Only now, so that nobody runs what is not yet whole; and past the umask.
     if (::fchmod(file.get(), entry.mode) != 0) return failed(errno, "set the mode of", entry.name);
+    if (options_.keepsTimes && entry.modified) {
+        const std::array<timespec, 2> times = {{{0, UTIME_OMIT}, {*entry.modified, 0}}};
+        if (::futimens(file.get(), times.data()) != 0) {
+            return failed(errno, "set the time of", entry.name);
+        }
+    }
     if (options_.fileWritten) {
         if (Status status = options_.fileWritten(file.get()); !status) return status;
     }

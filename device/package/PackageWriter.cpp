@@ -36,13 +36,13 @@ class UnfinishedPackage {
 
     [[nodiscard]] Result<UniqueFd> open() const {
         UniqueFd descriptor(::open(path_.c_str(), O_RDONLY | O_CLOEXEC));
-        if (!descriptor) return posixError(errno, "open", path_);
+        if (!descriptor) return posixError(errno, "write", package_);
         return descriptor;
     }
 
     [[nodiscard]] Status finish() const {
         if (::rename(path_.c_str(), package_.c_str()) == 0) return {};
-        return posixErrorBetween(errno, "rename", path_, package_);
+        return posixError(errno, "write", package_);
     }
 
   private:
@@ -97,7 +97,8 @@ Result<PackageInfo> writePackage(const std::string& folder, const std::string& p
     const Result<std::vector<PackageItem>> items = listPackageFolder(folder, PackageLimits());
     if (!items) return items.error();
     const UnfinishedPackage unfinished(package);
-    if (Status status = writeArchive(*items, unfinished.path()); !status) return status.error();
+    if (Status status = writeArchive(*items, unfinished.path(), package); !status)
+        return status.error();
     const Result<UniqueFd> file = unfinished.open();
     if (!file) return file.error();
     Result<PackageInfo> info = checkPackage(file->get(), package, propertyLists);

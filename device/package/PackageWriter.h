@@ -10,7 +10,8 @@ namespace appsync {
 class PropertyListSerialization;
 
 /// Makes an application package from a folder of this machine, which holds `<Name>.app/` and
-/// optionally `VessikMetadata.plist`, and nothing else, or is itself `<Name>.app`.
+/// optionally `VessikMetadata.plist`, and nothing else, or is itself `<Name>.app`, whose neighbour
+/// `VessikMetadata.plist` goes in with it.
 ///
 /// The package is the same, byte for byte, for the same names, contents and modes. Modes are
 /// reduced to 0755 (directories, and files that their owner can execute) and 0644. Whatever a

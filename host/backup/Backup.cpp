@@ -14,6 +14,7 @@
 #include "host/console/JsonWriting.h"
 #include "host/console/Problem.h"
 #include "host/file/HostFile.h"
+#include "system/PosixError.h"
 
 namespace appsync {
 namespace {
@@ -141,10 +142,16 @@ std::optional<std::string> identifierOfData(std::string_view file) {
     return identifierOfArchive(file.substr(1));
 }
 
+bool isBackup(const std::string& folder) {
+    std::error_code code;
+    return fs::exists(fs::symlink_status(fs::path(folder) / kBackupManifest, code));
+}
+
 Result<BackupManifest> readBackupManifest(const std::string& backup) {
     std::error_code code;
     if (!fs::is_directory(backup, code)) {
-        return unusable("there is no backup " + backup, "name the folder that appsync backup made");
+        return unusable("there is no backup " + displayPath(backup),
+                        "name the folder that appsync backup made");
     }
     const std::string path = (fs::path(backup) / kBackupManifest).native();
     const fs::file_status found = fs::symlink_status(path, code);

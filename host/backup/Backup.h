@@ -61,6 +61,9 @@ struct BackupFault {
 /// Whose archive the file is; nothing when it is none.
 [[nodiscard]] std::optional<std::string> identifierOfData(std::string_view file);
 
+/// Whether the folder holds a manifest, whatever that is: else it is no backup.
+[[nodiscard]] bool isBackup(const std::string& folder);
+
 /// Reads the manifest. Without a good one, a folder is no backup that can be used: the error says
 /// which it is, none or a damaged one.
 [[nodiscard]] Result<BackupManifest> readBackupManifest(const std::string& backup);

@@ -115,11 +115,11 @@ Result<BackupFolder> BackupFolder::make(const std::string& path) {
 Status BackupFolder::finish(ByteView manifest) {
     if (Status durable = makeDurable(path_); !durable) return durable;
     const std::string unfinished = unfinishedManifest(path_);
-    if (::ftruncate(manifest_.get(), 0) != 0) return cannotWriteFile(errno, unfinished);
-    const int error = writeWhole(manifest_.get(), manifest).error;
-    if (error != 0) return cannotWriteFile(error, unfinished);
-    if (::fsync(manifest_.get()) != 0) return cannotWriteFile(errno, unfinished);
     const std::string path = (fs::path(path_) / kBackupManifest).native();
+    if (::ftruncate(manifest_.get(), 0) != 0) return cannotWriteFile(errno, path);
+    const int error = writeWhole(manifest_.get(), manifest).error;
+    if (error != 0) return cannotWriteFile(error, path);
+    if (::fsync(manifest_.get()) != 0) return cannotWriteFile(errno, path);
     if (::rename(unfinished.c_str(), path.c_str()) != 0) return cannotWriteFile(errno, path);
     return makeDurable(path_);
 }

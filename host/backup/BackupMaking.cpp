@@ -198,9 +198,7 @@ class BackupMaking {
             return {};
         }
         if (!contents) return contents.error().withContext("the data of " + identifier);
-        for (std::string& reason : contents->leftOut) {
-            leaveOut(identifier, reason);
-        }
+        for (const LeftOutItem& item : contents->leftOut) leaveOut(identifier, item.why, item.name);
         application.hasData = contents->entries > 0;
         if (!application.hasData) {
             const Result<bool> copied = copyWaitingData(identifier, name);
@@ -224,8 +222,10 @@ class BackupMaking {
         return checked ? Status() : Status(checked.error());
     }
 
-    void leaveOut(const std::string& identifier, const std::string& reason) {
-        result_.leftOut.push_back({identifier, "left out of its data: " + reason});
+    // Without a file, it is all of the data.
+    void leaveOut(const std::string& identifier, const std::string& reason,
+                  const std::string& file = {}) {
+        result_.leftOut.push_back({identifier, file, "left out of its data: " + reason});
     }
 
     Result<bool> copyWaitingData(const std::string& identifier, const std::string& name) {

@@ -12,11 +12,19 @@ namespace appsync {
 class BackupFolder;
 class Device;
 
+/// Something of an application's data that is not in its backup.
+struct LeftOutData {
+    std::string identifier;
+    /// The file, relative to the data; empty when it is all of them.
+    std::string file;
+    std::string error;
+};
+
 /// What came of a backup.
 struct BackupResult {
     BackupManifest manifest;
     std::vector<std::string> demoted;
-    std::vector<BackupFault> leftOut;  // by identifier
+    std::vector<LeftOutData> leftOut;
     std::uint64_t bytes = 0;
 };
 

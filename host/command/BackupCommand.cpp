@@ -1,8 +1,7 @@
 #include <chrono>
 #include <cmath>
-#include <filesystem>
+#include <map>
 #include <ostream>
-#include <system_error>
 #include <utility>
 
 #include <nlohmann/json.hpp>
@@ -23,7 +22,6 @@
 namespace appsync {
 namespace {
 
-namespace fs = std::filesystem;
 using Json = nlohmann::ordered_json;
 using Clock = std::chrono::steady_clock;
 
@@ -35,6 +33,31 @@ Json jsonOf(const std::vector<BackupFault>& faults, const char* key) {
         list.push_back({{key, fault.file}, {"error", fault.error}});
     }
     return list;
+}
+
+Json jsonOf(const std::vector<LeftOutData>& leftOut) {
+    Json list = Json::array();
+    for (const LeftOutData& each : leftOut) {
+        list.push_back({{"identifier", each.identifier},
+                        {"file", each.file.empty() ? Json() : Json(each.file)},
+                        {"error", each.error}});
+    }
+    return list;
+}
+
+// The first of each application; the JSON names them all.
+void complainOf(const std::vector<LeftOutData>& leftOut, const Console& console) {
+    constexpr std::size_t kMost = 10;
+    std::map<std::string, std::size_t> counts;
+    for (const LeftOutData& each : leftOut) {
+        if (++counts[each.identifier] <= kMost)
+            console.complain(each.identifier + ": " + each.error);
+    }
+    for (const auto& [identifier, count] : counts) {
+        if (count <= kMost) continue;
+        console.complain(identifier + ": left out of its data: " + std::to_string(count - kMost) +
+                         " more, which --json names");
+    }
 }
 
 void printBackup(const BackupResult& result, double seconds, const Console& console) {
@@ -59,7 +82,7 @@ std::string jsonText(const BackupResult& result, const std::vector<BackupFault>&
     return indented({{"applications", std::move(applications)},
                      {"demoted", result.demoted},
                      {"data", std::move(data)},
-                     {"leftOut", jsonOf(result.leftOut, "identifier")},
+                     {"leftOut", jsonOf(result.leftOut)},
                      {"failed", jsonOf(failed, "identifier")},
                      {"bytes", result.bytes},
                      {"seconds", seconds}});
@@ -108,17 +131,14 @@ int runBackup(const BackupArguments& arguments, const Console& console) {
         return failWhole(arguments, unfinished(arguments.backup, result.error()), console);
     }
     const double seconds = std::chrono::duration<double>(Clock::now() - begin).count();
-    for (const BackupFault& each : result->leftOut) {
-        console.complain(each.file + ": " + each.error);
-    }
+    complainOf(result->leftOut, console);
     (arguments.asJson ? printBackupJson : printBackup)(*result, seconds, console);
     return result->leftOut.empty() ? kExitDone : kExitSomethingFailed;
 }
 
 int runBackupCheck(const std::string& backup, bool asJson, const Console& console) {
     const Result<BackupManifest> manifest = readBackupManifest(backup);
-    std::error_code code;
-    if (!manifest && !fs::is_directory(backup, code)) return console.fail(manifest.error());
+    if (!manifest && !isBackup(backup)) return console.fail(manifest.error());
     const std::vector<BackupFault> faults =
         manifest ? checkBackup(backup, *manifest)
                  : std::vector<BackupFault>{
@@ -132,7 +152,7 @@ int runBackupCheck(const std::string& backup, bool asJson, const Console& consol
     } else if (faults.empty()) {
         console.out << printable(backup)
                     << " is whole: " << counted(manifest->applications.size(), "application")
-                    << ", of " << printable(manifest->made) << '\n';
+                    << ", of " << localTimeOf(manifest->made) << '\n';
     }
     return faults.empty() ? kExitDone : kExitSomethingFailed;
 }

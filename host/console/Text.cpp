@@ -4,6 +4,7 @@
 #include <array>
 #include <cstdio>
 #include <ctime>
+#include <optional>
 
 namespace appsync {
 namespace {
@@ -12,6 +13,41 @@ std::string formatWith(const char* format, const std::tm& parts) {
     std::array<char, 64> buffer{};
     const std::size_t length = std::strftime(buffer.data(), buffer.size(), format, &parts);
     return {buffer.data(), length};
+}
+
+std::tm localParts(std::chrono::system_clock::time_point time) {
+    const std::time_t seconds = std::chrono::system_clock::to_time_t(time);
+    std::tm parts{};
+    localtime_r(&seconds, &parts);
+    return parts;
+}
+
+struct WrittenTime {
+    std::chrono::system_clock::time_point time;
+    std::string_view fraction;  // of its second: ".250", or empty
+};
+
+// "2026-01-31T12:00:00Z", with a fraction or without; nothing where the text is anything else.
+std::optional<WrittenTime> parsedTime(std::string_view text) {
+    constexpr std::string_view kPattern = "0000-00-00T00:00:00";
+    if (text.size() <= kPattern.size() || !text.ends_with('Z')) return std::nullopt;
+    text.remove_suffix(1);
+    const auto isDigit = [](char c) { return c >= '0' && c <= '9'; };
+    for (std::size_t index = 0; index < kPattern.size(); ++index) {
+        const bool isRight =
+            kPattern[index] == '0' ? isDigit(text[index]) : text[index] == kPattern[index];
+        if (!isRight) return std::nullopt;
+    }
+    const std::string_view fraction = text.substr(kPattern.size());
+    const bool isFraction =
+        fraction.empty() || (fraction.size() > 1 && fraction.front() == '.' &&
+                             std::all_of(fraction.begin() + 1, fraction.end(), isDigit));
+    std::tm parts{};
+    const std::string seconds(text.substr(0, kPattern.size()));
+    if (!isFraction || ::strptime(seconds.c_str(), "%Y-%m-%dT%H:%M:%S", &parts) == nullptr) {
+        return std::nullopt;
+    }
+    return WrittenTime{std::chrono::system_clock::from_time_t(::timegm(&parts)), fraction};
 }
 
 bool isContinuation(char byte) { return (static_cast<unsigned char>(byte) & 0xC0U) == 0x80U; }
@@ -89,11 +125,20 @@ std::string formatTime(std::chrono::system_clock::time_point time) {
     return formatWith("%Y-%m-%dT%H:%M:%SZ", parts);
 }
 
+std::string formatLocalTime(std::chrono::system_clock::time_point time) {
+    return formatWith("%Y-%m-%d %H:%M:%S %z", localParts(time));
+}
+
+std::string localTimeOf(std::string_view text) {
+    const std::optional<WrittenTime> written = parsedTime(text);
+    if (!written) return printable(text);
+    const std::tm parts = localParts(written->time);
+    return formatWith("%Y-%m-%d %H:%M:%S", parts) + std::string(written->fraction) +
+           formatWith(" %z", parts);
+}
+
 std::string formatClock(std::chrono::system_clock::time_point time) {
-    const std::time_t seconds = std::chrono::system_clock::to_time_t(time);
-    std::tm parts{};
-    localtime_r(&seconds, &parts);
-    return formatWith("%H:%M:%S", parts);
+    return formatWith("%H:%M:%S %z", localParts(time));
 }
 
 std::string printable(std::string_view text) {

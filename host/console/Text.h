@@ -14,7 +14,14 @@ namespace appsync {
 /// A point in time as ISO 8601 in UTC, to the second: "2026-01-31T12:00:00Z".
 [[nodiscard]] std::string formatTime(std::chrono::system_clock::time_point time);
 
-/// The time of day in the machine's time zone: "12:00:00".
+/// The same for people, in the machine's time zone: "2026-01-31 13:00:00 +0100".
+[[nodiscard]] std::string formatLocalTime(std::chrono::system_clock::time_point time);
+
+/// A time that is written down in ISO 8601 and UTC, for people, as `formatLocalTime` has it, with
+/// the fraction of its second; any other text made safe to print.
+[[nodiscard]] std::string localTimeOf(std::string_view text);
+
+/// The time of day in the machine's time zone: "13:00:00 +0100".
 [[nodiscard]] std::string formatClock(std::chrono::system_clock::time_point time);
 
 /// The text with everything that a terminal could take for a command or that could make it show

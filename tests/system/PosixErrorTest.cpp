@@ -32,6 +32,7 @@ TEST(PosixErrorTest, AnUnknownCodeIsNamedByItsNumber) {
 
 TEST(PosixErrorTest, ControlCharactersOfAPathStayOnOneLine) {
     using std::string_view_literals::operator""sv;
+    EXPECT_EQ(displayPath(""), "''");
     EXPECT_EQ(displayPath("/a\nb\x7f\0c"sv), "/a\\x0ab\\x7f\\x00c");
 }
 

@@ -4,7 +4,10 @@
 #include <gmock/gmock.h>
 #include <sys/stat.h>
 
+#include <array>
 #include <cerrno>
+#include <cstdint>
+#include <ctime>
 #include <filesystem>
 #include <fstream>
 #include <iterator>
@@ -66,6 +69,38 @@ class DataArchiveTest : public testing::Test {
     const TemporaryMachineDirectory directory_;
 };
 
+// What was left out, under its name, and why.
+auto leftOut(const std::string& name, const std::string& why) {
+    return testing::AllOf(testing::Field(&LeftOutItem::name, name),
+                          testing::Field(&LeftOutItem::why, HasSubstr(why)));
+}
+
+TEST_F(DataArchiveTest, filesKeepTheTimesOfTheirLastChange) {
+    const std::vector<std::pair<std::string, std::time_t>> files = {
+        {"new", 1'700'000'001}, {"of 1969", -1}, {"of 1901", INT32_MIN}, {"of 2038", INT32_MAX}};
+    for (const auto& [name, seconds] : files) {
+        write("root/data/" + name, name);
+        const std::array<timespec, 2> times = {{{0, 0}, {seconds, 500'000'000}}};
+        ASSERT_EQ(::utimensat(AT_FDCWD, path("root/data/" + name).c_str(), times.data(), 0), 0);
+    }
+    ASSERT_TRUE(archive().ok());
+    ASSERT_TRUE(unpack().ok());
+    for (const auto& [name, seconds] : files) {
+        struct stat found = {};
+        ASSERT_EQ(::stat(path("unpacked/" + name).c_str(), &found), 0);
+        EXPECT_EQ(found.st_mtim.tv_sec, seconds) << name;
+    }
+}
+
+TEST_F(DataArchiveTest, aTimeThatNoArchiveHoldsIsLost) {
+    write("root/data/late", "late");
+    const std::array<timespec, 2> times = {{{0, 0}, {std::int64_t{INT32_MAX} + 1, 0}}};
+    ASSERT_EQ(::utimensat(AT_FDCWD, path("root/data/late").c_str(), times.data(), 0), 0);
+    ASSERT_TRUE(archive().ok());
+    ASSERT_TRUE(unpack().ok());
+    EXPECT_EQ(read("unpacked/late"), "late");
+}
+
 TEST_F(DataArchiveTest, dataComesBackAsItWas) {
     write("root/data/Documents/letter é.txt", "Dear");
     write("root/data/Library/deep/er/cache", std::string(700'000, 'c'));
@@ -105,12 +140,13 @@ TEST_F(DataArchiveTest, whatNoArchiveHoldsIsLeftOutAndNamed) {
     const Result<DataArchiveContents> contents = archive();
     ASSERT_TRUE(contents.ok());
     EXPECT_EQ(contents->entries, 1U);
-    EXPECT_THAT(contents->leftOut,
-                UnorderedElementsAre(HasSubstr("'two\\x0alines' has a control character"),
-                                     HasSubstr("'back\\slash' has a backslash"),
-                                     HasSubstr("'link' is a symbolic link"),
-                                     HasSubstr("'linked directory' is a symbolic link"),
-                                     HasSubstr("'pipe' is a pipe")));
+    EXPECT_THAT(
+        contents->leftOut,
+        UnorderedElementsAre(leftOut("two\nlines", "'two\\x0alines' has a control character"),
+                             leftOut("back\\slash", "'back\\slash' has a backslash"),
+                             leftOut("link", "'link' is a symbolic link"),
+                             leftOut("linked directory", "'linked directory' is a symbolic link"),
+                             leftOut("pipe", "'pipe' is a pipe")));
     ASSERT_TRUE(unpack().ok());
     EXPECT_EQ(read("unpacked/kept"), "kept");
     EXPECT_FALSE(fs::exists(path("unpacked/link")));
@@ -178,7 +214,9 @@ TEST_F(DataArchiveTest, whatLiesTooDeepForAnyPathIsLeftOutAndNamed) {
     const Result<DataArchiveContents> contents = archive();
     ASSERT_TRUE(contents.ok()) << contents.error().description();
     EXPECT_EQ(contents->entries, 18U) << "17 directories, and the file beside them";
-    EXPECT_THAT(contents->leftOut, ElementsAre(HasSubstr("has a name that is too long")));
+    EXPECT_THAT(
+        contents->leftOut,
+        ElementsAre(testing::Field(&LeftOutItem::why, HasSubstr("has a name that is too long"))));
     EXPECT_TRUE(unpack().ok());
     for (std::size_t i = made.size() - 1; i > 0; --i) {
         ::unlinkat(made[i - 1].get(), component.c_str(), AT_REMOVEDIR);
