@@ -101,6 +101,7 @@ class Commands {
     // Whether the words are a command, and a command of that one.
     [[nodiscard]] Status checkCommands(const std::vector<std::string>& words) const {
         const CLI::App* command = &app_;
+        addStage();
         for (const std::string& word : words) {
             const auto known = command->get_subcommands(
                 [&word](const CLI::App* each) { return each->get_name() == word; });
@@ -232,6 +233,9 @@ class Commands {
     CLI::App& applicationCommand(const std::string& name, const std::string& description,
                                  const std::shared_ptr<DeviceValues>& values, DeviceAction action) {
         CLI::App& added = deviceCommand(name, description, values, std::move(action));
+    }
+
+    static void addStaged(CLI::App& added, SyncArguments& values) {
         added.add_option("ID", values->identifier, "the application's identifier")->required();
         return added;
     }
@@ -242,6 +246,7 @@ class Commands {
         addDemote();
         applicationCommand("run", "Mark an application as running: its termination is denied",
                            std::make_shared<DeviceValues>(), [this](const DeviceValues& parsed) {
+        addStaged(added, *values);
                                return runRun(parsed.device, parsed.identifier, console_);
                            });
         applicationCommand("quit", "Mark it as not running any more",
@@ -253,10 +258,21 @@ class Commands {
                                return runUninstall(parsed.device, parsed.identifier, console_);
                            });
         deviceCommand("reset", "Make the device forget what it keeps for syncing",
+        addStaged(added, *values);
                       std::make_shared<DeviceValues>(), [this](const DeviceValues& parsed) {
                           return runReset(parsed.device, console_);
                       });
     }
+    void addStage() {
+        const auto values = std::make_shared<StageArguments>();
+        CLI::App& added = command<StageArguments>(
+            app_, "stage", "Leave on the device what a sync would, for sync --staged", values,
+            [this](const StageArguments& parsed) { return runStage(parsed, console_); });
+        addPlanOptions(added, values->sync);
+        added.add_flag("--force", values->replaces, "replace a staging area that waits already");
+        added.add_flag("--json", values->asJson, "print JSON");
+    }
+
 
     void addCreate() {
         const auto values = std::make_shared<DeviceValues>();

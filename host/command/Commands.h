@@ -42,6 +42,17 @@ struct SyncArguments {
 };
 [[nodiscard]] int runSync(const SyncArguments& arguments, const Console& console);
 
+// StageCommand.cpp
+
+struct StageArguments {
+    /// What a sync would be told.
+    SyncArguments sync;
+    /// Also in the place of an area that waits already.
+    bool replaces = false;
+    bool asJson = false;
+};
+[[nodiscard]] int runStage(const StageArguments& arguments, const Console& console);
+
 // SendCommand.cpp
 
 struct SendArguments {

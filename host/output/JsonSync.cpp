@@ -91,3 +91,14 @@ std::string jsonText(const SyncPlan& plan, const SpaceCheck& space, JsonLayout l
 }
 
 }  // namespace appsync
+std::string stagedJsonText(const SyncPlan& plan, std::string_view area, bool hasReplaced) {
+    return indented({{"area", area},
+                     {"install", identifiers(plan.install)},
+                     {"update", updates(plan.update)},
+                     {"remove", plan.remove},
+                     {"skipped", skips(plan.skipped)},
+                     {"failed", failures(plan.failed)},
+                     {"notes", plan.notes},
+                     {"replaced", hasReplaced}});
+}
+

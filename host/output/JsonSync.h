@@ -19,4 +19,7 @@ enum class JsonLayout {
 [[nodiscard]] std::string jsonText(const SyncPlan& plan, const SpaceCheck& space,
                                    JsonLayout layout);
 
+/// What a staging area asks for that a host has left, at this path of the device.
+[[nodiscard]] std::string stagedJsonText(const SyncPlan& plan, std::string_view area,
+                                         bool hasReplaced);
 }  // namespace appsync

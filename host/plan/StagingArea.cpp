@@ -49,15 +49,17 @@ PropertyList installEntry(const PlannedInstall& planned) {
     return entry;
 }
 
+enum class StagedFor { ThisSession, Later };
+
 // Writes the files of a staging area that nobody looks at yet. The first failure stays.
 class StagingWriter {
   public:
     StagingWriter(Device& device, std::string directory)
         : device_(device), directory_(std::move(directory)) {}
 
-    Status write(const SyncPlan& plan, const Library& library) {
+    Status write(const SyncPlan& plan, const Library& library, StagedFor session) {
         status_ = device_.files().createDirectory(directory_, true, &kMobile);
-        addList(kHostRecordName, hostRecordOfLibrary());
+        if (session == StagedFor::ThisSession) addList(kHostRecordName, hostRecordOfLibrary());
         addList(kTodoListName, todoListOf(plan));
         if (library.iconOrder) add("DeskoraIconState.plist", *library.iconOrder);
         for (const auto* installs : {&plan.install, &plan.update}) {
@@ -117,6 +119,26 @@ Status takeIntoPlace(FileSystem& files) {
     // Not only what exists: a link that leads nowhere would be in the way, too.
     files.removeItem(place).ignore();
     return files.moveItem(std::string(kUnfinishedStagingArea), place);
+}
+
+// Where the area is built is nobody's business.
+ErrorRecord calledByItsPlace(const ErrorRecord& error) {
+    std::string text = error.description();
+    const std::size_t found = text.find(kUnfinishedStagingArea);
+    if (found != std::string::npos) {
+        text.replace(found, kUnfinishedStagingArea.size(), kStagingArea);
+    }
+    return ErrorRecord::make(error.domain, error.code, std::move(text));
+}
+
+Status writeArea(Device& device, const SyncPlan& plan, const Library& library, StagedFor session) {
+    const std::string unfinished(kUnfinishedStagingArea);
+    device.files().removeItem(unfinished).ignore();
+    Status status = StagingWriter(device, unfinished).write(plan, library, session);
+    if (status) status = takeIntoPlace(device.files());
+    if (status) return {};
+    device.files().removeItem(unfinished).ignore();
+    return calledByItsPlace(status.error());
 }
 
 struct CloseDirectory {
@@ -211,12 +233,13 @@ PropertyList todoListOf(const SyncPlan& plan) {
 }
 
 Status writeStagingArea(Device& device, const SyncPlan& plan, const Library& library) {
-    const std::string unfinished(kUnfinishedStagingArea);
-    device.files().removeItem(unfinished).ignore();
-    Status status = StagingWriter(device, unfinished).write(plan, library);
-    if (status) status = takeIntoPlace(device.files());
-    if (!status) device.files().removeItem(unfinished).ignore();
-    return status;
+    return writeArea(device, plan, library, StagedFor::ThisSession);
+}
+
+Result<std::string> stageForLater(Device& device, const SyncPlan& plan, const Library& library) {
+    const Status status = writeArea(device, plan, library, StagedFor::Later);
+    if (!status) return status.error();
+    return std::string(kStagingArea);
 }
 
 StagedTodoList readStagedTodoList(Device& device) {

@@ -23,6 +23,10 @@ struct SyncPlan;
 /// gets no directory. On failure nothing stays.
 Status writeStagingArea(Device& device, const SyncPlan& plan, const Library& library);
 
+/// The same as a host leaves it for a session that comes later. Gives its path on the device.
+[[nodiscard]] Result<std::string> stageForLater(Device& device, const SyncPlan& plan,
+                                                const Library& library);
+
 /// What a host left in the staging area of the device, or a session that was interrupted of it.
 struct StagedTodoList {
     /// Null when there is none, or no usable one.

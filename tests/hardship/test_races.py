@@ -118,7 +118,7 @@ def test_links_that_come_and_go_lead_nowhere(appsync, tmp_path, outside, coordin
 
 # Commands that meet.
 
-SESSION_COMMANDS = ["sync", "restore", "send", "demote", "reset"]
+SESSION_COMMANDS = ["sync", "restore", "send", "demote", "reset", "stage"]
 OTHER_COMMANDS = ["uninstall", "run-quit", "apps", "screen", "log", "set"]
 
 
@@ -142,6 +142,7 @@ def command_lines(name, device, library, backup, folder):
         "send": [["send", device, "com.example.sent", os.path.join(folder, "sent", "com.example.sent.zip")]],
         "demote": [["demote", device, "com.example.app01"]],
         "reset": [["reset", device]],
+        "stage": [["stage", device, library, "--force"]],
         "uninstall": [["uninstall", device, "com.example.app00"]],
         "run-quit": [["run", device, "com.example.app02"], ["quit", device, "com.example.app02"]],
         "apps": [["apps", device]] * 5,

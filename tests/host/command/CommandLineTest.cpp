@@ -47,6 +47,8 @@ INSTANTIATE_TEST_SUITE_P(
         WrongUsage{{"sync", "device", "library", "--json", "--json-lines"}, "--json"},
         WrongUsage{{"sync", "device", "library", "--staged", "--mirror"}, "--staged"},
         WrongUsage{{"sync", "device", "library", "--remove", "a/b"}, "--remove a/b is not"},
+        WrongUsage{{"stage", "device", "library", "--remove", "a/b"}, "--remove a/b is not"},
+        WrongUsage{{"stage", "device", "library", "--staged"}, "--staged is not an option"},
         WrongUsage{{"create", "device", "--coordination", "maybe"}, "on"},
         WrongUsage{{"create", "device", "--coordination", "perhaps"}, "perhaps"},
         WrongUsage{{"set", "device", "coordination=maybe"}, "use on or off"},
@@ -99,11 +101,12 @@ TEST_P(EachCommand, HasHelp) {
 }
 
 INSTANTIATE_TEST_SUITE_P(Help, EachCommand,
-                         testing::Values("", "create", "sync", "plan", "apps", "screen", "why",
-                                         "inventory", "set", "run", "quit", "uninstall", "reset",
-                                         "log", "history", "coordinator", "demote", "backup",
-                                         "restore", "store", "send", "package", "package make",
-                                         "package show", "plist", "plist show", "plist convert"));
+                         testing::Values("", "create", "sync", "plan", "stage", "apps", "screen",
+                                         "why", "inventory", "set", "run", "quit", "uninstall",
+                                         "reset", "log", "history", "coordinator", "demote",
+                                         "backup", "restore", "store", "send", "package",
+                                         "package make", "package show", "plist", "plist show",
+                                         "plist convert"));
 
 TEST_F(CommandLine, HelpShowsTheHelpOfACommand) {
     EXPECT_EQ(run({"help", "package", "make"}), 0);
