@@ -14,18 +14,20 @@ namespace {
 
 std::string stateText(const ApplicationRecord& record) {
     if (!record.isPlaceholder) return "installed";
-    if (!record.progress) return "placeholder";
+    std::string text(placeholderKind(record));
+    if (!record.progress) return text;
     const auto percent = static_cast<unsigned>(record.progress->fraction() * 100);
-    return "placeholder, " + std::to_string(percent) + " %";
+    return text + ", " + std::to_string(percent) + " %";
 }
 
-std::string applicationsTable(const std::vector<ApplicationRecord>& records, bool isForTerminal) {
+std::string applicationsTable(const std::vector<ApplicationRecord>& records,
+                              const Console& console) {
     Table table({"IDENTIFIER", "VERSION", "NAME", "STATE", "TYPE", "SIZE"});
     for (const ApplicationRecord& record : records) {
         table.add({record.identifier, record.version.value_or("-"), record.name.value_or("-"),
                    stateText(record), record.type, formatBytes(record.bytes)});
     }
-    if (isForTerminal) table.limit({40, 16, 24});  // a program gets all of it
+    if (console.isTerminal) table.fitInto(console.width);
     return records.empty() ? "No applications.\n" : table.text();
 }
 
@@ -35,8 +37,7 @@ int runApps(const std::string& device, bool asJson, const Console& console) {
     return lookAt(device, console, [&](Device& opened) -> Status {
         const Result<std::vector<ApplicationRecord>> records = opened.applications();
         if (!records) return unusable(records.error());
-        console.out << (asJson ? jsonText(*records) + "\n"
-                               : applicationsTable(*records, console.isTerminal));
+        console.out << (asJson ? jsonText(*records) + "\n" : applicationsTable(*records, console));
         return {};
     });
 }

@@ -8,6 +8,7 @@
 #include <memory>
 #include <optional>
 #include <ostream>
+#include <sstream>
 #include <string_view>
 #include <system_error>
 #include <utility>
@@ -25,8 +26,8 @@ namespace {
 constexpr const char* kDescription =
     "appsync keeps the applications of a device in step with a folder of packages.";
 constexpr const char* kFooter =
-    "Exit status: 0 done; 1 something failed, each failure named; 2 wrong usage; 3 the device or\n"
-    "the library cannot be used.";
+    "Exit status: 0 done; 1 something failed, each failure named; 2 wrong usage;\n"
+    "3 the device or the library cannot be used.";
 
 // The words that an option knows, with an error that names them.
 CLI::Validator oneOf(const std::vector<std::string>& words) {
@@ -46,6 +47,51 @@ std::optional<std::int64_t> wholeNumber(std::string_view text) {
     return number;
 }
 
+// A whole number of that range, with an error that says so.
+CLI::Validator wholeNumberFrom(std::int64_t least, std::int64_t most) {
+    return {[least, most](const std::string& given) {
+                const std::optional<std::int64_t> number = wholeNumber(given);
+                if (number && *number >= least && *number <= most) return std::string();
+                return shownArgument(given) + " is no whole number from " + std::to_string(least) +
+                       " to " + std::to_string(most);
+            },
+            ""};
+}
+
+CLI::Validator anyWholeNumber() {
+    return {[](const std::string& given) {
+                return wholeNumber(given) ? "" : shownArgument(given) + " is no whole number";
+            },
+            ""};
+}
+
+// Where the text of a line of help begins that is to be broken: behind the name of the option.
+std::size_t helpColumn(const std::string& line) {
+    const std::size_t begin = line.find_first_not_of(' ');
+    const std::size_t gap = line.find("  ", begin);
+    const std::size_t text = gap == std::string::npos ? gap : line.find_first_not_of(' ', gap);
+    constexpr std::size_t kFarthest = 40;
+    return text == std::string::npos || text > kFarthest ? begin + 2 : text;
+}
+
+// The text with its long lines broken between words.
+std::string brokenAt80(const std::string& text) {
+    constexpr std::size_t kWidth = 79;  // some terminals go on to the next line at the 80th
+    std::string broken;
+    std::istringstream lines(text);
+    for (std::string line; std::getline(lines, line);) {
+        const std::size_t column = line.size() > kWidth ? helpColumn(line) : 0;
+        while (line.size() > kWidth) {
+            const std::size_t blank = line.rfind(' ', kWidth);
+            if (blank == std::string::npos || blank <= column) break;
+            broken += line.substr(0, blank) + "\n";
+            line = std::string(column, ' ') + line.substr(blank + 1);
+        }
+        broken += line + "\n";
+    }
+    return broken;
+}
+
 // Declares the commands and remembers which one was chosen. The values that options are parsed into
 // live as long as the commands' actions.
 class Commands {
@@ -55,6 +101,7 @@ class Commands {
         app_.footer(kFooter);
         addSync();
         addPlan();
+        addStage();
         addSend();
         addDevice();
         addLook();
@@ -83,7 +130,9 @@ class Commands {
         try {
             app_.parse(std::move(arguments));
         } catch (const CLI::Success& help) {
-            app_.exit(help, console_.out, console_.err);
+            std::ostringstream text;
+            app_.exit(help, text, text);
+            console_.out << brokenAt80(text.str());
             return kExitDone;
         } catch (const CLI::ParseError& error) {
             return console_.fail(wrongUsage(whatIsWrong(error), "see " + chosen() + " --help"));
@@ -101,7 +150,6 @@ class Commands {
     // Whether the words are a command, and a command of that one.
     [[nodiscard]] Status checkCommands(const std::vector<std::string>& words) const {
         const CLI::App* command = &app_;
-        addStage();
         for (const std::string& word : words) {
             const auto known = command->get_subcommands(
                 [&word](const CLI::App* each) { return each->get_name() == word; });
@@ -135,7 +183,22 @@ class Commands {
         if (!unknown.empty()) {
             return shownArgument(unknown.front()) + " is one argument too many for " + chosen();
         }
-        return error.what();
+        return inOwnWords(error);
+    }
+
+    // What the parser says of an option begins with its name.
+    [[nodiscard]] std::string inOwnWords(const CLI::ParseError& error) const {
+        const std::string told = error.what();
+        const std::string option = told.substr(0, told.find(':'));
+        if (dynamic_cast<const CLI::ArgumentMismatch*>(&error) != nullptr) {
+            return option + " needs a value";
+        }
+        if (dynamic_cast<const CLI::ConversionError*>(&error) != nullptr) {
+            return "an option of " + chosen() + " does not take its value";
+        }
+        const bool lacksCommand = dynamic_cast<const CLI::RequiredError*>(&error) != nullptr &&
+                                  told.find("subcommand") != std::string::npos;
+        return lacksCommand ? chosen() + " needs a command" : told;
     }
 
     // A command whose options are parsed into one `Values`.
@@ -170,6 +233,9 @@ class Commands {
             ->allow_extra_args(false);  // what follows the identifier is DEVICE or LIBRARY
         added.add_flag("--mirror", values.plan.mirror,
                        "remove every user application that LIBRARY lacks");
+    }
+
+    static void addStaged(CLI::App& added, SyncArguments& values) {
         added.add_flag("--staged", values.isStaged,
                        "the staging area is there already: send what it asks for");
     }
@@ -180,6 +246,7 @@ class Commands {
             app_, "sync", "Bring the device in step with a folder of packages", values,
             [this](const SyncArguments& parsed) { return runSync(parsed, console_); });
         addPlanOptions(added, *values);
+        addStaged(added, *values);
         added.add_flag("--dry-run", values->isDryRun, "only say what would be done (= plan)");
         addDisplay(added, values->display);
     }
@@ -191,8 +258,19 @@ class Commands {
             app_, "plan", "Say what a sync would do and whether it fits", values,
             [this](const SyncArguments& parsed) { return runSync(parsed, console_); });
         addPlanOptions(added, *values);
+        addStaged(added, *values);
         added.add_flag_callback(
             "--json", [values] { values->display = SyncDisplayKind::Json; }, "print JSON");
+    }
+
+    void addStage() {
+        const auto values = std::make_shared<StageArguments>();
+        CLI::App& added = command<StageArguments>(
+            app_, "stage", "Leave on the device what a sync would, for sync --staged", values,
+            [this](const StageArguments& parsed) { return runStage(parsed, console_); });
+        addPlanOptions(added, values->sync);
+        added.add_flag("--force", values->replaces, "replace a staging area that waits already");
+        added.add_flag("--json", values->asJson, "print JSON");
     }
 
     void addSend() {
@@ -210,7 +288,7 @@ class Commands {
                 "1: the package, its data follows; 2: the data; 3: all at once; without it: 1 "
                 "where the device knows of data, else 3")
             ->type_name("N")
-            ->check(CLI::Range(1U, 3U));
+            ->check(wholeNumberFrom(1, 3));
         addDisplay(added, values->display);
     }
 
@@ -233,9 +311,6 @@ class Commands {
     CLI::App& applicationCommand(const std::string& name, const std::string& description,
                                  const std::shared_ptr<DeviceValues>& values, DeviceAction action) {
         CLI::App& added = deviceCommand(name, description, values, std::move(action));
-    }
-
-    static void addStaged(CLI::App& added, SyncArguments& values) {
         added.add_option("ID", values->identifier, "the application's identifier")->required();
         return added;
     }
@@ -244,59 +319,57 @@ class Commands {
         addCreate();
         addSet();
         addDemote();
-        applicationCommand("run", "Mark an application as running: its termination is denied",
-                           std::make_shared<DeviceValues>(), [this](const DeviceValues& parsed) {
-        addStaged(added, *values);
-                               return runRun(parsed.device, parsed.identifier, console_);
-                           });
-        applicationCommand("quit", "Mark it as not running any more",
-                           std::make_shared<DeviceValues>(), [this](const DeviceValues& parsed) {
-                               return runQuit(parsed.device, parsed.identifier, console_);
-                           });
-        applicationCommand("uninstall", "Remove an application as a person does on the device",
-                           std::make_shared<DeviceValues>(), [this](const DeviceValues& parsed) {
-                               return runUninstall(parsed.device, parsed.identifier, console_);
-                           });
-        deviceCommand("reset", "Make the device forget what it keeps for syncing",
-        addStaged(added, *values);
-                      std::make_shared<DeviceValues>(), [this](const DeviceValues& parsed) {
-                          return runReset(parsed.device, console_);
-                      });
-    }
-    void addStage() {
-        const auto values = std::make_shared<StageArguments>();
-        CLI::App& added = command<StageArguments>(
-            app_, "stage", "Leave on the device what a sync would, for sync --staged", values,
-            [this](const StageArguments& parsed) { return runStage(parsed, console_); });
-        addPlanOptions(added, values->sync);
-        added.add_flag("--force", values->replaces, "replace a staging area that waits already");
-        added.add_flag("--json", values->asJson, "print JSON");
+        addAction("run", "Mark an application as running: its termination is denied", runRun);
+        addAction("quit", "Mark it as not running any more", runQuit);
+        addAction("uninstall", "Remove an application as a person does on the device",
+                  runUninstall);
+        const auto reset = std::make_shared<DeviceValues>();
+        CLI::App& added = deviceCommand("reset", "Make the device forget what it keeps for syncing",
+                                        reset, [this](const DeviceValues& parsed) {
+                                            return runReset(parsed.device, parsed.flag, console_);
+                                        });
+        addJson(added, reset);
     }
 
+    void addAction(const std::string& name, const std::string& description,
+                   int (*act)(const ApplicationArguments&, const Console&)) {
+        const auto values = std::make_shared<DeviceValues>();
+        CLI::App& added =
+            applicationCommand(name, description, values, [this, act](const DeviceValues& parsed) {
+                return act(applicationOf(parsed), console_);
+            });
+        addJson(added, values);
+    }
+
+    static ApplicationArguments applicationOf(const DeviceValues& values) {
+        return {values.device, values.identifier, values.flag};
+    }
 
     void addCreate() {
         const auto values = std::make_shared<DeviceValues>();
-        CLI::App& added =
-            deviceCommand("create", "Make an empty device in a new directory", values,
-                          [this](const DeviceValues& parsed) {
-                              return runCreate(parsed.device, parsed.other == "on", console_);
-                          });
+        CLI::App& added = deviceCommand("create", "Make an empty device in a new directory", values,
+                                        [this](const DeviceValues& parsed) {
+                                            return runCreate(parsed.device, parsed.other == "on",
+                                                             parsed.flag, console_);
+                                        });
         added.add_option("--coordination", values->other, "whether installs are coordinated")
             ->type_name("on|off")
             ->check(oneOf({"on", "off"}));
+        addJson(added, values);
     }
 
     void addSet() {
         const auto values = std::make_shared<DeviceValues>();
-        CLI::App& added =
-            deviceCommand("set", "Change what the device's owner allows", values,
-                          [this](const DeviceValues& parsed) {
-                              return runSet(parsed.device, parsed.assignments, console_);
-                          });
+        CLI::App& added = deviceCommand("set", "Change what the device's owner allows", values,
+                                        [this](const DeviceValues& parsed) {
+                                            return runSet(parsed.device, parsed.assignments,
+                                                          parsed.flag, console_);
+                                        });
         added
             .add_option("NAME=VALUE", values->assignments,
                         "installation=yes|no|unset  removal=yes|no|unset  coordination=on|off")
             ->required();
+        addJson(added, values);
     }
 
     void addDemote() {
@@ -304,12 +377,12 @@ class Commands {
         CLI::App& added = applicationCommand(
             "demote", "Offload an application: its placeholder and its data stay", values,
             [this](const DeviceValues& parsed) {
-                return runDemote(parsed.device, parsed.identifier, parsed.other == "system",
-                                 console_);
+                return runDemote(applicationOf(parsed), parsed.other == "system", console_);
             });
         added.add_option("--by", values->other, "who does it")
             ->type_name("person|system")
             ->check(oneOf({"person", "system"}));
+        addJson(added, values);
     }
 
     void addJson(CLI::App& added, const std::shared_ptr<DeviceValues>& values) {
@@ -323,12 +396,13 @@ class Commands {
         addLook("history", "Show the transaction log", runHistory);
         addWhy();
         const auto values = std::make_shared<DeviceValues>();
-        deviceCommand("screen", "Draw the home screen as a PNG picture", values,
-                      [this](const DeviceValues& parsed) {
-                          return runScreen(parsed.device, parsed.other, console_);
-                      })
-            .add_option("OUT", values->other, "the picture to write")
-            ->required();
+        CLI::App& screen =
+            deviceCommand("screen", "Draw the home screen as a PNG picture", values,
+                          [this](const DeviceValues& parsed) {
+                              return runScreen(parsed.device, parsed.other, parsed.flag, console_);
+                          });
+        screen.add_option("OUT", values->other, "the picture to write")->required();
+        addJson(screen, values);
     }
 
     void addLook(const std::string& name, const std::string& description,
@@ -361,7 +435,9 @@ class Commands {
             app_, "log", "Show the system log", values,
             [this](const LogArguments& parsed) { return runLog(parsed, console_); });
         added.add_option("DEVICE", values->device, "the device's directory")->required();
-        added.add_option("--category", values->category, "only this category")->type_name("N");
+        added.add_option("--category", values->category, "only this category")
+            ->type_name("N")
+            ->check(wholeNumberFrom(0, 1'000'000));
         added
             .add_option_function<std::string>(
                 "--level", [values](const std::string& name) { values->level = kLevels.at(name); },
@@ -388,7 +464,7 @@ class Commands {
             .add_option("--client", values->client,
                         "the client to play: 1 is the app store, 3 the sync client (default 2)")
             ->type_name("N")
-            ->check(CLI::Range(1U, 1'000'000U).description(""));
+            ->check(wholeNumberFrom(1, 1'000'000));
         added.add_flag("--json", values->asJson, "print what stands afterwards as JSON");
         addStore();
     }
@@ -446,19 +522,13 @@ class Commands {
                 "--type", [values](const std::string& text) { values->type = *wholeNumber(text); },
                 "the kind of restore; 2 and 3 bring applications back (default 2)")
             ->type_name("N")
-            ->check(CLI::Validator(
-                [](const std::string& given) {
-                    return wholeNumber(given) ? "" : "'" + given + "' is no whole number";
-                },
-                ""));
+            ->check(anyWholeNumber());
         added.add_flag("--json", values->asJson, "print JSON");
     }
 
     struct FileValues {
         std::string file;
         std::string package;
-        std::optional<std::string> output;
-        PropertyListFormat format = PropertyListFormat::Xml;
         bool asJson = false;
     };
 
@@ -497,7 +567,8 @@ class Commands {
             [this](const FileValues& parsed) {
                 return runPropertyListShow(parsed.file, parsed.asJson, console_);
             });
-        show.add_option("FILE", shown->file, "the property list")->required();
+        show.add_option("FILE", shown->file, "the property list, or JSON; - is standard input")
+            ->required();
         show.add_flag("--json", shown->asJson, "print JSON");
         addConvert(parent);
     }
@@ -505,21 +576,29 @@ class Commands {
     void addConvert(CLI::App& parent) {
         static const std::map<std::string, PropertyListFormat> kFormats = {
             {"xml", PropertyListFormat::Xml}, {"binary", PropertyListFormat::Binary}};
-        const auto values = std::make_shared<FileValues>();
-        CLI::App& added = command<FileValues>(
+        const auto values = std::make_shared<ConvertArguments>();
+        CLI::App& added = command<ConvertArguments>(
             parent, "convert", "Write a property list in another encoding", values,
-            [this](const FileValues& parsed) {
-                return runPropertyListConvert(parsed.file, parsed.format, parsed.output, console_);
+            [this](const ConvertArguments& parsed) {
+                return runPropertyListConvert(parsed, console_);
             });
-        added.add_option("FILE", values->file, "the property list")->required();
+        added.add_option("FILE", values->file, "the property list, or JSON; - is standard input")
+            ->required();
         added
             .add_option_function<std::string>(
                 "--to", [values](const std::string& name) { values->format = kFormats.at(name); },
                 "the encoding to write")
             ->required()
             ->type_name("xml|binary")
-            ->check(oneOf({"xml", "binary"}));
+            ->check(CLI::Validator(
+                [](const std::string& given) {
+                    return given == "json"
+                               ? "json is none of xml, binary (plist show --json writes that)"
+                               : oneOf({"xml", "binary"})(given);
+                },
+                ""));
         added.add_option("--out", values->output, "the file to write; else standard output");
+        added.add_flag("--json", values->asJson, "tell of the file that is written as JSON");
     }
 
     const Console& console_;

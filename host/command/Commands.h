@@ -69,18 +69,22 @@ struct SendArguments {
 // What changes a device outside a sync: CreateCommand.cpp, SetCommand.cpp, RunCommand.cpp (and
 // quit), UninstallCommand.cpp, DemoteCommand.cpp, ResetCommand.cpp
 
-[[nodiscard]] int runCreate(const std::string& device, bool coordination, const Console& console);
-[[nodiscard]] int runSet(const std::string& device, const std::vector<std::string>& assignments,
-                         const Console& console);
-[[nodiscard]] int runRun(const std::string& device, const std::string& identifier,
-                         const Console& console);
-[[nodiscard]] int runQuit(const std::string& device, const std::string& identifier,
-                          const Console& console);
-[[nodiscard]] int runUninstall(const std::string& device, const std::string& identifier,
-                               const Console& console);
-[[nodiscard]] int runDemote(const std::string& device, const std::string& identifier, bool bySystem,
+/// One application of a device.
+struct ApplicationArguments {
+    std::string device;
+    std::string identifier;
+    bool asJson = false;
+};
+[[nodiscard]] int runCreate(const std::string& device, bool coordination, bool asJson,
                             const Console& console);
-[[nodiscard]] int runReset(const std::string& device, const Console& console);
+[[nodiscard]] int runSet(const std::string& device, const std::vector<std::string>& assignments,
+                         bool asJson, const Console& console);
+[[nodiscard]] int runRun(const ApplicationArguments& arguments, const Console& console);
+[[nodiscard]] int runQuit(const ApplicationArguments& arguments, const Console& console);
+[[nodiscard]] int runUninstall(const ApplicationArguments& arguments, const Console& console);
+[[nodiscard]] int runDemote(const ApplicationArguments& arguments, bool bySystem,
+                            const Console& console);
+[[nodiscard]] int runReset(const std::string& device, bool asJson, const Console& console);
 
 // What shows a device: AppsCommand.cpp, WhyCommand.cpp, InventoryCommand.cpp, HistoryCommand.cpp,
 // ScreenCommand.cpp
@@ -90,7 +94,7 @@ struct SendArguments {
                          const Console& console);
 [[nodiscard]] int runInventory(const std::string& device, bool asJson, const Console& console);
 [[nodiscard]] int runHistory(const std::string& device, bool asJson, const Console& console);
-[[nodiscard]] int runScreen(const std::string& device, const std::string& picture,
+[[nodiscard]] int runScreen(const std::string& device, const std::string& picture, bool asJson,
                             const Console& console);
 
 // LogCommand.cpp
@@ -149,8 +153,14 @@ struct RestoreArguments {
                                  const Console& console);
 [[nodiscard]] int runPackageShow(const std::string& package, bool asJson, const Console& console);
 [[nodiscard]] int runPropertyListShow(const std::string& file, bool asJson, const Console& console);
-[[nodiscard]] int runPropertyListConvert(const std::string& file, PropertyListFormat format,
-                                         const std::optional<std::string>& output,
-                                         const Console& console);
+
+struct ConvertArguments {
+    std::string file;  // "-": standard input
+    PropertyListFormat format = PropertyListFormat::Xml;
+    /// "-", or nothing: standard output.
+    std::optional<std::string> output;
+    bool asJson = false;
+};
+[[nodiscard]] int runPropertyListConvert(const ConvertArguments& arguments, const Console& console);
 
 }  // namespace appsync

@@ -44,26 +44,24 @@ std::string promisesText(const CoordinatorRecord& coordinator) {
     return text.empty() ? "-" : text;
 }
 
-std::string stateText(const CoordinatorRecord& coordinator) {
-    if (coordinator.isComplete) return "everything is there";
-    return coordinator.waitsFor;
-}
-
-std::string coordinatorsTable(const std::vector<CoordinatorRecord>& coordinators) {
+std::string coordinatorsTable(const std::vector<CoordinatorRecord>& coordinators,
+                              const Console& console) {
     if (coordinators.empty()) return "No coordinators.\n";
     Table table({"IDENTIFIER", "KIND", "CLIENT", "PLACEHOLDER", "PROMISES", "STATE"});
     for (const CoordinatorRecord& each : coordinators) {
         table.add({each.identifier, each.kind, std::to_string(each.client),
                    each.placeholderStands ? "shown" : (each.hasPlaceholder ? "not shown" : "-"),
-                   promisesText(each), stateText(each)});
+                   promisesText(each), coordinatorState(each)});
     }
+    if (console.isTerminal) table.fitInto(console.width);
     return table.text();
 }
 
 int listCoordinators(Device& device, bool asJson, const Console& console) {
     const Result<std::vector<CoordinatorRecord>> coordinators = device.coordinators();
     if (!coordinators) return console.fail(unusable(coordinators.error()));
-    console.out << (asJson ? jsonText(*coordinators) + "\n" : coordinatorsTable(*coordinators));
+    console.out << (asJson ? jsonText(*coordinators) + "\n"
+                           : coordinatorsTable(*coordinators, console));
     return kExitDone;
 }
 

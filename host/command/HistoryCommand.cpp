@@ -17,12 +17,13 @@ std::string whatText(const HistoryRecord& record) {
     return "step " + std::to_string(record.step) + (record.phase == 1 ? " begins" : " ends");
 }
 
-std::string historyTable(const std::vector<HistoryRecord>& records) {
+std::string historyTable(const std::vector<HistoryRecord>& records, const Console& console) {
     Table table({"TIME", "WHAT", "RESULT", "IDENTIFIER", "DESCRIPTION"});
     for (const HistoryRecord& record : records) {
-        table.add({formatTime(record.time), whatText(record), record.success ? "ok" : "failed",
+        table.add({formatLocalTime(record.time), whatText(record), record.success ? "ok" : "failed",
                    record.identifier, record.description});
     }
+    if (console.isTerminal) table.fitInto(console.width);
     return records.empty() ? "No history.\n" : table.text();
 }
 
@@ -32,7 +33,7 @@ int runHistory(const std::string& device, bool asJson, const Console& console) {
     return lookAt(device, console, [&](Device& opened) -> Status {
         const Result<std::vector<HistoryRecord>> records = opened.history();
         if (!records) return unusable(records.error());
-        console.out << (asJson ? jsonText(*records) + "\n" : historyTable(*records));
+        console.out << (asJson ? jsonText(*records) + "\n" : historyTable(*records, console));
         return {};
     });
 }

@@ -115,7 +115,7 @@ void showLine(const std::string& text, const LogArguments& arguments, const Cons
         return;
     }
     const std::string number = record.category ? std::to_string(*record.category) : "-";
-    console.out << printable(record.time) << ' ' << fitted(printable(record.level), 7) << ' '
+    console.out << localTimeOf(record.time) << ' ' << fitted(printable(record.level), 7) << ' '
                 << fitted(number, 2) << ' ' << printable(record.message) << '\n';
 }
 

@@ -2,9 +2,13 @@
 
 #include <ostream>
 
+#include <nlohmann/json.hpp>
+
 #include "device/values/DeviceError.h"
+#include "host/command/Commands.h"
 #include "host/command/IdentifierArgument.h"
 #include "host/console/Console.h"
+#include "host/console/JsonWriting.h"
 #include "host/console/Problem.h"
 
 namespace appsync {
@@ -31,16 +35,26 @@ int lookAt(const std::string& path, const Console& console, const WorkOnDevice& 
     return status ? kExitDone : console.fail(classified(status.error()));
 }
 
-int actOn(const std::string& path, const std::string& identifier, const DeviceOpenOptions& options,
-          std::string_view done, const Console& console, const WorkOnDevice& action) {
+int actOn(const ApplicationArguments& arguments, const DeviceOpenOptions& options,
+          const ActionTexts& texts, const Console& console,
+          const std::function<Result<ActionOutcome>(Device& device)>& action) {
+    const std::string& identifier = arguments.identifier;
     const Status checked = checkIdentifier(identifier, kGiveAsShown);
     if (!checked) return console.fail(checked.error());
-    const Result<std::unique_ptr<Device>> device = openDevice(path, options);
+    const Result<std::unique_ptr<Device>> device = openDevice(arguments.device, options);
     if (!device) return console.fail(device.error());
-    const Status status = action(**device);
+    const Result<ActionOutcome> outcome = action(**device);
     if (const auto broken = (*device)->databaseFailure()) return console.fail(unusable(*broken));
-    if (!status) return console.fail(classified(status.error()));
-    console.out << identifier << " " << done << '\n';
+    if (!outcome) return console.fail(classified(outcome.error()));
+    const bool hasChanged = *outcome == ActionOutcome::Done;
+    if (arguments.asJson) {
+        console.out << indented({{"identifier", identifier},
+                                 {"state", texts.state},
+                                 {"changed", hasChanged}})
+                    << '\n';
+    } else {
+        console.out << identifier << ' ' << (hasChanged ? texts.done : texts.wasSo) << '\n';
+    }
     return kExitDone;
 }
 

@@ -10,6 +10,7 @@
 
 namespace appsync {
 
+struct ApplicationArguments;
 struct Console;
 
 /// Opens a device for a command; the error has the exit status "unusable".
@@ -30,9 +31,22 @@ using WorkOnDevice = std::function<Status(Device& device)>;
 /// Opens a device for looking and hands it on. Gives the exit status.
 [[nodiscard]] int lookAt(const std::string& path, const Console& console, const WorkOnDevice& look);
 
-/// Does something to one application of a device and says that it is `done`. Gives the exit status.
-[[nodiscard]] int actOn(const std::string& path, const std::string& identifier,
-                        const DeviceOpenOptions& options, std::string_view done,
-                        const Console& console, const WorkOnDevice& action);
+/// Whether an action has changed anything.
+enum class ActionOutcome { Done, WasSo };
+
+/// How a command tells what it has done to an application.
+struct ActionTexts {
+    /// What follows the identifier: "is offloaded", "is offloaded already".
+    std::string_view done;
+    std::string_view wasSo;
+    /// What the application is now, in JSON.
+    std::string_view state;
+};
+
+/// Does something to one application of a device and says so in one line, or in JSON. Gives the
+/// exit status.
+[[nodiscard]] int actOn(const ApplicationArguments& arguments, const DeviceOpenOptions& options,
+                        const ActionTexts& texts, const Console& console,
+                        const std::function<Result<ActionOutcome>(Device& device)>& action);
 
 }  // namespace appsync

@@ -3,9 +3,11 @@
 #include "device/package/PackageReader.h"
 #include "device/package/PackageWriter.h"
 #include "host/command/Commands.h"
+#include "host/command/WrittenFile.h"
 #include "host/console/Console.h"
 #include "host/console/Problem.h"
 #include "host/console/Text.h"
+#include "host/file/HostFile.h"
 #include "host/output/JsonRecords.h"
 #include "system/property_list/PropertyListCodec.h"
 
@@ -24,10 +26,12 @@ std::string packageText(const PackageInfo& info) {
 int runPackageMake(const std::string& folder, const std::string& package, bool asJson,
                    const Console& console) {
     SystemPropertyLists codec;
+    const bool hasReplaced = isHostFile(package);
     const Result<PackageInfo> info = writePackage(folder, package, codec);
     if (!info) return console.fail(info.error());
-    console.out << (asJson ? jsonText(*info) + "\n"
-                           : printable(package) + ": " + packageText(*info));
+    console.out << (asJson ? jsonText(*info, hasReplaced) + "\n"
+                           : printable(package) + replacementText(hasReplaced) + ": " +
+                                 packageText(*info));
     return kExitDone;
 }
 

@@ -1,10 +1,13 @@
 #include <memory>
 #include <ostream>
 
+#include <nlohmann/json.hpp>
+
 #include "device/Device.h"
 #include "host/command/Commands.h"
 #include "host/command/OpenDevice.h"
 #include "host/console/Console.h"
+#include "host/console/JsonWriting.h"
 #include "host/console/Problem.h"
 #include "host/console/Text.h"
 #include "host/session/PlugIn.h"
@@ -12,7 +15,7 @@
 
 namespace appsync {
 
-int runReset(const std::string& device, const Console& console) {
+int runReset(const std::string& device, bool asJson, const Console& console) {
     const Result<std::unique_ptr<Device>> opened =
         openDevice(device, {.access = DeviceAccess::Session, .makesRoom = true});
     if (!opened) return console.fail(opened.error());
@@ -20,7 +23,11 @@ int runReset(const std::string& device, const Console& console) {
     if (!plugIn) return console.fail(plugIn.error());
     (*plugIn)->client().clearSyncData();
     if (const auto error = (*opened)->databaseFailure()) return console.fail(unusable(*error));
-    console.out << printable(device) << " has forgotten what it kept for syncing\n";
+    if (asJson) {
+        console.out << indented({{"device", device}}) << '\n';
+    } else {
+        console.out << printable(device) << " has forgotten what it kept for syncing\n";
+    }
     return kExitDone;
 }
 

@@ -53,6 +53,7 @@ void print(const RestoreArguments& arguments, const RestoreResult& result, doubl
             table.add({each.identifier, each.version.value_or("-"), each.name,
                        each.isPlaceholder ? "placeholder" : "installed"});
         }
+        if (console.isTerminal) table.fitInto(console.width);
         console.out << table.text();
     }
     if (!bringsApplications(arguments.type)) {

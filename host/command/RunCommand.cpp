@@ -3,15 +3,29 @@
 #include "host/command/OpenDevice.h"
 
 namespace appsync {
+namespace {
 
-int runRun(const std::string& device, const std::string& identifier, const Console& console) {
-    return actOn(device, identifier, {}, "runs", console,
-                 [&](Device& opened) { return opened.run(identifier); });
+// Runs or ends it; what is refused is refused also where it is so already.
+Result<ActionOutcome> setRunning(Device& device, const std::string& identifier, bool runs) {
+    const Result<ApplicationStatus> before = device.status(identifier);
+    if (!before) return before.error();
+    const Status status = runs ? device.run(identifier) : device.quit(identifier);
+    if (!status) return status.error();
+    return before->isRunning == runs ? ActionOutcome::WasSo : ActionOutcome::Done;
 }
 
-int runQuit(const std::string& device, const std::string& identifier, const Console& console) {
-    return actOn(device, identifier, {}, "does not run any more", console,
-                 [&](Device& opened) { return opened.quit(identifier); });
+}  // namespace
+
+int runRun(const ApplicationArguments& arguments, const Console& console) {
+    const ActionTexts texts{"runs", "runs already", "running"};
+    return actOn(arguments, {}, texts, console,
+                 [&](Device& opened) { return setRunning(opened, arguments.identifier, true); });
+}
+
+int runQuit(const ApplicationArguments& arguments, const Console& console) {
+    const ActionTexts texts{"does not run any more", "did not run", "not running"};
+    return actOn(arguments, {}, texts, console,
+                 [&](Device& opened) { return setRunning(opened, arguments.identifier, false); });
 }
 
 }  // namespace appsync

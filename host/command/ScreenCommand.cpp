@@ -2,24 +2,29 @@
 #include "device/screen/HomeScreenPicture.h"
 #include "host/command/Commands.h"
 #include "host/command/OpenDevice.h"
-#include "host/file/HostFile.h"
+#include "host/command/WrittenFile.h"
 
 namespace appsync {
 namespace {
 
-Status writeScreen(Device& device, const std::string& picture) {
+Result<WrittenFile> writeScreen(Device& device, const std::string& picture) {
     const Result<std::vector<HomeScreenItem>> items = device.homeScreen();
     if (!items) return items.error();
     const Result<Bytes> png = drawHomeScreen(*items, "appsync");
     if (!png) return png.error();
-    return writeHostFile(picture, *png);
+    return writeOutput(picture, *png);
 }
 
 }  // namespace
 
-int runScreen(const std::string& device, const std::string& picture, const Console& console) {
-    return lookAt(device, console,
-                  [&](Device& opened) -> Status { return writeScreen(opened, picture); });
+int runScreen(const std::string& device, const std::string& picture, bool asJson,
+              const Console& console) {
+    return lookAt(device, console, [&](Device& opened) -> Status {
+        const Result<WrittenFile> written = writeScreen(opened, picture);
+        if (!written) return written.error();
+        tellWritten(*written, asJson, console);
+        return {};
+    });
 }
 
 }  // namespace appsync

@@ -206,7 +206,6 @@ class Sending {
         SyncSummary summary;
         summary.failed.push_back({arguments_.identifier, reason.description()});
         summary.incomplete = true;
-        console_.fail(reason);
         return finish(std::move(summary));
     }
 
@@ -272,7 +271,7 @@ class Sending {
         const Result<SessionAftermath> aftermath = aftermathOf(*device_, end, facts_);
         if (!aftermath) {
             finish(summarizeFailed(plan_, facts_, aftermath.error()));
-            return aftermath.error();
+            return int{exitStatusOf(aftermath.error())};
         }
         SyncSummary summary = summarize(plan_, facts_, *aftermath);
         if (!plansInstall_ && summary.failed.empty()) {
@@ -296,7 +295,9 @@ class Sending {
     int finish(SyncSummary summary) {
         summary = timed(std::move(summary));
         events_.finish(summary);
-        if (signals_.stopRequested()) console_.fail(failure("interrupted", kRunAgain));
+        if (signals_.stopRequested() && !tellsOfInterruption(summary)) {
+            console_.fail(failure("interrupted", kRunAgain));
+        }
         return summary.incomplete ? kExitSomethingFailed : kExitDone;
     }
 

@@ -2,26 +2,30 @@
 #include <ostream>
 #include <string_view>
 
+#include <nlohmann/json.hpp>
+
 #include "device/Device.h"
 #include "host/command/Commands.h"
+#include "host/command/IdentifierArgument.h"
 #include "host/command/OpenDevice.h"
 #include "host/console/Console.h"
+#include "host/console/JsonWriting.h"
 #include "host/console/Problem.h"
 #include "host/console/Text.h"
 
 namespace appsync {
 namespace {
 
-Result<PolicyAnswer> parsePolicy(const std::string& name, std::string_view value) {
+Result<PolicyAnswer> parsePolicy(const std::string& name, const std::string& value) {
     if (value == "yes") return PolicyAnswer::Yes;
     if (value == "no") return PolicyAnswer::No;
     if (value == "unset") return PolicyAnswer::Unset;
-    return wrongUsage(name + " cannot be " + printable(value), "use yes, no or unset");
+    return wrongUsage(name + " cannot be " + shownArgument(value), "use yes, no or unset");
 }
 
-Status addCoordination(DeviceSettingsChange& change, std::string_view value) {
+Status addCoordination(DeviceSettingsChange& change, const std::string& value) {
     if (value != "on" && value != "off") {
-        return wrongUsage("coordination cannot be " + printable(value), "use on or off");
+        return wrongUsage("coordination cannot be " + shownArgument(value), "use on or off");
     }
     change.coordination = value == "on";
     return {};
@@ -33,7 +37,7 @@ Status addAssignment(DeviceSettingsChange& change, const std::string& assignment
     const std::string value = equals == std::string::npos ? "" : assignment.substr(equals + 1);
     if (name == "coordination") return addCoordination(change, value);
     if (name != "installation" && name != "removal") {
-        return wrongUsage("there is no setting " + printable(name),
+        return wrongUsage("there is no setting " + shownArgument(name),
                           "use installation=, removal= or coordination=");
     }
     const Result<PolicyAnswer> answer = parsePolicy(name, value);
@@ -51,29 +55,76 @@ Result<DeviceSettingsChange> parseAssignments(const std::vector<std::string>& as
     return change;
 }
 
+std::string_view nameOf(PolicyAnswer answer) {
+    if (answer == PolicyAnswer::Unset) return "unset";
+    return answer == PolicyAnswer::Yes ? "yes" : "no";
+}
+
+bool areSame(const DeviceSettings& left, const DeviceSettings& right) {
+    return left.installation == right.installation && left.removal == right.removal &&
+           left.coordination == right.coordination;
+}
+
+struct ChangedSettings {
+    DeviceSettings now;
+    bool hasChanged = false;
+    /// Whose coordinators the next session gives up.
+    std::vector<std::string> ends;
+};
+
 // Without coordination no coordinator outlives the opening of a session; whoever turns it off hears
 // whose goes.
-int tellWhatEnds(Device& device, const Console& console) {
+Result<ChangedSettings> changeSettings(Device& device, const DeviceSettingsChange& change) {
+    const Result<DeviceSettings> before = device.settings();
+    if (!before) return unusable(before.error());
+    const Status changed = device.change(change);
+    if (!changed) return classified(changed.error());
+    const Result<DeviceSettings> now = device.settings();
+    if (!now) return unusable(now.error());
+    ChangedSettings result{*now, !areSame(*before, *now), {}};
+    if (change.coordination != false) return result;
     const Result<std::vector<CoordinatorRecord>> ending = device.coordinators();
-    if (!ending) return console.fail(unusable(ending.error()));
-    if (ending->empty()) return kExitDone;
+    if (!ending) return unusable(ending.error());
+    for (const CoordinatorRecord& each : *ending) result.ends.push_back(each.identifier);
+    return result;
+}
+
+void printJson(const ChangedSettings& settings, const Console& console) {
+    console.out << indented({{"installation", nameOf(settings.now.installation)},
+                             {"removal", nameOf(settings.now.removal)},
+                             {"coordination", settings.now.coordination ? "on" : "off"},
+                             {"changed", settings.hasChanged},
+                             {"ends", settings.ends}})
+                << '\n';
+}
+
+void print(const std::string& device, const ChangedSettings& settings, const Console& console) {
+    console.out << printable(device) << (settings.hasChanged ? " is set: " : " was so already: ")
+                << "installation=" << nameOf(settings.now.installation)
+                << " removal=" << nameOf(settings.now.removal)
+                << " coordination=" << (settings.now.coordination ? "on" : "off") << '\n';
+    if (settings.ends.empty()) return;
     console.out << "The next session gives up what has a coordinator:";
-    for (const CoordinatorRecord& each : *ending) console.out << ' ' << printable(each.identifier);
+    for (const std::string& each : settings.ends) console.out << ' ' << printable(each);
     console.out << "\nTo keep it, turn coordination on again before that.\n";
-    return kExitDone;
 }
 
 }  // namespace
 
-int runSet(const std::string& device, const std::vector<std::string>& assignments,
+int runSet(const std::string& device, const std::vector<std::string>& assignments, bool asJson,
            const Console& console) {
     const Result<DeviceSettingsChange> change = parseAssignments(assignments);
     if (!change) return console.fail(change.error());
     const Result<std::unique_ptr<Device>> opened = openDevice(device, DeviceAccess::Look);
     if (!opened) return console.fail(opened.error());
-    const Status changed = (*opened)->change(*change);
-    if (!changed) return console.fail(classified(changed.error()));
-    return change->coordination == false ? tellWhatEnds(**opened, console) : kExitDone;
+    const Result<ChangedSettings> settings = changeSettings(**opened, *change);
+    if (!settings) return console.fail(settings.error());
+    if (asJson) {
+        printJson(*settings, console);
+    } else {
+        print(device, *settings, console);
+    }
+    return kExitDone;
 }
 
 }  // namespace appsync

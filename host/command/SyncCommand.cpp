@@ -139,7 +139,6 @@ class SyncRun {
 
     // Nothing of the plan is done, for one reason.
     int refuse(const std::string& reason) {
-        console_.complain(reason);
         return finish(summarizeRefused(sync_.allowed, reason));
     }
 
@@ -172,7 +171,7 @@ class SyncRun {
             return finish(summarize(sync_.plan, facts_, *aftermath));
         }
         finish(summarizeFailed(sync_.plan, facts_, aftermath.error()));
-        return aftermath.error();
+        return int{exitStatusOf(aftermath.error())};
     }
 
     // What is in step with the library, an earlier update may have failed of.
@@ -215,8 +214,8 @@ class SyncRun {
         }
         endedWith_ = summary.incomplete ? kExitSomethingFailed : kExitDone;
         events_.finish(summary);
-        const bool isInterrupted =
-            summary.incomplete && signals_->stopRequested() && !isStagingOver_;
+        const bool isInterrupted = summary.incomplete && signals_->stopRequested() &&
+                                   !isStagingOver_ && !tellsOfInterruption(summary);
         if (isInterrupted) console_.fail(failure("interrupted", kRunAgain));
         return endedWith_;
     }

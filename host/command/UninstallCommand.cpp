@@ -4,9 +4,14 @@
 
 namespace appsync {
 
-int runUninstall(const std::string& device, const std::string& identifier, const Console& console) {
-    return actOn(device, identifier, {.makesRoom = true}, "is uninstalled", console,
-                 [&](Device& opened) { return opened.uninstall(identifier); });
+int runUninstall(const ApplicationArguments& arguments, const Console& console) {
+    const ActionTexts texts{"is uninstalled", "", "absent"};  // what is not there is refused
+    return actOn(arguments, {.makesRoom = true}, texts, console,
+                 [&](Device& opened) -> Result<ActionOutcome> {
+                     const Status status = opened.uninstall(arguments.identifier);
+                     if (!status) return status.error();
+                     return ActionOutcome::Done;
+                 });
 }
 
 }  // namespace appsync

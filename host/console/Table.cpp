@@ -1,33 +1,51 @@
 #include "host/console/Table.h"
 
 #include <algorithm>
+#include <string_view>
 #include <utility>
 
 #include "host/console/Text.h"
 
 namespace appsync {
+namespace {
+
+constexpr std::string_view kGap = "  ";
+constexpr std::size_t kFewest = 4;  // characters of a cell that still say something
+
+}  // namespace
 
 void Table::add(std::vector<std::string> cells) {
     for (std::string& cell : cells) cell = printable(cell);
     rows_.push_back(std::move(cells));
 }
 
-std::string Table::text() const {
+std::vector<std::size_t> Table::columnWidths() const {
     std::vector<std::size_t> widths(rows_.front().size());
     for (const auto& row : rows_) {
         for (std::size_t column = 0; column < widths.size(); ++column) {
             widths[column] = std::max(widths[column], displayWidth(row[column]));
         }
     }
-    for (std::size_t column = 0; column < std::min(widths.size(), limits_.size()); ++column) {
-        widths[column] = std::min(widths[column], limits_[column]);
+    if (width_ == 0) return widths;
+    std::size_t taken = kGap.size() * (widths.size() - 1);
+    for (const std::size_t each : widths) taken += each;
+    for (; taken > width_; --taken) {
+        const auto widest = std::max_element(widths.begin(), widths.end());
+        if (*widest <= kFewest) break;
+        --*widest;
     }
+    return widths;
+}
+
+std::string Table::text() const {
+    const std::vector<std::size_t> widths = columnWidths();
     std::string result;
     for (const auto& row : rows_) {
         for (std::size_t column = 0; column + 1 < widths.size(); ++column) {
-            result += fitted(row[column], widths[column]) + "  ";
+            result.append(fitted(row[column], widths[column])).append(kGap);
         }
-        result += row.back() + "\n";
+        const bool isCut = displayWidth(row.back()) > widths.back();
+        result += (isCut ? fitted(row.back(), widths.back()) : row.back()) + "\n";
     }
     return result;
 }

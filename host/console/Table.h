@@ -15,15 +15,18 @@ class Table {
     /// One row, as many cells as the heading has; what no terminal should get is replaced.
     void add(std::vector<std::string> cells);
 
-    /// The most characters that the first columns may take; a longer cell is cut.
-    void limit(std::vector<std::size_t> widths) { limits_ = std::move(widths); }
+    /// Cuts the cells of the widest columns so that a line has no more characters than that, as far
+    /// as that goes. For terminals: who reads it through a pipe gets all of it.
+    void fitInto(std::size_t width) { width_ = width; }
 
     /// The rows, heading first, each with a line end.
     [[nodiscard]] std::string text() const;
 
   private:
+    [[nodiscard]] std::vector<std::size_t> columnWidths() const;
+
     std::vector<std::vector<std::string>> rows_;
-    std::vector<std::size_t> limits_;
+    std::size_t width_ = 0;  // 0: any
 };
 
 }  // namespace appsync

@@ -26,7 +26,7 @@ ErrorRecord advised(const ErrorRecord& error, const char* advice) {
 
 ErrorRecord cannotWriteFile(int errorNumber, const std::string& path) {
     const bool isFull = errorNumber == ENOSPC || errorNumber == EDQUOT;
-    return advised(systemError(errorNumber, "cannot write " + path),
+    return advised(systemError(errorNumber, "cannot write " + displayPath(path)),
                    isFull ? "free space there, and run it again"
                           : "name a file in a directory that can be written");
 }
@@ -34,7 +34,8 @@ ErrorRecord cannotWriteFile(int errorNumber, const std::string& path) {
 Result<HostFile> HostFile::open(const std::string& path) {
     const int descriptor = ::open(path.c_str(), O_RDONLY | O_CLOEXEC | O_NONBLOCK);
     if (descriptor < 0) {
-        return advised(systemError(errno, "cannot open " + path), "name a file that can be read");
+        return advised(systemError(errno, "cannot open " + displayPath(path)),
+                       "name a file that can be read");
     }
     HostFile file(descriptor, 0);
     struct stat attributes {};
@@ -85,6 +86,24 @@ Result<Bytes> readHostFile(const std::string& path, std::uint64_t maximumBytes) 
     return contents;
 }
 
+Result<Bytes> readStandardInput(std::uint64_t maximumBytes) {
+    constexpr std::size_t kPiece = std::size_t{64} << 10U;
+    Bytes contents;
+    for (std::size_t length = 0;;) {
+        contents.resize(length + kPiece);
+        const ssize_t count = ::read(STDIN_FILENO, contents.data() + length, kPiece);
+        if (count < 0 && errno == EINTR) continue;
+        if (count < 0) return systemError(errno, "cannot read standard input");
+        length += static_cast<std::size_t>(count);
+        if (length > maximumBytes) {
+            return ErrorRecord::make(kPosixErrorDomain, EFBIG,
+                                     "standard input brings too much; see what it is");
+        }
+        contents.resize(length);
+        if (count == 0) return contents;
+    }
+}
+
 namespace {
 
 Status writeAndClose(int descriptor, const std::string& path, ByteView contents) {
@@ -107,6 +126,11 @@ bool isSpecial(const std::string& path) {
 }
 
 }  // namespace
+
+bool isHostFile(const std::string& path) {
+    struct stat attributes {};
+    return ::stat(path.c_str(), &attributes) == 0 && S_ISREG(attributes.st_mode);
+}
 
 Status writeHostFile(const std::string& path, ByteView contents) {
     // A pipe or a terminal is written to, not replaced.

@@ -40,8 +40,14 @@ class HostFile {
 /// The whole of a file of this machine; an error when it holds more than `maximumBytes`.
 [[nodiscard]] Result<Bytes> readHostFile(const std::string& path, std::uint64_t maximumBytes);
 
+/// All that standard input brings, whatever it is; an error when that is more than `maximumBytes`.
+[[nodiscard]] Result<Bytes> readStandardInput(std::uint64_t maximumBytes);
+
 /// Creates or replaces a file of this machine, whole: on failure the old one stays.
 [[nodiscard]] Status writeHostFile(const std::string& path, ByteView contents);
+
+/// Whether writing this file would replace one.
+[[nodiscard]] bool isHostFile(const std::string& path);
 
 /// That a file of this machine cannot be written, and what to do about it.
 [[nodiscard]] ErrorRecord cannotWriteFile(int errorNumber, const std::string& path);

@@ -11,6 +11,7 @@
 #include "host/output/PropertyListOutline.h"
 #include "host/output/WhyAnswer.h"
 #include "host/session/Inventory.h"
+#include "platform/AppRegistry.h"
 #include "platform/PropertyList.h"
 
 namespace appsync {
@@ -28,6 +29,7 @@ Json jsonOf(const ApplicationRecord& record) {
             {"version", orNull(record.version)},
             {"name", orNull(record.name)},
             {"state", record.isPlaceholder ? "placeholder" : "installed"},
+            {"placeholder", record.isPlaceholder ? Json(placeholderKind(record)) : Json()},
             {"type", record.type},
             {"installType", record.installType},
             {"container", record.container},
@@ -61,7 +63,8 @@ Json jsonOf(const CoordinatorRecord& record) {
             {"kind", record.kind},
             {"client", record.client},
             {"promises", std::move(promises)},
-            {"placeholder", record.placeholderStands}};
+            {"placeholder", record.placeholderStands},
+            {"state", coordinatorState(record)}};
 }
 
 template <typename Record>
@@ -79,6 +82,19 @@ Json jsonOf(const SyncAccountInfo& account) {
     return {{"accountID", account.accountID},
             {"personID", account.personID ? jsonOf(*account.personID) : Json()},
             {"alternatePersonID", orNull(account.alternatePersonID)}};
+}
+
+Json jsonOf(const PackageInfo& info) {
+    return {{"identifier", info.identifier},
+            {"version", info.version},
+            {"name", info.displayName},
+            {"executable", info.executable},
+            {"iconFile", info.iconFile},
+            {"bundle", info.bundleDirectoryName},
+            {"entries", info.entryCount},
+            {"bytes", info.packedBytes},
+            {"unpackedBytes", info.unpackedBytes},
+            {"storeMetadata", info.hasStoreMetadata}};
 }
 
 Json jsonOf(const PropertyList& value);
@@ -123,6 +139,22 @@ Json jsonOf(const PropertyList& value) {
 
 }  // namespace
 
+std::string_view placeholderKind(const ApplicationRecord& record) {
+    switch (record.installType) {
+        case kInstallTypeDowngrade:
+        case kInstallTypeIntentionalDowngrade:
+            return "offloaded";
+        case kInstallTypeRestore:
+            return "restored";
+        default:
+            return "arriving";
+    }
+}
+
+std::string coordinatorState(const CoordinatorRecord& record) {
+    return record.isComplete ? "everything is there" : record.waitsFor;
+}
+
 std::string jsonText(const std::vector<ApplicationRecord>& records) { return listText(records); }
 
 std::string jsonText(const std::vector<HistoryRecord>& records) { return listText(records); }
@@ -154,17 +186,12 @@ std::string jsonText(const WhyAnswer& answer) {
                      {"lastError", orNull(answer.lastError)}});
 }
 
-std::string jsonText(const PackageInfo& info) {
-    return indented({{"identifier", info.identifier},
-                     {"version", info.version},
-                     {"name", info.displayName},
-                     {"executable", info.executable},
-                     {"iconFile", info.iconFile},
-                     {"bundle", info.bundleDirectoryName},
-                     {"entries", info.entryCount},
-                     {"bytes", info.packedBytes},
-                     {"unpackedBytes", info.unpackedBytes},
-                     {"storeMetadata", info.hasStoreMetadata}});
+std::string jsonText(const PackageInfo& info) { return indented(jsonOf(info)); }
+
+std::string jsonText(const PackageInfo& info, bool hasReplaced) {
+    Json object = jsonOf(info);
+    object["replaced"] = hasReplaced;
+    return indented(object);
 }
 
 std::string jsonText(const PropertyList& value) { return indented(jsonOf(value)); }

@@ -1,6 +1,7 @@
 #pragma once
 
 #include <string>
+#include <string_view>
 #include <vector>
 
 #include "device/values/DeviceRecords.h"
@@ -21,6 +22,15 @@ struct WhyAnswer;
 [[nodiscard]] std::string jsonText(const Inventory& inventory);
 [[nodiscard]] std::string jsonText(const WhyAnswer& answer);
 [[nodiscard]] std::string jsonText(const PackageInfo& info);
+/// The same of a package that was written, and whether one was replaced.
+[[nodiscard]] std::string jsonText(const PackageInfo& info, bool hasReplaced);
+/// What a placeholder stands for: "offloaded", "restored" by a backup, or "arriving" with a sync or
+/// from the store.
+[[nodiscard]] std::string_view placeholderKind(const ApplicationRecord& record);
+
+/// Whether all of a coordinated install is there, or what it waits for; a sentence.
+[[nodiscard]] std::string coordinatorState(const CoordinatorRecord& record);
+
 /// Data becomes a map {"data": base64}, a date {"date": ISO 8601}.
 [[nodiscard]] std::string jsonText(const PropertyList& value);
 

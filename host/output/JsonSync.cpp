@@ -32,12 +32,14 @@ Json identifiers(const std::vector<PlannedInstall>& installs) {
     return list;
 }
 
+Json versionOrNull(const std::string& version) { return version.empty() ? Json() : Json(version); }
+
 Json updates(const std::vector<PlannedInstall>& planned) {
     Json list = Json::array();
     for (const PlannedInstall& each : planned) {
         list.push_back({{"identifier", each.identifier},
-                        {"oldVersion", each.oldVersion},
-                        {"newVersion", each.newVersion}});
+                        {"oldVersion", versionOrNull(each.oldVersion)},
+                        {"newVersion", versionOrNull(each.newVersion)}});
     }
     return list;
 }
@@ -54,7 +56,12 @@ std::string jsonText(const SyncEvent& event) {
                    {"nextTry", nullptr}};
     if (event.nextTry) object["nextTry"] = formatTime(*event.nextTry);
     if (event.state == SyncState::Failed) object["error"] = event.text;
-    if (event.state == SyncState::Waiting) object["waitsFor"] = event.text;
+    if (event.state == SyncState::Waiting) {
+        object["waitsFor"] = {{"what", "termination"},
+                              {"who", event.identifier},
+                              {"nextTry", object["nextTry"]},
+                              {"promise", nullptr}};
+    }
     return dumped(object);
 }
 
@@ -90,7 +97,6 @@ std::string jsonText(const SyncPlan& plan, const SpaceCheck& space, JsonLayout l
     return layout == JsonLayout::EventLine ? dumped(object) : indented(object);
 }
 
-}  // namespace appsync
 std::string stagedJsonText(const SyncPlan& plan, std::string_view area, bool hasReplaced) {
     return indented({{"area", area},
                      {"install", identifiers(plan.install)},
@@ -102,3 +108,4 @@ std::string stagedJsonText(const SyncPlan& plan, std::string_view area, bool has
                      {"replaced", hasReplaced}});
 }
 
+}  // namespace appsync

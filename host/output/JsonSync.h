@@ -1,6 +1,7 @@
 #pragma once
 
 #include <string>
+#include <string_view>
 
 #include "host/plan/SyncPlan.h"
 #include "host/watch/SyncEvents.h"
@@ -18,8 +19,8 @@ enum class JsonLayout {
 [[nodiscard]] std::string jsonText(const SyncSummary& summary, JsonLayout layout);
 [[nodiscard]] std::string jsonText(const SyncPlan& plan, const SpaceCheck& space,
                                    JsonLayout layout);
-
 /// What a staging area asks for that a host has left, at this path of the device.
 [[nodiscard]] std::string stagedJsonText(const SyncPlan& plan, std::string_view area,
                                          bool hasReplaced);
+
 }  // namespace appsync

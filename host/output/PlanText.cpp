@@ -11,14 +11,18 @@ std::string sizeText(const PlannedInstall& each) {
     return each.hasArrived ? "(on the device already)\n" : "(" + formatBytes(each.bytes) + ")\n";
 }
 
+std::string versionText(const std::string& version) {
+    return version.empty() ? "-" : printable(version);
+}
+
 std::string installLine(const PlannedInstall& each) {
-    return "install  " + printable(each.identifier) + " " + printable(each.newVersion) + " " +
+    return "install  " + printable(each.identifier) + " " + versionText(each.newVersion) + " " +
            sizeText(each);
 }
 
 std::string updateLine(const PlannedInstall& each) {
-    return "update   " + printable(each.identifier) + " " + printable(each.oldVersion) + " -> " +
-           printable(each.newVersion) + " " + sizeText(each);
+    return "update   " + printable(each.identifier) + " " + versionText(each.oldVersion) + " -> " +
+           versionText(each.newVersion) + " " + sizeText(each);
 }
 
 std::size_t packagesToSend(const SyncPlan& plan) {

@@ -3,7 +3,9 @@
 #include <algorithm>
 #include <array>
 #include <cstdio>
+#include <map>
 #include <ostream>
+#include <string_view>
 
 #include "host/console/Console.h"
 #include "host/console/Text.h"
@@ -45,12 +47,40 @@ std::string stateText(const SyncEvent& event) {
            ")";
 }
 
+// "com.a, com.b"; on a terminal the first few, and how many more.
+std::string enumerated(const std::vector<std::string>& identifiers, bool isForTerminal) {
+    constexpr std::size_t kMost = 5;
+    const std::size_t shown =
+        isForTerminal ? std::min(identifiers.size(), kMost) : identifiers.size();
+    std::string text;
+    for (std::size_t index = 0; index < shown; ++index) {
+        const std::string& name = identifiers[index];
+        text += (index == 0 ? "" : ", ") + (name.empty() ? "''" : name);
+    }
+    if (identifiers.size() == shown) return text;
+    return text + " and " + std::to_string(identifiers.size() - shown) + " more";
+}
+
 class ConsoleDisplay : public SyncDisplay {
   public:
     explicit ConsoleDisplay(const Console& console) : console_(console) {}
     void complain(std::string_view text) override { console_.complain(text); }
 
   protected:
+    // Errors are no part of the output. One line for each, whatever it befell.
+    void complainOfFailures(const SyncSummary& summary) const {
+        std::map<std::string_view, std::vector<std::string>> befallen;
+        for (const SyncFailure& each : summary.failed) {
+            befallen[each.error].push_back(each.identifier);
+        }
+        for (const SyncFailure& each : summary.failed) {
+            const auto found = befallen.find(each.error);
+            if (found == befallen.end()) continue;
+            console_.complain(enumerated(found->second, console_.isTerminal) + ": " + each.error);
+            befallen.erase(found);
+        }
+    }
+
     const Console& console_;
 };
 
@@ -64,7 +94,8 @@ class LineDisplay : public ConsoleDisplay {
     }
 
     void finish(const SyncSummary& summary) override {
-        console_.out << summaryText(summary) << std::flush;
+        console_.out << summaryText(summary, console_.isTerminal) << std::flush;
+        complainOfFailures(summary);
     }
 };
 
@@ -98,7 +129,8 @@ class BarDisplay : public ConsoleDisplay {
 
     void finish(const SyncSummary& summary) override {
         erase();
-        console_.out << summaryText(summary) << std::flush;
+        console_.out << summaryText(summary, console_.isTerminal) << std::flush;
+        complainOfFailures(summary);
     }
 
   private:
@@ -131,6 +163,7 @@ class JsonDisplay : public ConsoleDisplay {
     void show(const SyncEvent&) override {}
     void finish(const SyncSummary& summary) override {
         console_.out << jsonText(summary, JsonLayout::Indented) << '\n' << std::flush;
+        complainOfFailures(summary);
     }
 };
 
@@ -142,17 +175,21 @@ class JsonLinesDisplay : public ConsoleDisplay {
     }
     void finish(const SyncSummary& summary) override {
         console_.out << jsonText(summary, JsonLayout::EventLine) << '\n' << std::flush;
+        complainOfFailures(summary);
     }
 };
 
-std::string listed(const char* title, const std::vector<std::string>& identifiers) {
+std::string listed(const char* title, const std::vector<std::string>& identifiers,
+                   bool isForTerminal) {
     if (identifiers.empty()) return {};
     std::string text = std::string(title) + " " + std::to_string(identifiers.size()) + ":";
     constexpr std::size_t kMost = 20;
-    for (std::size_t index = 0; index < std::min(identifiers.size(), kMost); ++index) {
+    const std::size_t shown =
+        isForTerminal ? std::min(identifiers.size(), kMost) : identifiers.size();
+    for (std::size_t index = 0; index < shown; ++index) {
         text += " " + printable(identifiers[index]);
     }
-    if (identifiers.size() > kMost) text += " ...";
+    if (identifiers.size() > shown) text += " ...";
     return text + "\n";
 }
 
@@ -223,15 +260,16 @@ std::string eventBar(const SyncEvent& event, std::size_t width) {
     return fitted(name, std::min(width - taken, kNameWidth)) + " " + shortest;
 }
 
-std::string summaryText(const SyncSummary& summary) {
-    std::string text = listed("Installed", summary.installed) + listed("Updated", summary.updated) +
-                       listed("Removed", summary.removed);
+std::string summaryText(const SyncSummary& summary, bool isForTerminal) {
+    std::string text = listed("Installed", summary.installed, isForTerminal) +
+                       listed("Updated", summary.updated, isForTerminal) +
+                       listed("Removed", summary.removed, isForTerminal);
     for (const PlannedSkip& skip : summary.skipped) {
         text += "Skipped " + printable(skip.identifier) + ": " + printable(skip.why) + "\n";
     }
-    for (const SyncFailure& failed : summary.failed) {
-        text += "Failed " + printable(failed.identifier) + ": " + printable(failed.error) + "\n";
-    }
+    std::vector<std::string> failed;
+    for (const SyncFailure& each : summary.failed) failed.push_back(each.identifier);
+    text += listed("Failed", failed, isForTerminal);
     if (text.empty() && summary.requested.empty()) return "Nothing to do: all is in step.\n";
     return text + amountLine(summary);
 }

@@ -32,7 +32,8 @@ enum class SyncDisplayKind { Text, Json, JsonLines };
 /// The bar of an event, at most `width` characters.
 [[nodiscard]] std::string eventBar(const SyncEvent& event, std::size_t width);
 
-/// What came of a session, for people; ends with a line end.
-[[nodiscard]] std::string summaryText(const SyncSummary& summary);
+/// What came of a session, for people; ends with a line end. How many failed, but not why: errors
+/// go to the error stream. On a terminal long lists are cut.
+[[nodiscard]] std::string summaryText(const SyncSummary& summary, bool isForTerminal = false);
 
 }  // namespace appsync

@@ -135,7 +135,7 @@ std::optional<AwaitedThing> awaitedThing(const std::string& identifier,
 }
 
 std::string versionText(const ApplicationRecord& record) {
-    return record.version ? " " + printable(*record.version) : "";
+    return record.version ? " " + printable(*record.version) : " without a version";
 }
 
 std::string stateSentence(const ApplicationStatus& status) {
@@ -147,7 +147,7 @@ std::string stateSentence(const ApplicationStatus& status) {
     }
     if (status.isRunning) text += " and is running";
     if (status.uninstalled) {
-        text += "; a person removed it at " + formatTime(*status.uninstalled);
+        text += "; a person removed it at " + formatLocalTime(*status.uninstalled);
     }
     return text;
 }

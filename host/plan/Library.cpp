@@ -18,8 +18,8 @@ bool comesBefore(const LibraryPackage& left, const LibraryPackage& right) {
 }
 
 std::string hiddenNote(const LibraryPackage& hidden, const LibraryPackage& kept) {
-    return hidden.file + " is left out: " + kept.file + " holds " + kept.identifier + " " +
-           kept.version + " too";
+    return hidden.file + " is left out: it holds " + hidden.identifier + " " + hidden.version +
+           ", and " + kept.file + " " + kept.version;
 }
 
 }  // namespace

@@ -13,6 +13,7 @@
 #include "host/file/HostFile.h"
 #include "host/plan/TransferError.h"
 #include "platform/PropertyListSerialization.h"
+#include "system/PosixError.h"
 
 namespace appsync {
 namespace {
@@ -37,7 +38,7 @@ Result<std::vector<std::string>> packageFiles(const std::string& folder) {
         if (isPackageName(name)) names.push_back(name);
     }
     if (code) {
-        return unusable("cannot read the library " + folder + ": " + code.message(),
+        return unusable("cannot read the library " + displayPath(folder) + ": " + code.message(),
                         "name a folder of packages");
     }
     std::sort(names.begin(), names.end());
@@ -96,13 +97,27 @@ void addPackage(const PackageReader& package, const std::string& name, const std
     packages.push_back(std::move(described));
 }
 
+// ID.zip, or the first of that name but for the case of its end.
+std::optional<std::string> fileNamedFor(const std::string& folder, const std::string& identifier) {
+    std::string plain = folder + "/" + identifier + ".zip";
+    std::error_code code;
+    if (std::filesystem::exists(plain, code)) return plain;
+    const Result<std::vector<std::string>> names = packageFiles(folder);
+    if (!names) return std::nullopt;
+    for (const std::string& name : *names) {
+        const bool isNamedSo = name.size() == identifier.size() + 4 && name.starts_with(identifier);
+        if (isNamedSo) return folder + "/" + name;
+    }
+    return std::nullopt;
+}
+
 }  // namespace
 
 Result<std::string> packageFileFor(const Library& library, const std::string& identifier) {
     if (const LibraryPackage* package = library.find(identifier)) return package->file;
-    std::string file = library.folder + "/" + identifier + ".zip";
-    std::error_code code;
-    if (std::filesystem::exists(file, code)) return file;
+    if (std::optional<std::string> file = fileNamedFor(library.folder, identifier)) {
+        return *std::move(file);
+    }
     return ErrorRecord::make(
         kTransferErrorDomain, kTransferNoPackage,
         "the library has no package of " + identifier + ": put one into " + library.folder);

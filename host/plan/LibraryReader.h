@@ -21,7 +21,7 @@ inline constexpr std::string_view kIconOrderFile = "IconOrder.plist";
                                           PropertyListSerialization& propertyLists);
 
 /// The file that a session sends for an identifier: the library's package of it, else the file
-/// ID.zip, which the device then judges.
+/// ID.zip (or ID.ZIP), which the device then judges.
 [[nodiscard]] Result<std::string> packageFileFor(const Library& library,
                                                  const std::string& identifier);
 

@@ -234,6 +234,12 @@ SyncSummary summarizeInterrupted(const SyncPlan& plan, const SessionFacts& facts
     return summarize(plan, facts, aftermath);
 }
 
+bool tellsOfInterruption(const SyncSummary& summary) {
+    return std::any_of(summary.failed.begin(), summary.failed.end(), [](const SyncFailure& each) {
+        return each.error.starts_with(interruption());
+    });
+}
+
 SyncSummary summarizeRefused(const SyncPlan& allowed, const std::string& reason) {
     SyncSummary summary;
     summary.failed = allowed.failed;
@@ -244,7 +250,7 @@ SyncSummary summarizeRefused(const SyncPlan& allowed, const std::string& reason)
         }
     }
     for (const std::string& identifier : allowed.remove) {
-        summary.failed.push_back({identifier, "nothing is done: " + reason});
+        summary.failed.push_back({identifier, reason});
     }
     return summary;
 }

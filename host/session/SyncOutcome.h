@@ -48,6 +48,8 @@ struct SessionAftermath {
 
 /// It is left in its middle, or before it began.
 [[nodiscard]] SyncSummary summarizeInterrupted(const SyncPlan& plan, const SessionFacts& facts);
+/// Whether one of its failures says already that the session was interrupted.
+[[nodiscard]] bool tellsOfInterruption(const SyncSummary& summary);
 /// Nothing of what policy would allow is done, for one reason.
 [[nodiscard]] SyncSummary summarizeRefused(const SyncPlan& allowed, const std::string& reason);
 /// The device cannot be looked at any more.

@@ -42,8 +42,8 @@ TEST_P(WrongCommandLine, IsRefusedWithOneLineAndStatus2) {
 INSTANTIATE_TEST_SUITE_P(
     Usage, WrongCommandLine,
     testing::Values(
-        WrongUsage{{}, "subcommand"}, WrongUsage{{"dance"}, "dance"},
-        WrongUsage{{"sync", "device"}, "LIBRARY"},
+        WrongUsage{{}, "appsync needs a command: see appsync --help"},
+        WrongUsage{{"dance"}, "dance"}, WrongUsage{{"sync", "device"}, "LIBRARY"},
         WrongUsage{{"sync", "device", "library", "--json", "--json-lines"}, "--json"},
         WrongUsage{{"sync", "device", "library", "--staged", "--mirror"}, "--staged"},
         WrongUsage{{"sync", "device", "library", "--remove", "a/b"}, "--remove a/b is not"},
@@ -64,10 +64,26 @@ INSTANTIATE_TEST_SUITE_P(
         WrongUsage{{"coordinator", "device", "cancel", "a/b"}, "a/b is not an identifier"},
         WrongUsage{{"log", "device", "--level", "loud"}, "loud"},
         WrongUsage{{"send", "device", "com.a", "file", "--parts", "2"}, "without --restore"},
-        WrongUsage{{"send", "device", "com.a", "file", "--restore", "--parts", "4"}, "4"},
+        WrongUsage{{"send", "device", "com.a", "file", "--restore", "--parts", "4"},
+                   "--parts: 4 is no whole number from 1 to 3: see appsync send --help"},
         WrongUsage{{"coordinator", "device", "dance"}, "dance"},
         WrongUsage{{"plist", "convert", "file", "--to", "json"},
                    "--to: json is none of xml, binary"},
+        WrongUsage{{"package"}, "appsync package needs a command: see appsync package --help"},
+        WrongUsage{{"log", "device", "--category", "x"},
+                   "--category: x is no whole number from 0 to 1000000: see appsync log --help"},
+        WrongUsage{{"log", "device", "--category", ""}, "--category: '' is no whole number"},
+        WrongUsage{{"coordinator", "device", "create", "com.a", "--client", "0"},
+                   "--client: 0 is no whole number from 1 to 1000000"},
+        WrongUsage{{"restore", "device", "backup", "--type", "two"},
+                   "--type: two is no whole number: see appsync restore --help"},
+        WrongUsage{{"demote", "device", "com.a", "--by"},
+                   "--by needs a value: see appsync demote --help"},
+        WrongUsage{{"sync", "device", "library", "--version"},
+                   "--version is not an option of appsync sync: see appsync sync --help"},
+        WrongUsage{{"set", "device", ""}, "there is no setting ''"},
+        WrongUsage{{"set", "device", "removal="}, "removal cannot be '': use yes, no or unset"},
+        WrongUsage{{"plist", "convert", "-", "--to", "xml", "--json"}, "name one with --out"},
         WrongUsage{{"plist", "convert", "file", "--to", "0"}, "--to: 0 is none of xml, binary"},
         WrongUsage{{"log", "device", "--level", "2"}, "2 is none of debug, info, default"},
         WrongUsage{{"demote", "device", "com.a", "--by", "me"}, "me is none of person, system"},
@@ -98,6 +114,8 @@ TEST_P(EachCommand, HasHelp) {
     EXPECT_EQ(run(arguments), 0);
     EXPECT_THAT(out.str(), HasSubstr("Usage: "));
     EXPECT_EQ(err.str(), "");
+    std::istringstream lines(out.str());
+    for (std::string line; std::getline(lines, line);) EXPECT_LT(line.size(), 80U) << line;
 }
 
 INSTANTIATE_TEST_SUITE_P(Help, EachCommand,

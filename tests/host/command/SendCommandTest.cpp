@@ -1,3 +1,4 @@
+#include <algorithm>
 #include <filesystem>
 
 #include "tests/host/HostFixture.h"
@@ -100,6 +101,7 @@ TEST_F(SendCommand, IsRefusedWhereInstallingIsForbidden) {
     EXPECT_EQ(run({"set", device, "installation=no"}), 0);
     EXPECT_EQ(run({"send", device, "com.a", library + "/com.a.zip", "--json"}), 1);
     EXPECT_THAT(err.str(), HasSubstr("policy does not allow installing"));
+    EXPECT_EQ(std::ranges::count(err.str(), '\n'), 1) << "it is told once: " << err.str();
     EXPECT_THAT(out.str(), HasSubstr("\"identifier\": \"com.a\""));
     EXPECT_THAT(applications(), IsEmpty());
 }

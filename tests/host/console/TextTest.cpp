@@ -2,6 +2,9 @@
 
 #include <gtest/gtest.h>
 
+#include <cstdlib>
+#include <ctime>
+
 #include "host/console/Table.h"
 
 namespace appsync {
@@ -61,11 +64,47 @@ TEST(Printable, ReplacesWhatIsNoCharacter) {
     EXPECT_EQ(printable("\xf4\x90\x80\x80"), "?");  // behind the last one
 }
 
-TEST(Table, CutsAColumnThatHasALimit) {
-    Table table({"A", "B"});
-    table.add({std::string(300, 'x'), "y"});
-    table.limit({4});
-    EXPECT_EQ(table.text(), "A     B\nxxx~  y\n");
+TEST(Table, CutsTheWidestColumnsWhereItMustFit) {
+    Table table({"A", "B", "C"});
+    table.add({std::string(300, 'x'), "y", std::string(20, 'z')});
+    table.fitInto(17);
+    EXPECT_EQ(table.text(), "A       B  C\nxxxxx~  y  zzzzz~\n");
+    table.fitInto(1);
+    EXPECT_EQ(table.text(), "A     B  C\nxxx~  y  zzz~\n") << "no cell is cut to nothing";
+}
+
+class LocalTime : public testing::Test {
+  protected:
+    LocalTime() { setZone("XYZ-5:30"); }
+    ~LocalTime() override { setZone(nullptr); }
+    LocalTime(const LocalTime&) = delete;
+    LocalTime& operator=(const LocalTime&) = delete;
+
+    static void setZone(const char* zone) {
+        if (zone != nullptr) {
+            ::setenv("TZ", zone, 1);
+        } else {
+            ::unsetenv("TZ");
+        }
+        ::tzset();
+    }
+};
+
+TEST_F(LocalTime, IsTheMachinesWithItsOffset) {
+    const std::chrono::system_clock::time_point time{std::chrono::seconds{1'700'000'000}};
+    EXPECT_EQ(formatTime(time), "2023-11-14T22:13:20Z");
+    EXPECT_EQ(formatLocalTime(time), "2023-11-15 03:43:20 +0530");
+    EXPECT_EQ(formatClock(time), "03:43:20 +0530");
+}
+
+TEST_F(LocalTime, OfWhatIsWrittenDownKeepsTheFraction) {
+    EXPECT_EQ(localTimeOf("2023-11-14T22:13:20Z"), "2023-11-15 03:43:20 +0530");
+    EXPECT_EQ(localTimeOf("2023-11-14T22:13:20.123456Z"), "2023-11-15 03:43:20.123456 +0530");
+    for (const char* other : {"", "yesterday", "2023-11-14T22:13:20", "2023-11-14T22:13:20.Z",
+                              "2023-11-14T22:13:20+01:00", "2023-99-14T22:13:20Z"}) {
+        EXPECT_EQ(localTimeOf(other), other);
+    }
+    EXPECT_EQ(localTimeOf("\x1b[2J"), "?[2J");
 }
 
 }  // namespace

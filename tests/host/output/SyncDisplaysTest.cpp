@@ -85,7 +85,8 @@ TEST_F(SyncDisplays, PrintsOneObjectPerEventAndTheSummaryLast) {
     EXPECT_EQ(text,
               R"({"event":"waiting","phase":"install","identifier":"com.example.atlas","done":0,)"
               R"("total":1024,"state":"waiting","nextTry":"2023-11-14T22:13:20Z",)"
-              R"("waitsFor":"it is running"})"
+              R"("waitsFor":{"what":"termination","who":"com.example.atlas",)"
+              R"("nextTry":"2023-11-14T22:13:20Z","promise":null}})"
               "\n"
               R"({"event":"summary","requested":["com.example.atlas"],"installed":[],"updated":[],)"
               R"("removed":[],"failed":[{"identifier":"com.example.atlas","error":"damaged"}],)"
@@ -108,12 +109,33 @@ TEST_F(SyncDisplays, SaysWhenNothingWasToDo) {
     EXPECT_EQ(summaryText(summary), "Nothing to do: all is in step.\n");
 }
 
-TEST_F(SyncDisplays, NamesEachFailureInTheSummary) {
+TEST_F(SyncDisplays, TellsEachErrorOnceOnTheErrorStreamAndNamesWhatFailedInTheSummary) {
     summary.requested = {"com.a"};
-    summary.failed.push_back({"com.a", "damaged"});
+    summary.failed = {{"com.a", "damaged"}, {"com.c", "lost"}, {"com.d", "damaged"}};
     summary.skipped.push_back({"com.b", "offloaded", true});
-    EXPECT_THAT(summaryText(summary), HasSubstr("Failed com.a: damaged\n"));
+    for (const auto kind :
+         {SyncDisplayKind::Text, SyncDisplayKind::Json, SyncDisplayKind::JsonLines}) {
+        err.str("");
+        shown(kind, {});
+        EXPECT_EQ(err.str(), "appsync: com.a, com.d: damaged\nappsync: com.c: lost\n");
+    }
+    EXPECT_THAT(summaryText(summary), HasSubstr("Failed 3: com.a com.c com.d\n"));
     EXPECT_THAT(summaryText(summary), HasSubstr("Skipped com.b: offloaded\n"));
+}
+
+TEST_F(SyncDisplays, OnlyATerminalGetsTheBeginningOfALongList) {
+    for (int number = 0; number < 30; ++number) {
+        const std::string identifier = "com.n" + std::to_string(number);
+        summary.installed.push_back(identifier);
+        summary.failed.push_back({identifier, "lost"});
+    }
+    EXPECT_THAT(shown(SyncDisplayKind::Text, {}), HasSubstr("com.n28 com.n29\n"));
+    EXPECT_THAT(err.str(), HasSubstr("com.n28, com.n29: lost\n"));
+    out.str("");
+    err.str("");
+    console.isTerminal = true;
+    EXPECT_THAT(shown(SyncDisplayKind::Text, {}), HasSubstr("com.n19 ...\n"));
+    EXPECT_THAT(err.str(), HasSubstr("com.n4 and 25 more: lost\n"));
 }
 
 TEST_F(SyncDisplays, ANoticeStandsAboveTheBars) {

@@ -19,7 +19,8 @@ TEST(Library, KeepsTheHighestOfSeveralVersionsAndNamesTheOthers) {
     ASSERT_EQ(kept.size(), 2U);
     EXPECT_EQ(kept[0].file, "a-1.10.zip");
     EXPECT_EQ(kept[1].file, "b.zip");
-    EXPECT_THAT(notes, testing::ElementsAre(testing::HasSubstr("a-1.9.zip is left out")));
+    EXPECT_THAT(notes, testing::ElementsAre("a-1.9.zip is left out: it holds com.a 1.9, and "
+                                            "a-1.10.zip 1.10"));
 }
 
 TEST(Library, KeepsTheFirstFileOfEqualVersions) {
