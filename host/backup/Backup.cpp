@@ -143,8 +143,12 @@ std::optional<std::string> identifierOfData(std::string_view file) {
 }
 
 bool isBackup(const std::string& folder) {
-    std::error_code code;
-    return fs::exists(fs::symlink_status(fs::path(folder) / kBackupManifest, code));
+    const std::string unfinished = std::string(kBackupManifest) + ".part";
+    const auto holds = [&](std::string_view name) {
+        std::error_code code;
+        return fs::exists(fs::symlink_status(fs::path(folder) / name, code));
+    };
+    return holds(kBackupManifest) || holds(unfinished) || holds(kBackupRestoreInfo);
 }
 
 Result<BackupManifest> readBackupManifest(const std::string& backup) {

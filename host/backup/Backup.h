@@ -61,7 +61,8 @@ struct BackupFault {
 /// Whose archive the file is; nothing when it is none.
 [[nodiscard]] std::optional<std::string> identifierOfData(std::string_view file);
 
-/// Whether the folder holds a manifest, whatever that is: else it is no backup.
+/// Whether the folder holds a backup, be it cut off or without its manifest: with nothing of one it
+/// is something else.
 [[nodiscard]] bool isBackup(const std::string& folder);
 
 /// Reads the manifest. Without a good one, a folder is no backup that can be used: the error says

@@ -219,7 +219,7 @@ std::vector<std::string> waitStates(const SyncEvent& event) {
     if (!event.nextTry) return {"waiting: " + what, "waiting"};
     const std::string time = formatClock(*event.nextTry);
     return {"waiting: " + what + "; next try at " + time, what + "; next try " + time,
-            "next try " + time, time};
+            "next try " + time, time, time.substr(0, time.find(' '))};
 }
 
 // What may stand behind the name, from the longest text to the shortest.

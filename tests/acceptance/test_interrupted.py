@@ -209,8 +209,9 @@ def test_a_stop_is_announced_at_once(waiting_sync):
     line = sync.stderr.readline()
     assert "stopping" in line and "second Ctrl-C" in line
     assert sync.poll() is None
-    out, _ = sync.communicate(timeout=60)
-    assert "Failed com.example.app00: interrupted" in out
+    out, err = sync.communicate(timeout=60)
+    assert "Failed 1: com.example.app00" in out
+    assert "appsync: com.example.app00: interrupted: run the same command again" in err
     assert sync.returncode == 1
 
 

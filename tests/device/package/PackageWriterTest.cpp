@@ -63,12 +63,17 @@ TEST_F(PackageWriterTest, theSameFilesGiveTheSamePackage) {
     EXPECT_EQ(read("out.zip"), first);
 }
 
-TEST_F(PackageWriterTest, theBundleItselfCanBePacked) {
+TEST_F(PackageWriterTest, theBundleItselfCanBePackedWithItsNeighbour) {
     makeAtlas();
+    write("atlas/unrelated", "stays here");
     const Result<PackageInfo> info = pack("atlas/Atlas.app");
     ASSERT_TRUE(info.ok()) << info.error().description();
     EXPECT_EQ(info->bundleDirectoryName, "Atlas.app");
-    EXPECT_FALSE(info->hasStoreMetadata);
+    EXPECT_TRUE(info->hasStoreMetadata);
+    fs::remove(path("atlas/VessikMetadata.plist"));
+    const Result<PackageInfo> alone = pack("atlas/Atlas.app");
+    ASSERT_TRUE(alone.ok()) << alone.error().description();
+    EXPECT_FALSE(alone->hasStoreMetadata);
 }
 
 TEST_F(PackageWriterTest, leavesNothingBesideThePackage) {

@@ -164,10 +164,12 @@ TEST_F(SyncDisplays, EightyColumnsHoldWhatRunsAndWhenTheNextTryComes) {
 }
 
 TEST_F(SyncDisplays, TheNextTryIsTheLastThatANarrowLineLoses) {
+    const std::string time = formatClock(kNextTry);
     for (std::size_t width = 8; width < 100; ++width) {
         const std::string line = eventBar(waitingForItself(), width);
         EXPECT_LE(displayWidth(line), width);
-        EXPECT_THAT(line, testing::EndsWith(formatClock(kNextTry)));
+        EXPECT_THAT(line,
+                    testing::AnyOf(testing::EndsWith(time), testing::EndsWith(time.substr(0, 8))));
     }
 }
 
