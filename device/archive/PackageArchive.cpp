@@ -79,11 +79,14 @@ Result<Bytes> PackageArchive::read(const PackageEntry& entry, std::uint64_t maxi
     return contents;
 }
 
-Status PackageArchive::verify() {
+Status PackageArchive::verify(const std::function<void(std::uint64_t bytes)>& progress) {
     Bytes piece(kReadBytes);
     for (const PackageEntry& entry : entries_) {
         if (entry.isDirectory) continue;
-        Status status = stream(entry, piece, [](ByteView) { return Status(); });
+        Status status = stream(entry, piece, [&](ByteView read) {
+            if (progress) progress(read.size());
+            return Status();
+        });
         if (!status) return status;
     }
     return {};

@@ -52,8 +52,9 @@ class PackageArchive {
     /// The contents of a file that is at most `maximumBytes` long.
     [[nodiscard]] Result<Bytes> read(const PackageEntry& entry, std::uint64_t maximumBytes);
 
-    /// Reads the contents of every file as an unpacking does, in pieces that nobody gets.
-    [[nodiscard]] Status verify();
+    /// Reads the contents of every file as an unpacking does, in pieces that nobody gets. Calls
+    /// `progress`, which may be empty, with the size of each.
+    [[nodiscard]] Status verify(const std::function<void(std::uint64_t bytes)>& progress = {});
 
     /// The error with what it is about before it: the package.
     [[nodiscard]] ErrorRecord named(const ErrorRecord& error) const;

@@ -94,8 +94,8 @@ Status PackageReader::expectIdentifier(std::string_view identifier) const {
                          ", which was asked for; send the package of that application"));
 }
 
-Status PackageReader::verify() {
-    const Status verified = archive_->verify();
+Status PackageReader::verify(const std::function<void(std::uint64_t bytes)>& progress) {
+    const Status verified = archive_->verify(progress);
     return verified ? verified : Status(archive_->named(verified.error()));
 }
 

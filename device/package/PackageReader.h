@@ -105,7 +105,8 @@ class PackageReader {
     [[nodiscard]] Status expectIdentifier(std::string_view identifier) const;
 
     /// Reads all the contents, in pieces, without unpacking them: refuses what `unpackInto` would.
-    [[nodiscard]] Status verify();
+    /// Calls `progress`, which may be empty, with the size of each piece.
+    [[nodiscard]] Status verify(const std::function<void(std::uint64_t bytes)>& progress = {});
 
     /// The contents of VessikMetadata.plist as they stand in the package (not parsed).
     /// `NoSuchEntry` when there is none.

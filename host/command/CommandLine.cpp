@@ -557,6 +557,35 @@ class Commands {
                                 });
         show.add_option("FILE", shown->file, "the package")->required();
         show.add_flag("--json", shown->asJson, "print JSON");
+        addPackageList(parent);
+        addPackageVerify(parent);
+    }
+
+    void addPackageList(CLI::App& parent) {
+        const auto values = std::make_shared<FileValues>();
+        CLI::App& added =
+            command<FileValues>(parent, "list", "List the packages of a folder", values,
+                                [this](const FileValues& parsed) {
+                                    return runPackageList(parsed.file, parsed.asJson, console_);
+                                });
+        added.add_option("FOLDER", values->file, "the folder of packages")->required();
+        added.add_flag("--json", values->asJson, "print JSON");
+    }
+
+    struct VerifyValues {
+        std::vector<std::string> paths;
+        bool asJson = false;
+    };
+
+    void addPackageVerify(CLI::App& parent) {
+        const auto values = std::make_shared<VerifyValues>();
+        CLI::App& added = command<VerifyValues>(
+            parent, "verify", "Check all that an install would, without a device", values,
+            [this](const VerifyValues& parsed) {
+                return runPackageVerify(parsed.paths, parsed.asJson, console_);
+            });
+        added.add_option("FILE", values->paths, "packages, and folders of packages")->required();
+        added.add_flag("--json", values->asJson, "print JSON");
     }
 
     void addPropertyList() {

@@ -147,11 +147,15 @@ struct RestoreArguments {
 };
 [[nodiscard]] int runRestore(const RestoreArguments& arguments, const Console& console);
 
-// Files of this machine: PackageCommand.cpp, PropertyListCommand.cpp
+// Files of this machine: PackageCommand.cpp, PackageCheckCommand.cpp (list and verify),
+// PropertyListCommand.cpp
 
 [[nodiscard]] int runPackageMake(const std::string& folder, const std::string& package, bool asJson,
                                  const Console& console);
 [[nodiscard]] int runPackageShow(const std::string& package, bool asJson, const Console& console);
+[[nodiscard]] int runPackageList(const std::string& folder, bool asJson, const Console& console);
+[[nodiscard]] int runPackageVerify(const std::vector<std::string>& paths, bool asJson,
+                                   const Console& console);
 [[nodiscard]] int runPropertyListShow(const std::string& file, bool asJson, const Console& console);
 
 struct ConvertArguments {

@@ -29,7 +29,38 @@ bool isPackageName(const std::string& name) {
     });
 }
 
-Result<std::vector<std::string>> packageFiles(const std::string& folder) {
+LibraryPackage packageOf(const PackageInfo& info, std::string file) {
+    return {info.identifier, info.version,     info.displayName,
+            std::move(file), info.packedBytes, bytesOnDevice(info)};
+}
+
+std::string iconOrderProblem(const PropertyList& order) {
+    if (!order.isArray()) return "it is not a list of bundle identifiers";
+    const auto elements = order.elements();
+    const bool strings = std::all_of(elements.begin(), elements.end(),
+                                     [](const PropertyList& each) { return each.isString(); });
+    return strings ? "" : "it holds something that is not a bundle identifier";
+}
+
+// The files of a staging area stand beside the directories that are named by applications.
+bool isStagingFileName(std::string_view identifier) {
+    constexpr std::array<std::string_view, 4> names = {
+        "ApplicationsSync.plist", "ApplicationsSync.plist-debug.plist", "AssetSortOrder.plist",
+        "DeskoraIconState.plist"};
+    return std::find(names.begin(), names.end(), identifier) != names.end();
+}
+
+Result<LibraryPackage> describedPackage(const PackageReader& package, const std::string& file) {
+    LibraryPackage described = packageOf(package.info(), file);
+    if (!isStagingFileName(described.identifier)) return described;
+    return failure(
+        "the device keeps a file under the name " + described.identifier + " when it syncs",
+        "give the application another identifier");
+}
+
+}  // namespace
+
+Result<std::vector<std::string>> packageNamesIn(const std::string& folder) {
     std::error_code code;
     std::vector<std::string> names;
     std::filesystem::directory_iterator iterator(folder, code);
@@ -45,64 +76,47 @@ Result<std::vector<std::string>> packageFiles(const std::string& folder) {
     return names;
 }
 
-LibraryPackage packageOf(const PackageInfo& info, std::string file) {
-    return {info.identifier, info.version,     info.displayName,
-            std::move(file), info.packedBytes, bytesOnDevice(info)};
-}
-
-std::string iconOrderProblem(const PropertyList& order) {
-    if (!order.isArray()) return "it is not a list of bundle identifiers";
-    const auto elements = order.elements();
-    const bool strings = std::all_of(elements.begin(), elements.end(),
-                                     [](const PropertyList& each) { return each.isString(); });
-    return strings ? "" : "it holds something that is not a bundle identifier";
-}
-
-void readIconOrder(Library& library, PropertyListSerialization& propertyLists) {
-    const std::string name(kIconOrderFile);
-    const std::string path = library.folder + "/" + name;
+Result<std::optional<Bytes>> readIconOrder(const std::string& folder,
+                                           PropertyListSerialization& propertyLists) {
+    const std::string path = folder + "/" + std::string(kIconOrderFile);
     std::error_code code;
-    if (!std::filesystem::exists(path, code) && !code) return;
+    if (!std::filesystem::exists(path, code) && !code) return std::optional<Bytes>();
     Result<Bytes> bytes = readHostFile(path, kMaximumIconOrderBytes);
-    if (!bytes) {
-        library.faults.push_back({name, bytes.error().description()});
-        return;
-    }
+    if (!bytes) return bytes.error();
     const Result<PropertyList> order = propertyLists.parse(*bytes);
     const std::string problem =
         order ? iconOrderProblem(*order) : order.error().withContext(path).description();
-    if (problem.empty()) {
-        library.iconOrder = *std::move(bytes);
-    } else {
-        library.faults.push_back({name, problem + "; correct it, or remove it"});
-    }
+    if (problem.empty()) return std::optional<Bytes>(*std::move(bytes));
+    return ErrorRecord::make(kPropertyListErrorDomain, 0, problem + "; correct it, or remove it");
 }
 
-// The files of a staging area stand beside the directories that are named by applications.
-bool isStagingFileName(std::string_view identifier) {
-    constexpr std::array<std::string_view, 4> names = {
-        "ApplicationsSync.plist", "ApplicationsSync.plist-debug.plist", "AssetSortOrder.plist",
-        "DeskoraIconState.plist"};
-    return std::find(names.begin(), names.end(), identifier) != names.end();
+Result<LibraryPackage> readPackage(const std::string& file,
+                                   PropertyListSerialization& propertyLists) {
+    const Result<PackageReader> package = PackageReader::open(file, propertyLists);
+    if (!package) return package.error();
+    return describedPackage(*package, file);
 }
 
-void addPackage(const PackageReader& package, const std::string& name, const std::string& file,
-                std::vector<LibraryPackage>& packages, std::vector<LibraryFault>& faults) {
-    LibraryPackage described = packageOf(package.info(), file);
-    if (isStagingFileName(described.identifier)) {
-        faults.push_back({name, "the device keeps a file under the name " + described.identifier +
-                                    " when it syncs: give the application another identifier"});
-        return;
-    }
-    packages.push_back(std::move(described));
+Result<LibraryPackage> readWholePackage(const std::string& file,
+                                        PropertyListSerialization& propertyLists,
+                                        const std::function<void(std::uint64_t bytes)>& progress) {
+    Result<PackageReader> package = PackageReader::open(file, propertyLists);
+    if (!package) return package.error();
+    Result<LibraryPackage> described = describedPackage(*package, file);
+    if (!described) return described;
+    const Status verified = package->verify(progress);
+    if (!verified) return verified.error();
+    return described;
 }
+
+namespace {
 
 // ID.zip, or the first of that name but for the case of its end.
 std::optional<std::string> fileNamedFor(const std::string& folder, const std::string& identifier) {
     std::string plain = folder + "/" + identifier + ".zip";
     std::error_code code;
     if (std::filesystem::exists(plain, code)) return plain;
-    const Result<std::vector<std::string>> names = packageFiles(folder);
+    const Result<std::vector<std::string>> names = packageNamesIn(folder);
     if (!names) return std::nullopt;
     for (const std::string& name : *names) {
         const bool isNamedSo = name.size() == identifier.size() + 4 && name.starts_with(identifier);
@@ -150,7 +164,7 @@ std::uint64_t bytesOnDevice(const PackageInfo& info) {
 }
 
 Result<Library> readLibrary(const std::string& folder, PropertyListSerialization& propertyLists) {
-    const Result<std::vector<std::string>> names = packageFiles(folder);
+    const Result<std::vector<std::string>> names = packageNamesIn(folder);
     if (!names) return names.error();
     Library library;
     library.folder = folder;
@@ -158,15 +172,20 @@ Result<Library> readLibrary(const std::string& folder, PropertyListSerialization
     for (const std::string& name : *names) {
         std::string file = folder;
         file.append("/").append(name);
-        const Result<PackageReader> package = PackageReader::open(file, propertyLists);
+        Result<LibraryPackage> package = readPackage(file, propertyLists);
         if (package) {
-            addPackage(*package, name, file, packages, library.faults);
+            packages.push_back(*std::move(package));
         } else {
             library.faults.push_back({name, package.error().description()});
         }
     }
     library.packages = keepHighestVersions(std::move(packages), library.notes);
-    readIconOrder(library, propertyLists);
+    Result<std::optional<Bytes>> iconOrder = readIconOrder(folder, propertyLists);
+    if (iconOrder) {
+        library.iconOrder = *std::move(iconOrder);
+    } else {
+        library.faults.push_back({std::string(kIconOrderFile), iconOrder.error().description()});
+    }
     return library;
 }
 

@@ -1,8 +1,11 @@
 #pragma once
 
 #include <cstdint>
+#include <functional>
+#include <optional>
 #include <string>
 #include <string_view>
+#include <vector>
 
 #include "host/plan/Library.h"
 #include "platform/Result.h"
@@ -19,6 +22,26 @@ inline constexpr std::string_view kIconOrderFile = "IconOrder.plist";
 /// layout that cannot be used become faults. An error only when the folder itself cannot be read.
 [[nodiscard]] Result<Library> readLibrary(const std::string& folder,
                                           PropertyListSerialization& propertyLists);
+
+/// The names of the packages in a folder, sorted: every "*.zip" directly in it. An error only when
+/// the folder itself cannot be read.
+[[nodiscard]] Result<std::vector<std::string>> packageNamesIn(const std::string& folder);
+
+/// One package as a library has it, or why no library can use it. What it says of its contents is
+/// taken for true.
+[[nodiscard]] Result<LibraryPackage> readPackage(const std::string& file,
+                                                 PropertyListSerialization& propertyLists);
+
+/// The same, and reads the contents, in pieces: refuses whatever an install would. Calls `progress`
+/// with the size of each piece.
+[[nodiscard]] Result<LibraryPackage> readWholePackage(
+    const std::string& file, PropertyListSerialization& propertyLists,
+    const std::function<void(std::uint64_t bytes)>& progress);
+
+/// The icon layout of a folder of packages; nothing where there is none. An error says why it
+/// cannot be used.
+[[nodiscard]] Result<std::optional<Bytes>> readIconOrder(const std::string& folder,
+                                                         PropertyListSerialization& propertyLists);
 
 /// The file that a session sends for an identifier: the library's package of it, else the file
 /// ID.zip (or ID.ZIP), which the device then judges.

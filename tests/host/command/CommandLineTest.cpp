@@ -123,8 +123,8 @@ INSTANTIATE_TEST_SUITE_P(Help, EachCommand,
                                          "why", "inventory", "set", "run", "quit", "uninstall",
                                          "reset", "log", "history", "coordinator", "demote",
                                          "backup", "restore", "store", "send", "package",
-                                         "package make", "package show", "plist", "plist show",
-                                         "plist convert"));
+                                         "package make", "package show", "package list",
+                                         "package verify", "plist", "plist show", "plist convert"));
 
 TEST_F(CommandLine, HelpShowsTheHelpOfACommand) {
     EXPECT_EQ(run({"help", "package", "make"}), 0);
