@@ -352,6 +352,19 @@ std::string Device::restoreDataPath(const std::string& identifier) {
 
 std::string Device::dataPath(const std::string& identifier) { return dataDirectoryOf(identifier); }
 
+Status Device::checkDataReplaceable(const std::string& identifier) {
+    if (Status status = requireSession(); !status) return status;
+    if (Status status = requireLegalIdentifier(identifier); !status) return status;
+    return appsync::checkDataReplaceable(state_->context, identifier);
+}
+
+Status Device::replaceData(const std::string& identifier,
+                           const std::function<Status(int directory)>& fill) {
+    if (Status status = requireSession(); !status) return status;
+    if (Status status = requireLegalIdentifier(identifier); !status) return status;
+    return replaceDataWith(state_->context, identifier, fill);
+}
+
 Result<std::map<std::string, Bytes>> Device::sinfData() {
     std::map<std::string, Bytes> found;
     const Status status = state_->database->read([&](Database& database) {

@@ -20,6 +20,7 @@
 
 #include <chrono>
 #include <cstdint>
+#include <functional>
 #include <map>
 #include <memory>
 #include <optional>
@@ -199,6 +200,14 @@ class Device {
     [[nodiscard]] static std::string restoreDataPath(const std::string& identifier);
     /// The device path of an application's data.
     [[nodiscard]] static std::string dataPath(const std::string& identifier);
+    /// Refuses where `replaceData` would before it begins.
+    Status checkDataReplaceable(const std::string& identifier);
+    /// Replaces the data of an application by what `fill` puts into an empty directory, whose
+    /// descriptor it gets: all of it, on disk, or on failure nothing. Refused where nothing stands
+    /// under the identifier, while the application runs, and where a restore has left data that
+    /// still waits for the install.
+    Status replaceData(const std::string& identifier,
+                       const std::function<Status(int directory)>& fill);
     /// The SINF data of placeholders that have any, by identifier.
     [[nodiscard]] Result<std::map<std::string, Bytes>> sinfData();
 

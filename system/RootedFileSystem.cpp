@@ -267,6 +267,21 @@ Status RootedFileSystem::moveItem(const std::string& from, const std::string& to
     return {};
 }
 
+Status RootedFileSystem::exchangeItem(const std::string& from, const std::string& to) {
+    if (Status status = checkStays(from, kMove); !status) return status;
+    if (Status status = checkStays(to, kMoveTo); !status) return status;
+    const Result<ItemPlace> source = root_.place(from, kMove);
+    if (!source) return source.error();
+    const Result<ItemPlace> target = root_.place(to, kMoveTo);
+    if (!target) return target.error();
+    if (::renameat2(source->directory.get(), source->name.c_str(), target->directory.get(),
+                    target->name.c_str(), RENAME_EXCHANGE) == 0) {
+        return {};
+    }
+    if (errno == ENOENT) return moveItem(from, to);
+    return posixErrorBetween(errno, "exchange", from, to);
+}
+
 Status RootedFileSystem::copyItem(const std::string& from, const std::string& to) {
     if (Status status = checkStays(to, kCopyTo); !status) return status;
     const Result<RegularFile> source = root_.openRegularFile(from, kCopy);

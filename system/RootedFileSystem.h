@@ -79,6 +79,11 @@ class RootedFileSystem : public FileSystem {
     Status setTimesToNow(const std::string& path) override;
     [[nodiscard]] std::string temporaryDirectory() override;
 
+    /// Puts what stands at `from` in the place of `to`, in one step. What stood there stands at
+    /// `from` afterwards; where nothing did, this is `moveItem`. An error on a file system that
+    /// cannot do it in one step.
+    Status exchangeItem(const std::string& from, const std::string& to);
+
     /// Removes what stands in the directory under the names that `goes` accepts. Refused where a
     /// part of the path is a link. Everything is tried; tells the first failure.
     Status removeContents(const std::string& directory,

@@ -22,15 +22,21 @@ namespace appsync {
 
 namespace {
 
+using PackProgress = std::function<void(std::uint64_t bytes)>;
+
 /// Gives libzip the contents of a file, which is open only while it is packed, and refuses what
 /// became something else since it was listed.
 class FileSource {
   public:
-    explicit FileSource(const PackageItem& item) : item_(item) { ::zip_error_init(&error_); }
+    FileSource(const PackageItem& item, const PackProgress& progress)
+        : item_(item), progress_(progress) {
+        ::zip_error_init(&error_);
+    }
 
     /// A source that owns itself: libzip frees it.
-    static zip_source_t* create(const PackageItem& item, zip_error_t* error) {
-        auto source = std::make_unique<FileSource>(item);
+    static zip_source_t* create(const PackageItem& item, const PackProgress& progress,
+                                zip_error_t* error) {
+        auto source = std::make_unique<FileSource>(item, progress);
         zip_source_t* made = ::zip_source_function_create(&command, source.get(), error);
         if (made != nullptr) static_cast<void>(source.release());
         return made;
@@ -77,7 +83,9 @@ class FileSource {
         do {
             count = ::read(descriptor_.get(), data, length);
         } while (count < 0 && errno == EINTR);
-        return count < 0 ? fail(ZIP_ER_READ, errno) : count;
+        if (count < 0) return fail(ZIP_ER_READ, errno);
+        if (progress_) progress_(static_cast<std::uint64_t>(count));
+        return count;
     }
 
     zip_int64_t stat(void* data) const {
@@ -94,6 +102,7 @@ class FileSource {
     }
 
     PackageItem item_;
+    const PackProgress& progress_;
     UniqueFd descriptor_;
     zip_error_t error_ = {};
 };
@@ -134,11 +143,12 @@ bool setTimes(zip_t* archive, zip_uint64_t place, const PackageItem& item) {
                                       ZIP_FL_LOCAL | ZIP_FL_CENTRAL) == 0;
 }
 
-Status addItem(zip_t* archive, const PackageItem& item) {
+Status addItem(zip_t* archive, const PackageItem& item, const PackProgress& progress) {
     zip_int64_t index = -1;
     if (S_ISDIR(item.mode)) {
         index = ::zip_dir_add(archive, item.entryName.c_str(), ZIP_FL_ENC_UTF_8);
-    } else if (zip_source_t* source = FileSource::create(item, ::zip_get_error(archive))) {
+    } else if (zip_source_t* source =
+                   FileSource::create(item, progress, ::zip_get_error(archive))) {
         index = ::zip_file_add(archive, item.entryName.c_str(), source, ZIP_FL_ENC_UTF_8);
         if (index < 0) ::zip_source_free(source);
     }
@@ -160,7 +170,7 @@ std::string workPathOf(const std::string& path) {
 }
 
 Status writeAt(const std::vector<PackageItem>& items, const std::string& path,
-               const std::string& name) {
+               const std::string& name, const PackProgress& progress) {
     zip_error_t error = {};
     int code = 0;
     Archive archive(::zip_open(path.c_str(), ZIP_CREATE | ZIP_TRUNCATE, &code));
@@ -171,7 +181,7 @@ Status writeAt(const std::vector<PackageItem>& items, const std::string& path,
         return failure;
     }
     for (const PackageItem& item : items) {
-        if (Status status = addItem(archive.get(), item); !status) return status;
+        if (Status status = addItem(archive.get(), item, progress); !status) return status;
     }
     if (::zip_close(archive.get()) != 0)
         return archiveFailure(::zip_get_error(archive.get()), name);
@@ -182,9 +192,9 @@ Status writeAt(const std::vector<PackageItem>& items, const std::string& path,
 }  // namespace
 
 Status writeArchive(const std::vector<PackageItem>& items, const std::string& path,
-                    const std::string& name) {
+                    const std::string& name, const PackProgress& progress) {
     const std::string work = workPathOf(path);
-    Status status = writeAt(items, work, name);
+    Status status = writeAt(items, work, name, progress);
     if (!status || work == path) return status;
     if (::rename(work.c_str(), path.c_str()) == 0) return {};
     const int error = errno;
@@ -193,7 +203,7 @@ Status writeArchive(const std::vector<PackageItem>& items, const std::string& pa
 }
 
 Status writeArchive(const std::vector<PackageItem>& items, const std::string& path) {
-    return writeArchive(items, path, path);
+    return writeArchive(items, path, path, {});
 }
 
 }  // namespace appsync

@@ -64,8 +64,8 @@ bool isOfSource(const ErrorRecord& error) {
 // One backup in the making.
 class BackupMaking {
   public:
-    BackupMaking(Device& device, BackupFolder& folder)
-        : device_(device), folder_(folder), backup_(folder.path()) {}
+    BackupMaking(Device& device, BackupFolder& folder, const BackupProgress& progress)
+        : device_(device), folder_(folder), progress_(progress), backup_(folder.path()) {}
 
     Result<BackupResult> run() {
         Status status = gather();
@@ -191,7 +191,9 @@ class BackupMaking {
             return {};
         }
         Result<DataArchiveContents> contents =
-            writeDataArchive(device_.root(), directory, pathOf(name));
+            writeDataArchive(device_.root(), directory, pathOf(name), [&](std::uint64_t bytes) {
+                if (progress_) progress_(identifier, bytes);
+            });
         if (!contents && isOfSource(contents.error())) {
             ::unlink(pathOf(name).c_str());
             leaveOut(identifier, contents.error().description());
@@ -256,6 +258,7 @@ class BackupMaking {
 
     Device& device_;
     BackupFolder& folder_;
+    const BackupProgress& progress_;
     const std::string backup_;
     std::vector<ApplicationRecord> records_;
     std::vector<std::string> order_;
@@ -265,17 +268,22 @@ class BackupMaking {
 
 }  // namespace
 
-Status checkBackupPlace(const Device& device, const std::string& backup) {
+bool liesInDevice(const Device& device, const std::string& path) {
     std::error_code code;
-    const fs::path folder = fs::weakly_canonical(backup, code);
-    const fs::path inside = folder.lexically_relative(fs::weakly_canonical(device.path(), code));
-    if (code || inside.empty() || *inside.begin() == "..") return {};
+    const fs::path canonical = fs::weakly_canonical(path, code);
+    const fs::path inside = canonical.lexically_relative(fs::weakly_canonical(device.path(), code));
+    return !code && !inside.empty() && *inside.begin() != "..";
+}
+
+Status checkBackupPlace(const Device& device, const std::string& backup) {
+    if (!liesInDevice(device, backup)) return {};
     return unusable(backup + " lies in the device that is to be backed up",
                     "name a folder outside of it");
 }
 
-Result<BackupResult> makeBackup(Device& device, BackupFolder& folder) {
-    return BackupMaking(device, folder).run();
+Result<BackupResult> makeBackup(Device& device, BackupFolder& folder,
+                                const BackupProgress& progress) {
+    return BackupMaking(device, folder, progress).run();
 }
 
 }  // namespace appsync

@@ -1,6 +1,7 @@
 #pragma once
 
 #include <cstdint>
+#include <functional>
 #include <string>
 #include <vector>
 
@@ -28,12 +29,20 @@ struct BackupResult {
     std::uint64_t bytes = 0;
 };
 
+/// Whether a path lies in the directory of the device.
+[[nodiscard]] bool liesInDevice(const Device& device, const std::string& path);
+
 /// Refuses a folder that lies in the device: a backup there would be part of what it backs up.
 [[nodiscard]] Status checkBackupPlace(const Device& device, const std::string& backup);
+
+/// Hears of which application data is packed, and the size of each piece that was read of it. May
+/// be empty.
+using BackupProgress = std::function<void(const std::string& identifier, std::uint64_t bytes)>;
 
 /// Writes what a restore needs of a device into the folder, and finishes it. The device is open for
 /// a session, and the plug-in has prepared it. What of an application's data cannot be read is left
 /// out and named; an error when the backup as a whole does not become one.
-[[nodiscard]] Result<BackupResult> makeBackup(Device& device, BackupFolder& folder);
+[[nodiscard]] Result<BackupResult> makeBackup(Device& device, BackupFolder& folder,
+                                              const BackupProgress& progress = {});
 
 }  // namespace appsync

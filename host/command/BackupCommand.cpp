@@ -15,6 +15,7 @@
 #include "host/console/Console.h"
 #include "host/console/JsonWriting.h"
 #include "host/console/Problem.h"
+#include "host/console/ProgressLine.h"
 #include "host/console/Text.h"
 #include "host/session/PlugIn.h"
 #include "platform/SyncClient.h"
@@ -102,6 +103,16 @@ ErrorRecord unfinished(const std::string& backup, const ErrorRecord& cause) {
                    "mend that and back up again, or remove the folder");
 }
 
+Result<BackupResult> backUpShowingProgress(Device& device, BackupFolder& folder,
+                                           const Console& console) {
+    ProgressLine line(console);
+    std::uint64_t packed = 0;
+    return makeBackup(device, folder, [&](const std::string& identifier, std::uint64_t bytes) {
+        packed += bytes;
+        line.show([&] { return "packed " + formatBytes(packed) + "; now " + identifier; });
+    });
+}
+
 // The backup as a whole is what failed.
 int failWhole(const BackupArguments& arguments, const ErrorRecord& error, const Console& console) {
     if (arguments.asJson) {
@@ -126,7 +137,7 @@ int runBackup(const BackupArguments& arguments, const Console& console) {
     Result<BackupFolder> folder = BackupFolder::make(arguments.backup);
     if (!folder) return console.fail(unusable(folder.error()));
     (*plugIn)->client().prepareForBackup();
-    const Result<BackupResult> result = makeBackup(**device, *folder);
+    const Result<BackupResult> result = backUpShowingProgress(**device, *folder, console);
     if (!result) {
         return failWhole(arguments, unfinished(arguments.backup, result.error()), console);
     }

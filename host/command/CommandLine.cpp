@@ -110,6 +110,7 @@ class Commands {
         addBackup();
         addRestore();
         addPackage();
+        addData();
         addPropertyList();
         app_.add_subcommand("help", "Show the help of a command (= COMMAND --help)");
     }
@@ -586,6 +587,39 @@ class Commands {
             });
         added.add_option("FILE", values->paths, "packages, and folders of packages")->required();
         added.add_flag("--json", values->asJson, "print JSON");
+    }
+
+    void addData() {
+        CLI::App& parent = group("data", "List, copy out or replace an application's data");
+        addDataCommand(parent, "ls", "List what an application's data consists of", runDataList);
+        const auto pulled =
+            addDataCommand(parent, "pull", "Copy an application's data out", runDataPull);
+        pulled.app
+            .add_option("OUT", pulled.values->place, "the folder or the archive (NAME.zip) to make")
+            ->required();
+        const auto pushed =
+            addDataCommand(parent, "push", "Replace an application's data", runDataPush);
+        pushed.app.add_option("FROM", pushed.values->place, "the folder or the archive with it")
+            ->required();
+        pushed.app.add_flag("--yes", pushed.values->yes, "replace data that is there, unasked");
+    }
+
+    struct DataCommand {
+        CLI::App& app;
+        std::shared_ptr<DataArguments> values;
+    };
+
+    DataCommand addDataCommand(CLI::App& parent, const std::string& name,
+                               const std::string& description,
+                               int (*action)(const DataArguments&, const Console&)) {
+        const auto values = std::make_shared<DataArguments>();
+        CLI::App& added = command<DataArguments>(
+            parent, name, description, values,
+            [this, action](const DataArguments& parsed) { return action(parsed, console_); });
+        added.add_option("DEVICE", values->device, "the device's directory")->required();
+        added.add_option("ID", values->identifier, "the application's identifier")->required();
+        added.add_flag("--json", values->asJson, "print JSON");
+        return {added, values};
     }
 
     void addPropertyList() {

@@ -97,6 +97,21 @@ struct ApplicationArguments {
 [[nodiscard]] int runScreen(const std::string& device, const std::string& picture, bool asJson,
                             const Console& console);
 
+// DataCommand.cpp: an application's data.
+
+struct DataArguments {
+    std::string device;
+    std::string identifier;
+    /// The folder or the archive (NAME.zip) that the data goes to, or comes from.
+    std::string place;
+    /// Data that is there may be replaced without asking.
+    bool yes = false;
+    bool asJson = false;
+};
+[[nodiscard]] int runDataList(const DataArguments& arguments, const Console& console);
+[[nodiscard]] int runDataPull(const DataArguments& arguments, const Console& console);
+[[nodiscard]] int runDataPush(const DataArguments& arguments, const Console& console);
+
 // LogCommand.cpp
 
 struct LogArguments {

@@ -96,6 +96,8 @@ INSTANTIATE_TEST_SUITE_P(
         WrongUsage{{"apps"}, "DEVICE is required: see appsync apps --help"},
         WrongUsage{{"package", "make", "folder"},
                    "OUT is required: see appsync package make --help"},
+        WrongUsage{{"data", "pull", "device", "a/b", "out"}, "a/b is not an identifier"},
+        WrongUsage{{"data", "push", "device", "com.a"}, "FROM is required"},
         WrongUsage{{""}, "there is no command ''"},
         WrongUsage{{"help", "dance"}, "there is no command dance"},
         WrongUsage{{"help", "package", "dance"}, "there is no command dance of package"},
@@ -123,8 +125,12 @@ INSTANTIATE_TEST_SUITE_P(Help, EachCommand,
                                          "why", "inventory", "set", "run", "quit", "uninstall",
                                          "reset", "log", "history", "coordinator", "demote",
                                          "backup", "restore", "store", "send", "package",
-                                         "package make", "package show", "package list",
-                                         "package verify", "plist", "plist show", "plist convert"));
+                                         "package make", "package show", "plist", "plist show",
+                                         "plist convert"));
+
+INSTANTIATE_TEST_SUITE_P(HelpWithoutASession, EachCommand,
+                         testing::Values("package list", "package verify", "data", "data ls",
+                                         "data pull", "data push"));
 
 TEST_F(CommandLine, HelpShowsTheHelpOfACommand) {
     EXPECT_EQ(run({"help", "package", "make"}), 0);
