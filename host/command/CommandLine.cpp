@@ -109,6 +109,7 @@ class Commands {
         addCoordination();
         addBackup();
         addRestore();
+        addDiff();
         addPackage();
         addData();
         addPropertyList();
@@ -586,6 +587,24 @@ class Commands {
                 return runPackageVerify(parsed.paths, parsed.asJson, console_);
             });
         added.add_option("FILE", values->paths, "packages, and folders of packages")->required();
+        added.add_flag("--json", values->asJson, "print JSON");
+    }
+
+    struct DiffValues {
+        std::string left;
+        std::string right;
+        bool asJson = false;
+    };
+
+    void addDiff() {
+        const auto values = std::make_shared<DiffValues>();
+        CLI::App& added = command<DiffValues>(
+            app_, "diff", "Compare two devices, backups or libraries", values,
+            [this](const DiffValues& parsed) {
+                return runDiff(parsed.left, parsed.right, parsed.asJson, console_);
+            });
+        added.add_option("LEFT", values->left, "a device, a backup or a library")->required();
+        added.add_option("RIGHT", values->right, "another one, of any kind")->required();
         added.add_flag("--json", values->asJson, "print JSON");
     }
 

@@ -97,6 +97,11 @@ struct ApplicationArguments {
 [[nodiscard]] int runScreen(const std::string& device, const std::string& picture, bool asJson,
                             const Console& console);
 
+// DiffCommand.cpp
+
+[[nodiscard]] int runDiff(const std::string& left, const std::string& right, bool asJson,
+                          const Console& console);
+
 // DataCommand.cpp: an application's data.
 
 struct DataArguments {

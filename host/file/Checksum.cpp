@@ -1,7 +1,6 @@
 #include "host/file/Checksum.h"
 
 #include <cerrno>
-#include <memory>
 #include <span>
 
 #include <openssl/evp.h>
@@ -13,11 +12,6 @@ namespace appsync {
 namespace {
 
 constexpr std::size_t kHashedAtOnce = std::size_t{256} << 10U;
-
-struct ContextDeleter {
-    void operator()(EVP_MD_CTX* context) const noexcept { ::EVP_MD_CTX_free(context); }
-};
-using Context = std::unique_ptr<EVP_MD_CTX, ContextDeleter>;
 
 ErrorRecord cannotSum(const std::string& path) {
     return systemError(ENOMEM, "cannot compute the checksum of " + path);
@@ -35,13 +29,32 @@ std::string hexadecimal(ByteView bytes) {
 
 }  // namespace
 
+RunningSum::RunningSum() : context_(::EVP_MD_CTX_new(), &::EVP_MD_CTX_free) {
+    const bool begun =
+        context_ != nullptr && ::EVP_DigestInit_ex(context_.get(), ::EVP_sha256(), nullptr) == 1;
+    if (!begun) context_.reset();
+}
+
+RunningSum::~RunningSum() = default;
+
+void RunningSum::add(ByteView piece) noexcept {
+    if (context_ == nullptr) return;
+    if (::EVP_DigestUpdate(context_.get(), piece.data(), piece.size()) != 1) context_.reset();
+}
+
+std::string RunningSum::finish() {
+    Bytes digest(EVP_MAX_MD_SIZE);
+    unsigned int length = 0;
+    if (context_ == nullptr || ::EVP_DigestFinal_ex(context_.get(), digest.data(), &length) != 1) {
+        return {};
+    }
+    return hexadecimal(std::span(digest).first(length));
+}
+
 Result<FileSum> sumOfFile(const std::string& path) {
     Result<HostFile> file = HostFile::open(path);
     if (!file) return file.error();
-    const Context context(::EVP_MD_CTX_new());
-    if (!context || ::EVP_DigestInit_ex(context.get(), ::EVP_sha256(), nullptr) != 1) {
-        return cannotSum(path);
-    }
+    RunningSum running;
     FileSum sum;
     Bytes piece(kHashedAtOnce);
     for (;;) {
@@ -49,12 +62,10 @@ Result<FileSum> sumOfFile(const std::string& path) {
         if (!count) return count.error().withContext(path);
         if (*count == 0) break;
         sum.size += *count;
-        if (::EVP_DigestUpdate(context.get(), piece.data(), *count) != 1) return cannotSum(path);
+        running.add(std::span(piece).first(*count));
     }
-    Bytes digest(EVP_MAX_MD_SIZE);
-    unsigned int length = 0;
-    if (::EVP_DigestFinal_ex(context.get(), digest.data(), &length) != 1) return cannotSum(path);
-    sum.sha256 = hexadecimal(std::span(digest).first(length));
+    sum.sha256 = running.finish();
+    if (sum.sha256.empty()) return cannotSum(path);
     return sum;
 }
 

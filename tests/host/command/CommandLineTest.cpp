@@ -130,7 +130,7 @@ INSTANTIATE_TEST_SUITE_P(Help, EachCommand,
 
 INSTANTIATE_TEST_SUITE_P(HelpWithoutASession, EachCommand,
                          testing::Values("package list", "package verify", "data", "data ls",
-                                         "data pull", "data push"));
+                                         "data pull", "data push", "diff"));
 
 TEST_F(CommandLine, HelpShowsTheHelpOfACommand) {
     EXPECT_EQ(run({"help", "package", "make"}), 0);
