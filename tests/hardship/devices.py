@@ -165,11 +165,48 @@ class Restore(Scenario):
             assert file.read() == "to be kept\n"
 
 
+class Push(Scenario):
+    """The data of an application is replaced."""
+
+    OLD, CHANGED = {"notes": b"old\n", "gone": b"old\n"}, {"notes": b"new\n", "deep/er": bytes(300_000)}
+
+    def prepare(self):
+        device = acceptance.Device(self.appsync, self.base, self.coordination)
+        library = os.path.join(self.folder, "library")
+        packages.make_package(library, STAYS)
+        device.sync(library)
+        self.source = os.path.join(self.folder, "data")
+        self.write(device.inside("/var/mobile/Containers/Data/" + STAYS), self.OLD)
+        self.write(self.source, self.CHANGED)
+
+    @staticmethod
+    def write(folder, files):
+        for name, content in files.items():
+            path = os.path.join(folder, name)
+            os.makedirs(os.path.dirname(path), exist_ok=True)
+            with open(path, "wb") as file:
+                file.write(content)
+
+    def command(self):
+        return ["data", "push", self.device, STAYS, self.source, "--yes"]
+
+    def check(self, expected, kept=lambda seen: seen):
+        top = os.path.join(self.device, "root/var/mobile/Containers/Data", STAYS)
+        there = {}
+        for base, _, names in os.walk(top):
+            for name in names:
+                with open(os.path.join(base, name), "rb") as file:
+                    there[os.path.relpath(os.path.join(base, name), top)] = file.read()
+        assert there in (self.OLD, self.CHANGED), there.keys()
+        super().check(expected, kept)
+
+
 SCENARIOS = {
     "sync": lambda appsync, folder: Sync(appsync, folder, "off"),
     "coordinated-sync": lambda appsync, folder: Sync(appsync, folder, "on"),
     "restore": lambda appsync, folder: Restore(appsync, folder, "off"),
     "coordinated-restore": lambda appsync, folder: Restore(appsync, folder, "on"),
+    "data-push": lambda appsync, folder: Push(appsync, folder, "off"),
 }
 
 
