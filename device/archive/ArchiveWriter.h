@@ -18,8 +18,8 @@ struct PackageItem;
 /// place that knows libzip's writer.
 [[nodiscard]] Status writeArchive(const std::vector<PackageItem>& items, const std::string& path,
                                   const std::string& name,
-                                  const std::function<void(std::uint64_t bytes)>& progress);
-/// The same under its own name, which nobody waits for.
+                                  const std::function<void(std::uint64_t bytes)>& progress = {});
+/// The same under its own name.
 [[nodiscard]] Status writeArchive(const std::vector<PackageItem>& items, const std::string& path);
 
 }  // namespace appsync

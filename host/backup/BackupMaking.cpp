@@ -270,7 +270,8 @@ class BackupMaking {
 
 bool liesInDevice(const Device& device, const std::string& path) {
     std::error_code code;
-    const fs::path canonical = fs::weakly_canonical(path, code);
+    // Of a name that is new in the working directory nothing else makes a whole path.
+    const fs::path canonical = fs::weakly_canonical(fs::absolute(path, code), code);
     const fs::path inside = canonical.lexically_relative(fs::weakly_canonical(device.path(), code));
     return !code && !inside.empty() && *inside.begin() != "..";
 }

@@ -60,14 +60,14 @@ int finishCheck(const CheckedPackages& checked, const Console& console) {
     return checked.faults.empty() ? kExitDone : kExitSomethingFailed;
 }
 
-std::string packagesTable(const std::vector<LibraryPackage>& packages, bool isForTerminal) {
+std::string packagesTable(const std::vector<LibraryPackage>& packages, const Console& console) {
     if (packages.empty()) return "No packages.\n";
     Table table({"FILE", "IDENTIFIER", "VERSION", "NAME", "SIZE"});
     for (const LibraryPackage& each : packages) {
         table.add({each.file, each.identifier, each.version.empty() ? "-" : each.version, each.name,
                    formatBytes(each.bytes)});
     }
-    if (isForTerminal) table.limit({20, 24, 10, 12});  // a program gets all of it
+    if (console.isTerminal) table.fitInto(console.width);
     return table.text();
 }
 
@@ -139,8 +139,7 @@ int runPackageList(const std::string& folder, bool asJson, const Console& consol
     for (const std::string& name : *names) {
         checked.note(name, readPackage((fs::path(folder) / name).native(), codec));
     }
-    console.out << (asJson ? checkedJson(checked) + "\n"
-                           : packagesTable(checked.good, console.isTerminal));
+    console.out << (asJson ? checkedJson(checked) + "\n" : packagesTable(checked.good, console));
     return finishCheck(checked, console);
 }
 

@@ -189,6 +189,15 @@ def test_pull_takes_no_place_that_is_taken(appsync, used, tmp_path):
 
 
 @ON_ONE_PATH
+def test_nothing_is_written_into_the_device_from_inside_of_it(appsync, used, tmp_path):
+    before = sorted(os.listdir(used.path))
+    for arguments in (("data", "pull", ".", ID, "out"), ("data", "pull", ".", ID, "out.zip"), ("backup", ".", "out")):
+        done = subprocess.run([appsync.program, *arguments], cwd=used.path, capture_output=True, text=True)
+        assert done.returncode in (1, 3) and "lies in the device" in done.stderr
+    assert sorted(os.listdir(used.path)) == before
+
+
+@ON_ONE_PATH
 def test_links_and_pipes_are_named_and_left_out(appsync, used, tmp_path):
     secret = tmp_path / "secret"
     secret.write_text("secret")
