@@ -64,6 +64,16 @@ int LogFile::openDirectory() {
 }
 
 int LogFile::openFile() {
+    int error = openFileInDirectory();
+    if (error == ENOENT && directory_) {
+        // The directory itself has gone, and what is open of it takes no files any more.
+        directory_.reset();
+        error = openFileInDirectory();
+    }
+    return error;
+}
+
+int LogFile::openFileInDirectory() {
     if (!directory_) {
         if (const int error = openDirectory(); error != 0) return error;
     }

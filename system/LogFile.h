@@ -49,6 +49,7 @@ class LogFile {
 
     int openDirectory();
     int openFile();
+    int openFileInDirectory();
     int makeRoom(off_t size);
     int putAside();
     [[nodiscard]] std::optional<off_t> sizeIfCurrent() const;

@@ -178,6 +178,19 @@ TEST_F(LogFileTest, AFileThatIsTakenAwayIsMadeAnew) {
     EXPECT_EQ(current(), Lines{"2222"});
 }
 
+TEST_F(LogFileTest, ADirectoryThatIsTakenAwayIsMadeAnew) {
+    LogFile log = open();
+    append(log, {"1111"});
+    fs::remove_all(directory());
+    append(log, {"2222"});
+    EXPECT_EQ(current(), Lines{"2222"});
+    LogFile other = open();
+    fs::remove_all(directory());
+    append(other, {"3333"});
+    append(log, {"4444"});
+    EXPECT_EQ(current(), (Lines{"3333", "4444"}));
+}
+
 TEST_F(LogFileTest, ALineAfterAnEarlierProcessesHalfOneIsWhole) {
     fs::create_directory(directory());
     std::ofstream(path()) << "1111\n22";
