@@ -36,6 +36,11 @@ TEST(PosixErrorTest, ControlCharactersOfAPathStayOnOneLine) {
     EXPECT_EQ(displayPath("/a\nb\x7f\0c"sv), "/a\\x0ab\\x7f\\x00c");
 }
 
+TEST(PosixErrorTest, AnEmptyPathIsQuoted) {
+    EXPECT_EQ(posixError(ENOENT, "open", "").description(),
+              "cannot open '': No such file or directory");
+}
+
 TEST(PosixErrorTest, LettersBeyondAsciiStayAsTheyAre) {
     EXPECT_EQ(displayPath("/\xC3\xBC"), "/\xC3\xBC");
 }
