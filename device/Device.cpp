@@ -33,6 +33,7 @@
 #include "device/values/DevicePaths.h"
 #include "device/values/PackageIdentifier.h"
 #include "system/PosixError.h"
+#include "system/RootDirectory.h"
 #include "system/RootedFileSystem.h"
 #include "system/SystemNotifications.h"
 #include "system/SystemWorkQueues.h"
@@ -102,7 +103,7 @@ struct Device::State {
     Containers containers;
     ProgressBook progress;
     const InstallContext context{*database, *files,        containers, barrier,
-                                 progress,  propertyLists, boot};
+                                 progress,  propertyLists, boot,       options.keepsData};
     DeviceRegistry registry;
     DevicePolicy policy;
     DeviceInstaller installer;
@@ -131,6 +132,7 @@ Result<std::unique_ptr<Device>> Device::open(const std::string& path,
         if (!repairs) return cannotUseDevice(path, repairs.error());
         state->repairs = std::move(*repairs);
         if (Status begun = beginSession(state->context); !begun) return begun.error();
+        keepSpaceReserve(state->path);
     }
     return std::unique_ptr<Device>(new Device(std::move(state)));
 }
@@ -140,6 +142,7 @@ Device::Device(std::unique_ptr<State> state) : state_(std::move(state)) {}
 Device::~Device() {
     state_->coordination.close();
     state_->database->flush().ignore();
+    if (!state_->lock && state_->options.makesRoom) keepSpaceReserve(state_->path);
     if (!state_->lock) return;
     clearPackages(state_->context);
     endSession(state_->context).ignore();
@@ -169,7 +172,7 @@ FileSystem& Device::files() { return *state_->files; }
 PropertyListSerialization& Device::propertyLists() { return state_->propertyLists; }
 WorkQueues& Device::queues() { return state_->queues; }
 IconRenderer& Device::icons() { return state_->icons; }
-const RootDirectory& Device::root() { return state_->files->root(); }
+const RootDirectory& Device::root() const { return state_->files->root(); }
 const std::string& Device::path() const noexcept { return state_->path; }
 const std::vector<std::string>& Device::repairs() const noexcept { return state_->repairs; }
 
@@ -182,6 +185,8 @@ Result<std::uint64_t> Device::freeSpace() const {
     }
     return std::uint64_t{space.f_bavail} * space.f_frsize;
 }
+
+std::uint64_t Device::spaceReserve() const { return spaceReserveOf(state_->path); }
 
 std::optional<ErrorRecord> Device::databaseFailure() const { return state_->database->failure(); }
 
@@ -221,6 +226,22 @@ Result<ApplicationStatus> Device::status(const std::string& identifier) {
     status->isHeld = status->isHeld && status->sessionUnderWay;
     if (!status->sessionUnderWay) status->denial.reset();
     return status;
+}
+
+Result<std::vector<std::string>> Device::running() {
+    return runningApplications(*state_->database);
+}
+
+Result<SessionRecord> Device::session() {
+    return sessionRecord(*state_->database, SessionLock::isHeld(state_->path));
+}
+
+bool Device::hasData(const std::string& identifier) const {
+    const std::string path = dataDirectoryOf(identifier);
+    const Result<UniqueFd> data = root().openDirectoryWithoutLinks(path, "list");
+    if (!data) return false;
+    const Result<std::vector<std::string>> names = namesIn(data->get(), path);
+    return names && !names->empty();
 }
 
 Result<std::vector<HomeScreenItem>> Device::homeScreen() {
@@ -297,7 +318,11 @@ Status Device::quit(const std::string& identifier) {
 
 Status Device::uninstall(const std::string& identifier) {
     if (Status status = requireLegalIdentifier(identifier); !status) return status;
-    return removeBundles(state_->context, identifier, Removal::Everything);
+    Status removed = removeBundles(state_->context, identifier, Removal::Everything);
+    if (removed || !isRegistryError(removed.error(), RegistryErrorCode::NothingInstalled) ||
+        !hasData(identifier))
+        return removed;
+    return state_->files->removeItem(dataDirectoryOf(identifier));
 }
 
 Result<std::vector<std::string>> Device::removeLeftoverSyncPlaceholders() {

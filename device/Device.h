@@ -59,6 +59,8 @@ struct DeviceOpenOptions {
     /// Something is to be taken away. Where the disk is full, the space that the device keeps for
     /// that is given up; the next session that ends with plenty of it left keeps some again.
     bool makesRoom = false;
+    /// What goes without being asked for by name leaves the application's data where it is.
+    bool keepsData = false;
 };
 
 /// Who takes an application's bundle away while its placeholder and its data stay.
@@ -78,6 +80,9 @@ class Device {
     /// directory must exist, the path must not.
     static Status create(const std::string& path, const DeviceCreateOptions& options = {});
 
+    /// Where the device may only be read, `Look` looks at a copy of its database: nothing is left
+    /// behind, what others commit from now on is not seen, and every change is refused. A process
+    /// of root's acts as the owner of the directory from now on (system/ActingAccount.h).
     [[nodiscard]] static Result<std::unique_ptr<Device>> open(
         const std::string& path, const DeviceOpenOptions& options = {});
 
@@ -96,7 +101,7 @@ class Device {
     [[nodiscard]] WorkQueues& queues();
     [[nodiscard]] IconRenderer& icons();
     /// The device's files as descriptors, for transfers in pieces.
-    [[nodiscard]] const RootDirectory& root();
+    [[nodiscard]] const RootDirectory& root() const;
 
     /// Absolute path of the device directory on this machine.
     [[nodiscard]] const std::string& path() const noexcept;
@@ -104,6 +109,9 @@ class Device {
     [[nodiscard]] std::string logPath() const;
     /// Bytes that may still be written to the file system that holds the device.
     [[nodiscard]] Result<std::uint64_t> freeSpace() const;
+    /// Bytes that the device keeps back for a full disk: 0 where it could not, or has given them
+    /// up.
+    [[nodiscard]] std::uint64_t spaceReserve() const;
 
     /// What went wrong with the database first, if anything did: the services of the platform
     /// cannot all say so. A session with such a failure has failed.
@@ -121,6 +129,11 @@ class Device {
     /// The same as a session that began now would find it: without what has lost its bundle on
     /// disk. An error where that cannot be looked at.
     [[nodiscard]] Result<std::vector<ApplicationRecord>> applicationsOnDisk();
+    /// The identifiers of the applications that run, ordered.
+    [[nodiscard]] Result<std::vector<std::string>> running();
+    [[nodiscard]] Result<SessionRecord> session();
+    /// Whether the device holds any file of an application's data.
+    [[nodiscard]] bool hasData(const std::string& identifier) const;
     /// How far an install has come; nothing when none is under way. Cheap; may be polled.
     [[nodiscard]] std::optional<InstallProgress> installProgress(const std::string& identifier);
     [[nodiscard]] Result<ApplicationStatus> status(const std::string& identifier);
@@ -178,6 +191,7 @@ class Device {
     /// It ends. No failure when it does not run.
     Status quit(const std::string& identifier);
     /// Removes the application, its placeholder and its data, and puts it on the installer's list.
+    /// Where nothing but data is left of it, that goes.
     Status uninstall(const std::string& identifier);
 
     // What the device or a host does between sessions. Only with DeviceAccess::Session.

@@ -8,6 +8,7 @@
 #include <cerrno>
 #include <cstdio>
 #include <filesystem>
+#include <optional>
 #include <utility>
 
 #include "device/SpaceReserve.h"
@@ -64,6 +65,39 @@ ErrorRecord alreadyExists(const fs::path& device) {
                            " exists already; give the path of a new directory, or remove it first");
 }
 
+// The reserve is for the day when the disk is full; a device without it could not even remove
+// something then.
+ErrorRecord noRoom(const fs::path& device) {
+    return deviceError(DeviceErrorCode::NoSpace,
+                       "cannot create the device " + displayPath(device.string()) +
+                           ": a device needs " + std::to_string(kSpaceOfNewDevice / 1024) +
+                           " KiB of free space to begin with, and there is less; free some, or "
+                           "give a path on another disk");
+}
+
+ErrorRecord liesInside(const fs::path& path, const fs::path& device) {
+    return deviceError(DeviceErrorCode::CannotUse,
+                       "cannot create the device " + displayPath(path.string()) +
+                           ": it would lie inside the device " + displayPath(device.string()) +
+                           "; give a path outside of it");
+}
+
+bool isDevice(const fs::path& directory) {
+    std::error_code ignored;
+    return fs::is_regular_file(directory / kDatabaseName, ignored) &&
+           fs::is_directory(directory / kRootName, ignored);
+}
+
+// The device in whose directory the path lies, if it lies in one.
+std::optional<fs::path> deviceAround(const fs::path& path) {
+    std::error_code error;
+    fs::path each = fs::weakly_canonical(path.parent_path(), error);
+    for (; !error && each.has_relative_path(); each = each.parent_path()) {
+        if (isDevice(each)) return each;
+    }
+    return std::nullopt;
+}
+
 /// A directory in the making: locked while it is, and removed unless it was put in its place.
 class Scaffold {
   public:
@@ -104,6 +138,8 @@ class Scaffold {
     }
 
     [[nodiscard]] const fs::path& path() const { return path_; }
+    /// What it is to become.
+    [[nodiscard]] const fs::path& device() const { return device_; }
 
   private:
     static UniqueFd openDirectory(const fs::path& path) {
@@ -171,7 +207,7 @@ Status build(Scaffold& scaffold, bool coordination) {
     if (status) status = makeDirectories(scaffold.path());
     if (status) status = makeDatabase(scaffold.path(), coordination);
     if (!status) return status;
-    keepSpaceReserve(scaffold.path().string());
+    if (!makeSpaceReserve(scaffold.path().string())) return noRoom(scaffold.device());
     return scaffold.putInPlace();
 }
 
@@ -187,6 +223,7 @@ Status createDevice(const std::string& path, bool coordination) {
     if (fs::symlink_status(device, error).type() != fs::file_type::not_found && !error) {
         return alreadyExists(device);
     }
+    if (const auto around = deviceAround(device)) return liesInside(device, *around);
     Scaffold scaffold(device);
     Status status = build(scaffold, coordination);
     if (status || status.error().domain == kDeviceErrorDomain) return status;

@@ -199,6 +199,30 @@ Result<ApplicationStatus> applicationStatus(DeviceDatabase& database,
     return status;
 }
 
+Result<std::vector<std::string>> runningApplications(DeviceDatabase& database) {
+    std::vector<std::string> identifiers;
+    const Status status = database.read([&](Database& connection) {
+        Query rows = connection.query("SELECT identifier FROM running ORDER BY identifier");
+        while (rows.next()) identifiers.push_back(rows.text(0));
+        return rows.status();
+    });
+    if (!status) return status.error();
+    return identifiers;
+}
+
+// A session is noted after it has the lock, and its note goes before the lock.
+Result<SessionRecord> sessionRecord(DeviceDatabase& database, bool isUnderWay) {
+    std::optional<std::int64_t> process;
+    const Status status = database.read([&](Database& connection) {
+        Query rows = connection.query("SELECT process FROM session");
+        if (rows.next()) process = rows.integer(0);
+        return rows.status();
+    });
+    if (!status) return status.error();
+    if (isUnderWay) return SessionRecord{true, process, false};
+    return SessionRecord{false, std::nullopt, process.has_value()};
+}
+
 std::vector<const ApplicationRecord*> homeScreenRecords(
     std::span<const std::string> order, std::span<const ApplicationRecord> records) {
     std::unordered_map<std::string_view, const ApplicationRecord*> byIdentifier;

@@ -29,6 +29,12 @@ class RootDirectory;
 [[nodiscard]] Result<ApplicationStatus> applicationStatus(DeviceDatabase& database,
                                                           const std::string& identifier);
 
+/// See Device::running.
+[[nodiscard]] Result<std::vector<std::string>> runningApplications(DeviceDatabase& database);
+
+/// What the database says of a session, beside whether one is under way.
+[[nodiscard]] Result<SessionRecord> sessionRecord(DeviceDatabase& database, bool isUnderWay);
+
 /// What stands on the home screen: of `order` those that `records` hold. A placeholder stands
 /// before the application that it covers. The results point into `records`.
 [[nodiscard]] std::vector<const ApplicationRecord*> homeScreenRecords(

@@ -1,17 +1,27 @@
 #pragma once
 
+#include <cstdint>
 #include <string>
 
 namespace appsync {
 
 /// Space that a device keeps for the day when its disk is full: a file beside its database that is
 /// given up when something is to be removed, which takes a little space before it gives any back.
-/// Both may do nothing; neither fails.
 
-/// Makes the file where there is none, and where that leaves plenty of space.
+/// What has to be free where a device is made: less would not do for the reserve and the first use.
+inline constexpr std::uint64_t kSpaceOfNewDevice = std::uint64_t{512} << 10U;
+
+/// Makes the file in a new device. False where there is no room for it. Where the file system
+/// cannot keep space back for a file, there is none, and it is true.
+[[nodiscard]] bool makeSpaceReserve(const std::string& devicePath) noexcept;
+
+/// Makes the file where there is none, and where that leaves plenty of space. May do nothing.
 void keepSpaceReserve(const std::string& devicePath) noexcept;
 
 /// Gives the file up where less space is left than it takes.
 void giveUpSpaceReserveIfFull(const std::string& devicePath) noexcept;
+
+/// What the file takes; 0 where there is none.
+[[nodiscard]] std::uint64_t spaceReserveOf(const std::string& devicePath) noexcept;
 
 }  // namespace appsync

@@ -130,7 +130,8 @@ Status removeBundles(const InstallContext& context, const std::string& identifie
     }
     if (outcome.removedApplication) context.containers.remove(outcome.freed.application);
     if (outcome.dataGoes()) {
-        context.files.removeItem(dataDirectoryOf(identifier)).ignore();
+        const bool isKept = context.keepsData && removal != Removal::Everything;
+        if (!isKept) context.files.removeItem(dataDirectoryOf(identifier)).ignore();
         dropRestoredData(context, identifier);
     }
     return {};

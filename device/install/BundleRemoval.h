@@ -22,9 +22,9 @@ enum class Removal {
 };
 
 /// Removes what stands under an identifier that is legal. With the last of it goes the data, except
-/// behind a sync's placeholder, which never brought any. A coordinator of the identifier is
-/// cancelled along with it. On disk when it returns. A registry error
-/// when there is nothing to remove, or when it is a system application. Any thread.
+/// behind a sync's placeholder, which never brought any, and where the context keeps it. A
+/// coordinator of the identifier is cancelled along with it. On disk when it returns. A registry
+/// error when there is nothing to remove, or when it is a system application. Any thread.
 Status removeBundles(const InstallContext& context, const std::string& identifier, Removal removal);
 
 /// Removes every placeholder that came with a sync, in one step, except those of coordinators.

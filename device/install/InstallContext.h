@@ -40,6 +40,8 @@ struct InstallContext {
     PropertyListSerialization& propertyLists;
     /// Names this boot of the machine; empty when it is not known.
     const std::string& boot;
+    /// See DeviceOpenOptions.
+    bool keepsData = false;
 };
 
 /// What goes into the same transaction as an install; when it fails, nothing is installed.

@@ -67,6 +67,16 @@ struct DeviceSettingsChange {
     std::optional<bool> coordination = std::nullopt;
 };
 
+/// Who holds the device, or held it.
+struct SessionRecord {
+    /// A session holds the device at this moment.
+    bool isUnderWay = false;
+    /// Its process, where that is known.
+    std::optional<std::int64_t> process;
+    /// None does, and the last one did not come to its end.
+    bool wasInterrupted = false;
+};
+
 /// One record of the transaction log.
 struct HistoryRecord {
     enum class Kind { Step, Scenario };

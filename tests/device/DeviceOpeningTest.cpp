@@ -71,6 +71,38 @@ TEST_F(DeviceOpeningTest, spaceForAFullDiskIsKept) {
     EXPECT_TRUE(fs::exists(reserve)) << "a session keeps some when it ends";
 }
 
+TEST_F(DeviceOpeningTest, spaceIsKeptAgainWhenASessionBegins) {
+    fs::remove(devicePath("space.reserve"));
+    const auto session = openSession(devicePath());
+    EXPECT_TRUE(fs::exists(devicePath("space.reserve")));
+    EXPECT_EQ((*session)->spaceReserve(), 256U * 1024);
+}
+
+TEST_F(DeviceOpeningTest, whoHasTakenSomethingAwayKeepsSpaceAgain) {
+    fs::remove(devicePath("space.reserve"));
+    EXPECT_EQ((*Device::open(devicePath(), {.makesRoom = true}))->spaceReserve(), 0U);
+    EXPECT_TRUE(fs::exists(devicePath("space.reserve")));
+}
+
+TEST_F(DeviceOpeningTest, aSessionThatIsCutOffIsKnown) {
+    EXPECT_FALSE(look()->session()->wasInterrupted);
+    {
+        const auto session = openSession(devicePath());
+        const SessionRecord seen = *look()->session();
+        EXPECT_TRUE(seen.isUnderWay);
+        EXPECT_EQ(seen.process, ::getpid());
+    }
+    EXPECT_FALSE(look()->session()->isUnderWay);
+    EXPECT_FALSE(look()->session()->wasInterrupted);
+}
+
+TEST_F(DeviceOpeningTest, creationRefusesAPlaceInsideADevice) {
+    const Status status = Device::create(rootPath("/new"));
+    ASSERT_FALSE(status);
+    EXPECT_NE(status.error().description().find("inside the device"), std::string::npos);
+    EXPECT_FALSE(fs::exists(rootPath("/new")));
+}
+
 TEST_F(DeviceOpeningTest, creationWithoutAParentLeavesNothing) {
     const Status status = Device::create(path("no/such/device"));
     ASSERT_FALSE(status);

@@ -1,6 +1,6 @@
 """What test_full_disk.py runs in a mount namespace of its own, where DISK is a small disk.
 
-    full_disk.py grow|look|remove APPSYNC DISK FOLDER COORDINATION each|last
+    full_disk.py grow|look|remove|small APPSYNC DISK FOLDER COORDINATION each|last
 """
 
 import os
@@ -16,7 +16,7 @@ import packages
 
 PAGE = 4  # KiB
 WIDE = 48
-SAYS_FULL = re.compile("is full|bytes and [0-9]+ are free|No space left|does not fit|do not fit|missing")
+SAYS_FULL = re.compile("is full|KiB of free space|bytes and [0-9]+ are free|No space left|does not fit|do not fit|missing")
 
 
 class Disk:
@@ -176,10 +176,58 @@ def remove(runner, _):
         assert len(runner.ok("apps", runner.device).splitlines()) == 4
 
 
+def small(runner, _):
+    """A device that is made where little space is left can be emptied when there is none; without space it is not made."""
+    disk, device = runner.disk, runner.device
+    shutil.rmtree(device)
+    with open(os.path.join(disk.where, "others"), "wb") as file:
+        file.write(bytes(disk.free() - (2 << 20)))
+    runner.ok("create", device)
+    assert os.path.getsize(os.path.join(device, "space.reserve")) == 256 << 10
+    runner.ok("sync", device, runner.library)
+    disk.fill()
+    runner.refused("set", device, "removal=yes")
+    runner.ok("uninstall", device, "com.example.app00")
+    assert "com.example.app00" not in runner.ok("apps", device)
+    check_made_again(runner)
+    # Who has nothing kept back is not sent in a circle.
+    os.remove(os.path.join(device, "space.reserve"))
+    disk.fill()
+    assert "appsync uninstall" not in runner.refused("uninstall", device, "com.example.app01")
+    runner.check_intact()
+    check_not_made(runner)
+
+
+def check_made_again(runner):
+    """What was given up is kept back again as soon as there is room, whoever ends or begins then."""
+    reserve = os.path.join(runner.device, "space.reserve")
+    for arguments in (["uninstall", runner.device, "com.example.app02"], ["sync", runner.device, runner.library]):
+        os.remove(os.path.join(runner.disk.where, "ballast"))
+        if os.path.exists(reserve):
+            os.remove(reserve)
+        runner.ok(*arguments)
+        assert os.path.getsize(reserve) == 256 << 10, arguments
+        runner.disk.fill()
+    os.remove(os.path.join(runner.disk.where, "ballast"))
+
+
+def check_not_made(runner):
+    """On a disk with less space than a device takes to begin with, none is made and nothing is left."""
+    shutil.rmtree(runner.device)
+    ballast = os.path.join(runner.disk.where, "ballast")
+    for kib in (0, 100, 400):
+        runner.disk.fill()
+        with open(ballast, "r+b") as file:
+            file.truncate(os.path.getsize(ballast) - (kib << 10))
+        before = sorted(os.listdir(runner.disk.where))
+        runner.refused("create", runner.device)
+        assert sorted(os.listdir(runner.disk.where)) == before
+
+
 def main():
     what, program, where, folder, coordination, sizes = sys.argv[1:]
     disk = Disk(where, 2048 if what == "grow" else 8192)
-    {"grow": grow, "look": look, "remove": remove}[what](Runner(program, disk, folder, coordination), sizes)
+    {"grow": grow, "look": look, "remove": remove, "small": small}[what](Runner(program, disk, folder, coordination), sizes)
 
 
 main()
