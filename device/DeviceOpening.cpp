@@ -12,6 +12,7 @@
 #include "device/install/Containers.h"
 #include "device/values/DeviceError.h"
 #include "device/values/DevicePaths.h"
+#include "system/ActingAccount.h"
 #include "system/PosixError.h"
 
 namespace appsync {
@@ -96,6 +97,12 @@ ErrorRecord inUse(const fs::path& device) {
                                                    "; try again when that one has ended");
 }
 
+// Else root would leave files behind that the device's owner cannot write.
+void actAsOwnerOf(const fs::path& device) {
+    struct stat status = {};
+    if (::stat(device.c_str(), &status) == 0) actAs(status.st_uid, status.st_gid);
+}
+
 Status takeLock(const fs::path& device, std::optional<SessionLock>& lock) {
     Result<std::optional<SessionLock>> taken = SessionLock::take(device.string());
     if (!taken) return taken.error();
@@ -107,7 +114,7 @@ Status takeLock(const fs::path& device, std::optional<SessionLock>& lock) {
 Status openDatabase(const fs::path& device, bool session, OpenedDevice& opened) {
     using Sharing = DeviceDatabase::Sharing;
     auto database = DeviceDatabase::open((device / kDatabaseName).string(),
-                                         session ? Sharing::Always : Sharing::IfThereIsSpace);
+                                         session ? Sharing::Always : Sharing::IfPossible);
     if (!database) return database.error();
     opened.database = std::move(*database);
     if (!session) return {};
@@ -139,6 +146,7 @@ Result<OpenedDevice> openDevice(const std::string& path, bool session, bool make
     OpenedDevice opened;
     opened.path = device.string();
     Status status = checkDirectory(device);
+    if (status) actAsOwnerOf(device);
     if (status && session) status = takeLock(device, opened.lock);
     if (status && makesRoom) giveUpSpaceReserveIfFull(opened.path);
     if (status) status = openDatabase(device, session, opened);

@@ -21,7 +21,8 @@ struct OpenedDevice {
 
 /// Opens a device directory. With `session` it takes the session's lock first, and reads the whole
 /// database to see whether it is sound; with `makesRoom` it gives up the space that the device
-/// keeps for a full disk, if it is. Errors are of `kDeviceErrorDomain`.
+/// keeps for a full disk, if it is. A process of root's acts as the directory's owner from then on
+/// (system/ActingAccount.h). Errors are of `kDeviceErrorDomain`.
 [[nodiscard]] Result<OpenedDevice> openDevice(const std::string& path, bool session,
                                               bool makesRoom);
 

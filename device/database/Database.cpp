@@ -9,6 +9,7 @@
 #include <utility>
 
 #include "device/values/DeviceError.h"
+#include "device/values/DevicePaths.h"
 #include "system/PosixError.h"
 
 namespace appsync {
@@ -43,6 +44,16 @@ bool hasNoSpace(const Failure& failure) {
         default:
             return false;
     }
+}
+
+// Where the space that a device keeps back is still there, an application can be removed.
+const char* adviceForFullDisk(const std::string& database) {
+    const std::filesystem::path reserve =
+        std::filesystem::path(database).parent_path() / kReserveName;
+    return ::access(reserve.c_str(), F_OK) == 0
+               ? "free some space there and try again, or remove an application with appsync "
+                 "uninstall"
+               : "free some space there and try again";
 }
 
 // The files that a database needs beside it are made where it stands.
@@ -81,18 +92,16 @@ std::string systemReason(const Failure& failure) {
 ErrorRecord databaseError(const Failure& failure) {
     const std::string what = "the device's database " + failure.path;
     if (hasNoSpace(failure)) {
-        return deviceError(
-            DeviceErrorCode::NoSpace,
-            what +
-                " cannot grow: the disk that it is on is full; free some space there and try "
-                "again, or remove an application with appsync uninstall");
+        return deviceError(DeviceErrorCode::NoSpace,
+                           what + " cannot grow: the disk that it is on is full; " +
+                               adviceForFullDisk(failure.path));
     }
     if (isWriteProtected(failure)) {
         return deviceError(
             DeviceErrorCode::CannotUse,
             what +
-                " cannot be written, which even looking at it needs; make it and its "
-                "directory writable, or use a copy of the device");
+                " cannot be written; make it and its directory writable, or use a copy of the "
+                "device");
     }
     switch (failure.resultCode & 0xff) {
         case SQLITE_ERROR:  // a table or a column that every device has is not there
@@ -197,11 +206,21 @@ Bytes Query::blob(int column) const {
 // Database
 
 Result<std::unique_ptr<Database>> Database::open(const std::string& path, Mode mode) {
+    return openNamed(path, path, mode);
+}
+
+Result<std::unique_ptr<Database>> Database::openCopy(const std::string& copy,
+                                                     const std::string& original) {
+    return openNamed(copy, original, Mode::Alone);
+}
+
+Result<std::unique_ptr<Database>> Database::openNamed(const std::string& path,
+                                                      const std::string& name, Mode mode) {
     sqlite3* handle = nullptr;
     const int creation = mode == Mode::Create ? SQLITE_OPEN_CREATE : 0;
     const int flags = SQLITE_OPEN_READWRITE | SQLITE_OPEN_NOMUTEX | SQLITE_OPEN_EXRESCODE;
     const int resultCode = sqlite3_open_v2(path.c_str(), &handle, flags | creation, nullptr);
-    std::unique_ptr<Database> database(new Database(handle, path));
+    std::unique_ptr<Database> database(new Database(handle, name));
     if (resultCode != SQLITE_OK) return database->error(resultCode);
     sqlite3_busy_timeout(handle, kBusyTimeoutMilliseconds);
     sqlite3_db_config(handle, SQLITE_DBCONFIG_DEFENSIVE, 1, nullptr);

@@ -89,6 +89,9 @@ class Database {
     /// Creates the file or opens an existing one. Waits up to ten seconds where another connection
     /// holds what a statement needs.
     [[nodiscard]] static Result<std::unique_ptr<Database>> open(const std::string& path, Mode mode);
+    /// The same of a copy; messages name the original.
+    [[nodiscard]] static Result<std::unique_ptr<Database>> openCopy(const std::string& copy,
+                                                                    const std::string& original);
     ~Database();
     Database(const Database&) = delete;
     Database& operator=(const Database&) = delete;
@@ -110,6 +113,10 @@ class Database {
   private:
     friend class Query;
     Database(sqlite3* handle, std::string path);
+
+    [[nodiscard]] static Result<std::unique_ptr<Database>> openNamed(const std::string& path,
+                                                                     const std::string& name,
+                                                                     Mode mode);
 
     [[nodiscard]] ErrorRecord error(int resultCode) const;
 

@@ -6,6 +6,7 @@
 #include <system_error>
 
 #include "device/database/Database.h"
+#include "device/database/DatabaseCopy.h"
 #include "device/database/DeviceSchema.h"
 #include "device/values/DeviceError.h"
 
@@ -15,14 +16,16 @@ namespace {
 
 constexpr std::chrono::milliseconds kLongestDelay{100};
 
+Status makeReady(Database& database) {
+    if (Status status = checkDeviceSchema(database); !status) return status;
+    return database.execute("PRAGMA synchronous = FULL");
+}
+
 Result<std::unique_ptr<Database>> connect(const std::string& path,
                                           Database::Mode mode = Database::Mode::Existing) {
     Result<std::unique_ptr<Database>> database = Database::open(path, mode);
     if (!database) return database;
-    if (Status status = checkDeviceSchema(**database); !status) return status.error();
-    if (Status status = (*database)->execute("PRAGMA synchronous = FULL"); !status) {
-        return status.error();
-    }
+    if (Status status = makeReady(**database); !status) return status.error();
     return database;
 }
 
@@ -38,8 +41,12 @@ struct DeviceDatabase::Waiting {
 
 Result<std::unique_ptr<DeviceDatabase>> DeviceDatabase::open(const std::string& path,
                                                              Sharing sharing) {
+    if (const auto refused = whyNotWritable(path)) {
+        if (sharing == Sharing::Always) return *refused;
+        return openCopy(path, *refused);
+    }
     Result<std::unique_ptr<Database>> reader = connect(path);
-    const bool alone = !reader && sharing == Sharing::IfThereIsSpace &&
+    const bool alone = !reader && sharing == Sharing::IfPossible &&
                        isDeviceError(reader.error(), DeviceErrorCode::NoSpace);
     if (!reader && !alone) return reader.error();
     if (alone) reader = std::unique_ptr<Database>();
@@ -48,6 +55,19 @@ Result<std::unique_ptr<DeviceDatabase>> DeviceDatabase::open(const std::string& 
     if (!writer) return writer.error();
     return std::unique_ptr<DeviceDatabase>(
         new DeviceDatabase(std::move(*reader), std::move(*writer)));
+}
+
+// The copy's files are needed by name no more once something was read of it.
+Result<std::unique_ptr<DeviceDatabase>> DeviceDatabase::openCopy(
+    const std::string& path, const ErrorRecord& whyNotWritable) {
+    const Result<DatabaseCopy> copy = DatabaseCopy::make(path);
+    if (!copy) return copy.error();
+    Result<std::unique_ptr<Database>> reader = Database::openCopy(copy->path(), path);
+    if (!reader) return reader.error();
+    if (Status status = makeReady(**reader); !status) return status.error();
+    std::unique_ptr<DeviceDatabase> database(new DeviceDatabase(*std::move(reader), nullptr));
+    database->whyNotWritable_ = whyNotWritable;
+    return database;
 }
 
 DeviceDatabase::DeviceDatabase(std::unique_ptr<Database> reader, std::unique_ptr<Database> writer)
@@ -70,6 +90,7 @@ Status DeviceDatabase::read(const Reading& reading) {
 }
 
 Status DeviceDatabase::change(Durability durability, const Change& change) {
+    if (!writer_) return noteFailure(*whyNotWritable_);
     Waiting own{change, durability};
     std::unique_lock lock(mutex_);
     queue_.push_back(&own);
@@ -143,6 +164,7 @@ void DeviceDatabase::endTransaction(const std::vector<Waiting*>& batch) {
 }
 
 void DeviceDatabase::changeLater(Change change) {
+    if (!writer_) return;
     const std::lock_guard lock(mutex_);
     later_.push_back(std::move(change));
     if (later_.size() == 1) flusherWakes_.notify_all();

@@ -34,7 +34,8 @@ enum class Durability {
     Soon,    // with the next change that is OnDisk, or when the system gets to it
 };
 
-/// A device's database: one connection that reads, one that writes; on a full disk a single one.
+/// A device's database: one connection that reads, one that writes; on a full disk, and for those
+/// who may only read, a single one.
 ///
 /// Writers that come at the same time share one transaction and one sync: the first of them
 /// commits for all that wait by then. Callable on any thread. The functions that are passed in may
@@ -49,8 +50,9 @@ class DeviceDatabase {
     enum class Sharing {
         Always,
         /// Where there is no space for what sharing needs, nobody else can use it as long as this
-        /// object has it open.
-        IfThereIsSpace,
+        /// object has it open. Where it may not be written, this object reads a copy, and refuses
+        /// every change.
+        IfPossible,
     };
 
     /// Opens the database and checks that it is one that this version can use.
@@ -89,6 +91,9 @@ class DeviceDatabase {
 
     DeviceDatabase(std::unique_ptr<Database> reader, std::unique_ptr<Database> writer);
 
+    [[nodiscard]] static Result<std::unique_ptr<DeviceDatabase>> openCopy(
+        const std::string& path, const ErrorRecord& whyNotWritable);
+
     void lead(std::unique_lock<std::mutex>& lock);
     void commitTogether(const std::vector<Waiting*>& batch, const std::vector<Change>& later);
     Status beginTransaction(Durability durability);
@@ -98,8 +103,9 @@ class DeviceDatabase {
     void flushNowAndThen();
 
     std::mutex readerMutex_;
-    const std::unique_ptr<Database> reader_;  // protected by readerMutex_; none when not shared
-    const std::unique_ptr<Database> writer_;  // used by whoever stands first in queue_
+    const std::unique_ptr<Database> reader_;     // protected by readerMutex_; none when not shared
+    const std::unique_ptr<Database> writer_;     // used by whoever stands first in queue_, if any
+    std::optional<ErrorRecord> whyNotWritable_;  // where there is no writer_
     Durability writerDurability_ = Durability::OnDisk;  // likewise
 
     mutable std::mutex mutex_;
