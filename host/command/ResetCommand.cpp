@@ -1,5 +1,7 @@
 #include <memory>
 #include <ostream>
+#include <string>
+#include <vector>
 
 #include <nlohmann/json.hpp>
 
@@ -15,18 +17,50 @@
 
 namespace appsync {
 
+namespace {
+
+std::vector<std::string> placeholdersOf(Device& device) {
+    std::vector<std::string> identifiers;
+    const Result<std::vector<ApplicationRecord>> records = device.applications();
+    if (!records) return identifiers;  // the device keeps that failure
+    for (const ApplicationRecord& each : *records) {
+        if (each.isPlaceholder) identifiers.push_back(each.identifier);
+    }
+    return identifiers;
+}
+
+// Nothing but the data tells any more that there were such applications.
+void tellWhoseDataStays(const Device& device, const std::vector<std::string>& placeholders,
+                        const Console& console) {
+    std::string names;
+    for (const std::string& each : placeholders) {
+        if (device.hasData(each)) names += (names.empty() ? "" : ", ") + printable(each);
+    }
+    if (names.empty()) return;
+    console.out << "The data of " << names
+                << " stays: installing it again finds it, and appsync uninstall removes it.\n";
+}
+
+}  // namespace
+
 int runReset(const std::string& device, bool asJson, const Console& console) {
     const Result<std::unique_ptr<Device>> opened =
-        openDevice(device, {.access = DeviceAccess::Session, .makesRoom = true});
+        openDevice(device, {.access = DeviceAccess::Session, .makesRoom = true, .keepsData = true});
     if (!opened) return console.fail(opened.error());
     const Result<std::unique_ptr<PlugIn>> plugIn = PlugIn::load(**opened, console);
     if (!plugIn) return console.fail(plugIn.error());
+    const std::vector<std::string> placeholders = placeholdersOf(**opened);
     (*plugIn)->client().clearSyncData();
     if (const auto error = (*opened)->databaseFailure()) return console.fail(unusable(*error));
+    std::vector<std::string> kept;
+    for (const std::string& each : placeholders) {
+        if ((*opened)->hasData(each)) kept.push_back(each);
+    }
     if (asJson) {
-        console.out << indented({{"device", device}}) << '\n';
+        console.out << indented({{"device", device}, {"dataKept", kept}}) << '\n';
     } else {
         console.out << printable(device) << " has forgotten what it kept for syncing\n";
+        tellWhoseDataStays(kept, console);
     }
     return kExitDone;
 }
