@@ -395,7 +395,9 @@ class Commands {
         addLook("apps", "Show installed applications and placeholders", runApps);
         addLook("inventory", "Show what the plug-in reports: deleted, metrics, accounts",
                 runInventory);
-        addLook("history", "Show the transaction log", runHistory);
+        addLook("status", "Show the device at a glance: settings, counts, session, space",
+                runStatus);
+        addHistory();
         addWhy();
         const auto values = std::make_shared<DeviceValues>();
         CLI::App& screen =
@@ -415,6 +417,17 @@ class Commands {
                 return show(parsed.device, parsed.flag, console_);
             });
         addJson(added, values);
+    }
+
+    void addHistory() {
+        const auto values = std::make_shared<HistoryArguments>();
+        CLI::App& added = command<HistoryArguments>(
+            app_, "history", "Show the transaction log", values,
+            [this](const HistoryArguments& parsed) { return runHistory(parsed, console_); });
+        added.add_option("DEVICE", values->device, "the device's directory")->required();
+        added.add_option("--app", values->application, "only what happened to this application")
+            ->type_name("ID");
+        added.add_flag("--json", values->asJson, "print JSON");
     }
 
     void addWhy() {
@@ -446,6 +459,11 @@ class Commands {
                 "only this level and those above it")
             ->type_name("debug|info|default|error|fault")
             ->check(oneOf({"debug", "info", "default", "error", "fault"}));
+        added.add_option("--app", values->application, "only lines that name this application")
+            ->type_name("ID");
+        added.add_option("--last", values->last, "only the last N lines of what is wanted")
+            ->type_name("N")
+            ->check(CLI::Range(1U, 1'000'000'000U).description(""));
         added.add_flag("--follow", values->follows, "go on as lines come");
         added.add_flag("--json", values->asJson, "print the lines as they are kept");
     }

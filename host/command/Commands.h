@@ -12,6 +12,7 @@
 // docs/commands.md and in tests/host/command/CommandLineTest.cpp. Includes every other room of
 // host/; called by host/main.cpp only.
 
+#include <cstddef>
 #include <cstdint>
 #include <optional>
 #include <string>
@@ -86,14 +87,23 @@ struct ApplicationArguments {
                             const Console& console);
 [[nodiscard]] int runReset(const std::string& device, bool asJson, const Console& console);
 
-// What shows a device: AppsCommand.cpp, WhyCommand.cpp, InventoryCommand.cpp, HistoryCommand.cpp,
-// ScreenCommand.cpp
+// What shows a device: AppsCommand.cpp, WhyCommand.cpp, InventoryCommand.cpp, StatusCommand.cpp,
+// HistoryCommand.cpp, ScreenCommand.cpp
 
 [[nodiscard]] int runApps(const std::string& device, bool asJson, const Console& console);
 [[nodiscard]] int runWhy(const std::string& device, const std::string& identifier, bool asJson,
                          const Console& console);
 [[nodiscard]] int runInventory(const std::string& device, bool asJson, const Console& console);
-[[nodiscard]] int runHistory(const std::string& device, bool asJson, const Console& console);
+[[nodiscard]] int runStatus(const std::string& device, bool asJson, const Console& console);
+
+struct HistoryArguments {
+    std::string device;
+    /// Only what happened to this application.
+    std::optional<std::string> application;
+    bool asJson = false;
+};
+[[nodiscard]] int runHistory(const HistoryArguments& arguments, const Console& console);
+
 [[nodiscard]] int runScreen(const std::string& device, const std::string& picture, bool asJson,
                             const Console& console);
 
@@ -124,6 +134,10 @@ struct LogArguments {
     std::optional<int> category;
     /// This level and those above it.
     std::optional<LogLevel> level;
+    /// Only lines that name this application.
+    std::optional<std::string> application;
+    /// Only so many lines, the last ones.
+    std::optional<std::size_t> last;
     bool follows = false;
     bool asJson = false;
 };

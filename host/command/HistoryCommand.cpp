@@ -2,6 +2,7 @@
 
 #include "device/Device.h"
 #include "host/command/Commands.h"
+#include "host/command/IdentifierArgument.h"
 #include "host/command/OpenDevice.h"
 #include "host/console/Console.h"
 #include "host/console/Problem.h"
@@ -29,11 +30,20 @@ std::string historyTable(const std::vector<HistoryRecord>& records, const Consol
 
 }  // namespace
 
-int runHistory(const std::string& device, bool asJson, const Console& console) {
-    return lookAt(device, console, [&](Device& opened) -> Status {
-        const Result<std::vector<HistoryRecord>> records = opened.history();
+int runHistory(const HistoryArguments& arguments, const Console& console) {
+    if (arguments.application) {
+        const Status checked = checkIdentifier(*arguments.application, kGiveAsShown, "--app");
+        if (!checked) return console.fail(checked.error());
+    }
+    return lookAt(arguments.device, console, [&](Device& opened) -> Status {
+        Result<std::vector<HistoryRecord>> records = opened.history();
         if (!records) return unusable(records.error());
-        console.out << (asJson ? jsonText(*records) + "\n" : historyTable(*records, console));
+        if (arguments.application) {
+            std::erase_if(*records, [&](const HistoryRecord& each) {
+                return each.identifier != *arguments.application;
+            });
+        }
+        console.out << (arguments.asJson ? jsonText(*records) + "\n" : historyTable(*records, console));
         return {};
     });
 }

@@ -1,0 +1,130 @@
+#include "host/output/DeviceOverview.h"
+
+#include <nlohmann/json.hpp>
+
+#include "host/console/JsonWriting.h"
+#include "host/console/Text.h"
+#include "platform/InstallProgressRecord.h"
+
+namespace appsync {
+namespace {
+
+// As `set` takes them.
+const char* settingText(PolicyAnswer answer) {
+    switch (answer) {
+        case PolicyAnswer::Yes:
+            return "yes";
+        case PolicyAnswer::No:
+            return "no";
+        case PolicyAnswer::Unset:
+            break;
+    }
+    return "unset";
+}
+
+const char* settingText(bool isOn) { return isOn ? "on" : "off"; }
+
+const char* sessionText(const SessionRecord& session) {
+    if (session.isUnderWay) return "under way";
+    return session.wasInterrupted ? "interrupted" : "none";
+}
+
+const char* stagedText(StagedWork staged) {
+    switch (staged) {
+        case StagedWork::Waiting:
+            return "waiting";
+        case StagedWork::Interrupted:
+            return "interrupted";
+        case StagedWork::None:
+            break;
+    }
+    return "none";
+}
+
+std::string sessionLine(const SessionRecord& session) {
+    std::string text = sessionText(session);
+    if (session.process) text += ", process " + std::to_string(*session.process);
+    if (session.wasInterrupted) text += ": run the command again that was cut off";
+    return text;
+}
+
+std::string stagedLine(StagedWork staged) {
+    std::string text = stagedText(staged);
+    if (staged == StagedWork::Waiting) text += ": appsync sync --staged sends what it asks for";
+    if (staged == StagedWork::Interrupted) text += ": appsync sync --staged goes on with it";
+    return text;
+}
+
+std::string runningLine(const std::vector<std::string>& running) {
+    std::string text;
+    for (const std::string& identifier : running) {
+        text += (text.empty() ? "" : ", ") + printable(identifier);
+    }
+    return text.empty() ? "none" : text;
+}
+
+std::string spaceLine(const DeviceOverview& overview) {
+    return formatBytes(overview.free) +
+           (overview.reserve == 0
+                ? ", and nothing kept back for a full disk"
+                : ", and " + formatBytes(overview.reserve) + " kept back for a full disk");
+}
+
+std::string applicationsLine(const DeviceOverview& overview) {
+    return std::to_string(overview.installed) + " installed, " +
+           std::to_string(overview.offloaded) + " offloaded, " + std::to_string(overview.restored) +
+           " restored, " + std::to_string(overview.arriving) + " arriving";
+}
+
+}  // namespace
+
+void count(DeviceOverview& overview, const ApplicationRecord& record) {
+    if (!record.isPlaceholder) {
+        ++overview.installed;
+        return;
+    }
+    switch (record.installType) {
+        case kInstallTypeDowngrade:
+        case kInstallTypeIntentionalDowngrade:
+            ++overview.offloaded;
+            return;
+        case kInstallTypeRestore:
+            ++overview.restored;
+            return;
+        default:
+            ++overview.arriving;
+    }
+}
+
+std::string overviewText(const DeviceOverview& overview) {
+    const DeviceSettings& settings = overview.settings;
+    return std::string("installation:  ") + settingText(settings.installation) +
+           "\nremoval:       " + settingText(settings.removal) +
+           "\ncoordination:  " + settingText(settings.coordination) +
+           "\napplications:  " + applicationsLine(overview) +
+           "\nrunning:       " + runningLine(overview.running) +
+           "\nsession:       " + sessionLine(overview.session) +
+           "\nstaging area:  " + stagedLine(overview.staged) +
+           "\nfree space:    " + spaceLine(overview) + "\n";
+}
+
+std::string jsonText(const DeviceOverview& overview) {
+    using Json = nlohmann::ordered_json;
+    const DeviceSettings& settings = overview.settings;
+    const std::optional<std::int64_t>& process = overview.session.process;
+    return indented({{"installation", settingText(settings.installation)},
+                     {"removal", settingText(settings.removal)},
+                     {"coordination", settingText(settings.coordination)},
+                     {"installed", overview.installed},
+                     {"offloaded", overview.offloaded},
+                     {"restored", overview.restored},
+                     {"arriving", overview.arriving},
+                     {"running", overview.running},
+                     {"session", sessionText(overview.session)},
+                     {"process", process ? Json(*process) : Json()},
+                     {"staged", stagedText(overview.staged)},
+                     {"free", overview.free},
+                     {"reserve", overview.reserve}});
+}
+
+}  // namespace appsync

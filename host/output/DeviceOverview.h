@@ -1,0 +1,37 @@
+#pragma once
+
+#include <cstddef>
+#include <cstdint>
+#include <string>
+#include <vector>
+
+#include "device/values/DeviceRecords.h"
+#include "host/plan/InterruptedStaging.h"
+
+namespace appsync {
+
+/// A device at a glance.
+struct DeviceOverview {
+    DeviceSettings settings;
+    std::size_t installed = 0;
+    std::size_t offloaded = 0;
+    /// Placeholders of a restore, and those of installs that are under way or were interrupted.
+    std::size_t restored = 0;
+    std::size_t arriving = 0;
+    std::vector<std::string> running;
+    SessionRecord session;
+    /// Only while no session is under way.
+    StagedWork staged = StagedWork::None;
+    std::uint64_t free = 0;
+    std::uint64_t reserve = 0;
+};
+
+/// Counts an application or a placeholder.
+void count(DeviceOverview& overview, const ApplicationRecord& record);
+
+/// A line for each thing, for people.
+[[nodiscard]] std::string overviewText(const DeviceOverview& overview);
+/// One JSON object, over several lines, without a line end.
+[[nodiscard]] std::string jsonText(const DeviceOverview& overview);
+
+}  // namespace appsync
