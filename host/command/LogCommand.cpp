@@ -2,174 +2,53 @@
 #include <sys/stat.h>
 #include <unistd.h>
 
-#include <array>
+#include <cerrno>
 #include <chrono>
 #include <cstddef>
-#include <cstdint>
-#include <optional>
 #include <ostream>
 #include <string>
 #include <string_view>
 #include <thread>
 #include <utility>
-#include <variant>
 
 #include "host/command/Commands.h"
+#include "host/command/IdentifierArgument.h"
+#include "host/command/LogLines.h"
 #include "host/command/OpenDevice.h"
 #include "host/console/Console.h"
-#include "host/console/JsonReading.h"
 #include "host/console/Problem.h"
-#include "host/console/Text.h"
-#include "system/JsonLogFacility.h"
 #include "system/LogFile.h"
+#include "system/PosixError.h"
 #include "system/UniqueFd.h"
 
 namespace appsync {
 namespace {
 
 constexpr std::chrono::milliseconds kFollowInterval{200};
-
-// More than a device writes: each of a message's few arguments is cut at 16 KiB.
-constexpr std::size_t kLongestLine = std::size_t{1} << 20U;
 constexpr std::size_t kPieceSize = std::size_t{64} << 10U;
 
-// From the least to the most severe.
-constexpr std::array kSeverity = {LogLevel::Debug, LogLevel::Info, LogLevel::Default,
-                                  LogLevel::Error, LogLevel::Fault};
-
-std::size_t severityOf(LogLevel level) {
-    std::size_t rank = 0;
-    while (rank < kSeverity.size() && kSeverity.at(rank) != level) ++rank;
-    return rank;
+ErrorRecord cannotReadLog(const std::string& path, const std::string& why) {
+    return unusable("cannot read the device's log " + displayPath(path) + ": " + why,
+                    "see what stands there, and who may read it");
 }
 
-std::size_t severityOf(std::string_view name) {
-    std::size_t rank = 0;
-    while (rank < kSeverity.size() && nameOf(kSeverity.at(rank)) != name) ++rank;
-    return rank;
-}
-
-// What the log says of a message; empty where it says nothing, or something else than a text.
-struct LogRecord {
-    std::string time;
-    std::string level;
-    std::string message;
-    std::optional<std::int64_t> category;
-};
-
-std::optional<std::int64_t> wholeNumber(const JsonScalar& value) {
-    if (const auto* number = std::get_if<std::int64_t>(&value)) return *number;
-    const auto* positive = std::get_if<std::uint64_t>(&value);
-    if (positive == nullptr || !std::in_range<std::int64_t>(*positive)) return std::nullopt;
-    return static_cast<std::int64_t>(*positive);
-}
-
-// Takes a line's members and nothing that lies deeper.
-class LineListener final : public JsonListener {
-  public:
-    explicit LineListener(LogRecord& record) : record_(record) {}
-
-    bool memberBegins(std::string name) override {
-        if (depth_ == 1) member_ = std::move(name);
-        return true;
-    }
-    bool scalar(JsonScalar value) override {
-        if (depth_ != 1) return depth_ != 0;  // a line is an object
-        if (member_ == "category") record_.category = wholeNumber(value);
-        auto* text = std::get_if<std::string>(&value);
-        std::string* place = placeOf(member_);
-        if (text != nullptr && place != nullptr) *place = std::move(*text);
-        return true;
-    }
-    bool objectBegins() override { return ++depth_ != 0; }
-    bool arrayBegins() override { return depth_++ != 0; }
-    bool containerEnds() override {
-        --depth_;
-        return true;
-    }
-
-  private:
-    std::string* placeOf(std::string_view member) {
-        if (member == "time") return &record_.time;
-        if (member == "level") return &record_.level;
-        return member == "message" ? &record_.message : nullptr;
-    }
-
-    LogRecord& record_;
-    std::string member_;
-    std::size_t depth_ = 0;
-};
-
-bool isWanted(const LogRecord& record, const LogArguments& arguments) {
-    if (arguments.category && record.category != arguments.category) return false;
-    return !arguments.level || severityOf(record.level) >= severityOf(*arguments.level);
-}
-
-void showLine(const std::string& text, const LogArguments& arguments, const Console& console) {
-    LogRecord record;
-    LineListener listener(record);
-    if (!readJson(text, listener)) return;  // cut off by a crash, for instance
-    if (!isWanted(record, arguments)) return;
-    if (arguments.asJson) {
-        console.out << text << '\n';
-        return;
-    }
-    const std::string number = record.category ? std::to_string(*record.category) : "-";
-    console.out << localTimeOf(record.time) << ' ' << fitted(printable(record.level), 7) << ' '
-                << fitted(number, 2) << ' ' << printable(record.message) << '\n';
-}
-
-// Puts lines together from the pieces that are read, and shows them.
-class LogLines {
-  public:
-    LogLines(std::string path, const LogArguments& arguments, const Console& console)
-        : path_(std::move(path)), arguments_(&arguments), console_(&console) {}
-
-    void add(std::string_view piece) {
-        for (std::size_t end = piece.find('\n'); end != piece.npos; end = piece.find('\n')) {
-            addToLine(piece.substr(0, end));
-            endLine();
-            piece.remove_prefix(end + 1);
-        }
-        addToLine(piece);
-    }
-
-  private:
-    void addToLine(std::string_view piece) {
-        isTooLong_ = isTooLong_ || begun_.size() + piece.size() > kLongestLine;
-        if (!isTooLong_) begun_ += piece;
-    }
-
-    void endLine() {
-        ++number_;
-        if (isTooLong_) {
-            console_->complain("line " + std::to_string(number_) + " of " + path_ +
-                               " is left out: it is longer than any that a device writes");
-        } else {
-            showLine(begun_, *arguments_, *console_);
-        }
-        begun_.clear();
-        isTooLong_ = false;
-    }
-
-    std::string path_;
-    const LogArguments* arguments_;
-    const Console* console_;
-    std::string begun_;  // the line that is still being written
-    bool isTooLong_ = false;
-    std::uint64_t number_ = 0;
-};
-
-// One file of the log, as far as it has been read; none where there is no regular file.
+// One file of the log, as far as it has been read; none where nothing stands.
 class LogPart {
   public:
     LogPart() = default;
-    // A pipe in its place would be waited on.
-    explicit LogPart(const std::string& path)
-        : file_(::open(path.c_str(), O_RDONLY | O_CLOEXEC | O_NONBLOCK)) {
-        const bool isRegular =
-            file_ && ::fstat(file_.get(), &opened_) == 0 && S_ISREG(opened_.st_mode);
-        if (!isRegular) file_.reset();
+
+    static Result<LogPart> open(const std::string& path) {
+        // A pipe in its place would be waited on.
+        UniqueFd file(::open(path.c_str(), O_RDONLY | O_CLOEXEC | O_NONBLOCK));
+        if (!file && errno == ENOENT) return LogPart();
+        LogPart part;
+        if (!file || ::fstat(file.get(), &part.opened_) != 0) {
+            return cannotReadLog(path, posixReason(errno));
+        }
+        if (!S_ISREG(part.opened_.st_mode)) return cannotReadLog(path, "it is no regular file");
+        part.file_ = std::move(file);
+        part.path_ = path;
+        return part;
     }
 
     [[nodiscard]] bool isThere() const { return file_.valid(); }
@@ -180,11 +59,19 @@ class LogPart {
         struct stat now {};
         return isThere() && ::stat(path.c_str(), &now) == 0 && isSameAs(now);
     }
+    // Whether somebody has emptied it; it is then read from its beginning again.
+    [[nodiscard]] bool beginsAnew() const {
+        struct stat now {};
+        const off_t read = isThere() ? ::lseek(file_.get(), 0, SEEK_CUR) : 0;
+        if (!isThere() || ::fstat(file_.get(), &now) != 0 || now.st_size >= read) return false;
+        return ::lseek(file_.get(), 0, SEEK_SET) == 0;
+    }
     // The next bytes of it; empty where there are none yet.
-    [[nodiscard]] std::string_view read(std::string& buffer) const {
-        if (!isThere()) return {};
+    [[nodiscard]] Result<std::string_view> read(std::string& buffer) const {
+        if (!isThere()) return std::string_view();
         const ssize_t count = ::read(file_.get(), buffer.data(), buffer.size());
-        return std::string_view(buffer).substr(0, count > 0 ? static_cast<std::size_t>(count) : 0);
+        if (count < 0) return cannotReadLog(path_, posixReason(errno));
+        return std::string_view(buffer).substr(0, static_cast<std::size_t>(count));
     }
 
   private:
@@ -193,6 +80,7 @@ class LogPart {
     }
 
     UniqueFd file_;
+    std::string path_;
     struct stat opened_ {};
 };
 
@@ -203,62 +91,85 @@ class LogReader {
         : path_(std::move(path)),
           arguments_(arguments),
           console_(console),
-          lines_(path_, arguments, console) {}
+          lines_(arguments, console) {}
 
-    void show() {
-        begin();
+    Status show() {
+        Status status = begin();
+        lines_.showLast();
         bool isPutAside = false;
-        while (arguments_.follows && console_.out.good()) {
+        while (status && arguments_.follows && console_.out.good()) {
             std::this_thread::sleep_for(kFollowInterval);
-            showRest();
+            if (part_.beginsAnew()) lines_.beginFile(path_);
+            status = showRest(part_);
             // Who was writing when it was put aside has had this round to end the line.
-            if (isPutAside) begin();
+            if (status && isPutAside) status = begin();
             isPutAside = !part_.standsAt(path_);
         }
+        return status;
     }
 
   private:
     // Shows what of both parts has not been shown.
-    void begin() {
-        LogPart next(path_);  // before the older part, which it may become in between
-        LogPart older(olderPartOf(path_));
-        if (!older.isSameAs(next)) turnTo(std::move(older), olderPartOf(path_));
-        turnTo(std::move(next), path_);
+    Status begin() {
+        Result<LogPart> next = LogPart::open(path_);  // before the older, which it may become
+        if (!next) return next.error();
+        Result<LogPart> older = LogPart::open(olderPartOf(path_));
+        if (!older) return older.error();
+        const bool isNew = next->isThere() && !next->isSameAs(part_);
+        if (part_.isThere() && !isNew) return {};
+        Status status = beginOlder(*std::move(older), *next);
+        if (!status || !isNew) return status;
+        part_ = *std::move(next);
+        lines_.beginFile(path_);
+        return showRest(part_);
     }
 
-    void turnTo(LogPart part, const std::string& path) {
-        if (!part.isThere() || part.isSameAs(part_)) return;
-        part_ = std::move(part);
-        lines_ = LogLines(path, arguments_, console_);
-        showRest();
+    Status beginOlder(LogPart older, const LogPart& next) {
+        if (older.isSameAs(part_)) {
+            older_ = std::move(part_);
+            return {};
+        }
+        if (!older.isThere() || older.isSameAs(older_) || older.isSameAs(next)) return {};
+        older_ = std::move(older);
+        lines_.beginFile(olderPartOf(path_));
+        return showRest(older_);
     }
 
-    void showRest() {
-        std::string_view piece = part_.read(buffer_);
-        while (!piece.empty() && console_.out.good()) {
-            lines_.add(piece);
-            piece = part_.read(buffer_);
+    Status showRest(const LogPart& part) {
+        Result<std::string_view> piece = part.read(buffer_);
+        while (piece && !piece->empty() && console_.out.good()) {
+            lines_.add(*piece);
+            piece = part.read(buffer_);
         }
         console_.out.flush();
+        return piece ? Status() : Status(piece.error());
     }
 
     const std::string path_;
     const LogArguments& arguments_;
     const Console& console_;
     std::string buffer_ = std::string(kPieceSize, '\0');
-    LogPart part_;  // which is being shown
+    LogPart part_;   // which is being shown
+    LogPart older_;  // the older part that has been shown: open, so that no other gets its number
     LogLines lines_;
 };
+
+Status checkArguments(const LogArguments& arguments) {
+    if (!arguments.application) return {};
+    return checkIdentifier(*arguments.application, kGiveAsShown, "--app");
+}
 
 }  // namespace
 
 int runLog(const LogArguments& arguments, const Console& console) {
+    const Status checked = checkArguments(arguments);
+    if (!checked) return console.fail(checked.error());
     Result<std::unique_ptr<Device>> device = openDevice(arguments.device, DeviceAccess::Look);
     if (!device) return console.fail(device.error());
     const std::string path = (*device)->logPath();
     device->reset();  // whoever watches the log has no use for the database
-    LogReader(path, arguments, console).show();
-    return kExitDone;
+    const Status shown = LogReader(path, arguments, console).show();
+    return shown ? kExitDone : console.fail(shown.error());
 }
 
 }  // namespace appsync

@@ -290,7 +290,7 @@ ROOTS = [
     Entry("the log is a pipe", tree_with(lambda place: (
         (place.device / "log/system.log").unlink(), os.mkfifo(place.device / "log/system.log"))), SYNC, 3),
     Entry("the log is a pipe, log", tree_with(lambda place: (
-        (place.device / "log/system.log").unlink(), os.mkfifo(place.device / "log/system.log"))), ("log", "{device}"), 0),
+        (place.device / "log/system.log").unlink(), os.mkfifo(place.device / "log/system.log"))), ("log", "{device}"), 3),
 ]
 
 
