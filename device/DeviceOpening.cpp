@@ -111,6 +111,19 @@ Status takeLock(const fs::path& device, std::optional<SessionLock>& lock) {
     return {};
 }
 
+Status readyForSession(DeviceDatabase& database) {
+    bool isFormer = false;
+    const Status checked = database.read([&](Database& whole) -> Status {
+        if (Status status = checkDeviceDatabase(whole); !status) return status;
+        const Result<bool> former = isOfFormerSchema(whole);
+        if (!former) return former.error();
+        isFormer = *former;
+        return {};
+    });
+    if (!checked || !isFormer) return checked;
+    return database.change(Durability::OnDisk, bringSchemaUpToDate);
+}
+
 Status openDatabase(const fs::path& device, bool session, OpenedDevice& opened) {
     using Sharing = DeviceDatabase::Sharing;
     auto database = DeviceDatabase::open((device / kDatabaseName).string(),
@@ -118,7 +131,7 @@ Status openDatabase(const fs::path& device, bool session, OpenedDevice& opened) 
     if (!database) return database.error();
     opened.database = std::move(*database);
     if (!session) return {};
-    return opened.database->read([](Database& whole) { return checkDeviceDatabase(whole); });
+    return readyForSession(*opened.database);
 }
 
 Status openFiles(const fs::path& device, OpenedDevice& opened) {

@@ -13,6 +13,7 @@ namespace appsync {
 
 namespace {
 
+// Those that are the same in every version.
 constexpr const char* kTables = R"sql(
 CREATE TABLE applications (
     identifier TEXT PRIMARY KEY,
@@ -53,12 +54,6 @@ CREATE TABLE progress (
     total INTEGER NOT NULL,
     completed INTEGER NOT NULL,
     unpacked INTEGER NOT NULL DEFAULT 0
-) STRICT;
-
-CREATE TABLE uninstalled (
-    identifier TEXT PRIMARY KEY,
-    version TEXT,
-    time INTEGER NOT NULL
 ) STRICT;
 
 CREATE TABLE coordinators (
@@ -146,6 +141,32 @@ CREATE TABLE history (
     identifier TEXT NOT NULL,
     description TEXT NOT NULL
 ) STRICT;
+)sql";
+
+// An `id` of `uninstalled` is never given again, so it tells what came before a session and what
+// during it, whatever the clock does.
+constexpr const char* kTablesOfVersion2 = R"sql(
+CREATE TABLE uninstalled (
+    id INTEGER PRIMARY KEY AUTOINCREMENT,
+    identifier TEXT NOT NULL UNIQUE,
+    version TEXT,
+    time INTEGER NOT NULL
+) STRICT;
+
+CREATE TABLE session (
+    id INTEGER PRIMARY KEY CHECK (id = 1),
+    process INTEGER NOT NULL,
+    started INTEGER NOT NULL,
+    last_uninstall INTEGER NOT NULL
+) STRICT;
+)sql";
+
+constexpr const char* kTablesOfVersion1 = R"sql(
+CREATE TABLE uninstalled (
+    identifier TEXT PRIMARY KEY,
+    version TEXT,
+    time INTEGER NOT NULL
+) STRICT;
 
 CREATE TABLE session (
     id INTEGER PRIMARY KEY CHECK (id = 1),
@@ -153,6 +174,23 @@ CREATE TABLE session (
     started INTEGER NOT NULL
 ) STRICT;
 )sql";
+
+constexpr const char* kSetVersion1Aside =
+    "ALTER TABLE uninstalled RENAME TO former_uninstalled;"
+    "ALTER TABLE session RENAME TO former_session;";
+
+constexpr const char* kTakeOverVersion1 =
+    "INSERT INTO uninstalled (identifier, version, time)"
+    " SELECT identifier, version, time FROM former_uninstalled ORDER BY time, identifier;"
+    "INSERT INTO session (id, process, started, last_uninstall)"
+    " SELECT id, process, started, 0 FROM former_session;"
+    "DROP TABLE former_uninstalled;"
+    "DROP TABLE former_session;"
+    "PRAGMA user_version = 2;";
+
+std::string tablesOf(std::int64_t version) {
+    return std::string(kTables) + (version == 1 ? kTablesOfVersion1 : kTablesOfVersion2);
+}
 
 ErrorRecord halfCreated(const Database& database) {
     return deviceError(DeviceErrorCode::HalfCreated,
@@ -182,9 +220,10 @@ ErrorRecord damaged(const Database& database, const std::string& what) {
                            "sync it");
 }
 
-// The statements of kTables, as the database keeps them.
-std::set<std::string> expectedStatements() {
-    std::string_view script = kTables;
+// The statements of the tables, as the database keeps them.
+std::set<std::string> expectedStatements(std::int64_t version) {
+    const std::string tables = tablesOf(version);
+    std::string_view script = tables;
     std::set<std::string> statements;
     for (std::size_t end = script.find(';'); end != script.npos; end = script.find(';')) {
         const std::size_t begin = script.find_first_not_of(" \n");
@@ -204,10 +243,10 @@ std::string creationOf(const std::string& statement) {
     return kind + statement.substr(name, statement.find_first_of(" (", name) - name);
 }
 
-// Exactly what createDeviceSchema makes: a trigger, a view or an index that somebody has put there
-// would do its work with ours.
-Status checkDefinitions(Database& database) {
-    std::set<std::string> missing = expectedStatements();
+// Exactly what createDeviceSchema makes, or made: a trigger, a view or an index that somebody has
+// put there would do its work with ours.
+Status checkDefinitions(Database& database, std::int64_t version) {
+    std::set<std::string> missing = expectedStatements(version);
     Query rows = database.query(
         "SELECT type, name, sql FROM sqlite_schema WHERE substr(name, 1, 7) <> 'sqlite_'");
     while (rows.next()) {
@@ -229,7 +268,7 @@ Status createDeviceSchema(Database& database) {
     }
     const std::string marks = "PRAGMA application_id = " + std::to_string(kDeviceApplicationId) +
                               "; PRAGMA user_version = " + std::to_string(kDeviceSchemaVersion);
-    const std::string script = std::string("BEGIN;") + kTables + marks + "; COMMIT;";
+    const std::string script = "BEGIN;" + tablesOf(kDeviceSchemaVersion) + marks + "; COMMIT;";
     return database.execute(script.c_str());
 }
 
@@ -244,7 +283,22 @@ Status checkDeviceSchema(Database& database) {
     if (!version) return version.error();
     if (*version > kDeviceSchemaVersion) return newerSchema(database, *version);
     if (*version < 1) return damaged(database, "it has no schema version");
-    return checkDefinitions(database);
+    return checkDefinitions(database, *version);
+}
+
+Result<bool> isOfFormerSchema(Database& database) {
+    const Result<std::int64_t> version = database.integer("PRAGMA user_version");
+    if (!version) return version.error();
+    return *version < kDeviceSchemaVersion;
+}
+
+Status bringSchemaUpToDate(Database& database) {
+    const Result<bool> isFormer = isOfFormerSchema(database);
+    if (!isFormer) return isFormer.error();
+    if (!*isFormer) return {};
+    Status status = database.execute(kSetVersion1Aside);
+    if (status) status = database.execute(kTablesOfVersion2);
+    return status ? database.execute(kTakeOverVersion1) : status;
 }
 
 Status checkDeviceDatabase(Database& database) {

@@ -9,8 +9,9 @@ class Database;
 /// Marks a file as a device's database ("Apps" in SQLite's application_id).
 inline constexpr int kDeviceApplicationId = 0x41707073;
 
-/// The schema that this version reads and writes; docs/device-format.md describes it.
-inline constexpr int kDeviceSchemaVersion = 1;
+/// The schema that this version makes; docs/device-format.md describes it. One of an earlier
+/// version serves whoever looks; a session brings it up to date first.
+inline constexpr int kDeviceSchemaVersion = 2;
 
 /// Makes the tables of an empty database, and marks it as a device's.
 Status createDeviceSchema(Database& database);
@@ -19,6 +20,13 @@ Status createDeviceSchema(Database& database);
 /// holds other tables, indexes, views or triggers than a device's: those of somebody else would
 /// take part in every statement.
 Status checkDeviceSchema(Database& database);
+
+/// Whether an earlier version has made it.
+[[nodiscard]] Result<bool> isOfFormerSchema(Database& database);
+
+/// Makes a database of an earlier version one of this version, in the caller's transaction; nothing
+/// that it holds is lost. No work where it is one already.
+Status bringSchemaUpToDate(Database& database);
 
 /// Reads the whole database and refuses it when it is damaged.
 Status checkDeviceDatabase(Database& database);

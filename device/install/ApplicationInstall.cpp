@@ -90,7 +90,8 @@ BundleRow rowOf(const PackageInfo& info, const NewContainer& container, std::uin
 // A person who uninstalls an application while its install is under way has the last word.
 Status refuseIfUninstalled(Database& database, const std::string& identifier) {
     Query rows = database.query(
-        "SELECT 1 FROM uninstalled JOIN session ON time > started WHERE identifier = ?");
+        "SELECT 1 FROM uninstalled JOIN session ON uninstalled.id > last_uninstall"
+        " WHERE identifier = ?");
     rows.bind(identifier);
     const bool found = rows.next();
     if (Status status = rows.status(); !status) return status;

@@ -284,7 +284,9 @@ Status beginSession(const InstallContext& context) {
     // The next session has to know of it, whatever ends this one.
     return context.database.change(Durability::OnDisk, [](Database& database) {
         return database
-            .query("INSERT OR REPLACE INTO session (id, process, started) VALUES (1, ?, ?)")
+            .query(
+                "INSERT OR REPLACE INTO session (id, process, started, last_uninstall)"
+                " VALUES (1, ?, ?, (SELECT coalesce(max(id), 0) FROM uninstalled))")
             .bind(std::int64_t{::getpid()}, milliseconds(wallNow()))
             .run();
     });

@@ -90,9 +90,8 @@ HistoryRecord historyRecord(const Query& row) {
 std::optional<PropertyList> DeviceInstaller::lookupUninstalled() {
     PropertyList list = PropertyList::map();
     const Status status = database_.read([&](Database& database) {
-        Query rows = database.query(
-            "SELECT identifier, version, time FROM uninstalled"
-            " ORDER BY time, identifier");
+        Query rows =
+            database.query("SELECT identifier, version, time FROM uninstalled ORDER BY rowid");
         while (rows.next()) list.set(rows.text(0), uninstalledEntry(rows));
         return rows.status();
     });

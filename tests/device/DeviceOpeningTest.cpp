@@ -42,7 +42,7 @@ TEST_F(DeviceOpeningTest, creationKeepsWhatWasAskedFor) {
 
 TEST_F(DeviceOpeningTest, creationWritesAheadAndSyncsEachCommit) {
     EXPECT_EQ(number("SELECT journal_mode = 'wal' FROM pragma_journal_mode"), 1);
-    EXPECT_EQ(number("PRAGMA user_version"), 1);
+    EXPECT_EQ(number("PRAGMA user_version"), 2);
 }
 
 TEST_F(DeviceOpeningTest, creationRefusesAPathThatExists) {
@@ -179,6 +179,68 @@ TEST_F(DeviceOpeningTest, aNewerSchemaIsRefusedAndLeftAlone) {
     sql("PRAGMA user_version = 99");
     EXPECT_TRUE(unusable(openSession(devicePath()), DeviceErrorCode::NewerSchema, "99"));
     EXPECT_EQ(number("PRAGMA user_version"), 99);
+}
+
+class DeviceOfVersion1Test : public DeviceOpeningTest {
+  protected:
+    DeviceOfVersion1Test() {
+        sql("DROP TABLE uninstalled; DROP TABLE session;"
+            "CREATE TABLE uninstalled (\n"
+            "    identifier TEXT PRIMARY KEY,\n"
+            "    version TEXT,\n"
+            "    time INTEGER NOT NULL\n"
+            ") STRICT;"
+            "CREATE TABLE session (\n"
+            "    id INTEGER PRIMARY KEY CHECK (id = 1),\n"
+            "    process INTEGER NOT NULL,\n"
+            "    started INTEGER NOT NULL\n"
+            ") STRICT;"
+            "INSERT INTO uninstalled VALUES ('com.example.b', '1.0', 2), ('com.example.a', '2.0', "
+            "1);"
+            "PRAGMA user_version = 1");
+    }
+};
+
+TEST_F(DeviceOfVersion1Test, aLookUsesItAsItIs) {
+    const std::unique_ptr<Device> other = look();
+    EXPECT_TRUE(other->status("com.example.a")->uninstalled);
+    EXPECT_EQ(number("PRAGMA user_version"), 1);
+}
+
+TEST_F(DeviceOfVersion1Test, aPersonRemovesApplicationsFromIt) {
+    sql("INSERT INTO applications VALUES"
+        " ('com.example.c', '1', 'C', 'User', 5, 'container', 'C.app', 'Icon.png', 1, 1)");
+    ASSERT_TRUE(succeeded(look()->uninstall("com.example.c")));
+    EXPECT_TRUE(look()->status("com.example.c")->uninstalled);
+}
+
+TEST_F(DeviceOfVersion1Test, aSessionBringsItUpToDateAndLosesNothing) {
+    ASSERT_TRUE(succeeded(install("com.example.b")));  // in a session that began after its removal
+    EXPECT_EQ(number("PRAGMA user_version"), 2);
+    EXPECT_EQ(number("SELECT count(*) FROM uninstalled WHERE identifier = 'com.example.a'"
+                     " AND version = '2.0' AND time = 1"),
+              1);
+    close();
+    EXPECT_TRUE(openSession(devicePath()).ok());
+}
+
+TEST_F(DeviceOfVersion1Test, aSessionThatWasCutOffIsStillKnown) {
+    sql("INSERT INTO session VALUES (1, 99, 1)");
+    const std::string temporary = rootPath("/var/mobile/tmp") + "/left";
+    std::ofstream(temporary) << "left";
+    ASSERT_TRUE(openSession(devicePath()).ok());
+    EXPECT_FALSE(fs::exists(temporary));
+    EXPECT_EQ(number("SELECT count(*) FROM session"), 0) << "it has ended in order";
+}
+
+TEST_F(DeviceOfVersion1Test, tablesOfTheNextVersionAreNotItsOwn) {
+    sql("DROP TABLE session; CREATE TABLE session (\n"
+        "    id INTEGER PRIMARY KEY CHECK (id = 1),\n"
+        "    process INTEGER NOT NULL,\n"
+        "    started INTEGER NOT NULL,\n"
+        "    last_uninstall INTEGER NOT NULL\n"
+        ") STRICT");
+    EXPECT_TRUE(unusable(openSession(devicePath()), DeviceErrorCode::Damaged, "session"));
 }
 
 TEST_F(DeviceOpeningTest, aDamagedHeader) {

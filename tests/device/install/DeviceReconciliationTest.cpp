@@ -247,7 +247,7 @@ TEST_F(DeviceReconciliationTest, aSessionThatWasCutOffLeavesNoTemporaryFileInABu
     const std::string container = application(kAtlas)->bundleContainerPath;
     const std::string temporary = container + "/.VessikMetadata.plist.appsync-a1b2c3";
     reopenAfter([&] {
-        sql("INSERT INTO session (id, process, started) VALUES (1, 1, 1)");
+        sql("INSERT INTO session (id, process, started, last_uninstall) VALUES (1, 1, 1, 0)");
         write(temporary, "half of it");
         write(container + "/.hidden", "the application's own");
     });

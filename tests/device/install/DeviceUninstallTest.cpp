@@ -7,6 +7,7 @@ namespace appsync {
 namespace {
 
 constexpr const char* kAtlas = "com.example.atlas";
+constexpr const char* kBrook = "com.example.brook";
 
 class DeviceUninstallTest : public DeviceFixture {
   protected:
@@ -168,7 +169,6 @@ TEST_F(DeviceUninstallTest, aPersonRemovesApplicationAndPlaceholderAtOnce) {
 TEST_F(DeviceUninstallTest, anInstallThatIsUnderWayDoesNotBringItBack) {
     ASSERT_TRUE(succeeded(install(kAtlas, "1.0")));
     ASSERT_TRUE(succeeded(installPlaceholder(kAtlas)));
-    sql("UPDATE session SET started = started - 1000");
     ASSERT_TRUE(succeeded(look()->uninstall(kAtlas)));
     EXPECT_TRUE(refusedBy(install(kAtlas, "2.0"), RegistryErrorCode::Uninstalled, kAtlas));
     EXPECT_FALSE(either(kAtlas));
@@ -182,6 +182,33 @@ TEST_F(DeviceUninstallTest, theNextSessionBringsItBack) {
     ASSERT_TRUE(succeeded(device().uninstall(kAtlas)));
     close();
     EXPECT_TRUE(succeeded(install(kAtlas)));
+}
+
+TEST_F(DeviceUninstallTest, aClockThatWasSetBackDoesNotMakeAnUninstallOneOfThisSession) {
+    ASSERT_TRUE(succeeded(install(kAtlas)));
+    ASSERT_TRUE(succeeded(device().uninstall(kAtlas)));
+    close();
+    static_cast<void>(device());
+    sql("UPDATE uninstalled SET time = time + 86400000");
+    EXPECT_TRUE(succeeded(install(kAtlas)));
+}
+
+TEST_F(DeviceUninstallTest, aClockThatIsSetBackDoesNotMakeAnUninstallOneOfBefore) {
+    ASSERT_TRUE(succeeded(install(kAtlas)));
+    ASSERT_TRUE(succeeded(look()->uninstall(kAtlas)));
+    sql("UPDATE uninstalled SET time = time - 86400000");
+    EXPECT_TRUE(refusedBy(install(kAtlas), RegistryErrorCode::Uninstalled, kAtlas));
+}
+
+TEST_F(DeviceUninstallTest, oneThatTheHostHasTakenNoteOfLeavesItsNumberToNobody) {
+    ASSERT_TRUE(succeeded(install(kAtlas)));
+    ASSERT_TRUE(succeeded(install(kBrook)));
+    ASSERT_TRUE(succeeded(device().uninstall(kAtlas)));
+    close();
+    static_cast<void>(device());
+    sql("DELETE FROM uninstalled");
+    ASSERT_TRUE(succeeded(look()->uninstall(kBrook)));
+    EXPECT_TRUE(refusedBy(install(kBrook), RegistryErrorCode::Uninstalled, kBrook));
 }
 
 TEST_F(DeviceUninstallTest, whatTheRegistryRemovesIsNotOnTheInstallersList) {

@@ -47,6 +47,17 @@ TEST_F(DeviceServicesTest, theInstallerListsWhatAPersonRemoved) {
     EXPECT_TRUE(list->find(kBrook));
 }
 
+TEST_F(DeviceServicesTest, theInstallersListIsInTheOrderOfTheRemovalsWhateverTheClockSaid) {
+    for (const char* identifier : {kBrook, kAtlas}) {
+        ASSERT_TRUE(succeeded(install(identifier)));
+        ASSERT_TRUE(succeeded(device().uninstall(identifier)));
+    }
+    sql("UPDATE uninstalled SET time = time - 86400000 WHERE identifier = 'com.example.atlas'");
+    const std::optional<PropertyList> list = platform().installer.lookupUninstalled();
+    ASSERT_EQ(list->size(), 2U);
+    EXPECT_EQ(list->entries()[0].key, kBrook);
+}
+
 TEST_F(DeviceServicesTest, clearingTakesNamedIdentifiersOffTheList) {
     for (const char* identifier : {kAtlas, kBrook}) {
         ASSERT_TRUE(succeeded(install(identifier)));

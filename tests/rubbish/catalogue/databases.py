@@ -214,7 +214,7 @@ TABLES = {
     "applications": ("install_type", "bytes", "arrived"),
     "settings": ("value",),
     "history": ("time", "kind", "step", "party", "phase", "success"),
-    "session": ("process", "started"),
+    "session": ("process", "started", "last_uninstall"),
     "failures": ("time", "code"),
     "denials": ("time", "next_try"),
     "uninstalled": ("time",),
@@ -222,11 +222,11 @@ TABLES = {
     "promises": ("role", "position", "client", "space", "percent"),
 }
 
-ROWS = ("INSERT OR IGNORE INTO session VALUES (1, 1, 1)",
+ROWS = ("INSERT OR IGNORE INTO session VALUES (1, 1, 1, 0)",
         "INSERT OR IGNORE INTO failures VALUES ('%s', 1, 'x', 1, 'x')" % A,
         "INSERT OR IGNORE INTO denials VALUES ('%s', 1, 1)" % A,
         "INSERT OR IGNORE INTO running VALUES ('%s')" % A,
-        "INSERT OR IGNORE INTO uninstalled VALUES ('com.example.gone', '1', 1)",
+        "INSERT OR IGNORE INTO uninstalled VALUES (1, 'com.example.gone', '1', 1)",
         "INSERT OR IGNORE INTO coordinators (id, identifier, kind, client, created) VALUES (1, '%s', 1, 2, 1)" % A,
         "INSERT OR IGNORE INTO promises VALUES (1, 0, 0, 'x', 2, NULL, 1, 1, 0, 0)")
 
