@@ -126,6 +126,9 @@ struct CoordinatorRecord {
     std::optional<CoordinationClient> waitsForClient;
     /// The last failure of an install of this application, if there was one.
     std::optional<ErrorRecord> error;
+
+    /// Whether it brings back what a restore has left a placeholder of.
+    [[nodiscard]] bool restores() const { return kind.starts_with("restoring"); }
 };
 
 /// The last failure of an install. A later success takes it away.

@@ -117,7 +117,7 @@ class Sending {
             offloaded_ = status->placeholder;
             return {};
         }
-        if (status->coordinator && status->coordinator->kind.starts_with("restoring")) {
+        if (status->coordinator && status->coordinator->restores()) {
             return failure("a restore brought " + arguments_.identifier +
                                " back, and its package is the store's to bring",
                            "see appsync store");
@@ -142,6 +142,7 @@ class Sending {
         const Result<std::vector<CoordinatorRecord>> coordinators = device_->coordinators();
         if (!coordinators) return unusable(coordinators.error());
         StandingRules rules;
+        rules.leavesOthers = true;
         rules.arrivedVersion = [this](const std::string& identifier) {
             return versionOfArrived(*device_, identifier);
         };
@@ -175,7 +176,9 @@ class Sending {
             facts_.reconciled();
             return {};
         }
-        return bringBack(*device_, service, *offloaded_, library_.packages.front(), facts_,
+        const bool hasArrived = standing_.arrived.contains(arguments_.identifier);
+        return bringBack(*device_, service, *offloaded_,
+                         hasArrived ? nullptr : &library_.packages.front(), facts_,
                          [this] { return signals_.stopRequested().load(); });
     }
 

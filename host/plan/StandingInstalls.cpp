@@ -10,14 +10,12 @@
 #include "device/values/DeviceError.h"
 #include "device/values/PackageIdentifier.h"
 #include "host/plan/SyncPlan.h"
-#include "platform/InstallProgressRecord.h"
 #include "system/RootDirectory.h"
 
 namespace appsync {
 namespace {
 
 constexpr std::string_view kPackagePromiseSuffix = "-Asset";
-constexpr std::string_view kInitiating = "initiating";
 constexpr std::string_view kUpdating = "updating";
 
 bool hasPackage(const CoordinatorRecord& coordinator) {
@@ -34,18 +32,14 @@ class TakingUp {
              const StandingRules& rules)
         : plan_(plan), rules_(rules) {
         for (const ApplicationRecord& record : present) {
-            if (!record.isPlaceholder) {
-                installed_[record.identifier] = record.version.value_or("");
-            }
-            if (record.isPlaceholder && record.installType == kInstallTypeSync) {
-                expectedVersions_[record.identifier] = record.version.value_or("");
-            }
+            if (record.isPlaceholder) continue;
+            installed_[record.identifier] = record.version.value_or("");
         }
     }
 
     void add(const CoordinatorRecord& coordinator) {
         if (coordinator.client != SyncClientID) return leaveTo(coordinator);
-        if (coordinator.kind != kInitiating && coordinator.kind != kUpdating) return;
+        if (coordinator.restores()) return addRestored(coordinator);
         if (!goesOn(coordinator)) {
             standing_.obsolete.push_back(coordinator.identifier);
         } else if (hasPackage(coordinator)) {
@@ -53,6 +47,7 @@ class TakingUp {
             if (PlannedInstall* planned = find(coordinator.identifier)) {
                 planned->hasArrived = true;
                 planned->isInstalledUnasked = coordinator.isComplete;
+                if (!planned->doubt.empty()) planned->newVersion = versionOf(planned->identifier);
             } else if (coordinator.isComplete) {
                 addLeftOver(coordinator.identifier);
             }
@@ -77,25 +72,45 @@ class TakingUp {
         const std::string& identifier = coordinator.identifier;
         const bool isUpdate = installed_.contains(identifier);
         if (isUpdate != (coordinator.kind == kUpdating)) return false;
-        const bool isRemoved =
-            std::find(plan_.remove.begin(), plan_.remove.end(), identifier) != plan_.remove.end();
-        if (isRemoved) return false;
+        if (isToBeRemoved(identifier)) return false;
         const PlannedInstall* planned = find(identifier);
-        if (!hasPackage(coordinator)) return planned != nullptr;
-        if (planned == nullptr) return !isUnwanted(identifier);
-        return planned->newVersion.empty() || versionOf(identifier) == planned->newVersion;
+        if (planned == nullptr) return rules_.leavesOthers && hasPackage(coordinator);
+        return !hasPackage(coordinator) || isAskedFor(*planned);
     }
 
-    // Of a package that has arrived.
-    std::string versionOf(const std::string& identifier) {
-        const auto arrived =
-            rules_.arrivedVersion ? rules_.arrivedVersion(identifier) : std::nullopt;
-        return arrived ? *arrived : expectedVersions_[identifier];
+    // Of a package that has arrived. Where the library has no good one, any version is as good.
+    [[nodiscard]] bool isAskedFor(const PlannedInstall& planned) const {
+        const std::optional<std::string> arrived = rules_.arrivedVersion(planned.identifier);
+        return arrived && (!planned.doubt.empty() || *arrived == planned.newVersion);
     }
 
-    [[nodiscard]] bool isUnwanted(const std::string& identifier) const {
-        return plan_.absent.contains(identifier) ||
-               (rules_.isUnwanted && rules_.isUnwanted(identifier));
+    [[nodiscard]] bool isToBeRemoved(const std::string& identifier) const {
+        return std::ranges::find(plan_.remove, identifier) != plan_.remove.end();
+    }
+
+    [[nodiscard]] std::string versionOf(const std::string& identifier) const {
+        return rules_.arrivedVersion(identifier).value_or("");
+    }
+
+    void addRestored(const CoordinatorRecord& coordinator) {
+        const std::string& identifier = coordinator.identifier;
+        if (!coordinator.placeholderStands) {
+            if (find(identifier) != nullptr) standing_.obsolete.push_back(identifier);
+        } else if (coordinator.isComplete && hasPackage(coordinator) &&
+                   !isToBeRemoved(identifier)) {
+            standing_.arrived.insert(identifier);
+            addLeftOver(identifier);
+            unskip(identifier);
+        }
+    }
+
+    // What the library holds in the version that comes is not left alone any more.
+    void unskip(const std::string& identifier) {
+        if (!rules_.libraryVersion || rules_.libraryVersion(identifier) != versionOf(identifier)) {
+            return;
+        }
+        std::erase_if(plan_.skipped,
+                      [&](const PlannedSkip& each) { return each.identifier == identifier; });
     }
 
     void addLeftOver(const std::string& identifier) {
@@ -121,8 +136,7 @@ class TakingUp {
 
     SyncPlan& plan_;
     const StandingRules& rules_;
-    std::map<std::string, std::string> installed_;         // versions
-    std::map<std::string, std::string> expectedVersions_;  // of what is to come
+    std::map<std::string, std::string> installed_;  // versions
     StandingInstalls standing_;
 };
 

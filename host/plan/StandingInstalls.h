@@ -25,16 +25,18 @@ struct StandingInstalls {
     std::vector<std::string> obsolete;
 };
 
-/// What rules installs out that an earlier session has begun.
+/// By what the installs are judged that an earlier session has begun.
 struct StandingRules {
+    using Version = std::function<std::optional<std::string>(const std::string& identifier)>;
     /// Device policy allows no install at all.
     bool isForbidden = false;
-    /// Whether an application that the plan does not name must not come either. Nothing: none is.
-    std::function<bool(const std::string& identifier)> isUnwanted = nullptr;
-    /// The version of the package that has arrived for an application. Nothing, or where it gives
-    /// nothing: the one that the placeholder shows, which the todo list may have left out.
-    std::function<std::optional<std::string>(const std::string& identifier)> arrivedVersion =
-        nullptr;
+    /// What the plan does not name is none of the session's business: it goes on.
+    bool leavesOthers = false;
+    /// The version of the package that has arrived for an application; nothing when there is none
+    /// that can be read.
+    Version arrivedVersion = nullptr;
+    /// The version that the library holds of an application; nothing when it holds none.
+    Version libraryVersion = nullptr;
 };
 
 /// The version that the package says which waits on the device for an application; nothing when
@@ -50,10 +52,11 @@ struct StandingRules {
 /// `present` is everything that the device holds.
 ///
 /// A coordinator of the sync client goes on where the plan still asks for the same version of the
-/// same application; one whose package has arrived also where the plan asks for nothing, as the
-/// device has promised the install to whoever looks at its home screen; but not where the
-/// application is to be removed, or the rules are against it. Everything else of the sync client's
-/// is obsolete. Coordinators of a restore are nobody's business here.
+/// same application, unless that is to be removed, or the rules are against it. Everything else of
+/// the sync client's is obsolete: after the session the device holds what the plan says, whatever
+/// had arrived before. A restore is not the plan's to judge: where the store has delivered the
+/// package, the device installs it, and where a crash has left no placeholder, it is in the way of
+/// what the plan asks for.
 [[nodiscard]] StandingInstalls takeUp(SyncPlan& plan,
                                       const std::vector<CoordinatorRecord>& coordinators,
                                       const std::vector<ApplicationRecord>& present,

@@ -97,7 +97,6 @@ class Planner {
         if (!named_.insert(identifier).second) return;
         const auto found = present_.find(identifier);
         if (found == present_.end()) {
-            plan_.absent.insert(identifier);
             skip(identifier, "it is not on the device", false);
         } else if (found->second.isSystem()) {
             skip(identifier, "it belongs to the system", true);
@@ -228,7 +227,6 @@ class StagedPlanner {
         if (!removals_.insert(identifier).second) return;
         const auto found = present_.find(identifier);
         if (found == present_.end()) {
-            plan_.absent.insert(identifier);
             plan_.skipped.push_back({identifier, "it is not on the device", false});
             return;
         }
@@ -308,11 +306,12 @@ SyncPlan allowedBy(const DeviceSettings& settings, SyncPlan plan) {
     }
     if (settings.installation == PolicyAnswer::No) {
         for (auto* installs : {&plan.install, &plan.update}) {
-            for (PlannedInstall& each : *installs) {
+            for (const PlannedInstall& each : *installs) {
+                if (each.isLeftOver) continue;  // of a restore, which no policy keeps from coming
                 plan.skipped.push_back(
-                    {std::move(each.identifier), std::string(kInstallationForbidden), true});
+                    {each.identifier, std::string(kInstallationForbidden), true});
             }
-            installs->clear();
+            std::erase_if(*installs, [](const PlannedInstall& each) { return !each.isLeftOver; });
         }
     }
     for (auto* installs : {&plan.install, &plan.update}) {

@@ -49,7 +49,7 @@ struct PlannedInstall {
     std::uint64_t unpackedBytes = 0;  // that it takes when installed
     bool hasArrived = false;          // its package is on the device already, and travels no more
     bool isInstalledUnasked = false;  // the device installs it with nothing more being done
-    bool isLeftOver = false;          // only an earlier session has asked for it
+    bool isLeftOver = false;          // the plan does not ask for it: it comes all the same
     std::string doubt = {};           // why no good package of it can be sent, if there is none
 };
 
@@ -81,8 +81,6 @@ struct SyncPlan {
     std::vector<PlannedInstall> install;
     std::vector<PlannedInstall> update;
     std::vector<std::string> remove;
-    /// To be removed as well, and not on the device: no install of these may bring them there.
-    std::set<std::string> absent;
     std::vector<PlannedSkip> skipped;
     /// What is asked for but cannot even be tried.
     std::vector<SyncFailure> failed;

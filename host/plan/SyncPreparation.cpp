@@ -1,5 +1,7 @@
 #include "host/plan/SyncPreparation.h"
 
+#include <optional>
+#include <set>
 #include <string>
 #include <utility>
 #include <vector>
@@ -20,7 +22,7 @@ class Preparing {
         options.bringsOffloaded = settings_.coordination;
         sync_.plan = makePlan(library_, present_, options);
         sync_.givenUp = stagedWorkOn(device_);
-        return finish(options.mirror);
+        return finish();
     }
 
     Result<SyncPreparation> ofStagingArea() {
@@ -37,7 +39,7 @@ class Preparing {
             sync_.plan.notes.emplace_back("this takes up the session that was interrupted");
         }
         if (sync_.staged.error) sync_.plan.failed.push_back(unusableList());
-        return finish(false);
+        return finish();
     }
 
   private:
@@ -48,6 +50,20 @@ class Preparing {
         const Result<DeviceSettings> settings = device_.settings();
         if (!settings) return unusable(settings.error());
         settings_ = *settings;
+        return settings_.coordination ? Status() : leaveOutWhatIsGivenUp();
+    }
+
+    // A session without coordination begins by giving up every coordinator, with its placeholder.
+    Status leaveOutWhatIsGivenUp() {
+        const Result<std::vector<CoordinatorRecord>> coordinators = device_.coordinators();
+        if (!coordinators) return unusable(coordinators.error());
+        std::set<std::string> givenUp;
+        for (const CoordinatorRecord& each : *coordinators) {
+            if (each.restores() && each.placeholderStands) givenUp.insert(each.identifier);
+        }
+        std::erase_if(present_, [&](const ApplicationRecord& each) {
+            return each.isPlaceholder && givenUp.contains(each.identifier);
+        });
         return {};
     }
 
@@ -58,31 +74,30 @@ class Preparing {
                                              : "; write the staging area anew")};
     }
 
-    Result<SyncPreparation> finish(bool isMirror) {
-        Status status = takeUpStanding(isMirror);
+    Result<SyncPreparation> finish() {
+        Status status = takeUpStanding();
         if (status) status = checkSpace();
         if (!status) return status.error();
         return std::move(sync_);
     }
 
-    Status takeUpStanding(bool isMirror) {
+    Status takeUpStanding() {
         if (!settings_.coordination) return {};  // a session begins by dropping what stands
         const Result<std::vector<CoordinatorRecord>> coordinators = device_.coordinators();
         if (!coordinators) return unusable(coordinators.error());
-        sync_.standing = takeUp(sync_.plan, *coordinators, present_, standingRules(isMirror));
+        sync_.standing = takeUp(sync_.plan, *coordinators, present_, standingRules());
         return {};
     }
 
-    // What cannot be read in a mirrored library may be the package of any application.
-    [[nodiscard]] StandingRules standingRules(bool isMirror) const {
+    [[nodiscard]] StandingRules standingRules() const {
         StandingRules rules;
         rules.isForbidden = settings_.installation == PolicyAnswer::No;
         rules.arrivedVersion = [this](const std::string& identifier) {
             return versionOfArrived(device_, identifier);
         };
-        if (!isMirror || !library_.faults.empty()) return rules;
-        rules.isUnwanted = [this](const std::string& identifier) {
-            return library_.find(identifier) == nullptr;
+        rules.libraryVersion = [this](const std::string& identifier) {
+            const LibraryPackage* package = library_.find(identifier);
+            return package != nullptr ? std::optional(package->version) : std::nullopt;
         };
         return rules;
     }

@@ -238,7 +238,7 @@ const SessionEnd& Session::end(const std::vector<std::string>& known) {
         });
         awaitCoordinatedInstalls();
         cancelWhere([this](const CoordinatorRecord& each) {
-            return takenUp_.contains(each.identifier) && !each.isComplete;
+            return takenUp_.contains(each.identifier) && !each.isComplete && !each.restores();
         });
     }
     end_.isInterrupted = isCutShort_;

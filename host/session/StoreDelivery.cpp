@@ -111,23 +111,27 @@ Result<std::uint64_t> sendAsStore(Device& device, InstallCoordinatorService& ser
 }  // namespace
 
 SessionEnd bringBack(Device& device, InstallCoordinatorService& service,
-                     const ApplicationRecord& application, const LibraryPackage& package,
+                     const ApplicationRecord& application, const LibraryPackage* package,
                      SessionFacts& facts, const std::function<bool()>& stopRequested) {
     const std::string& identifier = application.identifier;
-    device.letCoordinatedInstallsGo();
     facts.reconciled();
     facts.requested(identifier);
-    if (const Status awaited = awaitPackage(service, application); !awaited) {
+    // One that is complete must not be installed before it has been looked at.
+    const Status awaited = awaitPackage(service, application);
+    device.letCoordinatedInstallsGo();
+    if (!awaited) {
         facts.failed(identifier, awaited.error().description());
         return {};
     }
-    const Result<std::uint64_t> sent = sendAsStore(device, service, package, stopRequested);
-    if (!sent) {
-        facts.failed(identifier, sent.error().description());
-        device.cancelCoordinator(identifier, SyncClientID).ignore();
-        return {};
+    if (package != nullptr) {
+        const Result<std::uint64_t> sent = sendAsStore(device, service, *package, stopRequested);
+        if (!sent) {
+            facts.failed(identifier, sent.error().description());
+            device.cancelCoordinator(identifier, SyncClientID).ignore();
+            return {};
+        }
+        facts.sent(*sent);
     }
-    facts.sent(*sent);
     while (!device.waitForCoordinatedInstalls(kLookInterval)) {
         if (stopRequested()) return {};
     }

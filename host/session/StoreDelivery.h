@@ -36,10 +36,10 @@ Status awaitPackage(InstallCoordinatorService& service, const ApplicationRecord&
                                                      const PackageSender::Progress& progress);
 
 /// Brings one offloaded application of the system back as the store would, in the place of a
-/// session with the plug-in, and waits for its install; `facts` hears what becomes of it.
-/// `stopRequested` is asked now and then.
+/// session with the plug-in, and waits for its install; `facts` hears what becomes of it. The
+/// package is null where it waits on the device already. `stopRequested` is asked now and then.
 SessionEnd bringBack(Device& device, InstallCoordinatorService& service,
-                     const ApplicationRecord& application, const LibraryPackage& package,
+                     const ApplicationRecord& application, const LibraryPackage* package,
                      SessionFacts& facts, const std::function<bool()>& stopRequested);
 
 }  // namespace appsync

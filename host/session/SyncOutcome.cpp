@@ -119,7 +119,7 @@ class Summarizer {
         }
     }
 
-    // What an interrupted session had brought, and nobody asks for any more.
+    // What an earlier session had brought, and the plan did not know of.
     void addUnplannedInstalls() {
         for (const std::string& identifier : facts_.installedIdentifiers()) {
             const bool isThere = versions_.contains(identifier) && !installs_.contains(identifier);

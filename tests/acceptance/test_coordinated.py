@@ -3,19 +3,17 @@
 import json
 import os
 import plistlib
-import shutil
 import signal
-import sqlite3
 import time
 
 import pytest
 
 import packages
 from conftest import Device, names_of
+from delivery import STAGING, deliver
 from staging import install, remove, stage
 
 A, B = "com.example.app00", "com.example.app01"
-STAGING = "/var/mobile/Media/PublicStaging"
 
 
 @pytest.fixture
@@ -193,19 +191,6 @@ def test_an_update_that_waits_goes_on_in_the_next_session(appsync, device, libra
     assert device.placeholders() == [] and coordinators(device) == {}
 
 
-def test_an_update_that_goes_on_is_an_update_though_the_library_lacks_it(
-        appsync, device, library, waiting_update):
-    waiting_update.kill()
-    waiting_update.communicate()
-    appsync("quit", device.path, A)
-    os.remove(os.path.join(library, A + ".zip"))
-    plan = appsync.json("plan", device.path, library)
-    assert names_of(plan["update"]) == [A] and plan["install"] == []
-    result = device.sync(library)
-    assert result["updated"] == [A] and result["installed"] == [] and result["bytes"] == 0
-    assert device.versions()[A] == "2.0" and coordinators(device) == {}
-
-
 def test_an_update_that_goes_on_beside_a_package_sent_is_an_update(
         appsync, device, library, waiting_update, tmp_path):
     waiting_update.kill()
@@ -248,18 +233,6 @@ def interrupted(appsync, device, large_library):
     sync.communicate()
     assert sorted(coordinators(device)) == [A, B]
     return large_library
-
-
-def deliver(device, library, identifier):
-    """The package arrives as the session dies: its install has not begun."""
-    place = STAGING + "/" + identifier + ".zip"
-    shutil.copyfile(os.path.join(library, identifier + ".zip"), device.inside(place))
-    with sqlite3.connect(os.path.join(device.path, "device.db")) as database:
-        changed = database.execute(
-            "UPDATE promises SET complete = 1, percent = 1000, path = ? WHERE name = ?",
-            (place, identifier + "-Asset")).rowcount
-    database.close()
-    assert changed == 1
 
 
 @pytest.fixture
@@ -305,9 +278,11 @@ def test_a_plan_counts_on_nothing_that_stands_where_coordination_was_turned_off(
     assert device.sync(delivered)["installed"] == [A]
 
 
-def test_what_had_arrived_is_installed_though_the_library_lacks_it(device, delivered):
+def test_what_had_arrived_does_not_come_where_the_library_lacks_it(device, delivered):
     os.remove(os.path.join(delivered, B + ".zip"))
-    assert names_of(device.sync(delivered)["installed"]) == [A, B]
+    assert names_of(device.sync(delivered)["installed"]) == [A]
+    assert list(device.apps()) == [A] and device.placeholders() == [] and coordinators(device) == {}
+    assert os.listdir(device.inside(STAGING)) == []
 
 
 def test_why_names_the_promise_that_is_missing(appsync, device, interrupted):

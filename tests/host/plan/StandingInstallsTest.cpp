@@ -5,11 +5,13 @@
 
 #include <fstream>
 #include <iterator>
+#include <map>
+#include <optional>
+#include <string>
 
 #include "device/values/DeviceRecords.h"
 #include "host/plan/StagingArea.h"
 #include "host/plan/SyncPlan.h"
-#include "platform/InstallProgressRecord.h"
 #include "platform/PropertyList.h"
 #include "tests/host/HostFixture.h"
 
@@ -22,8 +24,23 @@ using testing::IsEmpty;
 
 class StandingInstallsTest : public testing::Test {
   protected:
-    // A coordinator of the sync client, by default of a first install.
+    StandingInstallsTest() {
+        rules.arrivedVersion = versionIn(arrived);
+        rules.libraryVersion = versionIn(library);
+    }
+
+    using Versions = std::map<std::string, std::string>;
+    static StandingRules::Version versionIn(const Versions& versions) {
+        return [&versions](const std::string& identifier) {
+            const auto found = versions.find(identifier);
+            return found == versions.end() ? std::nullopt : std::optional(found->second);
+        };
+    }
+
+    // A coordinator of the sync client, by default of a first install; its package, where it has
+    // one, is of version 2.
     CoordinatorRecord& stands(const char* identifier, bool hasPackage) {
+        if (hasPackage) arrived[identifier] = "2";
         CoordinatorRecord record;
         record.identifier = identifier;
         record.kind = "initiating";
@@ -32,15 +49,6 @@ class StandingInstallsTest : public testing::Test {
                             SyncClientID, false}};
         record.isComplete = hasPackage;
         return coordinators.emplace_back(record);
-    }
-
-    void placeholder(const char* identifier, const char* version) {
-        ApplicationRecord record;
-        record.identifier = identifier;
-        if (version != nullptr) record.version = version;
-        record.isPlaceholder = true;
-        record.installType = kInstallTypeSync;
-        present.push_back(record);
     }
 
     void installed(const char* identifier) {
@@ -56,6 +64,8 @@ class StandingInstallsTest : public testing::Test {
 
     StandingInstalls taken() { return takeUp(plan, coordinators, present, rules); }
 
+    Versions arrived;
+    Versions library;
     StandingRules rules;
     SyncPlan plan;
     std::vector<CoordinatorRecord> coordinators;
@@ -64,7 +74,6 @@ class StandingInstallsTest : public testing::Test {
 
 TEST_F(StandingInstallsTest, APackageThatHasArrivedTravelsNoMore) {
     planInstall("com.a", "2");
-    placeholder("com.a", "2");
     stands("com.a", true);
     const StandingInstalls standing = taken();
     EXPECT_THAT(standing.arrived, ElementsAre("com.a"));
@@ -76,7 +85,6 @@ TEST_F(StandingInstallsTest, APackageThatHasArrivedTravelsNoMore) {
 
 TEST_F(StandingInstallsTest, WhatLacksAnotherPieceIsAskedForAgainButNotSent) {
     planInstall("com.a", "2");
-    placeholder("com.a", "2");
     stands("com.a", true).isComplete = false;
     EXPECT_THAT(taken().arrived, ElementsAre("com.a"));
     EXPECT_EQ(*todoListOf(plan).elements()[0].findString("operation"), "install");
@@ -84,55 +92,49 @@ TEST_F(StandingInstallsTest, WhatLacksAnotherPieceIsAskedForAgainButNotSent) {
 
 TEST_F(StandingInstallsTest, APackageOfAnotherVersionIsObsolete) {
     planInstall("com.a", "3");
-    placeholder("com.a", "2");
     stands("com.a", true);
     EXPECT_THAT(taken().obsolete, ElementsAre("com.a"));
     EXPECT_EQ(plan.bytes(), 100U);
 }
 
-TEST_F(StandingInstallsTest, ThePackageThatArrivedSaysItsVersionWhereTheTodoListSaidNone) {
-    for (const char* identifier : {"com.a", "com.b", "com.c"}) {
-        planInstall(identifier, "2");
-        placeholder(identifier, nullptr);
-        stands(identifier, true);
-    }
-    rules.arrivedVersion = [](const std::string& identifier) {
-        return identifier == "com.c"
-                   ? std::nullopt
-                   : std::optional<std::string>(identifier == "com.a" ? "2" : "1");
-    };
-    const StandingInstalls standing = taken();
-    EXPECT_THAT(standing.arrived, ElementsAre("com.a"));
-    EXPECT_THAT(standing.obsolete, ElementsAre("com.b", "com.c"));
+TEST_F(StandingInstallsTest, APackageThatCannotBeReadIsObsolete) {
+    planInstall("com.a", "2");
+    stands("com.a", true);
+    arrived.clear();
+    EXPECT_THAT(taken().obsolete, ElementsAre("com.a"));
 }
 
-TEST_F(StandingInstallsTest, ThePackageThatArrivedSaysItsVersionWhateverTheTodoListSaid) {
-    planInstall("com.a", "2");
-    placeholder("com.a", "5");
+TEST_F(StandingInstallsTest, APackageWithoutAVersionIsNotOfAnyVersion) {
+    planInstall("com.a", "");
     stands("com.a", true);
-    placeholder("com.b", nullptr);
-    stands("com.b", true);
-    rules.arrivedVersion = [](const std::string&) { return std::optional<std::string>("2"); };
-    EXPECT_THAT(taken().arrived, ElementsAre("com.a", "com.b"));
-    ASSERT_EQ(plan.install.size(), 2U);
-    EXPECT_EQ(plan.install[1].newVersion, "2");
+    EXPECT_THAT(taken().obsolete, ElementsAre("com.a"));
+}
+
+TEST_F(StandingInstallsTest, WhereTheLibraryHasNoPackageTheOneThatArrivedIsAsGood) {
+    planInstall("com.a", "");
+    plan.install[0].doubt = "there is none";
+    stands("com.a", true);
+    EXPECT_THAT(taken().arrived, ElementsAre("com.a"));
+    EXPECT_EQ(plan.install[0].newVersion, "2");
 }
 
 TEST_F(StandingInstallsTest, WhatIsStillToBeSentGoesOnWhateverTheVersion) {
     planInstall("com.a", "3");
-    placeholder("com.a", "2");
     stands("com.a", false);
     const StandingInstalls standing = taken();
     EXPECT_THAT(standing.arrived, IsEmpty());
     EXPECT_THAT(standing.obsolete, IsEmpty());
 }
 
-TEST_F(StandingInstallsTest, WhatNobodyAsksForIsObsoleteUnlessItHasArrived) {
+TEST_F(StandingInstallsTest, WhatNobodyAsksForIsObsoleteThoughItHasArrived) {
     stands("com.a", false);
     stands("com.b", true);
+    installed("com.c");
+    stands("com.c", true).kind = "updating";
     const StandingInstalls standing = taken();
-    EXPECT_THAT(standing.obsolete, ElementsAre("com.a"));
-    EXPECT_THAT(standing.arrived, ElementsAre("com.b"));
+    EXPECT_THAT(standing.obsolete, ElementsAre("com.a", "com.b", "com.c"));
+    EXPECT_THAT(standing.arrived, IsEmpty());
+    EXPECT_TRUE(plan.empty());
 }
 
 TEST_F(StandingInstallsTest, WhatIsToBeRemovedIsObsolete) {
@@ -142,55 +144,29 @@ TEST_F(StandingInstallsTest, WhatIsToBeRemovedIsObsolete) {
     EXPECT_THAT(taken().obsolete, ElementsAre("com.a"));
 }
 
-TEST_F(StandingInstallsTest, ThePlanNamesWhatTheDeviceInstallsUnasked) {
-    placeholder("com.a", "2");
+TEST_F(StandingInstallsTest, ASessionThatLeavesOthersNamesWhatTheDeviceInstallsUnasked) {
+    rules.leavesOthers = true;
     stands("com.a", true);
     installed("com.b");
-    placeholder("com.b", "3");
     stands("com.b", true).kind = "updating";
     stands("com.c", true).isComplete = false;
-    EXPECT_THAT(taken().arrived, ElementsAre("com.a", "com.b", "com.c"));
+    stands("com.d", false);
+    const StandingInstalls standing = taken();
+    EXPECT_THAT(standing.arrived, ElementsAre("com.a", "com.b", "com.c"));
+    EXPECT_THAT(standing.obsolete, ElementsAre("com.d"));
     ASSERT_EQ(plan.install.size(), 1U);
     EXPECT_EQ(plan.install[0].identifier, "com.a");
     EXPECT_EQ(plan.install[0].newVersion, "2");
     ASSERT_EQ(plan.update.size(), 1U);
     EXPECT_EQ(plan.update[0].identifier, "com.b");
     EXPECT_EQ(plan.update[0].oldVersion, "1");
-    EXPECT_EQ(plan.update[0].newVersion, "3");
+    EXPECT_EQ(plan.update[0].newVersion, "2");
     EXPECT_EQ(plan.needed(), 0U);
     EXPECT_THAT(todoListOf(plan).elements(), IsEmpty());
 }
 
-TEST_F(StandingInstallsTest, WhatIsToBeAbsentIsObsoleteThoughItHasArrived) {
-    plan.absent = {"com.a"};
-    stands("com.a", true);
-    const StandingInstalls standing = taken();
-    EXPECT_THAT(standing.obsolete, ElementsAre("com.a"));
-    EXPECT_THAT(standing.arrived, IsEmpty());
-}
-
-TEST_F(StandingInstallsTest, WhatIsRemovedAndInstalledAnewGoesOn) {
-    plan.absent = {"com.a"};
-    planInstall("com.a", "2");
-    placeholder("com.a", "2");
-    stands("com.a", true);
-    EXPECT_THAT(taken().arrived, ElementsAre("com.a"));
-}
-
-TEST_F(StandingInstallsTest, WhatIsUnwantedIsObsoleteUnlessThePlanAsksForIt) {
-    planInstall("com.a", "2");
-    placeholder("com.a", "2");
-    stands("com.a", true);
-    stands("com.b", true);
-    rules.isUnwanted = [](const std::string&) { return true; };
-    const StandingInstalls standing = taken();
-    EXPECT_THAT(standing.obsolete, ElementsAre("com.b"));
-    EXPECT_THAT(standing.arrived, ElementsAre("com.a"));
-}
-
 TEST_F(StandingInstallsTest, NothingGoesOnWhereInstallingIsForbidden) {
     planInstall("com.a", "2");
-    placeholder("com.a", "2");
     stands("com.a", true);
     installed("com.b");
     stands("com.b", true).kind = "updating";
@@ -224,12 +200,61 @@ TEST_F(StandingInstallsTest, WhatAnotherClientHasInHandIsSkipped) {
     EXPECT_THAT(plan.skipped[0].why, HasSubstr("client 7"));
 }
 
-TEST_F(StandingInstallsTest, ARestoreIsLeftAlone) {
-    stands("com.a", false).kind = "restoring";
-    stands("com.b", true).kind = "restoring demoted";
+class StandingRestoreTest : public StandingInstallsTest {
+  protected:
+    CoordinatorRecord& restored(const char* identifier, bool hasPackage) {
+        CoordinatorRecord& record = stands(identifier, hasPackage);
+        record.kind = "restoring";
+        record.hasPlaceholder = record.placeholderStands = true;
+        return record;
+    }
+};
+
+TEST_F(StandingRestoreTest, IsLeftAloneUntilItsPackageHasCome) {
+    restored("com.a", false);
+    restored("com.b", false).kind = "restoring demoted";
+    coordinators.back().isComplete = true;  // there is nothing more to come of it
     const StandingInstalls standing = taken();
     EXPECT_THAT(standing.obsolete, IsEmpty());
     EXPECT_THAT(standing.arrived, IsEmpty());
+    EXPECT_TRUE(plan.empty());
+}
+
+TEST_F(StandingRestoreTest, IsNamedWhereTheStoreHasDeliveredItsPackage) {
+    restored("com.a", true);
+    const StandingInstalls standing = taken();
+    EXPECT_THAT(standing.arrived, ElementsAre("com.a"));
+    ASSERT_EQ(plan.install.size(), 1U);
+    EXPECT_TRUE(plan.install[0].isInstalledUnasked);
+    DeviceSettings settings;
+    settings.installation = PolicyAnswer::No;
+    EXPECT_EQ(allowedBy(settings, plan).install.size(), 1U) << "no policy keeps it from coming";
+}
+
+TEST_F(StandingRestoreTest, IsSkippedNoMoreWhereThatIsWhatTheLibraryHolds) {
+    for (const char* identifier : {"com.a", "com.b"}) {
+        restored(identifier, true);
+        plan.skipped.push_back({identifier, "a restore brought it back", true});
+    }
+    library = {{"com.a", "2"}, {"com.b", "3"}};
+    EXPECT_THAT(taken().arrived, ElementsAre("com.a", "com.b"));
+    ASSERT_EQ(plan.skipped.size(), 1U);
+    EXPECT_EQ(plan.skipped[0].identifier, "com.b");
+}
+
+TEST_F(StandingRestoreTest, IsNotNamedWhereItIsToBeRemoved) {
+    restored("com.a", true);
+    plan.remove = {"com.a"};
+    EXPECT_THAT(taken().arrived, IsEmpty());
+    EXPECT_THAT(plan.install, IsEmpty());
+}
+
+TEST_F(StandingRestoreTest, ThatACrashHasLeftWithoutAPlaceholderIsInTheWayOfAnInstall) {
+    planInstall("com.a", "2");
+    for (const char* identifier : {"com.a", "com.b"}) {
+        restored(identifier, false).placeholderStands = false;
+    }
+    EXPECT_THAT(taken().obsolete, ElementsAre("com.a"));
 }
 
 class ArrivedPackage : public HostFixture {
