@@ -8,6 +8,7 @@
 #include "device/install/Containers.h"
 #include "device/install/InstallContext.h"
 #include "platform/InstallProgressRecord.h"
+#include "platform/InstallPromises.h"
 
 namespace appsync {
 
@@ -52,6 +53,39 @@ Status forgetWithoutCoordinator(Database& database, Freed& freed) {
     return rows.status();
 }
 
+Result<std::vector<std::string>> restoredWithoutCoordinator(Database& database) {
+    Query rows = database.query(
+        "SELECT identifier FROM placeholders WHERE install_type = ?"
+        " AND identifier NOT IN (SELECT identifier FROM coordinators)");
+    rows.bind(static_cast<std::uint64_t>(kInstallTypeRestore));
+    std::vector<std::string> identifiers;
+    while (rows.next()) identifiers.push_back(rows.text(0));
+    if (Status status = rows.status(); !status) return status.error();
+    return identifiers;
+}
+
+Status leaveToStore(Database& database, const std::string& identifier) {
+    StoredCoordinator coordinator;
+    const Result<std::int64_t> id =
+        insertCoordinator(database, identifier, CoordinatorKind::Restoring, SyncClientID);
+    if (!id) return id.error();
+    coordinator.id = *id;
+    coordinator.responsible = AppStoreClientID;
+    coordinator.placeholder = PlaceholderState::Stands;
+    const Result<bool> updated = updateCoordinator(database, coordinator);
+    return updated ? Status() : Status(updated.error());
+}
+
+Status takeOverRestored(Database& database) {
+    const Result<std::vector<std::string>> restored = restoredWithoutCoordinator(database);
+    if (!restored) return restored.error();
+    for (const std::string& identifier : *restored) {
+        if (Status left = leaveToStore(database, identifier); !left) return left;
+    }
+    // Nobody sends the data of a restore where installs are coordinated.
+    return database.query("DELETE FROM restore_data").run();
+}
+
 Status reconcile(Database& database, Freed& freed) {
     freed.clear();
     // Nobody is there who could want to hear of these.
@@ -60,7 +94,8 @@ Status reconcile(Database& database, Freed& freed) {
     if (!coordinated) return coordinated.error();
     if (!*coordinated) return forgetAll(database, freed);
     Status status = forgetWithoutPlaceholder(database);
-    return status ? forgetWithoutCoordinator(database, freed) : status;
+    if (status) status = forgetWithoutCoordinator(database, freed);
+    return status ? takeOverRestored(database) : status;
 }
 
 }  // namespace

@@ -14,6 +14,9 @@ struct InstallContext;
 ///
 /// - a coordinator whose placeholder stood on the home screen and is lost goes;
 /// - a sync's placeholder without a coordinator goes;
+/// - a restored one without a coordinator, from when installs were not coordinated, gets one, as
+///   if it had been restored since: the store is to bring its package, and its data counts as
+///   there;
 /// - where the device's installs are no longer coordinated, every coordinator goes, with its
 ///   placeholder, and the placeholders of syncs are left to those.
 Status reconcileCoordinators(const InstallContext& context);

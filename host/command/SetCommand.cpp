@@ -1,5 +1,7 @@
+#include <algorithm>
 #include <memory>
 #include <ostream>
+#include <string>
 #include <string_view>
 
 #include <nlohmann/json.hpp>
@@ -12,6 +14,7 @@
 #include "host/console/JsonWriting.h"
 #include "host/console/Problem.h"
 #include "host/console/Text.h"
+#include "platform/InstallProgressRecord.h"
 
 namespace appsync {
 namespace {
@@ -70,10 +73,33 @@ struct ChangedSettings {
     bool hasChanged = false;
     /// Whose coordinators the next session gives up.
     std::vector<std::string> ends;
+    /// What a restore has left that the store brings from now on.
+    std::vector<std::string> storeBrings;
 };
 
-// Without coordination no coordinator outlives the opening of a session; whoever turns it off hears
-// whose goes.
+bool isRestoredWithoutCoordinator(const ApplicationRecord& record,
+                                  const std::vector<CoordinatorRecord>& coordinators) {
+    return record.isPlaceholder && record.installType == kInstallTypeRestore &&
+           std::ranges::none_of(coordinators, [&](const CoordinatorRecord& each) {
+               return each.identifier == record.identifier;
+           });
+}
+
+Result<std::vector<std::string>> whatTheStoreBrings(
+    Device& device, const std::vector<CoordinatorRecord>& coordinators) {
+    const Result<std::vector<ApplicationRecord>> records = device.applications();
+    if (!records) return unusable(records.error());
+    std::vector<std::string> identifiers;
+    for (const ApplicationRecord& each : *records) {
+        if (isRestoredWithoutCoordinator(each, coordinators)) {
+            identifiers.push_back(each.identifier);
+        }
+    }
+    return identifiers;
+}
+
+// Without coordination no coordinator outlives the opening of a session. Whoever turns it off hears
+// whose goes, and whoever turns it on who brings what a restore has left.
 Result<ChangedSettings> changeSettings(Device& device, const DeviceSettingsChange& change) {
     const Result<DeviceSettings> before = device.settings();
     if (!before) return unusable(before.error());
@@ -81,11 +107,17 @@ Result<ChangedSettings> changeSettings(Device& device, const DeviceSettingsChang
     if (!changed) return classified(changed.error());
     const Result<DeviceSettings> now = device.settings();
     if (!now) return unusable(now.error());
-    ChangedSettings result{*now, !areSame(*before, *now), {}};
-    if (change.coordination != false) return result;
-    const Result<std::vector<CoordinatorRecord>> ending = device.coordinators();
-    if (!ending) return unusable(ending.error());
-    for (const CoordinatorRecord& each : *ending) result.ends.push_back(each.identifier);
+    ChangedSettings result{*now, !areSame(*before, *now), {}, {}};
+    if (!change.coordination) return result;
+    const Result<std::vector<CoordinatorRecord>> coordinators = device.coordinators();
+    if (!coordinators) return unusable(coordinators.error());
+    if (*change.coordination) {
+        Result<std::vector<std::string>> brought = whatTheStoreBrings(device, *coordinators);
+        if (!brought) return brought.error();
+        result.storeBrings = *std::move(brought);
+    } else {
+        for (const CoordinatorRecord& each : *coordinators) result.ends.push_back(each.identifier);
+    }
     return result;
 }
 
@@ -94,7 +126,8 @@ void printJson(const ChangedSettings& settings, const Console& console) {
                              {"removal", nameOf(settings.now.removal)},
                              {"coordination", settings.now.coordination ? "on" : "off"},
                              {"changed", settings.hasChanged},
-                             {"ends", settings.ends}})
+                             {"ends", settings.ends},
+                             {"storeBrings", settings.storeBrings}})
                 << '\n';
 }
 
@@ -103,6 +136,11 @@ void print(const std::string& device, const ChangedSettings& settings, const Con
                 << "installation=" << nameOf(settings.now.installation)
                 << " removal=" << nameOf(settings.now.removal)
                 << " coordination=" << (settings.now.coordination ? "on" : "off") << '\n';
+    if (!settings.storeBrings.empty()) {
+        console.out << "What a restore brought back comes from the store from now on:";
+        for (const std::string& each : settings.storeBrings) console.out << ' ' << printable(each);
+        console.out << "\nSee appsync store.\n";
+    }
     if (settings.ends.empty()) return;
     console.out << "The next session gives up what has a coordinator:";
     for (const std::string& each : settings.ends) console.out << ' ' << printable(each);

@@ -12,14 +12,27 @@ AwaitedThing awaited(std::string what, std::string who, std::string sentence) {
     return {std::move(what), std::move(who), std::nullopt, std::nullopt, std::move(sentence)};
 }
 
+// Each sentence gives what a person can do as commands that are carried out as they stand, once
+// DEVICE, FILE and the like are put in: ", then" parts steps, ", or" parts ways.
+
 AwaitedThing awaitedOfPolicy() {
     return awaited("policy", "device",
                    "for device policy, which does not allow installing applications: allow it "
                    "(appsync set DEVICE installation=yes)");
 }
 
-bool isOfRestore(const CoordinatorRecord& coordinator) {
-    return coordinator.kind.starts_with("restoring");
+AwaitedThing awaitedOfNextSync(const std::string& reason) {
+    return awaited("sync", "host",
+                   "for the next sync" + reason +
+                       ": run it with a library that holds the application (appsync sync DEVICE "
+                       "LIBRARY)");
+}
+
+std::string storeCommand() { return "appsync store DEVICE FOLDER"; }
+
+std::string sendCommand(const std::string& identifier, const std::string& options = "",
+                        const std::string& file = "FILE") {
+    return "appsync send DEVICE " + identifier + " " + file + options;
 }
 
 std::optional<std::string> missingPromise(const CoordinatorRecord& coordinator) {
@@ -32,23 +45,25 @@ std::optional<std::string> missingPromise(const CoordinatorRecord& coordinator) 
 AwaitedThing awaitedOfComplete(bool sessionUnderWay) {
     if (sessionUnderWay) return awaited("install", "device", "for its install, which is under way");
     return awaited("sync", "host",
-                   "for the next session, in which the device installs it, as everything is "
-                   "there: run appsync sync");
+                   "for the next sync, as everything is there: run it with a library that holds "
+                   "the same version (appsync sync DEVICE LIBRARY)");
 }
 
 AwaitedThing awaitedOfClient(const CoordinatorRecord& coordinator, bool sessionUnderWay) {
     const std::string what = coordinator.waitsFor;
-    const auto client = coordinator.waitsForClient;
-    if (!client) return awaited("promise", "client", "as " + what);
-    if (*client == AppStoreClientID) {
-        return awaited("store", "store", "for the store: " + what + " (appsync store)");
+    const CoordinationClient client = coordinator.waitsForClient.value_or(coordinator.client);
+    // The store keeps its promises in the installs that the host has begun.
+    if (client == AppStoreClientID && coordinator.client == SyncClientID) {
+        return awaited("store", "store", "for the store: " + what + " (" + storeCommand() + ")");
     }
-    if (*client != SyncClientID) {
-        return awaited("promise", "client " + std::to_string(*client),
-                       "as " + what + ": wait, or cancel it (appsync coordinator)");
+    if (client != SyncClientID) {
+        const std::string number = std::to_string(client);
+        return awaited("promise", "client " + number,
+                       "as " + what + ": wait, or cancel it (appsync coordinator DEVICE cancel " +
+                           coordinator.identifier + " --client " + number + ")");
     }
     if (sessionUnderWay) return awaited("transfer", "host", "for the host: " + what);
-    return awaited("sync", "host", "for the next sync: " + what + ": run appsync sync again");
+    return awaitedOfNextSync(", as " + what);
 }
 
 AwaitedThing awaitedOfCoordinator(const CoordinatorRecord& coordinator, bool sessionUnderWay) {
@@ -59,28 +74,48 @@ AwaitedThing awaitedOfCoordinator(const CoordinatorRecord& coordinator, bool ses
 }
 
 AwaitedThing awaitedOfSync(const ApplicationRecord& placeholder, bool sessionUnderWay) {
-    if (!sessionUnderWay) {
-        return awaited("sync", "host", "for the next sync: run appsync sync again");
-    }
+    if (!sessionUnderWay) return awaitedOfNextSync("");
     const bool isLoading =
         !placeholder.progress || placeholder.progress->phase == kInstallPhaseLoading;
     return isLoading ? awaited("transfer", "host", "for its package, which the host is sending")
                      : awaited("install", "device", "for its install, which is under way");
 }
 
+bool isOffloadedPlaceholder(const ApplicationRecord& placeholder) {
+    return placeholder.installType == kInstallTypeDowngrade ||
+           placeholder.installType == kInstallTypeIntentionalDowngrade;
+}
+
 AwaitedThing awaitedOfOffloaded(const ApplicationRecord& placeholder, bool isCoordinated) {
     if (isCoordinated && placeholder.type == kApplicationTypeSystem) {
         return awaited("store", "store",
-                       "for the store, as it is an offloaded application of the system (appsync "
-                       "store), or send it (appsync send)");
+                       "for the store, as it is an offloaded application of the system (" +
+                           storeCommand() + "), or send it (" +
+                           sendCommand(placeholder.identifier) + ")");
     }
+    if (isCoordinated) return awaitedOfNextSync(", as it is offloaded");
+    return awaited("transfer", "host",
+                   "for its package, as it is offloaded: send it (" +
+                       sendCommand(placeholder.identifier) + ")");
+}
+
+AwaitedThing awaitedOfRestored(const ApplicationRecord& placeholder, bool isCoordinated) {
     if (isCoordinated) {
-        return awaited("sync", "host",
-                       "for its package, as it is offloaded: run appsync sync with a library that "
-                       "holds it");
+        return awaited("store", "store",
+                       "for the store, as a restore brought it back (" + storeCommand() + ")");
     }
     return awaited("transfer", "host",
-                   "for its package, as it is offloaded: send it (appsync send)");
+                   "for its package, as a restore brought it back: send it (" +
+                       sendCommand(placeholder.identifier, " --restore") + ")");
+}
+
+AwaitedThing awaitedOfData(const std::string& identifier) {
+    return awaited("restore data", "host",
+                   "for its data: send its package (" +
+                       sendCommand(identifier, " --restore --parts 1") + "), then its data (" +
+                       sendCommand(identifier, " --restore --parts 2", "DATA") +
+                       "), or the package alone, to use what the restore has left (" +
+                       sendCommand(identifier, " --restore --parts 3") + ")");
 }
 
 std::optional<AwaitedThing> awaitedOfPlaceholder(const ApplicationRecord& placeholder,
@@ -92,21 +127,52 @@ std::optional<AwaitedThing> awaitedOfPlaceholder(const ApplicationRecord& placeh
         case kInstallTypeIntentionalDowngrade:
             return awaitedOfOffloaded(placeholder, isCoordinated);
         case kInstallTypeRestore:
-            return awaited("transfer", "host",
-                           "for its package, as a restore brought it back: send it (appsync send "
-                           "--restore)");
+            return awaitedOfRestored(placeholder, isCoordinated);
         default:
             return awaited("install", "store", "for an install of its package");
     }
 }
 
-// Whether what it waits for is something that policy keeps from happening.
+// Installs are not coordinated any more, and the next session finds that out.
+AwaitedThing awaitedOfGivenUp() {
+    return awaited("sync", "host",
+                   "for nothing that will come, as the installs of this device are no longer "
+                   "coordinated: turn that on again (appsync set DEVICE coordination=on), or run a "
+                   "sync that brings it anew (appsync sync DEVICE LIBRARY)");
+}
+
+// What stands there when the coordinator has gone.
+bool standsAlone(const ApplicationStatus& status) {
+    return status.placeholder && isOffloadedPlaceholder(*status.placeholder) &&
+           !status.coordinator->restores();
+}
+
+// No sync goes on with what brings an offloaded application of the system back.
+bool isLeftToStore(const ApplicationStatus& status) {
+    return standsAlone(status) && status.placeholder->type == kApplicationTypeSystem &&
+           status.coordinator->client == SyncClientID;
+}
+
+AwaitedThing awaitedOfCoordination(const ApplicationStatus& status, bool isCoordinated) {
+    if (!status.sessionUnderWay) {
+        if (isCoordinated ? isLeftToStore(status) : standsAlone(status)) {
+            return awaitedOfOffloaded(*status.placeholder, isCoordinated);
+        }
+        if (!isCoordinated) return awaitedOfGivenUp();
+    }
+    return awaitedOfCoordinator(*status.coordinator, status.sessionUnderWay);
+}
+
+// Whether what it waits for is something that policy keeps from happening: the package of what a
+// restore has brought back comes from the store all the same, and so does what is being installed.
 bool isForbidden(const ApplicationStatus& status, const DeviceSettings& settings) {
     if (settings.installation != PolicyAnswer::No) return false;
-    if (status.coordinator) {
-        return !isOfRestore(*status.coordinator) && !status.coordinator->isComplete;
+    if (!status.coordinator) {
+        return status.awaitsRestoreData || status.placeholder || !status.installed;
     }
-    return status.placeholder || !status.installed;
+    const CoordinatorRecord& coordinator = *status.coordinator;
+    if (coordinator.kind == "restoring" && coordinator.placeholderStands) return false;
+    return !coordinator.isComplete || !status.sessionUnderWay;
 }
 
 std::optional<AwaitedThing> awaitedThing(const std::string& identifier,
@@ -115,21 +181,14 @@ std::optional<AwaitedThing> awaitedThing(const std::string& identifier,
     if (status.denial) {
         AwaitedThing thing =
             awaited("termination", identifier,
-                    "for the running application to end: quit it (appsync quit); next try at " +
-                        formatClock(status.denial->nextTry));
+                    "for the running application to end: quit it (appsync quit DEVICE " +
+                        identifier + "); next try at " + formatClock(status.denial->nextTry));
         thing.nextTry = status.denial->nextTry;
         return thing;
     }
-    if (status.awaitsRestoreData) {
-        return awaited(
-            "restore data", "host",
-            "for its data: send it after its package (appsync send --restore --parts 1, then "
-            "--parts 2), or send the package with --parts 3 to use what the restore has left");
-    }
     if (isForbidden(status, settings)) return awaitedOfPolicy();
-    if (status.coordinator) {
-        return awaitedOfCoordinator(*status.coordinator, status.sessionUnderWay);
-    }
+    if (status.awaitsRestoreData && !settings.coordination) return awaitedOfData(identifier);
+    if (status.coordinator) return awaitedOfCoordination(status, settings.coordination);
     if (!status.placeholder) return std::nullopt;
     return awaitedOfPlaceholder(*status.placeholder, status.sessionUnderWay, settings.coordination);
 }

@@ -178,6 +178,36 @@ TEST_F(DeviceCoordinationResumeTest, aSyncsPlaceholderWithoutACoordinatorGoes) {
     EXPECT_EQ(containers().size(), 0U);
 }
 
+TEST_F(DeviceCoordinationResumeTest, whatTheDirectPathHasRestoredIsLeftToTheStore) {
+    ASSERT_TRUE(look()->change({.coordination = false}));
+    ASSERT_TRUE(installPlaceholder(kAtlas, kInstallTypeRestore));
+    ASSERT_TRUE(device().setRestoreDataExpected(kAtlas, true));
+    close();
+    ASSERT_TRUE(look()->change({.coordination = true}));
+    static_cast<void>(device());
+    ASSERT_TRUE(recordOf(kAtlas));
+    EXPECT_EQ(recordOf(kAtlas)->kind, "restoring");
+    EXPECT_EQ(recordOf(kAtlas)->client, SyncClientID);
+    EXPECT_EQ(recordOf(kAtlas)->waitsForClient, AppStoreClientID);
+    EXPECT_TRUE(recordOf(kAtlas)->placeholderStands);
+    EXPECT_FALSE(device().status(kAtlas)->awaitsRestoreData);
+    close();
+    static_cast<void>(device());
+    EXPECT_TRUE(hasPlaceholder(kAtlas)) << "once more changes nothing";
+    EXPECT_EQ(device().coordinators()->size(), 1U);
+}
+
+TEST_F(DeviceCoordinationResumeTest, whatAnotherClientHasInHandIsNotTakenOver) {
+    ASSERT_TRUE(look()->change({.coordination = false}));
+    ASSERT_TRUE(installPlaceholder(kAtlas, kInstallTypeRestore));
+    close();
+    ASSERT_TRUE(look()->change({.coordination = true}));
+    ASSERT_TRUE(look()->createCoordinator(kAtlas, 7));
+    static_cast<void>(device());
+    EXPECT_EQ(recordOf(kAtlas)->client, 7U);
+    EXPECT_TRUE(hasPlaceholder(kAtlas));
+}
+
 TEST_F(DeviceCoordinationResumeTest, theFilesOfPlaceholdersAreClearedWhenASessionOpens) {
     beforeACrash([this] { stageIcon(kAtlas); });
     static_cast<void>(device());

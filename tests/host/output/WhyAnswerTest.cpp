@@ -93,12 +93,18 @@ CoordinatorRecord coordinator(CoordinationClient missing) {
     return record;
 }
 
+DeviceSettings coordinated() {
+    DeviceSettings settings;
+    settings.coordination = true;
+    return settings;
+}
+
 TEST(WhyAnswer, NamesThePromiseOfTheHostThatIsMissing) {
     ApplicationStatus status;
     status.coordinator = coordinator(SyncClientID);
-    EXPECT_EQ(explain("com.a", status, {}).waitsFor->what, "sync");
+    EXPECT_EQ(explain("com.a", status, coordinated()).waitsFor->what, "sync");
     status.sessionUnderWay = true;
-    const WhyAnswer answer = explain("com.a", status, {});
+    const WhyAnswer answer = explain("com.a", status, coordinated());
     EXPECT_EQ(answer.waitsFor->what, "transfer");
     EXPECT_EQ(answer.waitsFor->who, "host");
     EXPECT_EQ(answer.waitsFor->promise, "com.a-Asset");
@@ -108,31 +114,86 @@ TEST(WhyAnswer, NamesThePromiseOfTheHostThatIsMissing) {
 TEST(WhyAnswer, NamesAnotherClientAndTheStore) {
     ApplicationStatus status;
     status.coordinator = coordinator(7);
-    EXPECT_EQ(explain("com.a", status, {}).waitsFor->who, "client 7");
+    EXPECT_EQ(explain("com.a", status, coordinated()).waitsFor->who, "client 7");
     status.coordinator = coordinator(AppStoreClientID);
-    EXPECT_EQ(explain("com.a", status, {}).waitsFor->who, "store");
+    EXPECT_EQ(explain("com.a", status, coordinated()).waitsFor->who, "store");
+}
+
+TEST(WhyAnswer, WhatAnotherClientHasBegunCanBeCancelled) {
+    ApplicationStatus status;
+    status.coordinator = coordinator(AppStoreClientID);
+    status.coordinator->client = AppStoreClientID;  // not what the host has left to the store
+    const WhyAnswer answer = explain("com.a", status, coordinated());
+    EXPECT_EQ(answer.waitsFor->what, "promise");
+    EXPECT_EQ(answer.waitsFor->who, "client 1");
+    EXPECT_THAT(whyText(answer), HasSubstr("appsync coordinator DEVICE cancel com.a --client 1"));
+}
+
+TEST(WhyAnswer, WhatNobodyHasPromisedIsItsCreatorsTask) {
+    ApplicationStatus status;
+    status.coordinator = coordinator(SyncClientID);
+    status.coordinator->waitsForClient.reset();
+    EXPECT_EQ(explain("com.a", status, coordinated()).waitsFor->what, "sync");
+}
+
+TEST(WhyAnswer, ACoordinatorIsGivenUpWhereInstallsAreNotCoordinatedAnyMore) {
+    ApplicationStatus status;
+    status.coordinator = coordinator(AppStoreClientID);
+    EXPECT_THAT(whyText(explain("com.a", status, {})), HasSubstr("coordination=on"));
+    status.placeholder = application(true, kInstallTypeDowngrade);
+    EXPECT_EQ(explain("com.a", status, {}).waitsFor->what, "transfer") << "that stays";
+    status.sessionUnderWay = true;
+    EXPECT_EQ(explain("com.a", status, {}).waitsFor->what, "store") << "the session coordinates";
+}
+
+TEST(WhyAnswer, ARestoredApplicationComesFromTheStoreWhereInstallsAreCoordinated) {
+    ApplicationStatus status;
+    status.placeholder = application(true, kInstallTypeRestore);
+    EXPECT_EQ(explain("com.a", status, {}).waitsFor->what, "transfer");
+    EXPECT_EQ(explain("com.a", status, coordinated()).waitsFor->what, "store");
+    status.awaitsRestoreData = true;
+    EXPECT_EQ(explain("com.a", status, {}).waitsFor->what, "restore data");
+    EXPECT_EQ(explain("com.a", status, coordinated()).waitsFor->what, "store");
 }
 
 TEST(WhyAnswer, ACompleteCoordinatorWaitsForASessionOrItsInstall) {
     ApplicationStatus status;
     status.coordinator = coordinator(SyncClientID);
     status.coordinator->isComplete = true;
-    EXPECT_EQ(explain("com.a", status, {}).waitsFor->what, "sync");
+    EXPECT_EQ(explain("com.a", status, coordinated()).waitsFor->what, "sync");
     status.sessionUnderWay = true;
-    EXPECT_EQ(explain("com.a", status, {}).waitsFor->what, "install");
-    EXPECT_FALSE(explain("com.a", status, {}).waitsFor->promise);
+    EXPECT_EQ(explain("com.a", status, coordinated()).waitsFor->what, "install");
+    EXPECT_FALSE(explain("com.a", status, coordinated()).waitsFor->promise);
 }
 
 TEST(WhyAnswer, NamesThePolicyThatForbids) {
     DeviceSettings settings;
     settings.installation = PolicyAnswer::No;
+    settings.coordination = true;
     ApplicationStatus status;
     EXPECT_EQ(explain("com.a", status, settings).waitsFor->what, "policy");
     status.coordinator = coordinator(SyncClientID);
     EXPECT_EQ(explain("com.a", status, settings).waitsFor->what, "policy");
+    status.coordinator->isComplete = true;
+    EXPECT_EQ(explain("com.a", status, settings).waitsFor->what, "policy");
+    status.sessionUnderWay = true;
+    EXPECT_EQ(explain("com.a", status, settings).waitsFor->what, "install");
     status.coordinator.reset();
     status.installed = application(false, kInstallTypeSync);
     EXPECT_FALSE(explain("com.a", status, settings).waitsFor);
+    status.awaitsRestoreData = true;
+    EXPECT_EQ(explain("com.a", status, settings).waitsFor->what, "policy");
+}
+
+TEST(WhyAnswer, NoPolicyKeepsTheStoreFromBringingWhatWasRestored) {
+    DeviceSettings settings = coordinated();
+    settings.installation = PolicyAnswer::No;
+    ApplicationStatus status;
+    status.coordinator = coordinator(AppStoreClientID);
+    status.coordinator->kind = "restoring";
+    EXPECT_EQ(explain("com.a", status, settings).waitsFor->what, "policy");
+    status.coordinator->placeholderStands = true;
+    EXPECT_EQ(explain("com.a", status, settings).waitsFor->what, "store");
 }
 
 TEST(WhyAnswer, TellsTheErrorOfTheCoordinator) {
