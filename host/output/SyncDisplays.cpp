@@ -139,8 +139,9 @@ class BarDisplay : public ConsoleDisplay {
         return console_.width > 0 ? console_.width - 1 : 0;
     }
 
+    // From the line's beginning: a terminal has shown what was typed meanwhile, such as "^C".
     void erase() {
-        if (drawnLines_ > 0) console_.out << "\x1b[" << drawnLines_ << "A\x1b[J";
+        if (drawnLines_ > 0) console_.out << "\r\x1b[" << drawnLines_ << "A\x1b[J";
         drawnLines_ = 0;
     }
 

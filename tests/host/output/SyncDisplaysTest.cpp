@@ -60,7 +60,7 @@ TEST_F(SyncDisplays, RedrawsTheBarInPlace) {
     const std::string text =
         shown(SyncDisplayKind::Text, {event(SyncEventKind::Progress, SyncState::Active),
                                       event(SyncEventKind::Ended, SyncState::Finished, 1024)});
-    EXPECT_THAT(text, HasSubstr("[##########..........]  50 %\n\x1b[1A\x1b[J"));
+    EXPECT_THAT(text, HasSubstr("[##########..........]  50 %\n\r\x1b[1A\x1b[J"));
     EXPECT_THAT(text, HasSubstr("[####################] 100 %\n"));
 }
 
@@ -145,7 +145,8 @@ TEST_F(SyncDisplays, ANoticeStandsAboveTheBars) {
     out.str("");
     display->complain("stopping");
     EXPECT_EQ(err.str(), "appsync: stopping\n");
-    EXPECT_THAT(out.str(), StartsWith("\x1b[1A\x1b[J"));
+    // What was typed meanwhile stands there too.
+    EXPECT_THAT(out.str(), StartsWith("\r\x1b[1A\x1b[J"));
     EXPECT_THAT(out.str(), HasSubstr("[##########..........]"));
 }
 
@@ -192,7 +193,7 @@ TEST_F(SyncDisplays, NoTerminalIsTooNarrow) {
     console.isTerminal = true;
     console.width = 1;
     EXPECT_THAT(shown(SyncDisplayKind::Text, {event(SyncEventKind::Progress, SyncState::Active)}),
-                StartsWith("\n\x1b[1A\x1b[J"));
+                StartsWith("\n\r\x1b[1A\x1b[J"));
 }
 
 }  // namespace
