@@ -268,6 +268,10 @@ Result<std::vector<HistoryRecord>> Device::history(std::size_t limit) {
     return state_->history.records(limit);
 }
 
+Result<std::vector<FailedInstall>> Device::failedInstalls() {
+    return listFailedInstalls(*state_->database);
+}
+
 Result<DeviceSettings> Device::settings() { return state_->policy.settings(); }
 
 Status Device::change(const DeviceSettingsChange& change) { return state_->policy.change(change); }

@@ -144,6 +144,10 @@ class Device {
     /// The transaction log, oldest first; at most the last `limit` records.
     [[nodiscard]] Result<std::vector<HistoryRecord>> history(std::size_t limit = 100'000);
 
+    /// The applications whose last install failed, the oldest failure first: the transaction log
+    /// has the steps of an install, and not always its failure.
+    [[nodiscard]] Result<std::vector<FailedInstall>> failedInstalls();
+
     [[nodiscard]] Result<DeviceSettings> settings();
     /// Takes effect at once, also for a session that is under way (coordination: for the next).
     Status change(const DeviceSettingsChange& change);

@@ -171,6 +171,20 @@ Result<std::vector<CoordinatorRecord>> listCoordinators(DeviceDatabase& database
     return records;
 }
 
+Result<std::vector<FailedInstall>> listFailedInstalls(DeviceDatabase& database) {
+    database.flush().ignore();
+    std::vector<FailedInstall> failed;
+    const Status status = database.read([&](Database& connection) -> Status {
+        Query rows = connection.query(
+            "SELECT time, domain, code, description, identifier FROM failures"
+            " ORDER BY time, identifier");
+        while (rows.next()) failed.push_back({rows.text(4), failureOf(rows)});
+        return rows.status();
+    });
+    if (!status) return status.error();
+    return failed;
+}
+
 std::optional<InstallProgress> storedProgress(DeviceDatabase& database,
                                               const std::string& identifier) {
     std::optional<InstallProgress> progress;

@@ -20,6 +20,9 @@ class RootDirectory;
 /// See Device::coordinators.
 [[nodiscard]] Result<std::vector<CoordinatorRecord>> listCoordinators(DeviceDatabase& database);
 
+/// See Device::failedInstalls.
+[[nodiscard]] Result<std::vector<FailedInstall>> listFailedInstalls(DeviceDatabase& database);
+
 /// How far an install has come, as the database knows it; nothing when none is under way.
 [[nodiscard]] std::optional<InstallProgress> storedProgress(DeviceDatabase& database,
                                                             const std::string& identifier);

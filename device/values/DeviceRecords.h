@@ -137,6 +137,12 @@ struct InstallFailure {
     ErrorRecord error;
 };
 
+/// An application whose last install failed.
+struct FailedInstall {
+    std::string identifier;
+    InstallFailure failure;
+};
+
 /// What is known of one identifier, for whoever wants to know what it waits for.
 struct ApplicationStatus {
     std::optional<ApplicationRecord> installed;

@@ -28,6 +28,18 @@ std::string historyTable(const std::vector<HistoryRecord>& records, const Consol
     return records.empty() ? "No history.\n" : table.text();
 }
 
+// Of a failed install the log has every step that went well, and not always one that did not.
+std::string failureTable(const std::vector<FailedInstall>& failed, const Console& console) {
+    if (failed.empty()) return {};
+    Table table({"TIME", "LAST INSTALL FAILED", "ERROR"});
+    for (const FailedInstall& each : failed) {
+        table.add({formatLocalTime(each.failure.when), each.identifier,
+                   each.failure.error.description()});
+    }
+    if (console.isTerminal) table.fitInto(console.width);
+    return "\n" + table.text();
+}
+
 }  // namespace
 
 int runHistory(const HistoryArguments& arguments, const Console& console) {
@@ -38,12 +50,18 @@ int runHistory(const HistoryArguments& arguments, const Console& console) {
     return lookAt(arguments.device, console, [&](Device& opened) -> Status {
         Result<std::vector<HistoryRecord>> records = opened.history();
         if (!records) return unusable(records.error());
-        if (arguments.application) {
-            std::erase_if(*records, [&](const HistoryRecord& each) {
-                return each.identifier != *arguments.application;
-            });
+        const auto isOfAnother = [&](const auto& each) {
+            return arguments.application && each.identifier != *arguments.application;
+        };
+        std::erase_if(*records, isOfAnother);
+        if (arguments.asJson) {
+            console.out << jsonText(*records) << '\n';
+            return {};
         }
-        console.out << (arguments.asJson ? jsonText(*records) + "\n" : historyTable(*records, console));
+        Result<std::vector<FailedInstall>> failed = opened.failedInstalls();
+        if (!failed) return unusable(failed.error());
+        std::erase_if(*failed, isOfAnother);
+        console.out << historyTable(*records, console) << failureTable(*failed, console);
         return {};
     });
 }
