@@ -114,6 +114,7 @@ class Commands {
         addData();
         addPropertyList();
         app_.add_subcommand("help", "Show the help of a command (= COMMAND --help)");
+        refuseEmptyValues(app_);
     }
 
     int run(std::vector<std::string> arguments) {
@@ -128,6 +129,8 @@ class Commands {
             return console_.fail(wrongUsage(
                 "there is no command " + shownArgument(arguments.front()), "see appsync --help"));
         }
+        if (const Status given = checkValues(arguments); !given)
+            return console_.fail(given.error());
         std::reverse(arguments.begin(), arguments.end());  // as CLI11 wants them
         try {
             app_.parse(std::move(arguments));
@@ -143,6 +146,21 @@ class Commands {
     }
 
   private:
+    // What an option says itself of a value that it does not know comes first.
+    static void refuseEmptyValues(CLI::App& command) {
+        for (CLI::Option* option : command.get_options()) {
+            if (option->get_items_expected_max() == 0 || option->get_positional()) continue;
+            option->check(CLI::Validator(
+                [](const std::string& given) {
+                    return given.empty() ? std::string("it needs another value than ''")
+                                         : std::string();
+                },
+                ""));
+        }
+        for (CLI::App* each : command.get_subcommands([](CLI::App*) { return true; }))
+            refuseEmptyValues(*each);
+    }
+
     [[nodiscard]] bool isUnknownCommand(const std::string& name) const {
         const auto known = app_.get_subcommands(
             [&name](const CLI::App* command) { return command->get_name() == name; });
@@ -161,6 +179,26 @@ class Commands {
                                   "see appsync --help");
             }
             command = known.front();
+        }
+        return {};
+    }
+
+    // An option that ends in "=" would take the next word for its value.
+    [[nodiscard]] Status checkValues(const std::vector<std::string>& words) const {
+        const CLI::App* command = &app_;
+        std::string typed = app_.get_name();
+        for (const std::string& word : words) {
+            const auto known = command->get_subcommands(
+                [&word](const CLI::App* each) { return each->get_name() == word; });
+            if (!known.empty()) {
+                command = known.front();
+                typed += " " + word;
+            }
+            if (word == "--") break;
+            if (!word.starts_with("--") || word.find('=') != word.size() - 1) continue;
+            const std::string name = word.substr(0, word.size() - 1);
+            if (command->get_option_no_throw(name) == nullptr) continue;
+            return wrongUsage(name + " needs another value than ''", "see " + typed + " --help");
         }
         return {};
     }
