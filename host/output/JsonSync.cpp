@@ -39,7 +39,23 @@ Json updates(const std::vector<PlannedInstall>& planned) {
     for (const PlannedInstall& each : planned) {
         list.push_back({{"identifier", each.identifier},
                         {"oldVersion", versionOrNull(each.oldVersion)},
-                        {"newVersion", versionOrNull(each.newVersion)}});
+                        {"newVersion", versionOrNull(each.newVersion)},
+                        {"downgrade", each.isDowngrade()}});
+    }
+    return list;
+}
+
+Json packageObjects(const SyncPlan& plan) {
+    Json list = Json::array();
+    for (const auto* installs : {&plan.install, &plan.update}) {
+        for (const PlannedInstall& each : *installs) {
+            const bool travels = !each.hasArrived && !each.file.empty();
+            list.push_back({{"identifier", each.identifier},
+                            {"version", versionOrNull(each.newVersion)},
+                            {"file", travels ? Json(each.file) : Json()},
+                            {"bytes", each.hasArrived ? 0 : each.bytes},
+                            {"unpackedBytes", each.unpackedBytes}});
+        }
     }
     return list;
 }
@@ -85,6 +101,7 @@ std::string jsonText(const SyncPlan& plan, const SpaceCheck& space, JsonLayout l
     object["install"] = identifiers(plan.install);
     object["update"] = updates(plan.update);
     object["remove"] = plan.remove;
+    object["packages"] = packageObjects(plan);
     object["skipped"] = skips(plan.skipped);
     object["failed"] = failures(plan.failed);
     object["notes"] = plan.notes;

@@ -8,7 +8,8 @@ namespace appsync {
 namespace {
 
 std::string sizeText(const PlannedInstall& each) {
-    return each.hasArrived ? "(on the device already)\n" : "(" + formatBytes(each.bytes) + ")\n";
+    const std::string size = each.hasArrived ? "on the device already" : formatBytes(each.bytes);
+    return "(" + size + (each.isDowngrade() ? "; a downgrade)\n" : ")\n");
 }
 
 std::string versionText(const std::string& version) {
@@ -30,6 +31,17 @@ std::size_t packagesToSend(const SyncPlan& plan) {
     return static_cast<std::size_t>(
         std::count_if(plan.install.begin(), plan.install.end(), travels) +
         std::count_if(plan.update.begin(), plan.update.end(), travels));
+}
+
+// What somebody may not have meant.
+std::string lossLine(const SyncPlan& plan) {
+    const auto downgrades = static_cast<std::size_t>(
+        std::count_if(plan.update.begin(), plan.update.end(),
+                      [](const PlannedInstall& each) { return each.isDowngrade(); }));
+    std::string losses;
+    if (!plan.remove.empty()) losses = counted(plan.remove.size(), "removal");
+    if (downgrades > 0) losses += (losses.empty() ? "" : ", ") + counted(downgrades, "downgrade");
+    return losses.empty() ? "" : losses + "\n";
 }
 
 bool isInStep(const SyncPlan& plan) {
@@ -55,7 +67,7 @@ std::string planText(const SyncPlan& plan, const SpaceCheck& space) {
     if (plan.empty()) {
         return text + (isInStep(plan) ? "Nothing to do: all is in step.\n" : "Nothing to do.\n");
     }
-    return text + counted(packagesToSend(plan), "package") + " to send, " +
+    return text + lossLine(plan) + counted(packagesToSend(plan), "package") + " to send, " +
            formatBytes(plan.bytes()) + "; needed " + formatBytes(space.needed) + ", free " +
            formatBytes(space.free) + (space.fits() ? ": it fits\n" : ": it does not fit\n");
 }

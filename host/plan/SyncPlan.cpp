@@ -12,6 +12,7 @@
 #include "host/console/Problem.h"
 #include "host/console/Text.h"
 #include "host/plan/Library.h"
+#include "host/plan/Versions.h"
 #include "platform/AppRegistry.h"
 #include "platform/InstallProgressRecord.h"
 #include "platform/PropertyList.h"
@@ -71,21 +72,25 @@ std::string whyNot(const Present& present, bool isCoordinated) {
 }
 
 PlannedInstall plannedInstall(const LibraryPackage& package, std::string oldVersion) {
-    return {package.identifier, package.name,  std::move(oldVersion),
-            package.version,    package.bytes, package.unpackedBytes};
+    PlannedInstall planned{package.identifier, package.name,  std::move(oldVersion),
+                           package.version,    package.bytes, package.unpackedBytes};
+    planned.file = package.file;
+    return planned;
 }
 
 class Planner {
   public:
     Planner(const Library& library, const std::vector<ApplicationRecord>& present,
             const PlanOptions& options)
-        : library_(library), options_(options), present_(byIdentifier(present)) {}
+        : library_(library),
+          options_(options),
+          present_(byIdentifier(present)),
+          chosen_(options.only.begin(), options.only.end()) {}
 
     SyncPlan make() {
         plan_.notes = library_.notes;
-        for (const LibraryFault& fault : library_.faults) {
-            plan_.failed.push_back({fault.fileName, fault.error});
-        }
+        failLacking();
+        if (options_.only.empty() || !plan_.failed.empty()) failFaults();
         for (const std::string& identifier : options_.remove) removeNamed(identifier);
         for (const LibraryPackage& package : library_.packages) bringInStep(package);
         if (options_.mirror) removeWhatLibraryLacks();
@@ -93,6 +98,21 @@ class Planner {
     }
 
   private:
+    void failLacking() {
+        for (const std::string& identifier : chosen_) {
+            if (library_.find(identifier) != nullptr) continue;
+            plan_.failed.push_back(
+                {identifier, "the library has no package of it: put one into " + library_.folder});
+        }
+    }
+
+    // Any of them may be what is lacking.
+    void failFaults() {
+        for (const LibraryFault& fault : library_.faults) {
+            plan_.failed.push_back({fault.fileName, fault.error});
+        }
+    }
+
     void removeNamed(const std::string& identifier) {
         if (!named_.insert(identifier).second) return;
         const auto found = present_.find(identifier);
@@ -107,6 +127,7 @@ class Planner {
 
     void bringInStep(const LibraryPackage& package) {
         if (named_.contains(package.identifier)) return;
+        if (!chosen_.empty() && !chosen_.contains(package.identifier)) return;
         const auto found = present_.find(package.identifier);
         if (found == present_.end()) {
             plan_.install.push_back(plannedInstall(package, {}));
@@ -151,6 +172,7 @@ class Planner {
     const Library& library_;
     const PlanOptions& options_;
     const PresentByIdentifier present_;
+    const std::set<std::string> chosen_;
     std::set<std::string> named_;
     SyncPlan plan_;
 };
@@ -258,6 +280,11 @@ std::uint64_t total(const SyncPlan& plan, Number number) {
 bool isDoubtful(const PlannedInstall& each) { return !each.doubt.empty() && !each.hasArrived; }
 
 }  // namespace
+
+bool PlannedInstall::isDowngrade() const {
+    return !oldVersion.empty() && !newVersion.empty() &&
+           compareVersions(newVersion, oldVersion) < 0;
+}
 
 std::uint64_t SyncPlan::bytes() const {
     return total(*this,

@@ -34,6 +34,8 @@ struct PlanOptions {
     std::vector<std::string> remove;
     /// Remove every user application that the library lacks.
     bool mirror = false;
+    /// Of the library these alone, where any are named; one that it lacks has failed.
+    std::vector<std::string> only = {};
     /// Bring offloaded applications back: the plug-in asks for those where installs are
     /// coordinated.
     bool bringsOffloaded = false;
@@ -51,6 +53,10 @@ struct PlannedInstall {
     bool isInstalledUnasked = false;  // the device installs it with nothing more being done
     bool isLeftOver = false;          // the plan does not ask for it: it comes all the same
     std::string doubt = {};           // why no good package of it can be sent, if there is none
+    std::string file = {};            // its package on this machine, where there is one
+
+    /// The device has a higher version than the one to come.
+    [[nodiscard]] bool isDowngrade() const;
 };
 
 /// Why policy keeps something from being done.
