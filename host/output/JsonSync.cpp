@@ -70,6 +70,7 @@ std::string jsonText(const SyncEvent& event) {
                    {"total", event.total},
                    {"state", nameOf(event.state)},
                    {"nextTry", nullptr}};
+    if (event.phase == SyncPhase::Prepare) object["identifier"] = nullptr;  // it is of all of them
     if (event.nextTry) object["nextTry"] = formatTime(*event.nextTry);
     if (event.state == SyncState::Failed) object["error"] = event.text;
     if (event.state == SyncState::Waiting) {

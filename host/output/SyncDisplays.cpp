@@ -6,6 +6,7 @@
 #include <map>
 #include <ostream>
 #include <string_view>
+#include <utility>
 
 #include "host/console/Console.h"
 #include "host/console/Text.h"
@@ -90,6 +91,7 @@ class LineDisplay : public ConsoleDisplay {
     using ConsoleDisplay::ConsoleDisplay;
 
     void show(const SyncEvent& event) override {
+        if (event.phase == SyncPhase::Prepare && !isWorthALine(event)) return;
         console_.out << eventLine(event) << '\n' << std::flush;
     }
 
@@ -97,6 +99,14 @@ class LineDisplay : public ConsoleDisplay {
         console_.out << summaryText(summary, console_.isTerminal) << std::flush;
         complainOfFailures(summary);
     }
+
+  private:
+    // One for all of it, where it takes long enough for progress.
+    bool isWorthALine(const SyncEvent& preparation) {
+        return preparation.kind == SyncEventKind::Progress && !std::exchange(hasPrepared_, true);
+    }
+
+    bool hasPrepared_ = false;
 };
 
 // What has ended scrolls up; what is under way is redrawn below it.
@@ -111,7 +121,10 @@ class BarDisplay : public ConsoleDisplay {
         erase();
         if (event.kind == SyncEventKind::Ended) {
             if (drawn != bars_.end()) bars_.erase(drawn);
-            console_.out << eventBar(event, barWidth()) << '\n';
+            // Of what was before the first application, nothing is left to be told.
+            if (event.phase != SyncPhase::Prepare) {
+                console_.out << eventBar(event, barWidth()) << '\n';
+            }
         } else if (drawn != bars_.end()) {
             *drawn = event;
         } else {
@@ -131,6 +144,11 @@ class BarDisplay : public ConsoleDisplay {
         erase();
         console_.out << summaryText(summary, console_.isTerminal) << std::flush;
         complainOfFailures(summary);
+    }
+
+    void close() override {
+        erase();
+        console_.out << std::flush;
     }
 
   private:
@@ -239,13 +257,15 @@ std::vector<std::string> barStates(const SyncEvent& event, std::size_t width) {
 }  // namespace
 
 std::string eventLine(const SyncEvent& event) {
+    if (event.phase == SyncPhase::Prepare) return "prepare: " + printable(event.text);
     return std::string(nameOf(event.phase)) + " " + printable(event.identifier) + ": " +
            printable(stateText(event));
 }
 
 std::string eventBar(const SyncEvent& event, std::size_t width) {
     std::string bar = fitted(nameOf(event.phase), kPhaseWidth);
-    const std::string name = printable(event.identifier);
+    const std::string name =
+        printable(event.phase == SyncPhase::Prepare ? event.text : event.identifier);
     const std::vector<std::string> states = barStates(event, width);
     for (const std::string& state : states) {
         const std::size_t taken = displayWidth(state) + 1;

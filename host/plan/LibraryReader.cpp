@@ -163,13 +163,16 @@ std::uint64_t bytesOnDevice(const PackageInfo& info) {
     return info.unpackedBytes + info.entryCount * kBlockBytes;  // each file fills its last block
 }
 
-Result<Library> readLibrary(const std::string& folder, PropertyListSerialization& propertyLists) {
+Result<Library> readLibrary(const std::string& folder, PropertyListSerialization& propertyLists,
+                            const StepProgress& progress) {
     const Result<std::vector<std::string>> names = packageNamesIn(folder);
     if (!names) return names.error();
     Library library;
     library.folder = folder;
     std::vector<LibraryPackage> packages;
+    std::size_t done = 0;
     for (const std::string& name : *names) {
+        if (progress) progress(done++, names->size());
         std::string file = folder;
         file.append("/").append(name);
         Result<LibraryPackage> package = readPackage(file, propertyLists);
@@ -179,6 +182,7 @@ Result<Library> readLibrary(const std::string& folder, PropertyListSerialization
             library.faults.push_back({name, package.error().description()});
         }
     }
+    if (progress) progress(done, names->size());
     library.packages = keepHighestVersions(std::move(packages), library.notes);
     Result<std::optional<Bytes>> iconOrder = readIconOrder(folder, propertyLists);
     if (iconOrder) {

@@ -57,16 +57,21 @@ class StagingWriter {
     StagingWriter(Device& device, std::string directory)
         : device_(device), directory_(std::move(directory)) {}
 
-    Status write(const SyncPlan& plan, const Library& library, StagedFor session) {
+    Status write(const SyncPlan& plan, const Library& library, StagedFor session,
+                 const StepProgress& progress) {
         status_ = device_.files().createDirectory(directory_, true, &kMobile);
         if (session == StagedFor::ThisSession) addList(kHostRecordName, hostRecordOfLibrary());
         addList(kTodoListName, todoListOf(plan));
         if (library.iconOrder) add("DeskoraIconState.plist", *library.iconOrder);
+        const std::size_t count = plan.install.size() + plan.update.size();
+        std::size_t done = 0;
         for (const auto* installs : {&plan.install, &plan.update}) {
             for (const PlannedInstall& each : *installs) {
+                if (progress) progress(done++, count);
                 if (!each.isLeftOver) addApplication(library, each.identifier);
             }
         }
+        if (progress) progress(done, count);
         return status_;
     }
 
@@ -131,10 +136,11 @@ ErrorRecord calledByItsPlace(const ErrorRecord& error) {
     return ErrorRecord::make(error.domain, error.code, std::move(text));
 }
 
-Status writeArea(Device& device, const SyncPlan& plan, const Library& library, StagedFor session) {
+Status writeArea(Device& device, const SyncPlan& plan, const Library& library, StagedFor session,
+                 const StepProgress& progress) {
     const std::string unfinished(kUnfinishedStagingArea);
     device.files().removeItem(unfinished).ignore();
-    Status status = StagingWriter(device, unfinished).write(plan, library, session);
+    Status status = StagingWriter(device, unfinished).write(plan, library, session, progress);
     if (status) status = takeIntoPlace(device.files());
     if (status) return {};
     device.files().removeItem(unfinished).ignore();
@@ -232,12 +238,13 @@ PropertyList todoListOf(const SyncPlan& plan) {
     return list;
 }
 
-Status writeStagingArea(Device& device, const SyncPlan& plan, const Library& library) {
-    return writeArea(device, plan, library, StagedFor::ThisSession);
+Status writeStagingArea(Device& device, const SyncPlan& plan, const Library& library,
+                        const StepProgress& progress) {
+    return writeArea(device, plan, library, StagedFor::ThisSession, progress);
 }
 
 Result<std::string> stageForLater(Device& device, const SyncPlan& plan, const Library& library) {
-    const Status status = writeArea(device, plan, library, StagedFor::Later);
+    const Status status = writeArea(device, plan, library, StagedFor::Later, {});
     if (!status) return status.error();
     return std::string(kStagingArea);
 }

@@ -5,6 +5,7 @@
 #include <string>
 #include <string_view>
 
+#include "host/plan/StepProgress.h"
 #include "platform/PropertyList.h"
 #include "platform/Result.h"
 
@@ -20,8 +21,9 @@ struct SyncPlan;
 /// Writes the staging area for the plan: the todo list, the icon layout, and a directory for each
 /// application that is to come. It is built beside its place and then renamed, in the place of one
 /// that stood there: whoever looks sees all of it or none. A package that cannot be read any more
-/// gets no directory. On failure nothing stays.
-Status writeStagingArea(Device& device, const SyncPlan& plan, const Library& library);
+/// gets no directory. On failure nothing stays. The steps of the progress are applications.
+Status writeStagingArea(Device& device, const SyncPlan& plan, const Library& library,
+                        const StepProgress& progress = {});
 
 /// The same as a host leaves it for a session that comes later. Gives its path on the device.
 [[nodiscard]] Result<std::string> stageForLater(Device& device, const SyncPlan& plan,

@@ -152,11 +152,12 @@ Result<SyncPreparation> prepareStagedSync(Device& device, const Library& library
     return Preparing(device, library).ofStagingArea();
 }
 
-Status clearTheWay(Device& device, const SyncPreparation& sync, const Library& library) {
+Status clearTheWay(Device& device, const SyncPreparation& sync, const Library& library,
+                   const StepProgress& progress) {
     Status status = removeLeftovers(device, sync.standing);
     if (!status) return status;
     status = removeStaleTransfers(device, sync.standing.arrived);
-    if (status) status = writeStagingArea(device, sync.plan, library);
+    if (status) status = writeStagingArea(device, sync.plan, library, progress);
     return status ? status : cannotPrepare(status.error());
 }
 

@@ -3,6 +3,7 @@
 #include "host/plan/InterruptedStaging.h"
 #include "host/plan/StagingArea.h"
 #include "host/plan/StandingInstalls.h"
+#include "host/plan/StepProgress.h"
 #include "host/plan/SyncPlan.h"
 #include "platform/Result.h"
 
@@ -30,8 +31,9 @@ struct SyncPreparation {
 [[nodiscard]] Result<SyncPreparation> prepareStagedSync(Device& device, const Library& library);
 
 /// Makes the device ready for the session: nothing stays that an earlier one has left and that this
-/// one does not go on with, and its own staging area stands.
-Status clearTheWay(Device& device, const SyncPreparation& sync, const Library& library);
+/// one does not go on with, and its own staging area stands. The progress is that of its writing.
+Status clearTheWay(Device& device, const SyncPreparation& sync, const Library& library,
+                   const StepProgress& progress = {});
 
 /// The same where the staging area waits on the device, or an interrupted session has left it.
 Status clearTheWayForStaged(Device& device, SyncPreparation& sync);

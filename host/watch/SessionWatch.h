@@ -6,6 +6,7 @@
 //     SessionWatch.h    the plug-in's calls, with WatchedCoordination.h those of the coordination
 //                       service; keeps what it sees as SessionFacts.h and tells SyncEvents.h
 //     SyncEvents.h      one order for the events of all threads; a SyncDisplay shows them
+//     PreparationEvents.h    tells it of what comes before the first transfer
 //     SyncDaemon.h      the daemon that the plug-in is told of, with TransferQueue.h, which is
 //                       what it has still to send
 //

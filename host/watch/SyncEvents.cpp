@@ -21,6 +21,8 @@ std::string_view nameOf(SyncEventKind kind) {
 
 std::string_view nameOf(SyncPhase phase) {
     switch (phase) {
+        case SyncPhase::Prepare:
+            return "prepare";
         case SyncPhase::Remove:
             return "remove";
         case SyncPhase::Transfer:
@@ -91,6 +93,13 @@ void SyncEvents::complainSoon(std::string_view text) {
 void SyncEvents::finishSoon(const SyncSummary& summary) {
     const std::unique_lock lock = lockSoon();
     if (lock) finishLocked(summary);
+}
+
+void SyncEvents::closeSoon() {
+    const std::unique_lock lock = lockSoon();
+    if (!lock || isFinished_) return;
+    isFinished_ = true;
+    display_.close();
 }
 
 std::unique_lock<std::mutex> SyncEvents::lockSoon() {

@@ -15,25 +15,27 @@
 namespace appsync {
 
 enum class SyncEventKind { Started, Progress, Waiting, Ended };
-enum class SyncPhase { Remove, Transfer, Install };
+enum class SyncPhase { Prepare, Remove, Transfer, Install };
 enum class SyncState { Active, Waiting, Finished, Failed };
 
 [[nodiscard]] std::string_view nameOf(SyncEventKind kind);
 [[nodiscard]] std::string_view nameOf(SyncPhase phase);
 [[nodiscard]] std::string_view nameOf(SyncState state);
 
-/// Something that happened to one application in a session.
+/// Something that happened to one application in a session, or before it to all of them.
 struct SyncEvent {
     SyncEventKind kind = SyncEventKind::Started;
     SyncPhase phase = SyncPhase::Transfer;
+    /// Empty in the phase that is of all applications: `Prepare`.
     std::string identifier;
-    /// Bytes; `done` never passes `total` and never goes back within one phase of an identifier.
+    /// Bytes; of a preparation, steps. `done` never passes `total` and never goes back within one
+    /// phase of an identifier.
     std::uint64_t done = 0;
     std::uint64_t total = 0;
     SyncState state = SyncState::Active;
     /// When what waits is tried again.
     std::optional<std::chrono::system_clock::time_point> nextTry;
-    /// Why it failed, or what it waits for.
+    /// Why it failed, what it waits for, or what is being prepared.
     std::string text;
 };
 
@@ -60,6 +62,8 @@ class SyncDisplay {
     virtual void complain(std::string_view text) = 0;
     /// The session is over; nothing is shown after this.
     virtual void finish(const SyncSummary& summary) = 0;
+    /// It ends before there is a summary: what would be drawn anew goes away.
+    virtual void close() {}
 };
 
 /// Brings the events of all threads in one order and hands them to a display. What would make
@@ -80,6 +84,7 @@ class SyncEvents {
 
     void complainSoon(std::string_view text);
     void finishSoon(const SyncSummary& summary);
+    void closeSoon();
 
   private:
     [[nodiscard]] std::unique_lock<std::mutex> lockSoon();
