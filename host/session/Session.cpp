@@ -86,6 +86,7 @@ SessionEnd Session::sync(const Order& order) {
         facts_.requested(asset->identifier);
         assets.push_back(std::move(asset));
     }
+    if (order.prepared) order.prepared();
     device_.letCoordinatedInstallsGo();
     transferAll(assets, order.packages);
     return end(known);
@@ -196,6 +197,7 @@ void Session::send(const Parcel& parcel) {
     event.state = SyncState::Finished;
     events_.report(event);
     watch_.setSize(asset->identifier, *sent);
+    watch_.packageSent(asset->identifier, parcel.directory + "/" + parcel.name, parcel.file);
     if (!parcel.keepsPath) asset->path = parcel.name;
     if (watch_.isCoordinated()) watch_.packageDelivered(asset->identifier);
     client_.assetTransferSucceeded(asset, true, nullptr);
@@ -231,6 +233,7 @@ void Session::reportFailure(const SyncAssetPointer& asset, const ErrorRecord& er
 // A stop that comes when nothing is left to do interrupts nothing.
 const SessionEnd& Session::end(const std::vector<std::string>& known) {
     device_.letCoordinatedInstallsGo();
+    watch_.setOnlyWaiting();
     client_.assetTransferEndedWithSuccess(!isCutShort_ && !end_.error);
     if (watch_.isCoordinated()) {
         cancelWhere([this](const CoordinatorRecord& each) {
@@ -277,7 +280,7 @@ void Session::cancelWhere(const std::function<bool(const CoordinatorRecord&)>& i
 // the packages belongs to the session all the same: its end says that the device is in step.
 void Session::awaitCoordinatedInstalls() {
     while (!device_.waitForCoordinatedInstalls(kStopInterval)) {
-        if (!stopRequested_) continue;
+        if (!stopRequested_ && !watch_.isWaitOver()) continue;
         isCutShort_ = true;
         return;
     }

@@ -68,6 +68,8 @@ class Session {
         std::function<bool(const std::string& identifier)> sends;
         /// Whether the host takes note of what was uninstalled on the device.
         bool takesInventory = true;
+        /// Called when all is ready for the first transfer.
+        std::function<void()> prepared = nullptr;
     };
     /// A whole sync with what stands in the staging area. Returns when every install has ended, on
     /// the device's own path or through its coordination service.

@@ -4,6 +4,7 @@
 #include <utility>
 
 #include "device/Device.h"
+#include "device/values/DeviceError.h"
 #include "host/plan/TransferError.h"
 #include "host/watch/SessionFacts.h"
 #include "host/watch/SyncDaemon.h"
@@ -57,6 +58,7 @@ class WatchedRegistry : public AppRegistry {
     }
     Status installPlaceholderBundle(const FileURL& directory,
                                     const PropertyList& options) override {
+        watch_.placeholderAsked();
         Status status = registry_.installPlaceholderBundle(directory, options);
         if (!status) watch_.placeholderRefused(identifierOf(options), status.error());
         return status;
@@ -155,6 +157,16 @@ std::uint64_t SessionWatch::sizeOf(const std::string& identifier) const {
     return found != sizes_.end() ? found->second : 0;
 }
 
+void SessionWatch::limitWait(std::chrono::milliseconds longest, std::function<void()> leave) {
+    const std::lock_guard guard(mutex_);  // the poller looks already
+    longestWait_ = longest;
+    leave_ = std::move(leave);
+}
+
+void SessionWatch::placeholderAsked() const {
+    if (asking_) asking_();
+}
+
 void SessionWatch::placeholderRefused(const std::string& identifier, const ErrorRecord& error) {
     facts_.failed(identifier, error.description());
 }
@@ -169,6 +181,10 @@ void SessionWatch::terminationDenied(const std::string& identifier) {
 
 void SessionWatch::reportWaiting(const std::string& identifier,
                                  std::chrono::system_clock::time_point nextTry) {
+    {
+        const std::lock_guard guard(mutex_);
+        waiting_.insert(identifier);
+    }
     events_.report({SyncEventKind::Waiting, SyncPhase::Install, identifier, 0, sizeOf(identifier),
                     SyncState::Waiting, nextTry, identifier + " is running"});
 }
@@ -178,6 +194,7 @@ void SessionWatch::installBegins(const std::string& identifier) {
     reportBegin(identifier, size);
     const std::lock_guard guard(mutex_);
     installing_[identifier] = size;
+    waiting_.erase(identifier);
     concluded_.erase(identifier);
 }
 
@@ -188,26 +205,41 @@ void SessionWatch::reportBegin(const std::string& identifier, std::uint64_t size
 
 void SessionWatch::installEnded(const std::string& identifier, const Status& status) {
     const std::uint64_t size = sizeOf(identifier);
+    const std::string cause = status ? "" : causeOf(identifier, status.error());
     bool hasBegun = false;
     {
         const std::lock_guard guard(mutex_);
         hasBegun = installing_.erase(identifier) > 0;
         delivered_.erase(identifier);
+        underWay_.erase(identifier);
+        waiting_.erase(identifier);
         concluded_.insert(identifier);
     }
     if (!hasBegun) reportBegin(identifier, size);
     if (status) {
         facts_.installed(identifier);
     } else {
-        facts_.failed(identifier, status.error().description());
+        facts_.failed(identifier, cause);
     }
     events_.report({SyncEventKind::Ended, SyncPhase::Install, identifier, status ? size : 0, size,
-                    status ? SyncState::Finished : SyncState::Failed, std::nullopt,
-                    status ? "" : status.error().description()});
+                    status ? SyncState::Finished : SyncState::Failed, std::nullopt, cause});
+}
+
+// The device names the place where it had the package, which goes with the failure.
+std::string SessionWatch::causeOf(const std::string& identifier, const ErrorRecord& error) const {
+    std::string text = error.description();
+    const std::lock_guard guard(mutex_);
+    const auto found = sent_.find(identifier);
+    if (found == sent_.end()) return text;
+    const auto& [received, file] = found->second;
+    const std::size_t position = text.find(received);
+    return position == std::string::npos ? text : text.replace(position, received.size(), file);
 }
 
 void SessionWatch::uninstallEnded(const std::string& identifier, const Status& status) {
     if (!removing_) return;
+    // What is not there is as it was to be: nothing has happened.
+    if (!status && isRegistryError(status.error(), RegistryErrorCode::NothingInstalled)) return;
     if (status) {
         facts_.removed(identifier);
     } else {
@@ -216,6 +248,13 @@ void SessionWatch::uninstallEnded(const std::string& identifier, const Status& s
     events_.report({SyncEventKind::Ended, SyncPhase::Remove, identifier, status ? 1U : 0U, 1,
                     status ? SyncState::Finished : SyncState::Failed, std::nullopt,
                     status ? "" : status.error().description()});
+}
+
+void SessionWatch::packageSent(const std::string& identifier, const std::string& received,
+                               const std::string& file) {
+    const std::lock_guard guard(mutex_);
+    sent_[identifier] = {received, file};
+    underWay_.insert(identifier);
 }
 
 void SessionWatch::packageDelivered(const std::string& identifier) {
@@ -232,6 +271,7 @@ void SessionWatch::takeUpDelivered(const std::string& identifier) {
     if (concluded_.contains(identifier)) return;  // meanwhile
     if (!delivered_.try_emplace(identifier).second) return;
     installing_[identifier] = size;
+    underWay_.insert(identifier);
     reportBegin(identifier, size);  // before anything else is told of it
 }
 
@@ -300,8 +340,43 @@ void SessionWatch::poll() {
         lock.unlock();
         reportProgress();
         if (++polls % kPollsForDenials == 0) reportDenials();
+        checkWait();
         lock.lock();
     }
+}
+
+void SessionWatch::checkWait() {
+    const std::vector<std::string> waiting = takeWaiting();
+    if (waiting.empty()) return;
+    for (const std::string& identifier : waiting) giveUpWaiting(identifier);
+    isWaitOver_ = true;
+    if (!isCoordinated_) leave_();
+}
+
+// What waits, once it has waited for long enough with nothing else being under way.
+std::vector<std::string> SessionWatch::takeWaiting() {
+    const std::lock_guard guard(mutex_);
+    const auto now = std::chrono::steady_clock::now();
+    const auto sinceLastLook = now - std::exchange(lastLook_, now);
+    const bool isDue = longestWait_ && isOnlyWaiting_ && !isWaitOver_ && !underWay_.empty() &&
+                       waiting_.size() == underWay_.size();
+    if (!isDue) return {};
+    waited_ += sinceLastLook;
+    if (waited_ < *longestWait_) return {};
+    return {waiting_.begin(), waiting_.end()};
+}
+
+// It may have ended meanwhile; on the direct path the next try comes when it comes.
+void SessionWatch::giveUpWaiting(const std::string& identifier) {
+    const Result<ApplicationStatus> status = device_.status(identifier);
+    const bool hasEnded = status && !status->isRunning;
+    const std::string cause = identifier +
+                              (hasEnded ? " was running: " : " is running: quit it, and ") +
+                              "run the same command again to bring it in step";
+    facts_.failed(identifier, cause);
+    const std::uint64_t size = sizeOf(identifier);
+    events_.report({SyncEventKind::Ended, SyncPhase::Install, identifier, 0, size,
+                    SyncState::Failed, std::nullopt, cause});
 }
 
 void SessionWatch::reportDenials() {
@@ -310,7 +385,12 @@ void SessionWatch::reportDenials() {
 
 void SessionWatch::reportDenial(const std::string& identifier) {
     const Result<ApplicationStatus> status = device_.status(identifier);
-    if (!status || !status->denial) return;
+    if (!status) return;
+    {
+        const std::lock_guard guard(mutex_);
+        if (!status->denial) waiting_.erase(identifier);
+    }
+    if (!status->denial) return;
     {
         const std::lock_guard guard(mutex_);
         const auto found = delivered_.find(identifier);

@@ -16,6 +16,7 @@
 #include <chrono>
 #include <condition_variable>
 #include <cstdint>
+#include <functional>
 #include <map>
 #include <memory>
 #include <mutex>
@@ -65,10 +66,26 @@ class SessionWatch {
     void setSize(const std::string& identifier, std::uint64_t bytes);
     /// While removing, an uninstall is one that the host has asked for.
     void setRemoving(bool removing) { removing_ = removing; }
+    /// Called for each application that the client prepares the device for, before its package is
+    /// sent. To be set before the session.
+    void onAsking(std::function<void()> asking) { asking_ = std::move(asking); }
+
+    /// The longest that the session waits for applications that run, counted while there is nothing
+    /// else to do; without it, as long as they run. Then what waits has failed, and is told so;
+    /// `leave` is called where the client itself waits, which nothing but the end of the process
+    /// ends: on the direct path, on a thread of this object's own. To be set before the session.
+    void limitWait(std::chrono::milliseconds longest, std::function<void()> leave);
+    /// Everything that was to be sent has been: from now on there is only to be waited.
+    void setOnlyWaiting() { isOnlyWaiting_ = true; }
+    [[nodiscard]] bool isWaitOver() const { return isWaitOver_; }
 
     /// Whether the client installs through coordinators.
     [[nodiscard]] bool isCoordinated() const { return isCoordinated_; }
-    /// The package of an application is the coordination service's to install from now on.
+    /// The package of an application is about to be the device's to install. `received` is where
+    /// the device has it, `file` what was sent: the one that a person can look at when it fails.
+    void packageSent(const std::string& identifier, const std::string& received,
+                     const std::string& file);
+    /// The same through the coordination service, beside it.
     void packageDelivered(const std::string& identifier);
     /// The same for one whose package an earlier session has delivered.
     void takeUpDelivered(const std::string& identifier);
@@ -79,6 +96,7 @@ class SessionWatch {
     void settleDelivered();
 
     // From the services.
+    void placeholderAsked() const;
     void placeholderRefused(const std::string& identifier, const ErrorRecord& error);
     void terminationDenied(const std::string& identifier);
     void installBegins(const std::string& identifier);
@@ -99,6 +117,11 @@ class SessionWatch {
     struct Delivered {
         std::optional<std::chrono::system_clock::time_point> toldTry;
     };
+    // A package that has been sent.
+    struct SentPackage {
+        std::string received;
+        std::string file;
+    };
 
     void poll();
     void reportProgress();
@@ -108,6 +131,11 @@ class SessionWatch {
     void reportWaiting(const std::string& identifier,
                        std::chrono::system_clock::time_point nextTry);
     [[nodiscard]] std::vector<std::string> deliveredIdentifiers() const;
+    [[nodiscard]] std::string causeOf(const std::string& identifier,
+                                      const ErrorRecord& error) const;
+    void checkWait();
+    [[nodiscard]] std::vector<std::string> takeWaiting();
+    void giveUpWaiting(const std::string& identifier);
     std::uint64_t sizeOf(const std::string& identifier) const;
 
     Device& device_;
@@ -120,6 +148,11 @@ class SessionWatch {
     std::unique_ptr<InstallCoordinatorService> coordination_;
     std::atomic<bool> removing_ = false;
     std::atomic<bool> isCoordinated_ = false;
+    std::atomic<bool> isOnlyWaiting_ = false;
+    std::atomic<bool> isWaitOver_ = false;
+    std::function<void()> asking_;
+    std::optional<std::chrono::milliseconds> longestWait_;
+    std::function<void()> leave_;
 
     mutable std::mutex mutex_;
     std::condition_variable ended_;
@@ -127,8 +160,13 @@ class SessionWatch {
     std::map<std::string, std::uint64_t> sizes_;
     std::map<std::string, std::uint64_t> installing_;  // to their sizes
     std::map<std::string, Delivered> delivered_;       // through coordinators
-    std::set<std::string> concluded_;                  // what was installed, or failed
-    std::size_t uninstalls_ = 0;                       // of the coordination service's, under way
+    std::map<std::string, SentPackage> sent_;          // in this session
+    std::set<std::string> underWay_;                   // what was sent or taken up, and is not over
+    std::set<std::string> waiting_;                    // what of that was last refused, as it runs
+    std::chrono::steady_clock::duration waited_{};     // for that alone
+    std::chrono::steady_clock::time_point lastLook_ = std::chrono::steady_clock::now();
+    std::set<std::string> concluded_;  // what was installed, or failed
+    std::size_t uninstalls_ = 0;       // of the coordination service's, under way
     bool isOver_ = false;
 
     std::thread poller_;

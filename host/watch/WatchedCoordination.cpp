@@ -182,6 +182,7 @@ class WatchedCoordination : public InstallCoordinatorService {
     }
     Coordinator coordinator(CoordinatorKind kind, const std::string& identifier,
                             CoordinationClient client, Creation creation) override {
+        if (creation == Creation::CreateIfNotExisting) watch_.placeholderAsked();
         Coordinator found = service_.coordinator(kind, identifier, client, creation);
         if (creation == Creation::CreateIfNotExisting) tell(found, identifier, client);
         found.coordinator = watched(std::move(found.coordinator));
