@@ -2,6 +2,7 @@
 
 #include <algorithm>
 #include <charconv>
+#include <chrono>
 #include <cstdint>
 #include <functional>
 #include <map>
@@ -90,6 +91,22 @@ std::string brokenAt80(const std::string& text) {
         broken += line + "\n";
     }
     return broken;
+}
+
+constexpr std::int64_t kLongestWait = std::int64_t{365} * 24 * 3600;
+
+// "90", "90s", "5m", "1h".
+std::optional<std::chrono::seconds> duration(std::string_view text) {
+    static constexpr std::string_view kUnits = "smh";
+    std::int64_t factor = 1;
+    if (const std::size_t unit = text.empty() ? text.npos : kUnits.find(text.back());
+        unit != text.npos) {
+        for (std::size_t step = 0; step < unit; ++step) factor *= 60;
+        text.remove_suffix(1);
+    }
+    const std::optional<std::int64_t> number = wholeNumber(text);
+    if (!number || *number < 0 || *number > kLongestWait / factor) return std::nullopt;
+    return std::chrono::seconds(*number * factor);
 }
 
 // Declares the commands and remembers which one was chosen. The values that options are parsed into
@@ -271,13 +288,56 @@ class Commands {
             ->expected(1)
             ->take_all()
             ->allow_extra_args(false);  // what follows the identifier is DEVICE or LIBRARY
-        added.add_flag("--mirror", values.plan.mirror,
-                       "remove every user application that LIBRARY lacks");
+        addMirror(added, values);
+        added.add_option("--only", values.plan.only, "of LIBRARY, sync this application alone")
+            ->type_name("ID")
+            ->expected(1)
+            ->take_all()
+            ->allow_extra_args(false);
     }
 
     static void addStaged(CLI::App& added, SyncArguments& values) {
         added.add_flag("--staged", values.isStaged,
                        "the staging area is there already: send what it asks for");
+        addWait(added, values);
+    }
+
+    static void addMirror(CLI::App& added, SyncArguments& values) {
+        added.add_flag("--mirror")
+            ->description("remove every user application that LIBRARY lacks")
+            ->option_text("[=empty]")
+            ->check(CLI::Validator(
+                [&values](const std::string& given) {
+                    values.plan.mirror = true;
+                    values.mirrorsEmpty = given == "empty";
+                    return given == "true" || values.mirrorsEmpty
+                               ? std::string()
+                               : shownArgument(given) +
+                                     " is none of its values: say --mirror or "
+                                     "--mirror=empty";
+                },
+                ""));
+    }
+
+    static void addWait(CLI::App& added, SyncArguments& values) {
+        CLI::Option* none = added.add_flag_callback(
+            "--no-wait", [&values] { values.longestWait = std::chrono::seconds(0); },
+            "do not wait for applications that run");
+        added
+            .add_option_function<std::string>(
+                "--wait",
+                [&values](const std::string& text) { values.longestWait = duration(text); },
+                "wait for what runs so long at most: 90s, 5m, 1h")
+            ->type_name("TIME")
+            ->check(CLI::Validator(
+                [](const std::string& given) {
+                    return duration(given) ? std::string()
+                                           : shownArgument(given) +
+                                                 " is no time: give seconds (90 or 90s), "
+                                                 "minutes (5m) or hours (1h)";
+                },
+                ""))
+            ->excludes(none);
     }
 
     void addSync() {

@@ -12,6 +12,7 @@
 // docs/commands.md and in tests/host/command/CommandLineTest.cpp. Includes every other room of
 // host/; called by host/main.cpp only.
 
+#include <chrono>
 #include <cstddef>
 #include <cstdint>
 #include <optional>
@@ -37,8 +38,12 @@ struct SyncArguments {
     std::string device;
     std::string library;
     PlanOptions plan;
+    /// A mirror of a library without any package is meant.
+    bool mirrorsEmpty = false;
     bool isStaged = false;
     bool isDryRun = false;
+    /// The longest that the session waits for applications that run; nothing: as long as they do.
+    std::optional<std::chrono::seconds> longestWait;
     SyncDisplayKind display = SyncDisplayKind::Text;
 };
 [[nodiscard]] int runSync(const SyncArguments& arguments, const Console& console);

@@ -1,15 +1,19 @@
 #include <unistd.h>
 
+#include <algorithm>
 #include <atomic>
 #include <chrono>
 #include <memory>
 #include <optional>
 #include <ostream>
+#include <string_view>
 #include <utility>
+#include <vector>
 
 #include "device/Device.h"
 #include "host/command/Commands.h"
 #include "host/command/IdentifierArgument.h"
+#include "host/command/MirrorSource.h"
 #include "host/console/Console.h"
 #include "host/console/Problem.h"
 #include "host/console/Text.h"
@@ -22,6 +26,7 @@
 #include "host/session/Session.h"
 #include "host/session/StopSignals.h"
 #include "host/session/SyncOutcome.h"
+#include "host/watch/PreparationEvents.h"
 #include "host/watch/SessionFacts.h"
 #include "host/watch/SessionWatch.h"
 
@@ -30,17 +35,45 @@ namespace {
 
 using Clock = std::chrono::steady_clock;
 
+Status checkIdentifiers(const std::vector<std::string>& identifiers, std::string_view whatToDo,
+                        std::string_view option) {
+    for (const std::string& identifier : identifiers) {
+        if (Status legal = checkIdentifier(identifier, whatToDo, option); !legal) return legal;
+    }
+    return {};
+}
+
+Status checkChoice(const SyncArguments& arguments) {
+    const std::vector<std::string>& only = arguments.plan.only;
+    if (only.empty()) return {};
+    if (arguments.isStaged) {
+        return wrongUsage("--only does not go with --staged", "the staging area says what to sync");
+    }
+    if (arguments.plan.mirror) {
+        return wrongUsage("--only does not go with --mirror",
+                          "a mirror is one of the whole library");
+    }
+    for (const std::string& identifier : arguments.plan.remove) {
+        if (std::find(only.begin(), only.end(), identifier) == only.end()) continue;
+        return wrongUsage(identifier + " is named by --only and by --remove",
+                          "sync it or remove it");
+    }
+    return checkIdentifiers(only, kUseLegalCharacters, "--only");
+}
+
 Status checkArguments(const SyncArguments& arguments) {
     if (arguments.isStaged && (arguments.plan.mirror || !arguments.plan.remove.empty())) {
         return wrongUsage("--staged goes with neither --remove nor --mirror",
                           "the staging area says what to remove");
     }
-    for (const std::string& identifier : arguments.plan.remove) {
-        if (Status legal = checkIdentifier(identifier, kGiveAsShown, "--remove"); !legal) {
-            return legal;
-        }
-    }
-    return {};
+    Status legal = checkIdentifiers(arguments.plan.remove, kGiveAsShown, "--remove");
+    return legal ? checkChoice(arguments) : legal;
+}
+
+// What a plan prints is the plan: only a terminal, which takes it away again, shows more.
+bool showsPreparation(const SyncArguments& arguments, const Console& console) {
+    return !arguments.isDryRun ||
+           (arguments.display == SyncDisplayKind::Text && console.isTerminal);
 }
 
 // What the host staged for another session is not this one's to do.
@@ -58,7 +91,8 @@ class SyncRun {
         : arguments_(arguments),
           console_(console),
           display_(makeSyncDisplay(arguments.display, console)),
-          events_(*display_) {
+          events_(*display_),
+          preparation_(showsPreparation(arguments, console) ? &events_ : nullptr) {
         if (arguments.isDryRun) return;
         signals_.emplace(
             kPatience, [this] { events_.complainSoon(stoppingNotice()); }, [this] { leave(); });
@@ -72,20 +106,27 @@ class SyncRun {
     }
 
     Result<int> run() {
+        Result<int> status = attempt();
+        if (!status) preparation_.fail(status.error().description());
+        return status;
+    }
+
+  private:
+    Result<int> attempt() {
         Status ready = prepare();
         if (!ready) return ready.error();
         if (arguments_.isDryRun) return showPlan();
         isPlanned_ = true;
         if (sync_.staged.isTooLarge) return refuse(sync_.plan.failed.back().error);
         if (!sync_.space.fits()) return refuse(sync_.space.description());
-        if (sync_.givenUp != StagedWork::None) console_.complain(givenUpNote(sync_.givenUp));
+        if (sync_.givenUp != StagedWork::None) events_.complainSoon(givenUpNote(sync_.givenUp));
         ready = makeReady();
         if (!ready) return ready.error();
-        if (signals_->stopRequested()) return finish(summarizeInterrupted(sync_.plan, facts_));
-        return hold();
+        if (!signals_->stopRequested()) return hold();
+        preparation_.fail("interrupted");
+        return finish(summarizeInterrupted(sync_.plan, facts_));
     }
 
-  private:
     Status prepare() {
         Status status = openDevice();
         if (status) status = openLibrary();
@@ -105,10 +146,15 @@ class SyncRun {
     }
 
     Status openLibrary() {
-        Result<Library> library = readLibrary(arguments_.library, device_->propertyLists());
+        Result<Library> library = readLibrary(
+            arguments_.library, device_->propertyLists(),
+            [this](std::size_t done, std::size_t count) { preparation_.read(done, count); });
         if (!library) return library.error();
         library_ = *std::move(library);
-        return {};
+        // Where a few applications are chosen, the places of the others are not the sync's to say.
+        if (!arguments_.plan.only.empty()) library_.iconOrder.reset();
+        return arguments_.plan.mirror ? checkMirrorSource(library_, arguments_.mirrorsEmpty)
+                                      : Status();
     }
 
     Status makeThePlan() {
@@ -121,6 +167,7 @@ class SyncRun {
     }
 
     int showPlan() {
+        preparation_.finish();
         if (sync_.givenUp != StagedWork::None) {
             sync_.allowed.notes.push_back(givenUpNote(sync_.givenUp));
         }
@@ -139,17 +186,21 @@ class SyncRun {
 
     // Nothing of the plan is done, for one reason.
     int refuse(const std::string& reason) {
+        preparation_.fail(reason);
         return finish(summarizeRefused(sync_.allowed, reason));
     }
 
     Status makeReady() {
-        return arguments_.isStaged ? clearTheWayForStaged(*device_, sync_)
-                                   : clearTheWay(*device_, sync_, library_);
+        if (arguments_.isStaged) return clearTheWayForStaged(*device_, sync_);
+        return clearTheWay(*device_, sync_, library_, [this](std::size_t done, std::size_t count) {
+            preparation_.staged(done, count);
+        });
     }
 
     Result<int> hold() {
         Result<std::unique_ptr<PlugIn>> plugIn = PlugIn::load(*device_, events_, facts_, console_);
         if (!plugIn) return plugIn.error();
+        watchOver((*plugIn)->watch());
         for (const auto* installs : {&sync_.plan.install, &sync_.plan.update}) {
             for (const PlannedInstall& each : *installs) {
                 if (each.hasArrived) (*plugIn)->watch().setSize(each.identifier, each.bytes);
@@ -160,7 +211,13 @@ class SyncRun {
             {[this](const std::string& identifier) { return packageFileFor(library_, identifier); },
              [this](const std::string& identifier) {
                  return !sync_.standing.arrived.contains(identifier);
-             }});
+             },
+             true, [this] { preparation_.finish(); }});
+        if (end.error) {
+            preparation_.fail(end.error->description());
+        } else {
+            preparation_.finish();
+        }
         if (arguments_.isStaged && end.isSuccess()) {
             isStagingOver_ = true;
             endStagedSession(*device_);
@@ -174,21 +231,34 @@ class SyncRun {
         return int{exitStatusOf(aftermath.error())};
     }
 
+    void watchOver(SessionWatch& watch) {
+        const std::size_t count = sync_.allowed.install.size() + sync_.allowed.update.size();
+        watch.onAsking([this, count] { preparation_.asked(count); });
+        if (!arguments_.longestWait) return;
+        watch.limitWait(*arguments_.longestWait, [this] {
+            hasWaited_ = true;
+            leave();
+        });
+    }
+
     // What is in step with the library, an earlier update may have failed of.
     void forgetFailures(const std::vector<ApplicationRecord>& present) {
         if (arguments_.isStaged) return;
         device_->forgetFailures(identifiersInStep(library_, present)).ignore();
     }
 
-    // On the thread of the signals, whatever the session is at. From here on the plan stays as it
-    // is. What the session has said at its end comes before what is said here.
+    // On a thread of the signals' or the watch's, whatever the session is at. From here on the plan
+    // stays as it is. What the session has said at its end comes before what is said here.
     [[noreturn]] void leave() {
-        if (!isPlanned_) leaveAtOnce(console_);
+        if (!isPlanned_) {
+            events_.closeSoon();
+            leaveAtOnce(console_);
+        }
         const SyncSummary summary = timed(summaryOnLeaving());
         events_.finishSoon(summary);
         if (const int status = endedWith_; status >= 0) ::_exit(status);
         if (!summary.incomplete) ::_exit(kExitDone);
-        if (isStagingOver_) ::_exit(kExitSomethingFailed);
+        if (isStagingOver_ || hasWaited_) ::_exit(kExitSomethingFailed);
         leaveAtOnce(console_);
     }
 
@@ -224,6 +294,7 @@ class SyncRun {
     const Console& console_;
     std::unique_ptr<SyncDisplay> display_;
     SyncEvents events_;
+    PreparationEvents preparation_;
     SessionFacts facts_;
     std::unique_ptr<Device> device_;
     Library library_;
@@ -232,9 +303,10 @@ class SyncRun {
     std::atomic<bool> isPlanned_ = false;  // the plan is made, and changes no more
     // What is left of a staging area whose session has ended, the same command does not do.
     std::atomic<bool> isStagingOver_ = false;
-    std::atomic<int> endedWith_ = -1;     // the status that the session's own end has found
-    std::atomic_flag isDeviceTaken_;      // by whoever closes the device, or leaves it
-    std::optional<StopSignals> signals_;  // not for a dry run
+    std::atomic<bool> hasWaited_ = false;  // for as long as it was to
+    std::atomic<int> endedWith_ = -1;      // the status that the session's own end has found
+    std::atomic_flag isDeviceTaken_;       // by whoever closes the device, or leaves it
+    std::optional<StopSignals> signals_;   // not for a dry run
 };
 
 }  // namespace

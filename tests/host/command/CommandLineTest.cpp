@@ -102,6 +102,29 @@ INSTANTIATE_TEST_SUITE_P(
         WrongUsage{{"help", "dance"}, "there is no command dance"},
         WrongUsage{{"help", "package", "dance"}, "there is no command dance of package"},
         WrongUsage{{"help", "sync", "extra"}, "there is no command extra of sync"},
+        WrongUsage{{"sync", "device", "library", "--mirror=all"}, "--mirror=empty"},
+        WrongUsage{{"sync", "device", "library", "--only", "a/b"}, "--only a/b is not"},
+        WrongUsage{{"sync", "device", "library", "--only", "com.a", "--staged"}, "--staged"},
+        WrongUsage{{"sync", "device", "library", "--only", "com.a", "--mirror"}, "--mirror"},
+        WrongUsage{{"sync", "device", "library", "--only", "com.a", "--remove", "com.a"},
+                   "com.a is named by --only and by --remove"},
+        WrongUsage{{"plan", "device", "library", "--only", "com.a", "com.b"},
+                   "com.b is one argument too many for appsync plan"},
+        WrongUsage{{"sync", "device", "library", "--wait", "1m", "--no-wait"}, "--no-wait"},
+        WrongUsage{{"sync", "device", "library", "--wait", "soon"}, "soon is no time"},
+        WrongUsage{{"sync", "device", "library", "--wait", "-5"}, "-5 is no time"},
+        WrongUsage{{"sync", "device", "library", "--wait", "s"}, "s is no time"},
+        WrongUsage{{"sync", "device", "library", "--wait", "9000h"}, "9000h is no time"},
+        WrongUsage{{"sync", "device", "library", "--wait", "9223372036854775807m"}, "is no time"},
+        // An empty value is none, and takes no other word in its place.
+        WrongUsage{{"sync", "device", "library", "--remove=", "com.a"},
+                   "--remove needs another value than '': see appsync sync --help"},
+        WrongUsage{{"sync", "device", "library", "--mirror="}, "--mirror needs another value"},
+        WrongUsage{{"sync", "device", "library", "--remove", ""},
+                   "--remove: it needs another value than ''"},
+        WrongUsage{{"log", "device", "--category", ""}, "it needs another value than ''"},
+        WrongUsage{{"plist", "convert", "file", "--to=", "xml"},
+                   "--to needs another value than '': see appsync plist convert --help"},
         // One identifier for each --remove: what follows is an argument of the command.
         WrongUsage{{"sync", "device", "library", "--remove", "com.a", "com.b"},
                    "com.b is one argument too many for appsync sync"}));
@@ -144,6 +167,12 @@ TEST_F(CommandLine, HelpShowsTheHelpOfACommand) {
 TEST_F(CommandLine, WhatFollowsTheIdentifierToRemoveIsTheDeviceAndTheLibrary) {
     EXPECT_EQ(run({"plan", "--remove", "com.a", "/nonexistent/device", "library"}), 3);
     EXPECT_THAT(err.str(), HasSubstr("/nonexistent/device"));
+}
+
+TEST_F(CommandLine, ATimeIsSecondsMinutesOrHours) {
+    for (const char* time : {"0", "90", "90s", "5m", "8760h"}) {
+        EXPECT_EQ(run({"sync", "/nonexistent/device", "library", "--wait", time}), 3) << time;
+    }
 }
 
 TEST_F(CommandLine, ADeviceThatIsMissingIsStatus3) {
