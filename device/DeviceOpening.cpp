@@ -8,6 +8,7 @@
 
 #include "device/SpaceReserve.h"
 #include "device/database/Database.h"
+#include "device/database/DatabaseCopy.h"
 #include "device/database/DeviceSchema.h"
 #include "device/install/Containers.h"
 #include "device/values/DeviceError.h"
@@ -103,6 +104,12 @@ void actAsOwnerOf(const fs::path& device) {
     if (::stat(device.c_str(), &status) == 0) actAs(status.st_uid, status.st_gid);
 }
 
+// A session writes in any case: who may not is told before anything is touched, whoever holds it.
+Status requireWritable(const fs::path& device) {
+    if (const auto refused = whyNotWritable((device / kDatabaseName).string())) return *refused;
+    return {};
+}
+
 Status takeLock(const fs::path& device, std::optional<SessionLock>& lock) {
     Result<std::optional<SessionLock>> taken = SessionLock::take(device.string());
     if (!taken) return taken.error();
@@ -160,6 +167,7 @@ Result<OpenedDevice> openDevice(const std::string& path, bool session, bool make
     opened.path = device.string();
     Status status = checkDirectory(device);
     if (status) actAsOwnerOf(device);
+    if (status && session) status = requireWritable(device);
     if (status && session) status = takeLock(device, opened.lock);
     if (status && makesRoom) giveUpSpaceReserveIfFull(opened.path);
     if (status) status = openDatabase(device, session, opened);

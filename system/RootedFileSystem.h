@@ -9,6 +9,7 @@
 //     work            SystemWorkQueues.h, with ThreadedOperationQueue.h and DelayedWork.h
 //     log             JsonLogFacility.h, over LogFile.h, which bounds it
 //     notifications   SystemNotifications.h
+//     accounts        ActingAccount.h
 //     property_list/  both encodings, a room of its own
 //
 // Includes platform/ and POSIX; knows no device, no database, no plug-in. Called by device/ and

@@ -2,11 +2,11 @@
 
 // host/output: what commands say, as text or as JSON. SyncDisplays.h shows a session while it runs,
 // as bars, lines or JSON, and its summary; PlanText.h and JsonSync.h show plans, JsonSync.h events
-// and summaries too; JsonRecords.h has the JSON of what a device holds; WhyAnswer.h answers what an
-// application waits for; PropertyListOutline.h shows a property list. All of them make text of
-// values that others have gathered: nothing here asks a device or decides anything. Contracts with
-// programs that read it: docs/commands.md. Includes session, watch, plan, console, and of
-// the device its values and packages; called by the commands.
+// and summaries too; JsonRecords.h has the JSON of what a device holds; DeviceOverview.h shows it
+// at a glance; WhyAnswer.h answers what an application waits for; PropertyListOutline.h shows a
+// property list. All of them make text of values that others have gathered: nothing here asks a
+// device or decides anything. Contracts with programs that read it: docs/commands.md. Includes
+// session, watch, plan, console, and of the device its values and packages; called by the commands.
 
 #include <memory>
 #include <string>

@@ -183,10 +183,23 @@ def test_who_may_only_read_is_refused_every_change(place, coordination):
                     ["sync", library], ["demote", IDS[0]], ["reset"]):
         done = place.as_nobody(command[0], device.path, *command[1:], expect=3)
         assert "cannot be written" in done.stderr and done.stderr.count("\n") == 1, (command, done.stderr)
+    assert appearance(device.path) == before
     if device.is_coordinated:
         done = place.as_nobody("coordinator", device.path, "create", "com.example.new", expect=3)
         assert "cannot be written" in done.stderr
     assert appearance(device.path) == before
+
+
+def test_who_may_only_read_is_refused_a_session_whoever_holds_the_device(place):
+    appsync, device, library = place.appsync, place.device(), place.library()
+    device.sync(library)
+    packages.make_package(library, IDS[0], "2.0")
+    appsync("run", device.path, IDS[0])
+    sync = appsync.start("sync", device.path, library, "--json-lines")
+    for line in sync.stdout:
+        if json.loads(line).get("nextTry"):
+            break
+    assert "cannot be written" in place.as_nobody("sync", device.path, library, expect=3).stderr
 
 
 def test_who_may_not_read_is_told(place):
