@@ -5,6 +5,8 @@
 #include <unistd.h>
 
 #include <cerrno>
+#include <filesystem>
+#include <system_error>
 #include <utility>
 
 #include "system/PosixError.h"
@@ -127,6 +129,17 @@ bool isSpecial(const std::string& path) {
 
 }  // namespace
 
+namespace {
+
+// A link stays, as /dev/stdout does: what it leads to is replaced.
+std::string placeOf(const std::string& path) {
+    std::error_code code;
+    const std::filesystem::path place = std::filesystem::canonical(path, code);
+    return code ? path : place.native();
+}
+
+}  // namespace
+
 bool isHostFile(const std::string& path) {
     struct stat attributes {};
     return ::stat(path.c_str(), &attributes) == 0 && S_ISREG(attributes.st_mode);
@@ -135,13 +148,14 @@ bool isHostFile(const std::string& path) {
 Status writeHostFile(const std::string& path, ByteView contents) {
     // A pipe or a terminal is written to, not replaced.
     const bool isDirect = isSpecial(path);
-    const std::string target = isDirect ? path : path + "." + std::to_string(::getpid()) + ".new";
+    const std::string place = placeOf(path);
+    const std::string target = isDirect ? path : place + "." + std::to_string(::getpid()) + ".new";
     const int descriptor =
         ::open(target.c_str(), O_WRONLY | O_CREAT | O_CLOEXEC | (isDirect ? 0 : O_EXCL), 0666);
     if (descriptor < 0) return cannotWriteFile(errno, path);
     Status status = writeAndClose(descriptor, path, contents);
     if (isDirect) return status;
-    if (status && ::rename(target.c_str(), path.c_str()) != 0) {
+    if (status && ::rename(target.c_str(), place.c_str()) != 0) {
         status = cannotWriteFile(errno, path);
     }
     if (!status) ::unlink(target.c_str());

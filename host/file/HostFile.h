@@ -43,7 +43,8 @@ class HostFile {
 /// All that standard input brings, whatever it is; an error when that is more than `maximumBytes`.
 [[nodiscard]] Result<Bytes> readStandardInput(std::uint64_t maximumBytes);
 
-/// Creates or replaces a file of this machine, whole: on failure the old one stays.
+/// Creates or replaces a file of this machine, whole: on failure the old one stays. Where a link
+/// stands, the file that it leads to is replaced.
 [[nodiscard]] Status writeHostFile(const std::string& path, ByteView contents);
 
 /// Whether writing this file would replace one.

@@ -242,14 +242,9 @@ std::vector<std::string> waitStates(const SyncEvent& event) {
 }
 
 // What may stand behind the name, from the longest text to the shortest.
-std::vector<std::string> barStates(const SyncEvent& event, std::size_t width) {
+std::vector<std::string> barStates(const SyncEvent& event) {
     if (event.state == SyncState::Waiting) return waitStates(event);
-    if (event.state == SyncState::Failed) {
-        constexpr std::size_t kBefore = kPhaseWidth + kNameWidth + 1;
-        constexpr std::size_t kFewest = 12;
-        const std::size_t room = width > kBefore + kFewest ? width - kBefore : kFewest;
-        return {cut(printable(stateText(event)), room), "failed"};
-    }
+    if (event.state == SyncState::Failed) return {"failed"};  // the error stream says why
     const unsigned percent = percentOf(event.done, event.total);
     return {bar(percent, kBarWidth), bar(percent, kShortBarWidth), std::to_string(percent) + " %"};
 }
@@ -266,7 +261,7 @@ std::string eventBar(const SyncEvent& event, std::size_t width) {
     std::string bar = fitted(nameOf(event.phase), kPhaseWidth);
     const std::string name =
         printable(event.phase == SyncPhase::Prepare ? event.text : event.identifier);
-    const std::vector<std::string> states = barStates(event, width);
+    const std::vector<std::string> states = barStates(event);
     for (const std::string& state : states) {
         const std::size_t taken = displayWidth(state) + 1;
         if (taken + kPhaseWidth + kShortNameWidth <= width) {

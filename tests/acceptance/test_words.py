@@ -99,6 +99,16 @@ def test_what_writes_a_file_says_whether_it_replaced_one(appsync, device, librar
         assert told["replaced"] is False and told["bytes"] == os.path.getsize(out)
 
 
+def test_a_link_stays_and_what_it_leads_to_is_replaced(appsync, tmp_path):
+    (tmp_path / "in.plist").write_text('<plist version="1.0"><array/></plist>')
+    (tmp_path / "there").write_text("old")
+    os.symlink("there", tmp_path / "link")
+    convert = ["plist", "convert", tmp_path / "in.plist", "--to", "binary", "--out"]
+    assert one_line(appsync(*convert, tmp_path / "link").stdout).startswith("%s is replaced" % (tmp_path / "link"))
+    assert os.path.islink(tmp_path / "link") and (tmp_path / "there").read_bytes().startswith(b"bplist00")
+    assert sorted(os.listdir(tmp_path)) == ["in.plist", "link", "there"]
+
+
 # Errors.
 
 

@@ -65,11 +65,17 @@ TEST_F(SyncDisplays, RedrawsTheBarInPlace) {
 }
 
 TEST_F(SyncDisplays, NoBarIsWiderThanTheTerminal) {
-    SyncEvent failed = event(SyncEventKind::Ended, SyncState::Failed, 0, std::string(500, 'x'));
-    failed.identifier = std::string(300, 'y');
-    EXPECT_EQ(displayWidth(eventBar(failed, 79)), 79U);
-    failed.state = SyncState::Active;
-    EXPECT_LE(displayWidth(eventBar(failed, 79)), 79U);
+    SyncEvent wide = waiting();
+    wide.identifier = std::string(300, 'y');
+    wide.text = std::string(500, 'x');
+    EXPECT_LE(displayWidth(eventBar(wide, 79)), 79U);
+    wide.state = SyncState::Active;
+    EXPECT_LE(displayWidth(eventBar(wide, 79)), 79U);
+}
+
+TEST_F(SyncDisplays, ATerminalIsToldOnceWhySomethingFailed) {
+    const SyncEvent failed = event(SyncEventKind::Ended, SyncState::Failed, 0, "damaged");
+    EXPECT_THAT(eventBar(failed, 79), testing::EndsWith(" failed"));
 }
 
 TEST_F(SyncDisplays, NothingThatATerminalObeysGetsThrough) {
