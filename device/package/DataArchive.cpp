@@ -191,12 +191,18 @@ Status verifyDataArchive(const std::string& file) {
     return verified ? verified : Status(bare(verified.error(), (*archive)->name()));
 }
 
-Status unpackDataArchive(int archive, std::string_view name, int directory) {
+Status unpackDataArchive(int archive, std::string_view name, int directory,
+                         const DataProgress& progress) {
     const auto opened = openArchive(PackageFile::duplicate(archive, name));
     if (!opened) return opened.error();
     if (Status status = checkSpace(directory, **opened); !status) return status;
     PackageUnpackOptions options;
     options.keepsTimes = true;
+    std::uint64_t before = 0;
+    options.progress = [&](std::uint64_t done, std::uint64_t /*total*/) {
+        if (progress) progress(done - std::exchange(before, done));
+        return true;
+    };
     const Status unpacked = PackageUnpacker(**opened, directory, options).run();
     return unpacked ? unpacked : Status(bare(unpacked.error(), (*opened)->name()));
 }

@@ -50,8 +50,9 @@ using DataProgress = std::function<void(std::uint64_t bytes)>;
 
 /// Unpacks an archive of data into an empty directory. Both descriptors stay the caller's; `name`
 /// is what errors of the system call the archive. Nothing is made durable. Refused before the first
-/// byte when more would be unpacked than there is room for.
-[[nodiscard]] Status unpackDataArchive(int archive, std::string_view name, int directory);
+/// byte when more would be unpacked than there is room for. `progress` hears what was written.
+[[nodiscard]] Status unpackDataArchive(int archive, std::string_view name, int directory,
+                                       const DataProgress& progress = {});
 
 /// A file or a directory of an application's data.
 struct DataEntry {

@@ -98,30 +98,25 @@ Result<DataContents> dataOf(Device& device, const std::string& identifier) {
     return failure(identifier + " is not on the device", "appsync apps shows what is");
 }
 
-// What is made beside its place under a name of its own, and goes unless it is finished.
+// What is made beside its place as NAME.part, and goes unless it is finished.
 class PulledItem {
   public:
-    explicit PulledItem(const std::string& place) : place_(withoutSlash(place)) {
-        path_ = place_.parent_path() / (".appsync-pull-" + std::to_string(::getpid()));
-    }
+    explicit PulledItem(const std::string& place)
+        : place_(withoutSlash(place)), path_(place_.native() + ".part") {}
     ~PulledItem() {
         std::error_code code;
-        fs::remove_all(path_, code);
+        if (isOurs_) fs::remove_all(path_, code);
     }
     PulledItem(const PulledItem&) = delete;
     PulledItem& operator=(const PulledItem&) = delete;
 
     [[nodiscard]] std::string path() const { return path_.native(); }
 
-    [[nodiscard]] Status checkPlace(const Device& device) const {
-        std::error_code code;
-        if (fs::exists(fs::symlink_status(place_, code))) return isThere();
-        if (place_.empty() || !fs::is_directory(parent(), code)) {
-            return failure("cannot make '" + place_.native() + "'",
-                           "name a new one in a folder that is there");
-        }
-        if (!liesInDevice(device, place_.native())) return {};
-        return failure(place_.native() + " lies in the device", "name a place outside of it");
+    /// Only a place that may be used is written to, and cleared.
+    [[nodiscard]] Status takePlace(const Device& device) {
+        Status status = checkPlace(device);
+        isOurs_ = status.ok();
+        return status;
     }
 
     /// Puts it on disk, and then in its place.
@@ -144,8 +139,24 @@ class PulledItem {
         return failure(place_.native() + " exists", "name a new folder or archive");
     }
 
-    fs::path place_;
-    fs::path path_;
+    [[nodiscard]] Status checkPlace(const Device& device) const {
+        std::error_code code;
+        if (fs::exists(fs::symlink_status(place_, code))) return isThere();
+        if (fs::exists(fs::symlink_status(path_, code))) {
+            return failure(path_.native() + " exists, of a copy that was cut off or goes on",
+                           "remove it, or name another folder or archive");
+        }
+        if (place_.empty() || !fs::is_directory(parent(), code)) {
+            return failure("cannot make '" + place_.native() + "'",
+                           "name a new one in a folder that is there");
+        }
+        if (!liesInDevice(device, place_.native())) return {};
+        return failure(place_.native() + " lies in the device", "name a place outside of it");
+    }
+
+    const fs::path place_;
+    const fs::path path_;
+    bool isOurs_ = false;
 };
 
 // A line for what takes long: "copied 1.5 MiB".
@@ -181,8 +192,8 @@ Status pullArchive(Device& device, const std::string& directory, const std::stri
 }
 
 Status pull(Device& device, const DataArguments& arguments, const Console& console) {
-    const PulledItem item(arguments.place);
-    if (const Status good = item.checkPlace(device); !good) return good;
+    PulledItem item(arguments.place);
+    if (const Status taken = item.takePlace(device); !taken) return taken;
     const std::string directory = Device::dataPath(arguments.identifier);
     CopyProgress progress(console);
     const auto copy = isArchiveName(arguments.place) ? pullArchive : pullFolder;
@@ -201,10 +212,10 @@ Status fillFromFolder(const std::string& folder, int directory, const DataProgre
     return {};
 }
 
-Status fillFromArchive(const std::string& file, int directory) {
+Status fillFromArchive(const std::string& file, int directory, const DataProgress& progress) {
     const UniqueFd archive(::open(file.c_str(), O_RDONLY | O_NONBLOCK | O_CLOEXEC));
     if (!archive) return systemError(errno, "cannot open " + file);
-    const Status unpacked = unpackDataArchive(archive.get(), file, directory);
+    const Status unpacked = unpackDataArchive(archive.get(), file, directory, progress);
     if (unpacked || unpacked.error().domain != kInstallerErrorDomain) return unpacked;
     return failure(file + " cannot be unpacked: " + unpacked.error().description(),
                    "use another archive; nothing was changed");
@@ -247,7 +258,7 @@ Result<DataContents> push(Device& device, const DataArguments& arguments, const 
     const bool isFolder = fs::is_directory(arguments.place, code);
     const Status replaced = device.replaceData(arguments.identifier, [&](int made) {
         return isFolder ? fillFromFolder(arguments.place, made, progress.heard(), leftOut)
-                        : fillFromArchive(arguments.place, made);
+                        : fillFromArchive(arguments.place, made, progress.heard());
     });
     if (!replaced) return replaced.error();
     Result<DataContents> now = listData(device.root(), directory);

@@ -23,7 +23,7 @@ const HeldApplication& heldBy(const Holdings& side, const std::string& identifie
 }
 
 Json sideJson(const HeldApplication& application) {
-    return {{"version", application.version}, {"state", nameOf(application.state)}};
+    return {{"version", application.version}, {"state", stateName(application.state)}};
 }
 
 Json onlyJson(const Holdings& side, const std::vector<std::string>& identifiers) {
@@ -59,8 +59,8 @@ std::string comparisonJson(const Holdings& left, const Holdings& right,
     for (const UnreadableHolding& each : comparison.unreadable) {
         failed.push_back({{"what", each.what}, {"error", each.error}});
     }
-    return indented({{"left", {{"path", left.path}, {"kind", nameOf(left.kind)}}},
-                     {"right", {{"path", right.path}, {"kind", nameOf(right.kind)}}},
+    return indented({{"left", {{"path", left.path}, {"kind", kindName(left.kind)}}},
+                     {"right", {{"path", right.path}, {"kind", kindName(right.kind)}}},
                      {"same", comparison.same()},
                      {"onlyLeft", onlyJson(left, comparison.onlyLeft)},
                      {"onlyRight", onlyJson(right, comparison.onlyRight)},
@@ -74,7 +74,7 @@ void printOnly(const char* label, const Holdings& side, const std::vector<std::s
     for (const std::string& identifier : identifiers) {
         const HeldApplication& held = heldBy(side, identifier);
         console.out << label << identifier << " " << printable(held.version) << " ("
-                    << nameOf(held.state) << ")\n";
+                    << stateName(held.state) << ")\n";
     }
 }
 
@@ -88,8 +88,8 @@ void printDifference(const ApplicationDifference& difference, const Holdings& le
                     << printable(other.version) << '\n';
     }
     if (difference.inState) {
-        console.out << "state       " << name << ": " << nameOf(one.state) << " | "
-                    << nameOf(other.state) << '\n';
+        console.out << "state       " << name << ": " << stateName(one.state) << " | "
+                    << stateName(other.state) << '\n';
     }
     if (difference.inData) console.out << "data        " << name << '\n';
 }
@@ -107,7 +107,7 @@ void printComparison(const Holdings& left, const Holdings& right, const Comparis
 
 void sayKinds(const Holdings& left, const Holdings& right, const Console& console) {
     const auto described = [](const Holdings& side) {
-        return side.path + " is a " + std::string(nameOf(side.kind));
+        return side.path + " is a " + std::string(kindName(side.kind));
     };
     console.complain("left: " + described(left) + "; right: " + described(right));
 }

@@ -167,12 +167,12 @@ Holdings::Holdings(Holdings&&) noexcept = default;
 Holdings& Holdings::operator=(Holdings&&) noexcept = default;
 Holdings::~Holdings() = default;
 
-std::string_view nameOf(HoldingsKind kind) {
+std::string_view kindName(HoldingsKind kind) {
     constexpr std::array<std::string_view, 3> kNames = {"device", "backup", "library"};
     return kNames.at(static_cast<std::size_t>(kind));
 }
 
-std::string_view nameOf(HeldState state) {
+std::string_view stateName(HeldState state) {
     constexpr std::array<std::string_view, 7> kNames = {
         "installed", "offloaded", "restored", "arriving", "backed up", "offloaded", "package"};
     return kNames.at(static_cast<std::size_t>(state));

@@ -25,7 +25,7 @@ class PropertyListSerialization;
 enum class HoldingsKind { Device, Backup, Library };
 
 /// "device", "backup", "library".
-[[nodiscard]] std::string_view nameOf(HoldingsKind kind);
+[[nodiscard]] std::string_view kindName(HoldingsKind kind);
 
 /// How an application is there.
 enum class HeldState {
@@ -42,7 +42,7 @@ enum class HeldState {
 };
 
 /// "installed", "offloaded" and so on.
-[[nodiscard]] std::string_view nameOf(HeldState state);
+[[nodiscard]] std::string_view stateName(HeldState state);
 
 /// One application of a device, a backup or a library.
 struct HeldApplication {

@@ -9,13 +9,13 @@
 namespace appsync {
 namespace {
 
-constexpr std::chrono::milliseconds kPatience{500};
+constexpr std::chrono::milliseconds kBeforeTheLine{500};
 constexpr std::chrono::milliseconds kBetweenLines{100};
 
 }  // namespace
 
 ProgressLine::ProgressLine(const Console& console, std::function<Clock::time_point()> now)
-    : console_(console), now_(std::move(now)), due_(now_() + kPatience) {}
+    : console_(console), now_(std::move(now)), due_(now_() + kBeforeTheLine) {}
 
 void ProgressLine::show(const std::function<std::string()>& text) {
     if (!console_.isTerminal) return;
