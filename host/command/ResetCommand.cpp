@@ -30,13 +30,12 @@ std::vector<std::string> placeholdersOf(Device& device) {
 }
 
 // Nothing but the data tells any more that there were such applications.
-void tellWhoseDataStays(const Device& device, const std::vector<std::string>& placeholders,
-                        const Console& console) {
+void tellWhoseDataStays(const std::vector<std::string>& identifiers, const Console& console) {
+    if (identifiers.empty()) return;
     std::string names;
-    for (const std::string& each : placeholders) {
-        if (device.hasData(each)) names += (names.empty() ? "" : ", ") + printable(each);
+    for (const std::string& each : identifiers) {
+        names += (names.empty() ? "" : ", ") + printable(each);
     }
-    if (names.empty()) return;
     console.out << "The data of " << names
                 << " stays: installing it again finds it, and appsync uninstall removes it.\n";
 }

@@ -13,7 +13,7 @@
 #include "device/Device.h"
 #include "host/command/Commands.h"
 #include "host/command/IdentifierArgument.h"
-#include "host/command/MirrorSource.h"
+#include "host/command/SyncSource.h"
 #include "host/console/Console.h"
 #include "host/console/Problem.h"
 #include "host/console/Text.h"
@@ -34,41 +34,6 @@ namespace appsync {
 namespace {
 
 using Clock = std::chrono::steady_clock;
-
-Status checkIdentifiers(const std::vector<std::string>& identifiers, std::string_view whatToDo,
-                        std::string_view option) {
-    for (const std::string& identifier : identifiers) {
-        if (Status legal = checkIdentifier(identifier, whatToDo, option); !legal) return legal;
-    }
-    return {};
-}
-
-Status checkChoice(const SyncArguments& arguments) {
-    const std::vector<std::string>& only = arguments.plan.only;
-    if (only.empty()) return {};
-    if (arguments.isStaged) {
-        return wrongUsage("--only does not go with --staged", "the staging area says what to sync");
-    }
-    if (arguments.plan.mirror) {
-        return wrongUsage("--only does not go with --mirror",
-                          "a mirror is one of the whole library");
-    }
-    for (const std::string& identifier : arguments.plan.remove) {
-        if (std::find(only.begin(), only.end(), identifier) == only.end()) continue;
-        return wrongUsage(identifier + " is named by --only and by --remove",
-                          "sync it or remove it");
-    }
-    return checkIdentifiers(only, kUseLegalCharacters, "--only");
-}
-
-Status checkArguments(const SyncArguments& arguments) {
-    if (arguments.isStaged && (arguments.plan.mirror || !arguments.plan.remove.empty())) {
-        return wrongUsage("--staged goes with neither --remove nor --mirror",
-                          "the staging area says what to remove");
-    }
-    Status legal = checkIdentifiers(arguments.plan.remove, kGiveAsShown, "--remove");
-    return legal ? checkChoice(arguments) : legal;
-}
 
 // What a plan prints is the plan: only a terminal, which takes it away again, shows more.
 bool showsPreparation(const SyncArguments& arguments, const Console& console) {
@@ -146,15 +111,12 @@ class SyncRun {
     }
 
     Status openLibrary() {
-        Result<Library> library = readLibrary(
-            arguments_.library, device_->propertyLists(),
+        Result<Library> library = readSyncLibrary(
+            arguments_, device_->propertyLists(),
             [this](std::size_t done, std::size_t count) { preparation_.read(done, count); });
         if (!library) return library.error();
         library_ = *std::move(library);
-        // Where a few applications are chosen, the places of the others are not the sync's to say.
-        if (!arguments_.plan.only.empty()) library_.iconOrder.reset();
-        return arguments_.plan.mirror ? checkMirrorSource(library_, arguments_.mirrorsEmpty)
-                                      : Status();
+        return {};
     }
 
     Status makeThePlan() {
@@ -312,7 +274,7 @@ class SyncRun {
 }  // namespace
 
 int runSync(const SyncArguments& arguments, const Console& console) {
-    const Status checked = checkArguments(arguments);
+    const Status checked = checkSyncArguments(arguments);
     if (!checked) return console.fail(checked.error());
     const Result<int> status = SyncRun(arguments, console).run();
     return status ? *status : console.fail(status.error());
