@@ -93,7 +93,7 @@ CoordinatorRecord coordinator(CoordinationClient missing) {
     return record;
 }
 
-DeviceSettings coordinated() {
+DeviceSettings coordinatedSettings() {
     DeviceSettings settings;
     settings.coordination = true;
     return settings;
@@ -102,9 +102,9 @@ DeviceSettings coordinated() {
 TEST(WhyAnswer, NamesThePromiseOfTheHostThatIsMissing) {
     ApplicationStatus status;
     status.coordinator = coordinator(SyncClientID);
-    EXPECT_EQ(explain("com.a", status, coordinated()).waitsFor->what, "sync");
+    EXPECT_EQ(explain("com.a", status, coordinatedSettings()).waitsFor->what, "sync");
     status.sessionUnderWay = true;
-    const WhyAnswer answer = explain("com.a", status, coordinated());
+    const WhyAnswer answer = explain("com.a", status, coordinatedSettings());
     EXPECT_EQ(answer.waitsFor->what, "transfer");
     EXPECT_EQ(answer.waitsFor->who, "host");
     EXPECT_EQ(answer.waitsFor->promise, "com.a-Asset");
@@ -114,16 +114,16 @@ TEST(WhyAnswer, NamesThePromiseOfTheHostThatIsMissing) {
 TEST(WhyAnswer, NamesAnotherClientAndTheStore) {
     ApplicationStatus status;
     status.coordinator = coordinator(7);
-    EXPECT_EQ(explain("com.a", status, coordinated()).waitsFor->who, "client 7");
+    EXPECT_EQ(explain("com.a", status, coordinatedSettings()).waitsFor->who, "client 7");
     status.coordinator = coordinator(AppStoreClientID);
-    EXPECT_EQ(explain("com.a", status, coordinated()).waitsFor->who, "store");
+    EXPECT_EQ(explain("com.a", status, coordinatedSettings()).waitsFor->who, "store");
 }
 
 TEST(WhyAnswer, WhatAnotherClientHasBegunCanBeCancelled) {
     ApplicationStatus status;
     status.coordinator = coordinator(AppStoreClientID);
     status.coordinator->client = AppStoreClientID;  // not what the host has left to the store
-    const WhyAnswer answer = explain("com.a", status, coordinated());
+    const WhyAnswer answer = explain("com.a", status, coordinatedSettings());
     EXPECT_EQ(answer.waitsFor->what, "promise");
     EXPECT_EQ(answer.waitsFor->who, "client 1");
     EXPECT_THAT(whyText(answer), HasSubstr("appsync coordinator DEVICE cancel com.a --client 1"));
@@ -133,7 +133,7 @@ TEST(WhyAnswer, WhatNobodyHasPromisedIsItsCreatorsTask) {
     ApplicationStatus status;
     status.coordinator = coordinator(SyncClientID);
     status.coordinator->waitsForClient.reset();
-    EXPECT_EQ(explain("com.a", status, coordinated()).waitsFor->what, "sync");
+    EXPECT_EQ(explain("com.a", status, coordinatedSettings()).waitsFor->what, "sync");
 }
 
 TEST(WhyAnswer, ACoordinatorIsGivenUpWhereInstallsAreNotCoordinatedAnyMore) {
@@ -150,20 +150,20 @@ TEST(WhyAnswer, ARestoredApplicationComesFromTheStoreWhereInstallsAreCoordinated
     ApplicationStatus status;
     status.placeholder = application(true, kInstallTypeRestore);
     EXPECT_EQ(explain("com.a", status, {}).waitsFor->what, "transfer");
-    EXPECT_EQ(explain("com.a", status, coordinated()).waitsFor->what, "store");
+    EXPECT_EQ(explain("com.a", status, coordinatedSettings()).waitsFor->what, "store");
     status.awaitsRestoreData = true;
     EXPECT_EQ(explain("com.a", status, {}).waitsFor->what, "restore data");
-    EXPECT_EQ(explain("com.a", status, coordinated()).waitsFor->what, "store");
+    EXPECT_EQ(explain("com.a", status, coordinatedSettings()).waitsFor->what, "store");
 }
 
 TEST(WhyAnswer, ACompleteCoordinatorWaitsForASessionOrItsInstall) {
     ApplicationStatus status;
     status.coordinator = coordinator(SyncClientID);
     status.coordinator->isComplete = true;
-    EXPECT_EQ(explain("com.a", status, coordinated()).waitsFor->what, "sync");
+    EXPECT_EQ(explain("com.a", status, coordinatedSettings()).waitsFor->what, "sync");
     status.sessionUnderWay = true;
-    EXPECT_EQ(explain("com.a", status, coordinated()).waitsFor->what, "install");
-    EXPECT_FALSE(explain("com.a", status, coordinated()).waitsFor->promise);
+    EXPECT_EQ(explain("com.a", status, coordinatedSettings()).waitsFor->what, "install");
+    EXPECT_FALSE(explain("com.a", status, coordinatedSettings()).waitsFor->promise);
 }
 
 TEST(WhyAnswer, NamesThePolicyThatForbids) {
@@ -186,7 +186,7 @@ TEST(WhyAnswer, NamesThePolicyThatForbids) {
 }
 
 TEST(WhyAnswer, NoPolicyKeepsTheStoreFromBringingWhatWasRestored) {
-    DeviceSettings settings = coordinated();
+    DeviceSettings settings = coordinatedSettings();
     settings.installation = PolicyAnswer::No;
     ApplicationStatus status;
     status.coordinator = coordinator(AppStoreClientID);
