@@ -233,7 +233,7 @@ void Session::reportFailure(const SyncAssetPointer& asset, const ErrorRecord& er
 // A stop that comes when nothing is left to do interrupts nothing.
 const SessionEnd& Session::end(const std::vector<std::string>& known) {
     device_.letCoordinatedInstallsGo();
-    watch_.setOnlyWaiting();
+    watch_.nothingMoreIsSent();
     client_.assetTransferEndedWithSuccess(!isCutShort_ && !end_.error);
     if (watch_.isCoordinated()) {
         cancelWhere([this](const CoordinatorRecord& each) {

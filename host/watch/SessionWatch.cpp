@@ -158,9 +158,8 @@ std::uint64_t SessionWatch::sizeOf(const std::string& identifier) const {
 }
 
 void SessionWatch::limitWait(std::chrono::milliseconds longest, std::function<void()> leave) {
-    const std::lock_guard guard(mutex_);  // the poller looks already
-    longestWait_ = longest;
     leave_ = std::move(leave);
+    waitLimit_.set(longest);
 }
 
 void SessionWatch::placeholderAsked() const {
@@ -181,10 +180,7 @@ void SessionWatch::terminationDenied(const std::string& identifier) {
 
 void SessionWatch::reportWaiting(const std::string& identifier,
                                  std::chrono::system_clock::time_point nextTry) {
-    {
-        const std::lock_guard guard(mutex_);
-        waiting_.insert(identifier);
-    }
+    waitLimit_.waits(identifier);
     events_.report({SyncEventKind::Waiting, SyncPhase::Install, identifier, 0, sizeOf(identifier),
                     SyncState::Waiting, nextTry, identifier + " is running"});
 }
@@ -192,9 +188,9 @@ void SessionWatch::reportWaiting(const std::string& identifier,
 void SessionWatch::installBegins(const std::string& identifier) {
     const std::uint64_t size = sizeOf(identifier);
     reportBegin(identifier, size);
+    waitLimit_.goesOn(identifier);
     const std::lock_guard guard(mutex_);
     installing_[identifier] = size;
-    waiting_.erase(identifier);
     concluded_.erase(identifier);
 }
 
@@ -211,10 +207,9 @@ void SessionWatch::installEnded(const std::string& identifier, const Status& sta
         const std::lock_guard guard(mutex_);
         hasBegun = installing_.erase(identifier) > 0;
         delivered_.erase(identifier);
-        underWay_.erase(identifier);
-        waiting_.erase(identifier);
         concluded_.insert(identifier);
     }
+    waitLimit_.hasEnded(identifier);
     if (!hasBegun) reportBegin(identifier, size);
     if (status) {
         facts_.installed(identifier);
@@ -252,9 +247,9 @@ void SessionWatch::uninstallEnded(const std::string& identifier, const Status& s
 
 void SessionWatch::packageSent(const std::string& identifier, const std::string& received,
                                const std::string& file) {
+    waitLimit_.isUnderWay(identifier);
     const std::lock_guard guard(mutex_);
     sent_[identifier] = {received, file};
-    underWay_.insert(identifier);
 }
 
 void SessionWatch::packageDelivered(const std::string& identifier) {
@@ -271,7 +266,7 @@ void SessionWatch::takeUpDelivered(const std::string& identifier) {
     if (concluded_.contains(identifier)) return;  // meanwhile
     if (!delivered_.try_emplace(identifier).second) return;
     installing_[identifier] = size;
-    underWay_.insert(identifier);
+    waitLimit_.isUnderWay(identifier);
     reportBegin(identifier, size);  // before anything else is told of it
 }
 
@@ -346,24 +341,11 @@ void SessionWatch::poll() {
 }
 
 void SessionWatch::checkWait() {
-    const std::vector<std::string> waiting = takeWaiting();
+    const std::vector<std::string> waiting = waitLimit_.givenUpAt(std::chrono::steady_clock::now());
     if (waiting.empty()) return;
     for (const std::string& identifier : waiting) giveUpWaiting(identifier);
     isWaitOver_ = true;
     if (!isCoordinated_) leave_();
-}
-
-// What waits, once it has waited for long enough with nothing else being under way.
-std::vector<std::string> SessionWatch::takeWaiting() {
-    const std::lock_guard guard(mutex_);
-    const auto now = std::chrono::steady_clock::now();
-    const auto sinceLastLook = now - std::exchange(lastLook_, now);
-    const bool isDue = longestWait_ && isOnlyWaiting_ && !isWaitOver_ && !underWay_.empty() &&
-                       waiting_.size() == underWay_.size();
-    if (!isDue) return {};
-    waited_ += sinceLastLook;
-    if (waited_ < *longestWait_) return {};
-    return {waiting_.begin(), waiting_.end()};
 }
 
 // It may have ended meanwhile; on the direct path the next try comes when it comes.
@@ -386,11 +368,7 @@ void SessionWatch::reportDenials() {
 void SessionWatch::reportDenial(const std::string& identifier) {
     const Result<ApplicationStatus> status = device_.status(identifier);
     if (!status) return;
-    {
-        const std::lock_guard guard(mutex_);
-        if (!status->denial) waiting_.erase(identifier);
-    }
-    if (!status->denial) return;
+    if (!status->denial) return waitLimit_.goesOn(identifier);
     {
         const std::lock_guard guard(mutex_);
         const auto found = delivered_.find(identifier);

@@ -7,6 +7,7 @@
 //                       service; keeps what it sees as SessionFacts.h and tells SyncEvents.h
 //     SyncEvents.h      one order for the events of all threads; a SyncDisplay shows them
 //     PreparationEvents.h    tells it of what comes before the first transfer
+//     WaitLimit.h       how long a session waits for applications that run
 //     SyncDaemon.h      the daemon that the plug-in is told of, with TransferQueue.h, which is
 //                       what it has still to send
 //
@@ -26,6 +27,7 @@
 #include <thread>
 #include <vector>
 
+#include "host/watch/WaitLimit.h"
 #include "platform/AppRegistry.h"
 #include "platform/DevicePolicyService.h"
 #include "platform/HomeScreenService.h"
@@ -76,7 +78,7 @@ class SessionWatch {
     /// ends: on the direct path, on a thread of this object's own. To be set before the session.
     void limitWait(std::chrono::milliseconds longest, std::function<void()> leave);
     /// Everything that was to be sent has been: from now on there is only to be waited.
-    void setOnlyWaiting() { isOnlyWaiting_ = true; }
+    void nothingMoreIsSent() { waitLimit_.nothingMoreIsSent(); }
     [[nodiscard]] bool isWaitOver() const { return isWaitOver_; }
 
     /// Whether the client installs through coordinators.
@@ -134,7 +136,6 @@ class SessionWatch {
     [[nodiscard]] std::string causeOf(const std::string& identifier,
                                       const ErrorRecord& error) const;
     void checkWait();
-    [[nodiscard]] std::vector<std::string> takeWaiting();
     void giveUpWaiting(const std::string& identifier);
     std::uint64_t sizeOf(const std::string& identifier) const;
 
@@ -148,11 +149,10 @@ class SessionWatch {
     std::unique_ptr<InstallCoordinatorService> coordination_;
     std::atomic<bool> removing_ = false;
     std::atomic<bool> isCoordinated_ = false;
-    std::atomic<bool> isOnlyWaiting_ = false;
     std::atomic<bool> isWaitOver_ = false;
     std::function<void()> asking_;
-    std::optional<std::chrono::milliseconds> longestWait_;
     std::function<void()> leave_;
+    WaitLimit waitLimit_{std::chrono::steady_clock::now()};
 
     mutable std::mutex mutex_;
     std::condition_variable ended_;
@@ -161,12 +161,8 @@ class SessionWatch {
     std::map<std::string, std::uint64_t> installing_;  // to their sizes
     std::map<std::string, Delivered> delivered_;       // through coordinators
     std::map<std::string, SentPackage> sent_;          // in this session
-    std::set<std::string> underWay_;                   // what was sent or taken up, and is not over
-    std::set<std::string> waiting_;                    // what of that was last refused, as it runs
-    std::chrono::steady_clock::duration waited_{};     // for that alone
-    std::chrono::steady_clock::time_point lastLook_ = std::chrono::steady_clock::now();
-    std::set<std::string> concluded_;  // what was installed, or failed
-    std::size_t uninstalls_ = 0;       // of the coordination service's, under way
+    std::set<std::string> concluded_;                  // what was installed, or failed
+    std::size_t uninstalls_ = 0;                       // of the coordination service's, under way
     bool isOver_ = false;
 
     std::thread poller_;
