@@ -14,6 +14,8 @@
 #include "device/values/PackageIdentifier.h"
 #include "fuzz/readers/ScratchDirectory.h"
 #include "host/backup/Backup.h"
+#include "host/console/PropertyListReading.h"
+#include "host/output/JsonRecords.h"
 #include "host/plan/Versions.h"
 #include "system/property_list/PropertyListBinaryReader.h"
 #include "system/property_list/PropertyListCodec.h"
@@ -145,6 +147,14 @@ Reading readManifest(ByteView bytes) {
     return Reading::read()
         .unless(std::ranges::all_of(manifest->applications, isLegal), "an illegal identifier")
         .unless(std::ranges::all_of(manifest->files, isInside), "a file outside the backup");
+}
+
+Reading readJsonList(ByteView bytes) {
+    const std::string_view text(reinterpret_cast<const char*>(bytes.data()), bytes.size());
+    const Result<PropertyList> value = propertyListOfJson(text);
+    if (!value) return Reading::refused(value.error().description());
+    const Result<PropertyList> again = propertyListOfJson(jsonText(*value));
+    return Reading::read().unless(again.ok() && *again == *value, "it does not read back equal");
 }
 
 Reading readVersions(ByteView bytes) {

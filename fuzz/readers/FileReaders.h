@@ -14,6 +14,9 @@ namespace appsync {
 /// equal.
 [[nodiscard]] Reading readBinaryList(ByteView bytes);
 
+/// A property list in JSON. What was read is shown as JSON and read back equal.
+[[nodiscard]] Reading readJsonList(ByteView bytes);
+
 /// A package. If it unpacks to little, it is unpacked: then what stands there is what was
 /// announced, regular files and directories without dangerous modes.
 [[nodiscard]] Reading readPackage(ByteView bytes);

@@ -72,7 +72,7 @@ std::size_t helpColumn(const std::string& line) {
     const std::size_t gap = line.find("  ", begin);
     const std::size_t text = gap == std::string::npos ? gap : line.find_first_not_of(' ', gap);
     constexpr std::size_t kFarthest = 40;
-    return text == std::string::npos || text > kFarthest ? begin + 2 : text;
+    return text > kFarthest ? begin + 2 : text;
 }
 
 // The text with its long lines broken between words.

@@ -5,9 +5,9 @@
 // file of its own: <Name>Command.cpp. Such a file holds what is the command's own: which arguments
 // go together, what it opens, in which order it asks other rooms, what it prints. What could serve
 // another command stands elsewhere: host/plan (what is to be done), host/session (doing it with the
-// plug-in), host/backup, host/output (texts and JSON). OpenDevice.h and IdentifierArgument.h are
-// what commands share; SyncSource.h (with MirrorSource.h) is what those share that plan a sync.
-// LogLines.h is a part of LogCommand.cpp.
+// plug-in), host/backup, host/output (texts and JSON). OpenDevice.h, IdentifierArgument.h and
+// WrittenFile.h are what commands share; SyncSource.h (with MirrorSource.h) is what those share
+// that plan a sync. LogLines.h is a part of LogCommand.cpp.
 //
 // A new command: a function here, its file, its options in CommandLine.cpp, a line in
 // docs/commands.md and in tests/host/command/CommandLineTest.cpp. Includes every other room of

@@ -121,7 +121,7 @@ Result<ChangedSettings> changeSettings(Device& device, const DeviceSettingsChang
     return result;
 }
 
-void printJson(const ChangedSettings& settings, const Console& console) {
+void printSettingsJson(const ChangedSettings& settings, const Console& console) {
     console.out << indented({{"installation", nameOf(settings.now.installation)},
                              {"removal", nameOf(settings.now.removal)},
                              {"coordination", settings.now.coordination ? "on" : "off"},
@@ -131,7 +131,8 @@ void printJson(const ChangedSettings& settings, const Console& console) {
                 << '\n';
 }
 
-void print(const std::string& device, const ChangedSettings& settings, const Console& console) {
+void printSettings(const std::string& device, const ChangedSettings& settings,
+                   const Console& console) {
     console.out << printable(device) << (settings.hasChanged ? " is set: " : " was so already: ")
                 << "installation=" << nameOf(settings.now.installation)
                 << " removal=" << nameOf(settings.now.removal)
@@ -158,9 +159,9 @@ int runSet(const std::string& device, const std::vector<std::string>& assignment
     const Result<ChangedSettings> settings = changeSettings(**opened, *change);
     if (!settings) return console.fail(settings.error());
     if (asJson) {
-        printJson(*settings, console);
+        printSettingsJson(*settings, console);
     } else {
-        print(device, *settings, console);
+        printSettings(device, *settings, console);
     }
     return kExitDone;
 }

@@ -3,8 +3,8 @@
 // host/console: what every other room of host/ speaks with. `Console` (this header) is where a
 // command prints; Problem.h makes errors that say what to do and carry an exit status; Text.h makes
 // foreign text safe to print, and formats sizes and times; Table.h sets columns; JsonWriting.h and
-// JsonReading.h are the two directions of JSON. Knows neither devices nor plans: includes platform/
-// and nlohmann-json only.
+// JsonReading.h are the two directions of JSON, PropertyListReading.h reads lists from it. Knows
+// neither devices nor plans: includes platform/ and nlohmann-json only.
 
 #include <cstddef>
 #include <iosfwd>

@@ -18,6 +18,7 @@
 namespace appsync {
 namespace {
 
+constexpr int kFarthestYear = 10'000;
 constexpr std::string_view kJsonBlanks = " \t\r\n";
 
 // The value of a base64 digit; 64 for what is none.
@@ -79,7 +80,8 @@ std::optional<PropertyList::Date> dateOfText(std::string_view text) {
                                            std::chrono::day{static_cast<unsigned>(day)}};
     const bool isTime =
         hour >= 0 && hour < 24 && minute >= 0 && minute < 60 && second >= 0 && second <= 60;
-    if (!text.empty() || !date.ok() || !isTime || int{date.year()} != year) return std::nullopt;
+    const bool isYear = year > -kFarthestYear && year < kFarthestYear;
+    if (!text.empty() || !isYear || !date.ok() || !isTime) return std::nullopt;
     const double days = static_cast<double>((std::chrono::sys_days{date} - kEpoch).count());
     return PropertyList::Date{days * 86400 + hour * 3600 + minute * 60 + second};
 }

@@ -13,7 +13,7 @@ namespace appsync {
 namespace {
 
 constexpr double kSecondsTo2001 = 978307200;
-constexpr double kFarthestSecond = 2.0e11;  // some six thousand years from 2001
+constexpr double kFarthestSecond = 2.6e11;  // some eight thousand years from 2001
 constexpr std::size_t kShownBytes = 16;
 
 std::string realText(double value) {

@@ -120,7 +120,7 @@ std::optional<std::string> fileNamedFor(const std::string& folder, const std::st
     if (!names) return std::nullopt;
     for (const std::string& name : *names) {
         const bool isNamedSo = name.size() == identifier.size() + 4 && name.starts_with(identifier);
-        if (isNamedSo) return folder + "/" + name;
+        if (isNamedSo) return std::string(folder).append("/").append(name);
     }
     return std::nullopt;
 }

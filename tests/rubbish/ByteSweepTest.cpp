@@ -44,6 +44,7 @@ constexpr Reader coordinated() {
 const std::array kKinds = {
     Kind{"XmlList", smallXmlList, readXmlList, Pace::Quick},
     Kind{"BinaryList", smallBinaryList, readBinaryList, Pace::Quick},
+    Kind{"JsonList", smallJsonList, readJsonList, Pace::Quick},
     Kind{"Package", smallPackage, readPackage, Pace::Slow},
     Kind{"DataArchive", smallDataArchive, readDataArchive, Pace::Slow},
     Kind{"Icon", smallIcon, readIcon, Pace::Slow},

@@ -65,6 +65,13 @@ Bytes smallXmlList() { return xml(everyKind()); }
 
 Bytes smallBinaryList() { return binary(everyKind()); }
 
+Bytes smallJsonList() {
+    constexpr std::string_view kText =
+        R"({"text": "x\n\u00e9", "flags": [true, false], "numbers": [-5, 18446744073709551615, 2.5e3],)"
+        R"( "data": {"data": "AAH/gA=="}, "date": {"date": "1999-12-31T23:59:58Z"}, "map": {"a": {}}})";
+    return {kText.begin(), kText.end()};
+}
+
 Bytes smallPackage() {
     const ScratchDirectory scratch;
     const fs::path folder = fs::path(scratch.path()) / "folder";
@@ -84,9 +91,10 @@ Bytes smallDataArchive() {
     write(top / "letter", bytesOf("Dear"));
     write(top / "zeros", Bytes(300));
     const fs::path archive = top / "data.zip";
-    const std::vector<PackageItem> items{{top / "Documents", "Documents/", S_IFDIR | 0755U, 0},
-                                         {top / "letter", "Documents/letter", S_IFREG | 0644U, 4},
-                                         {top / "zeros", "zeros", S_IFREG | 0600U, 300}};
+    const std::vector<PackageItem> items{
+        {top / "Documents", "Documents/", S_IFDIR | 0755U, 0},
+        {top / "letter", "Documents/letter", S_IFREG | 0644U, 4, 1},
+        {top / "zeros", "zeros", S_IFREG | 0600U, 300}};
     if (!writeArchive(items, archive.native())) return {};
     return contentsOf(archive);
 }

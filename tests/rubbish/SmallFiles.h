@@ -9,6 +9,7 @@ namespace appsync {
 
 [[nodiscard]] Bytes smallXmlList();
 [[nodiscard]] Bytes smallBinaryList();
+[[nodiscard]] Bytes smallJsonList();
 [[nodiscard]] Bytes smallPackage();
 [[nodiscard]] Bytes smallDataArchive();
 [[nodiscard]] Bytes smallIcon();
