@@ -28,6 +28,7 @@
 #include "host/console/Table.h"
 #include "host/console/Text.h"
 #include "host/file/HostFile.h"
+#include "platform/FileSystem.h"
 #include "system/RootDirectory.h"
 #include "system/UniqueFd.h"
 
@@ -41,8 +42,15 @@ std::string amountOf(const DataContents& data) {
     return counted(data.files(), "file") + ", " + formatBytes(data.bytes);
 }
 
-std::string linesOf(const DataContents& data, bool isForTerminal) {
-    if (data.entries.empty()) return "No data.\n";
+bool waitsForInstall(Device& device, const std::string& identifier) {
+    return device.files().itemExists(Device::restoreDataPath(identifier));
+}
+
+std::string linesOf(const DataContents& data, bool isWaiting, bool isForTerminal) {
+    if (data.entries.empty()) {
+        return isWaiting ? "No data: what a restore has left waits for the install.\n"
+                         : "No data.\n";
+    }
     Table table({"SIZE", "MODIFIED", "NAME"});
     for (const DataEntry& each : data.entries) {
         table.add({each.isDirectory ? "-" : formatBytes(each.size), formatLocalTime(each.modified),
@@ -275,9 +283,11 @@ int runDataList(const DataArguments& arguments, const Console& console) {
         const Result<DataContents> data = dataOf(device, arguments.identifier);
         if (!data) return data.error();
         Json object = amountJson(arguments.identifier, *data);
+        const bool isWaiting = waitsForInstall(device, arguments.identifier);
+        object["waiting"] = isWaiting;
         object["entries"] = entriesJson(*data);
         console.out << (arguments.asJson ? indented(object) + "\n"
-                                         : linesOf(*data, console.isTerminal));
+                                         : linesOf(*data, isWaiting, console.isTerminal));
         for (const LeftOutItem& each : data->leftOut) console.complain(each.why);
         return {};
     });
@@ -292,8 +302,10 @@ int runDataPull(const DataArguments& arguments, const Console& console) {
     if (!data) return console.fail(data.error());
     if (data->entries.empty()) {
         finishWith(*data, console);
-        return console.fail(failure(arguments.identifier + " has no data that can be copied",
-                                    "see appsync data ls"));
+        const bool isWaiting = waitsForInstall(**device, arguments.identifier);
+        return console.fail(failure(
+            arguments.identifier + " has no data that can be copied",
+            isWaiting ? "what a restore has left comes with the install" : "see appsync data ls"));
     }
     const Status pulled = pull(**device, arguments, console);
     if (!pulled) return console.fail(pulled.error());

@@ -170,6 +170,7 @@ def test_data_of_what_the_device_does_not_know(appsync, used, tmp_path):
 def test_an_application_without_data(appsync, used, tmp_path):
     other = "com.example.app01"
     assert appsync("data", "ls", used.path, other).stdout == "No data.\n"
+    assert not appsync.json("data", "ls", used.path, other)["waiting"]
     complaint(appsync("data", "pull", used.path, other, tmp_path / "out", expect=1))
     assert not (tmp_path / "out").exists()
 
@@ -312,6 +313,9 @@ def test_a_restored_application_keeps_the_data_that_waits_for_it(appsync, used, 
     told = complaint(appsync("data", "push", fresh.path, ID, folder, "--yes", expect=1))
     assert "install the application first" in told
     assert data_of(fresh, ID) == {}
+    assert appsync.json("data", "ls", fresh.path, ID)["waiting"]
+    assert "waits" in appsync("data", "ls", fresh.path, ID).stdout
+    assert "comes with the install" in complaint(appsync("data", "pull", fresh.path, ID, tmp_path / "out", expect=1))
 
 
 def test_an_offloaded_application_gets_new_data(appsync, used, library, tmp_path):
