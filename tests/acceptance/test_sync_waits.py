@@ -56,7 +56,8 @@ def test_events_and_summary_agree_on_what_was_left(appsync, device, running):
     of_a = [event for event in events if event.get("identifier") == A and event["phase"] == "install"]
     assert of_a[-1]["event"] == "ended" and of_a[-1]["state"] == "failed"
     assert of_a[-1]["error"] == failures_of(events[-1])[A]
-    assert done.stderr == ""
+    (told,) = done.stderr.splitlines()
+    assert "%s is running" % A in told
 
 
 def test_a_staged_sync_that_did_not_wait_is_taken_up_by_the_same_command(appsync, device, running):
@@ -165,7 +166,7 @@ def test_ctrl_c_during_the_wait_leaves_every_line_whole(device, running, termina
     lines = shown.screen()
     (notice,) = (line for line in lines if "stopping" in line)
     assert notice.startswith("appsync: stopping: ")
-    assert any(line.startswith("Failed %s: interrupted" % A) for line in lines)
+    assert any("%s: interrupted" % A in line for line in lines)
     for line in lines:
         # Nothing but what the command has to say, and what the terminal echoes on a line of its own.
         assert re.match(r"(appsync: |install |transfer |Updated |Failed |\d.* sent in |\^C|$)", line), lines

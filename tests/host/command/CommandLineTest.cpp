@@ -122,7 +122,6 @@ INSTANTIATE_TEST_SUITE_P(
         WrongUsage{{"sync", "device", "library", "--mirror="}, "--mirror needs another value"},
         WrongUsage{{"sync", "device", "library", "--remove", ""},
                    "--remove: it needs another value than ''"},
-        WrongUsage{{"log", "device", "--category", ""}, "it needs another value than ''"},
         WrongUsage{{"plist", "convert", "file", "--to=", "xml"},
                    "--to needs another value than '': see appsync plist convert --help"},
         // One identifier for each --remove: what follows is an argument of the command.
