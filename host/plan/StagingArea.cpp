@@ -244,7 +244,13 @@ Status writeStagingArea(Device& device, const SyncPlan& plan, const Library& lib
 }
 
 Result<std::string> stageForLater(Device& device, const SyncPlan& plan, const Library& library) {
-    const Status status = writeArea(device, plan, library, StagedFor::Later, {});
+    // What has arrived by now the list asks for all the same: a later session cancels what nobody
+    // asks for.
+    SyncPlan asked = plan;
+    for (auto* installs : {&asked.install, &asked.update}) {
+        for (PlannedInstall& each : *installs) each.isInstalledUnasked = false;
+    }
+    const Status status = writeArea(device, asked, library, StagedFor::Later, {});
     if (!status) return status.error();
     return std::string(kStagingArea);
 }

@@ -69,7 +69,7 @@ def test_set_says_what_holds_now_and_whether_it_did_before(appsync, device):
     assert one_line(appsync("set", name, "installation=no").stdout) == (
         name + " was so already: installation=no removal=unset coordination=off")
     assert appsync.json("set", name, "removal=yes", "coordination=on") == {
-        "installation": "no", "removal": "yes", "coordination": "on", "changed": True, "ends": []}
+        "installation": "no", "removal": "yes", "coordination": "on", "changed": True, "ends": [], "storeBrings": []}
 
 
 @COORDINATED
