@@ -409,7 +409,8 @@ TEST_P(CoordinationContract, AFailedInstallOfARestoredApplicationKeepsItsPlaceho
     observer_->waitForOne();
     EXPECT_THAT(observer_->heard(),
                 ElementsAre("placeholder com.example.a", "complete com.example.a, failed"));
-    EXPECT_THAT(bundles(AppRegistry::kEveryBundle), ElementsAre(std::string(kA) + " (placeholder)"));
+    EXPECT_THAT(bundles(AppRegistry::kEveryBundle),
+                ElementsAre(std::string(kA) + " (placeholder)"));
     const auto again = service_.existingCoordinator(kA, AppStoreClientID);
     ASSERT_NE(again, nullptr);
     EXPECT_FALSE(again->error());
