@@ -33,8 +33,8 @@ struct StandingRules {
     /// What the plan does not name is none of the session's business: it goes on.
     bool leavesOthers = false;
     /// The version of the package that has arrived for an application; nothing when there is none
-    /// that can be read.
-    Version arrivedVersion = nullptr;
+    /// that can be read. Never null.
+    Version arrivedVersion = [](const std::string&) { return std::nullopt; };
     /// The version that the library holds of an application; nothing when it holds none.
     Version libraryVersion = nullptr;
 };
@@ -60,7 +60,7 @@ struct StandingRules {
 [[nodiscard]] StandingInstalls takeUp(SyncPlan& plan,
                                       const std::vector<CoordinatorRecord>& coordinators,
                                       const std::vector<ApplicationRecord>& present,
-                                      const StandingRules& rules = {});
+                                      const StandingRules& rules);
 
 /// Cancels what is obsolete. One that has gone meanwhile is no failure.
 Status cancelObsolete(Device& device, const StandingInstalls& standing);

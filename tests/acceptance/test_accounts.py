@@ -212,3 +212,27 @@ def test_who_may_not_read_is_told(place):
     os.chmod(os.path.join(device.path, "log", "system.log"), 0o600)
     done = place.as_nobody("log", device.path, expect=3)
     assert "system.log: Permission denied" in done.stderr and done.stderr.count("\n") == 1
+
+
+def test_data_that_may_not_be_read_is_named_and_left_out(place):
+    device = place.device()
+    device.sync(place.library())
+    new, out, identifier = place.path("new"), place.path("temporary-out"), IDS[0]
+    for folder, names in ((new, ("a", "locked")), (out, ())):
+        os.mkdir(folder)
+        for name in names:
+            with open(os.path.join(folder, name), "w") as file:
+                file.write(name)
+    os.chmod(os.path.join(new, "locked"), 0)
+    for path in (device.path, new, out):
+        give(path, NOBODY)
+    pushed = place.as_nobody("data", "push", device.path, identifier, new, "--yes", expect=1)
+    assert "locked" in pushed.stderr and pushed.stderr.count("\n") == 1
+    data = os.path.join(device.path, "root/var/mobile/Containers/Data", identifier)
+    assert os.listdir(data) == ["a"]
+    shutil.copy(os.path.join(data, "a"), os.path.join(data, "b"))
+    os.chmod(os.path.join(data, "a"), 0)
+    give(data, NOBODY)
+    pulled = place.as_nobody("data", "pull", device.path, identifier, os.path.join(out, "data"), "--json", expect=1)
+    assert [each["file"] for each in json.loads(pulled.stdout)["leftOut"]] == ["a"]
+    assert os.listdir(os.path.join(out, "data")) == ["b"]

@@ -264,19 +264,6 @@ def test_a_rubbish_archive_changes_nothing(appsync, used, tmp_path):
     assert data_of(used, ID) == FILES
 
 
-@DIRECTLY
-@pytest.mark.skipif(os.geteuid() == 0, reason="root may read everything")
-def test_what_may_not_be_read_is_named_and_left_out(appsync, used, tmp_path):
-    folder = with_files(tmp_path / "new", {"a": b"1", "locked": b"2"})
-    os.chmod(folder / "locked", 0)
-    assert "locked" in complaint(appsync("data", "push", used.path, ID, folder, "--yes", expect=1))
-    assert data_of(used, ID) == {"a": b"1"}
-    os.chmod(os.path.join(used.inside(DATA), ID, "a"), 0)
-    write_data(used, ID, {"b": b"2"})
-    pulled = appsync.json("data", "pull", used.path, ID, tmp_path / "out", expect=1)
-    assert [each["file"] for each in pulled["leftOut"]] == ["a"] and files_below(tmp_path / "out") == {"b": b"2"}
-
-
 def test_push_to_a_full_disk_keeps_what_is_there(appsync, tmp_path):
     """A disk of 8 MiB that the device lies on."""
     script = '''

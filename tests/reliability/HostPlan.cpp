@@ -1,6 +1,7 @@
 #include "tests/reliability/HostPlan.h"
 
 #include <algorithm>
+#include <optional>
 #include <utility>
 #include <vector>
 
@@ -75,6 +76,16 @@ std::vector<CoordinatorRecord> coordinatorsOn(const World& world) {
     return coordinators;
 }
 
+/// A simulated package says nothing: its version is the one that was asked for, which the
+/// placeholder shows.
+std::optional<std::string> versionOfArrivedOn(const World& world, const std::string& identifier) {
+    const SimulatedCoordinatorState* state = world.platform.coordination.state(identifier);
+    if (state == nullptr || state->appAsset == nullptr || !state->appAsset->path) return {};
+    if (!world.platform.files.contents(state->appAsset->path->path())) return {};
+    if (state->placeholder == nullptr || !state->placeholder->attributes) return {};
+    return state->placeholder->attributes->bundleVersion;
+}
+
 /// Those without a coordinator that goes on with them.
 void removeLeftoverPlaceholders(World& world) {
     SimulatedAppRegistry& registry = world.platform.registry;
@@ -116,7 +127,11 @@ HostPlan planSession(World& world, const PropertyList& wanted) {
     const std::vector<ApplicationRecord> present = presentOn(world);
     SyncPlan plan = makePlan(library, present, options);
     StandingInstalls standing;
-    if (world.coordinated) standing = takeUp(plan, coordinatorsOn(world), present);
+    StandingRules rules;
+    rules.arrivedVersion = [&world](const std::string& identifier) {
+        return versionOfArrivedOn(world, identifier);
+    };
+    if (world.coordinated) standing = takeUp(plan, coordinatorsOn(world), present, rules);
     for (const std::string& identifier : standing.obsolete) {
         world.platform.coordination.cancel(identifier, cancelledByHost(), SyncClientID);
     }
