@@ -107,8 +107,9 @@ class PropertyListBuilder final : public nlohmann::json_sax<nlohmann::json> {
     bool boolean(bool value) override { return add(value); }
     bool number_integer(number_integer_t value) override { return add(value); }
     bool number_unsigned(number_unsigned_t value) override { return add(value); }
-    bool number_float(number_float_t value, const string_t& /*text*/) override {
-        return add(value);
+    bool number_float(number_float_t value, const string_t& text) override {
+        const bool isWhole = text.find_first_of(".eE") == text.npos;
+        return isWhole ? stop(text + " does not fit into 64 bits") : add(value);
     }
     bool string(string_t& value) override { return add(std::move(value)); }
     bool binary(binary_t& /*value*/) override { return false; }

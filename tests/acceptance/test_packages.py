@@ -76,6 +76,19 @@ def test_make_and_show(appsync, device, tmp_path):
     assert device.versions() == {"com.example.made": "4.2"}
 
 
+def test_make_refuses_a_package_in_the_bundle_that_it_packs(appsync, tmp_path):
+    bundle = tmp_path / "folder" / "My.app"
+    bundle.mkdir(parents=True)
+    (bundle / "Info.plist").write_bytes(plistlib.dumps(packages.info("com.example.my")))
+    before = sorted(os.listdir(bundle))
+    for folder in (tmp_path / "folder", bundle):
+        done = appsync("package", "make", folder, bundle / "out.zip", expect=1)
+        assert "lies in the bundle" in done.stderr and done.stderr.count("\n") == 1
+    assert sorted(os.listdir(bundle)) == before
+    appsync("package", "make", tmp_path / "folder", tmp_path / "folder" / "out.zip")
+    assert appsync.json("package", "show", tmp_path / "folder" / "out.zip")["identifier"] == "com.example.my"
+
+
 def test_make_refuses_a_folder_without_a_bundle(appsync, tmp_path):
     (tmp_path / "folder").mkdir()
     done = appsync("package", "make", tmp_path / "folder", tmp_path / "out.zip", expect=None)

@@ -41,7 +41,8 @@ def test_json_comes_back_as_it_was_shown(appsync, tmp_path):
 @pytest.mark.parametrize("text,says", [
     (b"{", "not JSON, at byte"), (b'{"a": }', "not JSON, at byte"), (b"[1,2", "not JSON"), (b"[1]\0", "at byte 4"),
     (b'{"a": 1, "a": 2}', "names something twice"), (b"[" * 200 + b"]" * 200, "nests too deep"),
-    (b"", "standard input"), (b"5", "standard input"), (b"[null]", "null")])
+    (b"", "standard input"), (b"5", "standard input"), (b"[null]", "null"),
+    (b"[18446744073709551616]", "18446744073709551616 does not fit"), (b"[-9223372036854775809]", "does not fit")])
 def test_rubbish_from_a_pipe_is_refused_in_one_line(appsync, text, says):
     told = fed(appsync, text, "convert", "-", "--to", "xml", status=1)
     assert says in told and told.count("\n") == 1
