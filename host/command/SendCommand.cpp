@@ -1,3 +1,5 @@
+#include <unistd.h>
+
 #include <atomic>
 #include <chrono>
 #include <filesystem>
@@ -286,8 +288,11 @@ class Sending {
 
     // On the thread of the signals, whatever the session is at.
     [[noreturn]] void leave() {
-        if (isPlanned_) events_.finishSoon(timed(summarizeInterrupted(plan_, facts_)));
-        leaveAtOnce(console_);
+        if (!isPlanned_) leaveAtOnce(console_);
+        const SyncSummary summary = timed(summarizeInterrupted(plan_, facts_));
+        const bool isTold = events_.finishSoon(summary);
+        if (!isTold || summary.failed.empty()) leaveAtOnce(console_);
+        ::_exit(kExitSomethingFailed);
     }
 
     SyncSummary timed(SyncSummary summary) const {

@@ -217,10 +217,13 @@ class SyncRun {
             leaveAtOnce(console_);
         }
         const SyncSummary summary = timed(summaryOnLeaving());
-        events_.finishSoon(summary);
+        const bool isTold = events_.finishSoon(summary);
         if (const int status = endedWith_; status >= 0) ::_exit(status);
         if (!summary.incomplete) ::_exit(kExitDone);
-        if (isStagingOver_ || hasWaited_) ::_exit(kExitSomethingFailed);
+        // What has failed is then told, each with what to do.
+        if (isStagingOver_ || hasWaited_ || (isTold && !summary.failed.empty())) {
+            ::_exit(kExitSomethingFailed);
+        }
         leaveAtOnce(console_);
     }
 

@@ -90,9 +90,10 @@ void SyncEvents::complainSoon(std::string_view text) {
     if (lock && !isFinished_) display_.complain(text);
 }
 
-void SyncEvents::finishSoon(const SyncSummary& summary) {
+bool SyncEvents::finishSoon(const SyncSummary& summary) {
     const std::unique_lock lock = lockSoon();
     if (lock) finishLocked(summary);
+    return lock.owns_lock();
 }
 
 void SyncEvents::closeSoon() {

@@ -83,7 +83,8 @@ class SyncEvents {
     // second, as on an output that nobody reads.
 
     void complainSoon(std::string_view text);
-    void finishSoon(const SyncSummary& summary);
+    /// Whether the session has ended for the display, now or before.
+    bool finishSoon(const SyncSummary& summary);
     void closeSoon();
 
   private:

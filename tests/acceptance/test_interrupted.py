@@ -212,6 +212,7 @@ def test_a_stop_is_announced_at_once(waiting_sync):
     out, err = sync.communicate(timeout=60)
     assert "Failed 1: com.example.app00" in out
     assert "appsync: com.example.app00: interrupted: run the same command again" in err
+    assert err.count("interrupted") == 1
     assert sync.returncode == 1
 
 

@@ -124,7 +124,7 @@ TEST(SyncEvents, NothingIsShownAfterTheFirstSummary) {
     RecordingDisplay display;
     SyncEvents events(display);
     events.complainSoon("stopping");
-    events.finishSoon({});
+    EXPECT_TRUE(events.finishSoon({}));
     events.finish({});
     events.report(progress(50, 100));
     events.complainSoon("too late");
@@ -144,7 +144,7 @@ class StuckDisplay : public RecordingDisplay {
 
 TEST(SyncEvents, WhoeverLeavesDoesNotWaitForAnOutputThatIsStuck) {
     SyncEvents* shown = nullptr;
-    StuckDisplay display([&] { std::thread([&] { shown->finishSoon({}); }).join(); });
+    StuckDisplay display([&] { std::thread([&] { EXPECT_FALSE(shown->finishSoon({})); }).join(); });
     SyncEvents events(display);
     shown = &events;
     events.report(progress(50, 100));
