@@ -121,9 +121,8 @@ void performDeletions(AppsClient& client, const Platform& platform, bool isCoord
         deleteApplication(client, platform, isCoordinated, identifier);
 }
 
-/// The system's own text for the error, without what was attempted and where.
+/// The system's own text for an error of the file system, without what was attempted and where.
 std::string systemTextOf(const ErrorRecord& error) {
-    if (error.domain != kPosixErrorDomain) return error.description();
     return std::generic_category().message(static_cast<int>(error.code));
 }
 

@@ -74,7 +74,7 @@ std::optional<std::string> AppsClient::_operationStateForIdentifier(
 
 void AppsClient::changeAssetID(const std::string& identifier, std::string_view toDo) {
     const std::lock_guard guard(*todoListLock_);
-    if (!todoListFile_->read(platform_)) return;
+    todoListFile_->read(platform_);
     const std::optional<const PropertyList*> operation = todoListFile_->operationOf(identifier);
     if (!operation) return;
     log_(Level::Default, "%s|Changing %{public}@ from %{public}@ to %{public}@", identifier,

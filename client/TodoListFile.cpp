@@ -9,14 +9,14 @@
 
 namespace appsync {
 
-bool TodoListFile::read(const Platform& platform) {
+void TodoListFile::read(const Platform& platform) {
     Result<Bytes> bytes = platform.files.readFile(std::string(kTodoListPath));
-    if (bytes && list_ && *bytes == bytes_) return true;
+    if (bytes && list_ && *bytes == bytes_) return;
     list_.reset();
     indexes_.clear();
-    if (!bytes || bytes->empty()) return false;
+    if (!bytes || bytes->empty()) return;
     list_ = parseListFile(platform, *bytes, &PropertyList::isArray, kTodoListMessages, nullptr);
-    if (!list_) return false;
+    if (!list_) return;
     bytes_ = *std::move(bytes);
     std::size_t index = 0;
     for (const PropertyList& entry : list_->elements()) {
@@ -24,12 +24,11 @@ bool TodoListFile::read(const Platform& platform) {
         if (identifier != nullptr) indexes_.try_emplace(*identifier, index);
         ++index;
     }
-    return true;
 }
 
 std::optional<const PropertyList*> TodoListFile::operationOf(const std::string& identifier) const {
     const auto found = indexes_.find(identifier);
-    if (!list_ || found == indexes_.end()) return std::nullopt;
+    if (found == indexes_.end()) return std::nullopt;
     return list_->at(found->second)->find(kTodoOperationKey);
 }
 

@@ -23,9 +23,9 @@ inline constexpr ListFileMessages kTodoListMessages{"%s|couldn't parse todo list
 /// time.
 class TodoListFile {
   public:
-    /// Takes up the file as it is now. False when there is no list in it, which is logged as
+    /// Takes up the file as it is now. What is no list has no entries, and is logged as
     /// `_loadPlist` does.
-    [[nodiscard]] bool read(const Platform& platform);
+    void read(const Platform& platform);
     /// The operation of the first entry with this identifier, and null when it has none; nothing
     /// when there is no such entry. Borrowed until the next call.
     [[nodiscard]] std::optional<const PropertyList*> operationOf(

@@ -230,6 +230,14 @@ TEST_F(SyncReconciliation, WritesTheDebugCopyInTheBinaryEncoding) {
     EXPECT_TRUE(platform_.files.text(kDebugCopy)->starts_with("bplist00"));
 }
 
+TEST_F(SyncReconciliation, IgnoresThatTheDebugCopyCannotBeSerialised) {
+    stage(PropertyList::array());
+    platform_.propertyLists.failNextSerialize(ErrorRecord::make(kPropertyListErrorDomain, 1, "no"));
+    EXPECT_TRUE(reconcile());
+    EXPECT_EQ(error_, std::nullopt);
+    EXPECT_FALSE(platform_.files.exists(kDebugCopy));
+}
+
 TEST_F(SyncReconciliation, IgnoresThatTheDebugCopyCannotBeWritten) {
     stage(PropertyList::array({todoEntry(kA, "install")}));
     platform_.files.failNext(FileOperation::WriteFileAtomically, kTodoListDebugPath, ENOSPC);

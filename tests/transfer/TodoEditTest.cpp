@@ -63,6 +63,24 @@ TEST_F(TodoEdit, DoesNothingWithoutAList) {
     EXPECT_THAT(platform_.callsTo({"FileSystem.writeFileAtomically"}), IsEmpty());
 }
 
+TEST_F(TodoEdit, LeavesAFileThatIsNoListAlone) {
+    setTodoList(PropertyList::array({todoEntry(kA, "install")}));
+    client_->changeAssetID(kA, "SENT");
+    platform_.recorder.clear();
+    for (const std::string text : {"", "no list", "{}"}) {
+        platform_.files.addFile(file_, text);
+        client_->changeAssetID(kA, "FAILED");
+        EXPECT_EQ(platform_.files.text(file_), text);
+    }
+    EXPECT_THAT(platform_.callsTo({"FileSystem.writeFileAtomically"}), IsEmpty());
+    EXPECT_THAT(platform_.messages(),
+                ElementsAre("couldn't parse todo list", "couldn't parse todo list"));
+    setTodoList(PropertyList::array({todoEntry(kB, "install")}));
+    client_->changeAssetID(kA, "FAILED");
+    client_->changeAssetID(kB, "FAILED");
+    EXPECT_EQ(operationOf(kB), "FAILED");
+}
+
 TEST_F(TodoEdit, WritesNothingWhenTheListCannotBeSerialised) {
     setTodoList(PropertyList::array({todoEntry(kA, "install")}));
     platform_.propertyLists.failNextSerialize(ErrorRecord::make(kPropertyListErrorDomain, 1, "no"));
@@ -75,6 +93,9 @@ TEST_F(TodoEdit, IgnoresThatTheListCannotBeWritten) {
     platform_.files.failNext(FileOperation::WriteFileAtomically, file_, ENOSPC);
     client_->changeAssetID(kA, "SENT");
     EXPECT_EQ(operationOf(kA), "install");
+    client_->changeAssetID(kA, "DOWNLOADED");
+    EXPECT_TRUE(logged(LogLevel::Default, "Changing com.example.a from install to DOWNLOADED"));
+    EXPECT_EQ(operationOf(kA), "DOWNLOADED");
 }
 
 TEST_F(TodoEdit, ShowsInTheOperationState) {
