@@ -16,8 +16,12 @@
 
 #include <CLI/CLI.hpp>
 
-#include "host/command/Commands.h"
-#include "host/command/IdentifierArgument.h"
+#include "host/command/argument/IdentifierArgument.h"
+#include "host/command/change/ChangeCommands.h"
+#include "host/command/data/DataCommands.h"
+#include "host/command/file/FileCommands.h"
+#include "host/command/look/LookCommands.h"
+#include "host/command/sync/SyncCommands.h"
 #include "host/console/Console.h"
 #include "host/console/Problem.h"
 

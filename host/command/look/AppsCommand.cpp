@@ -1,0 +1,45 @@
+#include <ostream>
+
+#include "device/Device.h"
+#include "host/command/argument/OpenDevice.h"
+#include "host/command/look/LookCommands.h"
+#include "host/console/Console.h"
+#include "host/console/Problem.h"
+#include "host/console/Table.h"
+#include "host/console/Text.h"
+#include "host/output/JsonRecords.h"
+
+namespace appsync {
+namespace {
+
+std::string stateText(const ApplicationRecord& record) {
+    if (!record.isPlaceholder) return "installed";
+    std::string text(placeholderKind(record));
+    if (!record.progress) return text;
+    const auto percent = static_cast<unsigned>(record.progress->fraction() * 100);
+    return text + ", " + std::to_string(percent) + " %";
+}
+
+std::string applicationsTable(const std::vector<ApplicationRecord>& records,
+                              const Console& console) {
+    Table table({"IDENTIFIER", "VERSION", "NAME", "STATE", "TYPE", "SIZE"});
+    for (const ApplicationRecord& record : records) {
+        table.add({record.identifier, record.version.value_or("-"), record.name.value_or("-"),
+                   stateText(record), record.type, formatBytes(record.bytes)});
+    }
+    if (console.isTerminal) table.fitInto(console.width);
+    return records.empty() ? "No applications.\n" : table.text();
+}
+
+}  // namespace
+
+int runApps(const std::string& device, bool asJson, const Console& console) {
+    return lookAt(device, console, [&](Device& opened) -> Status {
+        const Result<std::vector<ApplicationRecord>> records = opened.applications();
+        if (!records) return unusable(records.error());
+        console.out << (asJson ? jsonText(*records) + "\n" : applicationsTable(*records, console));
+        return {};
+    });
+}
+
+}  // namespace appsync
