@@ -33,8 +33,8 @@ struct ItemAttributes {
 /// may undo what was done since the device last synced its files, which it does with the install of
 /// each application and at the end of a session, and nobody else has to:
 ///
-/// - `writeFileAtomically` leaves the old file or the new one, whole. Only the contents are synced:
-///   the old file may come back.
+/// - `writeFileAtomically` leaves the old file or the new one, whole: an old one may come back, not
+///   only the last. In the temporary directory it leaves no more than `createFile` does.
 /// - `createFile` and `copyItem` leave what was there before, or the new file, or a part of it: cut
 ///   off, empty, or with zeros for what is missing.
 /// - `createDirectory`, `moveItem` and `removeItem` are done or not; an item that is moved stands
@@ -70,9 +70,10 @@ class FileSystem {
     /// The whole file, past any cache of the process.
     virtual Result<Bytes> readFile(const std::string& path) = 0;
 
-    /// Writes the file whole, durably: temporary file in the same directory, sync, rename. After a
-    /// failure or a crash at any instant the old file is there or the new one, and no temporary
-    /// file stays for good.
+    /// Writes the file whole: temporary file in the same directory, sync, rename; or otherwise,
+    /// where that comes to the same. After a failure or a crash at any instant the old file is
+    /// there or the new one, and no temporary file stays for good. Everybody reads the new one from
+    /// now on; a loss of power may bring an old one back, see above.
     virtual Status writeFileAtomically(const std::string& path, ByteView contents) = 0;
 
     /// Creates or replaces a file, not atomically: nothing is synced. `attributes` as with
@@ -83,7 +84,8 @@ class FileSystem {
     /// Sets the times of last access and modification to now.
     virtual Status setTimesToNow(const std::string& path) = 0;
 
-    /// The process's directory for temporary files, without a slash at its end. It exists.
+    /// The process's directory for temporary files, without a slash at its end. It exists, and what
+    /// is in it goes with the process: the device empties it before the next one begins.
     [[nodiscard]] virtual std::string temporaryDirectory() = 0;
 };
 

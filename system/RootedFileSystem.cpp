@@ -11,6 +11,7 @@
 #include <unistd.h>
 
 #include "system/DescriptorIO.h"
+#include "system/InPlaceWrite.h"
 #include "system/PosixError.h"
 #include "system/TemporaryFile.h"
 #include "system/TreeWalk.h"
@@ -304,10 +305,15 @@ Result<Bytes> RootedFileSystem::readFile(const std::string& path) {
 
 Status RootedFileSystem::writeFileAtomically(const std::string& path, ByteView contents) {
     if (Status status = checkStays(path, kWrite); !status) return status;
-    Result<TemporaryFile> file = TemporaryFile::create(root_, path);
+    Result<ItemPlace> place = root_.place(path, kWrite);
+    if (!place) return place.error();
+    if (writeInPlace(*place, contents)) return {};
+    Result<TemporaryFile> file = TemporaryFile::create(*std::move(place), path);
     if (!file) return file.error();
     if (Status written = file->write(contents); !written) return written;
-    if (Status synced = file->sync(); !synced) return synced;
+    if (!isTemporary(path)) {
+        if (Status synced = file->sync(); !synced) return synced;
+    }
     // The directory is not synced: after a power loss the old file may stand there, whole.
     return file->commit();
 }
@@ -338,6 +344,11 @@ Status RootedFileSystem::setTimesToNow(const std::string& path) {
 Status RootedFileSystem::checkStays(const std::string& path, std::string_view operation) const {
     if (!leavesDirectory(path, temporaryDirectory_)) return {};
     return posixError(EACCES, operation, path, "the path leads out of " + temporaryDirectory_);
+}
+
+bool RootedFileSystem::isTemporary(std::string_view path) const {
+    return path.starts_with(temporaryDirectory_) &&
+           path.substr(temporaryDirectory_.size()).starts_with('/');
 }
 
 std::string RootedFileSystem::temporaryDirectory() { return temporaryDirectory_; }

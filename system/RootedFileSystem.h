@@ -4,8 +4,8 @@
 // or what several need:
 //
 //     files           RootedFileSystem.h, over RootDirectory.h, which no path leads out of;
-//                     MachinePath.h, TreeWalk.h, TemporaryFile.h, DescriptorIO.h, UniqueFd.h,
-//                     PosixError.h
+//                     MachinePath.h, TreeWalk.h, TemporaryFile.h, InPlaceWrite.h, DescriptorIO.h,
+//                     UniqueFd.h, PosixError.h
 //     work            SystemWorkQueues.h, with ThreadedOperationQueue.h and DelayedWork.h
 //     log             JsonLogFacility.h, over LogFile.h, which bounds it
 //     notifications   SystemNotifications.h
@@ -19,6 +19,7 @@
 #include <map>
 #include <memory>
 #include <string>
+#include <string_view>
 
 #include <sys/types.h>
 
@@ -49,8 +50,9 @@ struct RootedFileSystemOptions {
 ///
 /// Files are written through a temporary file in the same directory, named after the target (see
 /// `isTemporaryName`); the finished file takes the target's name, and where the target was a link,
-/// the link's place. A file that is replaced keeps its permissions and its owner. A crash can leave
-/// a temporary file; `removeStaleTemporaries` clears it.
+/// the link's place. Only a change of a few bytes is written in place (system/InPlaceWrite.h). A
+/// file that is replaced keeps its permissions and its owner. A crash can leave a temporary file;
+/// `removeStaleTemporaries` clears it.
 ///
 /// What begins with the path of the temporary directory is changed there only: where ".." would
 /// lead out of it, nothing is made, changed or removed, and the error is EACCES.
@@ -100,6 +102,9 @@ class RootedFileSystem : public FileSystem {
 
     /// Refuses a path to something in the temporary directory that lies elsewhere.
     [[nodiscard]] Status checkStays(const std::string& path, std::string_view operation) const;
+
+    /// Whether a path that stays where it begins is one of something in the temporary directory.
+    [[nodiscard]] bool isTemporary(std::string_view path) const;
 
     const RootDirectory root_;
     const AccountMap accounts_;

@@ -86,8 +86,12 @@ int removeIfStale(int directory, const std::string& name) {
 Result<TemporaryFile> TemporaryFile::create(const RootDirectory& root, const std::string& path) {
     Result<ItemPlace> place = root.place(path, kOperation);
     if (!place) return place.error();
-    if (place->mustBeDirectory) return posixError(EISDIR, kOperation, path);
-    TemporaryFile result(std::move(*place), path);
+    return create(*std::move(place), path);
+}
+
+Result<TemporaryFile> TemporaryFile::create(ItemPlace place, const std::string& path) {
+    if (place.mustBeDirectory) return posixError(EISDIR, kOperation, path);
+    TemporaryFile result(std::move(place), path);
     if (const int error = result.open(); error != 0) return posixError(error, kOperation, path);
     result.inheritFromTarget();
     return result;

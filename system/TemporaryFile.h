@@ -30,6 +30,8 @@ class TemporaryFile {
     /// that it is to replace, where there is one and the system permits.
     [[nodiscard]] static Result<TemporaryFile> create(const RootDirectory& root,
                                                       const std::string& path);
+    /// The same for a target that was looked up already; `path` is for errors.
+    [[nodiscard]] static Result<TemporaryFile> create(ItemPlace place, const std::string& path);
 
     TemporaryFile(TemporaryFile&& other) noexcept;
     TemporaryFile& operator=(TemporaryFile&&) = delete;

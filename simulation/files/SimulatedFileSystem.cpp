@@ -10,6 +10,13 @@
 namespace appsync {
 namespace {
 
+constexpr std::string_view kTemporaryDirectory = "/tmp";
+
+bool isTemporary(std::string_view path) {
+    return path.starts_with(kTemporaryDirectory) &&
+           path.substr(kTemporaryDirectory.size()).starts_with('/');
+}
+
 constexpr std::string_view kService = "FileSystem";
 constexpr std::string_view kDefaultAccount = "mobile";
 constexpr std::size_t kLongestPath = 4095;
@@ -139,7 +146,8 @@ Result<Bytes> SimulatedFileSystem::readFile(const std::string& path) {
 Status SimulatedFileSystem::writeFileAtomically(const std::string& path, ByteView contents) {
     RecordedCall call(recorder_, kService, "writeFileAtomically", path, contents);
     int error = fault(FileOperation::WriteFileAtomically, path);
-    if (error == 0) error = replaceFile(path, share(contents), {}, Written::Synced);
+    const Written written = isTemporary(path) ? Written::Unsynced : Written::Synced;
+    if (error == 0) error = replaceFile(path, share(contents), {}, written);
     tell(error, "writeFileAtomically", path);
     return call.result(statusOf(error, "write", path));
 }
@@ -166,7 +174,7 @@ Status SimulatedFileSystem::setTimesToNow(const std::string& path) {
 
 std::string SimulatedFileSystem::temporaryDirectory() {
     RecordedCall call(recorder_, kService, "temporaryDirectory");
-    return call.result(std::string("/tmp"));
+    return call.result(std::string(kTemporaryDirectory));
 }
 
 // Resolution. Each gives an errno value, or 0.

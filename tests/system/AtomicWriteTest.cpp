@@ -47,7 +47,7 @@ TEST_F(AtomicWriteTest, ReplacesAFileAndKeepsItsPermissions) {
 
 TEST_F(AtomicWriteTest, KeepsTheOwnerOfAFile) {
     if (::geteuid() != 0) GTEST_SKIP() << "only root can give files away";
-    put("/a/file", "old");
+    put("/a/file", "old one");
     ASSERT_EQ(::chown(real("/a/file").c_str(), 4242, 4343), 0);
     ASSERT_TRUE(files_->writeFileAtomically("/a/file", bytes("new")));
     struct stat status {};
@@ -58,7 +58,7 @@ TEST_F(AtomicWriteTest, KeepsTheOwnerOfAFile) {
 
 TEST_F(AtomicWriteTest, AnOwnerThatCannotBeKeptIsNoFailure) {
     if (::geteuid() != 0) GTEST_SKIP() << "only root can give files away";
-    put("/a/file", "old");
+    put("/a/file", "old one");
     ASSERT_EQ(::chown(real("/a/file").c_str(), 4242, 4343), 0);
     const FailingCall failing(Call::Fchown, EPERM);
     EXPECT_TRUE(files_->writeFileAtomically("/a/file", bytes("new")));
@@ -117,7 +117,7 @@ INSTANTIATE_TEST_SUITE_P(Each, FailingStepTest,
                          [](const auto& parameters) { return std::string(parameters.param.name); });
 
 TEST_P(FailingStepTest, LeavesTheOldFileAndNothingElse) {
-    put("/a/file", "old");
+    put("/a/file", "old one");
     {
         const FailingCall failing(GetParam().call, GetParam().error);
         const Status written = files_->writeFileAtomically("/a/file", bytes("new"));
@@ -125,8 +125,16 @@ TEST_P(FailingStepTest, LeavesTheOldFileAndNothingElse) {
         EXPECT_EQ(written.error().code, GetParam().error);
         EXPECT_TRUE(written.error().description().starts_with("cannot write /a/file: "));
     }
-    EXPECT_EQ(contents("/a/file"), "old");
+    EXPECT_EQ(contents("/a/file"), "old one");
     EXPECT_EQ(names("/a"), Names{"file"});
+}
+
+TEST_F(AtomicWriteTest, InTheTemporaryDirectoryNothingWaitsForTheDisk) {
+    const FailingCall failing(Call::Fsync, EIO);
+    EXPECT_TRUE(files_->writeFileAtomically("/tmp/file", bytes("new")));
+    EXPECT_EQ(failing.failures(), 0);
+    EXPECT_FALSE(files_->writeFileAtomically("/tmpfile", bytes("new")));
+    EXPECT_EQ(failing.failures(), 1);
 }
 
 TEST_F(AtomicWriteTest, ATakenNameIsPassedOver) {
@@ -160,10 +168,10 @@ bool mountSmallDisk(const fs::path& directory) {
 int fillSmallDisk(const fs::path& root) {
     if (!mountSmallDisk(root)) return kCannotMount;
     const auto files = RootedFileSystem::open(root.string());
-    if (!files || !(*files)->writeFileAtomically("/file", bytes("old"))) return 1;
+    if (!files || !(*files)->writeFileAtomically("/file", bytes("old one"))) return 1;
     const Status full = (*files)->writeFileAtomically("/file", Bytes(1'000'000));
     if (full || full.error().code != ENOSPC) return 2;
-    if (text(*(*files)->readFile("/file")) != "old") return 3;
+    if (text(*(*files)->readFile("/file")) != "old one") return 3;
     // What the failure left behind would not leave room for this.
     return (*files)->writeFileAtomically("/file", Bytes(200'000)) ? 0 : 4;
 }
@@ -221,10 +229,10 @@ TEST_F(AtomicWriteTest, CreatesAFileAndReplacesIt) {
 }
 
 TEST_F(AtomicWriteTest, AFileThatCannotBeCreatedLeavesTheOldOne) {
-    put("/a/file", "old");
+    put("/a/file", "old one");
     const FailingCall failing(Call::Write, ENOSPC);
     EXPECT_EQ(files_->createFile("/a/file", bytes("new"), {}).error().code, ENOSPC);
-    EXPECT_EQ(contents("/a/file"), "old");
+    EXPECT_EQ(contents("/a/file"), "old one");
     EXPECT_EQ(names("/a"), Names{"file"});
     EXPECT_EQ(files_->createFile("/absent/file", {}, {}).error().code, ENOENT);
 }

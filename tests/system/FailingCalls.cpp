@@ -88,6 +88,11 @@ int __wrap_openat(int directory, const char* path, int flags, ...) {
     return fails(Call::Openat) ? -1 : __real_openat(directory, path, flags, mode);
 }
 
+ssize_t __real_pread(int descriptor, void* target, size_t size, off_t offset);
+ssize_t __wrap_pread(int descriptor, void* target, size_t size, off_t offset) {
+    return fails(Call::Pread) ? -1 : __real_pread(descriptor, target, size, offset);
+}
+
 ssize_t __real_read(int descriptor, void* target, size_t size);
 ssize_t __wrap_read(int descriptor, void* target, size_t size) {
     return fails(Call::Read) ? -1 : __real_read(descriptor, target, size);

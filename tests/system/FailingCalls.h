@@ -12,6 +12,7 @@ enum class Call {
     Mkdirat,
     Openat,
     Openat2,
+    Pread,
     Read,
     Renameat,
     Renameat2,
