@@ -18,6 +18,7 @@ void TodoListFile::read(const Platform& platform) {
     list_ = parseListFile(platform, *bytes, &PropertyList::isArray, kTodoListMessages, nullptr);
     if (!list_) return;
     bytes_ = *std::move(bytes);
+    isOwn_ = false;
     std::size_t index = 0;
     for (const PropertyList& entry : list_->elements()) {
         const std::string* identifier = entry.findString(kTodoIdentifierKey);
@@ -38,16 +39,21 @@ void TodoListFile::setOperation(const Platform& platform, const std::string& ide
     PropertyList entry = list_->take(index);
     entry.set(kTodoOperationKey, operation);
     list_->set(index, std::move(entry));
-    write(platform);
+    const bool replaced =
+        isOwn_ && platform.propertyLists.replaceText(bytes_, index, kTodoOperationKey, operation);
+    if ((replaced || serialize(platform)) &&
+        platform.files.writeFileAtomically(std::string(kTodoListPath), bytes_)) {
+        return;
+    }
+    list_.reset();
 }
 
-void TodoListFile::write(const Platform& platform) {
+bool TodoListFile::serialize(const Platform& platform) {
     Result<Bytes> bytes = platform.propertyLists.serialize(*list_, PropertyListFormat::Binary);
-    if (bytes && platform.files.writeFileAtomically(std::string(kTodoListPath), *bytes)) {
-        bytes_ = *std::move(bytes);
-    } else {
-        list_.reset();
-    }
+    if (!bytes) return false;
+    bytes_ = *std::move(bytes);
+    isOwn_ = true;
+    return true;
 }
 
 }  // namespace appsync

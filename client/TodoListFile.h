@@ -36,9 +36,10 @@ class TodoListFile {
                       std::string_view operation);
 
   private:
-    void write(const Platform& platform);
+    bool serialize(const Platform& platform);
 
-    Bytes bytes_;  // of the file that the list was read from, or written to
+    Bytes bytes_;         // of the file that the list was read from, or written to
+    bool isOwn_ = false;  // the bytes were serialised here
     std::optional<PropertyList> list_;
     std::unordered_map<std::string, std::size_t> indexes_;  // of first entries
 };

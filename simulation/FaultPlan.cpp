@@ -142,6 +142,7 @@ WaysByCall fileWaysByCall() {
         {"FileSystem.setTimesToNow", fileWays(FileOperation::SetTimesToNow, false)},
         {"PropertyListSerialization.parse", {refused("no property list")}},
         {"PropertyListSerialization.serialize", {refused("not written")}},
+        {"PropertyListSerialization.replaceText", {refused("not replaced")}},
     };
 }
 

@@ -17,6 +17,7 @@
 #include "host/console/PropertyListReading.h"
 #include "host/output/JsonRecords.h"
 #include "host/plan/Versions.h"
+#include "system/property_list/PropertyListBinaryEdit.h"
 #include "system/property_list/PropertyListBinaryReader.h"
 #include "system/property_list/PropertyListCodec.h"
 #include "system/property_list/PropertyListPlainXmlReader.h"
@@ -97,7 +98,15 @@ Reading readXmlList(ByteView bytes) {
         .unless(!plain || (value.ok() && *value == *plain), "the plain form reads otherwise");
 }
 
-Reading readBinaryList(ByteView bytes) { return readList(readBinaryPropertyList(bytes), "offset"); }
+Reading readBinaryList(ByteView bytes) {
+    // Of bytes that nobody has looked at yet, it must only come back, and leave their size alone.
+    Bytes changed(bytes.begin(), bytes.end());
+    const bool replaced = replaceBinaryText(changed, 0, "operation", "SENT");
+    return readList(readBinaryPropertyList(bytes), "offset")
+        .unless(changed.size() == bytes.size(), "a replaced text moves others")
+        .unless(replaced || std::equal(changed.begin(), changed.end(), bytes.begin()),
+                "what could not be replaced has changed");
+}
 
 Reading readPackage(ByteView bytes) {
     SystemPropertyLists propertyLists;

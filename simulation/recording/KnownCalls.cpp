@@ -76,7 +76,7 @@ const Calls& otherCalls() {
         {"NotificationCenter", {"addObserver", "removeObserver"}},
         {"NotificationCenterObserver", {"callback"}},
         {"OperationQueue", {"add", "setMaximumConcurrentOperations"}},
-        {"PropertyListSerialization", {"parse", "serialize"}},
+        {"PropertyListSerialization", {"parse", "serialize", "replaceText"}},
         {"Semaphore", {"signal", "wait"}},
         {"SerialQueue", {"sync"}},
         {"SyncHost", {"mainBundleIdentifier", "isRecoverableError", "transferService"}},

@@ -35,4 +35,13 @@ Result<Bytes> SimulatedPropertyLists::serialize(const PropertyList& value,
     return call.result(codec_.serialize(value, format));
 }
 
+bool SimulatedPropertyLists::replaceText(Bytes& bytes, std::size_t index, std::string_view key,
+                                         std::string_view text) {
+    RecordedCall call(recorder_, kService, "replaceText", index, key, text);
+    Bytes changed = bytes;
+    const bool replaced = call.result(codec_.replaceText(changed, index, key, text));
+    if (replaced) bytes = std::move(changed);
+    return replaced;
+}
+
 }  // namespace appsync

@@ -17,6 +17,8 @@ class SimulatedPropertyLists : public PropertyListSerialization {
 
     Result<PropertyList> parse(ByteView bytes) override;
     Result<Bytes> serialize(const PropertyList& value, PropertyListFormat format) override;
+    bool replaceText(Bytes& bytes, std::size_t index, std::string_view key,
+                     std::string_view text) override;
 
     // The test's side; not recorded. The failures are used up one by one.
     void failNextParse(ErrorRecord error) { parseFailures_.push_back(std::move(error)); }

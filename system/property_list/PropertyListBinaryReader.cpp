@@ -20,18 +20,6 @@ namespace appsync {
 
 namespace {
 
-// Eight bytes are there to be read, of which `width` count, 1 to 8: what is read in this file
-// stands before the trailer or in it.
-std::uint64_t bigEndian(const std::uint8_t* bytes, std::size_t width) {
-    std::uint64_t value = 0;
-    std::memcpy(&value, bytes, sizeof(value));
-    if constexpr (std::endian::native == std::endian::little) value = __builtin_bswap64(value);
-    return value >> (64 - 8 * width);
-}
-
-std::uint8_t kindOf(std::uint8_t marker) { return marker & 0xF0U; }
-std::uint8_t lowerHalf(std::uint8_t marker) { return marker & 0x0FU; }
-
 class BinaryReader {
   public:
     explicit BinaryReader(ByteView bytes)
@@ -42,7 +30,7 @@ class BinaryReader {
 
     Result<PropertyList> read() {
         PropertyList value;
-        if (readTrailer() && readObject(top_, bytes_.size() - 16, value)) return value;
+        if (readTrailer() && readObject(trailer_.top, bytes_.size() - 16, value)) return value;
         return binaryReadError(problemAt_, problem_);
     }
 
@@ -67,31 +55,27 @@ class BinaryReader {
                               " bytes, found the end");
         }
         const std::size_t trailer = bytes_.size() - kBinaryTrailerSize;
-        const std::uint8_t* at = bytes_.data() + trailer;
-        offsetWidth_ = at[6];
-        referenceWidth_ = at[7];
-        objectCount_ = bigEndian(at + 8, 8);
-        top_ = bigEndian(at + 16, 8);
-        table_ = static_cast<std::size_t>(bigEndian(at + 24, 8));
+        trailer_ = readBinaryTrailer(bytes_.data() + trailer);
         return checkTrailer(trailer);
     }
 
     bool checkTrailer(std::size_t trailer) {
-        if (offsetWidth_ < 1 || offsetWidth_ > 8) {
+        if (trailer_.offsetWidth < 1 || trailer_.offsetWidth > 8) {
             return refuse(trailer + 6, "expected the width of an offset, 1 to 8");
         }
-        if (referenceWidth_ < 1 || referenceWidth_ > 8) {
+        if (trailer_.referenceWidth < 1 || trailer_.referenceWidth > 8) {
             return refuse(trailer + 7, "expected the width of a reference, 1 to 8");
         }
-        if (table_ <= kBinaryMagic.size() || table_ >= trailer) {
+        if (trailer_.table <= kBinaryMagic.size() || trailer_.table >= trailer) {
             return refuse(trailer + 24,
                           "expected the place of the offset table, between the "
                           "header and the trailer");
         }
-        const std::size_t tableSize = trailer - table_;
-        if (objectCount_ != tableSize / offsetWidth_ || tableSize % offsetWidth_ != 0) {
+        const std::size_t tableSize = trailer - trailer_.table;
+        if (trailer_.objectCount != tableSize / trailer_.offsetWidth ||
+            tableSize % trailer_.offsetWidth != 0) {
             return refuse(trailer + 8, "expected the number of objects, one for each " +
-                                           std::to_string(offsetWidth_) +
+                                           std::to_string(trailer_.offsetWidth) +
                                            " bytes of the offset table");
         }
         return true;
@@ -121,14 +105,15 @@ class BinaryReader {
 
     /// Where the object stands that is referred to at `from`.
     bool locate(std::uint64_t reference, std::size_t from, std::size_t& at) {
-        if (reference >= objectCount_) {
+        if (reference >= trailer_.objectCount) {
             return refuse(from, "expected the number of an object below " +
-                                    std::to_string(objectCount_) + ", found " +
+                                    std::to_string(trailer_.objectCount) + ", found " +
                                     std::to_string(reference));
         }
-        const std::size_t entry = table_ + static_cast<std::size_t>(reference) * offsetWidth_;
-        const std::uint64_t offset = bigEndian(bytes_.data() + entry, offsetWidth_);
-        if (offset < kBinaryMagic.size() || offset >= table_) {
+        const std::size_t entry =
+            trailer_.table + static_cast<std::size_t>(reference) * trailer_.offsetWidth;
+        const std::uint64_t offset = bigEndian(bytes_.data() + entry, trailer_.offsetWidth);
+        if (offset < kBinaryMagic.size() || offset >= trailer_.table) {
             return refuse(entry,
                           "expected the offset of an object, between the header and the "
                           "offset table, found " +
@@ -153,10 +138,10 @@ class BinaryReader {
 
     /// Whether so many bytes are left for objects.
     bool checkSize(std::size_t at, std::uint64_t size) {
-        return size <= table_ - at || refuse(at, "expected " + std::to_string(size) +
-                                                     " more bytes before the offset "
-                                                     "table, found " +
-                                                     std::to_string(table_ - at));
+        return size <= trailer_.table - at || refuse(at, "expected " + std::to_string(size) +
+                                                             " more bytes before the offset "
+                                                             "table, found " +
+                                                             std::to_string(trailer_.table - at));
     }
 
     bool readInteger(std::size_t at, PropertyList& value) {
@@ -215,8 +200,8 @@ class BinaryReader {
         std::uint64_t count = lowerHalf(bytes_[at]);
         std::size_t begin = at + 1;
         if (count == kBinaryCountFollows && !readCount(begin, count)) return false;
-        if (count > (table_ - begin) / unit) {
-            return refuse(at, "expected a count that " + std::to_string(table_ - begin) +
+        if (count > (trailer_.table - begin) / unit) {
+            return refuse(at, "expected a count that " + std::to_string(trailer_.table - begin) +
                                   " bytes before the offset table can hold, found " +
                                   std::to_string(count));
         }
@@ -293,7 +278,8 @@ class BinaryReader {
         if (open_.size() == PropertyList::kMaximumDepth) {
             return refuse(at, "expected at most 128 containers in one another");
         }
-        const std::size_t width = referenceWidth_ * (kindOf(bytes_[at]) == kBinaryMap ? 2U : 1U);
+        const std::size_t width =
+            trailer_.referenceWidth * (kindOf(bytes_[at]) == kBinaryMap ? 2U : 1U);
         Span span;
         if (!readSpan(at, width, span)) return false;
         const std::size_t count = span.size / width;
@@ -310,32 +296,32 @@ class BinaryReader {
     }
 
     [[nodiscard]] std::uint64_t referenceAt(std::size_t at) const {
-        return bigEndian(bytes_.data() + at, referenceWidth_);
+        return bigEndian(bytes_.data() + at, trailer_.referenceWidth);
     }
 
     bool readArray(Span span, PropertyList& value) {
-        std::vector<PropertyList> elements(span.size / referenceWidth_);
+        std::vector<PropertyList> elements(span.size / trailer_.referenceWidth);
         std::size_t at = span.at;
         for (PropertyList& element : elements) {
             if (!readObject(referenceAt(at), at, element)) return false;
-            at += referenceWidth_;
+            at += trailer_.referenceWidth;
         }
         return value.becomeArray(elements);
     }
 
     bool readMap(Span span, PropertyList& value) {
-        std::vector<PropertyList::Entry> entries(span.size / 2 / referenceWidth_);
+        std::vector<PropertyList::Entry> entries(span.size / 2 / trailer_.referenceWidth);
         std::size_t at = span.at;
         std::size_t place = 0;
         for (auto& [key, inner] : entries) {
             const std::size_t valueAt = at + span.size / 2;
             if (!readKeyAt(place++, at, key) || !readObject(referenceAt(valueAt), valueAt, inner))
                 return false;
-            at += referenceWidth_;
+            at += trailer_.referenceWidth;
         }
         if (value.becomeMap(entries)) return true;
         const std::size_t repeated = PropertyList::findRepeatedKey(entries).value_or(0);
-        return refuse(span.at + repeated * referenceWidth_,
+        return refuse(span.at + repeated * trailer_.referenceWidth,
                       "expected a key that the map does not have yet");
     }
 
@@ -390,11 +376,7 @@ class BinaryReader {
     static constexpr std::size_t kRememberedKeys = 16;
 
     ByteView bytes_;
-    std::size_t offsetWidth_ = 0;
-    std::size_t referenceWidth_ = 0;
-    std::uint64_t objectCount_ = 0;
-    std::uint64_t top_ = 0;
-    std::size_t table_ = 0;
+    BinaryTrailer trailer_;
 
     std::size_t valuesLeft_;
     std::size_t longBytesLeft_;

@@ -5,6 +5,7 @@
 #include <string_view>
 #include <utility>
 
+#include "system/property_list/PropertyListBinaryEdit.h"
 #include "system/property_list/PropertyListBinaryFormat.h"
 #include "system/property_list/PropertyListBinaryReader.h"
 #include "system/property_list/PropertyListBinaryWriter.h"
@@ -54,6 +55,11 @@ Result<Bytes> SystemPropertyLists::serialize(const PropertyList& value, Property
     } catch (const std::bad_alloc&) {
         return outOfMemoryError(PropertyListErrorCode::Unwritable);
     }
+}
+
+bool SystemPropertyLists::replaceText(Bytes& bytes, std::size_t index, std::string_view key,
+                                      std::string_view text) {
+    return magicPrefix(bytes) == kBinaryMagic.size() && replaceBinaryText(bytes, index, key, text);
 }
 
 }  // namespace appsync

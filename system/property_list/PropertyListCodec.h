@@ -4,10 +4,10 @@
 // it looks at the bytes and hands them to PropertyListBinaryReader.h, or to
 // PropertyListXmlReader.h, for which pugixml parses, or, where lists are plain,
 // PropertyListPlainXmlReader.h, which is faster. PropertyListXmlValues.h and PropertyListText.h are
-// what the XML side shares, PropertyListBinaryFormat.h what the binary side does,
-// PropertyListErrors.h says where and why. Every byte may be foreign: what an input claims is
-// bounded by what it could hold (fuzz/readers/). The value itself is platform/PropertyList.h.
-// Includes platform/ and pugixml.
+// what the XML side shares, PropertyListBinaryFormat.h what the binary side does (its reader, its
+// writer, and PropertyListBinaryEdit.h, which changes a text in place), PropertyListErrors.h says
+// where and why. Every byte may be foreign: what an input claims is bounded by what it could hold
+// (fuzz/readers/). The value itself is platform/PropertyList.h. Includes platform/ and pugixml.
 
 #include "platform/PropertyListSerialization.h"
 
@@ -22,6 +22,9 @@ class SystemPropertyLists final : public PropertyListSerialization {
   public:
     Result<PropertyList> parse(ByteView bytes) override;
     Result<Bytes> serialize(const PropertyList& value, PropertyListFormat format) override;
+    /// Where the bytes are binary and hold the text already.
+    bool replaceText(Bytes& bytes, std::size_t index, std::string_view key,
+                     std::string_view text) override;
 };
 
 }  // namespace appsync

@@ -7,6 +7,7 @@ namespace {
 
 using testing::ElementsAre;
 using testing::IsEmpty;
+using testing::SizeIs;
 
 class TodoEdit : public AppsClientFixture {
   protected:
@@ -30,6 +31,29 @@ TEST_F(TodoEdit, RewritesAnXmlListInTheBinaryEncoding) {
     client_->changeAssetID(kA, "SENT");
     EXPECT_TRUE(platform_.files.text(file_)->starts_with("bplist00"));
     EXPECT_EQ(operationOf(kA), "SENT");
+}
+
+TEST_F(TodoEdit, SerialisesTheListOnlyForAnOperationThatItHasNotHeldYet) {
+    setTodoList(PropertyList::array(
+        {todoEntry(kA, "install"), todoEntry(kB, "install"), todoEntry(kC, "install")}));
+    const std::vector<std::pair<std::string, std::string>> edits{
+        {kA, "SENT"}, {kB, "SENT"}, {kA, "INSTALLED"}, {kB, "INSTALLED"}, {kC, "SENT"}};
+    for (const auto& [identifier, operation] : edits) client_->changeAssetID(identifier, operation);
+    EXPECT_THAT(platform_.callsTo({"PropertyListSerialization.serialize"}), SizeIs(2));
+    EXPECT_THAT(platform_.callsTo({"FileSystem.writeFileAtomically"}), SizeIs(edits.size()));
+    EXPECT_EQ(platform_.propertyListAt(file_),
+              PropertyList::array(
+                  {todoEntry(kA, "INSTALLED"), todoEntry(kB, "INSTALLED"), todoEntry(kC, "SENT")}));
+}
+
+TEST_F(TodoEdit, SerialisesWhatSomebodyElseHasWritten) {
+    setTodoList(PropertyList::array({todoEntry(kA, "install"), todoEntry(kB, "SENT")}));
+    client_->changeAssetID(kA, "SENT");
+    setTodoList(PropertyList::array({todoEntry(kB, "SENT"), todoEntry(kA, "install")}));
+    client_->changeAssetID(kA, "SENT");
+    EXPECT_THAT(platform_.callsTo({"PropertyListSerialization.serialize"}), SizeIs(2));
+    EXPECT_EQ(platform_.propertyListAt(file_),
+              PropertyList::array({todoEntry(kB, "SENT"), todoEntry(kA, "SENT")}));
 }
 
 TEST_F(TodoEdit, LeavesAListWithoutTheIdentifierUntouched) {
