@@ -54,10 +54,10 @@ Status PackageArchive::stream(const PackageEntry& entry, std::span<std::uint8_t>
                               const std::function<Status(ByteView piece)>& sink) {
     PackageArchiveContents contents(file_, entry);
     while (true) {
-        const Result<std::size_t> count = contents.read(buffer);
-        if (!count) return count.error().withContext("entry " + quotedName(entry.name));
-        if (*count == 0) return {};
-        if (Status status = sink(buffer.first(*count)); !status) return status;
+        const Result<ByteView> piece = contents.next(buffer);
+        if (!piece) return piece.error().withContext("entry " + quotedName(entry.name));
+        if (piece->empty()) return {};
+        if (Status status = sink(*piece); !status) return status;
     }
 }
 

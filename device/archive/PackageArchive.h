@@ -8,7 +8,7 @@
 // PackageLimits.h says what an archive may claim, PackageError.h why one is refused. Written by
 // ArchiveWriter.h, with libzip, from what PackageFolder.h finds.
 //
-// Includes device/values, system/, libzip and zlib. Called by device/package.
+// Includes device/values, system/, libzip, libdeflate and zlib. Called by device/package.
 
 #include <cstddef>
 #include <cstdint>
@@ -43,7 +43,8 @@ class PackageArchive {
     /// Null when there is none.
     [[nodiscard]] const PackageEntry* find(std::string_view entryName) const noexcept;
 
-    /// Gives the contents piece by piece, through `buffer`, to `sink`; stops at the first error.
+    /// Gives the contents piece by piece to `sink`, none longer than `buffer`, which is there for
+    /// what is not in memory anyway; stops at the first error.
     /// Succeeds only when the sizes and the CRC were right. Nothing is true of the pieces before
     /// that.
     [[nodiscard]] Status stream(const PackageEntry& entry, std::span<std::uint8_t> buffer,

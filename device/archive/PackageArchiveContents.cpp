@@ -1,11 +1,13 @@
 #include "device/archive/PackageArchiveContents.h"
 
+#include <libdeflate.h>
 #include <zlib.h>
 
 #include <algorithm>
 #include <cerrno>
 #include <string>
 #include <string_view>
+#include <utility>
 
 #include "device/archive/PackageEntries.h"
 #include "device/archive/PackageError.h"
@@ -19,6 +21,31 @@ namespace {
 constexpr std::uint64_t kPackedPieceBytes = std::uint64_t{64} << 10;
 /// The window of deflate; negative, as there is no header around it.
 constexpr int kRawDeflate = -MAX_WBITS;
+
+struct FreeInflater {
+    void operator()(libdeflate_decompressor* inflater) const noexcept {
+        libdeflate_free_decompressor(inflater);
+    }
+};
+
+/// Inflates all of `packed` to all of `contents`; false where they are not the same, or memory
+/// lacks.
+bool inflateWhole(ByteView packed, std::span<std::uint8_t> contents) {
+    const std::unique_ptr<libdeflate_decompressor, FreeInflater> inflater(
+        libdeflate_alloc_decompressor());
+    std::size_t used = 0;
+    std::size_t made = 0;
+    return inflater != nullptr &&
+           libdeflate_deflate_decompress_ex(inflater.get(), packed.data(), packed.size(),
+                                            contents.data(), contents.size(), &used,
+                                            &made) == LIBDEFLATE_SUCCESS &&
+           used == packed.size() && made == contents.size();
+}
+
+bool fitsAtOnce(const PackageEntry& entry) {
+    constexpr std::uint64_t most = PackageArchiveContents::kMostAtOnce;
+    return entry.size <= most && entry.packedSize <= most - entry.size;
+}
 
 ErrorRecord damaged(std::string_view reason) {
     return packageError(PackageErrorCode::DamagedEntry,
@@ -34,19 +61,34 @@ PackageArchiveContents::~PackageArchiveContents() {
     if (stream_) ::inflateEnd(stream_.get());
 }
 
-Result<std::size_t> PackageArchiveContents::read(std::span<std::uint8_t> buffer) {
-    // One byte more than the entry says, to notice that there is more.
+Result<ByteView> PackageArchiveContents::next(std::span<std::uint8_t> buffer) {
+    const Result<ByteView> next = piece(buffer);
+    if (!next) return next;
+    if (next->size() > entry_.size - done_) return damaged("it unpacks to more bytes than it says");
+    if (next->empty()) {
+        if (Status status = checkEnd(); !status) return status.error();
+        return next;
+    }
+    crc_ = libdeflate_crc32(crc_, next->data(), next->size());
+    done_ += next->size();
+    return next;
+}
+
+Result<ByteView> PackageArchiveContents::piece(std::span<std::uint8_t> buffer) {
     const std::uint64_t left = entry_.size - done_;
-    const auto piece = buffer.first(
+    if (entry_.isDeflated && !std::exchange(hasTriedAtOnce_, true) && fitsAtOnce(entry_)) {
+        if (Status status = inflateAtOnce(); !status) return status.error();
+    }
+    if (whole_) {
+        return ByteView(whole_.get() + done_,
+                        static_cast<std::size_t>(std::min<std::uint64_t>(buffer.size(), left)));
+    }
+    // One byte more than the entry says, to notice that there is more.
+    buffer = buffer.first(
         static_cast<std::size_t>(std::min<std::uint64_t>(buffer.size() - 1, left) + 1));
-    const Result<std::size_t> count = entry_.isDeflated ? inflate(piece) : copy(piece);
-    if (!count) return count;
-    if (*count > left) return damaged("it unpacks to more bytes than it says");
-    crc_ = static_cast<std::uint32_t>(::crc32_z(crc_, piece.data(), *count));
-    done_ += *count;
-    if (*count > 0) return count;
-    if (Status status = checkEnd(); !status) return status.error();
-    return count;
+    const Result<std::size_t> count = entry_.isDeflated ? inflate(buffer) : copy(buffer);
+    if (!count) return count.error();
+    return ByteView(buffer.first(*count));
 }
 
 Status PackageArchiveContents::checkEnd() const {
@@ -65,6 +107,21 @@ Result<std::size_t> PackageArchiveContents::copy(std::span<std::uint8_t> buffer)
         buffer.first(static_cast<std::size_t>(std::min<std::uint64_t>(buffer.size(), left)));
     if (Status status = readPacked(piece); !status) return status.error();
     return piece.size();
+}
+
+Status PackageArchiveContents::inflateAtOnce() {
+    const auto packedSize = static_cast<std::size_t>(entry_.packedSize);
+    const auto size = static_cast<std::size_t>(entry_.size);
+    const auto packed = std::make_unique_for_overwrite<std::uint8_t[]>(packedSize);
+    const std::span packedBytes(packed.get(), packedSize);
+    if (Status status = readPacked(packedBytes); !status) return status;
+    auto whole = std::make_unique_for_overwrite<std::uint8_t[]>(size);
+    if (inflateWhole(packedBytes, {whole.get(), size})) {
+        whole_ = std::move(whole);
+    } else {
+        packedDone_ = 0;
+    }
+    return {};
 }
 
 Result<std::size_t> PackageArchiveContents::inflate(std::span<std::uint8_t> buffer) {

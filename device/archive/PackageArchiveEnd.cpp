@@ -45,7 +45,7 @@ ErrorRecord inSeveralParts() {
 /// Looks through the end of a file for ends of archives.
 class EndSearch {
   public:
-    EndSearch(const PackageFile& file, const PackageLimits& limits, const Bytes& tail)
+    EndSearch(const PackageFile& file, const PackageLimits& limits, ByteView tail)
         : file_(file), limits_(limits), tail_(tail) {}
 
     /// The one whose comment ends where the file ends, but for padding.
@@ -154,7 +154,7 @@ class EndSearch {
 
     const PackageFile& file_;
     const PackageLimits& limits_;
-    const Bytes& tail_;
+    const ByteView tail_;
 };
 
 }  // namespace
@@ -163,10 +163,10 @@ Result<ArchiveDirectoryPlace> findArchiveDirectory(const PackageFile& file,
                                                    const PackageLimits& limits) {
     constexpr std::uint64_t kTailBytes =
         kLongestComment + 1 + kEndBytes + kLocatorBytes + kLongestPadding;
-    const std::uint64_t size = std::min(file.size(), kTailBytes);
-    const Result<Bytes> tail = file.readExactly(file.size() - size, size);
-    if (!tail) return tail.error();
-    return EndSearch(file, limits, *tail).run();
+    static_assert(kTailBytes <= PackageFile::kKeptBytes);
+    const ByteView end = file.end();
+    const std::size_t size = std::min<std::size_t>(end.size(), kTailBytes);
+    return EndSearch(file, limits, end.last(size)).run();
 }
 
 ErrorRecord tooManyEntries(const PackageLimits& limits) {

@@ -4,6 +4,7 @@
 #include <sys/stat.h>
 #include <unistd.h>
 
+#include <algorithm>
 #include <cerrno>
 #include <utility>
 
@@ -40,11 +41,16 @@ Result<PackageFile> PackageFile::take(UniqueFd descriptor, std::string_view name
                             "package " + quotedName(name) +
                                 ": it is not a regular file; name the .zip file itself");
     }
-    return PackageFile(std::move(descriptor), static_cast<std::uint64_t>(status.st_size), name);
+    PackageFile file(std::move(descriptor), static_cast<std::uint64_t>(status.st_size), name);
+    const std::uint64_t kept = std::min(file.size_, kKeptBytes);
+    Result<Bytes> end = file.readExactly(file.size_ - kept, kept);
+    if (!end) return end.error();
+    file.end_ = *std::move(end);
+    return file;
 }
 
 Result<std::size_t> PackageFile::readAt(std::uint64_t offset, std::span<std::uint8_t> bytes) const {
-    std::size_t done = 0;
+    std::size_t done = readKept(offset, bytes);
     while (done < bytes.size()) {
         const ssize_t count = ::pread(descriptor_.get(), bytes.data() + done, bytes.size() - done,
                                       static_cast<off_t>(offset + done));
@@ -54,6 +60,16 @@ Result<std::size_t> PackageFile::readAt(std::uint64_t offset, std::span<std::uin
         done += static_cast<std::size_t>(count);
     }
     return done;
+}
+
+std::size_t PackageFile::readKept(std::uint64_t offset,
+                                  std::span<std::uint8_t> bytes) const noexcept {
+    const std::uint64_t begin = size_ - end_.size();
+    if (offset < begin || offset - begin >= end_.size()) return 0;
+    const ByteView kept = end().subspan(static_cast<std::size_t>(offset - begin));
+    const std::size_t count = std::min(kept.size(), bytes.size());
+    std::copy_n(kept.begin(), count, bytes.begin());
+    return count;
 }
 
 Result<Bytes> PackageFile::readExactly(std::uint64_t offset, std::uint64_t size) const {
