@@ -3,11 +3,11 @@
 #include <sys/statvfs.h>
 
 #include <algorithm>
-#include <array>
 #include <cerrno>
 #include <fstream>
 #include <map>
 #include <set>
+#include <unordered_set>
 
 #include "device/DeviceCreation.h"
 #include "device/DeviceOpening.h"
@@ -48,16 +48,6 @@ std::string readBoot() {
     std::string boot;
     std::getline(file, boot);
     return boot;
-}
-
-/// Whether nothing stands at the path, or nothing can. What cannot be looked at is not gone.
-Result<bool> isGone(RootedFileSystem& files, const std::string& path) {
-    constexpr std::array<std::int64_t, 5> kCodes = {ENOENT, ENOTDIR, ELOOP, EINVAL, ENAMETOOLONG};
-    const Result<ItemAttributes> attributes = files.attributes(path);
-    if (attributes) return false;
-    const std::int64_t code = attributes.error().code;
-    if (std::ranges::find(kCodes, code) != kCodes.end()) return true;
-    return attributes.error();
 }
 
 }  // namespace
@@ -198,11 +188,13 @@ Result<std::vector<ApplicationRecord>> Device::applications() {
 Result<std::vector<ApplicationRecord>> Device::applicationsOnDisk() {
     Result<std::vector<ApplicationRecord>> records = applications();
     if (!records) return records;
-    std::set<std::string> lost;
+    const Result<std::vector<std::string>> names = state_->containers.names();
+    if (!names) return names.error();
+    std::unordered_set<std::string> there;
+    for (const std::string& name : *names) there.insert(containerPath(name));
+    std::unordered_set<std::string> lost;
     for (const ApplicationRecord& each : *records) {
-        const Result<bool> gone = isGone(*state_->files, each.container);
-        if (!gone) return gone.error();
-        if (*gone) lost.insert(each.container);
+        if (!there.contains(each.container)) lost.insert(each.container);
     }
     if (lost.empty()) return records;
     records = applications();

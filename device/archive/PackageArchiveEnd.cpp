@@ -4,6 +4,7 @@
 #include <cstddef>
 #include <optional>
 #include <string>
+#include <string_view>
 
 #include "device/archive/PackageArchiveFormat.h"
 #include "device/archive/PackageError.h"
@@ -15,7 +16,7 @@ namespace appsync {
 namespace {
 
 // The end of central directory, "PK\5\6": 22 bytes and a comment of at most 65535.
-constexpr std::uint32_t kEndSignature = 0x06054b50;
+constexpr std::string_view kEndSignature = "PK\5\6";
 constexpr std::size_t kEndBytes = 22;
 constexpr std::size_t kLongestComment = 65535;
 // Its locator for large archives, right before it, and what that leads to.
@@ -52,8 +53,7 @@ class EndSearch {
     Result<ArchiveDirectoryPlace> run() {
         std::optional<std::size_t> found;
         std::size_t count = 0;
-        for (std::size_t at = 0; at + kEndBytes <= tail_.size(); ++at) {
-            if (tail_[at] != 'P' || u32(tail_, at) != kEndSignature) continue;
+        for (std::size_t at = nextEnd(0); at != kNone; at = nextEnd(at + 1)) {
             if (++count > kMostEnds) return inconsistentArchive("it has too many ends");
             if (!isPaddingFrom(at + kEndBytes + u16(tail_, at + 20))) continue;
             if (found) return inconsistentArchive("it has two ends");
@@ -64,6 +64,15 @@ class EndSearch {
     }
 
   private:
+    static constexpr std::size_t kNone = std::string_view::npos;
+
+    /// The first place from there on where an end may begin.
+    [[nodiscard]] std::size_t nextEnd(std::size_t from) const {
+        const std::string_view tail(reinterpret_cast<const char*>(tail_.data()), tail_.size());
+        const std::size_t at = tail.find(kEndSignature, from);
+        return at == kNone || tail.size() - at < kEndBytes ? kNone : at;
+    }
+
     [[nodiscard]] std::uint64_t fileOffset(std::size_t at) const {
         return file_.size() - tail_.size() + at;
     }
