@@ -15,7 +15,9 @@
 #include "fuzz/readers/ScratchDirectory.h"
 #include "host/backup/Backup.h"
 #include "host/console/PropertyListReading.h"
+#include "host/file/Checksum.h"
 #include "host/output/JsonRecords.h"
+#include "host/plan/LibraryIndex.h"
 #include "host/plan/Versions.h"
 #include "system/property_list/PropertyListBinaryEdit.h"
 #include "system/property_list/PropertyListBinaryReader.h"
@@ -156,6 +158,24 @@ Reading readManifest(ByteView bytes) {
     return Reading::read()
         .unless(std::ranges::all_of(manifest->applications, isLegal), "an illegal identifier")
         .unless(std::ranges::all_of(manifest->files, isInside), "a file outside the backup");
+}
+
+Reading readLibraryIndex(ByteView bytes) {
+    constexpr std::size_t kSumLength = 64;
+    RunningSum sum;
+    sum.add(bytes);
+    Bytes index = indexBytes({});
+    index.resize(index.size() - kSumLength);
+    for (const char digit : sum.finish()) index.push_back(static_cast<std::uint8_t>(digit));
+    index.insert(index.end(), bytes.begin(), bytes.end());
+    const auto packages = readIndex(index);
+    if (!packages) return Reading::refused("it is no index");
+    const auto isLegal = [](const IndexedPackage& each) {
+        return isLegalIdentifier(each.package.identifier);
+    };
+    return Reading::read()
+        .unless(std::ranges::all_of(*packages, isLegal), "an illegal identifier")
+        .unless(indexBytes(*packages) == index, "it is written otherwise");
 }
 
 Reading readJsonList(ByteView bytes) {

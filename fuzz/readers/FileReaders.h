@@ -31,6 +31,10 @@ namespace appsync {
 /// The manifest of a backup. All names that were read are those of a backup's files.
 [[nodiscard]] Reading readManifest(ByteView bytes);
 
+/// What the index of a library says after its sum, which is made to be right. What was read is
+/// written as it was, and names legal identifiers alone.
+[[nodiscard]] Reading readLibraryIndex(ByteView bytes);
+
 /// Three versions, one a line: comparing them is an order.
 [[nodiscard]] Reading readVersions(ByteView bytes);
 

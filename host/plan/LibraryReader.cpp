@@ -50,8 +50,7 @@ bool isStagingFileName(std::string_view identifier) {
     return std::find(names.begin(), names.end(), identifier) != names.end();
 }
 
-Result<LibraryPackage> describedPackage(const PackageReader& package, const std::string& file) {
-    LibraryPackage described = packageOf(package.info(), file);
+Result<LibraryPackage> usablePackage(LibraryPackage described) {
     if (!isStagingFileName(described.identifier)) return described;
     return failure(
         "the device keeps a file under the name " + described.identifier + " when it syncs",
@@ -94,7 +93,7 @@ Result<LibraryPackage> readPackage(const std::string& file,
                                    PropertyListSerialization& propertyLists) {
     const Result<PackageReader> package = PackageReader::open(file, propertyLists);
     if (!package) return package.error();
-    return describedPackage(*package, file);
+    return usablePackage(packageOf(package->info(), file));
 }
 
 Result<LibraryPackage> readWholePackage(const std::string& file,
@@ -102,7 +101,7 @@ Result<LibraryPackage> readWholePackage(const std::string& file,
                                         const std::function<void(std::uint64_t bytes)>& progress) {
     Result<PackageReader> package = PackageReader::open(file, propertyLists);
     if (!package) return package.error();
-    Result<LibraryPackage> described = describedPackage(*package, file);
+    Result<LibraryPackage> described = usablePackage(packageOf(package->info(), file));
     if (!described) return described;
     const Status verified = package->verify(progress);
     if (!verified) return verified.error();
@@ -163,19 +162,42 @@ std::uint64_t bytesOnDevice(const PackageInfo& info) {
     return info.unpackedBytes + info.entryCount * kBlockBytes;  // each file fills its last block
 }
 
+namespace {
+
+// The package in a file of the library, read only where the index does not know it.
+Result<LibraryPackage> indexedPackage(LibraryIndex& index, const std::string& name,
+                                      const std::string& file,
+                                      PropertyListSerialization& propertyLists) {
+    // Before it is read: what changes it meanwhile changes the stamp that is found next time.
+    const std::optional<FileStamp> stamp = stampOf(file);
+    if (stamp) {
+        if (std::optional<LibraryPackage> known = index.take(name, *stamp)) {
+            known->file = file;
+            return usablePackage(*std::move(known));
+        }
+    }
+    Result<LibraryPackage> package = readPackage(file, propertyLists);
+    if (package && stamp) index.keep(name, *stamp, *package);
+    return package;
+}
+
+}  // namespace
+
 Result<Library> readLibrary(const std::string& folder, PropertyListSerialization& propertyLists,
-                            const StepProgress& progress) {
+                            const StepProgress& progress, const LibraryIndexPlace& indexPlace) {
     const Result<std::vector<std::string>> names = packageNamesIn(folder);
     if (!names) return names.error();
     Library library;
     library.folder = folder;
+    LibraryIndex index(indexPlace, folder, names->size());
     std::vector<LibraryPackage> packages;
+    packages.reserve(names->size());
     std::size_t done = 0;
     for (const std::string& name : *names) {
         if (progress) progress(done++, names->size());
         std::string file = folder;
         file.append("/").append(name);
-        Result<LibraryPackage> package = readPackage(file, propertyLists);
+        Result<LibraryPackage> package = indexedPackage(index, name, file, propertyLists);
         if (package) {
             packages.push_back(*std::move(package));
         } else {
@@ -183,6 +205,7 @@ Result<Library> readLibrary(const std::string& folder, PropertyListSerialization
         }
     }
     if (progress) progress(done, names->size());
+    index.save();
     library.packages = keepHighestVersions(std::move(packages), library.notes);
     Result<std::optional<Bytes>> iconOrder = readIconOrder(folder, propertyLists);
     if (iconOrder) {

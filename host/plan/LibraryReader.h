@@ -8,6 +8,7 @@
 #include <vector>
 
 #include "host/plan/Library.h"
+#include "host/plan/LibraryIndex.h"
 #include "host/plan/StepProgress.h"
 #include "platform/Result.h"
 
@@ -21,10 +22,11 @@ inline constexpr std::string_view kIconOrderFile = "IconOrder.plist";
 
 /// Reads a folder of packages: every "*.zip" directly in it, and IconOrder.plist. Packages and a
 /// layout that cannot be used become faults. An error only when the folder itself cannot be read.
-/// The steps of the progress are packages.
-[[nodiscard]] Result<Library> readLibrary(const std::string& folder,
-                                          PropertyListSerialization& propertyLists,
-                                          const StepProgress& progress = {});
+/// The steps of the progress are packages. One that the index of the folder knows is not opened.
+[[nodiscard]] Result<Library> readLibrary(
+    const std::string& folder, PropertyListSerialization& propertyLists,
+    const StepProgress& progress = {},
+    const LibraryIndexPlace& indexPlace = LibraryIndexPlace::ofUser());
 
 /// The names of the packages in a folder, sorted: every "*.zip" directly in it. An error only when
 /// the folder itself cannot be read.

@@ -1,12 +1,12 @@
 #pragma once
 
 // host/plan: what a sync is to do, found out before anything is done. Library.h and LibraryReader.h
-// are the folder of packages (Versions.h compares), SyncPlan.h (this header) what of it the device
-// lacks, StandingInstalls.h what an earlier coordinated session has left and goes on, StagingArea.h
-// and InterruptedStaging.h the staging area that a host has written or an interrupted session left.
-// SyncPreparation.h puts these together for `sync` and `plan`, and makes the device ready for the
-// session. For `send`, RestoredParts.h is what a package of a restore comes with;
-// TransferError.h are the errors of what travels.
+// are the folder of packages (Versions.h compares, LibraryIndex.h remembers them), SyncPlan.h (this
+// header) what of it the device lacks, StandingInstalls.h what an earlier coordinated session has
+// left and goes on, StagingArea.h and InterruptedStaging.h the staging area that a host has written
+// or an interrupted session left. SyncPreparation.h puts these together for `sync` and `plan`, and
+// makes the device ready for the session. For `send`, RestoredParts.h is what a package of a
+// restore comes with; TransferError.h are the errors of what travels.
 //
 // The plan itself is plain: device records in, `SyncPlan` out, no file and no device touched.
 // Called by session (which judges its outcome by the plan), watch, output, backup and the commands.

@@ -12,6 +12,7 @@
 #include "device/package/PackageWriter.h"
 #include "device/screen/IconCanvas.h"
 #include "fuzz/readers/ScratchDirectory.h"
+#include "host/plan/LibraryIndex.h"
 #include "system/property_list/PropertyListCodec.h"
 
 namespace appsync {
@@ -114,6 +115,13 @@ Bytes smallManifest() {
                    R"(","version":null,"name":"\u00e9","data":true}],"files":{)"
                    R"("RestoreApplications.plist":{"size":12,"sha256":")" +
                    sum + R"("},"data/com.example.a.zip":{"size":0,"sha256":")" + sum + "\"}}}");
+}
+
+Bytes smallLibraryIndex() {
+    const IndexedPackage package{{1, 2, 300, 4, 5}, {kA, "1.0", "\u00e9", "a.zip", 300, 4096}};
+    const Bytes whole = indexBytes({package});
+    const auto head = static_cast<std::ptrdiff_t>(indexBytes({}).size());
+    return {whole.begin() + head, whole.end()};
 }
 
 Bytes smallTodoList() {

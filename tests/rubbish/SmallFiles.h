@@ -14,6 +14,8 @@ namespace appsync {
 [[nodiscard]] Bytes smallDataArchive();
 [[nodiscard]] Bytes smallIcon();
 [[nodiscard]] Bytes smallManifest();
+/// What an index says after its sum.
+[[nodiscard]] Bytes smallLibraryIndex();
 [[nodiscard]] Bytes smallTodoList();
 [[nodiscard]] Bytes smallIconOrder();
 [[nodiscard]] Bytes smallRestoreInfo();
