@@ -94,10 +94,12 @@ class Device:
 
 
 @pytest.fixture(scope="session")
-def appsync():
+def appsync(tmp_path_factory):
     program = os.environ.get("APPSYNC")
     if not program:
         pytest.exit("set APPSYNC to the command to test", returncode=2)
+    # Of the libraries that tests make, the user's own cache is to have nothing.
+    os.environ["XDG_CACHE_HOME"] = str(tmp_path_factory.mktemp("cache"))
     return Command(os.path.abspath(program))
 
 

@@ -43,7 +43,7 @@ class Command:
     def __init__(self, program, directory):
         self.program = program
         self.out, self.err = os.path.join(directory, "out"), os.path.join(directory, "err")
-        self.environment = dict(os.environ)
+        self.environment = dict(os.environ, XDG_CACHE_HOME=str(directory))
         # What was freed stays in the sanitizer's quarantine: that is not the command's need.
         self.environment["ASAN_OPTIONS"] = ":".join(
             filter(None, [os.environ.get("ASAN_OPTIONS"), "quarantine_size_mb=4"]))
