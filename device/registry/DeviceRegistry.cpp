@@ -126,7 +126,18 @@ std::optional<AppProxy> DeviceRegistry::proxyForIdentifier(const std::string& id
 }
 
 bool DeviceRegistry::isApplicationInstalled(const std::string& identifier) {
-    return proxyForIdentifier(identifier, Placeholders::Included).has_value();
+    bool isThere = false;
+    context_.database
+        .read([&](Database& database) {
+            Query rows = database.query(
+                "SELECT 1 FROM applications WHERE identifier = ?"
+                " UNION ALL SELECT 1 FROM placeholders WHERE identifier = ?");
+            rows.bind(identifier, identifier);
+            isThere = rows.next();
+            return rows.status();
+        })
+        .ignore();
+    return isThere;
 }
 
 void DeviceRegistry::enumerateBundles(BundleType type, const ProxyCallback& callback) {
