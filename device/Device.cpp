@@ -21,10 +21,12 @@
 #include "device/install/Containers.h"
 #include "device/install/DurabilityBarrier.h"
 #include "device/install/InstallContext.h"
+#include "device/install/KeptBundles.h"
 #include "device/install/PlaceholderInstall.h"
 #include "device/install/ProgressBook.h"
 #include "device/install/Reconciliation.h"
 #include "device/install/RestoreData.h"
+#include "device/install/Rollback.h"
 #include "device/registry/DeviceRegistry.h"
 #include "device/screen/CairoIconRenderer.h"
 #include "device/screen/DeviceHomeScreen.h"
@@ -70,6 +72,7 @@ struct Device::State {
           database(std::move(opened.database)),
           barrier(files->root().descriptor()),
           containers(*files),
+          kept(*files, path),
           progress(*database, [this] { registry.touch(); }),
           registry(context),
           policy(*database),
@@ -91,9 +94,10 @@ struct Device::State {
     const std::unique_ptr<DeviceDatabase> database;
     DurabilityBarrier barrier;
     Containers containers;
+    KeptBundles kept;
     ProgressBook progress;
-    const InstallContext context{*database, *files,        containers, barrier,
-                                 progress,  propertyLists, boot,       options.keepsData};
+    const InstallContext context{*database,     *files, containers,       kept, barrier, progress,
+                                 propertyLists, boot,   options.keepsData};
     DeviceRegistry registry;
     DevicePolicy policy;
     DeviceInstaller installer;
@@ -173,7 +177,11 @@ Result<std::uint64_t> Device::freeSpace() const {
     if (::fstatvfs(state_->files->root().descriptor(), &space) != 0) {
         return posixError(errno, "ask for the free space of", state_->path);
     }
-    return std::uint64_t{space.f_bavail} * space.f_frsize;
+    const Result<std::uint64_t> kept = bytesKept(*state_->database);
+    if (!kept) return kept.error();
+    const std::uint64_t capacity = std::uint64_t{space.f_blocks} * space.f_frsize;
+    const std::uint64_t free = std::uint64_t{space.f_bavail} * space.f_frsize;
+    return free + std::min(*kept, capacity - std::min(free, capacity));
 }
 
 std::uint64_t Device::spaceReserve() const { return spaceReserveOf(state_->path); }
@@ -345,6 +353,17 @@ Status Device::forgetFailures(const std::set<std::string>& identifiers) {
         }
         return {};
     });
+}
+
+void Device::makeRoom(std::uint64_t bytes) {
+    constexpr std::uint64_t kAllowance = std::uint64_t{1} << 20U;  // records, lists, the log
+    if (state_->lock) makeRoomFor(state_->context, std::max(bytes, bytes + kAllowance));
+}
+
+Result<RollbackRecord> Device::rollBack(const std::string& identifier) {
+    if (Status status = requireSession(); !status) return status.error();
+    if (Status status = requireLegalIdentifier(identifier); !status) return status.error();
+    return rollBackApplication(state_->context, identifier);
 }
 
 Status Device::demote(const std::string& identifier, DemotedBy by) {

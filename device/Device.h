@@ -107,7 +107,8 @@ class Device {
     [[nodiscard]] const std::string& path() const noexcept;
     /// The system log on this machine: one JSON object a line. It may not exist yet.
     [[nodiscard]] std::string logPath() const;
-    /// Bytes that may still be written to the file system that holds the device.
+    /// Bytes that may still be written to the file system that holds the device: what versions take
+    /// that are kept for a rollback is among them, as those go once the room is needed.
     [[nodiscard]] Result<std::uint64_t> freeSpace() const;
     /// Bytes that the device keeps back for a full disk: 0 where it could not, or has given them
     /// up.
@@ -205,6 +206,12 @@ class Device {
     [[nodiscard]] Result<std::vector<std::string>> removeLeftoverSyncPlaceholders();
     /// Nobody misses anything of these applications any more: their last failures are forgotten.
     Status forgetFailures(const std::set<std::string>& identifiers);
+    /// Sees to it that so many bytes are free, and a little more for what goes along with them, as
+    /// far as giving up versions that are kept for a rollback can do that: the oldest first.
+    void makeRoom(std::uint64_t bytes);
+    /// Exchanges the application with the version that its last update has replaced; the data stays
+    /// as it is. Refused while it runs or is being updated, and where nothing is kept of it.
+    [[nodiscard]] Result<RollbackRecord> rollBack(const std::string& identifier);
     /// Takes the bundle away and leaves placeholder and data.
     Status demote(const std::string& identifier, DemotedBy by);
 

@@ -7,6 +7,7 @@
 #include "device/database/CoordinationTables.h"
 #include "device/database/Database.h"
 #include "device/database/DeviceDatabase.h"
+#include "device/database/KeptTable.h"
 #include "device/database/RegistryTables.h"
 #include "device/install/ProgressBook.h"
 #include "device/screen/IconDrawing.h"
@@ -43,6 +44,19 @@ Status addProgress(Database& database, std::vector<ApplicationRecord>& records) 
     for (ApplicationRecord& record : records) {
         const auto found = progress->find(record.identifier);
         if (record.isPlaceholder && found != progress->end()) record.progress = found->second;
+    }
+    return {};
+}
+
+Status addKept(Database& database, std::vector<ApplicationRecord>& records) {
+    const Result<std::vector<BundleRow>> rows = allKept(database);
+    if (!rows) return rows.error();
+    std::unordered_map<std::string_view, const BundleRow*> kept;
+    for (const BundleRow& row : *rows) kept[row.identifier] = &row;
+    for (ApplicationRecord& record : records) {
+        const auto found = kept.find(record.identifier);
+        if (record.isPlaceholder || found == kept.end()) continue;
+        record.kept = KeptVersion{found->second->version, found->second->bytes};
     }
     return {};
 }
@@ -145,7 +159,8 @@ Result<std::vector<ApplicationRecord>> listApplications(DeviceDatabase& database
     const Status status = database.read([&](Database& connection) {
         Status read = appendRecords(connection, BundleTable::Applications, records);
         if (read) read = appendRecords(connection, BundleTable::Placeholders, records);
-        return read ? addProgress(connection, records) : read;
+        if (read) read = addProgress(connection, records);
+        return read ? addKept(connection, records) : read;
     });
     if (!status) return status.error();
     std::stable_sort(records.begin(), records.end(),
@@ -153,6 +168,19 @@ Result<std::vector<ApplicationRecord>> listApplications(DeviceDatabase& database
                          return left.identifier < right.identifier;
                      });
     return records;
+}
+
+Result<std::uint64_t> bytesKept(DeviceDatabase& database) {
+    std::uint64_t bytes = 0;
+    const Status status = database.read([&](Database& connection) -> Status {
+        bytes = 0;
+        const Result<std::vector<BundleRow>> rows = allKept(connection);
+        if (!rows) return rows.error();
+        for (const BundleRow& row : *rows) bytes += row.bytes;
+        return {};
+    });
+    if (!status) return status.error();
+    return bytes;
 }
 
 Result<std::vector<CoordinatorRecord>> listCoordinators(DeviceDatabase& database) {

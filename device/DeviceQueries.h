@@ -17,6 +17,9 @@ class RootDirectory;
 /// See Device::applications.
 [[nodiscard]] Result<std::vector<ApplicationRecord>> listApplications(DeviceDatabase& database);
 
+/// What the versions take that are kept for a rollback.
+[[nodiscard]] Result<std::uint64_t> bytesKept(DeviceDatabase& database);
+
 /// See Device::coordinators.
 [[nodiscard]] Result<std::vector<CoordinatorRecord>> listCoordinators(DeviceDatabase& database);
 

@@ -256,7 +256,7 @@ Status removeCoordinator(Database& database, std::int64_t id, RemovedCoordinator
         database.query("DELETE FROM denials WHERE identifier = ?").bind(identifier).run();
     if (!status || placeholder != PlaceholderState::Stands) return status;
     removed.hadPlaceholder = true;
-    return forgetBundle(database, BundleTable::Placeholders, identifier, removed.container);
+    return forgetPlaceholder(database, identifier, removed.container);
 }
 
 Status renewRestore(Database& database, const StoredCoordinator& failed,

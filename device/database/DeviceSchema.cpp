@@ -13,7 +13,7 @@ namespace appsync {
 
 namespace {
 
-// Those that are the same in every version.
+// Those that are in every version, the same.
 constexpr const char* kTables = R"sql(
 CREATE TABLE applications (
     identifier TEXT PRIMARY KEY,
@@ -145,7 +145,7 @@ CREATE TABLE history (
 
 // An `id` of `uninstalled` is never given again, so it tells what came before a session and what
 // during it, whatever the clock does.
-constexpr const char* kTablesOfVersion2 = R"sql(
+constexpr const char* kTablesSinceVersion2 = R"sql(
 CREATE TABLE uninstalled (
     id INTEGER PRIMARY KEY AUTOINCREMENT,
     identifier TEXT NOT NULL UNIQUE,
@@ -158,6 +158,21 @@ CREATE TABLE session (
     process INTEGER NOT NULL,
     started INTEGER NOT NULL,
     last_uninstall INTEGER NOT NULL
+) STRICT;
+)sql";
+
+// An `id` is greater than that of whatever was kept before.
+constexpr const char* kTablesSinceVersion3 = R"sql(
+CREATE TABLE kept (
+    id INTEGER PRIMARY KEY,
+    identifier TEXT NOT NULL UNIQUE REFERENCES applications (identifier) ON DELETE CASCADE,
+    version TEXT,
+    name TEXT,
+    install_type INTEGER NOT NULL,
+    container TEXT NOT NULL UNIQUE,
+    bundle TEXT NOT NULL,
+    icon TEXT NOT NULL,
+    bytes INTEGER NOT NULL
 ) STRICT;
 )sql";
 
@@ -185,11 +200,11 @@ constexpr const char* kTakeOverVersion1 =
     "INSERT INTO session (id, process, started, last_uninstall)"
     " SELECT id, process, started, 0 FROM former_session;"
     "DROP TABLE former_uninstalled;"
-    "DROP TABLE former_session;"
-    "PRAGMA user_version = 2;";
+    "DROP TABLE former_session;";
 
 std::string tablesOf(std::int64_t version) {
-    return std::string(kTables) + (version == 1 ? kTablesOfVersion1 : kTablesOfVersion2);
+    return std::string(kTables) + (version == 1 ? kTablesOfVersion1 : kTablesSinceVersion2) +
+           (version < 3 ? "" : kTablesSinceVersion3);
 }
 
 ErrorRecord halfCreated(const Database& database) {
@@ -259,6 +274,12 @@ Status checkDefinitions(Database& database, std::int64_t version) {
     return damaged(database, "it has no " + creationOf(*missing.begin()));
 }
 
+Status leaveVersion1(Database& database) {
+    Status status = database.execute(kSetVersion1Aside);
+    if (status) status = database.execute(kTablesSinceVersion2);
+    return status ? database.execute(kTakeOverVersion1) : status;
+}
+
 }  // namespace
 
 Status createDeviceSchema(Database& database) {
@@ -293,12 +314,14 @@ Result<bool> isOfFormerSchema(Database& database) {
 }
 
 Status bringSchemaUpToDate(Database& database) {
-    const Result<bool> isFormer = isOfFormerSchema(database);
-    if (!isFormer) return isFormer.error();
-    if (!*isFormer) return {};
-    Status status = database.execute(kSetVersion1Aside);
-    if (status) status = database.execute(kTablesOfVersion2);
-    return status ? database.execute(kTakeOverVersion1) : status;
+    const Result<std::int64_t> version = database.integer("PRAGMA user_version");
+    if (!version) return version.error();
+    Status status;
+    if (*version < 2) status = leaveVersion1(database);
+    if (status && *version < 3) status = database.execute(kTablesSinceVersion3);
+    if (!status || *version == kDeviceSchemaVersion) return status;
+    const std::string mark = "PRAGMA user_version = " + std::to_string(kDeviceSchemaVersion);
+    return database.execute(mark.c_str());
 }
 
 Status checkDeviceDatabase(Database& database) {

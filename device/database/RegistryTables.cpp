@@ -1,6 +1,7 @@
 #include "device/database/RegistryTables.h"
 
 #include "device/database/Database.h"
+#include "device/database/KeptTable.h"
 #include "device/values/DevicePaths.h"
 
 namespace appsync {
@@ -61,6 +62,19 @@ std::uint64_t installTypeAfter(const Predecessor& predecessor, const BundleRow& 
     const std::uint64_t type = predecessor.placeholder->installType;
     const bool demoted = type == kInstallTypeDowngrade || type == kInstallTypeIntentionalDowngrade;
     return demoted ? row.installType : type;
+}
+
+// The same version again is no update: what an update has replaced before is kept on.
+Status keepOrFree(Database& database, const Predecessor& predecessor, const BundleRow& row,
+                  FreedContainers& freed) {
+    if (!predecessor.application) return {};
+    const BundleRow& replaced = *predecessor.application;
+    if (replaced.version == row.version) {
+        freed.application = replaced.container;
+        return {};
+    }
+    freed.replaced = replaced.container;
+    return keepReplaced(database, replaced, freed.kept);
 }
 
 // One more than the last arrival of all.
@@ -194,8 +208,8 @@ Status recordInstalled(Database& database, const BundleRow& row, FreedContainers
         return status;
     }
     freed = {};
-    if (predecessor.application) freed.application = predecessor.application->container;
     if (predecessor.placeholder) freed.placeholder = predecessor.placeholder->container;
+    if (Status status = keepOrFree(database, predecessor, row, freed); !status) return status;
     Query insert = database.query(kInsertApplication);
     const Status inserted =
         bindRow(insert, row, typeAfter(predecessor, row), installTypeAfter(predecessor, row)).run();
@@ -220,12 +234,24 @@ Status recordPlaceholder(Database& database, const BundleRow& row, const Placeho
         .run();
 }
 
-Status forgetBundle(Database& database, BundleTable table, const std::string& identifier,
-                    std::string& container) {
+Status forgetApplication(Database& database, const std::string& identifier,
+                         FreedContainers& freed) {
+    const Result<std::optional<BundleRow>> kept = findKept(database, identifier);
+    if (!kept) return kept.error();
+    freed.kept = *kept ? (*kept)->container : "";
+    freed.application.clear();
+    Query rows =
+        database.query("DELETE FROM applications WHERE identifier = ? RETURNING container");
+    rows.bind(identifier);
+    while (rows.next()) freed.application = rows.text(0);
+    return rows.status();
+}
+
+Status forgetPlaceholder(Database& database, const std::string& identifier,
+                         std::string& container) {
     container.clear();
-    Query rows = database.query(
-        either(table, "DELETE FROM applications WHERE identifier = ? RETURNING container",
-               "DELETE FROM placeholders WHERE identifier = ? RETURNING container"));
+    Query rows =
+        database.query("DELETE FROM placeholders WHERE identifier = ? RETURNING container");
     rows.bind(identifier);
     while (rows.next()) container = rows.text(0);
     return rows.status();

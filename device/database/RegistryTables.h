@@ -42,6 +42,10 @@ struct PlaceholderExtras {
 struct FreedContainers {
     std::string application;
     std::string placeholder;
+    /// Of a version that is kept no more.
+    std::string kept;
+    /// No freed one: that of the version that was replaced, and is kept from now on.
+    std::string replaced;
 };
 
 [[nodiscard]] AppProxy proxyOf(const BundleRow& row, BundleTable table);
@@ -67,16 +71,18 @@ struct FreedContainers {
 
 /// Puts an application in, in place of the one that was there, and takes its placeholder away with
 /// all that waited for the install. Type and install type come from what is replaced; the row's
-/// own count where there is nothing.
+/// own count where there is nothing. What is replaced is kept if it is of another version.
 Status recordInstalled(Database& database, const BundleRow& row, FreedContainers& freed);
 
 /// Puts a placeholder in, in place of the one that was there.
 Status recordPlaceholder(Database& database, const BundleRow& row, const PlaceholderExtras& extras,
                          FreedContainers& freed);
 
-/// Takes a row away. `container` gets the name of its container, or becomes empty when there was
-/// none.
-Status forgetBundle(Database& database, BundleTable table, const std::string& identifier,
-                    std::string& container);
+/// Takes the row of an application away, and with it that of the version that is kept of it.
+Status forgetApplication(Database& database, const std::string& identifier, FreedContainers& freed);
+
+/// Takes the row of a placeholder away. `container` gets the name of its container, or becomes
+/// empty when there was none.
+Status forgetPlaceholder(Database& database, const std::string& identifier, std::string& container);
 
 }  // namespace appsync

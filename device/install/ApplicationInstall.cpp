@@ -11,6 +11,7 @@
 #include "device/install/Containers.h"
 #include "device/install/DurabilityBarrier.h"
 #include "device/install/InstallContext.h"
+#include "device/install/KeptBundles.h"
 #include "device/install/ProgressBook.h"
 #include "device/install/RestoreData.h"
 #include "device/package/PackageReader.h"
@@ -62,10 +63,13 @@ Result<NewContainer> unpackDurably(const InstallContext& context, const std::str
                                    PackageReader& reader) {
     const std::shared_ptr<InstallProgressRecord> record = context.progress.record(identifier);
     for (bool again : {true, false}) {
+        makeRoomFor(context, reader.info().unpackedBytes);
         Result<NewContainer> container = context.containers.make();
         if (!container) return container;
         Status status = checkSpace(container->descriptor(), identifier, reader.info());
         if (status) status = unpack(*container, reader, record.get());
+        // Other installs that came at the same time may have taken the room.
+        if (!status && again && makesRoomAfter(context, status.error())) continue;
         if (!status) return status.error();
         status = context.barrier.pass();
         if (status) return container;
@@ -115,8 +119,7 @@ Status commitInstall(const InstallContext& context, const PackageInfo& info,
     if (!committed) return asRegistryStatus(committed);
     container.keep();
     context.progress.forget(info.identifier, kInstallStateFinished);
-    context.containers.remove(freed.application);
-    context.containers.remove(freed.placeholder);
+    putAway(context, freed);
     return {};
 }
 

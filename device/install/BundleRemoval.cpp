@@ -6,6 +6,7 @@
 #include "device/database/RegistryTables.h"
 #include "device/install/Containers.h"
 #include "device/install/InstallContext.h"
+#include "device/install/KeptBundles.h"
 #include "device/install/ProgressBook.h"
 #include "device/install/RestoreData.h"
 #include "device/values/DeviceError.h"
@@ -89,12 +90,10 @@ Status noteUninstalled(Database& database, const std::string& identifier, const 
 Status forget(Database& database, const std::string& identifier, Outcome& outcome) {
     Status status;
     if (outcome.removedPlaceholder) {
-        status = forgetBundle(database, BundleTable::Placeholders, identifier,
-                              outcome.freed.placeholder);
+        status = forgetPlaceholder(database, identifier, outcome.freed.placeholder);
     }
     if (status && outcome.removedApplication) {
-        status = forgetBundle(database, BundleTable::Applications, identifier,
-                              outcome.freed.application);
+        status = forgetApplication(database, identifier, outcome.freed);
     }
     // An install that was to put something here is over, too.
     if (status) status = cancelForRemoval(database, identifier);
@@ -124,11 +123,8 @@ Status removeBundles(const InstallContext& context, const std::string& identifie
         return removeRows(database, identifier, removal, outcome);
     });
     if (!committed) return asRegistryStatus(committed);
-    if (outcome.removedPlaceholder) {
-        context.progress.forget(identifier, kInstallStateCanceled);
-        context.containers.remove(outcome.freed.placeholder);
-    }
-    if (outcome.removedApplication) context.containers.remove(outcome.freed.application);
+    if (outcome.removedPlaceholder) context.progress.forget(identifier, kInstallStateCanceled);
+    putAway(context, outcome.freed);
     if (outcome.dataGoes()) {
         const bool isKept = context.keepsData && removal != Removal::Everything;
         if (!isKept) context.files.removeItem(dataDirectoryOf(identifier)).ignore();

@@ -50,6 +50,12 @@ NewContainer::~NewContainer() {
     if (!kept_ && !name_.empty()) Containers(files_).remove(name_);
 }
 
+bool isSingleName(std::string_view name) noexcept {
+    constexpr std::string_view kForbidden("/\0", 2);
+    return !name.empty() && name.find_first_of(kForbidden) == name.npos && name != "." &&
+           name != "..";
+}
+
 Result<NewContainer> Containers::make() {
     const std::string name = makeUuid();
     const std::string path = containerPath(name);
@@ -67,9 +73,7 @@ Result<NewContainer> Containers::make() {
 }
 
 void Containers::remove(const std::string& name) {
-    // Out of a database that somebody has altered it could be the path of anything.
-    const bool isPlain = name.find('/') == name.npos && name != "." && name != "..";
-    if (isPlain && !name.empty()) files_.removeItem(containerPath(name)).ignore();
+    if (isSingleName(name)) files_.removeItem(containerPath(name)).ignore();
 }
 
 Result<std::vector<std::string>> Containers::names() const {

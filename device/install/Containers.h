@@ -2,6 +2,7 @@
 
 #include <cstdint>
 #include <string>
+#include <string_view>
 #include <vector>
 
 #include "platform/Result.h"
@@ -33,6 +34,10 @@ class NewContainer {
     UniqueFd directory_;
     bool kept_ = false;
 };
+
+/// Whether a name is that of one thing in a directory, as those of containers and bundles are. Out
+/// of a database that somebody has altered it could be the path of anything.
+[[nodiscard]] bool isSingleName(std::string_view name) noexcept;
 
 /// The containers of bundles on disk: directories with names that never come twice. Callable on any
 /// thread.

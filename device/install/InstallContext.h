@@ -6,9 +6,11 @@
 //     ApplicationInstall.h   a package becomes an application, with RestoreData.h that of a backup
 //     PlaceholderInstall.h   a bundle becomes a placeholder
 //     BundleRemoval.h        what goes, and what stays
+//     Rollback.h             the version before an update comes back
 //
-// They share Containers.h (the directories of bundles), DurabilityBarrier.h (syncs that threads
-// share) and ProgressBook.h (how far each install is).
+// They share Containers.h (the directories of bundles), KeptBundles.h (those of versions that were
+// replaced), DurabilityBarrier.h (syncs that threads share) and ProgressBook.h (how far each
+// install is).
 //
 // After a crash or a session that was cut off, Reconciliation.h and CoordinationRecovery.h remove
 // what neither database nor disk can account for (docs/device-format.md). Who may call it when is
@@ -26,6 +28,7 @@ class Containers;
 class Database;
 class DeviceDatabase;
 class DurabilityBarrier;
+class KeptBundles;
 class ProgressBook;
 class PropertyListSerialization;
 class RootedFileSystem;
@@ -35,6 +38,7 @@ struct InstallContext {
     DeviceDatabase& database;
     RootedFileSystem& files;
     Containers& containers;
+    KeptBundles& kept;
     DurabilityBarrier& barrier;
     ProgressBook& progress;
     PropertyListSerialization& propertyLists;

@@ -11,6 +11,7 @@
 #include "device/install/Containers.h"
 #include "device/install/DurabilityBarrier.h"
 #include "device/install/InstallContext.h"
+#include "device/install/KeptBundles.h"
 #include "device/install/ProgressBook.h"
 #include "device/screen/IconDrawing.h"
 #include "device/values/DeviceError.h"
@@ -335,11 +336,11 @@ Status demoteApplication(const InstallContext& context, const std::string& ident
         Status status = requireNotRunning(database, identifier);  // somebody may have started it
         if (status) status = recordPlaceholder(database, row, {}, freed);
         if (!status) return status;
-        return forgetBundle(database, BundleTable::Applications, identifier, freed.application);
+        return forgetApplication(database, identifier, freed);
     });
     if (!committed) return asRegistryStatus(committed);
     container->keep();
-    context.containers.remove(freed.application);
+    putAway(context, freed);
     return {};
 }
 

@@ -8,11 +8,13 @@
 
 #include "device/database/Database.h"
 #include "device/database/DeviceDatabase.h"
+#include "device/database/KeptTable.h"
 #include "device/database/RegistryTables.h"
 #include "device/install/Containers.h"
 #include "device/install/CoordinationRecovery.h"
 #include "device/install/DurabilityBarrier.h"
 #include "device/install/InstallContext.h"
+#include "device/install/KeptBundles.h"
 #include "device/install/RestoreData.h"
 #include "device/values/DevicePaths.h"
 #include "device/values/PackageIdentifier.h"
@@ -91,6 +93,55 @@ Status noteLost(Database& database, const std::string& identifier) {
         .run();
 }
 
+/// The versions that are kept for a rollback, after the records of all others.
+class KeptComparison {
+  public:
+    KeptComparison(const InstallContext& context, const std::unordered_set<std::string>& bundles,
+                   const std::unordered_set<std::string>& recorded)
+        : context_(context), bundles_(bundles), recorded_(recorded) {}
+
+    Status run() {
+        if (Status status = gather(); !status) return status;
+        std::vector<std::string> lost;
+        for (const std::string& container : kept_) {
+            if (onDisk_.erase(container) == 0 && !putInPlace(container)) lost.push_back(container);
+        }
+        for (const std::string& name : onDisk_) context_.kept.remove(name);
+        if (lost.empty()) return {};
+        return context_.database.change(Durability::Soon, [&](Database& database) -> Status {
+            for (const std::string& container : lost) {
+                if (Status status = forgetKept(database, container); !status) return status;
+            }
+            return {};
+        });
+    }
+
+  private:
+    Status gather() {
+        const Result<std::vector<std::string>> names = context_.kept.names();
+        if (!names) return names.error();
+        onDisk_.insert(names->begin(), names->end());
+        return context_.database.read([this](Database& database) -> Status {
+            const Result<std::vector<BundleRow>> rows = allKept(database);
+            if (!rows) return rows.error();
+            for (const BundleRow& row : *rows) kept_.push_back(row.container);
+            return {};
+        });
+    }
+
+    // Whoever was to put it there did not come to that.
+    bool putInPlace(const std::string& container) {
+        const bool isStray = bundles_.contains(container) && !recorded_.contains(container);
+        return isStray && context_.kept.keep(container);
+    }
+
+    const InstallContext& context_;
+    const std::unordered_set<std::string>& bundles_;
+    const std::unordered_set<std::string>& recorded_;
+    std::unordered_set<std::string> onDisk_;
+    std::vector<std::string> kept_;
+};
+
 /// What database and disk hold, and what of it fits together.
 class Comparison {
   public:
@@ -99,6 +150,9 @@ class Comparison {
     Status run() {
         if (Status status = gather(); !status) return status;
         if (Status status = forgetLostRecords(); !status) return status;
+        if (Status status = KeptComparison(context_, onDisk_, recorded_).run(); !status) {
+            return status;
+        }
         for (const std::string& name : onDisk_) {
             if (!recorded_.contains(name)) context_.containers.remove(name);
         }
@@ -142,14 +196,13 @@ class Comparison {
 
     Status forgetIn(Database& database) {
         std::string container;
+        FreedContainers freed;
         for (const std::string& identifier : lostPlaceholders_) {
-            const Status status =
-                forgetBundle(database, BundleTable::Placeholders, identifier, container);
+            const Status status = forgetPlaceholder(database, identifier, container);
             if (!status) return status;
         }
         for (const std::string& identifier : lostApplications_) {
-            Status status =
-                forgetBundle(database, BundleTable::Applications, identifier, container);
+            Status status = forgetApplication(database, identifier, freed);
             if (status) status = noteLost(database, identifier);
             if (!status) return status;
         }

@@ -8,6 +8,7 @@
 #include "device/install/BundleRemoval.h"
 #include "device/install/DurabilityBarrier.h"
 #include "device/install/InstallContext.h"
+#include "device/install/KeptBundles.h"
 #include "device/package/DataArchive.h"
 #include "device/values/DeviceError.h"
 #include "device/values/DevicePaths.h"
@@ -38,6 +39,14 @@ Status fillAnew(const InstallContext& context, const std::string& directory, con
     return opened ? fill(opened->get()) : Status(opened.error());
 }
 
+// What updates have replaced is kept only as long as nothing else needs the room.
+Status fillWithRoom(const InstallContext& context, const std::string& directory,
+                    const DataFill& fill) {
+    Status status = fillAnew(context, directory, fill);
+    if (status || !makesRoomAfter(context, status.error())) return status;
+    return fillAnew(context, directory, fill);
+}
+
 Status replaceData(const InstallContext& context, const std::string& from, const std::string& to) {
     Status status = context.files.createDirectory(std::string(kDataDirectory), true, nullptr);
     if (status) status = removeIfThere(context, to);
@@ -55,7 +64,7 @@ Status placeRestoredData(const InstallContext& context, const std::string& ident
     const Result<RegularFile> archive = context.files.root().openRegularFile(path);
     if (!archive) return archive.error().code == ENOENT ? Status() : Status(archive.error());
     const std::string unpacked = placeOfNewData(identifier);
-    Status status = fillAnew(context, unpacked, [&](int directory) {
+    Status status = fillWithRoom(context, unpacked, [&](int directory) {
         return unpackDataArchive(archive->descriptor.get(), archiveNameOf(identifier), directory);
     });
     if (status) status = replaceData(context, unpacked, dataDirectoryOf(identifier));
@@ -123,7 +132,7 @@ Status replaceDataWith(const InstallContext& context, const std::string& identif
     if (Status status = checkDataReplaceable(context, identifier); !status) return status;
     const std::string made = placeOfNewData(identifier);
     const std::string place = dataDirectoryOf(identifier);
-    Status status = fillAnew(context, made, fill);
+    Status status = fillWithRoom(context, made, fill);
     if (status) status = context.barrier.pass();
     if (status) {
         // In a transaction: nobody can begin to run it, or uninstall it, between look and exchange.

@@ -35,6 +35,7 @@ enum class RegistryErrorCode : std::int64_t {
     DatabaseFailed = 8,      // the registry's own database failed
     Uninstalled = 9,         // a person uninstalled it while its install was under way
     Running = 10,            // it runs, and its termination is denied
+    NothingKept = 11,        // no earlier version of it is kept
 };
 
 /// Domain of errors of a device's coordination service.

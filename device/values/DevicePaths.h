@@ -10,6 +10,8 @@ namespace appsync {
 inline constexpr std::string_view kDatabaseName = "device.db";
 inline constexpr std::string_view kRootName = "root";
 inline constexpr std::string_view kReserveName = "space.reserve";
+// The containers of versions that a rollback brings back.
+inline constexpr std::string_view kKeptDirectoryName = "kept";
 inline constexpr std::string_view kLogDirectoryName = "log";
 inline constexpr std::string_view kLogName = "log/system.log";
 

@@ -37,6 +37,18 @@ struct InstallProgress {
     [[nodiscard]] double fraction() const noexcept;
 };
 
+/// A version that an update has replaced and that a rollback brings back.
+struct KeptVersion {
+    std::optional<std::string> version;
+    std::uint64_t bytes = 0;
+};
+
+/// What a rollback has done.
+struct RollbackRecord {
+    std::optional<std::string> oldVersion;  // that was installed
+    std::optional<std::string> newVersion;  // that is
+};
+
 /// One installed application, or one placeholder. An update under way has a record of each.
 struct ApplicationRecord {
     std::string identifier;
@@ -51,6 +63,8 @@ struct ApplicationRecord {
     std::uint64_t bytes = 0;
     /// Of a placeholder whose install is under way.
     std::optional<InstallProgress> progress;
+    /// Of an application: what its last update has replaced, while that is kept.
+    std::optional<KeptVersion> kept;
 };
 
 /// What a person or a manager has set.

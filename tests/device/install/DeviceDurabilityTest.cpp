@@ -8,6 +8,7 @@
 #include "device/install/Containers.h"
 #include "device/install/DurabilityBarrier.h"
 #include "device/install/InstallContext.h"
+#include "device/install/KeptBundles.h"
 #include "device/install/ProgressBook.h"
 #include "device/values/DevicePaths.h"
 #include "system/RootedFileSystem.h"
@@ -79,11 +80,12 @@ class FailingDiskTest : public DeviceFixture {
         auto database = DeviceDatabase::open(devicePath(kDatabaseName));
         auto files = RootedFileSystem::open(rootPath(""), {{}, std::string(kTemporaryDirectory)});
         Containers containers(**files);
+        KeptBundles kept(**files, devicePath());
         ProgressBook progress(**database, {});
         SystemPropertyLists propertyLists;
         const std::string boot;
-        const InstallContext context{**database, **files,       containers, barrier,
-                                     progress,   propertyLists, boot};
+        const InstallContext context{**database, **files,  containers,    kept,
+                                     barrier,    progress, propertyLists, boot};
         const std::string package = std::string(kPublicStagingDirectory) + "/package.zip";
         write(package, packageOf(kAtlas, "2.0"));
         return installApplication(context, kAtlas, *FileURL::fromPath(package, false), 0);
