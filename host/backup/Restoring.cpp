@@ -184,6 +184,7 @@ class Restoring {
         const Result<std::uint64_t> free = device_.freeSpace();
         if (!free || data_.empty()) return {};  // what fails then is named alone
         const std::uint64_t needed = bytesNeededFor(data_, device_);
+        device_.makeRoom(needed <= *free ? needed : 0);
         if (needed <= *free) return {};
         return lackOfSpace("the data of all applications together", needed, *free,
                            "nothing is restored; free space on the device and restore again");

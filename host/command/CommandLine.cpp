@@ -427,6 +427,8 @@ class Commands {
         addAction("quit", "Mark it as not running any more", runQuit);
         addAction("uninstall", "Remove an application as a person does on the device",
                   runUninstall);
+        addAction("rollback", "Bring back what an application's last update has replaced",
+                  runRollback);
         const auto reset = std::make_shared<DeviceValues>();
         CLI::App& added = deviceCommand("reset", "Make the device forget what it keeps for syncing",
                                         reset, [this](const DeviceValues& parsed) {

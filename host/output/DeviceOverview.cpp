@@ -70,6 +70,13 @@ std::string spaceLine(const DeviceOverview& overview) {
                 : ", and " + formatBytes(overview.reserve) + " kept back for a full disk");
 }
 
+// Most devices have none.
+std::string keptLine(const DeviceOverview& overview) {
+    if (overview.kept == 0) return "";
+    return "\nkept versions: " + std::to_string(overview.kept) + ", " +
+           formatBytes(overview.keptBytes) + " of the free space, until that is needed";
+}
+
 std::string applicationsLine(const DeviceOverview& overview) {
     return std::to_string(overview.installed) + " installed, " +
            std::to_string(overview.offloaded) + " offloaded, " + std::to_string(overview.restored) +
@@ -79,6 +86,10 @@ std::string applicationsLine(const DeviceOverview& overview) {
 }  // namespace
 
 void count(DeviceOverview& overview, const ApplicationRecord& record) {
+    if (record.kept) {
+        ++overview.kept;
+        overview.keptBytes += record.kept->bytes;
+    }
     if (!record.isPlaceholder) {
         ++overview.installed;
         return;
@@ -105,7 +116,7 @@ std::string overviewText(const DeviceOverview& overview) {
            "\nrunning:       " + runningLine(overview.running) +
            "\nsession:       " + sessionLine(overview.session) +
            "\nstaging area:  " + stagedLine(overview.staged) +
-           "\nfree space:    " + spaceLine(overview) + "\n";
+           "\nfree space:    " + spaceLine(overview) + keptLine(overview) + "\n";
 }
 
 std::string jsonText(const DeviceOverview& overview) {
@@ -124,7 +135,9 @@ std::string jsonText(const DeviceOverview& overview) {
                      {"process", process ? Json(*process) : Json()},
                      {"staged", stagedText(overview.staged)},
                      {"free", overview.free},
-                     {"reserve", overview.reserve}});
+                     {"reserve", overview.reserve},
+                     {"kept", overview.kept},
+                     {"keptBytes", overview.keptBytes}});
 }
 
 }  // namespace appsync

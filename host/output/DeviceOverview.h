@@ -24,6 +24,9 @@ struct DeviceOverview {
     StagedWork staged = StagedWork::None;
     std::uint64_t free = 0;
     std::uint64_t reserve = 0;
+    /// The versions that are kept for a rollback, and what they take of the free space.
+    std::size_t kept = 0;
+    std::uint64_t keptBytes = 0;
 };
 
 /// Counts an application or a placeholder.

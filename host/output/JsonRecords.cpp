@@ -24,6 +24,10 @@ Json orNull(const std::optional<Value>& value) {
     return value ? Json(*value) : Json();
 }
 
+Json jsonOf(const KeptVersion& kept) {
+    return {{"version", orNull(kept.version)}, {"bytes", kept.bytes}};
+}
+
 Json jsonOf(const ApplicationRecord& record) {
     return {{"identifier", record.identifier},
             {"version", orNull(record.version)},
@@ -33,7 +37,8 @@ Json jsonOf(const ApplicationRecord& record) {
             {"type", record.type},
             {"installType", record.installType},
             {"container", record.container},
-            {"bytes", record.bytes}};
+            {"bytes", record.bytes},
+            {"kept", record.kept ? jsonOf(*record.kept) : Json()}};
 }
 
 Json jsonOf(const HistoryRecord& record) {

@@ -1,5 +1,6 @@
 #include "host/plan/SyncPreparation.h"
 
+#include <algorithm>
 #include <optional>
 #include <set>
 #include <string>
@@ -117,6 +118,11 @@ class Preparing {
     SyncPreparation sync_;
 };
 
+// What removals give back is there by the time that the first package comes.
+void makeRoomFor(Device& device, const SpaceCheck& space) {
+    device.makeRoom(space.needed - std::min(space.needed, space.reclaimed));
+}
+
 Status removeLeftovers(Device& device, const StandingInstalls& standing) {
     const Status cancelled = cancelObsolete(device, standing);
     if (!cancelled) return unusable(cancelled.error());
@@ -154,6 +160,7 @@ Result<SyncPreparation> prepareStagedSync(Device& device, const Library& library
 
 Status clearTheWay(Device& device, const SyncPreparation& sync, const Library& library,
                    const StepProgress& progress) {
+    makeRoomFor(device, sync.space);
     Status status = removeLeftovers(device, sync.standing);
     if (!status) return status;
     status = removeStaleTransfers(device, sync.standing.arrived);
@@ -162,6 +169,7 @@ Status clearTheWay(Device& device, const SyncPreparation& sync, const Library& l
 }
 
 Status clearTheWayForStaged(Device& device, SyncPreparation& sync) {
+    makeRoomFor(device, sync.space);
     Status status = removeLeftovers(device, sync.standing);
     if (!status) return status;
     status = removeStaleTransfers(device, sync.standing.arrived);

@@ -19,7 +19,7 @@ def test_an_empty_device(appsync, device):
     assert status == {
         "installation": "unset", "removal": "unset", "coordination": device.coordination, "installed": 0,
         "offloaded": 0, "restored": 0, "arriving": 0, "running": [], "session": "none", "process": None,
-        "staged": "none"}
+        "staged": "none", "kept": 0, "keptBytes": 0}
     shown = appsync("status", device.path).stdout
     assert len(shown.splitlines()) <= 15 and "256.0 KiB kept back" in shown
     os.remove(os.path.join(device.path, "space.reserve"))

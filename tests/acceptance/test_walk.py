@@ -103,6 +103,15 @@ class Walk:
     def demote(self, identifier):
         self.run("demote", self.device.path, identifier, "--by", self.numbers.choice(["person", "system"]))
 
+    def roll_back(self, identifier):
+        before = {app["identifier"]: app for app in self.json("apps", self.device.path) if app["state"] == "installed"}
+        done = self.run("rollback", self.device.path, identifier)
+        if done.returncode != 0:
+            return
+        after = self.device.apps()
+        assert after[identifier]["version"] == before[identifier]["kept"]["version"], self.done
+        assert after[identifier]["kept"]["version"] == before[identifier]["version"], self.done
+
     def change_settings(self, identifier):
         name = self.numbers.choice(["installation", "removal", "coordination"])
         values = ["on", "off"] if name == "coordination" else ["yes", "no", "unset"]
@@ -165,6 +174,9 @@ class Walk:
         folders = os.path.join(self.device.path, CONTAINERS)
         there = set(os.listdir(folders)) if os.path.isdir(folders) else set()
         assert there == {os.path.basename(app["container"]) for app in apps if app["container"]}, self.done
+        folder = os.path.join(self.device.path, "kept")
+        kept = os.listdir(folder) if os.path.isdir(folder) else []
+        assert len(kept) == len([app for app in apps if app["kept"]]) == status["kept"], self.done
         for identifier in {app["identifier"] for app in apps}:
             # An update's placeholder covers what is installed.
             shown = sorted(app["state"] for app in apps if app["identifier"] == identifier)
@@ -178,7 +190,7 @@ class Walk:
 
 ACTIONS = (
     ["sync"] * 8 + ["release"] * 5 + ["withdraw"] * 2 + ["stage"] * 2 + ["start", "stop", "stop", "uninstall"] + ["demote"] * 2
-    + ["change_settings"] * 2 + ["allow"] * 2 + ["send", "play_client", "back_up_and_restore", "store", "reset"]
+    + ["roll_back"] * 3 + ["change_settings"] * 2 + ["allow"] * 2 + ["send", "play_client", "back_up_and_restore", "store", "reset"]
     + ["exchange_data"] * 2 + ["look"]
 )
 # Nothing else may lose data.

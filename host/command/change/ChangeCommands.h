@@ -25,6 +25,7 @@ struct ApplicationArguments {
 [[nodiscard]] int runRun(const ApplicationArguments& arguments, const Console& console);
 [[nodiscard]] int runQuit(const ApplicationArguments& arguments, const Console& console);
 [[nodiscard]] int runUninstall(const ApplicationArguments& arguments, const Console& console);
+[[nodiscard]] int runRollback(const ApplicationArguments& arguments, const Console& console);
 [[nodiscard]] int runDemote(const ApplicationArguments& arguments, bool bySystem,
                             const Console& console);
 [[nodiscard]] int runReset(const std::string& device, bool asJson, const Console& console);

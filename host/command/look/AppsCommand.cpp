@@ -1,4 +1,8 @@
+#include <algorithm>
 #include <ostream>
+#include <string>
+#include <utility>
+#include <vector>
 
 #include "device/Device.h"
 #include "host/command/argument/OpenDevice.h"
@@ -22,10 +26,21 @@ std::string stateText(const ApplicationRecord& record) {
 
 std::string applicationsTable(const std::vector<ApplicationRecord>& records,
                               const Console& console) {
-    Table table({"IDENTIFIER", "VERSION", "NAME", "STATE", "TYPE", "SIZE"});
+    std::vector<std::string> titles{"IDENTIFIER", "VERSION", "NAME", "STATE", "TYPE", "SIZE"};
+    const bool anyKept =
+        std::any_of(records.begin(), records.end(),
+                    [](const ApplicationRecord& record) { return record.kept.has_value(); });
+    if (anyKept) titles.emplace_back("KEPT");
+    Table table(std::move(titles));
     for (const ApplicationRecord& record : records) {
-        table.add({record.identifier, record.version.value_or("-"), record.name.value_or("-"),
-                   stateText(record), record.type, formatBytes(record.bytes)});
+        std::vector<std::string> cells{record.identifier,
+                                       record.version.value_or("-"),
+                                       record.name.value_or("-"),
+                                       stateText(record),
+                                       record.type,
+                                       formatBytes(record.bytes)};
+        if (anyKept) cells.push_back(record.kept ? record.kept->version.value_or("-") : "");
+        table.add(std::move(cells));
     }
     if (console.isTerminal) table.fitInto(console.width);
     return records.empty() ? "No applications.\n" : table.text();

@@ -200,8 +200,9 @@ class Sending {
                 PackageReader::open(arguments_.file, device_->propertyLists());
             if (package) needed += bytesOnDevice(package->info());
         }
-        return needed <= *free ? Status()
-                               : lackOfSpace("it", needed, *free, "free space on the device");
+        if (needed > *free) return lackOfSpace("it", needed, *free, "free space on the device");
+        device_->makeRoom(needed);
+        return {};
     }
 
     // Nothing is sent. A device that cannot be used is an error, not a failure of this package.

@@ -145,10 +145,10 @@ TEST_P(EachCommand, HasHelp) {
 INSTANTIATE_TEST_SUITE_P(Help, EachCommand,
                          testing::Values("", "create", "sync", "plan", "stage", "apps", "screen",
                                          "why", "inventory", "set", "run", "quit", "uninstall",
-                                         "reset", "log", "history", "status", "coordinator",
-                                         "demote", "backup", "restore", "store", "send", "package",
-                                         "package make", "package show", "plist", "plist show",
-                                         "plist convert"));
+                                         "reset", "rollback", "log", "history", "status",
+                                         "coordinator", "demote", "backup", "restore", "store",
+                                         "send", "package", "package make", "package show", "plist",
+                                         "plist show", "plist convert"));
 
 INSTANTIATE_TEST_SUITE_P(HelpWithoutASession, EachCommand,
                          testing::Values("package list", "package verify", "data", "data ls",

@@ -1,0 +1,182 @@
+"""What the last update of an application has replaced comes back."""
+
+import os
+import shutil
+
+import pytest
+
+import packages
+from conftest import ON_ONE_PATH, Device
+
+A, B = "com.example.orbit", "com.example.atlas"
+BUNDLE = "Orbit.app"
+
+
+@pytest.fixture
+def libraries(tmp_path):
+    """A library with the versions before, and one with those of today."""
+    old, new = str(tmp_path / "old"), str(tmp_path / "new")
+    for folder, version in ((old, "1.9"), (new, "2.0")):
+        packages.make_package(folder, A, version, payload=b"program of " + version.encode())
+        packages.make_package(folder, B, "1.0")
+    return old, new
+
+
+@pytest.fixture
+def updated(device, libraries):
+    for library in libraries:
+        device.sync(library)
+    return device
+
+
+def program(device):
+    with open(os.path.join(device.container_of(A), BUNDLE, "Resources/data.bin"), "rb") as file:
+        return file.read()
+
+
+def kept(device, identifier=A):
+    return device.apps()[identifier]["kept"]
+
+
+def kept_folders(device):
+    folder = os.path.join(device.path, "kept")
+    return os.listdir(folder) if os.path.isdir(folder) else []
+
+
+def containers(device):
+    return os.listdir(device.inside("/var/containers/Bundle/Application"))
+
+
+def test_an_update_is_undone_and_done_again(appsync, updated, libraries):
+    said = appsync("rollback", updated.path, A).stdout
+    assert said == (A + " is rolled back from 2.0 to 1.9; its data stays as it is, and a sync of a library with 2.0 "
+                    "updates it again\n")
+    assert updated.versions() == {A: "1.9", B: "1.0"} and program(updated) == b"program of 1.9"
+    assert kept(updated)["version"] == "2.0"
+    plan = appsync.json("plan", updated.path, libraries[1])
+    assert [(each["identifier"], each["oldVersion"], each["newVersion"]) for each in plan["update"]] == [(A, "1.9", "2.0")]
+    assert updated.sync(libraries[1])["updated"] == [A]
+    assert program(updated) == b"program of 2.0" and kept(updated)["version"] == "1.9"
+
+
+def test_a_rollback_is_undone_by_a_second_one(appsync, updated):
+    assert appsync.json("rollback", updated.path, A) == {
+        "identifier": A, "state": "rolled back", "changed": True, "oldVersion": "2.0", "newVersion": "1.9"}
+    assert appsync.json("rollback", updated.path, A)["newVersion"] == "2.0"
+    assert program(updated) == b"program of 2.0"
+    assert len(containers(updated)) == 2 and len(kept_folders(updated)) == 1
+
+
+def test_what_is_kept_is_told(appsync, updated):
+    apps = updated.apps()
+    assert apps[B]["kept"] is None
+    assert apps[A]["kept"]["version"] == "1.9" and apps[A]["kept"]["bytes"] > 0
+    lines = appsync("apps", updated.path).stdout.splitlines()
+    assert lines[0].endswith("KEPT") and any(line.startswith(A) and line.endswith("1.9") for line in lines)
+    status = appsync.json("status", updated.path)
+    assert (status["kept"], status["keptBytes"]) == (1, apps[A]["kept"]["bytes"])
+    assert "kept versions: 1, " in appsync("status", updated.path).stdout
+
+
+def test_nothing_is_said_where_nothing_is_kept(appsync, device, libraries):
+    device.sync(libraries[0])
+    assert "KEPT" not in appsync("apps", device.path).stdout
+    assert "kept versions" not in appsync("status", device.path).stdout
+    done = appsync("rollback", device.path, A, expect=1)
+    assert done.stdout == "" and "no earlier version of " + A + " is kept" in done.stderr
+    assert "is not installed" in appsync("rollback", device.path, "com.example.nobody", expect=1).stderr
+    appsync("rollback", device.path, "../up", expect=2)
+
+
+def test_the_data_stays_and_the_rest_tells_the_truth(appsync, updated, tmp_path):
+    data = updated.inside("/var/mobile/Containers/Data/" + A)
+    os.makedirs(data, exist_ok=True)
+    with open(os.path.join(data, "notes"), "w") as file:
+        file.write("written with 2.0")
+    before = appsync.json("inventory", updated.path)
+    appsync("rollback", updated.path, A)
+    with open(os.path.join(data, "notes")) as file:
+        assert file.read() == "written with 2.0"
+    assert appsync.json("inventory", updated.path) == before  # both versions are as large
+    assert appsync.json("why", updated.path, A)["state"] == "installed"
+    last = appsync.json("history", updated.path, "--app", A)[-1]
+    assert (last["scenario"], last["success"], last["description"]) == ("Rollback", True, "Rolled back from 2.0 to 1.9")
+    appsync("screen", updated.path, tmp_path / "screen.png")
+
+
+def test_an_application_that_runs_is_not_rolled_back(appsync, updated):
+    appsync("run", updated.path, A)
+    assert "is running; quit it" in appsync("rollback", updated.path, A, expect=1).stderr
+    assert updated.versions()[A] == "2.0"
+    appsync("quit", updated.path, A)
+    appsync("rollback", updated.path, A)
+
+
+def test_a_session_has_the_device_for_itself(appsync, updated, libraries):
+    packages.make_package(libraries[1], B, "2.0")
+    appsync("run", updated.path, B)
+    process = appsync.start("sync", updated.path, libraries[1])
+    for line in process.stdout:
+        if "waiting" in line:
+            break
+    assert "in use" in appsync("rollback", updated.path, A, expect=3).stderr
+    appsync("quit", updated.path, B)
+    assert process.wait(60) == 0
+
+
+@pytest.mark.parametrize("words", [["uninstall"], ["demote"]])
+def test_what_is_kept_goes_with_the_application(appsync, updated, words):
+    appsync(*words, updated.path, A)
+    assert kept_folders(updated) == []
+    assert appsync.json("status", updated.path)["kept"] == 0
+
+
+def test_a_sync_that_removes_the_application_takes_what_is_kept(updated, libraries):
+    updated.sync(libraries[1], "--remove", A)
+    assert kept_folders(updated) == [] and len(containers(updated)) == 1
+
+
+def test_an_interrupted_update_is_finished_before_another_is_undone(appsync, updated, libraries):
+    packages.make_package(libraries[1], A, "3.0")
+    appsync("run", updated.path, A)
+    process = appsync.start("sync", updated.path, libraries[1])
+    for line in process.stdout:
+        if "waiting" in line:
+            break
+    process.kill()
+    process.wait()
+    appsync("quit", updated.path, A)
+    done = appsync("rollback", updated.path, A, expect=None)
+    if done.returncode != 0:
+        assert "an update of " + A + " is under way" in done.stderr
+    updated.sync(libraries[1])
+    assert updated.versions()[A] == "3.0"
+    appsync("rollback", updated.path, A)
+
+
+@ON_ONE_PATH
+def test_junk_beside_what_is_kept_is_cleared_and_links_lead_nowhere(appsync, updated, libraries, tmp_path):
+    outside = tmp_path / "outside"
+    outside.mkdir()
+    (outside / "file").write_text("not the device's")
+    folder = os.path.join(updated.path, "kept")
+    os.symlink(outside, os.path.join(folder, "LINK"))
+    os.makedirs(os.path.join(folder, "JUNK", "deep"))
+    os.symlink(outside, os.path.join(folder, "JUNK", "deep", "link"))
+    updated.sync(libraries[1])
+    assert len(kept_folders(updated)) == 1 and (outside / "file").exists()
+    appsync("rollback", updated.path, A)
+    # The directory itself is a link.
+    shutil.rmtree(folder)
+    os.symlink(outside, folder)
+    updated.sync(libraries[1])
+    assert "no earlier version" in appsync("rollback", updated.path, A, expect=1).stderr
+    assert os.listdir(outside) == ["file"] and updated.versions()[A] == "2.0"
+
+
+@ON_ONE_PATH
+def test_a_backup_has_nothing_of_it(appsync, updated, tmp_path, coordination):
+    appsync("backup", updated.path, tmp_path / "with")
+    fresh = Device(appsync, tmp_path / "fresh", coordination)
+    appsync("restore", fresh.path, tmp_path / "with")
+    assert kept_folders(fresh) == [] and appsync.json("status", fresh.path)["kept"] == 0
