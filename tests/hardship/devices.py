@@ -201,11 +201,63 @@ class Push(Scenario):
         super().check(expected, kept)
 
 
+class Rollback(Scenario):
+    """An update is undone, of an application of which an earlier version is kept."""
+
+    def prepare(self):
+        device = acceptance.Device(self.appsync, self.base, self.coordination)
+        library = os.path.join(self.folder, "library")
+        for version in ("1.0", "2.0"):
+            packages.make_package(library, UPDATED, version)
+            packages.make_package(library, STAYS)
+            device.sync(library)
+
+    def command(self):
+        return ["rollback", self.device, UPDATED]
+
+    def versions(self):
+        (app,) = [app for app in self.appsync.json("apps", self.device) if app["identifier"] == UPDATED]
+        return app["version"], app["kept"] and app["kept"]["version"]
+
+    def expected(self):
+        self.fresh()
+        self.again()
+        return look_at(self.device)
+
+    def check(self, expected, kept=lambda seen: seen):
+        """One of the two is installed, whole, and the other is kept; each rollback exchanges them."""
+        check_intact(self.appsync, self.device)
+        before = self.versions()
+        assert before in (("2.0", "1.0"), ("1.0", "2.0")), before
+        self.again()
+        assert self.versions() == before[::-1]
+        check_kept(self.device)
+        self.again()
+        assert self.versions() == before
+        check_kept(self.device)
+
+
+def check_kept(device):
+    """The containers that records name are there, each in its place with its program, and no others."""
+    database = sqlite3.connect(os.path.join(device, "device.db"))
+    try:
+        for table, folder in (("applications", "root/var/containers/Bundle/Application"), ("kept", "kept")):
+            rows = database.execute("SELECT container, bundle, version FROM " + table).fetchall()
+            top = os.path.join(device, folder)
+            assert sorted(os.listdir(top)) == sorted(container for container, _, _ in rows), table
+            for container, bundle, version in rows:
+                with open(os.path.join(top, container, bundle, "Info.plist"), "rb") as file:
+                    assert plistlib.load(file)["BundleVersion"] == version
+    finally:
+        database.close()
+
+
 SCENARIOS = {
     "sync": lambda appsync, folder: Sync(appsync, folder, "off"),
     "coordinated-sync": lambda appsync, folder: Sync(appsync, folder, "on"),
     "restore": lambda appsync, folder: Restore(appsync, folder, "off"),
     "coordinated-restore": lambda appsync, folder: Restore(appsync, folder, "on"),
+    "rollback": lambda appsync, folder: Rollback(appsync, folder, "off"),
     "data-push": lambda appsync, folder: Push(appsync, folder, "off"),
 }
 
@@ -227,7 +279,7 @@ def look_at(device):
     database.row_factory = sqlite3.Row
     try:
         owners = {}
-        for table in ("applications", "placeholders"):
+        for table in ("applications", "placeholders", "kept"):
             for row in database.execute("SELECT identifier, container FROM " + table):
                 owners[row["container"]] = "<%s of %s>" % (table, row["identifier"])
         return {"tables": rows_of(database), "tree": tree_of(device, owners)}

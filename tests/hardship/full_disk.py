@@ -1,8 +1,9 @@
 """What test_full_disk.py runs in a mount namespace of its own, where DISK is a small disk.
 
-    full_disk.py grow|look|remove|small APPSYNC DISK FOLDER COORDINATION each|last
+    full_disk.py grow|look|remove|small|kept APPSYNC DISK FOLDER COORDINATION each|last
 """
 
+import json
 import os
 import re
 import shutil
@@ -224,10 +225,47 @@ def check_not_made(runner):
         assert sorted(os.listdir(runner.disk.where)) == before
 
 
+MIB = 1 << 20
+
+
+def kept(runner, _):
+    """What updates have replaced counts as free, and is given up when the room is needed: the oldest first."""
+    update_both(runner)
+    assert versions_kept(runner) == {"com.example.app00": "1.0", "com.example.app01": "1.0"}
+    told, really = json.loads(runner.ok("status", runner.device, "--json"))["free"], runner.disk.free()
+    assert 2 * MIB - 100_000 < told - really < 2 * MIB + 100_000, (told, really)  # who looks takes a little
+    # A session has a mebibyte left beside what its packages take.
+    packages.make_package(runner.library, "com.example.new", payload=os.urandom((really - MIB) // 2 + 200_000))
+    runner.ok("sync", runner.device, runner.library)
+    assert versions_kept(runner) == {"com.example.app01": "1.0"}
+    data = os.path.join(runner.folder, "data")
+    os.mkdir(data)
+    with open(os.path.join(data, "large"), "wb") as file:
+        file.write(bytes(runner.disk.free() + 100_000))
+    runner.ok("data", "push", runner.device, "com.example.app00", data)
+    assert versions_kept(runner) == {}
+    runner.check_intact()
+    assert len(runner.ok("apps", runner.device).splitlines()) == 4
+
+
+def update_both(runner):
+    """One application after the other, with a mebibyte that no disk can hold in less."""
+    for name in os.listdir(runner.library):
+        os.remove(os.path.join(runner.library, name))
+    for identifier, version in (("00", "1.0"), ("01", "1.0"), ("00", "2.0"), ("01", "2.0")):
+        packages.make_package(runner.library, "com.example.app" + identifier, version, payload=os.urandom(MIB))
+        runner.ok("sync", runner.device, runner.library)
+
+
+def versions_kept(runner):
+    apps = json.loads(runner.ok("apps", runner.device, "--json"))
+    return {app["identifier"]: app["kept"]["version"] for app in apps if app["kept"]}
+
+
 def main():
     what, program, where, folder, coordination, sizes = sys.argv[1:]
     disk = Disk(where, 2048 if what == "grow" else 8192)
-    {"grow": grow, "look": look, "remove": remove, "small": small}[what](Runner(program, disk, folder, coordination), sizes)
+    {"grow": grow, "look": look, "remove": remove, "small": small, "kept": kept}[what](Runner(program, disk, folder, coordination), sizes)
 
 
 main()

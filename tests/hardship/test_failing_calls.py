@@ -4,6 +4,7 @@ import errno
 import itertools
 import os
 import random
+import re
 
 import pytest
 
@@ -103,12 +104,13 @@ def check_truth(scenario, expected, outcome):
 
 def what_success_promises(seen):
     """Applications, placeholders and their files. The plug-in logs that it could not read the icon layout, and
-    goes on; the next sync brings it. What is left lying about is the next session's to clear."""
+    goes on; the next sync brings it. What is left lying about is the next session's to clear, or to put where it
+    is kept."""
     kept = forgivingly(seen)
     tables = {name: rows for name, rows in kept["tables"].items()
               if name in ("applications", "placeholders", "restore_data")}
     tree = {path: what for path, what in kept["tree"].items()
-            if "/Application/<" in path or path.startswith("root/var/mobile/Containers/")}
+            if re.search("/Application/<(?!kept of)", path) or path.startswith("root/var/mobile/Containers/")}
     return {"tables": tables, "tree": tree}
 
 

@@ -183,7 +183,47 @@ def with_bytes_that_are_no_text(column):
     return altered("UPDATE applications SET %s = CAST(X'fffe41' AS TEXT)" % column)
 
 
+KEPT = ("INSERT OR REPLACE INTO kept (id, identifier, version, install_type, container, bundle, icon, bytes)"
+        " VALUES (1, '%s', '0.9', 4, ?, ?, '', 1)" % A)
+ROLLBACK = ("rollback", "{device}", A)
+
+
+def kept(container, bundle="App00.app"):
+    return altered((KEPT, (container, bundle)))
+
+
+def own_container_kept(place):
+    """What is kept and what is installed stand in one container."""
+    place.alter((KEPT, (place.container_of(A).name, "App00.app")))
+
+
+def kept_with(lay_out, bundle="App00.app"):
+    """A container that is kept, as `lay_out` makes it."""
+    def make(place):
+        (place.device / "kept").mkdir()
+        lay_out(place, place.device / "kept" / "OLD")
+        place.alter((KEPT, ("OLD", bundle)))
+
+    return make
+
+
+def still_installed(place, done):
+    unharmed(place, done)
+    assert (place.container_of(A) / "App00.app" / "main").exists()
+
+
 VALUES = [
+    *[Entry("a kept container %r, %s" % (value[:20], command[0]), kept(value), command, status, also=still_installed)
+      for value in ("../../../mobile", "..", ".", "", "/", "a\0b", "../../../../../../../../outside")
+      for command, status in ((ROLLBACK, 1), (SYNC, 0))],
+    *[Entry("a kept container that is the installed one, " + command[0], own_container_kept, command, status,
+            also=still_installed) for command, status in ((ROLLBACK, 1), (SYNC, 0), (LOOKS[0], 0))],
+    *[Entry("a kept bundle %r" % value, kept_with(lambda place, path: path.mkdir(), value), ROLLBACK, 1, also=still_installed)
+      for value in ("../" * 14 + "outside", "../../../../mobile", "..", "")],
+    Entry("a kept container that is a link", kept_with(lambda place, path: path.symlink_to(place.outside)), ROLLBACK, 1,
+          also=still_installed),
+    Entry("a kept container that is a file", kept_with(lambda place, path: path.write_bytes(b"x")), ROLLBACK, 1,
+          also=still_installed),
     *[Entry("a container %r, %s" % (value[:20], command[0]), container(value), command, 0, also=also)
       for value in ("../../../mobile", "..", ".", "", "/", "../../../../../../../../outside")
       for command, also in ((("uninstall", "{device}", A), unharmed_but_the_data_of_a),
@@ -212,6 +252,7 @@ def both_lines(done):
 
 TABLES = {
     "applications": ("install_type", "bytes", "arrived"),
+    "kept": ("id", "install_type", "bytes"),
     "settings": ("value",),
     "history": ("time", "kind", "step", "party", "phase", "success"),
     "session": ("process", "started", "last_uninstall"),
@@ -226,6 +267,7 @@ ROWS = ("INSERT OR IGNORE INTO session VALUES (1, 1, 1, 0)",
         "INSERT OR IGNORE INTO failures VALUES ('%s', 1, 'x', 1, 'x')" % A,
         "INSERT OR IGNORE INTO denials VALUES ('%s', 1, 1)" % A,
         "INSERT OR IGNORE INTO running VALUES ('%s')" % A,
+        "INSERT OR IGNORE INTO kept VALUES (1, '%s', '0.9', 'x', 4, 'OLD', 'App00.app', '', 1)" % A,
         "INSERT OR IGNORE INTO uninstalled VALUES (1, 'com.example.gone', '1', 1)",
         "INSERT OR IGNORE INTO coordinators (id, identifier, kind, client, created) VALUES (1, '%s', 1, 2, 1)" % A,
         "INSERT OR IGNORE INTO promises VALUES (1, 0, 0, 'x', 2, NULL, 1, 1, 0, 0)")
@@ -240,7 +282,8 @@ def numbers(table, value, command, device):
 NUMBERS = [numbers(table, value, command, device)
            for table, command, device in (
                ("applications", SYNC, "used-direct"), ("applications", LOOKS[0], "used-direct"),
-               ("applications", LOOKS[3], "used-direct"), ("settings", SYNC, "used-direct"),
+               ("applications", LOOKS[3], "used-direct"), ("kept", LOOKS[0], "used-direct"),
+               ("kept", ("status", "{device}", "--json"), "used-direct"), ("kept", SYNC, "used-direct"), ("settings", SYNC, "used-direct"),
                ("history", LOOKS[1], "used-direct"), ("session", SYNC, "used-direct"),
                ("failures", LOOKS[2], "used-direct"), ("denials", LOOKS[2], "used-direct"),
                ("uninstalled", LOOKS[3], "used-direct"), ("coordinators", LOOKS[4], "used-coordinated"),
@@ -280,6 +323,12 @@ ROOTS = [
     unusable("the containers are a link out of the device", tree_with(lambda place: (
         shutil.rmtree(place.inside("/var/containers/Bundle/Application")),
         place.inside("/var/containers/Bundle/Application").symlink_to(place.outside))), "", also=None),
+    Entry("what is kept is a link out of the device", tree_with(lambda place: (place.device / "kept").symlink_to(
+        place.outside)), SYNC, 0, also=unharmed),
+    Entry("what is kept is a file", tree_with(lambda place: (place.device / "kept").touch()), SYNC, 0, also=unharmed),
+    Entry("what is kept is a link, and something is", tree_with(lambda place: (
+        (place.device / "kept").symlink_to(place.outside), place.alter((KEPT, ("secret", "App00.app"))))), ROLLBACK, 1,
+        also=still_installed),
     Entry("the log is a link out of the device", tree_with(lambda place: (
         (place.device / "log/system.log").unlink(), (place.device / "log/system.log").symlink_to(
             place.outside / "secret"))), SYNC, 3),
