@@ -116,6 +116,19 @@ def test_what_root_makes_belongs_to_the_owner_of_the_device(place, coordination)
 
 
 @pytest.mark.plain_build  # who has taken on another account is not looked into for leaks
+def test_what_root_keeps_the_owner_rolls_back(place):
+    device, library = place.device("off", NOBODY), place.library()
+    device.sync(library)
+    packages.make_library(library, 2, "2.0")
+    device.sync(library)
+    place.appsync("rollback", device.path, IDS[0])
+    assert owners(device.path) == {}
+    place.as_nobody("rollback", device.path, IDS[0])
+    place.as_nobody("rollback", device.path, IDS[1])
+    assert device.versions()[IDS[0]] == "2.0" and device.versions()[IDS[1]] == "1.0"
+
+
+@pytest.mark.plain_build  # who has taken on another account is not looked into for leaks
 def test_root_reads_and_replaces_what_only_root_may(place):
     device, library = place.device("off", NOBODY), place.library()
     device.sync(library)
@@ -182,7 +195,7 @@ def test_who_may_only_read_is_refused_every_change(place, coordination):
     device.sync(library)
     before = appearance(device.path)
     for command in (["run", IDS[0]], ["quit", IDS[0]], ["set", "removal=no"], ["uninstall", IDS[0]],
-                    ["sync", library], ["demote", IDS[0]], ["reset"]):
+                    ["sync", library], ["demote", IDS[0]], ["rollback", IDS[0]], ["reset"]):
         done = place.as_nobody(command[0], device.path, *command[1:], expect=3)
         assert "cannot be written" in done.stderr and done.stderr.count("\n") == 1, (command, done.stderr)
     assert appearance(device.path) == before

@@ -14,7 +14,7 @@ import pytest
 
 import packages
 from conftest import HERE, IS_LONG, SEED, acceptance
-from devices import check_intact
+from devices import check_intact, check_kept
 from processes import with_default_signals
 
 SESSIONS = 200 if IS_LONG else 4
@@ -118,7 +118,7 @@ def test_links_that_come_and_go_lead_nowhere(appsync, tmp_path, outside, coordin
 
 # Commands that meet.
 
-SESSION_COMMANDS = ["sync", "restore", "send", "demote", "reset", "stage"]
+SESSION_COMMANDS = ["sync", "restore", "send", "demote", "rollback", "reset", "stage"]
 OTHER_COMMANDS = ["uninstall", "run-quit", "apps", "screen", "log", "set"]
 
 
@@ -128,6 +128,8 @@ def crowd(appsync, tmp_path_factory, request):
     library = str(folder / "library")
     packages.make_library(library, 4)
     source = acceptance.Device(appsync, folder / "source", request.param)
+    source.sync(library)
+    packages.make_package(library, "com.example.app03", "1.1")
     source.sync(library)
     backup = str(folder / "backup")
     appsync("backup", source.path, backup)
@@ -141,6 +143,7 @@ def command_lines(name, device, library, backup, folder):
         "restore": [["restore", device, backup]],
         "send": [["send", device, "com.example.sent", os.path.join(folder, "sent", "com.example.sent.zip")]],
         "demote": [["demote", device, "com.example.app01"]],
+        "rollback": [["rollback", device, "com.example.app03"]] * 3,
         "reset": [["reset", device]],
         "stage": [["stage", device, library, "--force"]],
         "uninstall": [["uninstall", device, "com.example.app00"]],
@@ -199,4 +202,5 @@ def test_two_commands_on_one_device(appsync, crowd, tmp_path, pair):
         appsync("reset", device.path)
         device.sync(library)
         assert set(device.versions()) >= {"com.example.app%02d" % number for number in range(4)}
+        check_kept(device.path)
         shutil.rmtree(device.path)

@@ -1,5 +1,6 @@
 #include <atomic>
 #include <cerrno>
+#include <functional>
 #include <latch>
 #include <thread>
 
@@ -10,6 +11,7 @@
 #include "device/install/InstallContext.h"
 #include "device/install/KeptBundles.h"
 #include "device/install/ProgressBook.h"
+#include "device/install/Rollback.h"
 #include "device/values/DevicePaths.h"
 #include "system/RootedFileSystem.h"
 #include "system/property_list/PropertyListCodec.h"
@@ -75,7 +77,17 @@ TEST(DurabilityBarrierTest, aFailureIsToldToThoseWhomItConcernsAndNotToLaterOnes
 /// Installs on a device whose disk fails as a test wants it.
 class FailingDiskTest : public DeviceFixture {
   protected:
+    using Work = std::function<Status(const InstallContext& context)>;
+
     Status installWith(DurabilityBarrier& barrier) {
+        const std::string package = std::string(kPublicStagingDirectory) + "/package.zip";
+        return workWith(barrier, [&](const InstallContext& context) {
+            write(package, packageOf(kAtlas, "2.0"));  // the end of a session would clear it
+            return installApplication(context, kAtlas, *FileURL::fromPath(package, false), 0);
+        });
+    }
+
+    Status workWith(DurabilityBarrier& barrier, const Work& work) {
         close();
         auto database = DeviceDatabase::open(devicePath(kDatabaseName));
         auto files = RootedFileSystem::open(rootPath(""), {{}, std::string(kTemporaryDirectory)});
@@ -86,9 +98,7 @@ class FailingDiskTest : public DeviceFixture {
         const std::string boot;
         const InstallContext context{**database, **files,  containers,    kept,
                                      barrier,    progress, propertyLists, boot};
-        const std::string package = std::string(kPublicStagingDirectory) + "/package.zip";
-        write(package, packageOf(kAtlas, "2.0"));
-        return installApplication(context, kAtlas, *FileURL::fromPath(package, false), 0);
+        return work(context);
     }
 };
 
@@ -111,6 +121,27 @@ TEST_F(FailingDiskTest, aDiskThatGoesOnFailingLeavesTheOldVersion) {
     EXPECT_EQ(status.error().code, EIO);
     EXPECT_EQ(containers(), before);
     EXPECT_EQ(application(kAtlas)->bundleVersion, "1.0");
+}
+
+TEST_F(FailingDiskTest, aRollbackIsNotCommittedBeforeItsFilesAreInTheirPlaceOnDisk) {
+    ASSERT_TRUE(succeeded(install(kAtlas, "1.0")));
+    ASSERT_TRUE(succeeded(install(kAtlas, "2.0")));
+    const auto before = containers();
+    std::vector<std::string> atTheSync;
+    DurabilityBarrier barrier([&] {
+        atTheSync = containers();
+        return EIO;
+    });
+    const Status status = workWith(barrier, [](const InstallContext& context) {
+        const auto done = rollBackApplication(context, kAtlas);
+        return done ? Status() : Status(done.error());
+    });
+    ASSERT_FALSE(status);
+    EXPECT_EQ(status.error().code, EIO);
+    EXPECT_EQ(atTheSync.size(), 2U);
+    EXPECT_EQ(containers(), before);
+    EXPECT_EQ(application(kAtlas)->bundleVersion, "2.0");
+    EXPECT_TRUE(device().rollBack(kAtlas)) << "what was kept is kept";
 }
 
 TEST_F(FailingDiskTest, aDatabaseThatFailsAtTheLastStepLeavesTheOldVersion) {
