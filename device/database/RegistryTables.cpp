@@ -190,6 +190,12 @@ Result<std::vector<BundleRow>> bundlesOfType(Database& database, BundleTable tab
     return readRows(std::move(rows));
 }
 
+Result<std::vector<BundleRow>> placeholdersWithProgress(Database& database) {
+    return readRows(database.query(
+        "SELECT identifier, version, name, type, install_type, container, bundle, icon, bytes"
+        " FROM placeholders JOIN progress USING (identifier) ORDER BY arrived"));
+}
+
 Result<std::vector<std::string>> identifiersByArrival(Database& database) {
     Query rows = database.query(
         "SELECT identifier, min(arrived) AS first FROM"

@@ -66,6 +66,10 @@ struct FreedContainers {
 [[nodiscard]] Result<std::vector<BundleRow>> bundlesOfType(Database& database, BundleTable table,
                                                            std::string_view type);
 
+/// The placeholders of installs that were announced and have not ended, in the order in which they
+/// came.
+[[nodiscard]] Result<std::vector<BundleRow>> placeholdersWithProgress(Database& database);
+
 /// Every identifier once, in the order in which they first came to the device.
 [[nodiscard]] Result<std::vector<std::string>> identifiersByArrival(Database& database);
 

@@ -83,27 +83,6 @@ std::uint64_t installTypeOf(const PropertyList& options) {
                             : value->asUnsigned().value_or(kInstallTypeNone);
 }
 
-Result<std::vector<std::string>> placeholdersByArrival(Database& database) {
-    Query rows = database.query(
-        "SELECT identifier FROM placeholders JOIN progress USING (identifier) ORDER BY arrived");
-    std::vector<std::string> identifiers;
-    while (rows.next()) identifiers.push_back(rows.text(0));
-    if (Status status = rows.status(); !status) return status.error();
-    return identifiers;
-}
-
-Status placeholdersUnderWay(Database& database, std::vector<AppProxy>& proxies) {
-    const Result<std::vector<std::string>> identifiers = placeholdersByArrival(database);
-    if (!identifiers) return identifiers.error();
-    for (const std::string& identifier : *identifiers) {
-        std::optional<AppProxy> proxy;
-        const Status status = find(database, BundleTable::Placeholders, identifier, proxy);
-        if (!status) return status;
-        if (proxy) proxies.push_back(*std::move(proxy));
-    }
-    return {};
-}
-
 }  // namespace
 
 DeviceRegistry::DeviceRegistry(const InstallContext& context)
@@ -224,12 +203,18 @@ void DeviceRegistry::removeObserver(const AppRegistryObserver* observer) {
 }
 
 InstallsUnderWay DeviceRegistry::installsUnderWay() {
-    std::vector<AppProxy> placeholders;
+    std::vector<BundleRow> placeholders;
     context_.database
-        .read([&](Database& database) { return placeholdersUnderWay(database, placeholders); })
+        .read([&](Database& database) -> Status {
+            Result<std::vector<BundleRow>> rows = placeholdersWithProgress(database);
+            if (!rows) return rows.error();
+            placeholders = *std::move(rows);
+            return {};
+        })
         .ignore();
     InstallsUnderWay lists;
-    for (AppProxy& proxy : placeholders) {
+    for (const BundleRow& row : placeholders) {
+        AppProxy proxy = proxyOf(row, BundleTable::Placeholders);
         const auto record = context_.progress.record(proxy.applicationIdentifier);
         if (record == nullptr) continue;
         const std::uint64_t state = record->installState();
