@@ -1,37 +1,60 @@
 #include "host/command/sync/MirrorSource.h"
 
 #include <filesystem>
-#include <string>
 #include <string_view>
 #include <system_error>
 
 #include "host/backup/Backup.h"
 #include "host/console/Problem.h"
 #include "host/plan/Library.h"
+#include "system/PosixError.h"
 
 namespace appsync {
 namespace {
 
+namespace fs = std::filesystem;
+
 constexpr std::string_view kNameALibrary = "name the folder of packages, which is LIBRARY";
 
-bool hasItem(const Library& library, std::string_view name) {
+bool hasItem(const fs::path& folder, std::string_view name) {
     std::error_code code;
-    return std::filesystem::exists(std::filesystem::path(library.folder) / name, code);
+    return fs::exists(folder / name, code);
 }
 
-ErrorRecord noMirror(const Library& library, std::string_view what, std::string_view whatToDo) {
+// "a device", "a backup", or nothing.
+std::string_view ownerOf(const fs::path& folder) {
+    if (hasItem(folder, "device.db")) return "a device";
+    // The manifest is written last; a backup that was cut off has this one.
+    return hasItem(folder, kBackupRestoreInfo) ? "a backup" : "";
+}
+
+// Of what stands above the folder.
+std::string_view ownerAround(const std::string& folder) {
+    std::error_code code;
+    const fs::path whole = fs::canonical(folder, code);
+    if (code) return "";
+    fs::path each = whole.parent_path();
+    while (ownerOf(each).empty() && each != each.root_path()) each = each.parent_path();
+    return ownerOf(each);
+}
+
+ErrorRecord noMirror(const Library& library, const std::string& what, std::string_view whatToDo) {
     return unusable(
-        "the device cannot become a mirror of " + library.folder + ", which " + std::string(what),
+        "the device cannot become a mirror of " + displayPath(library.folder) + ", which " + what,
         whatToDo);
 }
 
 }  // namespace
 
+Status checkLibraryFolder(const std::string& folder) {
+    const std::string owner(ownerOf(folder));
+    if (owner.empty()) return {};
+    return unusable(displayPath(folder) + " is " + owner + " and no library", kNameALibrary);
+}
+
 Status checkMirrorSource(const Library& library, bool mayBeEmpty) {
-    if (hasItem(library, "device.db")) return noMirror(library, "is a device", kNameALibrary);
-    // The manifest is written last; a backup that was cut off has this one.
-    if (hasItem(library, kBackupRestoreInfo))
-        return noMirror(library, "is a backup", kNameALibrary);
+    const std::string owner(ownerAround(library.folder));
+    if (!owner.empty()) return noMirror(library, "stands in " + owner, kNameALibrary);
     // What cannot be read keeps everything from being removed.
     if (mayBeEmpty || !library.packages.empty() || !library.faults.empty()) return {};
     return noMirror(library, "holds no package",

@@ -10,6 +10,7 @@
 #include "host/command/sync/SyncCommands.h"
 #include "host/console/Problem.h"
 #include "host/plan/LibraryReader.h"
+#include "system/PosixError.h"
 
 namespace appsync {
 namespace {
@@ -40,6 +41,12 @@ Status checkChoice(const SyncArguments& arguments) {
     return checkIdentifiers(only, kUseLegalCharacters, "--only");
 }
 
+// A removal, an application that is chosen or a staging area may be all that is wanted.
+bool wantsPackages(const SyncArguments& arguments) {
+    const PlanOptions& plan = arguments.plan;
+    return !arguments.isStaged && !plan.mirror && plan.remove.empty() && plan.only.empty();
+}
+
 }  // namespace
 
 Status checkSyncArguments(const SyncArguments& arguments) {
@@ -54,10 +61,15 @@ Status checkSyncArguments(const SyncArguments& arguments) {
 Result<Library> readSyncLibrary(const SyncArguments& arguments,
                                 PropertyListSerialization& propertyLists,
                                 const StepProgress& progress) {
+    if (Status folder = checkLibraryFolder(arguments.library); !folder) return folder.error();
     Result<Library> library = readLibrary(arguments.library, propertyLists, progress);
     if (!library) return library;
     // Where a few applications are chosen, the places of the others are not the sync's to say.
     if (!arguments.plan.only.empty()) library->iconOrder.reset();
+    if (library->packages.empty() && library->faults.empty() && wantsPackages(arguments)) {
+        library->notes.push_back(displayPath(arguments.library) +
+                                 " holds no package (*.zip): there is nothing to install");
+    }
     if (!arguments.plan.mirror) return library;
     if (Status mirrored = checkMirrorSource(*library, arguments.mirrorsEmpty); !mirrored) {
         return mirrored.error();

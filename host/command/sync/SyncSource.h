@@ -13,7 +13,8 @@ struct SyncArguments;
 /// none.
 [[nodiscard]] Status checkSyncArguments(const SyncArguments& arguments);
 
-/// Reads the library that they name. Refuses one that nobody can mean a device to be a mirror of.
+/// Reads the library that they name. Refuses a folder that nobody can mean as one, or as one to
+/// mirror; a note tells of one that holds no package, unless that may be meant.
 [[nodiscard]] Result<Library> readSyncLibrary(const SyncArguments& arguments,
                                               PropertyListSerialization& propertyLists,
                                               const StepProgress& progress = {});

@@ -8,6 +8,7 @@ namespace {
 using testing::ElementsAre;
 using testing::HasSubstr;
 using testing::IsEmpty;
+using testing::Not;
 
 // Whatever is refused, the device keeps its application.
 class MirrorSource : public HostFixture {
@@ -32,14 +33,16 @@ class MirrorSource : public HostFixture {
 };
 
 TEST_F(MirrorSource, ADeviceIsNone) {
-    expectRefused(device, "--mirror", "which is a device");
-    expectRefused(device, "--mirror=empty", "which is a device");
+    for (const char* option : {"--mirror", "--mirror=empty", "--no-wait"}) {
+        expectRefused(device, option, device + " is a device and no library: name the folder");
+    }
 }
 
 TEST_F(MirrorSource, ABackupIsNone) {
     ASSERT_EQ(run({"backup", device, backup}), 0);
-    expectRefused(backup, "--mirror", "which is a backup");
-    expectRefused(backup, "--mirror=empty", "which is a backup");
+    for (const char* option : {"--mirror", "--mirror=empty", "--no-wait"}) {
+        expectRefused(backup, option, backup + " is a backup and no library: name the folder");
+    }
 }
 
 TEST_F(MirrorSource, AFolderWithoutPackagesIsOneWhereThatIsSaid) {
@@ -57,9 +60,27 @@ TEST_F(MirrorSource, WhatCannotBeReadStillKeepsEverything) {
     EXPECT_THAT(applications(), ElementsAre("com.a 1"));
 }
 
-TEST_F(MirrorSource, WithoutAMirrorAnyFolderWillDo) {
-    EXPECT_EQ(run({"sync", device, device}), 0);
+TEST_F(MirrorSource, AFolderInADeviceOrABackupIsNone) {
+    const std::string media = device + "/root/var/mobile/Media";
+    std::filesystem::create_directory_symlink(media, empty);
+    ASSERT_EQ(run({"backup", device, backup}), 0);
+    std::filesystem::create_directory(backup + "/more");
+    for (const std::string& folder : {media, empty, media + "/"}) {
+        expectRefused(folder, "--mirror=empty", folder + ", which stands in a device: name");
+    }
+    expectRefused(backup + "/more", "--mirror=empty", ", which stands in a backup: name");
+}
+
+TEST_F(MirrorSource, WithoutAMirrorAFolderWithoutPackagesIsNoted) {
+    std::filesystem::create_directory(empty);
+    const std::string note = empty + " holds no package (*.zip): there is nothing to install";
+    for (const char* command : {"plan", "sync"}) {
+        EXPECT_EQ(run({command, device, empty}), 0);
+        EXPECT_THAT(out.str(), HasSubstr(note));
+    }
     EXPECT_THAT(applications(), ElementsAre("com.a 1"));
+    EXPECT_EQ(run({"sync", device, empty, "--remove", "com.a"}), 0);
+    EXPECT_THAT(out.str(), Not(HasSubstr("no package"))) << "a removal needs none";
 }
 
 TEST_F(MirrorSource, ItsOptionTakesNoWordThatFollows) {
