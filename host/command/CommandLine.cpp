@@ -16,6 +16,7 @@
 
 #include <CLI/CLI.hpp>
 
+#include "host/command/MeantWord.h"
 #include "host/command/argument/IdentifierArgument.h"
 #include "host/command/change/ChangeCommands.h"
 #include "host/command/data/DataCommands.h"
@@ -120,6 +121,8 @@ class Commands {
     explicit Commands(const Console& console) : console_(console), app_(kDescription, "appsync") {
         app_.require_subcommand(1);
         app_.footer(kFooter);
+        app_.set_version_flag("--version", "appsync " APPSYNC_VERSION,
+                              "Print the version and exit");
         addSync();
         addPlan();
         addStage();
@@ -147,8 +150,7 @@ class Commands {
             arguments.emplace_back("--help");
         }
         if (!arguments.empty() && isUnknownCommand(arguments.front())) {
-            return console_.fail(wrongUsage(
-                "there is no command " + shownArgument(arguments.front()), "see appsync --help"));
+            return console_.fail(unknownCommand(app_, arguments.front()));
         }
         if (const Status given = checkValues(arguments); !given)
             return console_.fail(given.error());
@@ -161,8 +163,9 @@ class Commands {
             console_.out << brokenAt80(text.str());
             return kExitDone;
         } catch (const CLI::ParseError& error) {
-            return console_.fail(wrongUsage(whatIsWrong(error), "see " + chosen() + " --help"));
+            return console_.fail(whatIsWrong(error));
         }
+        console_.help = typed(chosen()) + " --help";
         return action_ ? action_() : kExitWrongUsage;
     }
 
@@ -194,11 +197,7 @@ class Commands {
         for (const std::string& word : words) {
             const auto known = command->get_subcommands(
                 [&word](const CLI::App* each) { return each->get_name() == word; });
-            if (known.empty()) {
-                const std::string of = command == &app_ ? "" : " of " + command->get_name();
-                return wrongUsage("there is no command " + shownArgument(word) + of,
-                                  "see appsync --help");
-            }
+            if (known.empty()) return unknownCommand(*command, word);
             command = known.front();
         }
         return {};
@@ -207,44 +206,71 @@ class Commands {
     // An option that ends in "=" would take the next word for its value.
     [[nodiscard]] Status checkValues(const std::vector<std::string>& words) const {
         const CLI::App* command = &app_;
-        std::string typed = app_.get_name();
         for (const std::string& word : words) {
             const auto known = command->get_subcommands(
                 [&word](const CLI::App* each) { return each->get_name() == word; });
-            if (!known.empty()) {
-                command = known.front();
-                typed += " " + word;
-            }
+            if (!known.empty()) command = known.front();
             if (word == "--") break;
             if (!word.starts_with("--") || word.find('=') != word.size() - 1) continue;
             const std::string name = word.substr(0, word.size() - 1);
             if (command->get_option_no_throw(name) == nullptr) continue;
-            return wrongUsage(name + " needs another value than ''", "see " + typed + " --help");
+            return wrongUsage(name + " needs another value than ''", helpOf(*command));
         }
         return {};
     }
 
-    // The command that the arguments name, as it is typed: "appsync package make".
-    [[nodiscard]] std::string chosen() const {
-        std::string typed = app_.get_name();
+    // The command that the arguments name.
+    [[nodiscard]] const CLI::App& chosen() const {
         const CLI::App* command = &app_;
-        while (!command->get_subcommands().empty()) {
-            command = command->get_subcommands().front();
-            typed += " " + command->get_name();
+        while (!command->get_subcommands().empty()) command = command->get_subcommands().front();
+        return *command;
+    }
+
+    // A command as it is typed: "appsync package make".
+    static std::string typed(const CLI::App& command) {
+        const CLI::App* parent = command.get_parent();
+        return (parent == nullptr ? "" : typed(*parent) + " ") + command.get_name();
+    }
+
+    // What to do about what nobody knows, where the help is, and what may have been meant.
+    static std::string helpOf(const CLI::App& command, const std::string& meant = "") {
+        const std::string tried = meant.empty() ? "" : "try " + meant + ", or ";
+        return tried + "see " + typed(command) + " --help";
+    }
+
+    static ErrorRecord unknownCommand(const CLI::App& command, const std::string& word) {
+        std::vector<std::string> known;
+        for (const CLI::App* each : command.get_subcommands([](const CLI::App*) { return true; })) {
+            known.push_back(each->get_name());
         }
-        return typed;
+        const std::string of = command.get_parent() == nullptr ? "" : " of " + typed(command);
+        return wrongUsage("there is no command " + shownArgument(word) + of,
+                          helpOf(command, meantWord(word, known)));
+    }
+
+    static ErrorRecord unknownOption(const CLI::App& command, const std::string& word) {
+        std::vector<std::string> known;
+        for (const CLI::Option* each : command.get_options()) {
+            if (!each->get_positional()) known.push_back(each->get_name());
+        }
+        return wrongUsage(word + " is not an option of " + typed(command),
+                          helpOf(command, meantWord(word.substr(0, word.find('=')), known)));
     }
 
     // What nobody knows is told before what is missing, which it may have been meant to be.
-    [[nodiscard]] std::string whatIsWrong(const CLI::ParseError& error) const {
+    [[nodiscard]] ErrorRecord whatIsWrong(const CLI::ParseError& error) const {
+        const CLI::App& command = chosen();
         const std::vector<std::string> unknown = app_.remaining(true);
         for (const std::string& word : unknown) {
-            if (word.starts_with('-')) return word + " is not an option of " + chosen();
+            if (word.starts_with('-')) return unknownOption(command, word);
         }
-        if (!unknown.empty()) {
-            return shownArgument(unknown.front()) + " is one argument too many for " + chosen();
+        if (unknown.empty()) return wrongUsage(inOwnWords(error), helpOf(command));
+        if (command.get_require_subcommand_min() > 0) {
+            return unknownCommand(command, unknown.front());
         }
-        return inOwnWords(error);
+        return wrongUsage(
+            shownArgument(unknown.front()) + " is one argument too many for " + typed(command),
+            helpOf(command));
     }
 
     // What the parser says of an option begins with its name.
@@ -255,11 +281,18 @@ class Commands {
             return option + " needs a value";
         }
         if (dynamic_cast<const CLI::ConversionError*>(&error) != nullptr) {
-            return "an option of " + chosen() + " does not take its value";
+            return "an option of " + typed(chosen()) + " does not take its value";
+        }
+        if (dynamic_cast<const CLI::ExcludesError*>(&error) != nullptr) {
+            constexpr std::string_view kExcludes = " excludes ";
+            const std::size_t verb = told.find(kExcludes);
+            if (verb == std::string::npos) return told;
+            return told.substr(0, verb) + " does not go with " +
+                   told.substr(verb + kExcludes.size());
         }
         const bool lacksCommand = dynamic_cast<const CLI::RequiredError*>(&error) != nullptr &&
                                   told.find("subcommand") != std::string::npos;
-        return lacksCommand ? chosen() + " needs a command" : told;
+        return lacksCommand ? typed(chosen()) + " needs a command" : told;
     }
 
     // A command whose options are parsed into one `Values`.
@@ -567,7 +600,7 @@ class Commands {
             ->type_name("ID");
         added.add_option("--last", values->last, "only the last N lines of what is wanted")
             ->type_name("N")
-            ->check(CLI::Range(1U, 1'000'000'000U).description(""));
+            ->check(wholeNumberFrom(1, 1'000'000'000));
         added.add_flag("--follow", values->follows, "go on as lines come");
         added.add_flag("--json", values->asJson, "print the lines as they are kept");
     }
@@ -631,7 +664,7 @@ class Commands {
         }
         if (!values.backup.backup.empty()) return runBackup(values.backup, console_);
         return console_.fail(wrongUsage("backup needs DEVICE and BACKUP, or --check BACKUP",
-                                        "see appsync backup --help"));
+                                        "name what is to be backed up, or checked"));
     }
 
     void addRestore() {
@@ -805,7 +838,7 @@ class Commands {
         added.add_flag("--json", values->asJson, "tell of the file that is written as JSON");
     }
 
-    const Console& console_;
+    Console console_;
     CLI::App app_;
     std::function<int()> action_;
 };

@@ -33,13 +33,15 @@ void Console::complain(std::string_view text) const {
 }
 
 int Console::fail(const ErrorRecord& error) const {
-    complain(error.description());
-    return exitStatusOf(error);
+    const ExitStatus status = exitStatusOf(error);
+    const bool showsHelp = status == kExitWrongUsage && !help.empty();
+    complain(error.description() + (showsHelp ? "; see " + help : ""));
+    return status;
 }
 
 Console processConsole() {
     std::cerr.tie(nullptr);  // a complaint must not wait for an output that nobody reads
-    return {std::cout, std::cerr, canRedraw(), terminalWidth()};
+    return {std::cout, std::cerr, canRedraw(), terminalWidth(), {}};
 }
 
 }  // namespace appsync

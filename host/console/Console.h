@@ -8,6 +8,7 @@
 
 #include <cstddef>
 #include <iosfwd>
+#include <string>
 #include <string_view>
 
 namespace appsync {
@@ -22,10 +23,13 @@ struct Console {
     bool isTerminal = false;
     /// Characters in a line of that terminal.
     std::size_t width = 80;
+    /// What shows the help of the command that runs: "appsync apps --help". Empty: none does yet.
+    std::string help{};
 
     /// One line on the error stream: "appsync: " and the text, made safe to print.
     void complain(std::string_view text) const;
-    /// The same of an error. Gives the exit status that it asks for.
+    /// The same of an error; wrong usage is told where the help is. Gives the exit status that it
+    /// asks for.
     int fail(const ErrorRecord& error) const;
 };
 

@@ -38,8 +38,12 @@ Status addAssignment(DeviceSettingsChange& change, const std::string& assignment
     const std::size_t equals = assignment.find('=');
     const std::string name = assignment.substr(0, equals);
     const std::string value = equals == std::string::npos ? "" : assignment.substr(equals + 1);
+    const bool isKnown = name == "coordination" || name == "installation" || name == "removal";
+    if (isKnown && equals == std::string::npos) {
+        return wrongUsage(name + " has no value", "use " + name + "=VALUE");
+    }
     if (name == "coordination") return addCoordination(change, value);
-    if (name != "installation" && name != "removal") {
+    if (!isKnown) {
         return wrongUsage("there is no setting " + shownArgument(name),
                           "use installation=, removal= or coordination=");
     }

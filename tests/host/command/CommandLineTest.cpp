@@ -3,6 +3,7 @@
 #include <gmock/gmock.h>
 #include <gtest/gtest.h>
 
+#include <optional>
 #include <sstream>
 
 #include "host/console/Console.h"
@@ -10,6 +11,7 @@
 namespace appsync {
 namespace {
 
+using testing::EndsWith;
 using testing::HasSubstr;
 using testing::StartsWith;
 
@@ -27,7 +29,20 @@ class CommandLine : public testing::Test {
 struct WrongUsage {
     std::vector<std::string> arguments;
     std::string complaint;
+    /// Whose help is named; nothing: that of the command that the first arguments are.
+    std::optional<std::string> command = std::nullopt;
 };
+
+std::string commandOf(const WrongUsage& wrong) {
+    if (wrong.command) return *wrong.command;
+    const std::string& first = wrong.arguments.front();
+    const bool isGroup = first == "package" || first == "plist" || first == "data";
+    return isGroup ? first + " " + wrong.arguments.at(1) : first;
+}
+
+std::string pointerTo(const std::string& command) {
+    return "see appsync " + command + (command.empty() ? "" : " ") + "--help\n";
+}
 
 class WrongCommandLine : public CommandLine, public testing::WithParamInterface<WrongUsage> {};
 
@@ -35,6 +50,7 @@ TEST_P(WrongCommandLine, IsRefusedWithOneLineAndStatus2) {
     EXPECT_EQ(run(GetParam().arguments), 2);
     EXPECT_THAT(err.str(), StartsWith("appsync: "));
     EXPECT_THAT(err.str(), HasSubstr(GetParam().complaint));
+    EXPECT_THAT(err.str(), EndsWith(pointerTo(commandOf(GetParam()))));
     EXPECT_EQ(err.str().find('\n'), err.str().size() - 1);
     EXPECT_EQ(out.str(), "");
 }
@@ -42,8 +58,9 @@ TEST_P(WrongCommandLine, IsRefusedWithOneLineAndStatus2) {
 INSTANTIATE_TEST_SUITE_P(
     Usage, WrongCommandLine,
     testing::Values(
-        WrongUsage{{}, "appsync needs a command: see appsync --help"},
-        WrongUsage{{"dance"}, "dance"}, WrongUsage{{"sync", "device"}, "LIBRARY"},
+        WrongUsage{{}, "appsync needs a command: see appsync --help", ""},
+        WrongUsage{{"dance"}, "there is no command dance: see", ""},
+        WrongUsage{{"sync", "device"}, "LIBRARY"},
         WrongUsage{{"sync", "device", "library", "--json", "--json-lines"}, "--json"},
         WrongUsage{{"sync", "device", "library", "--staged", "--mirror"}, "--staged"},
         WrongUsage{{"sync", "device", "library", "--remove", "a/b"}, "--remove a/b is not"},
@@ -69,7 +86,8 @@ INSTANTIATE_TEST_SUITE_P(
         WrongUsage{{"coordinator", "device", "dance"}, "dance"},
         WrongUsage{{"plist", "convert", "file", "--to", "json"},
                    "--to: json is none of xml, binary"},
-        WrongUsage{{"package"}, "appsync package needs a command: see appsync package --help"},
+        WrongUsage{
+            {"package"}, "appsync package needs a command: see appsync package --help", "package"},
         WrongUsage{{"log", "device", "--category", "x"},
                    "--category: x is no whole number from 0 to 1000000: see appsync log --help"},
         WrongUsage{{"log", "device", "--category", ""}, "--category: '' is no whole number"},
@@ -88,9 +106,10 @@ INSTANTIATE_TEST_SUITE_P(
         WrongUsage{{"log", "device", "--level", "2"}, "2 is none of debug, info, default"},
         WrongUsage{{"demote", "device", "com.a", "--by", "me"}, "me is none of person, system"},
         WrongUsage{{"demote", "device", "com.a", "--by", ""}, "'' is none of person, system"},
-        WrongUsage{{"--verbose"}, "--verbose is not an option of appsync: see appsync --help"},
-        WrongUsage{{"apps", "--jsn"},
-                   "--jsn is not an option of appsync apps: see appsync apps --help"},
+        WrongUsage{{"--verbose"}, "--verbose is not an option of appsync: see appsync --help", ""},
+        WrongUsage{
+            {"apps", "--jsn"},
+            "--jsn is not an option of appsync apps: try --json, or see appsync apps --help"},
         WrongUsage{{"apps", "device", "too", "many"},
                    "too is one argument too many for appsync apps: see appsync apps --help"},
         WrongUsage{{"apps"}, "DEVICE is required: see appsync apps --help"},
@@ -98,10 +117,21 @@ INSTANTIATE_TEST_SUITE_P(
                    "OUT is required: see appsync package make --help"},
         WrongUsage{{"data", "pull", "device", "a/b", "out"}, "a/b is not an identifier"},
         WrongUsage{{"data", "push", "device", "com.a"}, "FROM is required"},
-        WrongUsage{{""}, "there is no command ''"},
-        WrongUsage{{"help", "dance"}, "there is no command dance"},
-        WrongUsage{{"help", "package", "dance"}, "there is no command dance of package"},
-        WrongUsage{{"help", "sync", "extra"}, "there is no command extra of sync"},
+        WrongUsage{{""}, "there is no command ''", ""},
+        WrongUsage{{"help", "dance"}, "there is no command dance", ""},
+        WrongUsage{{"help", "package", "dance"}, "no command dance of appsync package", "package"},
+        WrongUsage{{"help", "sync", "extra"}, "no command extra of appsync sync", "sync"},
+        WrongUsage{{"data", "dance"}, "there is no command dance of appsync data: see", "data"},
+        WrongUsage{{"plist", "shw", "file"}, "no command shw of appsync plist: try show", "plist"},
+        WrongUsage{{"snyc", "device", "library"}, "there is no command snyc: try sync, or", ""},
+        WrongUsage{{"sync", "device", "library", "--mirorr=empty"}, "try --mirror, or see"},
+        WrongUsage{{"backup", "device", "--check", "backup"}, "DEVICE does not go with --check"},
+        WrongUsage{{"backup", "device"}, "backup needs DEVICE and BACKUP, or --check BACKUP"},
+        WrongUsage{{"log", "device", "--last", "0"}, "--last: 0 is no whole number from 1"},
+        WrongUsage{{"create", ""}, "cannot create a device at ''"},
+        WrongUsage{{"set", "device", "coordination"},
+                   "coordination has no value: use coordination="},
+        WrongUsage{{"stage", "device", "library", "--only", "com.a", "--mirror"}, "--mirror"},
         WrongUsage{{"sync", "device", "library", "--mirror=all"}, "--mirror=empty"},
         WrongUsage{{"sync", "device", "library", "--only", "a/b"}, "--only a/b is not"},
         WrongUsage{{"sync", "device", "library", "--only", "com.a", "--staged"}, "--staged"},
@@ -142,6 +172,20 @@ TEST_P(EachCommand, HasHelp) {
     for (std::string line; std::getline(lines, line);) EXPECT_LT(line.size(), 80U) << line;
 }
 
+TEST_P(EachCommand, IsUsedWronglyWithoutArgumentsAndWithAnUnknownOption) {
+    std::vector<std::string> arguments;
+    std::istringstream words(GetParam());
+    for (std::string word; words >> word;) arguments.push_back(word);
+    EXPECT_EQ(run(arguments), 2);
+    EXPECT_THAT(err.str(), EndsWith(pointerTo(GetParam())));
+    err.str("");
+    arguments.emplace_back("--unheard-of");
+    EXPECT_EQ(run(arguments), 2);
+    EXPECT_THAT(err.str(), HasSubstr("--unheard-of is not an option of appsync"));
+    EXPECT_THAT(err.str(), EndsWith(pointerTo(GetParam())));
+    EXPECT_EQ(out.str(), "");
+}
+
 INSTANTIATE_TEST_SUITE_P(Help, EachCommand,
                          testing::Values("", "create", "sync", "plan", "stage", "apps", "screen",
                                          "why", "inventory", "set", "run", "quit", "uninstall",
@@ -166,6 +210,12 @@ TEST_F(CommandLine, HelpShowsTheHelpOfACommand) {
 TEST_F(CommandLine, WhatFollowsTheIdentifierToRemoveIsTheDeviceAndTheLibrary) {
     EXPECT_EQ(run({"plan", "--remove", "com.a", "/nonexistent/device", "library"}), 3);
     EXPECT_THAT(err.str(), HasSubstr("/nonexistent/device"));
+}
+
+TEST_F(CommandLine, TellsItsVersionInOneLine) {
+    EXPECT_EQ(run({"--version"}), 0);
+    EXPECT_THAT(out.str(), testing::MatchesRegex("appsync [0-9]+\\.[0-9]+\\.[0-9]+\n"));
+    EXPECT_EQ(err.str(), "");
 }
 
 TEST_F(CommandLine, ATimeIsSecondsMinutesOrHours) {
