@@ -17,10 +17,13 @@ namespace {
 constexpr std::uint64_t kLargestPropertyList = std::uint64_t{1} << 30;
 constexpr std::string_view kStandardStream = "-";
 
+// An error says what to do.
 Result<PropertyList> parsePropertyList(const Bytes& bytes) {
     const std::string_view text(reinterpret_cast<const char*>(bytes.data()), bytes.size());
     if (looksLikeJson(text)) return propertyListOfJson(text);
-    return SystemPropertyLists().parse(bytes);
+    Result<PropertyList> value = SystemPropertyLists().parse(bytes);
+    if (value) return value;
+    return failure(value.error().description(), "correct it there");
 }
 
 Result<PropertyList> readPropertyList(const std::string& file) {
@@ -31,7 +34,7 @@ Result<PropertyList> readPropertyList(const std::string& file) {
     Result<PropertyList> value = parsePropertyList(*bytes);
     if (value) return value;
     const std::string name = isStandard ? "standard input" : file;
-    return failure(value.error().withContext(name).description(), "correct it there");
+    return value.error().withContext(name);
 }
 
 }  // namespace
