@@ -177,6 +177,17 @@ std::string fitted(std::string_view text, std::size_t width) {
     return result.substr(0, end) + "~";
 }
 
+std::string shellWord(std::string_view text) {
+    constexpr std::string_view kPlain =
+        "ABCDEFGHIJKLMNOPQRSTUVWXYZabcdefghijklmnopqrstuvwxyz0123456789_./+,:@%-";
+    const std::string shown = printable(text);
+    if (!shown.empty() && shown.find_first_not_of(kPlain) == std::string::npos) return shown;
+    std::string quoted = "'";
+    for (const char each : shown)
+        quoted += each == '\'' ? std::string("'\\''") : std::string(1, each);
+    return quoted + "'";
+}
+
 std::string counted(std::uint64_t number, std::string_view noun) {
     return std::to_string(number) + " " + std::string(noun) + (number == 1 ? "" : "s");
 }

@@ -36,6 +36,9 @@ namespace appsync {
 /// The number of code points.
 [[nodiscard]] std::size_t displayWidth(std::string_view text);
 
+/// The text as a shell takes it for one word, made safe to print.
+[[nodiscard]] std::string shellWord(std::string_view text);
+
 /// "1 application", "2 applications".
 [[nodiscard]] std::string counted(std::uint64_t number, std::string_view noun);
 

@@ -1,9 +1,12 @@
 #include "host/output/DeviceOverview.h"
 
+#include <algorithm>
+
 #include <nlohmann/json.hpp>
 
 #include "host/console/JsonWriting.h"
 #include "host/console/Text.h"
+#include "platform/InstallCoordinatorService.h"
 #include "platform/InstallProgressRecord.h"
 
 namespace appsync {
@@ -24,9 +27,9 @@ const char* settingText(PolicyAnswer answer) {
 
 const char* settingText(bool isOn) { return isOn ? "on" : "off"; }
 
-const char* sessionText(const SessionRecord& session) {
-    if (session.isUnderWay) return "under way";
-    return session.wasInterrupted ? "interrupted" : "none";
+const char* sessionText(const DeviceOverview& overview) {
+    if (overview.session.isUnderWay) return "under way";
+    return overview.session.wasInterrupted || !overview.open.empty() ? "interrupted" : "none";
 }
 
 const char* stagedText(StagedWork staged) {
@@ -41,26 +44,44 @@ const char* stagedText(StagedWork staged) {
     return "none";
 }
 
-std::string sessionLine(const SessionRecord& session) {
-    std::string text = sessionText(session);
-    if (session.process) text += ", process " + std::to_string(*session.process);
-    if (session.wasInterrupted) text += ": run the command again that was cut off";
+std::string listText(const std::vector<std::string>& identifiers) {
+    std::string text;
+    for (const std::string& each : identifiers)
+        text += (text.empty() ? "" : ", ") + printable(each);
     return text;
+}
+
+// What still waits for an application to end goes on when that has.
+std::string whatToDo(const DeviceOverview& overview) {
+    std::vector<std::string> running;
+    for (const std::string& each : overview.open) {
+        if (std::ranges::find(overview.running, each) != overview.running.end())
+            running.push_back(each);
+    }
+    const std::string quit = running.empty() ? "" : "quit " + listText(running) + ", and ";
+    const std::string open =
+        overview.open.empty() ? "" : ", with " + listText(overview.open) + " still to be installed";
+    return open + ": " + quit + "run the command again that was cut off";
+}
+
+std::string sessionLine(const DeviceOverview& overview) {
+    const SessionRecord& session = overview.session;
+    std::string text = sessionText(overview);
+    if (session.process) text += ", process " + std::to_string(*session.process);
+    const bool isOver = !session.isUnderWay && (session.wasInterrupted || !overview.open.empty());
+    return isOver ? text + whatToDo(overview) : text;
 }
 
 std::string stagedLine(StagedWork staged) {
     std::string text = stagedText(staged);
-    if (staged == StagedWork::Waiting) text += ": appsync sync --staged sends what it asks for";
-    if (staged == StagedWork::Interrupted) text += ": appsync sync --staged goes on with it";
-    return text;
+    if (staged == StagedWork::None) return text;
+    const bool waits = staged == StagedWork::Waiting;
+    return text + ": appsync sync DEVICE LIBRARY --staged " +
+           (waits ? "sends what it asks for" : "goes on with it");
 }
 
 std::string runningLine(const std::vector<std::string>& running) {
-    std::string text;
-    for (const std::string& identifier : running) {
-        text += (text.empty() ? "" : ", ") + printable(identifier);
-    }
-    return text.empty() ? "none" : text;
+    return running.empty() ? "none" : listText(running);
 }
 
 std::string spaceLine(const DeviceOverview& overview) {
@@ -107,6 +128,14 @@ void count(DeviceOverview& overview, const ApplicationRecord& record) {
     }
 }
 
+bool isOpenInstall(const ApplicationRecord& record) {
+    return record.isPlaceholder && record.installType == kInstallTypeSync;
+}
+
+bool isOpenInstall(const CoordinatorRecord& coordinator) {
+    return coordinator.client == SyncClientID && !coordinator.restores();
+}
+
 std::string overviewText(const DeviceOverview& overview) {
     const DeviceSettings& settings = overview.settings;
     return std::string("installation:  ") + settingText(settings.installation) +
@@ -114,7 +143,7 @@ std::string overviewText(const DeviceOverview& overview) {
            "\ncoordination:  " + settingText(settings.coordination) +
            "\napplications:  " + applicationsLine(overview) +
            "\nrunning:       " + runningLine(overview.running) +
-           "\nsession:       " + sessionLine(overview.session) +
+           "\nsession:       " + sessionLine(overview) +
            "\nstaging area:  " + stagedLine(overview.staged) +
            "\nfree space:    " + spaceLine(overview) + keptLine(overview) + "\n";
 }
@@ -131,8 +160,9 @@ std::string jsonText(const DeviceOverview& overview) {
                      {"restored", overview.restored},
                      {"arriving", overview.arriving},
                      {"running", overview.running},
-                     {"session", sessionText(overview.session)},
+                     {"session", sessionText(overview)},
                      {"process", process ? Json(*process) : Json()},
+                     {"open", overview.open},
                      {"staged", stagedText(overview.staged)},
                      {"free", overview.free},
                      {"reserve", overview.reserve},

@@ -20,6 +20,8 @@ struct DeviceOverview {
     std::size_t arriving = 0;
     std::vector<std::string> running;
     SessionRecord session;
+    /// Whose installs a session has begun that is over, sorted.
+    std::vector<std::string> open;
     /// Only while no session is under way.
     StagedWork staged = StagedWork::None;
     std::uint64_t free = 0;
@@ -31,6 +33,11 @@ struct DeviceOverview {
 
 /// Counts an application or a placeholder.
 void count(DeviceOverview& overview, const ApplicationRecord& record);
+
+/// Whether a sync has begun to install it, and has not come to the end of that: of a placeholder on
+/// the direct path, and of a coordinator.
+[[nodiscard]] bool isOpenInstall(const ApplicationRecord& record);
+[[nodiscard]] bool isOpenInstall(const CoordinatorRecord& coordinator);
 
 /// A line for each thing, for people.
 [[nodiscard]] std::string overviewText(const DeviceOverview& overview);

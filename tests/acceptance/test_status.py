@@ -19,7 +19,7 @@ def test_an_empty_device(appsync, device):
     assert status == {
         "installation": "unset", "removal": "unset", "coordination": device.coordination, "installed": 0,
         "offloaded": 0, "restored": 0, "arriving": 0, "running": [], "session": "none", "process": None,
-        "staged": "none", "kept": 0, "keptBytes": 0}
+         "open": [], "staged": "none", "kept": 0, "keptBytes": 0}
     shown = appsync("status", device.path).stdout
     assert len(shown.splitlines()) <= 15 and "256.0 KiB kept back" in shown
     os.remove(os.path.join(device.path, "space.reserve"))
@@ -69,7 +69,7 @@ def test_a_staging_area_that_waits_is_seen(appsync, device, library):
     with open(device.inside(TODO + "/ApplicationsSync.plist"), "wb") as file:
         plistlib.dump([{"identifier": IDS[0], "operation": "install", "version": "1.0", "name": "A"}], file)
     assert appsync.json("status", device.path)["staged"] == "waiting"
-    assert "sync --staged" in appsync("status", device.path).stdout
+    assert "appsync sync DEVICE LIBRARY --staged sends" in appsync("status", device.path).stdout
     appsync("sync", device.path, library, "--staged", expect=None)
     assert appsync.json("status", device.path)["staged"] == "none"
 

@@ -50,6 +50,19 @@ def test_what_runs_is_left_after_the_time_and_the_rest_is_done(appsync, device, 
     assert device.placeholders() == []
 
 
+def test_status_tells_what_was_left_and_what_to_do(appsync, device, running):
+    device.sync(running, "--no-wait", expect=1)
+    told = ("session:       interrupted, with %s still to be installed: %srun the command again that was cut off\n")
+    status = appsync.json("status", device.path)
+    assert (status["session"], status["open"]) == ("interrupted", [A])
+    assert told % (A, "quit %s, and " % A) in appsync("status", device.path).stdout
+    appsync("quit", device.path, A)
+    assert told % (A, "") in appsync("status", device.path).stdout
+    device.sync(running)
+    status = appsync.json("status", device.path)
+    assert (status["session"], status["open"]) == ("none", [])
+
+
 def test_events_and_summary_agree_on_what_was_left(appsync, device, running):
     done = appsync("sync", device.path, running, "--no-wait", "--json-lines", expect=1)
     events = [json.loads(line) for line in done.stdout.splitlines()]

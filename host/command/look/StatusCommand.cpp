@@ -1,4 +1,5 @@
 #include <ostream>
+#include <set>
 
 #include "device/Device.h"
 #include "host/command/argument/OpenDevice.h"
@@ -20,12 +21,33 @@ Status gatherApplications(Device& device, DeviceOverview& overview) {
     return {};
 }
 
+// Of a session that is over.
+Status gatherOpenInstalls(Device& device, DeviceOverview& overview) {
+    std::set<std::string> open;
+    if (overview.settings.coordination) {
+        const Result<std::vector<CoordinatorRecord>> coordinators = device.coordinators();
+        if (!coordinators) return unusable(coordinators.error());
+        for (const CoordinatorRecord& each : *coordinators) {
+            if (isOpenInstall(each)) open.insert(each.identifier);
+        }
+    } else {
+        const Result<std::vector<ApplicationRecord>> records = device.applications();
+        if (!records) return unusable(records.error());
+        for (const ApplicationRecord& each : *records) {
+            if (isOpenInstall(each)) open.insert(each.identifier);
+        }
+    }
+    overview.open.assign(open.begin(), open.end());
+    return {};
+}
+
 Status gatherSession(Device& device, DeviceOverview& overview) {
     const Result<SessionRecord> session = device.session();
     if (!session) return unusable(session.error());
     overview.session = *session;
-    if (!session->isUnderWay) overview.staged = stagedWorkOn(device);
-    return {};
+    if (session->isUnderWay) return {};
+    overview.staged = stagedWorkOn(device);
+    return gatherOpenInstalls(device, overview);
 }
 
 Result<DeviceOverview> overviewOf(Device& device) {

@@ -134,7 +134,7 @@ class Sending {
         return failure(work == StagedWork::Waiting
                            ? "a host has left a staging area on the device"
                            : "an interrupted sync --staged has left something to do on the device",
-                       "take it over first with appsync sync --staged");
+                       "take it over first (appsync sync DEVICE LIBRARY --staged)");
     }
 
     // Only what an earlier session has left of this application; the others go on.

@@ -17,10 +17,11 @@ namespace {
 
 Status checkPlace(StagedWork work) {
     if (work == StagedWork::None) return {};
-    return failure(work == StagedWork::Waiting
-                       ? "a staging area waits on the device already"
-                       : "an interrupted sync --staged has left something to do on the device",
-                   "let appsync sync --staged do that first, or replace it with --force");
+    return failure(
+        work == StagedWork::Waiting
+            ? "a staging area waits on the device already"
+            : "an interrupted sync --staged has left something to do on the device",
+        "do that first (appsync sync DEVICE LIBRARY --staged), or replace it with --force");
 }
 
 void tell(const StageArguments& arguments, const SyncPreparation& sync, const std::string& area,
@@ -39,8 +40,9 @@ void tell(const StageArguments& arguments, const SyncPreparation& sync, const st
                 << counted(plan.install.size(), "install") << ", "
                 << counted(plan.update.size(), "update") << ", "
                 << counted(plan.remove.size(), "removal")
-                << (hasReplaced ? ", in place of what waited" : "")
-                << "; appsync sync --staged does it\n";
+                << (hasReplaced ? ", in place of what waited" : "") << "; appsync sync "
+                << shellWord(arguments.sync.device) << ' ' << shellWord(arguments.sync.library)
+                << " --staged does it\n";
 }
 
 }  // namespace

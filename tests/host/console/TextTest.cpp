@@ -73,6 +73,15 @@ TEST(Table, CutsTheWidestColumnsWhereItMustFit) {
     EXPECT_EQ(table.text(), "A     B  C\nxxx~  y  zzz~\n") << "no cell is cut to nothing";
 }
 
+TEST(Text, AWordForTheShellIsQuotedWhereItMustBe) {
+    EXPECT_EQ(shellWord("../my-device/a_1.zip"), "../my-device/a_1.zip");
+    EXPECT_EQ(shellWord("my device"), "'my device'");
+    EXPECT_EQ(shellWord("it's"), "'it'\\''s'");
+    EXPECT_EQ(shellWord("$HOME"), "'$HOME'");
+    EXPECT_EQ(shellWord(""), "''");
+    EXPECT_EQ(shellWord("a\nb"), "'a?b'");
+}
+
 class LocalTime : public testing::Test {
   protected:
     LocalTime() { setZone("XYZ-5:30"); }
