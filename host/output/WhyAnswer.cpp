@@ -2,6 +2,7 @@
 
 #include "device/values/DeviceRecords.h"
 #include "host/console/Text.h"
+#include "host/output/FailureText.h"
 #include "platform/AppRegistry.h"
 #include "platform/InstallProgressRecord.h"
 
@@ -109,13 +110,15 @@ AwaitedThing awaitedOfRestored(const ApplicationRecord& placeholder, bool isCoor
                        sendCommand(placeholder.identifier, " --restore") + ")");
 }
 
-AwaitedThing awaitedOfData(const std::string& identifier) {
-    return awaited("restore data", "host",
-                   "for its data: send its package (" +
-                       sendCommand(identifier, " --restore --parts 1") + "), then its data (" +
-                       sendCommand(identifier, " --restore --parts 2", "DATA") +
-                       "), or the package alone, to use what the restore has left (" +
-                       sendCommand(identifier, " --restore --parts 3") + ")");
+AwaitedThing awaitedOfData(const std::string& identifier, bool packageWaits) {
+    const std::string package = sendCommand(identifier, " --restore --parts 1");
+    return awaited(
+        "restore data", "host",
+        (packageWaits ? "for its data, as its package is there: send it ("
+                      : "for its data: send its package (" + package + "), then its data (") +
+            sendCommand(identifier, " --restore --parts 2", "DATA") +
+            "), or the package alone, to use what the restore has left (" +
+            sendCommand(identifier, " --restore --parts 3") + ")");
 }
 
 std::optional<AwaitedThing> awaitedOfPlaceholder(const ApplicationRecord& placeholder,
@@ -177,7 +180,7 @@ bool isForbidden(const ApplicationStatus& status, const DeviceSettings& settings
 
 std::optional<AwaitedThing> awaitedThing(const std::string& identifier,
                                          const ApplicationStatus& status,
-                                         const DeviceSettings& settings) {
+                                         const DeviceSettings& settings, bool packageWaits) {
     if (status.denial) {
         AwaitedThing thing =
             awaited("termination", identifier,
@@ -187,7 +190,8 @@ std::optional<AwaitedThing> awaitedThing(const std::string& identifier,
         return thing;
     }
     if (isForbidden(status, settings)) return awaitedOfPolicy();
-    if (status.awaitsRestoreData && !settings.coordination) return awaitedOfData(identifier);
+    if (status.awaitsRestoreData && !settings.coordination)
+        return awaitedOfData(identifier, packageWaits);
     if (status.coordinator) return awaitedOfCoordination(status, settings.coordination);
     if (!status.placeholder) return std::nullopt;
     return awaitedOfPlaceholder(*status.placeholder, status.sessionUnderWay, settings.coordination);
@@ -214,15 +218,15 @@ std::string stateSentence(const ApplicationStatus& status) {
 }  // namespace
 
 WhyAnswer explain(const std::string& identifier, const ApplicationStatus& status,
-                  const DeviceSettings& settings) {
+                  const DeviceSettings& settings, bool packageWaits) {
     WhyAnswer answer;
     answer.identifier = identifier;
     answer.state = status.installed ? "installed" : status.placeholder ? "placeholder" : "absent";
-    answer.waitsFor = awaitedThing(identifier, status, settings);
+    answer.waitsFor = awaitedThing(identifier, status, settings, packageWaits);
     if (status.lastFailure) {
-        answer.lastError = status.lastFailure->error.description();
+        answer.lastError = failureText(identifier, status.lastFailure->error);
     } else if (status.coordinator && status.coordinator->error) {
-        answer.lastError = status.coordinator->error->description();
+        answer.lastError = failureText(identifier, *status.coordinator->error);
     }
     answer.sentence = stateSentence(status);
     return answer;

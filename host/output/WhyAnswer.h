@@ -35,8 +35,9 @@ struct WhyAnswer {
     std::string sentence;
 };
 
+/// `packageWaits`: the package of a restored application has come, and waits for its data.
 [[nodiscard]] WhyAnswer explain(const std::string& identifier, const ApplicationStatus& status,
-                                const DeviceSettings& settings);
+                                const DeviceSettings& settings, bool packageWaits = false);
 
 /// The answer for people; ends with a line end.
 [[nodiscard]] std::string whyText(const WhyAnswer& answer);

@@ -150,7 +150,10 @@ def test_history_shows_the_installs_that_failed(appsync, device, library):
     packages.damage_contents(package, "Bad.app/Resources/data.bin")
     device.sync(library, expect=1)
     (line,) = (line for line in appsync("history", device.path).stdout.splitlines() if "CRC" in line)
-    assert "com.example.bad" in line
+    assert "com.example.bad" in line and "its package: entry" in line
+    # Where it lay on the device, nothing is any more.
+    why = appsync("why", device.path, "com.example.bad").stdout
+    assert "CRC" in why and "PublicStaging" not in why + line
     packages.make_package(library, "com.example.bad")
     device.sync(library)
     assert "CRC" not in appsync("history", device.path).stdout

@@ -8,6 +8,7 @@
 #include "host/console/Problem.h"
 #include "host/console/Table.h"
 #include "host/console/Text.h"
+#include "host/output/FailureText.h"
 #include "host/output/JsonRecords.h"
 
 namespace appsync {
@@ -34,7 +35,7 @@ std::string failureTable(const std::vector<FailedInstall>& failed, const Console
     Table table({"TIME", "LAST INSTALL FAILED", "ERROR"});
     for (const FailedInstall& each : failed) {
         table.add({formatLocalTime(each.failure.when), each.identifier,
-                   each.failure.error.description()});
+                   failureText(each.identifier, each.failure.error)});
     }
     if (console.isTerminal) table.fitInto(console.width);
     return "\n" + table.text();

@@ -8,6 +8,7 @@
 #include "host/console/Problem.h"
 #include "host/output/JsonRecords.h"
 #include "host/output/WhyAnswer.h"
+#include "host/session/Parcels.h"
 
 namespace appsync {
 
@@ -20,7 +21,8 @@ int runWhy(const std::string& device, const std::string& identifier, bool asJson
         if (!status) return status.error();
         const Result<DeviceSettings> settings = opened.settings();
         if (!settings) return unusable(settings.error());
-        const WhyAnswer answer = explain(identifier, *status, *settings);
+        const WhyAnswer answer = explain(identifier, *status, *settings,
+                                         versionThatWaitsForData(opened, identifier).has_value());
         const bool isUnknown = answer.state == "absent" && !answer.lastError && !answer.waitsFor &&
                                !status->uninstalled;
         if (isUnknown) {

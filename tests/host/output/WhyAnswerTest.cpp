@@ -196,6 +196,16 @@ TEST(WhyAnswer, NoPolicyKeepsTheStoreFromBringingWhatWasRestored) {
     EXPECT_EQ(explain("com.a", status, settings).waitsFor->what, "store");
 }
 
+TEST(WhyAnswer, NoPackageIsWantedThatWaitsForItsData) {
+    ApplicationStatus status;
+    status.placeholder = application(true, kInstallTypeRestore);
+    status.awaitsRestoreData = true;
+    EXPECT_THAT(explain("com.a", status, {}, false).waitsFor->sentence, HasSubstr("--parts 1"));
+    const std::string sentence = explain("com.a", status, {}, true).waitsFor->sentence;
+    EXPECT_THAT(sentence, HasSubstr("send it (appsync send DEVICE com.a DATA --restore --parts 2"));
+    EXPECT_THAT(sentence, testing::Not(HasSubstr("--parts 1")));
+}
+
 TEST(WhyAnswer, TellsTheErrorOfTheCoordinator) {
     ApplicationStatus status;
     status.coordinator = coordinator(SyncClientID);
