@@ -1,14 +1,17 @@
 #include "device/database/DatabaseCopy.h"
 
 #include <fcntl.h>
+#include <sys/file.h>
 #include <sys/stat.h>
 #include <unistd.h>
 
+#include <algorithm>
 #include <array>
 #include <cerrno>
 #include <cstdlib>
 #include <ctime>
 #include <filesystem>
+#include <string_view>
 #include <utility>
 
 #include "device/values/DeviceError.h"
@@ -24,6 +27,9 @@ namespace fs = std::filesystem;
 
 constexpr const char* kLogSuffix = "-wal";
 constexpr int kMostCopies = 20;
+constexpr std::string_view kCopyPrefix = "appsync-look-";
+constexpr std::array<std::string_view, 3> kCopyNames = {"device.db", "device.db-wal",
+                                                        "device.db-shm"};
 
 // Between two equal states of a database nothing that a copy needs is overwritten: a log that
 // begins anew has another header, and without a log nobody writes the database unseen.
@@ -107,6 +113,70 @@ ErrorRecord neverLeftAlone(const std::string& path) {
                                                    " is being written all the time; try again");
 }
 
+ErrorRecord noTemporaryDirectory(int error) {
+    return posixError(error, "make", "a temporary directory",
+                      "what may only be read is copied there; set TMPDIR to a directory that can "
+                      "be written");
+}
+
+UniqueFd openCopyDirectory(const fs::path& path) {
+    return UniqueFd(::open(path.c_str(), O_RDONLY | O_DIRECTORY | O_CLOEXEC | O_NOFOLLOW));
+}
+
+struct LockedDirectory {
+    std::string path;
+    UniqueFd lock;
+};
+
+// Until it is locked, another process may take it for one that was left. Where the file system has
+// no locks, none is ever taken for that.
+Result<LockedDirectory> makeLockedDirectory(const fs::path& parent) {
+    for (int attempt = 0; attempt < kMostCopies; ++attempt) {
+        std::string path = (parent / kCopyPrefix).string() + "XXXXXX";
+        if (::mkdtemp(path.data()) == nullptr) break;
+        UniqueFd lock = openCopyDirectory(path);
+        if (!lock) continue;
+        ::flock(lock.get(), LOCK_EX);
+        struct stat status = {};
+        if (::fstat(lock.get(), &status) == 0 && status.st_nlink > 0) {
+            return LockedDirectory{std::move(path), std::move(lock)};
+        }
+    }
+    return noTemporaryDirectory(errno);
+}
+
+bool holdsCopyOnly(const fs::path& directory) {
+    std::error_code code;
+    fs::directory_iterator each(directory, code);
+    for (; !code && each != fs::directory_iterator(); each.increment(code)) {
+        const std::string name = each->path().filename();
+        if (std::find(kCopyNames.begin(), kCopyNames.end(), name) == kCopyNames.end()) return false;
+    }
+    return !code;
+}
+
+// Only what this account's own looking has made, and nobody uses.
+void clearIfAbandoned(const fs::path& path) {
+    const UniqueFd directory = openCopyDirectory(path);
+    struct stat status = {};
+    if (!directory || ::fstat(directory.get(), &status) != 0) return;
+    const bool isOwn = status.st_uid == ::geteuid() && (status.st_mode & 07777U) == 0700;
+    if (!isOwn || ::flock(directory.get(), LOCK_EX | LOCK_NB) != 0) return;
+    if (!holdsCopyOnly(path)) return;
+    for (const std::string_view name : kCopyNames) ::unlinkat(directory.get(), name.data(), 0);
+    ::rmdir(path.c_str());
+}
+
+void clearAbandonedCopies(const fs::path& parent) {
+    std::error_code code;
+    fs::directory_iterator each(parent, code);
+    for (; !code && each != fs::directory_iterator(); each.increment(code)) {
+        const std::string name = each->path().filename();
+        const bool isCopy = name.starts_with(kCopyPrefix) && name.size() == kCopyPrefix.size() + 6;
+        if (isCopy) clearIfAbandoned(each->path());
+    }
+}
+
 }  // namespace
 
 std::optional<ErrorRecord> whyNotWritable(const std::string& path) {
@@ -124,10 +194,11 @@ std::optional<ErrorRecord> whyNotWritable(const std::string& path) {
     return std::nullopt;
 }
 
-DatabaseCopy::DatabaseCopy(std::string directory) : directory_(std::move(directory)) {}
+DatabaseCopy::DatabaseCopy(std::string directory, UniqueFd lock)
+    : directory_(std::move(directory)), lock_(std::move(lock)) {}
 
 DatabaseCopy::DatabaseCopy(DatabaseCopy&& other) noexcept
-    : directory_(std::exchange(other.directory_, {})) {}
+    : directory_(std::exchange(other.directory_, {})), lock_(std::move(other.lock_)) {}
 
 DatabaseCopy::~DatabaseCopy() {
     std::error_code ignored;
@@ -137,14 +208,13 @@ DatabaseCopy::~DatabaseCopy() {
 std::string DatabaseCopy::path() const { return directory_ + "/device.db"; }
 
 Result<DatabaseCopy> DatabaseCopy::make(const std::string& path, const Interlude& interlude) {
-    std::error_code error;
-    std::string directory = (fs::temp_directory_path(error) / "appsync-XXXXXX").string();
-    if (error || ::mkdtemp(directory.data()) == nullptr) {
-        return posixError(error ? error.value() : errno, "make", "a temporary directory",
-                          "what may only be read is copied there; set TMPDIR to a directory that "
-                          "can be written");
-    }
-    DatabaseCopy copy(directory);
+    std::error_code code;
+    const fs::path parent = fs::temp_directory_path(code);
+    if (code) return noTemporaryDirectory(code.value());
+    clearAbandonedCopies(parent);
+    Result<LockedDirectory> directory = makeLockedDirectory(parent);
+    if (!directory) return directory.error();
+    DatabaseCopy copy(directory->path, std::move(directory->lock));
     for (int attempt = 0; attempt < kMostCopies; ++attempt) {
         const Result<bool> done = copyUndisturbed(path, copy.path(), interlude);
         if (!done) return done.error();

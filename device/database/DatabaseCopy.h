@@ -5,6 +5,7 @@
 #include <string>
 
 #include "platform/Result.h"
+#include "system/UniqueFd.h"
 
 namespace appsync {
 
@@ -15,7 +16,7 @@ namespace appsync {
 
 /// A copy of a database in a private directory of its own, for those who may only read it: what is
 /// committed, while others go on writing. The directory goes with this object; who has read of the
-/// copy by then can use it all the same.
+/// copy by then can use it all the same. One that a killed process has left goes with the next.
 class DatabaseCopy {
   public:
     /// What others may do between the copies of the two files; tests say it.
@@ -36,9 +37,10 @@ class DatabaseCopy {
     [[nodiscard]] std::string path() const;
 
   private:
-    explicit DatabaseCopy(std::string directory);
+    DatabaseCopy(std::string directory, UniqueFd lock);
 
     std::string directory_;
+    UniqueFd lock_;  // of the directory, which tells others that it is in use
 };
 
 }  // namespace appsync

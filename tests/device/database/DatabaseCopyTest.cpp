@@ -1,6 +1,12 @@
 #include "device/database/DatabaseCopy.h"
 
+#include <sys/wait.h>
+#include <unistd.h>
+
+#include <csignal>
+#include <cstdlib>
 #include <filesystem>
+#include <fstream>
 
 #include "device/database/Database.h"
 #include "device/database/DeviceDatabase.h"
@@ -93,6 +99,88 @@ TEST_F(DatabaseCopyTest, goesWithItsObjectAndStaysForWhoHasReadOfIt) {
     EXPECT_FALSE(fs::exists(fs::path(path).parent_path()));
     EXPECT_EQ(*copy->integer("SELECT count(*) FROM applications"), 0);
     EXPECT_EQ(copy->path(), devicePath("device.db")) << "messages name the original";
+}
+
+// Where copies are made: what is found there, and whose it is.
+class AbandonedCopies : public DatabaseCopyTest {
+  protected:
+    AbandonedCopies() {
+        fs::create_directory(place);
+        ::setenv("TMPDIR", place.c_str(), 1);
+    }
+    ~AbandonedCopies() override { ::unsetenv("TMPDIR"); }
+    AbandonedCopies(const AbandonedCopies&) = delete;
+    AbandonedCopies& operator=(const AbandonedCopies&) = delete;
+
+    [[nodiscard]] std::size_t count() const {
+        return static_cast<std::size_t>(
+            std::distance(fs::directory_iterator(place), fs::directory_iterator()));
+    }
+    /// A process that looks at the device, and is killed amid its copy.
+    void lookAndBeKilled() const {
+        const pid_t child = ::fork();
+        if (child == 0) {
+            const auto copy = DatabaseCopy::make(devicePath("device.db"), [] { ::raise(SIGKILL); });
+            ::_exit(0);
+        }
+        int status = 0;
+        ASSERT_EQ(::waitpid(child, &status, 0), child);
+        ASSERT_TRUE(WIFSIGNALED(status));
+    }
+    [[nodiscard]] fs::path makeDirectory(const char* name, fs::perms mode) const {
+        fs::path made = place / name;
+        fs::create_directory(made);
+        fs::permissions(made, mode);
+        std::ofstream(made / "device.db") << "a database";
+        return made;
+    }
+
+    const fs::path place = path("copies");
+};
+
+TEST_F(AbandonedCopies, goWithTheNextCopy) {
+    lookAndBeKilled();
+    lookAndBeKilled();
+    EXPECT_EQ(count(), 1U) << "the second has cleared what the first has left";
+    EXPECT_TRUE(DatabaseCopy::make(devicePath("device.db")));
+    EXPECT_EQ(count(), 0U);
+}
+
+TEST_F(AbandonedCopies, areNoneThatAreInUse) {
+    const Result<DatabaseCopy> first = DatabaseCopy::make(devicePath("device.db"), [this] {
+        EXPECT_TRUE(DatabaseCopy::make(devicePath("device.db")));
+    });
+    EXPECT_TRUE(DatabaseCopy::make(devicePath("device.db")));
+    ASSERT_TRUE(first);
+    EXPECT_TRUE(fs::exists(first->path()));
+    EXPECT_EQ(count(), 1U);
+}
+
+TEST_F(AbandonedCopies, areNothingThatLooksLikeOne) {
+    const fs::path control = makeDirectory("appsync-look-000000", fs::perms::owner_all);
+    const fs::path filled = makeDirectory("appsync-look-000001", fs::perms::owner_all);
+    std::ofstream(filled / "letter.txt") << "Dear";
+    const fs::path shared = makeDirectory("appsync-look-000002", fs::perms::all);
+    const fs::path longer = makeDirectory("appsync-look-0000034", fs::perms::owner_all);
+    const fs::path other = makeDirectory("appsync-loot-000005", fs::perms::owner_all);
+    const fs::path target = makeDirectory("target", fs::perms::owner_all);
+    fs::create_directory_symlink(target, place / "appsync-look-000006");
+    std::ofstream(place / "appsync-look-000007") << "a file";
+    EXPECT_TRUE(DatabaseCopy::make(devicePath("device.db")));
+    EXPECT_FALSE(fs::exists(control));
+    for (const fs::path& each : {filled, shared, longer, other, target}) {
+        EXPECT_TRUE(fs::exists(each / "device.db")) << each;
+    }
+    EXPECT_EQ(count(), 7U);
+}
+
+TEST_F(AbandonedCopies, areNoneOfSomebodyElse) {
+    if (::geteuid() != 0) GTEST_SKIP() << "only root can give something away";
+    const fs::path others = makeDirectory("appsync-look-000000", fs::perms::owner_all);
+    constexpr uid_t kSomebody = 65534;
+    ASSERT_EQ(::chown(others.c_str(), kSomebody, kSomebody), 0);
+    EXPECT_TRUE(DatabaseCopy::make(devicePath("device.db")));
+    EXPECT_TRUE(fs::exists(others / "device.db"));
 }
 
 TEST_F(DatabaseCopyTest, missesADatabaseThatIsNotThere) {
