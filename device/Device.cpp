@@ -136,11 +136,15 @@ Device::Device(std::unique_ptr<State> state) : state_(std::move(state)) {}
 Device::~Device() {
     state_->coordination.close();
     state_->database->flush().ignore();
-    if (!state_->lock && state_->options.makesRoom) keepSpaceReserve(state_->path);
-    if (!state_->lock) return;
-    clearPackages(state_->context);
-    endSession(state_->context).ignore();
-    keepSpaceReserve(state_->path);
+    const bool isSession = state_->lock.has_value();
+    if (isSession) {
+        clearPackages(state_->context);
+        endSession(state_->context).ignore();
+    }
+    if (!isSession && !state_->options.makesRoom) return;
+    const std::string path = state_->path;
+    state_.reset();  // and with it what the database's log has taken
+    keepSpaceReserve(path);
 }
 
 Platform Device::platform(SyncHost& host, LogFacility& log) {

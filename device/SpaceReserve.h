@@ -15,7 +15,8 @@ inline constexpr std::uint64_t kSpaceOfNewDevice = std::uint64_t{512} << 10U;
 /// cannot keep space back for a file, there is none, and it is true.
 [[nodiscard]] bool makeSpaceReserve(const std::string& devicePath) noexcept;
 
-/// Makes the file where there is none, and where that leaves plenty of space. May do nothing.
+/// Makes the file where there is none, or lets a smaller one grow: whole where plenty of space is
+/// free, else as much as a removal needs, as long as that much is there. May do nothing.
 void keepSpaceReserve(const std::string& devicePath) noexcept;
 
 /// Gives the file up where less space is left than it takes.

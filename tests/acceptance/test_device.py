@@ -381,6 +381,20 @@ def test_a_full_disk_can_be_looked_at(appsync, tmp_path):
     assert [line for line in done.stdout.splitlines() if line.isdigit()] == ["0", "1", "0", "0"], done.stdout
 
 
+def test_uninstall_works_again_and_again_on_a_full_disk(appsync, tmp_path):
+    """What it frees is not enough for a whole reserve, and others take it before the next one."""
+    identifiers = packages.make_library(str(tmp_path / "library"), 6, payload=b"x" * 40_000)
+    disk = tmp_path / "disk"
+    disk.mkdir()
+    steps = "; ".join(
+        "cat /dev/zero >>{0}/filler 2>/dev/null; {1} uninstall {0}/d {2} 2>&1 >/dev/null; echo $?; {1} status {0}/d".format(
+            disk, appsync.program, identifier) for identifier in identifiers)
+    done = in_own_mounts("mount -t tmpfs -o size=16m tmpfs {0} && {1} create {0}/d >/dev/null && "
+                         "{1} sync {0}/d {2} >/dev/null && {3}".format(disk, appsync.program, tmp_path / "library", steps))
+    assert [line for line in done.stdout.splitlines() if line.isdigit()] == ["0"] * 6, done.stdout
+    assert len(re.findall(r"and (9[6-9]|1[0-2][0-9])\.0 KiB kept back", done.stdout)) == 6, done.stdout
+
+
 def test_a_read_only_device_can_be_looked_at_and_nothing_else(appsync, device, library, tmp_path):
     device.sync(library)
     looks = "; ".join([look_at(appsync, device.path), *(
