@@ -150,13 +150,19 @@ Status openFiles(const fs::path& device, OpenedDevice& opened) {
     return {};
 }
 
+std::string whatToDoAbout(const ErrorRecord& cause) {
+    if (isInTheWay(cause)) return "; remove what stands there in its place";
+    const bool isForbidden = cause.domain == kPosixErrorDomain && cause.code == EACCES;
+    return isForbidden ? "; run the command as the account that owns the device" : "";
+}
+
 }  // namespace
 
 ErrorRecord cannotUseDevice(const std::string& path, const ErrorRecord& cause) {
     if (cause.domain == kDeviceErrorDomain) return cause;
-    return deviceError(DeviceErrorCode::CannotUse,
-                       "cannot use the device " + displayPath(path) + ": " + cause.description() +
-                           (isInTheWay(cause) ? "; remove what stands there in its place" : ""));
+    return deviceError(DeviceErrorCode::CannotUse, "cannot use the device " + displayPath(path) +
+                                                       ": " + cause.description() +
+                                                       whatToDoAbout(cause));
 }
 
 Result<OpenedDevice> openDevice(const std::string& path, bool session, bool makesRoom) {

@@ -115,8 +115,9 @@ ErrorRecord neverLeftAlone(const std::string& path) {
 
 ErrorRecord noTemporaryDirectory(int error) {
     return posixError(error, "make", "a temporary directory",
-                      "what may only be read is copied there; set TMPDIR to a directory that can "
-                      "be written");
+                      posixReason(error) +
+                          "; what may only be read is copied there: set TMPDIR to a directory that "
+                          "can be written");
 }
 
 UniqueFd openCopyDirectory(const fs::path& path) {

@@ -251,3 +251,12 @@ def test_data_that_may_not_be_read_is_named_and_left_out(place):
     pulled = place.as_nobody("data", "pull", device.path, identifier, os.path.join(out, "data"), "--json", expect=1)
     assert [each["file"] for each in json.loads(pulled.stdout)["leftOut"]] == ["a"]
     assert os.listdir(os.path.join(out, "data")) == ["b"]
+
+
+def test_a_device_that_may_not_be_read_names_who_may(place):
+    device = place.device()
+    os.chmod(device.path, 0o700)
+    for command in ("apps", "status", "log", "reset"):
+        told = place.as_nobody(command, device.path, expect=3).stderr
+        assert "Permission denied" in told and told.count("\n") == 1
+        assert told.endswith("; run the command as the account that owns the device\n")
