@@ -46,6 +46,8 @@ def test_json_comes_back_as_it_was_shown(appsync, tmp_path):
 def test_rubbish_from_a_pipe_is_refused_in_one_line(appsync, text, says):
     told = fed(appsync, text, "convert", "-", "--to", "xml", status=1)
     assert says in told and told.count("\n") == 1
+    assert ("write it as plist show --json does" in told) + ("correct it there" in told) == (says != "null")
+    assert told.startswith("appsync: standard input: ")
 
 
 def test_no_encoding_is_called_json(appsync):

@@ -17,6 +17,10 @@ namespace {
 constexpr std::uint64_t kLargestPropertyList = std::uint64_t{1} << 30;
 constexpr std::string_view kStandardStream = "-";
 
+std::string sourceName(const std::string& file) {
+    return file == kStandardStream ? "standard input" : file;
+}
+
 // An error says what to do.
 Result<PropertyList> parsePropertyList(const Bytes& bytes) {
     const std::string_view text(reinterpret_cast<const char*>(bytes.data()), bytes.size());
@@ -33,8 +37,7 @@ Result<PropertyList> readPropertyList(const std::string& file) {
     if (!bytes) return bytes.error();
     Result<PropertyList> value = parsePropertyList(*bytes);
     if (value) return value;
-    const std::string name = isStandard ? "standard input" : file;
-    return value.error().withContext(name);
+    return value.error().withContext(sourceName(file));
 }
 
 }  // namespace
@@ -56,7 +59,7 @@ int runPropertyListConvert(const ConvertArguments& arguments, const Console& con
     const Result<PropertyList> value = readPropertyList(arguments.file);
     if (!value) return console.fail(value.error());
     const Result<Bytes> bytes = SystemPropertyLists().serialize(*value, arguments.format);
-    if (!bytes) return console.fail(bytes.error().withContext(arguments.file));
+    if (!bytes) return console.fail(bytes.error().withContext(sourceName(arguments.file)));
     if (isPrinted) {
         console.out.write(reinterpret_cast<const char*>(bytes->data()),
                           static_cast<std::streamsize>(bytes->size()));
