@@ -44,7 +44,7 @@ const char* stagedText(StagedWork staged) {
     return "none";
 }
 
-std::string listText(const std::vector<std::string>& identifiers) {
+std::string namesText(const std::vector<std::string>& identifiers) {
     std::string text;
     for (const std::string& each : identifiers)
         text += (text.empty() ? "" : ", ") + printable(each);
@@ -52,15 +52,16 @@ std::string listText(const std::vector<std::string>& identifiers) {
 }
 
 // What still waits for an application to end goes on when that has.
-std::string whatToDo(const DeviceOverview& overview) {
+std::string openWorkText(const DeviceOverview& overview) {
     std::vector<std::string> running;
     for (const std::string& each : overview.open) {
         if (std::ranges::find(overview.running, each) != overview.running.end())
             running.push_back(each);
     }
-    const std::string quit = running.empty() ? "" : "quit " + listText(running) + ", and ";
-    const std::string open =
-        overview.open.empty() ? "" : ", with " + listText(overview.open) + " still to be installed";
+    const std::string quit = running.empty() ? "" : "quit " + namesText(running) + ", and ";
+    const std::string open = overview.open.empty()
+                                 ? ""
+                                 : ", with " + namesText(overview.open) + " still to be installed";
     return open + ": " + quit + "run the command again that was cut off";
 }
 
@@ -69,7 +70,7 @@ std::string sessionLine(const DeviceOverview& overview) {
     std::string text = sessionText(overview);
     if (session.process) text += ", process " + std::to_string(*session.process);
     const bool isOver = !session.isUnderWay && (session.wasInterrupted || !overview.open.empty());
-    return isOver ? text + whatToDo(overview) : text;
+    return isOver ? text + openWorkText(overview) : text;
 }
 
 std::string stagedLine(StagedWork staged) {
@@ -81,7 +82,7 @@ std::string stagedLine(StagedWork staged) {
 }
 
 std::string runningLine(const std::vector<std::string>& running) {
-    return running.empty() ? "none" : listText(running);
+    return running.empty() ? "none" : namesText(running);
 }
 
 std::string spaceLine(const DeviceOverview& overview) {
