@@ -18,6 +18,7 @@
 
 #include "host/command/MeantWord.h"
 #include "host/command/argument/IdentifierArgument.h"
+#include "host/command/argument/OpenDevice.h"
 #include "host/command/change/ChangeCommands.h"
 #include "host/command/data/DataCommands.h"
 #include "host/command/file/FileCommands.h"
@@ -166,6 +167,8 @@ class Commands {
             return console_.fail(whatIsWrong(error));
         }
         console_.help = typed(chosen()) + " --help";
+        if (const Status placed = checkPlaceOfDevice(); !placed)
+            return console_.fail(placed.error());
         return action_ ? action_() : kExitWrongUsage;
     }
 
@@ -203,7 +206,26 @@ class Commands {
         return {};
     }
 
-    // An option that ends in "=" would take the next word for its value.
+    // Another argument may be the device: everything that follows would tell of the wrong one.
+    [[nodiscard]] Status checkPlaceOfDevice() const {
+        const CLI::App& command = chosen();
+        const CLI::Option* device = command.get_option_no_throw("DEVICE");
+        if (device == nullptr || device->empty()) return {};
+        const std::string& given = device->results().front();
+        if (looksLikeDevice(given)) return {};
+        for (const CLI::Option* each : command.get_options()) {
+            if (!each->get_positional()) continue;
+            for (const std::string& word : each->results()) {
+                if (!looksLikeDevice(word)) continue;
+                return unusable(shownArgument(given) + " is no device, and " + word + " is one",
+                                "DEVICE is the first argument: " + helpOf(command));
+            }
+        }
+        return {};
+    }
+
+    // An option that ends in "=" would take the next word for its value, and a flag that is given
+    // one would be on or off by what that says.
     [[nodiscard]] Status checkValues(const std::vector<std::string>& words) const {
         const CLI::App* command = &app_;
         for (const std::string& word : words) {
@@ -211,12 +233,22 @@ class Commands {
                 [&word](const CLI::App* each) { return each->get_name() == word; });
             if (!known.empty()) command = known.front();
             if (word == "--") break;
-            if (!word.starts_with("--") || word.find('=') != word.size() - 1) continue;
-            const std::string name = word.substr(0, word.size() - 1);
-            if (command->get_option_no_throw(name) == nullptr) continue;
+            const std::size_t equals = word.find('=');
+            if (!word.starts_with("--") || equals == std::string::npos) continue;
+            const std::string name = word.substr(0, equals);
+            const CLI::Option* option = command->get_option_no_throw(name);
+            if (option == nullptr) continue;
+            if (isPlainFlag(*option)) {
+                return wrongUsage(name + " takes no value", helpOf(*command));
+            }
+            if (equals != word.size() - 1) continue;
             return wrongUsage(name + " needs another value than ''", helpOf(*command));
         }
         return {};
+    }
+
+    static bool isPlainFlag(const CLI::Option& option) {
+        return option.get_items_expected_max() == 0 && option.get_option_text().empty();
     }
 
     // The command that the arguments name.

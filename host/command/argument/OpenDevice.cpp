@@ -1,10 +1,19 @@
 #include "host/command/argument/OpenDevice.h"
 
+#include <filesystem>
+#include <system_error>
+
 #include "device/values/DeviceError.h"
+#include "device/values/DevicePaths.h"
 #include "host/console/Console.h"
 #include "host/console/Problem.h"
 
 namespace appsync {
+
+bool looksLikeDevice(const std::string& path) {
+    std::error_code code;
+    return std::filesystem::exists(std::filesystem::path(path) / kDatabaseName, code);
+}
 
 Result<std::unique_ptr<Device>> openDevice(const std::string& path, DeviceAccess access) {
     return openDevice(path, {.access = access});

@@ -14,6 +14,9 @@ namespace appsync {
 
 struct Console;
 
+/// Whether something that may be a device stands there.
+[[nodiscard]] bool looksLikeDevice(const std::string& path);
+
 /// Opens a device for a command; the error has the exit status "unusable".
 [[nodiscard]] Result<std::unique_ptr<Device>> openDevice(const std::string& path,
                                                          DeviceAccess access);

@@ -1,4 +1,5 @@
 #include <algorithm>
+#include <map>
 #include <memory>
 #include <ostream>
 #include <string>
@@ -34,9 +35,13 @@ Status addCoordination(DeviceSettingsChange& change, const std::string& value) {
     return {};
 }
 
+std::string nameIn(const std::string& assignment) {
+    return assignment.substr(0, assignment.find('='));
+}
+
 Status addAssignment(DeviceSettingsChange& change, const std::string& assignment) {
     const std::size_t equals = assignment.find('=');
-    const std::string name = assignment.substr(0, equals);
+    const std::string name = nameIn(assignment);
     const std::string value = equals == std::string::npos ? "" : assignment.substr(equals + 1);
     const bool isKnown = name == "coordination" || name == "installation" || name == "removal";
     if (isKnown && equals == std::string::npos) {
@@ -55,9 +60,16 @@ Status addAssignment(DeviceSettingsChange& change, const std::string& assignment
 
 Result<DeviceSettingsChange> parseAssignments(const std::vector<std::string>& assignments) {
     DeviceSettingsChange change;
+    std::map<std::string, std::string> given;
     for (const std::string& assignment : assignments) {
         const Status added = addAssignment(change, assignment);
         if (!added) return added.error();
+        const std::string& first = given.emplace(nameIn(assignment), assignment).first->second;
+        if (first != assignment) {
+            std::string both = "both ";
+            both.append(first).append(" and ").append(assignment).append(" are given");
+            return wrongUsage(both, "choose one");
+        }
     }
     return change;
 }

@@ -5,6 +5,7 @@
 #include <system_error>
 
 #include "host/backup/Backup.h"
+#include "host/command/argument/OpenDevice.h"
 #include "host/console/Problem.h"
 #include "host/plan/Library.h"
 #include "system/PosixError.h"
@@ -23,7 +24,7 @@ bool hasItem(const fs::path& folder, std::string_view name) {
 
 // "a device", "a backup", or nothing.
 std::string_view ownerOf(const fs::path& folder) {
-    if (hasItem(folder, "device.db")) return "a device";
+    if (looksLikeDevice(folder)) return "a device";
     // The manifest is written last; a backup that was cut off has this one.
     return hasItem(folder, kBackupRestoreInfo) ? "a backup" : "";
 }
