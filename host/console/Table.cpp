@@ -37,15 +37,21 @@ std::vector<std::size_t> Table::columnWidths() const {
     return widths;
 }
 
+std::string Table::cell(const std::string& text, std::size_t column, std::size_t width) const {
+    const std::size_t length = displayWidth(text);
+    if (length <= width || !keptEnds_.contains(column)) return fitted(text, width);
+    return "~" + std::string(endOf(text, width - 1));
+}
+
 std::string Table::text() const {
     const std::vector<std::size_t> widths = columnWidths();
     std::string result;
     for (const auto& row : rows_) {
         for (std::size_t column = 0; column + 1 < widths.size(); ++column) {
-            result.append(fitted(row[column], widths[column])).append(kGap);
+            result.append(cell(row[column], column, widths[column])).append(kGap);
         }
         const bool isCut = displayWidth(row.back()) > widths.back();
-        result += (isCut ? fitted(row.back(), widths.back()) : row.back()) + "\n";
+        result += (isCut ? cell(row.back(), widths.size() - 1, widths.back()) : row.back()) + "\n";
     }
     return result;
 }

@@ -177,6 +177,14 @@ std::string fitted(std::string_view text, std::size_t width) {
     return result.substr(0, end) + "~";
 }
 
+std::string_view endOf(std::string_view text, std::size_t width) {
+    std::size_t begin = text.size();
+    for (std::size_t characters = 0; begin > 0 && characters < width;) {
+        if (!isContinuation(text[--begin])) ++characters;
+    }
+    return text.substr(begin);
+}
+
 std::string shellWord(std::string_view text) {
     constexpr std::string_view kPlain =
         "ABCDEFGHIJKLMNOPQRSTUVWXYZabcdefghijklmnopqrstuvwxyz0123456789_./+,:@%-";

@@ -33,6 +33,9 @@ namespace appsync {
 /// up with blanks. Counts code points.
 [[nodiscard]] std::string fitted(std::string_view text, std::size_t width);
 
+/// The last `width` characters of the text, or all of it.
+[[nodiscard]] std::string_view endOf(std::string_view text, std::size_t width);
+
 /// The number of code points.
 [[nodiscard]] std::size_t displayWidth(std::string_view text);
 

@@ -12,7 +12,9 @@ namespace appsync {
 
 bool looksLikeDevice(const std::string& path) {
     std::error_code code;
-    return std::filesystem::exists(std::filesystem::path(path) / kDatabaseName, code);
+    const std::filesystem::path directory(path);
+    return std::filesystem::exists(directory / kDatabaseName, code) ||
+           std::filesystem::exists(directory / kRootName / "var/mobile", code);
 }
 
 Result<std::unique_ptr<Device>> openDevice(const std::string& path, DeviceAccess access) {

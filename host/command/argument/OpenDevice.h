@@ -14,7 +14,7 @@ namespace appsync {
 
 struct Console;
 
-/// Whether something that may be a device stands there.
+/// Whether a device stands there, or what is left of one.
 [[nodiscard]] bool looksLikeDevice(const std::string& path);
 
 /// Opens a device for a command; the error has the exit status "unusable".

@@ -48,6 +48,7 @@ std::string coordinatorsTable(const std::vector<CoordinatorRecord>& coordinators
                               const Console& console) {
     if (coordinators.empty()) return "No coordinators.\n";
     Table table({"IDENTIFIER", "KIND", "CLIENT", "PLACEHOLDER", "PROMISES", "STATE"});
+    table.keepEndsOf(0);
     for (const CoordinatorRecord& each : coordinators) {
         table.add({each.identifier, each.kind, std::to_string(each.client),
                    each.placeholderStands ? "shown" : (each.hasPlaceholder ? "not shown" : "-"),

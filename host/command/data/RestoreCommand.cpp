@@ -49,6 +49,7 @@ void print(const RestoreArguments& arguments, const RestoreResult& result, doubl
            const Console& console) {
     if (!result.screen.empty()) {
         Table table({"IDENTIFIER", "VERSION", "NAME", "STATE"});
+        table.keepEndsOf(0);
         for (const ShownApplication& each : result.screen) {
             table.add({each.identifier, each.version.value_or("-"), each.name,
                        each.isPlaceholder ? "placeholder" : "installed"});

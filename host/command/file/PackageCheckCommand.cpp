@@ -63,6 +63,7 @@ int finishCheck(const CheckedPackages& checked, const Console& console) {
 std::string packagesTable(const std::vector<LibraryPackage>& packages, const Console& console) {
     if (packages.empty()) return "No packages.\n";
     Table table({"FILE", "IDENTIFIER", "VERSION", "NAME", "SIZE"});
+    for (const std::size_t column : {0U, 1U}) table.keepEndsOf(column);
     for (const LibraryPackage& each : packages) {
         table.add({each.file, each.identifier, each.version.empty() ? "-" : each.version, each.name,
                    formatBytes(each.bytes)});

@@ -32,6 +32,7 @@ std::string applicationsTable(const std::vector<ApplicationRecord>& records,
                     [](const ApplicationRecord& record) { return record.kept.has_value(); });
     if (anyKept) titles.emplace_back("KEPT");
     Table table(std::move(titles));
+    table.keepEndsOf(0);
     for (const ApplicationRecord& record : records) {
         std::vector<std::string> cells{record.identifier,
                                        record.version.value_or("-"),

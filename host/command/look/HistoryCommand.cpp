@@ -21,6 +21,7 @@ std::string whatText(const HistoryRecord& record) {
 
 std::string historyTable(const std::vector<HistoryRecord>& records, const Console& console) {
     Table table({"TIME", "WHAT", "RESULT", "IDENTIFIER", "DESCRIPTION"});
+    table.keepEndsOf(3);
     for (const HistoryRecord& record : records) {
         table.add({formatLocalTime(record.time), whatText(record), record.success ? "ok" : "failed",
                    record.identifier, record.description});
@@ -33,6 +34,7 @@ std::string historyTable(const std::vector<HistoryRecord>& records, const Consol
 std::string failureTable(const std::vector<FailedInstall>& failed, const Console& console) {
     if (failed.empty()) return {};
     Table table({"TIME", "LAST INSTALL FAILED", "ERROR"});
+    table.keepEndsOf(1);
     for (const FailedInstall& each : failed) {
         table.add({formatLocalTime(each.failure.when), each.identifier,
                    failureText(each.identifier, each.failure.error)});

@@ -73,6 +73,23 @@ TEST(Table, CutsTheWidestColumnsWhereItMustFit) {
     EXPECT_EQ(table.text(), "A     B  C\nxxx~  y  zzz~\n") << "no cell is cut to nothing";
 }
 
+TEST(Table, KeepsTheEndsOfAColumnWhereThatIsSaid) {
+    Table table({"ID", "B", "C"});
+    table.keepEndsOf(0);
+    table.keepEndsOf(2);
+    table.add({"com.example.app00", "y", "abcdefgh"});
+    table.add({"a", "y", "z"});
+    table.fitInto(17);
+    EXPECT_EQ(table.text(), "ID      B  C\n~app00  y  ~defgh\na       y  z\n");
+}
+
+TEST(Text, TheEndOfATextIsCountedInCharacters) {
+    EXPECT_EQ(endOf("abc", 2), "bc");
+    EXPECT_EQ(endOf("abc", 9), "abc");
+    EXPECT_EQ(endOf("abc", 0), "");
+    EXPECT_EQ(endOf("\xc3\xa4\xc3\xb6\xc3\xbc", 2), "\xc3\xb6\xc3\xbc");
+}
+
 TEST(Text, AWordForTheShellIsQuotedWhereItMustBe) {
     EXPECT_EQ(shellWord("../my-device/a_1.zip"), "../my-device/a_1.zip");
     EXPECT_EQ(shellWord("my device"), "'my device'");

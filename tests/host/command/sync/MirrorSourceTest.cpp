@@ -38,6 +38,13 @@ TEST_F(MirrorSource, ADeviceIsNone) {
     }
 }
 
+TEST_F(MirrorSource, WhatIsLeftOfADeviceIsNone) {
+    const std::string lost = directory.path() + "/lost";
+    std::filesystem::create_directories(lost + "/root/var/mobile");
+    expectRefused(lost, "--mirror=empty", lost + " is a device and no library");
+    expectRefused(lost + "/root", "--mirror=empty", "which stands in a device");
+}
+
 TEST_F(MirrorSource, ABackupIsNone) {
     ASSERT_EQ(run({"backup", device, backup}), 0);
     for (const char* option : {"--mirror", "--mirror=empty", "--no-wait"}) {
