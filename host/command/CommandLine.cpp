@@ -151,7 +151,10 @@ class Commands {
             arguments.emplace_back("--help");
         }
         if (!arguments.empty() && isUnknownCommand(arguments.front())) {
-            return console_.fail(unknownCommand(app_, arguments.front()));
+            return console_.fail(comesLate(arguments)
+                                     ? wrongUsage("there is no command " + arguments.front(),
+                                                  "the command comes first, " + helpOf(app_))
+                                     : unknownCommand(app_, arguments.front()));
         }
         if (const Status given = checkValues(arguments); !given)
             return console_.fail(given.error());
@@ -192,6 +195,12 @@ class Commands {
         const auto known = app_.get_subcommands(
             [&name](const CLI::App* command) { return command->get_name() == name; });
         return !name.starts_with('-') && known.empty();
+    }
+
+    // Whether the command stands behind its first argument.
+    [[nodiscard]] bool comesLate(const std::vector<std::string>& words) const {
+        if (words.size() < 2 || words[0].empty() || words[1].starts_with('-')) return false;
+        return !isUnknownCommand(words[1]);
     }
 
     // Whether the words are a command, and a command of that one.

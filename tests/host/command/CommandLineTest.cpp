@@ -119,6 +119,7 @@ INSTANTIATE_TEST_SUITE_P(
         WrongUsage{{"data", "push", "device", "com.a"}, "FROM is required"},
         WrongUsage{{""}, "there is no command ''", ""},
         WrongUsage{{"help", "dance"}, "there is no command dance", ""},
+        WrongUsage{{"device", "apps"}, "no command device: the command comes first, see", ""},
         WrongUsage{{"help", "package", "dance"}, "no command dance of appsync package", "package"},
         WrongUsage{{"help", "sync", "extra"}, "no command extra of appsync sync", "sync"},
         WrongUsage{{"data", "dance"}, "there is no command dance of appsync data: see", "data"},
