@@ -138,8 +138,8 @@ void CoordinationService::start() {
 Status CoordinationService::create(const std::string& identifier, CoordinationClient client) {
     if (!isCoordinationEnabled()) {
         return coordinationError(CoordinationErrorCode::NotEnabled,
-                                 "installs are not coordinated on this device; set coordination=on "
-                                 "to have them coordinated");
+                                 "installs are not coordinated on this device; turn that on "
+                                 "(appsync set DEVICE coordination=on)");
     }
     return book_->create(identifier, client);
 }

@@ -260,7 +260,8 @@ Status requireNotRunning(Database& database, const std::string& identifier) {
     rows.bind(identifier);
     if (!rows.next()) return rows.status();
     return registryError(RegistryErrorCode::Running,
-                         identifier + " is running; quit it (appsync quit), and offload it then");
+                         identifier + " is running; quit it (appsync quit DEVICE " + identifier +
+                             "), and offload it then");
 }
 
 Result<BundleRow> findDemotable(const InstallContext& context, const std::string& identifier) {

@@ -95,9 +95,9 @@ Status requireAtRest(Database& database, const std::string& identifier) {
     Query rows = database.query("SELECT 1 FROM running WHERE identifier = ?");
     rows.bind(identifier);
     if (!rows.next()) return rows.status();
-    return registryError(
-        RegistryErrorCode::Running,
-        identifier + " is running; quit it (appsync quit), and replace its data then");
+    return registryError(RegistryErrorCode::Running,
+                         identifier + " is running; quit it (appsync quit DEVICE " + identifier +
+                             "), and replace its data then");
 }
 
 Status requireNoneWaiting(const InstallContext& context, Database& database,

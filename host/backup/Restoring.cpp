@@ -406,7 +406,7 @@ class Restoring {
         if (defect != defects_.end()) return defect->second;
         const Result<ApplicationStatus> status = device_.status(identifier);
         if (status && status->coordinator && status->coordinator->client != SyncClientID) {
-            return heldSentence(status->coordinator->client);
+            return heldSentence(identifier, status->coordinator->client);
         }
         if (status && status->lastFailure) return status->lastFailure->error.description();
         return "the device has made no placeholder of it: see appsync log";

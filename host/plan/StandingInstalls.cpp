@@ -131,7 +131,8 @@ class TakingUp {
                 return each.identifier == coordinator.identifier;
             });
         }
-        plan_.skipped.push_back({coordinator.identifier, heldSentence(coordinator.client), true});
+        plan_.skipped.push_back({coordinator.identifier,
+                                 heldSentence(coordinator.identifier, coordinator.client), true});
     }
 
     SyncPlan& plan_;
@@ -142,10 +143,11 @@ class TakingUp {
 
 }  // namespace
 
-std::string heldSentence(CoordinationClient client) {
+std::string heldSentence(const std::string& identifier, CoordinationClient client) {
     return "client " + std::to_string(client) +
            " of the coordination service has its install in hand: wait for that, or cancel it "
-           "with appsync coordinator";
+           "(appsync coordinator DEVICE cancel " +
+           identifier + ")";
 }
 
 std::optional<std::string> versionOfArrived(Device& device, const std::string& identifier) {

@@ -45,7 +45,7 @@ struct StandingRules {
                                                           const std::string& identifier);
 
 /// Why an application is left to another client.
-[[nodiscard]] std::string heldSentence(CoordinationClient client);
+[[nodiscard]] std::string heldSentence(const std::string& identifier, CoordinationClient client);
 
 /// Holds the plan against the coordinators that stand. Marks in it what has arrived, adds what the
 /// device installs though the plan has not asked for it, and skips what another client has in hand.

@@ -53,20 +53,27 @@ bool isOffloaded(const ApplicationRecord& placeholder) {
            placeholder.installType == kInstallTypeIntentionalDowngrade;
 }
 
+std::string commandToSend(const ApplicationRecord& placeholder) {
+    return "appsync send DEVICE " + placeholder.identifier + " FILE";
+}
+
 std::string whyNot(const Present& present, bool isCoordinated) {
     if (present.isSystem()) {
         const bool comesBack = present.placeholder != nullptr && isOffloaded(*present.placeholder);
-        return comesBack ? "it belongs to the system, and is offloaded: appsync send brings it back"
+        return comesBack ? "it belongs to the system, and is offloaded: " +
+                               commandToSend(*present.placeholder) + " brings it back"
                          : "it belongs to the system";
     }
     if (isOffloaded(*present.placeholder)) {
-        return "it is offloaded on the device: appsync send brings it back";
+        return "it is offloaded on the device: " + commandToSend(*present.placeholder) +
+               " brings it back";
     }
     if (present.placeholder->installType == kInstallTypeRestore) {
         return isCoordinated
                    ? "a restore brought it back, and its package is the store's to bring: "
                      "see appsync store"
-                   : "a restore brought it back: appsync send --restore brings its package";
+                   : "a restore brought it back: " + commandToSend(*present.placeholder) +
+                         " --restore brings its package";
     }
     return "another install of it is under way on the device";
 }

@@ -120,15 +120,18 @@ class Store {
             if (installed.contains(identifier) && !isOpen && !status->lastFailure) {
                 result_.kept.push_back(identifier);
             } else {
-                result_.failed.push_back({identifier, whyNot(*status)});
+                result_.failed.push_back({identifier, whyNot(identifier, *status)});
             }
         }
         return {};
     }
 
-    static std::string whyNot(const ApplicationStatus& status) {
+    static std::string whyNot(const std::string& identifier, const ApplicationStatus& status) {
         if (status.lastFailure) return status.lastFailure->error.description();
-        if (status.denial) return "it is running: quit it (appsync quit), and run the store again";
+        if (status.denial) {
+            return "it is running: quit it (appsync quit DEVICE " + identifier +
+                   "), and run the store again";
+        }
         return "the device has not installed it: see appsync why";
     }
 

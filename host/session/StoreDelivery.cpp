@@ -56,8 +56,9 @@ Status awaitPackage(InstallCoordinatorService& service, const ApplicationRecord&
     }
     InstallCoordinator& coordinator = *found.coordinator;
     if (coordinator.creatorIdentifier() != SyncClientID) {
-        return ErrorRecord::make(kCommandErrorDomain, kExitSomethingFailed,
-                                 heldSentence(coordinator.creatorIdentifier()));
+        return ErrorRecord::make(
+            kCommandErrorDomain, kExitSomethingFailed,
+            heldSentence(application.identifier, coordinator.creatorIdentifier()));
     }
     Status status;
     if (!coordinator.hasInstallOptions()) {

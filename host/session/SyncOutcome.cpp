@@ -132,7 +132,7 @@ class Summarizer {
         if (const auto cause = facts_.firstFailure(identifier)) return fail(identifier, *cause);
         if (aftermath_.failure) return fail(identifier, *aftermath_.failure);
         if (const auto client = facts_.holder(identifier)) {
-            summary_.skipped.push_back({identifier, heldSentence(*client), true});
+            summary_.skipped.push_back({identifier, heldSentence(identifier, *client), true});
             return;
         }
         if (!isAllowed) {

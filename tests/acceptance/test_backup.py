@@ -622,7 +622,7 @@ def test_damaged_package_is_not_sent_and_costs_nothing(appsync, used, tmp_path):
 
 def test_what_cannot_be_offloaded_is_refused_and_stays(appsync, used):
     appsync("run", used.path, IDS[0])
-    assert "appsync quit" in stripped(appsync("demote", used.path, IDS[0], expect=1).stderr)
+    assert "appsync quit DEVICE " + IDS[0] in stripped(appsync("demote", used.path, IDS[0], expect=1).stderr)
     assert IDS[0] in used.apps()
     appsync("quit", used.path, IDS[0])
     appsync("demote", used.path, IDS[0])

@@ -284,7 +284,7 @@ def test_offloaded_application_keeps_data_and_comes_back_by_send(appsync, used, 
         assert names_of(plan["install"]) == [IDS[2], IDS[3]]
     else:
         told = {each["identifier"]: each["why"] for each in plan["skipped"]}
-        assert "appsync send brings it back" in told[IDS[2]]
+        assert "appsync send DEVICE %s FILE brings it back" % IDS[2] in told[IDS[2]]
     appsync("send", used.path, IDS[2], os.path.join(store, IDS[2] + ".zip"))
     assert IDS[2] in used.apps() and data_of(used, IDS[2]) == {"notes": b"of an offloaded one"}
 

@@ -129,8 +129,9 @@ TEST(SyncPlan, NamesTheOneCommandThatBringsWhatItLeavesAlone) {
         placeholder("com.restoring", kInstallTypeRestore), system};
     const SyncPlan direct = makePlan(library, present, {});
     ASSERT_EQ(direct.skipped.size(), 2U);
-    EXPECT_THAT(direct.skipped[0].why, HasSubstr("appsync send --restore"));
-    EXPECT_THAT(direct.skipped[1].why, HasSubstr("appsync send brings it back"));
+    EXPECT_THAT(direct.skipped[0].why,
+                HasSubstr("appsync send DEVICE com.restoring FILE --restore brings"));
+    EXPECT_THAT(direct.skipped[1].why, HasSubstr(" FILE brings it back"));
     PlanOptions options;
     options.bringsOffloaded = true;
     const SyncPlan coordinated = makePlan(library, present, options);
