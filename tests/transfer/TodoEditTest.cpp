@@ -46,6 +46,33 @@ TEST_F(TodoEdit, SerialisesTheListOnlyForAnOperationThatItHasNotHeldYet) {
                   {todoEntry(kA, "INSTALLED"), todoEntry(kB, "INSTALLED"), todoEntry(kC, "SENT")}));
 }
 
+/// A codec as others may write it: with what is asked of every codec.
+class PlainCodec : public PropertyListSerialization {
+  public:
+    Result<PropertyList> parse(ByteView bytes) override { return codec_.parse(bytes); }
+    Result<Bytes> serialize(const PropertyList& value, PropertyListFormat format) override {
+        return codec_.serialize(value, format);
+    }
+
+  private:
+    SystemPropertyLists codec_;
+};
+
+TEST(TodoEditOfAPlainCodec, SerialisesTheListEachTime) {
+    PlainCodec codec;
+    SimulatedPlatform platform(codec);
+    const Bytes list = *codec.serialize(
+        PropertyList::array({PropertyList::map({{"identifier", "a"}, {"operation", "install"}})}),
+        PropertyListFormat::Binary);
+    platform.files.addFile(std::string(kTodoListPath), list);
+    const auto client = AppsClient::create(platform.services());
+    for (const std::string_view operation : {"SENT", "INSTALLED", "SENT"}) {
+        client->changeAssetID("a", operation);
+        EXPECT_EQ(client->_operationStateForIdentifier("a"), operation);
+    }
+    EXPECT_THAT(platform.callsTo({"PropertyListSerialization.serialize"}), SizeIs(3));
+}
+
 TEST_F(TodoEdit, SerialisesWhatSomebodyElseHasWritten) {
     setTodoList(PropertyList::array({todoEntry(kA, "install"), todoEntry(kB, "SENT")}));
     client_->changeAssetID(kA, "SENT");
