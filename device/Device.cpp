@@ -361,6 +361,7 @@ Status Device::forgetFailures(const std::set<std::string>& identifiers) {
 
 void Device::makeRoom(std::uint64_t bytes) {
     constexpr std::uint64_t kAllowance = std::uint64_t{1} << 20U;  // records, lists, the log
+    if (bytes == 0) return;
     if (state_->lock) makeRoomFor(state_->context, std::max(bytes, bytes + kAllowance));
 }
 

@@ -207,7 +207,8 @@ class Device {
     /// Nobody misses anything of these applications any more: their last failures are forgotten.
     Status forgetFailures(const std::set<std::string>& identifiers);
     /// Sees to it that so many bytes are free, and a little more for what goes along with them, as
-    /// far as giving up versions that are kept for a rollback can do that: the oldest first.
+    /// far as giving up versions that are kept for a rollback can do that: the oldest first. Of 0
+    /// bytes nothing is needed.
     void makeRoom(std::uint64_t bytes);
     /// Exchanges the application with the version that its last update has replaced; the data stays
     /// as it is. Refused while it runs or is being updated, and where nothing is kept of it.

@@ -11,6 +11,7 @@
 #include "device/database/DatabaseCopy.h"
 #include "device/database/DeviceSchema.h"
 #include "device/install/Containers.h"
+#include "device/install/KeptBundles.h"
 #include "device/values/DeviceError.h"
 #include "device/values/DevicePaths.h"
 #include "system/ActingAccount.h"
@@ -49,8 +50,9 @@ Status notADevice(const fs::path& device, std::string_view reason) {
 Status halfCreated(const fs::path& device, std::string_view absent) {
     return deviceError(DeviceErrorCode::HalfCreated,
                        "the device " + shown(device) + " is not whole: it has no " +
-                           std::string(absent) +
-                           "; remove the directory and create the device again");
+                           std::string(absent) + "; save what you want to keep of its " +
+                           std::string(kRootName) +
+                           ", remove the directory and create the device again");
 }
 
 Status checkRoot(const fs::path& device) {
@@ -176,6 +178,7 @@ Result<OpenedDevice> openDevice(const std::string& path, bool session, bool make
     if (status && session) status = requireWritable(device);
     if (status && session) status = takeLock(device, opened.lock);
     if (status && makesRoom) giveUpSpaceReserveIfFull(opened.path);
+    if (status && session) giveUpKeptIfFull(opened.path);
     if (status) status = openDatabase(device, session, opened);
     if (status) status = openFiles(device, opened);
     if (!status) return cannotUseDevice(path, status.error());

@@ -4,10 +4,15 @@
 #include <sys/stat.h>
 #include <sys/statvfs.h>
 
+#include <algorithm>
 #include <cerrno>
 #include <cstdio>
+#include <exception>
+#include <filesystem>
 #include <limits>
 #include <optional>
+#include <system_error>
+#include <utility>
 
 #include "device/database/Database.h"
 #include "device/database/DeviceDatabase.h"
@@ -24,7 +29,11 @@ namespace appsync {
 
 namespace {
 
+namespace fs = std::filesystem;
+
 constexpr mode_t kKeptMode = 0755;
+// The log and the log's index of a database that is opened and changed, with room.
+constexpr std::uint64_t kRoomOfDatabase = std::uint64_t{128} << 10U;
 
 std::optional<std::uint64_t> freeBytesAt(int directory) {
     struct statvfs space = {};
@@ -32,9 +41,34 @@ std::optional<std::uint64_t> freeBytesAt(int directory) {
     return std::uint64_t{space.f_bavail} * space.f_frsize;
 }
 
-Status renameBetween(int from, const std::string& name, int to, const std::string& newName) {
-    if (::renameat2(from, name.c_str(), to, newName.c_str(), RENAME_NOREPLACE) == 0) return {};
-    return posixError(errno, "move", name);
+// `path` is what an error names.
+Status renameBetween(int from, int to, const std::string& name, const std::string& path) {
+    if (::renameat2(from, name.c_str(), to, name.c_str(), RENAME_NOREPLACE) == 0) return {};
+    const int error = errno;
+    if (error != EACCES && error != EPERM) return posixError(error, "move", path);
+    return posixError(error, "move", path,
+                      "permission denied; let the device's owner write there, and try again");
+}
+
+std::string pathOfKept(const std::string& devicePath) {
+    return devicePath + "/" + std::string(kKeptDirectoryName);
+}
+
+/// The kept containers, the one first that was put there first.
+std::vector<std::string> containersByArrival(const std::string& directory) {
+    std::vector<std::pair<std::int64_t, std::string>> found;
+    std::error_code error;
+    if (!fs::is_directory(fs::symlink_status(directory, error))) return {};
+    for (fs::directory_iterator entry(directory, error), end; !error && entry != end;
+         entry.increment(error)) {
+        struct stat status = {};
+        if (::lstat(entry->path().c_str(), &status) != 0) continue;
+        found.emplace_back(status.st_ctim.tv_sec, entry->path().string());
+    }
+    std::sort(found.begin(), found.end());
+    std::vector<std::string> paths;
+    for (auto& [time, path] : found) paths.push_back(std::move(path));
+    return paths;
 }
 
 Status forgetAllKept(const InstallContext& context, const std::vector<std::string>& containers) {
@@ -54,7 +88,7 @@ Status KeptBundles::keep(const std::string& container) {
     if (!from) return from.error();
     const Result<UniqueFd> to = madeDirectory();
     if (!to) return to.error();
-    return renameBetween(from->directory.get(), container, to->get(), container);
+    return renameBetween(from->directory.get(), to->get(), container, keptPath(container));
 }
 
 Status KeptBundles::bringBack(const std::string& container) {
@@ -63,7 +97,7 @@ Status KeptBundles::bringBack(const std::string& container) {
     if (!from) return from.error();
     const Result<ItemPlace> to = files_.root().place(containerPath(container), "bring back");
     if (!to) return to.error();
-    return renameBetween(from->get(), container, to->directory.get(), container);
+    return renameBetween(from->get(), to->directory.get(), container, keptPath(container));
 }
 
 void KeptBundles::remove(const std::string& container) {
@@ -72,7 +106,8 @@ void KeptBundles::remove(const std::string& container) {
     const std::string path = std::string(kTemporaryDirectory) + "/" + container;
     const Result<ItemPlace> to = files_.root().place(path, "remove");
     if (!from || !to) return;
-    const Status moved = renameBetween(from->get(), container, to->directory.get(), container);
+    const Status moved =
+        renameBetween(from->get(), to->directory.get(), container, keptPath(container));
     if (moved) files_.removeItem(path).ignore();
 }
 
@@ -84,8 +119,12 @@ Result<std::vector<std::string>> KeptBundles::names() const {
     return opened.error();
 }
 
+std::string KeptBundles::keptPath(const std::string& container) const {
+    return pathOfKept(devicePath_) + "/" + container;
+}
+
 Result<UniqueFd> KeptBundles::directory() const {
-    const std::string path = devicePath_ + "/" + std::string(kKeptDirectoryName);
+    const std::string path = pathOfKept(devicePath_);
     const int flags = O_RDONLY | O_DIRECTORY | O_NOFOLLOW | O_CLOEXEC;
     UniqueFd opened(::open(path.c_str(), flags));
     if (!opened) return posixError(errno, "open", path);
@@ -95,7 +134,7 @@ Result<UniqueFd> KeptBundles::directory() const {
 Result<UniqueFd> KeptBundles::madeDirectory() const {
     Result<UniqueFd> opened = directory();
     if (opened || opened.error().code != ENOENT) return opened;
-    const std::string path = devicePath_ + "/" + std::string(kKeptDirectoryName);
+    const std::string path = pathOfKept(devicePath_);
     if (::mkdir(path.c_str(), kKeptMode) != 0 && errno != EEXIST) {
         return posixError(errno, "create", path);
     }
@@ -135,6 +174,23 @@ void makeRoomFor(const InstallContext& context, std::uint64_t bytes) {
     if (givenUp.empty()) return;
     context.kept.noteGivenUp();
     forgetAllKept(context, givenUp).ignore();
+}
+
+void giveUpKeptIfFull(const std::string& devicePath) noexcept {
+    try {
+        const UniqueFd device(::open(devicePath.c_str(), O_RDONLY | O_DIRECTORY | O_CLOEXEC));
+        const auto isFull = [&device] {
+            return freeBytesAt(device.get()).value_or(kRoomOfDatabase) < kRoomOfDatabase;
+        };
+        if (!device || !isFull()) return;
+        std::error_code error;
+        for (const std::string& container : containersByArrival(pathOfKept(devicePath))) {
+            fs::remove_all(container, error);
+            if (!isFull()) return;
+        }
+    } catch (const std::exception&) {
+        return;  // what comes next tells that the disk is full
+    }
 }
 
 bool makesRoomAfter(const InstallContext& context, const ErrorRecord& failure) {

@@ -43,6 +43,7 @@ class KeptBundles {
     [[nodiscard]] bool gaveUp() const noexcept { return gaveUp_; }
 
   private:
+    [[nodiscard]] std::string keptPath(const std::string& container) const;
     [[nodiscard]] Result<UniqueFd> directory() const;
     [[nodiscard]] Result<UniqueFd> madeDirectory() const;
 
@@ -58,6 +59,11 @@ void putAway(const InstallContext& context, const FreedContainers& freed);
 /// Gives up versions that are kept, the oldest first, until that many bytes are free on the
 /// device's disk; none where they are. Only while the session's lock is held.
 void makeRoomFor(const InstallContext& context, std::uint64_t bytes);
+
+/// For a device that is about to be opened, whose lock is held: on a disk where not even its
+/// database can be written, gives up what is kept, what was put there first first, until that can
+/// be. The records follow when the device is put in order. Never fails.
+void giveUpKeptIfFull(const std::string& devicePath) noexcept;
 
 /// After something found no space: gives up all that is kept. Whether it is worth another try,
 /// because something was given up since the session began.

@@ -5,6 +5,7 @@
 
 #include <cerrno>
 
+#include "device/database/CoordinationTables.h"
 #include "device/database/Database.h"
 #include "device/database/DeviceDatabase.h"
 #include "device/database/RegistryTables.h"
@@ -267,6 +268,7 @@ Status requireNotRunning(Database& database, const std::string& identifier) {
 Result<BundleRow> findDemotable(const InstallContext& context, const std::string& identifier) {
     std::optional<BundleRow> application;
     std::optional<BundleRow> covering;
+    bool isCoordinated = false;
     const Status status = context.database.read([&](Database& database) -> Status {
         auto placeholder = findBundle(database, BundleTable::Placeholders, identifier);
         if (!placeholder) return placeholder.error();
@@ -274,11 +276,14 @@ Result<BundleRow> findDemotable(const InstallContext& context, const std::string
         auto row = findBundle(database, BundleTable::Applications, identifier);
         if (!row) return row.error();
         application = std::move(*row);
+        const auto coordinator = findCoordinator(database, identifier);
+        if (!coordinator) return coordinator.error();
+        isCoordinated = coordinator->has_value();
         return requireNotRunning(database, identifier);
     });
     if (!status) return asRegistryStatus(status).error();
     if (!application) return notInstalled(identifier, covering);
-    if (!covering) return *std::move(application);
+    if (!covering && !isCoordinated) return *std::move(application);
     return registryError(
         RegistryErrorCode::UpdateUnderWay,
         "an update of " + identifier + " is under way; let a sync finish it, and offload it then");

@@ -20,6 +20,7 @@
 #include "device/values/PackageIdentifier.h"
 #include "device/values/WallClock.h"
 #include "platform/InstallProgressRecord.h"
+#include "system/PosixError.h"
 #include "system/RootDirectory.h"
 #include "system/RootedFileSystem.h"
 #include "system/TemporaryFile.h"
@@ -97,7 +98,7 @@ Status noteLost(Database& database, const std::string& identifier) {
 class KeptComparison {
   public:
     KeptComparison(const InstallContext& context, const std::unordered_set<std::string>& bundles,
-                   const std::unordered_set<std::string>& recorded)
+                   std::unordered_set<std::string>& recorded)
         : context_(context), bundles_(bundles), recorded_(recorded) {}
 
     Status run() {
@@ -129,15 +130,19 @@ class KeptComparison {
         });
     }
 
-    // Whoever was to put it there did not come to that.
+    // Whoever was to put it there did not come to that. Where it cannot be put there now either, it
+    // is kept where it lies.
     bool putInPlace(const std::string& container) {
-        const bool isStray = bundles_.contains(container) && !recorded_.contains(container);
-        return isStray && context_.kept.keep(container);
+        if (!bundles_.contains(container) || recorded_.contains(container)) return false;
+        const Status kept = context_.kept.keep(container);
+        if (!kept && isInTheWay(kept.error())) return false;
+        if (!kept) recorded_.insert(container);
+        return true;
     }
 
     const InstallContext& context_;
     const std::unordered_set<std::string>& bundles_;
-    const std::unordered_set<std::string>& recorded_;
+    std::unordered_set<std::string>& recorded_;
     std::unordered_set<std::string> onDisk_;
     std::vector<std::string> kept_;
 };

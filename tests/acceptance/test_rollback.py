@@ -7,6 +7,7 @@ import pytest
 
 import packages
 from conftest import ON_ONE_PATH, Device
+from test_device import in_own_mounts
 
 A, B = "com.example.orbit", "com.example.atlas"
 BUNDLE = "Orbit.app"
@@ -180,3 +181,32 @@ def test_a_backup_has_nothing_of_it(appsync, updated, tmp_path, coordination):
     fresh = Device(appsync, tmp_path / "fresh", coordination)
     appsync("restore", fresh.path, tmp_path / "with")
     assert kept_folders(fresh) == [] and appsync.json("status", fresh.path)["kept"] == 0
+
+
+def test_on_a_full_disk_what_is_kept_goes_for_what_comes(appsync, tmp_path):
+    """And for nothing else: a sync that has nothing to do takes nothing."""
+    for version, size in (("1.0", 300_000), ("2.0", 300_000), ("3.0", 100_000)):
+        for identifier in (A, B):
+            packages.make_package(str(tmp_path / version), identifier, version, payload=os.urandom(size))
+    disk = tmp_path / "disk"
+    disk.mkdir()
+    script = """
+mount -t tmpfs -o size=5m tmpfs {disk} && {appsync} create {disk}/d >/dev/null || exit 1
+for version in 1.0 2.0; do {appsync} sync {disk}/d {libraries}/$version >/dev/null; done
+head -c 700000 /dev/zero >{disk}/spare
+cat /dev/zero >{disk}/filler 2>/dev/null
+rm {disk}/spare
+{appsync} sync {disk}/d {libraries}/2.0 2>/dev/null; echo status $?
+{appsync} sync {disk}/d {libraries}/3.0 --only com.example.nosuch >/dev/null 2>&1
+{appsync} apps {disk}/d
+cat /dev/zero >>{disk}/filler 2>/dev/null
+{appsync} sync {disk}/d {libraries}/3.0 --only {b} >/dev/null; echo status $?
+{appsync} apps {disk}/d
+""".format(disk=disk, appsync=appsync.program, libraries=tmp_path, b=B)
+    done = in_own_mounts(script)
+    said = done.stdout.splitlines()
+    assert [line for line in said if line.startswith("status")] == ["status 0"] * 2, done.stdout + done.stderr
+    second = said.index("status 0", said.index("status 0") + 1)
+    before, after = said[:second], said[second:]
+    assert [line.split()[-1] for line in before if line.startswith("com.example.")] == ["1.0", "1.0"], done.stdout
+    assert [line.split()[1] for line in after if line.startswith(B)] == ["3.0"], done.stdout

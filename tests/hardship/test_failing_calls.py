@@ -40,6 +40,7 @@ OF_THE_DATABASE = {
     "ENFILE": CANNOT_OPEN,
     "EACCES": CANNOT_OPEN,
 }
+NEVER_CALLED = {("rollback", "mkdir-ENOSPC")}  # the directory of what is kept was made by the update
 SHARE = 40  # of the combinations of scenario and fault, one call each, in the short form
 
 
@@ -50,7 +51,7 @@ def chosen(count, label):
 
 
 def combinations():
-    every = list(itertools.product(SCENARIOS, FAULTS, [False, True]))
+    every = [each for each in itertools.product(SCENARIOS, FAULTS, [False, True]) if each[:2] not in NEVER_CALLED]
     return every if IS_LONG else random.Random(SEED).sample(every, SHARE)
 
 
@@ -127,6 +128,7 @@ def test_a_failing_call_is_told_and_survived(meddling, prepared, name, fault, ev
     scenario, expected = prepared(name)
     calls, error = FAULTS[fault]
     count = scenario.meddled("--calls", calls).count
+    assert count > 0, "no such call is made"
     options = ["--calls", calls, "--fail", error] + (["--ever"] if ever else [])
     problems = []
     for number in chosen(count, "%s %s %s" % (name, fault, ever)):

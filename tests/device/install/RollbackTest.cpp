@@ -1,5 +1,6 @@
 #include <algorithm>
 #include <filesystem>
+#include <fstream>
 #include <limits>
 
 #include "device/values/DevicePaths.h"
@@ -276,6 +277,43 @@ TEST_F(RollbackTest, whatSomebodyHasTakenAwayIsNotKept) {
     EXPECT_EQ(program(), "program 2.0");
 }
 
+TEST_F(RollbackTest, whatIsDamagedIsNotInstalledAndNotRemoved) {
+    update();
+    const std::string info = keptPath(kept().front()) + "/App.app/Info.plist";
+    ASSERT_TRUE(fs::exists(info));
+    fs::rename(info, path("info"));
+    const auto refused = device().rollBack(kAtlas);
+    ASSERT_FALSE(refused);
+    EXPECT_TRUE(isRegistryError(refused.error(), RegistryErrorCode::NothingKept));
+    EXPECT_THAT(refused.error().description(), testing::HasSubstr("Info.plist cannot be read"));
+    EXPECT_EQ(program(), "program 2.0");
+    std::ofstream(info) << "stray";
+    EXPECT_FALSE(device().rollBack(kAtlas));
+    fs::rename(path("info"), info);
+    EXPECT_TRUE(device().rollBack(kAtlas));
+    EXPECT_EQ(program(), "program 1.0");
+}
+
+TEST_F(RollbackTest, whatCouldNotBePutAwayIsKeptWhereItLies) {
+    update();
+    moveBackToBundles();
+    EXPECT_TRUE(device().rollBack(kAtlas)) << "in the session of the update";
+    EXPECT_EQ(program(), "program 1.0");
+    EXPECT_EQ(keptVersion(), "2.0");
+}
+
+TEST_F(RollbackTest, anUpdateByAnotherClientIsUnderWay) {
+    update();
+    sql("INSERT INTO coordinators (identifier, kind, client, created) VALUES"
+        " ('com.example.atlas', 2, 2, 0)");
+    const auto refused = device().rollBack(kAtlas);
+    ASSERT_FALSE(refused);
+    EXPECT_TRUE(isRegistryError(refused.error(), RegistryErrorCode::UpdateUnderWay));
+    EXPECT_TRUE(refusedBy(device().demote(kAtlas, DemotedBy::Person),
+                          RegistryErrorCode::UpdateUnderWay, "under way"));
+    EXPECT_EQ(keptVersion(), "1.0");
+}
+
 TEST_F(RollbackTest, anAlteredRecordDoesNotTouchWhatIsInstalled) {
     update();
     sql("UPDATE kept SET container = (SELECT container FROM applications)");
@@ -292,6 +330,7 @@ TEST_F(RollbackTest, anAlteredRecordDoesNotTouchWhatIsInstalled) {
 TEST_F(RollbackTest, whatIsKeptGoesWhenTheRoomIsNeeded) {
     update();
     update(kBrook);
+    device().makeRoom(0);
     device().makeRoom(1);
     EXPECT_EQ(keptVersion(), "1.0") << "or the test's own disk is about full";
     device().makeRoom(kMoreThanThereIs);
