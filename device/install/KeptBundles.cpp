@@ -67,6 +67,7 @@ std::vector<std::string> containersByArrival(const std::string& directory) {
     }
     std::sort(found.begin(), found.end());
     std::vector<std::string> paths;
+    paths.reserve(found.size());
     for (auto& [time, path] : found) paths.push_back(std::move(path));
     return paths;
 }

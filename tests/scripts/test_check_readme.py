@@ -75,3 +75,19 @@ def test_a_command_that_fails_is_found(differences):
 def test_readme_has_such_a_session():
     readme = pathlib.Path(check_readme.README).read_text().splitlines()
     assert len(check_readme.steps_of(readme)) > 20
+
+
+MORE_PROGRESS = """\
+## A first session
+    $ printf '%s\\n' 'transfer a: 50 % (1 B of 2 B)' 'transfer a: 100 % (2 B of 2 B)' done 'install a: 50 % (1 B of 2 B)'
+    transfer a: 100 % (2 B of 2 B)
+    done
+"""
+
+
+def test_a_slow_machine_may_tell_more_of_progress(differences):
+    assert differences(MORE_PROGRESS) == []
+
+
+def test_other_lines_may_not_come_beside_progress(differences):
+    assert differences(MORE_PROGRESS.replace(" done ", " done too ")) != []
