@@ -21,6 +21,7 @@
 #include "device/install/Containers.h"
 #include "device/install/DurabilityBarrier.h"
 #include "device/install/InstallContext.h"
+#include "device/install/JointCommits.h"
 #include "device/install/KeptBundles.h"
 #include "device/install/PlaceholderInstall.h"
 #include "device/install/ProgressBook.h"
@@ -71,6 +72,7 @@ struct Device::State {
           files(std::move(opened.files)),
           database(std::move(opened.database)),
           barrier(files->root().descriptor()),
+          commits(barrier, *database),
           containers(*files),
           kept(*files, path),
           progress(*database, [this] { registry.touch(); }),
@@ -93,11 +95,12 @@ struct Device::State {
     const std::unique_ptr<RootedFileSystem> files;
     const std::unique_ptr<DeviceDatabase> database;
     DurabilityBarrier barrier;
+    JointCommits commits;
     Containers containers;
     KeptBundles kept;
     ProgressBook progress;
-    const InstallContext context{*database,     *files, containers,       kept, barrier, progress,
-                                 propertyLists, boot,   options.keepsData};
+    const InstallContext context{*database, *files,   containers,    kept, barrier,
+                                 commits,   progress, propertyLists, boot, options.keepsData};
     DeviceRegistry registry;
     DevicePolicy policy;
     DeviceInstaller installer;

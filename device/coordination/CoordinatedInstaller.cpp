@@ -18,8 +18,9 @@ namespace appsync {
 
 namespace {
 
-/// So many installs at a time: enough to share syncs and commits.
-constexpr std::size_t kWorkers = 4;
+/// So many installs at a time, as many as on the direct path: most of them wait for the disk, and
+/// the more wait, the more share a sync and a commit.
+constexpr std::size_t kWorkers = 10;
 constexpr std::chrono::milliseconds kWatchInterval{100};
 /// Why the service wants an application to end: the reason that every install gives.
 constexpr std::uint64_t kAssertionReason = 1;

@@ -90,14 +90,34 @@ Status DeviceDatabase::read(const Reading& reading) {
 }
 
 Status DeviceDatabase::change(Durability durability, const Change& change) {
-    if (!writer_) return noteFailure(*whyNotWritable_);
-    Waiting own{change, durability};
+    std::vector<Joint> changes;
+    changes.push_back({change, {}});
+    changeAll(durability, changes);
+    return std::move(changes.front().status);
+}
+
+void DeviceDatabase::changeAll(Durability durability, std::vector<Joint>& changes) {
+    std::vector<Waiting> own;
+    own.reserve(changes.size());
+    for (const Joint& each : changes) own.push_back({each.change, durability});
+    if (writer_) {
+        makeInTurn(own);
+    } else {
+        for (Waiting& each : own) each.status = *whyNotWritable_;
+    }
+    for (std::size_t index = 0; index < own.size(); ++index) {
+        changes[index].status = noteFailure(std::move(own[index].status));
+    }
+}
+
+// They enter the queue together, and so they leave it.
+void DeviceDatabase::makeInTurn(std::vector<Waiting>& own) {
+    if (own.empty()) return;
+    const Waiting& first = own.front();
     std::unique_lock lock(mutex_);
-    queue_.push_back(&own);
-    turn_.wait(lock, [&] { return own.done || (queue_.front() == &own && !isFrozen_); });
-    if (!own.done) lead(lock);
-    lock.unlock();
-    return noteFailure(std::move(own.status));
+    for (Waiting& each : own) queue_.push_back(&each);
+    turn_.wait(lock, [&] { return first.done || (queue_.front() == &first && !isFrozen_); });
+    if (!first.done) lead(lock);
 }
 
 // Commits for everybody in the queue, the caller being the first of them.

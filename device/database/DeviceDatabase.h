@@ -72,6 +72,15 @@ class DeviceDatabase {
     /// sees it once the call has returned.
     Status change(Durability durability, const Change& change);
 
+    /// One of several changes that come together.
+    struct Joint {
+        const Change& change;
+        Status status;  // what became of it
+    };
+    /// As many calls of `change` that come at the same time: one transaction, and each change is
+    /// made whole or not at all, whatever becomes of the others.
+    void changeAll(Durability durability, std::vector<Joint>& changes);
+
     /// Leaves a change for later: it goes with the next change of anyone's, at the latest a tenth
     /// of a second from now. It runs after those that were left before it. What fails is dropped,
     /// and a crash may lose it. It may run after this call has returned.
@@ -95,6 +104,7 @@ class DeviceDatabase {
     [[nodiscard]] static Result<std::unique_ptr<DeviceDatabase>> openCopy(
         const std::string& path, const ErrorRecord& whyNotWritable);
 
+    void makeInTurn(std::vector<Waiting>& own);
     void lead(std::unique_lock<std::mutex>& lock);
     void commitTogether(const std::vector<Waiting*>& batch, const std::vector<Change>& later);
     Status beginTransaction(Durability durability);

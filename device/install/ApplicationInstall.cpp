@@ -9,8 +9,8 @@
 #include "device/database/DeviceDatabase.h"
 #include "device/database/RegistryTables.h"
 #include "device/install/Containers.h"
-#include "device/install/DurabilityBarrier.h"
 #include "device/install/InstallContext.h"
+#include "device/install/JointCommits.h"
 #include "device/install/KeptBundles.h"
 #include "device/install/ProgressBook.h"
 #include "device/install/RestoreData.h"
@@ -58,26 +58,6 @@ Status unpack(const NewContainer& container, PackageReader& reader, InstallProgr
     return reader.unpackInto(container.descriptor(), options);
 }
 
-// After a failed sync nobody knows what is on disk, so everything is written anew, once.
-Result<NewContainer> unpackDurably(const InstallContext& context, const std::string& identifier,
-                                   PackageReader& reader) {
-    const std::shared_ptr<InstallProgressRecord> record = context.progress.record(identifier);
-    for (bool again : {true, false}) {
-        makeRoomFor(context, reader.info().unpackedBytes);
-        Result<NewContainer> container = context.containers.make();
-        if (!container) return container;
-        Status status = checkSpace(container->descriptor(), identifier, reader.info());
-        if (status) status = unpack(*container, reader, record.get());
-        // Other installs that came at the same time may have taken the room.
-        if (!status && again && makesRoomAfter(context, status.error())) continue;
-        if (!status) return status.error();
-        status = context.barrier.pass();
-        if (status) return container;
-        if (!again) return status.error();
-    }
-    return posixError(EIO, "unpack", identifier);
-}
-
 BundleRow rowOf(const PackageInfo& info, const NewContainer& container, std::uint64_t installType) {
     BundleRow row;
     row.identifier = info.identifier;
@@ -106,21 +86,44 @@ Status refuseIfUninstalled(Database& database, const std::string& identifier) {
                              "again to bring it back");
 }
 
-Status commitInstall(const InstallContext& context, const PackageInfo& info,
-                     NewContainer& container, std::uint64_t installType,
-                     const AlsoCommitted& alsoCommitted) {
+JointCommits::Outcome commitInstall(const InstallContext& context, const PackageInfo& info,
+                                    NewContainer& container, std::uint64_t installType,
+                                    const AlsoCommitted& alsoCommitted) {
     const BundleRow row = rowOf(info, container, installType);
     FreedContainers freed;
-    const Status committed = context.database.change(Durability::OnDisk, [&](Database& database) {
+    JointCommits::Outcome outcome = context.commits.commit([&](Database& database) {
         Status committing = refuseIfUninstalled(database, row.identifier);
         if (committing) committing = recordInstalled(database, row, freed);
         return committing && alsoCommitted ? alsoCommitted(database) : committing;
     });
-    if (!committed) return asRegistryStatus(committed);
+    if (!outcome.synced) return outcome;
+    if (!outcome.committed) return {{}, asRegistryStatus(std::move(outcome.committed))};
     container.keep();
     context.progress.forget(info.identifier, kInstallStateFinished);
     putAway(context, freed);
-    return {};
+    return outcome;
+}
+
+// After a failed sync nobody knows what is on disk, so everything is written anew, once.
+Status unpackAndCommit(const InstallContext& context, const std::string& identifier,
+                       PackageReader& reader, std::uint64_t installType,
+                       const AlsoCommitted& alsoCommitted) {
+    const std::shared_ptr<InstallProgressRecord> record = context.progress.record(identifier);
+    for (bool again : {true, false}) {
+        makeRoomFor(context, reader.info().unpackedBytes);
+        Result<NewContainer> container = context.containers.make();
+        if (!container) return container.error();
+        Status status = checkSpace(container->descriptor(), identifier, reader.info());
+        if (status) status = unpack(*container, reader, record.get());
+        // Other installs that came at the same time may have taken the room.
+        if (!status && again && makesRoomAfter(context, status.error())) continue;
+        if (!status) return status;
+        JointCommits::Outcome outcome =
+            commitInstall(context, reader.info(), *container, installType, alsoCommitted);
+        if (outcome.synced) return std::move(outcome.committed);
+        if (!again) return std::move(outcome.synced);
+    }
+    return posixError(EIO, "unpack", identifier);
 }
 
 }  // namespace
@@ -132,9 +135,7 @@ Status installApplicationWith(const InstallContext& context, const std::string& 
     if (!reader) return reader.error();
     // Before the sync that the unpacked package goes through, which makes the data durable, too.
     if (Status status = placeRestoredData(context, identifier); !status) return status;
-    Result<NewContainer> container = unpackDurably(context, identifier, *reader);
-    if (!container) return container.error();
-    Status status = commitInstall(context, reader->info(), *container, installType, alsoCommitted);
+    Status status = unpackAndCommit(context, identifier, *reader, installType, alsoCommitted);
     if (status) dropRestoredData(context, identifier);
     return status;
 }

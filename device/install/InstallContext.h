@@ -9,8 +9,8 @@
 //     Rollback.h             the version before an update comes back
 //
 // They share Containers.h (the directories of bundles), KeptBundles.h (those of versions that were
-// replaced), DurabilityBarrier.h (syncs that threads share) and ProgressBook.h (how far each
-// install is).
+// replaced), DurabilityBarrier.h (syncs that threads share), JointCommits.h (transactions of
+// installs that end together) and ProgressBook.h (how far each install is).
 //
 // After a crash or a session that was cut off, Reconciliation.h and CoordinationRecovery.h remove
 // what neither database nor disk can account for (docs/device-format.md). Who may call it when is
@@ -28,6 +28,7 @@ class Containers;
 class Database;
 class DeviceDatabase;
 class DurabilityBarrier;
+class JointCommits;
 class KeptBundles;
 class ProgressBook;
 class PropertyListSerialization;
@@ -40,6 +41,7 @@ struct InstallContext {
     Containers& containers;
     KeptBundles& kept;
     DurabilityBarrier& barrier;
+    JointCommits& commits;
     ProgressBook& progress;
     PropertyListSerialization& propertyLists;
     /// Names this boot of the machine; empty when it is not known.

@@ -4,15 +4,18 @@
 #include <latch>
 #include <thread>
 
+#include "device/database/Database.h"
 #include "device/database/DeviceDatabase.h"
 #include "device/install/ApplicationInstall.h"
 #include "device/install/Containers.h"
 #include "device/install/DurabilityBarrier.h"
 #include "device/install/InstallContext.h"
+#include "device/install/JointCommits.h"
 #include "device/install/KeptBundles.h"
 #include "device/install/ProgressBook.h"
 #include "device/install/Rollback.h"
 #include "device/values/DevicePaths.h"
+#include "system/PosixError.h"
 #include "system/RootedFileSystem.h"
 #include "system/property_list/PropertyListCodec.h"
 #include "tests/device/DeviceFixture.h"
@@ -93,14 +96,105 @@ class FailingDiskTest : public DeviceFixture {
         auto files = RootedFileSystem::open(rootPath(""), {{}, std::string(kTemporaryDirectory)});
         Containers containers(**files);
         KeptBundles kept(**files, devicePath());
+        JointCommits commits(barrier, **database);
         ProgressBook progress(**database, {});
         SystemPropertyLists propertyLists;
         const std::string boot;
-        const InstallContext context{**database, **files,  containers,    kept,
-                                     barrier,    progress, propertyLists, boot};
+        const InstallContext context{**database, **files,  containers,    kept, barrier,
+                                     commits,    progress, propertyLists, boot};
         return work(context);
     }
 };
+
+/// Changes that come together, on a device whose disk fails as a test wants it.
+class JointCommitsTest : public DeviceFixture {
+  protected:
+    void SetUp() override {
+        DeviceFixture::SetUp();
+        close();
+        auto opened = DeviceDatabase::open(devicePath(kDatabaseName));
+        ASSERT_TRUE(opened);
+        database_ = std::move(*opened);
+    }
+
+    static JointCommits::Change uninstalled(const std::string& identifier) {
+        return [identifier](Database& database) {
+            return database.query("INSERT INTO uninstalled (identifier, time) VALUES (?, 0)")
+                .bind(identifier)
+                .run();
+        };
+    }
+
+    bool isThere(const std::string& identifier) {
+        bool found = false;
+        const Status read = database_->read([&](Database& database) {
+            Query rows = database.query("SELECT 1 FROM uninstalled WHERE identifier = ?");
+            rows.bind(identifier);
+            found = rows.next();
+            return rows.status();
+        });
+        EXPECT_TRUE(succeeded(read));
+        return found;
+    }
+
+    std::unique_ptr<DeviceDatabase> database_;
+};
+
+TEST_F(JointCommitsTest, eachIsSyncedBeforeItsChangeIsMadeAndIsThereAfterTheCall) {
+    std::atomic<int> written{0};
+    std::atomic<int> durable{0};
+    DurabilityBarrier barrier([&] {
+        const int seen = written;
+        std::this_thread::yield();
+        durable = seen;
+        return 0;
+    });
+    JointCommits commits(barrier, *database_);
+    std::vector<std::thread> threads;
+    for (int thread = 0; thread < 8; ++thread) {
+        threads.emplace_back([&, thread] {
+            for (int round = 0; round < 10; ++round) {
+                const std::string name = "t" + std::to_string(thread) + "." + std::to_string(round);
+                const int mine = ++written;
+                const auto outcome = commits.commit([&](Database& database) {
+                    EXPECT_GE(durable.load(), mine);
+                    return uninstalled(name)(database);
+                });
+                EXPECT_TRUE(succeeded(outcome.synced));
+                EXPECT_TRUE(succeeded(outcome.committed));
+                EXPECT_TRUE(isThere(name));
+            }
+        });
+    }
+    for (std::thread& thread : threads) thread.join();
+    EXPECT_LE(barrier.syncs(), 80U);
+}
+
+TEST_F(JointCommitsTest, withoutASyncNothingChanges) {
+    DurabilityBarrier barrier([] { return EIO; });
+    JointCommits commits(barrier, *database_);
+    const auto outcome = commits.commit(uninstalled(kAtlas));
+    ASSERT_FALSE(outcome.synced);
+    EXPECT_EQ(outcome.synced.error().code, EIO);
+    EXPECT_FALSE(isThere(kAtlas));
+}
+
+TEST_F(JointCommitsTest, aChangeThatFailsTakesNoOtherAlong) {
+    const DeviceDatabase::Change fails = [](Database& database) {
+        const Status made = uninstalled("com.example.lost")(database);
+        return made ? Status(posixError(EPERM, "change", "the test's database")) : made;
+    };
+    const DeviceDatabase::Change works = uninstalled(kAtlas);
+    std::vector<DeviceDatabase::Joint> changes;
+    changes.push_back({fails, {}});
+    changes.push_back({works, {}});
+    database_->changeAll(Durability::OnDisk, changes);
+    ASSERT_FALSE(changes[0].status);
+    EXPECT_EQ(changes[0].status.error().code, EPERM);
+    EXPECT_TRUE(succeeded(changes[1].status));
+    EXPECT_FALSE(isThere("com.example.lost"));
+    EXPECT_TRUE(isThere(kAtlas));
+}
 
 TEST_F(FailingDiskTest, afterAFailedSyncTheFilesAreWrittenAnew) {
     ASSERT_TRUE(succeeded(install(kAtlas, "1.0")));
