@@ -17,6 +17,7 @@
 #include "host/command/CommandLine.h"
 #include "host/console/Console.h"
 #include "host/console/Problem.h"
+#include "system/AllocatorTuning.h"
 
 namespace {
 
@@ -71,6 +72,7 @@ int afterOutput(const appsync::Console& console, int status) {
 }  // namespace
 
 int main(int argumentCount, char** arguments) {
+    appsync::tuneAllocator();
     // Neither a reader that goes away (| head) nor a limit on the size of files may end a session
     // in its middle: both are errors of the write.
     std::signal(SIGPIPE, SIG_IGN);
