@@ -3,7 +3,7 @@
 // bytes. Files are written to the working directory: it should be on a disk.
 //
 // Names: planning/N, coordinating/N, restoring/N, restoringCoordinated/N (one call with N
-// applications), todoListEdit, todoListPlainRewrite.
+// applications), todoListEdit/N, todoListPlainRewrite/N (a list of N entries).
 
 #include <benchmark/benchmark.h>
 #include <fcntl.h>
@@ -25,8 +25,6 @@
 
 namespace appsync {
 namespace {
-
-constexpr int kEditedListLength = 1000;
 
 std::string identifierOf(int number) { return "com.example.application" + std::to_string(number); }
 
@@ -162,21 +160,24 @@ Platform withRealFiles(SimulatedPlatform& simulated, FileSystem& files,
         all.queues, files,      propertyLists,  all.notifications, all.notificationCenter};
 }
 
-Bytes encodedTodoList() {
-    return *SystemPropertyLists().serialize(todoListOf(kEditedListLength),
-                                            PropertyListFormat::Binary);
+Bytes encodedTodoList(int length) {
+    return *SystemPropertyLists().serialize(todoListOf(length), PropertyListFormat::Binary);
 }
 
 void todoListEdit(benchmark::State& state) {
+    const int length = static_cast<int>(state.range(0));
     const ScratchDirectory scratch;
     const auto files = *RootedFileSystem::open(scratch.path());
     files->createDirectory(std::string(kTodoDirectory), true, nullptr).ignore();
-    files->writeFileAtomically(std::string(kTodoListPath), encodedTodoList()).ignore();
+    files->writeFileAtomically(std::string(kTodoListPath), encodedTodoList(length)).ignore();
     SystemPropertyLists codec;
     SimulatedPlatform simulated(codec);
     simulated.recorder.setEnabled(false);
     const auto client = AppsClient::create(withRealFiles(simulated, *files, codec));
-    const std::string identifier = identifierOf(kEditedListLength / 2);
+    const std::string identifier = identifierOf(length / 2);
+    // Others are on their way, too.
+    client->changeAssetID(identifierOf(0), kTodoSent);
+    client->changeAssetID(identifierOf(1), kTodoDownloaded);
     bool sent = false;
     for (auto _ : state) {
         sent = !sent;
@@ -185,7 +186,7 @@ void todoListEdit(benchmark::State& state) {
     const auto operation = client->_operationStateForIdentifier(identifier);
     if (operation != (sent ? kTodoSent : kTodoDownloaded)) state.SkipWithError("not edited");
 }
-BENCHMARK(todoListEdit)->Unit(benchmark::kMicrosecond)->UseRealTime();
+BENCHMARK(todoListEdit)->Arg(1000)->Arg(10000)->Unit(benchmark::kMicrosecond)->UseRealTime();
 
 bool rewrite(const std::string& temporary, const std::string& target, const Bytes& bytes) {
     const int file = ::open(temporary.c_str(), O_WRONLY | O_CREAT | O_TRUNC | O_CLOEXEC, 0644);
@@ -199,14 +200,18 @@ bool rewrite(const std::string& temporary, const std::string& target, const Byte
 
 void todoListPlainRewrite(benchmark::State& state) {
     const ScratchDirectory scratch;
-    const Bytes bytes = encodedTodoList();
+    const Bytes bytes = encodedTodoList(static_cast<int>(state.range(0)));
     const std::string target = scratch.path() + "/list";
     for (auto _ : state) {
         if (!rewrite(target + ".new", target, bytes)) state.SkipWithError("not written");
     }
     state.SetBytesProcessed(state.iterations() * static_cast<std::int64_t>(bytes.size()));
 }
-BENCHMARK(todoListPlainRewrite)->Unit(benchmark::kMicrosecond)->UseRealTime();
+BENCHMARK(todoListPlainRewrite)
+    ->Arg(1000)
+    ->Arg(10000)
+    ->Unit(benchmark::kMicrosecond)
+    ->UseRealTime();
 
 }  // namespace
 }  // namespace appsync
