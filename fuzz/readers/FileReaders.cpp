@@ -162,20 +162,21 @@ Reading readManifest(ByteView bytes) {
 
 Reading readLibraryIndex(ByteView bytes) {
     constexpr std::size_t kSumLength = 64;
+    constexpr std::size_t kNoFolderLength = 8;
     RunningSum sum;
     sum.add(bytes);
     Bytes index = indexBytes({});
-    index.resize(index.size() - kSumLength);
+    index.resize(index.size() - kNoFolderLength - kSumLength);
     for (const char digit : sum.finish()) index.push_back(static_cast<std::uint8_t>(digit));
     index.insert(index.end(), bytes.begin(), bytes.end());
-    const auto packages = readIndex(index);
-    if (!packages) return Reading::refused("it is no index");
+    const auto contents = readIndex(index);
+    if (!contents) return Reading::refused("it is no index");
     const auto isLegal = [](const IndexedPackage& each) {
         return isLegalIdentifier(each.package.identifier);
     };
     return Reading::read()
-        .unless(std::ranges::all_of(*packages, isLegal), "an illegal identifier")
-        .unless(indexBytes(*packages) == index, "it is written otherwise");
+        .unless(std::ranges::all_of(contents->packages, isLegal), "an illegal identifier")
+        .unless(indexBytes(*contents) == index, "it is written otherwise");
 }
 
 Reading readJsonList(ByteView bytes) {

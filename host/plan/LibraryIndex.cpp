@@ -6,6 +6,7 @@
 #include <unistd.h>
 
 #include <algorithm>
+#include <cerrno>
 #include <cstdio>
 #include <cstdlib>
 #include <filesystem>
@@ -17,18 +18,22 @@
 #include "device/values/PackageText.h"
 #include "host/file/Checksum.h"
 #include "system/DescriptorIO.h"
+#include "system/RootDirectory.h"
 #include "system/UniqueFd.h"
 
 namespace appsync {
 namespace {
 
-// What an index begins with; the SHA-256 sum of the rest follows. The number goes up when what is
-// read of a package changes, or what is refused: what an older one says is then not believed.
-constexpr std::string_view kIndexHead = "appsync library index 1\n";
+// What an index begins with; the SHA-256 sum of the rest follows, which is the library's folder and
+// the packages. The number goes up when what is read of a package changes, or what is refused: what
+// an older one says is then not believed.
+constexpr std::string_view kIndexHead = "appsync library index 2\n";
+constexpr std::string_view kIndexMark = "appsync library index ";
 constexpr std::size_t kIndexSumLength = 64;
 constexpr std::uint64_t kLargestIndex = std::uint64_t{256} << 20U;
 constexpr std::size_t kTypicalRecord = 192;
 constexpr std::size_t kLongestIndexedText = 4096;
+constexpr std::size_t kMostLookedAt = 256;  // of the indexes of other libraries
 
 std::string indexSum(ByteView bytes) {
     RunningSum sum;
@@ -167,7 +172,9 @@ std::optional<Bytes> readOwnFile(const std::string& path) {
 }
 
 UniqueFd openOwnDirectory(const std::string& path) {
-    ::mkdir(std::filesystem::path(path).parent_path().c_str(), S_IRWXU);
+    for (std::size_t end = path.find('/', 1); end != path.npos; end = path.find('/', end + 1)) {
+        ::mkdir(path.substr(0, end).c_str(), S_IRWXU);
+    }
     ::mkdir(path.c_str(), S_IRWXU);
     UniqueFd directory(::open(path.c_str(), O_RDONLY | O_DIRECTORY | O_NOFOLLOW | O_CLOEXEC));
     const bool isUsable = directory.valid() && isOwnFile(directory.get(), S_IFDIR);
@@ -204,16 +211,70 @@ void replaceOwnFile(const std::string& directoryPath, const std::string& name, B
     }
 }
 
+bool isIndexName(std::string_view name) {
+    return name.size() == kIndexSumLength &&
+           name.find_first_not_of("0123456789abcdef") == name.npos;
+}
+
+// The longest beginning of an index that tells of which library it is.
+Bytes beginningOf(int directory, const std::string& name) {
+    const UniqueFd file(::openat(directory, name.c_str(),
+                                 O_RDONLY | O_NOFOLLOW | O_NONBLOCK | O_NOCTTY | O_CLOEXEC));
+    if (!file || !isOwnFile(file.get(), S_IFREG)) return {};
+    constexpr std::size_t kLengthBytes = 8;
+    Bytes bytes(kIndexHead.size() + kIndexSumLength + kLengthBytes + kLongestIndexedText);
+    const ssize_t count = ::pread(file.get(), bytes.data(), bytes.size(), 0);
+    bytes.resize(count < 0 ? 0 : static_cast<std::size_t>(count));
+    return bytes;
+}
+
+// Whether it is an index that serves nobody any more: of a library that is gone, or of another
+// form.
+bool isUseless(ByteView beginning) {
+    const std::string_view text(reinterpret_cast<const char*>(beginning.data()), beginning.size());
+    if (!text.starts_with(kIndexHead)) return text.starts_with(kIndexMark);
+    constexpr std::size_t kHeadLength = kIndexHead.size() + kIndexSumLength;
+    if (beginning.size() < kHeadLength) return true;
+    IndexReader reader(beginning.subspan(kHeadLength));
+    const std::string folder = reader.text();
+    struct stat status {};
+    if (reader.failed()) return true;
+    if (::stat(folder.c_str(), &status) == 0) return !S_ISDIR(status.st_mode);
+    return errno == ENOENT || errno == ENOTDIR;
+}
+
+void dropUselessIndexes(const std::string& directoryPath, const std::string& own) {
+    const UniqueFd directory = openOwnDirectory(directoryPath);
+    if (!directory) return;
+    const Result<std::vector<std::string>> names = namesIn(directory.get(), directoryPath);
+    if (!names) return;
+    std::size_t looks = 0;
+    for (const std::string& name : *names) {
+        if (name == own || !isIndexName(name)) continue;
+        if (++looks > kMostLookedAt) return;
+        if (isUseless(beginningOf(directory.get(), name))) {
+            ::unlinkat(directory.get(), name.c_str(), 0);
+        }
+    }
+}
+
 std::int64_t nanoseconds(const timespec& time) {
     constexpr std::int64_t kPerSecond = 1'000'000'000;
     return std::int64_t{time.tv_sec} * kPerSecond + time.tv_nsec;
 }
 
 // A library is the same by whatever way it is named.
-std::string indexNameOf(const std::string& folder) {
+std::string placeOfLibrary(const std::string& folder) {
     std::error_code code;
     const std::filesystem::path place = std::filesystem::canonical(folder, code);
-    return code ? "" : indexSum(bytesOfText(place.native()));
+    return code ? "" : place.native();
+}
+
+// The user's own, or one that may be made: not with the rights of root who acts for somebody else.
+bool canBeOwn(const std::string& directory) {
+    if (isOwnDirectory(directory)) return true;
+    struct stat status {};
+    return ::lstat(directory.c_str(), &status) != 0 && errno == ENOENT && ::getuid() == ::geteuid();
 }
 
 }  // namespace
@@ -222,7 +283,7 @@ LibraryIndexPlace LibraryIndexPlace::ofUser() {
     LibraryIndexPlace place;
     const std::string home = absoluteVariable("HOME");
     const std::string base = absoluteVariable("XDG_CACHE_HOME");
-    if (!base.empty() && isOwnDirectory(base)) {
+    if (!base.empty() && canBeOwn(base)) {
         place.directory = base + "/appsync";
     } else if (base.empty() && isOwnDirectory(home)) {
         place.directory = home + "/.cache/appsync";
@@ -233,14 +294,16 @@ LibraryIndexPlace LibraryIndexPlace::ofUser() {
 LibraryIndex::LibraryIndex(LibraryIndexPlace place, const std::string& folder, std::size_t count)
     : place_(std::move(place)) {
     if (place_.directory.empty() || count < place_.fewest) return;
-    fileName_ = indexNameOf(folder);
+    folder_ = placeOfLibrary(folder);
+    if (folder_.empty()) return;
+    fileName_ = indexSum(bytesOfText(folder_));
     if (fileName_.empty()) return;
     now_.reserve(count);
     const std::optional<Bytes> bytes = readOwnFile(place_.directory + "/" + fileName_);
     auto known = bytes ? readIndex(*bytes) : std::nullopt;
-    if (!known) return;
-    before_.reserve(known->size());
-    for (IndexedPackage& each : *known) {
+    if (!known || known->folder != folder_) return;
+    before_.reserve(known->packages.size());
+    for (IndexedPackage& each : known->packages) {
         std::string name = each.package.file;
         before_.insert_or_assign(std::move(name), std::move(each));
     }
@@ -269,7 +332,8 @@ bool LibraryIndex::hasSettled(const FileStamp& stamp) const {
 
 void LibraryIndex::save() {
     if (fileName_.empty() || (!hasNew_ && before_.empty())) return;
-    replaceOwnFile(place_.directory, fileName_, indexBytes(now_));
+    replaceOwnFile(place_.directory, fileName_, indexBytes({folder_, now_}));
+    dropUselessIndexes(place_.directory, fileName_);
 }
 
 std::optional<FileStamp> stampOf(const std::string& file) {
@@ -279,16 +343,17 @@ std::optional<FileStamp> stampOf(const std::string& file) {
                      nanoseconds(status.st_mtim), nanoseconds(status.st_ctim)};
 }
 
-Bytes indexBytes(const std::vector<IndexedPackage>& packages) {
-    IndexWriter writer(packages.size());
-    for (const IndexedPackage& each : packages) writeRecord(writer, each);
+Bytes indexBytes(const LibraryIndexContents& contents) {
+    IndexWriter writer(contents.packages.size());
+    writer.text(contents.folder);
+    for (const IndexedPackage& each : contents.packages) writeRecord(writer, each);
     const std::string head = std::string(kIndexHead) + indexSum(writer.bytes());
     Bytes bytes(head.begin(), head.end());
     bytes.insert(bytes.end(), writer.bytes().begin(), writer.bytes().end());
     return bytes;
 }
 
-std::optional<std::vector<IndexedPackage>> readIndex(ByteView bytes) {
+std::optional<LibraryIndexContents> readIndex(ByteView bytes) {
     constexpr std::size_t kHeadLength = kIndexHead.size() + kIndexSumLength;
     if (bytes.size() < kHeadLength) return std::nullopt;
     const ByteView records = bytes.subspan(kHeadLength);
@@ -296,14 +361,15 @@ std::optional<std::vector<IndexedPackage>> readIndex(ByteView bytes) {
     if (!std::equal(head.begin(), head.end(), bytes.begin(), bytes.begin() + kHeadLength)) {
         return std::nullopt;
     }
-    std::vector<IndexedPackage> packages;
-    packages.reserve(records.size() / kTypicalRecord);
+    LibraryIndexContents contents;
+    contents.packages.reserve(records.size() / kTypicalRecord);
     IndexReader reader(records);
-    while (!reader.atEnd()) {
-        packages.push_back(readRecord(reader));
-        if (reader.failed() || !isPlausible(packages.back().package)) return std::nullopt;
+    contents.folder = reader.text();
+    while (!reader.failed() && !reader.atEnd()) {
+        contents.packages.push_back(readRecord(reader));
+        if (!isPlausible(contents.packages.back().package)) return std::nullopt;
     }
-    return packages;
+    return reader.failed() ? std::nullopt : std::optional(std::move(contents));
 }
 
 }  // namespace appsync

@@ -31,6 +31,13 @@ struct IndexedPackage {
     LibraryPackage package;
 };
 
+/// What an index says.
+struct LibraryIndexContents {
+    /// The library's folder: absolute, and without links.
+    std::string folder;
+    std::vector<IndexedPackage> packages;
+};
+
 /// Where indexes of libraries are kept, and of which files.
 struct LibraryIndexPlace {
     /// Absolute; empty where no index is kept.
@@ -42,7 +49,8 @@ struct LibraryIndexPlace {
     std::size_t fewest = 64;
 
     /// "appsync" in the cache directory of the user who runs the process: $XDG_CACHE_HOME, else
-    /// ~/.cache. None where that is another user's, as for root who acts for a device's owner.
+    /// ~/.cache; either is made where it is missing. None where that is another user's, as for root
+    /// who acts for a device's owner.
     [[nodiscard]] static LibraryIndexPlace ofUser();
 };
 
@@ -65,13 +73,15 @@ class LibraryIndex {
     /// Remembers what was read of a file whose stamp was looked at before.
     void keep(const std::string& name, const FileStamp& stamp, const LibraryPackage& package);
 
-    /// Writes it where something of it has changed and that is possible.
+    /// Writes it where something of it has changed and that is possible; then the indexes go whose
+    /// libraries are gone.
     void save();
 
   private:
     [[nodiscard]] bool hasSettled(const FileStamp& stamp) const;
 
     const LibraryIndexPlace place_;
+    std::string folder_;
     std::string fileName_;  // empty where there is to be none
     std::unordered_map<std::string, IndexedPackage> before_;
     std::vector<IndexedPackage> now_;
@@ -82,7 +92,7 @@ class LibraryIndex {
 [[nodiscard]] std::optional<FileStamp> stampOf(const std::string& file);
 
 /// The contents of an index, and what they say; nothing where they are not what `indexBytes` gives.
-[[nodiscard]] Bytes indexBytes(const std::vector<IndexedPackage>& packages);
-[[nodiscard]] std::optional<std::vector<IndexedPackage>> readIndex(ByteView bytes);
+[[nodiscard]] Bytes indexBytes(const LibraryIndexContents& contents);
+[[nodiscard]] std::optional<LibraryIndexContents> readIndex(ByteView bytes);
 
 }  // namespace appsync

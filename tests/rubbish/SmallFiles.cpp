@@ -118,9 +118,10 @@ Bytes smallManifest() {
 }
 
 Bytes smallLibraryIndex() {
+    constexpr std::size_t kNoFolderLength = 8;
     const IndexedPackage package{{1, 2, 300, 4, 5}, {kA, "1.0", "\u00e9", "a.zip", 300, 4096}};
-    const Bytes whole = indexBytes({package});
-    const auto head = static_cast<std::ptrdiff_t>(indexBytes({}).size());
+    const Bytes whole = indexBytes({"/library", {package}});
+    const auto head = static_cast<std::ptrdiff_t>(indexBytes({}).size() - kNoFolderLength);
     return {whole.begin() + head, whole.end()};
 }
 

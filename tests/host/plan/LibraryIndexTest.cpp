@@ -64,16 +64,17 @@ class LibraryIndexTest : public HostFixture {
         std::ofstream(indexFile(), std::ios::binary | std::ios::trunc)
             << std::string(bytes.begin(), bytes.end());
     }
-    [[nodiscard]] std::vector<IndexedPackage> indexed() const {
-        auto packages = readIndex(indexContents());
-        EXPECT_TRUE(packages.has_value());
-        return packages.value_or(std::vector<IndexedPackage>());
+    [[nodiscard]] LibraryIndexContents index() const {
+        auto contents = readIndex(indexContents());
+        EXPECT_TRUE(contents.has_value());
+        return contents.value_or(LibraryIndexContents());
     }
+    [[nodiscard]] std::vector<IndexedPackage> indexed() const { return index().packages; }
     /// Lets the index say something of each package that nobody could find in its file.
     template <typename Change>
     void alterIndex(Change change) {
-        std::vector<IndexedPackage> all = indexed();
-        for (IndexedPackage& each : all) {
+        LibraryIndexContents all = index();
+        for (IndexedPackage& each : all.packages) {
             each.package.version = "9";
             change(each);
         }
@@ -286,6 +287,61 @@ TEST_F(LibraryIndexTest, standsInTheCacheOfTheUser) {
     }
     const Variable relative("XDG_CACHE_HOME", "relative");
     EXPECT_EQ(LibraryIndexPlace::ofUser().directory, home + "/.cache/appsync");
+}
+
+TEST_F(LibraryIndexTest, aCacheThatIsMissingIsMadeForTheUserAlone) {
+    const std::string cache = directory.path() + "/not/yet";
+    const Variable cacheVariable("XDG_CACHE_HOME", cache);
+    place.directory = LibraryIndexPlace::ofUser().directory;
+    EXPECT_EQ(place.directory, cache + "/appsync");
+    EXPECT_FALSE(fs::exists(directory.path() + "/not")) << "before there is anything to write";
+    ASSERT_EQ(packages(), truth);
+    EXPECT_EQ(indexed().size(), 2U);
+    for (const char* made : {"/not", "/not/yet", "/not/yet/appsync"}) {
+        EXPECT_EQ(fs::status(directory.path() + made).permissions(), fs::perms::owner_all) << made;
+    }
+}
+
+TEST_F(LibraryIndexTest, somethingElseInPlaceOfTheCacheIsLeftAlone) {
+    const std::string cache = directory.path() + "/cache";
+    write(cache, "a file");
+    const Variable cacheVariable("XDG_CACHE_HOME", cache);
+    EXPECT_EQ(LibraryIndexPlace::ofUser().directory, "");
+    fs::remove(cache);
+    fs::create_symlink("nowhere", cache);
+    EXPECT_EQ(LibraryIndexPlace::ofUser().directory, "");
+}
+
+TEST_F(LibraryIndexTest, thatOfALibraryThatIsGoneGoesWithTheNextThatIsWritten) {
+    const std::string other = directory.path() + "/other";
+    fs::copy(library, other);
+    ASSERT_EQ(packages(other), truth);
+    const std::string ofOther = indexFile();
+    ASSERT_EQ(packages(), truth);
+    EXPECT_TRUE(fs::exists(ofOther)) << "its library is there";
+    write(place.directory + "/" + std::string(64, 'a'), "nobody knows what");
+    write(place.directory + "/" + std::string(64, 'b'), "appsync library index 1\n");
+    write(place.directory + "/notes", "appsync library index 1\n");
+    for (const char name : {'a', 'b'}) {
+        fs::permissions(place.directory + "/" + std::string(64, name),
+                        fs::perms::owner_read | fs::perms::owner_write);
+    }
+    fs::remove_all(other);
+    addPackage(kBrookPackage, "2.0.1");
+    ASSERT_EQ(packages().back(), "com.example.brook 2.0.1");
+    EXPECT_FALSE(fs::exists(ofOther));
+    EXPECT_FALSE(fs::exists(place.directory + "/" + std::string(64, 'b'))) << "of a former form";
+    EXPECT_TRUE(fs::exists(place.directory + "/" + std::string(64, 'a')));
+    EXPECT_EQ(indexFiles().size(), 3U);
+}
+
+TEST_F(LibraryIndexTest, thatOfAnotherLibraryIsNotBelieved) {
+    ASSERT_EQ(packages(), truth);
+    alterIndex();
+    LibraryIndexContents others = index();
+    others.folder += "/other";
+    writeIndex(indexBytes(others));
+    EXPECT_EQ(packages(), truth);
 }
 
 TEST_F(LibraryIndexTest, hasNoPlaceWhereTheUserHasNone) {
