@@ -158,6 +158,13 @@ class Commands {
         }
         if (const Status given = checkValues(arguments); !given)
             return console_.fail(given.error());
+        // The parser would print the version, and pass over what follows.
+        if (arguments.size() > 1 && arguments.front() == "--version") {
+            return console_.fail(wrongUsage(
+                shownArgument(arguments[1]) + " is one argument too many for appsync --version",
+                helpOf(app_)));
+        }
+        const std::optional<ErrorRecord> misplaced = deviceComesLate(arguments);
         std::reverse(arguments.begin(), arguments.end());  // as CLI11 wants them
         try {
             app_.parse(std::move(arguments));
@@ -167,7 +174,7 @@ class Commands {
             console_.out << brokenAt80(text.str());
             return kExitDone;
         } catch (const CLI::ParseError& error) {
-            return console_.fail(whatIsWrong(error));
+            return console_.fail(misplaced ? *misplaced : whatIsWrong(error));
         }
         console_.help = typed(chosen()) + " --help";
         if (const Status placed = checkPlaceOfDevice(); !placed)
@@ -201,6 +208,25 @@ class Commands {
     [[nodiscard]] bool comesLate(const std::vector<std::string>& words) const {
         if (words.size() < 2 || words[0].empty() || words[1].starts_with('-')) return false;
         return !isUnknownCommand(words[1]);
+    }
+
+    // What is wrong with the words, if anything is, where the action of `coordinator` stands before
+    // the device, as a command of `package` or `data` does.
+    static std::optional<ErrorRecord> deviceComesLate(const std::vector<std::string>& words) {
+        const auto isAction = [&words](std::size_t place) {
+            return place < words.size() &&
+                   std::ranges::count(coordinatorActions(), words[place]) > 0;
+        };
+        if (words.empty() || words[0] != "coordinator" || !isAction(1) || isAction(2)) return {};
+        const std::string rest = words[1] == "list" ? "" : " ID";
+        return wrongUsage("DEVICE comes before " + words[1],
+                          "try appsync coordinator DEVICE " + words[1] + rest +
+                              ", or see appsync coordinator --help");
+    }
+
+    static const std::vector<std::string>& coordinatorActions() {
+        static const std::vector<std::string> actions{"list", "create", "cancel"};
+        return actions;
     }
 
     // Whether the words are a command, and a command of that one.
@@ -656,7 +682,7 @@ class Commands {
         added.add_option("DEVICE", values->device, "the device's directory")->required();
         added.add_option("ACTION", values->action, "list, create or cancel")
             ->required()
-            ->check(oneOf({"list", "create", "cancel"}));
+            ->check(oneOf(coordinatorActions()));
         added.add_option("ID", values->identifier, "the application's identifier");
         added
             .add_option("--client", values->client,

@@ -134,6 +134,12 @@ INSTANTIATE_TEST_SUITE_P(
         WrongUsage{{"sync", "device", "library", "--no-wait=1"}, "--no-wait takes no value"},
         WrongUsage{{"set", "device", "removal=yes", "coordination=on", "removal=no"},
                    "both removal=yes and removal=no are given: choose one"},
+        WrongUsage{{"coordinator", "list", "device"},
+                   "DEVICE comes before list: try appsync coordinator DEVICE list, or see appsync"},
+        WrongUsage{{"coordinator", "cancel", "device", "com.a"},
+                   "DEVICE comes before cancel: try appsync coordinator DEVICE cancel ID, or see"},
+        WrongUsage{{"coordinator", "list"}, "DEVICE comes before list: try"},
+        WrongUsage{{"coordinator", "device", "lost"}, "lost is none of list, create, cancel"},
         WrongUsage{{"create", ""}, "cannot create a device at ''"},
         WrongUsage{{"set", "device", "coordination"},
                    "coordination has no value: use coordination="},
@@ -222,6 +228,14 @@ TEST_F(CommandLine, TellsItsVersionInOneLine) {
     EXPECT_EQ(run({"--version"}), 0);
     EXPECT_THAT(out.str(), testing::MatchesRegex("appsync [0-9]+\\.[0-9]+\\.[0-9]+\n"));
     EXPECT_EQ(err.str(), "");
+}
+
+TEST_F(CommandLine, NothingFollowsTheVersion) {
+    EXPECT_EQ(run({"--version", "x"}), 2);
+    EXPECT_EQ(out.str(), "");
+    EXPECT_EQ(err.str(),
+              "appsync: x is one argument too many for appsync --version: see appsync --help\n");
+    EXPECT_EQ(run({"--version", "apps", "device"}), 2);
 }
 
 TEST_F(CommandLine, ATimeIsSecondsMinutesOrHours) {
