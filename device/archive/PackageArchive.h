@@ -5,8 +5,8 @@
 // against the headers before the contents, PackageArchiveHeaders.h), PackageEntries.h (names,
 // kinds, the tree), PackageArchive.h (all of it), PackageArchiveContents.h (what is in a file).
 // PackageArchiveFormat.h has the records and numbers that several of them read.
-// PackageLimits.h says what an archive may claim, PackageError.h why one is refused. Written by
-// ArchiveWriter.h, with libzip, from what PackageFolder.h finds.
+// PackageLimits.h says what an archive may claim, PackageError.h why one is refused, Crc.h computes
+// the CRC. Written by ArchiveWriter.h, with libzip, from what PackageFolder.h finds.
 //
 // Includes device/values, system/, libzip, libdeflate and zlib. Called by device/package.
 

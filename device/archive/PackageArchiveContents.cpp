@@ -9,6 +9,7 @@
 #include <string_view>
 #include <utility>
 
+#include "device/archive/Crc.h"
 #include "device/archive/PackageEntries.h"
 #include "device/archive/PackageError.h"
 #include "device/archive/PackageFile.h"
@@ -69,7 +70,7 @@ Result<ByteView> PackageArchiveContents::next(std::span<std::uint8_t> buffer) {
         if (Status status = checkEnd(); !status) return status.error();
         return next;
     }
-    crc_ = libdeflate_crc32(crc_, next->data(), next->size());
+    crc_ = continueCrc(crc_, *next);
     done_ += next->size();
     return next;
 }

@@ -176,6 +176,13 @@ CREATE TABLE kept (
 ) STRICT;
 )sql";
 
+constexpr const char* kTablesSinceVersion4 = R"sql(
+CREATE TABLE sums (
+    container TEXT PRIMARY KEY,
+    sum INTEGER NOT NULL
+) STRICT, WITHOUT ROWID;
+)sql";
+
 constexpr const char* kTablesOfVersion1 = R"sql(
 CREATE TABLE uninstalled (
     identifier TEXT PRIMARY KEY,
@@ -204,7 +211,7 @@ constexpr const char* kTakeOverVersion1 =
 
 std::string tablesOf(std::int64_t version) {
     return std::string(kTables) + (version == 1 ? kTablesOfVersion1 : kTablesSinceVersion2) +
-           (version < 3 ? "" : kTablesSinceVersion3);
+           (version < 3 ? "" : kTablesSinceVersion3) + (version < 4 ? "" : kTablesSinceVersion4);
 }
 
 ErrorRecord halfCreated(const Database& database) {
@@ -313,12 +320,19 @@ Result<bool> isOfFormerSchema(Database& database) {
     return *version < kDeviceSchemaVersion;
 }
 
+Result<bool> hasKeptTable(Database& database) {
+    const Result<std::int64_t> version = database.integer("PRAGMA user_version");
+    if (!version) return version.error();
+    return *version >= 3;
+}
+
 Status bringSchemaUpToDate(Database& database) {
     const Result<std::int64_t> version = database.integer("PRAGMA user_version");
     if (!version) return version.error();
     Status status;
     if (*version < 2) status = leaveVersion1(database);
     if (status && *version < 3) status = database.execute(kTablesSinceVersion3);
+    if (status && *version < 4) status = database.execute(kTablesSinceVersion4);
     if (!status || *version == kDeviceSchemaVersion) return status;
     const std::string mark = "PRAGMA user_version = " + std::to_string(kDeviceSchemaVersion);
     return database.execute(mark.c_str());

@@ -11,7 +11,7 @@ inline constexpr int kDeviceApplicationId = 0x41707073;
 
 /// The schema that this version makes; docs/device-format.md describes it. One of an earlier
 /// version serves whoever looks; a session brings it up to date first.
-inline constexpr int kDeviceSchemaVersion = 3;
+inline constexpr int kDeviceSchemaVersion = 4;
 
 /// Makes the tables of an empty database, and marks it as a device's.
 Status createDeviceSchema(Database& database);
@@ -23,6 +23,9 @@ Status checkDeviceSchema(Database& database);
 
 /// Whether an earlier version has made it.
 [[nodiscard]] Result<bool> isOfFormerSchema(Database& database);
+
+/// Whether it has the table `kept`, which came with version 3.
+[[nodiscard]] Result<bool> hasKeptTable(Database& database);
 
 /// Makes a database of an earlier version one of this version, in the caller's transaction; nothing
 /// that it holds is lost. No work where it is one already.

@@ -30,9 +30,9 @@ Result<std::vector<BundleRow>> readAllKept(Query rows) {
 }  // namespace
 
 Result<std::optional<BundleRow>> findKept(Database& database, const std::string& identifier) {
-    const Result<bool> isFormer = isOfFormerSchema(database);
-    if (!isFormer) return isFormer.error();
-    if (*isFormer) return std::optional<BundleRow>();
+    const Result<bool> hasTable = hasKeptTable(database);
+    if (!hasTable) return hasTable.error();
+    if (!*hasTable) return std::optional<BundleRow>();
     Query rows = database.query(
         "SELECT identifier, version, name, install_type, container, bundle, icon, bytes FROM kept"
         " WHERE identifier = ?");
@@ -43,9 +43,9 @@ Result<std::optional<BundleRow>> findKept(Database& database, const std::string&
 }
 
 Result<std::vector<BundleRow>> allKept(Database& database) {
-    const Result<bool> isFormer = isOfFormerSchema(database);
-    if (!isFormer) return isFormer.error();
-    if (*isFormer) return std::vector<BundleRow>();
+    const Result<bool> hasTable = hasKeptTable(database);
+    if (!hasTable) return hasTable.error();
+    if (!*hasTable) return std::vector<BundleRow>();
     return readAllKept(
         database.query("SELECT identifier, version, name, install_type, container, bundle, icon,"
                        " bytes FROM kept ORDER BY id"));

@@ -8,6 +8,7 @@
 #include "device/database/Database.h"
 #include "device/database/DeviceDatabase.h"
 #include "device/database/RegistryTables.h"
+#include "device/database/SumTable.h"
 #include "device/install/Containers.h"
 #include "device/install/InstallContext.h"
 #include "device/install/JointCommits.h"
@@ -86,20 +87,22 @@ Status refuseIfUninstalled(Database& database, const std::string& identifier) {
                              "again to bring it back");
 }
 
-JointCommits::Outcome commitInstall(const InstallContext& context, const PackageInfo& info,
+JointCommits::Outcome commitInstall(const InstallContext& context, const PackageReader& package,
                                     NewContainer& container, std::uint64_t installType,
                                     const AlsoCommitted& alsoCommitted) {
-    const BundleRow row = rowOf(info, container, installType);
+    const BundleRow row = rowOf(package.info(), container, installType);
+    const std::uint64_t sum = package.bundleSum();
     FreedContainers freed;
     JointCommits::Outcome outcome = context.commits.commit([&](Database& database) {
         Status committing = refuseIfUninstalled(database, row.identifier);
         if (committing) committing = recordInstalled(database, row, freed);
+        if (committing) committing = recordSum(database, row.container, sum);
         return committing && alsoCommitted ? alsoCommitted(database) : committing;
     });
     if (!outcome.synced) return outcome;
     if (!outcome.committed) return {{}, asRegistryStatus(std::move(outcome.committed))};
     container.keep();
-    context.progress.forget(info.identifier, kInstallStateFinished);
+    context.progress.forget(row.identifier, kInstallStateFinished);
     putAway(context, freed);
     return outcome;
 }
@@ -119,7 +122,7 @@ Status unpackAndCommit(const InstallContext& context, const std::string& identif
         if (!status && again && makesRoomAfter(context, status.error())) continue;
         if (!status) return status;
         JointCommits::Outcome outcome =
-            commitInstall(context, reader.info(), *container, installType, alsoCommitted);
+            commitInstall(context, reader, *container, installType, alsoCommitted);
         if (outcome.synced) return std::move(outcome.committed);
         if (!again) return std::move(outcome.synced);
     }

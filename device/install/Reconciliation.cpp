@@ -10,6 +10,7 @@
 #include "device/database/DeviceDatabase.h"
 #include "device/database/KeptTable.h"
 #include "device/database/RegistryTables.h"
+#include "device/database/SumTable.h"
 #include "device/install/Containers.h"
 #include "device/install/CoordinationRecovery.h"
 #include "device/install/DurabilityBarrier.h"
@@ -364,6 +365,7 @@ Status endSession(const InstallContext& context) {
         Query synced = database.query(
             "UPDATE placeholders SET unsynced_boot = NULL WHERE unsynced_boot IS NOT NULL");
         if (Status marked = synced.run(); !marked) return marked;
+        if (Status tidied = forgetOldSums(database); !tidied) return tidied;
         return database.query("DELETE FROM session").run();
     });
 }

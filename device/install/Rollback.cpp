@@ -9,10 +9,12 @@
 #include "device/database/DeviceDatabase.h"
 #include "device/database/KeptTable.h"
 #include "device/database/RegistryTables.h"
+#include "device/database/SumTable.h"
 #include "device/install/Containers.h"
 #include "device/install/DurabilityBarrier.h"
 #include "device/install/InstallContext.h"
 #include "device/install/KeptBundles.h"
+#include "device/package/BundleSum.h"
 #include "device/values/DeviceError.h"
 #include "device/values/DevicePaths.h"
 #include "device/values/WallClock.h"
@@ -37,6 +39,10 @@ ErrorRecord nothingKept(const std::string& identifier) {
         RegistryErrorCode::NothingKept,
         "no earlier version of " + identifier + " is kept; put one into a library, and sync that");
 }
+
+constexpr std::string_view kGone = "is gone from the disk";
+constexpr std::string_view kDamaged =
+    "is damaged, as its files are not those that were installed, and is kept no more";
 
 ErrorRecord keptIsGone(const std::string& identifier, std::string_view what) {
     return registryError(RegistryErrorCode::NothingKept,
@@ -111,41 +117,63 @@ Status commitRollback(const InstallContext& context, const Versions& versions) {
     });
 }
 
-/// What is wrong with a bundle that cannot be used any more; nothing with any other.
-std::optional<std::string> defectOf(const InstallContext& context, const BundleRow& kept) {
-    const std::string bundle = containerPath(kept.container) + "/" + kept.bundle;
-    const std::string infoName("Info.plist");
-    const Result<Bytes> bytes = context.files.readFile(bundle + "/" + infoName);
-    if (!bytes) return "its " + infoName + " cannot be read";
-    const Result<PropertyList> info = context.propertyLists.parse(*bytes);
-    const std::string* identifier = info ? info->findString(BundleIdentifierKey) : nullptr;
-    if (identifier != nullptr && *identifier == kept.identifier) return std::nullopt;
-    return "its " + infoName + " is damaged";
-}
-
-Status checkWhole(const InstallContext& context, const BundleRow& kept) {
-    const std::string container = containerPath(kept.container);
-    if (!isSingleName(kept.bundle)) return posixError(ENOENT, "open", container);
-    const auto bundle =
-        context.files.root().openDirectoryWithoutLinks(container + "/" + kept.bundle);
-    if (!bundle) return bundle.error();
-    const std::optional<std::string> defect = defectOf(context, kept);
-    return defect ? Status(keptIsGone(kept.identifier, "is damaged: " + *defect)) : Status();
-}
-
 bool isMissing(const ErrorRecord& error) {
     if (error.domain != kPosixErrorDomain) return false;
     return error.code == ENOENT || error.code == ENOTDIR || error.code == ELOOP;
 }
 
-// Somebody has taken it away, or something of it.
-ErrorRecord forgetMissing(const InstallContext& context, const BundleRow& kept,
-                          std::string_view what) {
+Result<std::optional<std::uint64_t>> recordedSum(const InstallContext& context,
+                                                 const std::string& container) {
+    std::optional<std::uint64_t> sum;
+    const Status read = context.database.read([&](Database& database) -> Status {
+        const auto found = findSum(database, container);
+        if (!found) return found.error();
+        sum = *found;
+        return {};
+    });
+    if (!read) return read.error();
+    return sum;
+}
+
+/// Whether its Info.plist is there, and is that of the application.
+Result<bool> hasInfo(const InstallContext& context, const std::string& bundle,
+                     const std::string& identifier) {
+    const Result<Bytes> bytes = context.files.readFile(bundle + "/Info.plist");
+    if (!bytes && isMissing(bytes.error())) return false;
+    if (!bytes) return bytes.error();
+    const Result<PropertyList> info = context.propertyLists.parse(*bytes);
+    const std::string* found = info ? info->findString(BundleIdentifierKey) : nullptr;
+    return found != nullptr && *found == identifier;
+}
+
+/// Whether the bundle is as it was unpacked. Where nobody has recorded that, whether it is the
+/// application at all.
+Result<bool> isAsInstalled(const InstallContext& context, const BundleRow& kept,
+                           const std::string& bundle) {
+    const auto recorded = recordedSum(context, kept.container);
+    if (!recorded) return recorded.error();
+    if (!*recorded) return hasInfo(context, bundle, kept.identifier);
+    const Result<std::uint64_t> sum = sumOfBundle(context.files.root(), bundle);
+    if (!sum) return sum.error();
+    return *sum == **recorded;
+}
+
+Status checkWhole(const InstallContext& context, const BundleRow& kept) {
+    const std::string container = containerPath(kept.container);
+    if (!isSingleName(kept.bundle)) return posixError(ENOENT, "open", container);
+    const std::string bundle = container + "/" + kept.bundle;
+    const auto opened = context.files.root().openDirectoryWithoutLinks(bundle);
+    if (!opened) return opened.error();
+    const Result<bool> isWhole = isAsInstalled(context, kept, bundle);
+    if (!isWhole) return isWhole.error();
+    return *isWhole ? Status() : Status(keptIsGone(kept.identifier, kDamaged));
+}
+
+void forgetRecord(const InstallContext& context, const BundleRow& kept) {
     context.database
         .change(Durability::Soon,
                 [&](Database& database) { return forgetKept(database, kept.container); })
         .ignore();
-    return keptIsGone(kept.identifier, what);
 }
 
 // Whether it lies with the containers of bundles, and is nobody's.
@@ -168,7 +196,8 @@ Status bringBack(const InstallContext& context, const BundleRow& kept) {
     Status moved = context.kept.bringBack(kept.container);
     if (moved || !isMissing(moved.error())) return moved;
     if (isStray(context, kept.container)) return {};
-    return forgetMissing(context, kept, "is gone from the disk");
+    forgetRecord(context, kept);
+    return keptIsGone(kept.identifier, kGone);
 }
 
 // Its files were durable before it was installed; that they are in their place again is not yet.
@@ -178,9 +207,11 @@ Status bringBackDurably(const InstallContext& context, const BundleRow& kept) {
     if (placed) placed = context.barrier.pass();
     if (placed) return {};
     context.kept.keep(kept.container).ignore();
-    if (!isMissing(placed.error())) return placed;
+    const bool isGone = isMissing(placed.error());
+    if (!isGone && !isRegistryError(placed.error(), RegistryErrorCode::NothingKept)) return placed;
     context.kept.remove(kept.container);
-    return forgetMissing(context, kept, "is gone from the disk");
+    forgetRecord(context, kept);
+    return isGone ? keptIsGone(kept.identifier, kGone) : placed;
 }
 
 }  // namespace

@@ -5,6 +5,7 @@
 #include "device/archive/PackageArchive.h"
 #include "device/archive/PackageError.h"
 #include "device/archive/PackageFile.h"
+#include "device/package/BundleSum.h"
 #include "device/package/PackageInfo.h"
 #include "device/package/PackageUnpacker.h"
 #include "device/values/PackageText.h"
@@ -84,6 +85,10 @@ Result<PackageReader> PackageReader::open(PackageFile file,
     Result<PackageInfo> info = describe(**archive, propertyLists, limits);
     if (!info) return (*archive)->named(info.error());
     return PackageReader(*std::move(archive), *std::move(info), limits);
+}
+
+std::uint64_t PackageReader::bundleSum() const {
+    return sumOfEntries(archive_->entries(), info_.bundleDirectoryName);
 }
 
 Status PackageReader::expectIdentifier(std::string_view identifier) const {

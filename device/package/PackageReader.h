@@ -101,6 +101,9 @@ class PackageReader {
 
     [[nodiscard]] const PackageInfo& info() const noexcept { return info_; }
 
+    /// What tells later whether the unpacked bundle is as it was (BundleSum.h).
+    [[nodiscard]] std::uint64_t bundleSum() const;
+
     /// Refuses the package unless it is of this application.
     [[nodiscard]] Status expectIdentifier(std::string_view identifier) const;
 

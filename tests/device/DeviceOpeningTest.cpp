@@ -42,7 +42,7 @@ TEST_F(DeviceOpeningTest, creationKeepsWhatWasAskedFor) {
 
 TEST_F(DeviceOpeningTest, creationWritesAheadAndSyncsEachCommit) {
     EXPECT_EQ(number("SELECT journal_mode = 'wal' FROM pragma_journal_mode"), 1);
-    EXPECT_EQ(number("PRAGMA user_version"), 3);
+    EXPECT_EQ(number("PRAGMA user_version"), 4);
 }
 
 TEST_F(DeviceOpeningTest, creationRefusesAPathThatExists) {
@@ -184,7 +184,7 @@ TEST_F(DeviceOpeningTest, aNewerSchemaIsRefusedAndLeftAlone) {
 class DeviceOfVersion1Test : public DeviceOpeningTest {
   protected:
     DeviceOfVersion1Test() {
-        sql("DROP TABLE kept; DROP TABLE uninstalled; DROP TABLE session;"
+        sql("DROP TABLE sums; DROP TABLE kept; DROP TABLE uninstalled; DROP TABLE session;"
             "CREATE TABLE uninstalled (\n"
             "    identifier TEXT PRIMARY KEY,\n"
             "    version TEXT,\n"
@@ -216,7 +216,7 @@ TEST_F(DeviceOfVersion1Test, aPersonRemovesApplicationsFromIt) {
 
 TEST_F(DeviceOfVersion1Test, aSessionBringsItUpToDateAndLosesNothing) {
     ASSERT_TRUE(succeeded(install("com.example.b")));  // in a session that began after its removal
-    EXPECT_EQ(number("PRAGMA user_version"), 3);
+    EXPECT_EQ(number("PRAGMA user_version"), 4);
     EXPECT_EQ(number("SELECT count(*) FROM uninstalled WHERE identifier = 'com.example.a'"
                      " AND version = '2.0' AND time = 1"),
               1);
@@ -238,7 +238,7 @@ class DeviceOfVersion2Test : public DeviceOpeningTest {
     DeviceOfVersion2Test() {
         EXPECT_TRUE(succeeded(install("com.example.a", "1.0")));
         close();
-        sql("DROP TABLE kept; PRAGMA user_version = 2");
+        sql("DROP TABLE sums; DROP TABLE kept; PRAGMA user_version = 2");
     }
 };
 
@@ -258,7 +258,7 @@ TEST_F(DeviceOfVersion2Test, aPersonRemovesApplicationsFromIt) {
 TEST_F(DeviceOfVersion2Test, aSessionBringsItUpToDateAndLosesNothing) {
     sql("INSERT INTO uninstalled VALUES (7, 'com.example.b', '2.0', 1)");
     ASSERT_TRUE(succeeded(install("com.example.a", "2.0")));
-    EXPECT_EQ(number("PRAGMA user_version"), 3);
+    EXPECT_EQ(number("PRAGMA user_version"), 4);
     EXPECT_EQ(number("SELECT id FROM uninstalled"), 7);
     EXPECT_EQ(device().applications()->front().kept->version, "1.0");
     close();
@@ -268,6 +268,31 @@ TEST_F(DeviceOfVersion2Test, aSessionBringsItUpToDateAndLosesNothing) {
 TEST_F(DeviceOfVersion2Test, aTableOfTheNextVersionIsNotItsOwn) {
     sql("CREATE TABLE kept (id INTEGER PRIMARY KEY)");
     EXPECT_TRUE(unusable(openSession(devicePath()), DeviceErrorCode::Damaged, "kept"));
+}
+
+class DeviceOfVersion3Test : public DeviceOpeningTest {
+  protected:
+    DeviceOfVersion3Test() {
+        for (const char* version : {"1.0", "2.0"}) {
+            EXPECT_TRUE(succeeded(install("com.example.a", version)));
+        }
+        close();
+        sql("DROP TABLE sums; PRAGMA user_version = 3");
+    }
+};
+
+TEST_F(DeviceOfVersion3Test, aLookTellsWhatIsKept) {
+    EXPECT_EQ(look()->applications()->front().kept->version, "1.0");
+    ASSERT_TRUE(succeeded(look()->uninstall("com.example.a")));
+    EXPECT_TRUE(fs::is_empty(devicePath("kept")));
+    EXPECT_EQ(number("PRAGMA user_version"), 3);
+}
+
+TEST_F(DeviceOfVersion3Test, aSessionBringsItUpToDateAndWhatIsKeptComesBack) {
+    EXPECT_TRUE(device().rollBack("com.example.a"));
+    EXPECT_EQ(number("PRAGMA user_version"), 4);
+    EXPECT_EQ(device().applications()->front().version, "1.0");
+    EXPECT_EQ(device().applications()->front().kept->version, "2.0");
 }
 
 TEST_F(DeviceOfVersion1Test, tablesOfTheNextVersionAreNotItsOwn) {

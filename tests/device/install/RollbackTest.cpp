@@ -1,6 +1,7 @@
 #include <algorithm>
 #include <filesystem>
 #include <fstream>
+#include <functional>
 #include <limits>
 
 #include "device/values/DevicePaths.h"
@@ -277,21 +278,80 @@ TEST_F(RollbackTest, whatSomebodyHasTakenAwayIsNotKept) {
     EXPECT_EQ(program(), "program 2.0");
 }
 
-TEST_F(RollbackTest, whatIsDamagedIsNotInstalledAndNotRemoved) {
+/// Something that happens to a bundle.
+struct Damage {
+    const char* name;
+    std::function<void(const fs::path& bundle)> happen;
+};
+
+const std::vector<Damage>& damages() {
+    static const std::vector<Damage> all = {
+        {"no Info.plist", [](const fs::path& bundle) { fs::remove(bundle / "Info.plist"); }},
+        {"no program", [](const fs::path& bundle) { fs::remove(bundle / "main"); }},
+        {"an empty program", [](const fs::path& bundle) { fs::resize_file(bundle / "main", 0); }},
+        {"a byte that has flipped",
+         [](const fs::path& bundle) {
+             std::fstream file(bundle / "main", std::ios::in | std::ios::out | std::ios::binary);
+             file.seekp(3);
+             file.put('X');
+         }},
+        {"a link in place of the program",
+         [](const fs::path& bundle) {
+             fs::rename(bundle / "main", bundle.parent_path() / "main");
+             fs::create_symlink("../main", bundle / "main");
+         }},
+        {"a file more", [](const fs::path& bundle) { std::ofstream(bundle / "more") << "x"; }},
+        {"a directory more", [](const fs::path& bundle) { fs::create_directory(bundle / "more"); }},
+    };
+    return all;
+}
+
+TEST_F(RollbackTest, whatIsDamagedIsNotInstalledAndNotKeptOn) {
+    for (const Damage& damage : damages()) {
+        update();
+        damage.happen(keptPath(kept().front()) + "/App.app");
+        const auto refused = device().rollBack(kAtlas);
+        ASSERT_FALSE(refused) << damage.name;
+        EXPECT_TRUE(isRegistryError(refused.error(), RegistryErrorCode::NothingKept));
+        EXPECT_THAT(
+            refused.error().description(),
+            testing::HasSubstr("earlier version of com.example.atlas that was kept is damaged"));
+        EXPECT_EQ(program(), "program 2.0") << damage.name;
+        expectNothingKept();
+        EXPECT_EQ(containers().size(), 1U) << damage.name;
+    }
+}
+
+TEST_F(RollbackTest, storeMetadataThatIsWrittenAnewIsNoDamage) {
     update();
-    const std::string info = keptPath(kept().front()) + "/App.app/Info.plist";
-    ASSERT_TRUE(fs::exists(info));
-    fs::rename(info, path("info"));
-    const auto refused = device().rollBack(kAtlas);
-    ASSERT_FALSE(refused);
-    EXPECT_TRUE(isRegistryError(refused.error(), RegistryErrorCode::NothingKept));
-    EXPECT_THAT(refused.error().description(), testing::HasSubstr("Info.plist cannot be read"));
-    EXPECT_EQ(program(), "program 2.0");
-    std::ofstream(info) << "stray";
-    EXPECT_FALSE(device().rollBack(kAtlas));
-    fs::rename(path("info"), info);
-    EXPECT_TRUE(device().rollBack(kAtlas));
+    std::ofstream(keptPath(kept().front()) + "/VessikMetadata.plist") << "newer";
+    ASSERT_TRUE(device().rollBack(kAtlas));
     EXPECT_EQ(program(), "program 1.0");
+}
+
+TEST_F(RollbackTest, whatNobodyHasSummedUpIsTakenForWhole) {
+    update();
+    sql("DELETE FROM sums");
+    const std::string bundle = keptPath(kept().front()) + "/App.app";
+    std::ofstream(bundle + "/main") << "changed";
+    ASSERT_TRUE(device().rollBack(kAtlas));
+    EXPECT_EQ(program(), "changed");
+    fs::remove(keptPath(kept().front()) + "/App.app/Info.plist");
+    EXPECT_FALSE(device().rollBack(kAtlas));
+    expectNothingKept();
+}
+
+TEST_F(RollbackTest, sumsGoWithWhatTheyAreOf) {
+    update();
+    update(kBrook);
+    ASSERT_TRUE(device().rollBack(kBrook));
+    close();
+    EXPECT_EQ(number("SELECT count(*) FROM sums"), 4);
+    ASSERT_TRUE(succeeded(look()->uninstall(kAtlas)));
+    ASSERT_TRUE(succeeded(install(kBrook, "3.0")));
+    close();
+    EXPECT_EQ(number("SELECT count(*) FROM sums"), 2);
+    EXPECT_TRUE(device().rollBack(kBrook)) << "by the sum of what was installed before";
 }
 
 TEST_F(RollbackTest, whatCouldNotBePutAwayIsKeptWhereItLies) {

@@ -253,6 +253,7 @@ def both_lines(done):
 TABLES = {
     "applications": ("install_type", "bytes", "arrived"),
     "kept": ("id", "install_type", "bytes"),
+    "sums": ("sum",),
     "settings": ("value",),
     "history": ("time", "kind", "step", "party", "phase", "success"),
     "session": ("process", "started", "last_uninstall"),
@@ -268,6 +269,7 @@ ROWS = ("INSERT OR IGNORE INTO session VALUES (1, 1, 1, 0)",
         "INSERT OR IGNORE INTO denials VALUES ('%s', 1, 1)" % A,
         "INSERT OR IGNORE INTO running VALUES ('%s')" % A,
         "INSERT OR IGNORE INTO kept VALUES (1, '%s', '0.9', 'x', 4, 'OLD', 'App00.app', '', 1)" % A,
+        "INSERT OR IGNORE INTO sums VALUES ('OLD', 1)",
         "INSERT OR IGNORE INTO uninstalled VALUES (1, 'com.example.gone', '1', 1)",
         "INSERT OR IGNORE INTO coordinators (id, identifier, kind, client, created) VALUES (1, '%s', 1, 2, 1)" % A,
         "INSERT OR IGNORE INTO promises VALUES (1, 0, 0, 'x', 2, NULL, 1, 1, 0, 0)")
@@ -283,7 +285,8 @@ NUMBERS = [numbers(table, value, command, device)
            for table, command, device in (
                ("applications", SYNC, "used-direct"), ("applications", LOOKS[0], "used-direct"),
                ("applications", LOOKS[3], "used-direct"), ("kept", LOOKS[0], "used-direct"),
-               ("kept", ("status", "{device}", "--json"), "used-direct"), ("kept", SYNC, "used-direct"), ("settings", SYNC, "used-direct"),
+               ("kept", ("status", "{device}", "--json"), "used-direct"), ("kept", SYNC, "used-direct"),
+               ("sums", SYNC, "used-direct"), ("settings", SYNC, "used-direct"),
                ("history", LOOKS[1], "used-direct"), ("session", SYNC, "used-direct"),
                ("failures", LOOKS[2], "used-direct"), ("denials", LOOKS[2], "used-direct"),
                ("uninstalled", LOOKS[3], "used-direct"), ("coordinators", LOOKS[4], "used-coordinated"),
