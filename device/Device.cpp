@@ -68,6 +68,7 @@ struct Device::State {
     State(OpenedDevice opened, const DeviceOpenOptions& openOptions)
         : options(openOptions),
           path(std::move(opened.path)),
+          givenUpReserve(opened.givenUpReserve),
           lock(std::move(opened.lock)),
           files(std::move(opened.files)),
           database(std::move(opened.database)),
@@ -86,8 +87,17 @@ struct Device::State {
           coordination(context, policy, homeScreen, options.retryInterval,
                        lock ? CoordinationBook::Access::Session : CoordinationBook::Access::Look) {}
 
+    // Puts in order what an interrupted session has left.
+    Status begin() {
+        Result<std::vector<std::string>> found = reconcileDevice(context);
+        if (!found) return found.error();
+        repairs = std::move(*found);
+        return beginSession(context);
+    }
+
     const DeviceOpenOptions options;
     const std::string path;
+    const std::uint64_t givenUpReserve;
     const std::string boot = readBoot();
     const std::optional<SessionLock> lock;
     std::vector<std::string> repairs;
@@ -121,16 +131,18 @@ Status Device::create(const std::string& path, const DeviceCreateOptions& option
 Result<std::unique_ptr<Device>> Device::open(const std::string& path,
                                              const DeviceOpenOptions& options) {
     const bool session = options.access == DeviceAccess::Session;
-    Result<OpenedDevice> opened = openDevice(path, session, options.makesRoom);
+    Result<OpenedDevice> opened =
+        openDevice(path, {session, options.makesRoom, options.borrowsRoom, options.sparesKept});
     if (!opened) return opened.error();
+    const std::string place = opened->path;
+    const std::uint64_t givenUp = opened->givenUpReserve;
     auto state = std::make_unique<State>(std::move(*opened), options);
-    if (session) {
-        Result<std::vector<std::string>> repairs = reconcileDevice(state->context);
-        if (!repairs) return cannotUseDevice(path, repairs.error());
-        state->repairs = std::move(*repairs);
-        if (Status begun = beginSession(state->context); !begun) return begun.error();
-        keepSpaceReserve(state->path);
-    }
+    const Status begun = session ? state->begin() : Status();
+    if (!begun) state.reset();
+    // What was given up is needed to the end; a session that does not begin has come to its own.
+    const bool needsRoom = givenUp != 0 && begun.ok();
+    if (session && !needsRoom) keepSpaceReserve(place, givenUp);
+    if (!begun) return cannotUseDevice(path, begun.error());
     return std::unique_ptr<Device>(new Device(std::move(state)));
 }
 
@@ -144,10 +156,12 @@ Device::~Device() {
         clearPackages(state_->context);
         endSession(state_->context).ignore();
     }
-    if (!isSession && !state_->options.makesRoom) return;
+    const bool makesRoom = state_->options.makesRoom;
+    const std::uint64_t borrowed = makesRoom ? 0 : state_->givenUpReserve;
+    if (!isSession && !makesRoom && borrowed == 0) return;
     const std::string path = state_->path;
     state_.reset();  // and with it what the database's log has taken
-    keepSpaceReserve(path);
+    keepSpaceReserve(path, borrowed);
 }
 
 Platform Device::platform(SyncHost& host, LogFacility& log) {
@@ -188,7 +202,8 @@ Result<std::uint64_t> Device::freeSpace() const {
     if (!kept) return kept.error();
     const std::uint64_t capacity = std::uint64_t{space.f_blocks} * space.f_frsize;
     const std::uint64_t free = std::uint64_t{space.f_bavail} * space.f_frsize;
-    return free + std::min(*kept, capacity - std::min(free, capacity));
+    const std::uint64_t own = free - std::min(free, state_->givenUpReserve);
+    return own + std::min(*kept, capacity - std::min(own, capacity));
 }
 
 std::uint64_t Device::spaceReserve() const { return spaceReserveOf(state_->path); }

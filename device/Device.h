@@ -59,6 +59,11 @@ struct DeviceOpenOptions {
     /// Something is to be taken away. Where the disk is full, the space that the device keeps for
     /// that is given up; the next session that ends with plenty of it left keeps some again.
     bool makesRoom = false;
+    /// No more than a record is to be written. The same space is given up, and all of it that is
+    /// left kept again at the end.
+    bool borrowsRoom = false;
+    /// No earlier version of an application is given up, however full the disk is.
+    bool sparesKept = false;
     /// What goes without being asked for by name leaves the application's data where it is.
     bool keepsData = false;
 };
@@ -108,7 +113,8 @@ class Device {
     /// The system log on this machine: one JSON object a line. It may not exist yet.
     [[nodiscard]] std::string logPath() const;
     /// Bytes that may still be written to the file system that holds the device: what versions take
-    /// that are kept for a rollback is among them, as those go once the room is needed.
+    /// that are kept for a rollback is among them, as those go once the room is needed; what the
+    /// device keeps for a full disk is not, also while that is given up.
     [[nodiscard]] Result<std::uint64_t> freeSpace() const;
     /// Bytes that the device keeps back for a full disk: 0 where it could not, or has given them
     /// up.
@@ -211,7 +217,8 @@ class Device {
     /// bytes nothing is needed.
     void makeRoom(std::uint64_t bytes);
     /// Exchanges the application with the version that its last update has replaced; the data stays
-    /// as it is. Refused while it runs or is being updated, and where nothing is kept of it.
+    /// as it is. Refused while it runs or is being updated, and where nothing is kept of it. What
+    /// is damaged is kept no more.
     [[nodiscard]] Result<RollbackRecord> rollBack(const std::string& identifier);
     /// Takes the bundle away and leaves placeholder and data.
     Status demote(const std::string& identifier, DemotedBy by);

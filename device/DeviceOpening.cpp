@@ -152,6 +152,16 @@ Status openFiles(const fs::path& device, OpenedDevice& opened) {
     return {};
 }
 
+// Nothing is known yet of what a session needs: one that turns out to need nothing makes the
+// reserve again at its end, while what is kept would be gone.
+void makeRoomToOpen(const OpeningNeeds& needs, OpenedDevice& opened) {
+    const bool couldGiveUpKept = needs.session && isFullWithKept(opened.path);
+    if (needs.makesRoom || needs.borrowsRoom || couldGiveUpKept) {
+        opened.givenUpReserve = giveUpSpaceReserveIfFull(opened.path);
+    }
+    if (couldGiveUpKept && !needs.sparesKept) giveUpKeptIfFull(opened.path);
+}
+
 std::string whatToDoAbout(const ErrorRecord& cause) {
     if (isInTheWay(cause)) return "; remove what stands there in its place";
     const bool isForbidden = cause.domain == kPosixErrorDomain && cause.code == EACCES;
@@ -167,7 +177,7 @@ ErrorRecord cannotUseDevice(const std::string& path, const ErrorRecord& cause) {
                                                        whatToDoAbout(cause));
 }
 
-Result<OpenedDevice> openDevice(const std::string& path, bool session, bool makesRoom) {
+Result<OpenedDevice> openDevice(const std::string& path, const OpeningNeeds& needs) {
     std::error_code error;
     const fs::path device = fs::absolute(path, error);
     if (path.empty() || path.find('\0') != path.npos || error) return missing(path).error();
@@ -175,14 +185,15 @@ Result<OpenedDevice> openDevice(const std::string& path, bool session, bool make
     opened.path = device.string();
     Status status = checkDirectory(device);
     if (status) actAsOwnerOf(device);
-    if (status && session) status = requireWritable(device);
-    if (status && session) status = takeLock(device, opened.lock);
-    if (status && makesRoom) giveUpSpaceReserveIfFull(opened.path);
-    if (status && session) giveUpKeptIfFull(opened.path);
-    if (status) status = openDatabase(device, session, opened);
+    if (status && needs.session) status = requireWritable(device);
+    if (status && needs.session) status = takeLock(device, opened.lock);
+    if (status) makeRoomToOpen(needs, opened);
+    if (status) status = openDatabase(device, needs.session, opened);
     if (status) status = openFiles(device, opened);
-    if (!status) return cannotUseDevice(path, status.error());
-    return opened;
+    if (status) return opened;
+    opened.database.reset();
+    if (opened.givenUpReserve != 0) keepSpaceReserve(opened.path, opened.givenUpReserve);
+    return cannotUseDevice(path, status.error());
 }
 
 }  // namespace appsync

@@ -75,18 +75,22 @@ bool makeSpaceReserve(const std::string& devicePath) noexcept {
     return error != ENOSPC && error != EDQUOT;
 }
 
-void keepSpaceReserve(const std::string& devicePath) noexcept {
+void keepSpaceReserve(const std::string& devicePath, std::uint64_t borrowed) noexcept {
     const UniqueFd directory = openDevice(devicePath);
     const std::optional<off_t> held = directory ? reserveIn(directory.get()) : std::nullopt;
     if (!held || *held == kReserve) return;
-    const off_t wanted = reserveOf(freeSpaceAt(directory.get()));
+    const off_t space = freeSpaceAt(directory.get());
+    const off_t back = std::min({space, static_cast<off_t>(borrowed), kReserve}) / kBlock * kBlock;
+    const off_t wanted = std::max(reserveOf(space), back);
     if (wanted > *held) makeReserveIn(directory.get(), wanted);
 }
 
-void giveUpSpaceReserveIfFull(const std::string& devicePath) noexcept {
+std::uint64_t giveUpSpaceReserveIfFull(const std::string& devicePath) noexcept {
     const UniqueFd directory = openDevice(devicePath);
-    if (!directory || freeSpaceAt(directory.get()) >= kReserve) return;
-    if (spaceReserveOf(devicePath) != 0) ::unlinkat(directory.get(), kReserveName.data(), 0);
+    if (!directory || freeSpaceAt(directory.get()) >= kReserve) return 0;
+    const std::uint64_t held = spaceReserveOf(devicePath);
+    if (held == 0 || ::unlinkat(directory.get(), kReserveName.data(), 0) != 0) return 0;
+    return held;
 }
 
 std::uint64_t spaceReserveOf(const std::string& devicePath) noexcept {

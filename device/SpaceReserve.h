@@ -16,11 +16,13 @@ inline constexpr std::uint64_t kSpaceOfNewDevice = std::uint64_t{512} << 10U;
 [[nodiscard]] bool makeSpaceReserve(const std::string& devicePath) noexcept;
 
 /// Makes the file where there is none, or lets a smaller one grow: whole where plenty of space is
-/// free, else as much as a removal needs, as long as that much is there. May do nothing.
-void keepSpaceReserve(const std::string& devicePath) noexcept;
+/// free, else as much as a removal needs, as long as that much is there. What was borrowed is kept
+/// again as far as there is room. May do nothing.
+void keepSpaceReserve(const std::string& devicePath, std::uint64_t borrowed = 0) noexcept;
 
-/// Gives the file up where less space is left than it takes.
-void giveUpSpaceReserveIfFull(const std::string& devicePath) noexcept;
+/// Gives the file up where less space is left than it takes. Gives what it took; 0
+/// where nothing was given up.
+std::uint64_t giveUpSpaceReserveIfFull(const std::string& devicePath) noexcept;
 
 /// What the file takes; 0 where there is none.
 [[nodiscard]] std::uint64_t spaceReserveOf(const std::string& devicePath) noexcept;

@@ -41,6 +41,11 @@ std::optional<std::uint64_t> freeBytesAt(int directory) {
     return std::uint64_t{space.f_bavail} * space.f_frsize;
 }
 
+bool isFullAt(const std::string& devicePath) {
+    const UniqueFd device(::open(devicePath.c_str(), O_RDONLY | O_DIRECTORY | O_CLOEXEC));
+    return device.valid() && freeBytesAt(device.get()).value_or(kRoomOfDatabase) < kRoomOfDatabase;
+}
+
 // `path` is what an error names.
 Status renameBetween(int from, int to, const std::string& name, const std::string& path) {
     if (::renameat2(from, name.c_str(), to, name.c_str(), RENAME_NOREPLACE) == 0) return {};
@@ -177,17 +182,21 @@ void makeRoomFor(const InstallContext& context, std::uint64_t bytes) {
     forgetAllKept(context, givenUp).ignore();
 }
 
+bool isFullWithKept(const std::string& devicePath) noexcept {
+    try {
+        return isFullAt(devicePath) && !containersByArrival(pathOfKept(devicePath)).empty();
+    } catch (const std::exception&) {
+        return false;
+    }
+}
+
 void giveUpKeptIfFull(const std::string& devicePath) noexcept {
     try {
-        const UniqueFd device(::open(devicePath.c_str(), O_RDONLY | O_DIRECTORY | O_CLOEXEC));
-        const auto isFull = [&device] {
-            return freeBytesAt(device.get()).value_or(kRoomOfDatabase) < kRoomOfDatabase;
-        };
-        if (!device || !isFull()) return;
+        if (!isFullAt(devicePath)) return;
         std::error_code error;
         for (const std::string& container : containersByArrival(pathOfKept(devicePath))) {
             fs::remove_all(container, error);
-            if (!isFull()) return;
+            if (!isFullAt(devicePath)) return;
         }
     } catch (const std::exception&) {
         return;  // what comes next tells that the disk is full

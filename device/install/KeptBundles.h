@@ -60,6 +60,10 @@ void putAway(const InstallContext& context, const FreedContainers& freed);
 /// device's disk; none where they are. Only while the session's lock is held.
 void makeRoomFor(const InstallContext& context, std::uint64_t bytes);
 
+/// Whether the disk of a device is so full that not even its database can be written, while
+/// something is kept that could be given up.
+[[nodiscard]] bool isFullWithKept(const std::string& devicePath) noexcept;
+
 /// For a device that is about to be opened, whose lock is held: on a disk where not even its
 /// database can be written, gives up what is kept, what was put there first first, until that can
 /// be. The records follow when the device is put in order. Never fails.

@@ -1,5 +1,6 @@
 """What the last update of an application has replaced comes back."""
 
+import json
 import os
 import shutil
 
@@ -210,3 +211,85 @@ cat /dev/zero >>{disk}/filler 2>/dev/null
     before, after = said[:second], said[second:]
     assert [line.split()[-1] for line in before if line.startswith("com.example.")] == ["1.0", "1.0"], done.stdout
     assert [line.split()[1] for line in after if line.startswith(B)] == ["3.0"], done.stdout
+
+
+def damaged_program(bundle):
+    path = os.path.join(bundle, "Resources/data.bin")
+    with open(path, "r+b") as file:
+        first = file.read(1)
+        file.seek(0)
+        file.write(bytes([first[0] ^ 1]))
+
+
+DAMAGES = {"a flipped bit": damaged_program,
+           "an emptied program": lambda bundle: os.truncate(os.path.join(bundle, "Resources/data.bin"), 0),
+           "a lost program": lambda bundle: os.remove(os.path.join(bundle, "Resources/data.bin")),
+           "a lost bundle": shutil.rmtree}
+
+
+@pytest.mark.parametrize("damage", DAMAGES)
+def test_what_is_damaged_is_not_installed_and_is_said_to_be_gone(appsync, updated, damage):
+    (container,) = kept_folders(updated)
+    DAMAGES[damage](os.path.join(updated.path, "kept", container, BUNDLE))
+    done = appsync("rollback", updated.path, A, expect=1)
+    assert "that was kept is " + ("gone" if damage == "a lost bundle" else "damaged") in done.stderr
+    assert updated.versions()[A] == "2.0" and program(updated) == b"program of 2.0"
+    assert kept(updated) is None and kept_folders(updated) == []
+    assert appsync.json("status", updated.path)["kept"] == 0
+    assert "no earlier version" in appsync("rollback", updated.path, A, expect=1).stderr
+
+
+def on_a_full_disk(appsync, tmp_path, coordination, steps):
+    """What a shell says of the steps, after two updates of 300 KB each, where no byte is free; of each step its status."""
+    for version in ("1.0", "2.0"):
+        for identifier in (A, B):
+            packages.make_package(str(tmp_path / version), identifier, version, payload=os.urandom(300_000))
+    disk = tmp_path / "disk"
+    disk.mkdir()
+    head = """
+mount -t tmpfs -o size=6m tmpfs {disk} && {appsync} create {disk}/d --coordination {coordination} >/dev/null || exit 1
+for version in 1.0 2.0; do {appsync} sync {disk}/d {libraries}/$version >/dev/null; done
+"""
+    tail = "".join("cat /dev/zero >>{disk}/filler 2>/dev/null; %s; echo status $?\n" % step for step in steps)
+    done = in_own_mounts((head + tail + "{appsync} apps {disk}/d --json").format(
+        disk=disk, appsync=appsync.program, libraries=tmp_path, coordination=coordination, a=A, b=B))
+    said, _, apps = done.stdout.partition("[\n")
+    statuses = [int(line.split()[1]) for line in said.splitlines() if line.startswith("status ")]
+    listed = {app["identifier"]: (app["version"], app["kept"] and app["kept"]["version"])
+              for app in json.loads("[\n" + apps)}
+    return statuses, listed, said + done.stderr
+
+
+def test_a_rollback_works_on_a_full_disk_and_gives_nothing_up(appsync, tmp_path, coordination):
+    statuses, apps, said = on_a_full_disk(appsync, tmp_path, coordination, [
+        "{appsync} rollback {disk}/d com.example.nobody", "{appsync} rollback {disk}/d {a}",
+        "{appsync} rollback {disk}/d {a}", "{appsync} rollback {disk}/d {a}"])
+    assert statuses == [1, 0, 0, 0], said
+    assert apps == {A: ("1.0", "2.0"), B: ("2.0", "1.0")}
+
+
+def test_without_space_that_is_kept_back_a_rollback_is_refused_and_gives_nothing_up(appsync, tmp_path, coordination):
+    statuses, apps, said = on_a_full_disk(appsync, tmp_path, coordination, [
+        "rm {disk}/d/space.reserve", "{appsync} rollback {disk}/d {a}"])
+    assert statuses == [0, 3], said
+    assert apps == {A: ("2.0", "1.0"), B: ("2.0", "1.0")}
+
+
+def test_on_a_full_disk_nothing_is_given_up_for_what_is_refused_or_needs_no_room(appsync, tmp_path, coordination):
+    statuses, apps, said = on_a_full_disk(appsync, tmp_path, coordination, [
+        "{appsync} demote {disk}/d com.example.nobody", "{appsync} data push {disk}/d com.example.nobody {libraries} --yes",
+        "{appsync} sync {disk}/d {libraries}/2.0", "{appsync} sync {disk}/d {libraries}/nowhere",
+        "test $(stat -c %s {disk}/d/space.reserve) -ge 98304"])
+    assert statuses == [1, 1, 0, 3, 0], said
+    assert apps == {A: ("2.0", "1.0"), B: ("2.0", "1.0")}
+
+
+def test_a_person_runs_quits_and_sets_on_a_full_disk_again_and_again(appsync, tmp_path, coordination):
+    """Also where a sync has failed for want of room; and an application can be removed all the same."""
+    round_of_commands = ["{appsync} run {disk}/d {a}", "{appsync} set {disk}/d removal=no", "{appsync} quit {disk}/d {a}",
+                         "{appsync} set {disk}/d removal=unset"]
+    packages.make_package(str(tmp_path / "large"), "com.example.large", payload=os.urandom(2_000_000))
+    statuses, apps, said = on_a_full_disk(appsync, tmp_path, coordination, [
+        "{appsync} sync {disk}/d {libraries}/large", *(round_of_commands * 5), "{appsync} uninstall {disk}/d {b}"])
+    assert statuses == [1, *[0] * 20, 0], said
+    assert list(apps) == [A]

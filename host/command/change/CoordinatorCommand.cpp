@@ -77,9 +77,11 @@ Status act(Device& device, const CoordinatorArguments& arguments) {
 int runCoordinator(const CoordinatorArguments& arguments, const Console& console) {
     const Status checked = checkArguments(arguments);
     if (!checked) return console.fail(checked.error());
-    const Result<std::unique_ptr<Device>> device = openDevice(arguments.device, DeviceAccess::Look);
+    const bool isList = arguments.action == "list";
+    const Result<std::unique_ptr<Device>> device =
+        openDevice(arguments.device, {.borrowsRoom = !isList});
     if (!device) return console.fail(device.error());
-    if (arguments.action == "list") return listCoordinators(**device, arguments.asJson, console);
+    if (isList) return listCoordinators(**device, arguments.asJson, console);
     const Status done = act(**device, arguments);
     if (!done) return console.fail(classified(done.error()));
     if (arguments.asJson) return listCoordinators(**device, true, console);

@@ -41,7 +41,8 @@ int runRollback(const ApplicationArguments& arguments, const Console& console) {
     const Status checked = checkIdentifier(identifier, kGiveAsShown);
     if (!checked) return console.fail(checked.error());
     const Result<std::unique_ptr<Device>> device =
-        openDevice(arguments.device, DeviceAccess::Session);
+        openDevice(arguments.device,
+                   {.access = DeviceAccess::Session, .borrowsRoom = true, .sparesKept = true});
     if (!device) return console.fail(device.error());
     const Result<RollbackRecord> record = (*device)->rollBack(identifier);
     if (const auto broken = (*device)->databaseFailure()) return console.fail(unusable(*broken));

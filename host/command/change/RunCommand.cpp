@@ -18,13 +18,13 @@ Result<ActionOutcome> setRunning(Device& device, const std::string& identifier, 
 
 int runRun(const ApplicationArguments& arguments, const Console& console) {
     const ActionTexts texts{"runs", "runs already", "running"};
-    return actOn(arguments, {}, texts, console,
+    return actOn(arguments, {.borrowsRoom = true}, texts, console,
                  [&](Device& opened) { return setRunning(opened, arguments.identifier, true); });
 }
 
 int runQuit(const ApplicationArguments& arguments, const Console& console) {
     const ActionTexts texts{"does not run any more", "did not run", "not running"};
-    return actOn(arguments, {}, texts, console,
+    return actOn(arguments, {.borrowsRoom = true}, texts, console,
                  [&](Device& opened) { return setRunning(opened, arguments.identifier, false); });
 }
 

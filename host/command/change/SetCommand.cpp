@@ -170,7 +170,7 @@ int runSet(const std::string& device, const std::vector<std::string>& assignment
            const Console& console) {
     const Result<DeviceSettingsChange> change = parseAssignments(assignments);
     if (!change) return console.fail(change.error());
-    const Result<std::unique_ptr<Device>> opened = openDevice(device, DeviceAccess::Look);
+    const Result<std::unique_ptr<Device>> opened = openDevice(device, {.borrowsRoom = true});
     if (!opened) return console.fail(opened.error());
     const Result<ChangedSettings> settings = changeSettings(**opened, *change);
     if (!settings) return console.fail(settings.error());
