@@ -155,11 +155,11 @@ Status openFiles(const fs::path& device, OpenedDevice& opened) {
 // Nothing is known yet of what a session needs: one that turns out to need nothing makes the
 // reserve again at its end, while what is kept would be gone.
 void makeRoomToOpen(const OpeningNeeds& needs, OpenedDevice& opened) {
-    const bool couldGiveUpKept = needs.session && isFullWithKept(opened.path);
+    const bool couldGiveUpKept = needs.session && !needs.sparesKept && isFullWithKept(opened.path);
     if (needs.makesRoom || needs.borrowsRoom || couldGiveUpKept) {
         opened.givenUpReserve = giveUpSpaceReserveIfFull(opened.path);
     }
-    if (couldGiveUpKept && !needs.sparesKept) giveUpKeptIfFull(opened.path);
+    if (couldGiveUpKept) giveUpKeptIfFull(opened.path);
 }
 
 std::string whatToDoAbout(const ErrorRecord& cause) {

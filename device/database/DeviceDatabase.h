@@ -1,11 +1,11 @@
 #pragma once
 
 // device/database: the one room that knows SQLite. `Database` is a connection and `Query` a
-// statement (Database.h); DeviceSchema.h makes and checks the tables; RegistryTables.h and
-// CoordinationTables.h are their statements, as functions that run inside a transaction of the
-// caller's. `DeviceDatabase` (this header) is what the other rooms hold: it reads, and it makes
-// changes whole, with as few waits for the disk as their durability allows. DatabaseCopy.h is for
-// those who may only read.
+// statement (Database.h); DeviceSchema.h makes and checks the tables; RegistryTables.h,
+// KeptTable.h, SumTable.h and CoordinationTables.h are their statements, as functions that run
+// inside a transaction of the caller's. `DeviceDatabase` (this header) is what the other rooms
+// hold: it reads, and it makes changes whole, with as few waits for the disk as their durability
+// allows. DatabaseCopy.h is for those who may only read.
 //
 // A new table, or a new column, begins in DeviceSchema.cpp, with a new schema version, and in
 // docs/device-format.md. Includes device/values, system/ and SQLite. Called by screen, services,

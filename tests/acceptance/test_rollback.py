@@ -279,8 +279,9 @@ def test_on_a_full_disk_nothing_is_given_up_for_what_is_refused_or_needs_no_room
     statuses, apps, said = on_a_full_disk(appsync, tmp_path, coordination, [
         "{appsync} demote {disk}/d com.example.nobody", "{appsync} data push {disk}/d com.example.nobody {libraries} --yes",
         "{appsync} sync {disk}/d {libraries}/2.0", "{appsync} sync {disk}/d {libraries}/nowhere",
+        "{appsync} backup {disk}/d {libraries}/backup",
         "test $(stat -c %s {disk}/d/space.reserve) -ge 98304"])
-    assert statuses == [1, 1, 0, 3, 0], said
+    assert statuses == [1, 1, 0, 3, 0, 0], said
     assert apps == {A: ("2.0", "1.0"), B: ("2.0", "1.0")}
 
 

@@ -137,6 +137,8 @@ def look(runner, _):
     for arguments in (["set", runner.device, "installation=no"], ["run", runner.device, identifier]):
         runner.ok(*arguments)  # a record, for which the device keeps space back
         runner.disk.fill()
+    runner.ok("backup", runner.device, os.path.join(runner.folder, "backup"))
+    runner.disk.fill()
     assert "uninstall" in runner.refused("sync", runner.device, runner.library)
     runner.check_intact()
     check_looks(runner, identifier)

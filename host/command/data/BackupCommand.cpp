@@ -1,5 +1,8 @@
+#include <sys/stat.h>
+
 #include <chrono>
 #include <cmath>
+#include <filesystem>
 #include <map>
 #include <ostream>
 #include <utility>
@@ -122,12 +125,31 @@ int failWhole(const BackupArguments& arguments, const ErrorRecord& error, const 
     return console.fail(error);
 }
 
+// Whether a backup that is made there leaves the disk of the device as it is.
+bool liesOnOtherDisk(const std::string& backup, const std::string& device) {
+    namespace fs = std::filesystem;
+    std::error_code code;
+    const fs::path place = fs::absolute(backup, code);
+    struct stat ofBackup {};
+    struct stat ofDevice {};
+    const bool isKnown = ::stat(place.c_str(), &ofBackup) == 0 ||
+                         ::stat(place.parent_path().c_str(), &ofBackup) == 0;
+    return isKnown && ::stat(device.c_str(), &ofDevice) == 0 && ofBackup.st_dev != ofDevice.st_dev;
+}
+
+// It writes no more than a record to the device.
+DeviceOpenOptions backupOptions(const BackupArguments& arguments) {
+    DeviceOpenOptions options{.access = DeviceAccess::Session, .sparesKept = true};
+    options.borrowsRoom = liesOnOtherDisk(arguments.backup, arguments.device);
+    return options;
+}
+
 }  // namespace
 
 int runBackup(const BackupArguments& arguments, const Console& console) {
     const Clock::time_point begin = Clock::now();
     const Result<std::unique_ptr<Device>> device =
-        openDevice(arguments.device, DeviceAccess::Session);
+        openDevice(arguments.device, backupOptions(arguments));
     if (!device) return console.fail(device.error());
     const Result<std::unique_ptr<PlugIn>> plugIn = PlugIn::load(**device, console);
     if (!plugIn) return console.fail(plugIn.error());
