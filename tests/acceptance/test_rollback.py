@@ -291,6 +291,7 @@ def test_a_person_runs_quits_and_sets_on_a_full_disk_again_and_again(appsync, tm
                          "{appsync} set {disk}/d removal=unset"]
     packages.make_package(str(tmp_path / "large"), "com.example.large", payload=os.urandom(2_000_000))
     statuses, apps, said = on_a_full_disk(appsync, tmp_path, coordination, [
-        "{appsync} sync {disk}/d {libraries}/large", *(round_of_commands * 5), "{appsync} uninstall {disk}/d {b}"])
-    assert statuses == [1, *[0] * 20, 0], said
+        "{appsync} sync {disk}/d {libraries}/large", *(round_of_commands * 5),
+        "test $(stat -c %s {disk}/d/space.reserve) -ge 200000", "{appsync} uninstall {disk}/d {b}"])
+    assert statuses == [1, *[0] * 20, 0, 0], said
     assert list(apps) == [A]
