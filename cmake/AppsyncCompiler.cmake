@@ -5,7 +5,7 @@ set(CMAKE_CXX_STANDARD_REQUIRED ON)
 set(CMAKE_CXX_EXTENSIONS OFF)
 set(CMAKE_EXPORT_COMPILE_COMMANDS ON)
 
-if(NOT CMAKE_BUILD_TYPE)
+if(PROJECT_IS_TOP_LEVEL AND NOT CMAKE_BUILD_TYPE)
     set(CMAKE_BUILD_TYPE Release CACHE STRING "Build type" FORCE)
 endif()
 # -O3 makes the build longer and the command no faster: its time goes into the kernel and zlib.
@@ -65,7 +65,7 @@ endif()
 find_program(APPSYNC_CCACHE ccache)
 if(APPSYNC_CCACHE AND NOT CMAKE_CXX_COMPILER_LAUNCHER)
     set(CMAKE_CXX_COMPILER_LAUNCHER
-        "${CMAKE_COMMAND}" -E env "CCACHE_BASEDIR=${CMAKE_SOURCE_DIR}" CCACHE_NOHASHDIR=1
+        "${CMAKE_COMMAND}" -E env "CCACHE_BASEDIR=${PROJECT_SOURCE_DIR}" CCACHE_NOHASHDIR=1
         CCACHE_SLOPPINESS=pch_defines,time_macros "${APPSYNC_CCACHE}")
     if(CMAKE_CXX_COMPILER_ID STREQUAL "Clang")
         # A time stamp inside a precompiled header would make each one new to ccache.

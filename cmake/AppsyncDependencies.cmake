@@ -1,6 +1,10 @@
 # Everything third-party comes from Debian packages (scripts/setup installs them). Nothing is downloaded.
 
 find_package(Threads REQUIRED)
+find_package(pugixml REQUIRED)
+if(NOT APPSYNC_COMMAND)
+    return()
+endif()
 find_package(PkgConfig REQUIRED)
 pkg_check_modules(SQLITE3 REQUIRED IMPORTED_TARGET sqlite3)
 pkg_check_modules(LIBZIP REQUIRED IMPORTED_TARGET libzip)
@@ -9,7 +13,6 @@ pkg_check_modules(DEFLATE REQUIRED IMPORTED_TARGET libdeflate)
 pkg_check_modules(LIBCRYPTO REQUIRED IMPORTED_TARGET libcrypto)
 pkg_check_modules(CAIRO REQUIRED IMPORTED_TARGET cairo)
 pkg_check_modules(PNG REQUIRED IMPORTED_TARGET libpng)
-find_package(pugixml REQUIRED)
 find_package(CLI11 REQUIRED)
 find_package(nlohmann_json REQUIRED)
 if(APPSYNC_TESTS)

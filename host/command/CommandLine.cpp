@@ -26,6 +26,7 @@
 #include "host/command/sync/SyncCommands.h"
 #include "host/console/Console.h"
 #include "host/console/Problem.h"
+#include "host/module/PlugInModule.h"
 
 namespace appsync {
 namespace {
@@ -122,8 +123,10 @@ class Commands {
     explicit Commands(const Console& console) : console_(console), app_(kDescription, "appsync") {
         app_.require_subcommand(1);
         app_.footer(kFooter);
-        app_.set_version_flag("--version", "appsync " APPSYNC_VERSION,
-                              "Print the version and exit");
+        app_.set_version_flag(
+            "--version",
+            "appsync " APPSYNC_VERSION ", module interface " + moduleInterfaceVersion(),
+            "Print the version, and that of the plug-in modules it loads, and exit");
         addSync();
         addPlan();
         addStage();
@@ -406,6 +409,11 @@ class Commands {
         addWait(added, values);
     }
 
+    static void addPlugIn(CLI::App& added, std::string& plugIn) {
+        added.add_option("--plug-in", plugIn, "run with the plug-in of this module")
+            ->type_name("MODULE");
+    }
+
     static void addMirror(CLI::App& added, SyncArguments& values) {
         added.add_flag("--mirror")
             ->description("remove every user application that LIBRARY lacks")
@@ -452,6 +460,7 @@ class Commands {
         addPlanOptions(added, *values);
         addStaged(added, *values);
         added.add_flag("--dry-run", values->isDryRun, "only say what would be done (= plan)");
+        addPlugIn(added, values->plugIn);
         addDisplay(added, values->display);
     }
 
@@ -493,6 +502,7 @@ class Commands {
                 "where the device knows of data, else 3")
             ->type_name("N")
             ->check(wholeNumberFrom(1, 3));
+        addPlugIn(added, values->plugIn);
         addDisplay(added, values->display);
     }
 
@@ -747,6 +757,7 @@ class Commands {
                 "the kind of restore; 2 and 3 bring applications back (default 2)")
             ->type_name("N")
             ->check(anyWholeNumber());
+        addPlugIn(added, values->plugIn);
         added.add_flag("--json", values->asJson, "print JSON");
     }
 

@@ -4,7 +4,6 @@
 #include <string>
 #include <utility>
 
-#include "client/AppsClient.h"
 #include "device/Device.h"
 #include "host/console/Console.h"
 #include "host/console/Problem.h"
@@ -25,8 +24,8 @@ Platform watched(const Platform& platform, SessionWatch& watch) {
 
 }  // namespace
 
-PlugIn::PlugIn(SyncDaemon::Process process, const Console& console)
-    : daemon_(process), console_(console) {}
+PlugIn::PlugIn(SyncDaemon::Process process, const Console& console, const PlugInTable& table)
+    : daemon_(process), console_(console), table_(table) {}
 
 // The device may be in the middle of telling the client something.
 PlugIn::~PlugIn() {
@@ -36,8 +35,8 @@ PlugIn::~PlugIn() {
         device_->closeCoordination();
     }
     // Or else the client might go on the registry's thread, after what it stands on.
-    if (client_ != nullptr) registry_->removeObserver(client_.get());
-    client_.reset();  // its last messages come now
+    if (client_.client != nullptr) registry_->removeObserver(client_.observer);
+    table_.destroyClient(client_);  // its last messages come now
     tellLogLoss();
 }
 
@@ -60,43 +59,58 @@ void PlugIn::tellLogLoss() const {
 }
 
 Result<std::unique_ptr<PlugIn>> PlugIn::loadIn(SyncDaemon::Process process, Device& device,
-                                               const Console& console) {
-    std::unique_ptr<PlugIn> plugIn(new PlugIn(process, console));
+                                               const Console& console, const PlugInTable& table) {
+    std::unique_ptr<PlugIn> plugIn(new PlugIn(process, console, table));
     plugIn->device_ = &device;
     const Status status = plugIn->openLog(device);
     if (!status) return status.error();
     plugIn->platform_ =
         std::make_unique<const Platform>(device.platform(plugIn->daemon_, *plugIn->log_));
-    plugIn->registry_ = &plugIn->platform_->registry;
+    return plugIn;
+}
+
+Status PlugIn::makeClient(const Platform& platform) {
+    registry_ = &platform.registry;
+    client_ = table_.makeClient(platform);
+    if (client_.client != nullptr) return {};
+    return failure("out of means: the plug-in cannot make its client", "run it again");
+}
+
+Result<std::unique_ptr<PlugIn>> PlugIn::loadPlain(SyncDaemon::Process process, Device& device,
+                                                  const Console& console,
+                                                  const PlugInTable& table) {
+    Result<std::unique_ptr<PlugIn>> plugIn = loadIn(process, device, console, table);
+    if (!plugIn) return plugIn;
+    const Status made = (*plugIn)->makeClient((*plugIn)->platform());
+    if (!made) return made.error();
     return plugIn;
 }
 
 Result<std::unique_ptr<PlugIn>> PlugIn::load(Device& device, const Console& console) {
-    Result<std::unique_ptr<PlugIn>> plugIn = loadIn(SyncDaemon::Process::Daemon, device, console);
-    if (plugIn) (*plugIn)->client_ = AppsClient::create((*plugIn)->platform());
-    return plugIn;
+    return loadPlain(SyncDaemon::Process::Daemon, device, console, *appsyncPlugInTable());
 }
 
-Result<std::unique_ptr<PlugIn>> PlugIn::loadForRestore(Device& device, const Console& console) {
-    Result<std::unique_ptr<PlugIn>> plugIn = loadIn(SyncDaemon::Process::Restore, device, console);
-    if (plugIn) (*plugIn)->client_ = AppsClient::create((*plugIn)->platform());
-    return plugIn;
+Result<std::unique_ptr<PlugIn>> PlugIn::loadForRestore(Device& device, const Console& console,
+                                                       const PlugInTable& table) {
+    return loadPlain(SyncDaemon::Process::Restore, device, console, table);
 }
 
 Result<std::unique_ptr<PlugIn>> PlugIn::load(Device& device, SyncEvents& events,
-                                             SessionFacts& facts, const Console& console) {
-    Result<std::unique_ptr<PlugIn>> loaded = loadIn(SyncDaemon::Process::Daemon, device, console);
+                                             SessionFacts& facts, const Console& console,
+                                             const PlugInTable& table) {
+    Result<std::unique_ptr<PlugIn>> loaded =
+        loadIn(SyncDaemon::Process::Daemon, device, console, table);
     if (!loaded) return loaded;
     PlugIn& plugIn = **loaded;
     plugIn.watch_ = std::make_unique<SessionWatch>(device, plugIn.platform(), events, facts);
-    plugIn.registry_ = &plugIn.watch_->registry();
-    plugIn.client_ = AppsClient::create(watched(plugIn.platform(), *plugIn.watch_));
+    const Status made = plugIn.makeClient(watched(plugIn.platform(), *plugIn.watch_));
+    if (!made) return made.error();
     // What an interrupted session has delivered must not end while the plug-in looks what there is.
     device.holdCoordinatedInstalls();
     plugIn.platform().notificationCenter.post(kStartupCompleteNotification);
     return loaded;
 }
 
-SyncClient& PlugIn::client() { return *client_; }
+SyncClient& PlugIn::client() { return *client_.client; }
 
 }  // namespace appsync

@@ -5,12 +5,12 @@
 #include "host/console/Console.h"
 #include "host/watch/SyncDaemon.h"
 #include "platform/Platform.h"
+#include "platform/PlugInTable.h"
 #include "platform/Result.h"
 
 namespace appsync {
 
 class AppRegistry;
-class AppsClient;
 class Device;
 class JsonLogFacility;
 class SessionFacts;
@@ -20,7 +20,8 @@ class SyncEvents;
 
 /// The plug-in, loaded on a device: what the sync daemon does at its start. Its log is the
 /// device's; what cannot be written to it is told on the console, at the end. The device and the
-/// console's streams must outlive it.
+/// console's streams must outlive it, and so must the module that a table is of; without one it is
+/// the plug-in that is built in.
 class PlugIn {
   public:
     [[nodiscard]] static Result<std::unique_ptr<PlugIn>> load(Device& device,
@@ -28,12 +29,12 @@ class PlugIn {
     /// For a session: with a watch between plug-in and device, and told that the daemon has started
     /// up, upon which it attaches to the coordination service. Coordinated installs are held: the
     /// session lets them go. Events and facts must outlive it.
-    [[nodiscard]] static Result<std::unique_ptr<PlugIn>> load(Device& device, SyncEvents& events,
-                                                              SessionFacts& facts,
-                                                              const Console& console);
+    [[nodiscard]] static Result<std::unique_ptr<PlugIn>> load(
+        Device& device, SyncEvents& events, SessionFacts& facts, const Console& console,
+        const PlugInTable& table = *appsyncPlugInTable());
     /// In the process that restores backups, which is not the sync daemon.
-    [[nodiscard]] static Result<std::unique_ptr<PlugIn>> loadForRestore(Device& device,
-                                                                        const Console& console);
+    [[nodiscard]] static Result<std::unique_ptr<PlugIn>> loadForRestore(
+        Device& device, const Console& console, const PlugInTable& table = *appsyncPlugInTable());
     ~PlugIn();
 
     [[nodiscard]] SyncClient& client();
@@ -46,10 +47,16 @@ class PlugIn {
     [[nodiscard]] TransferQueue& transfers() { return daemon_.transfers(); }
 
   private:
-    PlugIn(SyncDaemon::Process process, const Console& console);
+    PlugIn(SyncDaemon::Process process, const Console& console, const PlugInTable& table);
     [[nodiscard]] static Result<std::unique_ptr<PlugIn>> loadIn(SyncDaemon::Process process,
                                                                 Device& device,
-                                                                const Console& console);
+                                                                const Console& console,
+                                                                const PlugInTable& table);
+    [[nodiscard]] static Result<std::unique_ptr<PlugIn>> loadPlain(SyncDaemon::Process process,
+                                                                   Device& device,
+                                                                   const Console& console,
+                                                                   const PlugInTable& table);
+    Status makeClient(const Platform& platform);
     Status openLog(Device& device);
     void tellLogLoss() const;
 
@@ -57,10 +64,11 @@ class PlugIn {
     const Console console_;
     Device* device_ = nullptr;
     AppRegistry* registry_ = nullptr;  // the one that the client observes
+    const PlugInTable& table_;
     std::unique_ptr<JsonLogFacility> log_;
     std::unique_ptr<const Platform> platform_;
     std::unique_ptr<SessionWatch> watch_;
-    std::shared_ptr<AppsClient> client_;  // goes first
+    PlugInClient client_;  // goes first
 };
 
 }  // namespace appsync

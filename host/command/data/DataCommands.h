@@ -42,6 +42,8 @@ struct RestoreArguments {
     std::string backup;
     /// What the plug-in is told; 2 and 3 bring applications back.
     std::int64_t type = 2;
+    /// The module with the plug-in; empty: the one that is built in.
+    std::string plugIn{};
     bool asJson = false;
 };
 [[nodiscard]] int runRestore(const RestoreArguments& arguments, const Console& console);

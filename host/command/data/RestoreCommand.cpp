@@ -15,6 +15,7 @@
 #include "host/console/Problem.h"
 #include "host/console/Table.h"
 #include "host/console/Text.h"
+#include "host/module/PlugInModule.h"
 #include "host/session/PlugIn.h"
 
 namespace appsync {
@@ -70,12 +71,15 @@ void print(const RestoreArguments& arguments, const RestoreResult& result, doubl
 
 int runRestore(const RestoreArguments& arguments, const Console& console) {
     const Clock::time_point begin = Clock::now();
+    const Result<PlugInModule> build = PlugInModule::open(arguments.plugIn);
+    if (!build) return console.fail(build.error());
     const Result<BackupManifest> manifest = readBackupManifest(arguments.backup);
     if (!manifest) return console.fail(manifest.error());
     const Result<std::unique_ptr<Device>> device =
         openDevice(arguments.device, DeviceAccess::Session);
     if (!device) return console.fail(device.error());
-    const Result<std::unique_ptr<PlugIn>> plugIn = PlugIn::loadForRestore(**device, console);
+    const Result<std::unique_ptr<PlugIn>> plugIn =
+        PlugIn::loadForRestore(**device, console, build->table());
     if (!plugIn) return console.fail(plugIn.error());
     const Result<RestoreResult> result =
         restoreBackup(arguments.backup, *manifest, arguments.type, **device, **plugIn);

@@ -17,6 +17,7 @@
 #include "host/console/Console.h"
 #include "host/console/Problem.h"
 #include "host/file/HostFile.h"
+#include "host/module/PlugInModule.h"
 #include "host/plan/InterruptedStaging.h"
 #include "host/plan/Library.h"
 #include "host/plan/LibraryReader.h"
@@ -52,8 +53,9 @@ Status checkArguments(const SendArguments& arguments) {
 
 class Sending {
   public:
-    Sending(const SendArguments& arguments, const Console& console)
+    Sending(const SendArguments& arguments, const PlugInModule& module, const Console& console)
         : arguments_(arguments),
+          module_(module),
           console_(console),
           display_(makeSyncDisplay(arguments.display, console)),
           events_(*display_),
@@ -270,7 +272,8 @@ class Sending {
     }
 
     Result<int> hold() {
-        Result<std::unique_ptr<PlugIn>> plugIn = PlugIn::load(*device_, events_, facts_, console_);
+        Result<std::unique_ptr<PlugIn>> plugIn =
+            PlugIn::load(*device_, events_, facts_, console_, module_.table());
         if (!plugIn) return plugIn.error();
         Session session(*device_, **plugIn, events_, facts_, signals_.stopRequested());
         const SessionEnd end = holdSession(session, (*plugIn)->platform().coordination);
@@ -311,6 +314,7 @@ class Sending {
     }
 
     const SendArguments& arguments_;
+    const PlugInModule& module_;
     const Console& console_;
     std::unique_ptr<SyncDisplay> display_;
     SyncEvents events_;
@@ -335,7 +339,9 @@ class Sending {
 int runSend(const SendArguments& arguments, const Console& console) {
     const Status checked = checkArguments(arguments);
     if (!checked) return console.fail(checked.error());
-    const Result<int> status = Sending(arguments, console).run();
+    const Result<PlugInModule> build = PlugInModule::open(arguments.plugIn);
+    if (!build) return console.fail(build.error());
+    const Result<int> status = Sending(arguments, *build, console).run();
     return status ? *status : console.fail(status.error());
 }
 

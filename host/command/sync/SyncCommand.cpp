@@ -17,6 +17,7 @@
 #include "host/console/Console.h"
 #include "host/console/Problem.h"
 #include "host/console/Text.h"
+#include "host/module/PlugInModule.h"
 #include "host/output/JsonSync.h"
 #include "host/output/PlanText.h"
 #include "host/plan/LibraryReader.h"
@@ -52,8 +53,9 @@ std::string givenUpNote(StagedWork work) {
 // One run of `sync` or `plan`.
 class SyncRun {
   public:
-    SyncRun(const SyncArguments& arguments, const Console& console)
+    SyncRun(const SyncArguments& arguments, const PlugInModule& module, const Console& console)
         : arguments_(arguments),
+          module_(module),
           console_(console),
           display_(makeSyncDisplay(arguments.display, console)),
           events_(*display_),
@@ -160,7 +162,8 @@ class SyncRun {
     }
 
     Result<int> hold() {
-        Result<std::unique_ptr<PlugIn>> plugIn = PlugIn::load(*device_, events_, facts_, console_);
+        Result<std::unique_ptr<PlugIn>> plugIn =
+            PlugIn::load(*device_, events_, facts_, console_, module_.table());
         if (!plugIn) return plugIn.error();
         watchOver((*plugIn)->watch());
         for (const auto* installs : {&sync_.plan.install, &sync_.plan.update}) {
@@ -256,6 +259,7 @@ class SyncRun {
     }
 
     const SyncArguments& arguments_;
+    const PlugInModule& module_;
     const Console& console_;
     std::unique_ptr<SyncDisplay> display_;
     SyncEvents events_;
@@ -279,7 +283,9 @@ class SyncRun {
 int runSync(const SyncArguments& arguments, const Console& console) {
     const Status checked = checkSyncArguments(arguments);
     if (!checked) return console.fail(checked.error());
-    const Result<int> status = SyncRun(arguments, console).run();
+    const Result<PlugInModule> build = PlugInModule::open(arguments.plugIn);
+    if (!build) return console.fail(build.error());
+    const Result<int> status = SyncRun(arguments, *build, console).run();
     return status ? *status : console.fail(status.error());
 }
 

@@ -26,6 +26,8 @@ struct SyncArguments {
     bool isDryRun = false;
     /// The longest that the session waits for applications that run; nothing: as long as they do.
     std::optional<std::chrono::seconds> longestWait;
+    /// The module with the plug-in; empty: the one that is built in.
+    std::string plugIn{};
     SyncDisplayKind display = SyncDisplayKind::Text;
 };
 [[nodiscard]] int runSync(const SyncArguments& arguments, const Console& console);
@@ -50,6 +52,8 @@ struct SendArguments {
     bool isRestore = false;
     /// 1, 2 or 3, see AssetParts. Nothing: of a restore, what the device knows decides.
     std::optional<unsigned> parts;
+    /// The module with the plug-in; empty: the one that is built in.
+    std::string plugIn{};
     SyncDisplayKind display = SyncDisplayKind::Text;
 };
 [[nodiscard]] int runSend(const SendArguments& arguments, const Console& console);

@@ -226,7 +226,9 @@ TEST_F(CommandLine, WhatFollowsTheIdentifierToRemoveIsTheDeviceAndTheLibrary) {
 
 TEST_F(CommandLine, TellsItsVersionInOneLine) {
     EXPECT_EQ(run({"--version"}), 0);
-    EXPECT_THAT(out.str(), testing::MatchesRegex("appsync [0-9]+\\.[0-9]+\\.[0-9]+\n"));
+    EXPECT_THAT(out.str(),
+                testing::MatchesRegex(
+                    "appsync [0-9]+\\.[0-9]+\\.[0-9]+, module interface [0-9]+\\.[0-9]+\n"));
     EXPECT_EQ(err.str(), "");
 }
 

@@ -1,0 +1,5 @@
+#include "platform/PlugInTable.h"
+
+extern "C" const appsync::PlugInTable* appsyncTableOfAnotherLibrary();
+
+const appsync::PlugInTable* appsyncPlugInTable() noexcept { return appsyncTableOfAnotherLibrary(); }

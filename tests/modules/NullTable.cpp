@@ -1,0 +1,3 @@
+#include "platform/PlugInTable.h"
+
+const appsync::PlugInTable* appsyncPlugInTable() noexcept { return nullptr; }
