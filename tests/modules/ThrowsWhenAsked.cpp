@@ -1,3 +1,6 @@
 // Not by its header, which promises that it does not throw.
-extern "C" const void* appsyncPlugInTable();
-extern "C" const void* appsyncPlugInTable() { throw 7; }
+namespace appsync {
+struct PlugInTable;
+}
+extern "C" const appsync::PlugInTable* appsyncPlugInTable();
+const appsync::PlugInTable* appsyncPlugInTable() { throw 7; }
