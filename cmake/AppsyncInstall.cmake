@@ -3,7 +3,7 @@
 #     bin/appsync                     lib/appsync/appsync-plugin.so
 #     include/appsync/                the headers of platform/, client/ (in part), system/ and simulation/
 #     lib/libappsync_*.a              with lib/cmake/appsync/ and lib/pkgconfig/
-#     share/doc/appsync/
+#     share/doc/appsync/              share/man/man1/, and completions where bash, zsh and fish look for them
 #
 # Nothing of it names the prefix, so an installed tree may be moved.
 
@@ -51,6 +51,15 @@ install(FILES "${PROJECT_BINARY_DIR}/appsyncConfig.cmake" "${PROJECT_BINARY_DIR}
 install(TARGETS appsync_module LIBRARY DESTINATION "${CMAKE_INSTALL_LIBDIR}/appsync" COMPONENT command)
 if(APPSYNC_COMMAND)
     install(TARGETS appsync RUNTIME DESTINATION "${CMAKE_INSTALL_BINDIR}" COMPONENT command)
+    # Not there where only some of the targets were built.
+    set(shell "${PROJECT_BINARY_DIR}/shell")
+    install(DIRECTORY "${shell}/man1/" DESTINATION "${CMAKE_INSTALL_MANDIR}/man1" COMPONENT command OPTIONAL)
+    install(FILES "${shell}/appsync" DESTINATION "${CMAKE_INSTALL_DATADIR}/bash-completion/completions"
+            COMPONENT command OPTIONAL)
+    install(FILES "${shell}/_appsync" DESTINATION "${CMAKE_INSTALL_DATADIR}/zsh/site-functions"
+            COMPONENT command OPTIONAL)
+    install(FILES "${shell}/appsync.fish" DESTINATION "${CMAKE_INSTALL_DATADIR}/fish/vendor_completions.d"
+            COMPONENT command OPTIONAL)
 endif()
 install(DIRECTORY "${PROJECT_SOURCE_DIR}/docs/" DESTINATION "${CMAKE_INSTALL_DOCDIR}/docs" COMPONENT doc)
 install(FILES README.md CHANGELOG.md LICENSE DESTINATION "${CMAKE_INSTALL_DOCDIR}" COMPONENT doc)

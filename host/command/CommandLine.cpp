@@ -16,6 +16,7 @@
 
 #include <CLI/CLI.hpp>
 
+#include "host/command/CommandTable.h"
 #include "host/command/MeantWord.h"
 #include "host/command/argument/IdentifierArgument.h"
 #include "host/command/argument/OpenDevice.h"
@@ -23,6 +24,7 @@
 #include "host/command/data/DataCommands.h"
 #include "host/command/file/FileCommands.h"
 #include "host/command/look/LookCommands.h"
+#include "host/command/shell/ShellCommands.h"
 #include "host/command/sync/SyncCommands.h"
 #include "host/console/Console.h"
 #include "host/console/Problem.h"
@@ -141,11 +143,17 @@ class Commands {
         addPackage();
         addData();
         addPropertyList();
+        addShell();
         app_.add_subcommand("help", "Show the help of a command (= COMMAND --help)");
         refuseEmptyValues(app_);
     }
 
     int run(std::vector<std::string> arguments) {
+        // What the completion of a shell asks about a line that is not at its end.
+        if (!arguments.empty() && arguments.front() == "complete") {
+            arguments.erase(arguments.begin());
+            return runComplete(commandTable(app_), arguments, console_);
+        }
         if (!arguments.empty() && arguments.front() == "help") {
             arguments.erase(arguments.begin());
             if (const Status known = checkCommands(arguments); !known) {
@@ -692,6 +700,7 @@ class Commands {
         added.add_option("DEVICE", values->device, "the device's directory")->required();
         added.add_option("ACTION", values->action, "list, create or cancel")
             ->required()
+            ->type_name("list|create|cancel")
             ->check(oneOf(coordinatorActions()));
         added.add_option("ID", values->identifier, "the application's identifier");
         added
@@ -914,6 +923,34 @@ class Commands {
                 ""));
         added.add_option("--out", values->output, "the file to write; else standard output");
         added.add_flag("--json", values->asJson, "tell of the file that is written as JSON");
+    }
+
+    struct ShellValues {
+        std::string place;
+        bool asJson = false;
+    };
+
+    void addShell() {
+        const auto values = std::make_shared<ShellValues>();
+        command<ShellValues>(
+            app_, "completion", "Print the script that completes lines in a shell", values,
+            [this](const ShellValues& parsed) { return runCompletion(parsed.place, console_); })
+            .add_option("SHELL", values->place, "the shell: bash, zsh or fish")
+            ->required()
+            ->type_name("bash|zsh|fish")
+            ->check(oneOf({"bash", "zsh", "fish"}));
+        const auto pages = std::make_shared<ShellValues>();
+        CLI::App& manual = command<ShellValues>(
+            app_, "manual", "Write the pages of the manual, one for each command", pages,
+            [this](const ShellValues& parsed) {
+                return runManual(parsed.place,
+                                 manualPages(commandTable(app_), kFooter, APPSYNC_VERSION),
+                                 parsed.asJson, console_);
+            });
+        manual
+            .add_option("FOLDER", pages->place, "the folder for the pages; made where it is none")
+            ->required();
+        manual.add_flag("--json", pages->asJson, "print JSON");
     }
 
     Console console_;

@@ -43,7 +43,9 @@ def configure(prefix, folder, *options, expect=0):
 
 def test_everything_is_where_it_is_looked_for(prefix):
     for name in ("bin/appsync", "lib/appsync/appsync-plugin.so", "include/appsync/platform/PlugInTable.h",
-                 "lib/libappsync_plugin.a", "share/doc/appsync/docs/porting.md"):
+                 "lib/libappsync_plugin.a", "share/doc/appsync/docs/porting.md", "share/man/man1/appsync-sync.1",
+                 "share/bash-completion/completions/appsync", "share/zsh/site-functions/_appsync",
+                 "share/fish/vendor_completions.d/appsync.fish"):
         assert (prefix / name).is_file(), name
 
 

@@ -207,8 +207,8 @@ INSTANTIATE_TEST_SUITE_P(Help, EachCommand,
                                          "plist show", "plist convert"));
 
 INSTANTIATE_TEST_SUITE_P(HelpWithoutASession, EachCommand,
-                         testing::Values("package list", "package verify", "data", "data ls",
-                                         "data pull", "data push", "diff"));
+                         testing::Values("completion", "manual", "package list", "package verify",
+                                         "data", "data ls", "data pull", "data push", "diff"));
 
 TEST_F(CommandLine, HelpShowsTheHelpOfACommand) {
     EXPECT_EQ(run({"help", "package", "make"}), 0);

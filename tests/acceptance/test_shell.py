@@ -1,0 +1,142 @@
+"""Completion in the real shells, and the pages of the manual in the real reader."""
+
+import os
+import re
+import shutil
+import subprocess
+
+import pytest
+
+import packages
+from conftest import Device
+
+A, B = "com.example.atlas", "com.example.beacon"
+
+
+def needs(program):
+    if shutil.which(program) is None:
+        pytest.skip("%s is not installed" % program)
+
+
+@pytest.fixture
+def place(appsync, tmp_path):
+    """A directory with a device, two packages, and the command on the path."""
+    library = tmp_path / "library"
+    library.mkdir()
+    for identifier in (A, B):
+        packages.write_zip(library / (identifier + ".zip"), packages.entries(identifier))
+    device = Device(appsync, tmp_path / "my phone")
+    device.sync(library)
+    (tmp_path / "note.txt").write_text("")
+    (tmp_path / "bin").mkdir()
+    (tmp_path / "bin" / "appsync").symlink_to(appsync.program)
+    return tmp_path
+
+
+def run(place, *command):
+    environment = {**os.environ, "PATH": "%s:%s" % (place / "bin", os.environ["PATH"]), "HOME": str(place)}
+    done = subprocess.run(command, capture_output=True, text=True, cwd=place, env=environment,
+                          stdin=subprocess.DEVNULL, timeout=60)
+    assert done.stderr == ""
+    return done.stdout
+
+
+def in_bash(place, *words):
+    script = """
+        source <(appsync completion bash)
+        COMP_WORDS=(appsync "$@"); COMP_CWORD=$#
+        _appsync
+        printf '%s\\n' "${COMPREPLY[@]}"
+    """
+    return set(run(place, "bash", "--norc", "-c", script, "bash", *words).split("\n")) - {""}
+
+
+def in_fish(place, *words):
+    needs("fish")
+    line = " ".join(["appsync", *words])
+    printed = run(place, "fish", "--no-config", "-c",
+                  "appsync completion fish | source; complete --do-complete $argv[1]", line)
+    return {each.split("\t")[0] for each in printed.split("\n")} - {""}
+
+
+def in_zsh(place, *words):
+    """By a tab in a terminal, as zsh completes only there; what it is given to offer is printed."""
+    needs("zsh")
+    script = r"""
+        zmodload zsh/zpty
+        zpty shell zsh -f -i
+        zpty -w shell 'PS1=; stty -echo; autoload -U compinit; compinit -u -D; unsetopt list_beep'
+        zpty -w shell 'eval "$(appsync completion zsh)"'
+        zpty -w shell 'compadd() {
+            if [[ ${@[1,(i)(-|--)]} == *-(O|A|D)\ * ]]; then builtin compadd "$@"; return; fi
+            local -a hits; builtin compadd -A hits "$@"
+            local hit; for hit in $hits; do print -r -- "offer:$hit"; done
+        }'
+        zpty -w shell 'comppostfuncs=(tell-the-end); tell-the-end() { print the-end; }; print ready-"now"'
+        zpty -m -r shell heard '*ready-now*'
+        zpty -n -w shell "$1"$'\t'
+        zpty -m -r shell heard '*the-end*'
+        print -r -- "$heard"
+        zpty -d shell
+    """
+    line = " ".join(["appsync", *words])
+    return set(re.findall(r"offer:(\S+)", run(place, "zsh", "-f", "-c", script, "zsh", line)))
+
+
+SHELLS = pytest.mark.parametrize("complete", [in_bash, in_fish, in_zsh])
+
+
+@SHELLS
+def test_a_shell_completes_commands_and_their_commands(place, complete):
+    assert complete(place, "sta") == {"stage", "status"}
+    assert complete(place, "package", "l") == {"list"}
+
+
+@SHELLS
+def test_a_shell_completes_options_and_their_values(place, complete):
+    assert complete(place, "sync", "--js") == {"--json", "--json-lines"}
+    assert complete(place, "demote", "--by", "p") == {"person"}
+
+
+@SHELLS
+def test_a_shell_completes_what_is_on_the_device_that_is_named(place, complete):
+    assert complete(place, "why", "my\\ phone", "com.example.") == {A, B}
+    assert complete(place, "why", "my\\ phone", "com.example.b") == {B}
+
+
+@SHELLS
+def test_where_there_is_no_device_nothing_is_offered_and_nothing_said(place, complete):
+    assert complete(place, "why", "nowhere", "c") == set()
+
+
+@pytest.mark.parametrize("complete", [in_bash, in_fish])
+def test_a_shell_completes_directories_and_files(place, complete):
+    assert {each.rstrip("/") for each in complete(place, "apps", "li")} == {"library"}
+    assert complete(place, "apps", "no") == set()
+    assert complete(place, "plist", "show", "no") == {"note.txt"}
+
+
+@pytest.mark.parametrize("complete", [in_bash, in_fish])
+def test_directories_with_blanks_are_offered_whole(place, complete):
+    assert {each.rstrip("/").replace("\\", "") for each in complete(place, "apps", "my")} == {"my phone"}
+
+
+def test_every_page_of_the_manual_is_read_without_a_warning(appsync, tmp_path):
+    needs("man")
+    pages = appsync.json("manual", tmp_path / "man")["pages"]
+    assert "appsync.1" in pages and "appsync-package-make.1" in pages
+    for page in pages:
+        shown = subprocess.run(["man", "--warnings", "-l", "-Tutf8", tmp_path / "man" / page],
+                               capture_output=True, text=True, env={**os.environ, "MANWIDTH": "80"})
+        assert shown.returncode == 0 and shown.stderr == "", page
+        text = re.sub(".\b", "", shown.stdout)  # printed over itself, letters are bold
+        assert "SYNOPSIS" in text and "--help" in text
+
+
+def test_the_manual_tells_what_the_help_tells(appsync, tmp_path):
+    appsync("manual", tmp_path / "man")
+    for command in ("sync", "backup", "data push"):
+        page = (tmp_path / "man" / ("appsync-%s.1" % command.replace(" ", "-"))).read_text().replace("\\-", "-")
+        for word in appsync(*command.split(), "--help").stdout.split():
+            if word.startswith("--") and word.isascii():
+                assert word.split(",")[0] in page, word
