@@ -2,7 +2,7 @@
 
 // host/command/shell: what makes the command at home in a shell, all of it from the one table of
 // commands that `--help` is made of too: Completion.h finds what can follow the words of a line
-// (the scripts of CompletionScripts.h ask it), ManualPages.h writes pages for man. Knows no command
+// (and has the scripts that ask for it), ManualPages.h writes pages for man. Knows no command
 // by name, and of devices only where they are and what is on them. Called by host/command only.
 
 #include <string>
