@@ -51,7 +51,7 @@ struct MachineKind {
 };
 
 Result<FileStart> readStart(const std::string& path) {
-    constexpr std::uint64_t kLongestStart = 64 * 1024;
+    constexpr std::uint64_t kLongestStart = 65'536;
     Result<HostFile> file = HostFile::open(path);
     if (!file) return file.error();
     FileStart start;

@@ -90,16 +90,17 @@ class Finder {
         : line_(line), begun_(begun), identifiers_(identifiers) {}
 
     Completions find() {
+        const OptionEntry* const next = placedAt(*line_.command, line_.placed.size());
+        const bool isCommand = !line_.command->commands.empty();
+        const bool isFull = next == nullptr && !isCommand;
         if (line_.asking != nullptr) {
             addValues(line_.asking->value);
-        } else if (begun_.starts_with('-') && !line_.isOnlyPlaced) {
-            addOptions();
-        } else if (!line_.command->commands.empty()) {
+        } else if (isFull || (begun_.starts_with('-') && !line_.isOnlyPlaced)) {
+            if (!line_.isOnlyPlaced) addOptions();
+        } else if (isCommand) {
             if (line_.placed.empty()) addCommands();
-        } else if (const OptionEntry* const next = placedAt(*line_.command, line_.placed.size())) {
+        } else {
             addValues(wordsOfValue(next->value).empty() ? next->name : next->value);
-        } else if (!line_.isOnlyPlaced) {
-            addOptions();
         }
         return std::move(found_);
     }
