@@ -56,8 +56,8 @@ if(APPSYNC_COMMAND)
     install(DIRECTORY "${shell}/man1/" DESTINATION "${CMAKE_INSTALL_MANDIR}/man1" COMPONENT command OPTIONAL)
     install(FILES "${shell}/appsync" DESTINATION "${CMAKE_INSTALL_DATADIR}/bash-completion/completions"
             COMPONENT command OPTIONAL)
-    install(FILES "${shell}/_appsync" DESTINATION "${CMAKE_INSTALL_DATADIR}/zsh/site-functions"
-            COMPONENT command OPTIONAL)
+    install(FILES "${shell}/_appsync" COMPONENT command OPTIONAL
+            DESTINATION "${CMAKE_INSTALL_DATADIR}/zsh/$<IF:$<BOOL:${APPSYNC_PACKAGES}>,vendor-completions,site-functions>")
     install(FILES "${shell}/appsync.fish" DESTINATION "${CMAKE_INSTALL_DATADIR}/fish/vendor_completions.d"
             COMPONENT command OPTIONAL)
 endif()
