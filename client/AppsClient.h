@@ -42,7 +42,11 @@ class AppsClient final : public SyncClient,
     // client/AppsClient.cpp: the object and the entry to a session.
 
     /// `init`: a new client. Whether it installs directly or through coordinators is asked here,
-    /// for its whole life. The platform must outlive the client and what it has queued.
+    /// for its whole life. The references of the platform are copied; the services must outlive the
+    /// client and what it has queued. Queued work keeps the client alive, so that the client may
+    /// end on a thread of the queues': it is over when `assetTransferEndedWithSuccess` has returned
+    /// and no session is under way. Who lets a client go earlier ends the queues first, and keeps
+    /// registry, coordination and log until they have ended.
     [[nodiscard]] static std::shared_ptr<AppsClient> create(const Platform& platform);
 
     /// `dealloc`: warns of what is outstanding, and stops listening. Any thread, an install's too.

@@ -29,7 +29,8 @@ class HomeScreenConnection {
   public:
     virtual ~HomeScreenConnection() = default;
 
-    /// Sets the icon layout from the home screen's own bytes. The answer says whether it was taken.
+    /// Sets the icon layout from bytes that the host left in "DeskoraIconState.plist": the home
+    /// screen's own form, which the plug-in does not look into. False when they were not taken.
     virtual bool setIconState(ByteView state) = 0;
 
     /// The icon layout flattened: a property list whose root is an array of bundle identifiers in

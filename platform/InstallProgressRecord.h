@@ -37,8 +37,9 @@ enum InstallType : std::uint64_t {
 };
 
 /// A live handle on the progress of one application's install. Every call takes effect at once for
-/// everybody who looks. Callable on any thread; never fails: a record whose install is over keeps
-/// its last values and changes nothing any more.
+/// everybody who looks. Callable on any thread; never fails. When the install ends, the state
+/// becomes finished (5), failed (4) or canceled (3); from then on the record keeps its values and
+/// changes nothing any more.
 class InstallProgressRecord {
   public:
     virtual ~InstallProgressRecord() = default;

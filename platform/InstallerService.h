@@ -14,7 +14,9 @@ class InstallerService {
   public:
     virtual ~InstallerService() = default;
 
-    /// A map keyed by bundle identifier; nothing when the installer does not answer.
+    /// A map keyed by bundle identifier; nothing when the installer does not answer. What stands
+    /// under a key is the installer's own: the plug-in reads the keys. The list outlives the
+    /// process.
     [[nodiscard]] virtual std::optional<PropertyList> lookupUninstalled() = 0;
 
     /// Takes identifiers off the list; those that are not on it are passed over. False when it

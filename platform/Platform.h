@@ -18,8 +18,9 @@ class PropertyListSerialization;
 class SyncHost;
 class WorkQueues;
 
-/// Everything that the plug-in needs of a device. The services belong to whoever makes the client
-/// and must outlive it, the work that it has queued included.
+/// Everything that the plug-in needs of a device: references, which the client copies. The services
+/// belong to whoever makes the client and must outlive it, the work that it has queued included:
+/// see `AppsClient::create`.
 struct Platform {
     SyncHost& host;
     LogFacility& log;

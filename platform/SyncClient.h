@@ -58,7 +58,8 @@ class SyncClient {
     /// `syncEndedWithSuccess:`: the session is over.
     virtual void syncEndedWithSuccess(bool success) = 0;
 
-    /// `installedAssets`: a map; "_Deleted" holds what has gone since the last session.
+    /// `installedAssets`: a map whose only key is "_Deleted": an array of identifiers, strings, of
+    /// what has gone since the last session. The array may be empty.
     [[nodiscard]] virtual PropertyList installedAssets() = 0;
     /// `clearSyncData`: forget everything that is kept for syncing.
     virtual void clearSyncData() = 0;
@@ -83,9 +84,13 @@ class SyncClient {
     /// that was started has ended.
     virtual void assetTransferEndedWithSuccess(bool success) = 0;
 
+    // For the plug-in itself, at the end of each direct install, on the thread that installed. No
+    // host calls them: it learns of outcomes from the todo list.
+
     /// `assetInstallSucceeded:`: the asset's install has succeeded.
     virtual void assetInstallSucceeded(const SyncAssetPointer& asset) = 0;
-    /// `assetInstallFailed:withError:`: the asset's install has failed.
+    /// `assetInstallFailed:withError:`: the asset's install has failed. Uninstalls what the install
+    /// left: after a success that would be the application.
     virtual void assetInstallFailed(const SyncAssetPointer& asset, const ErrorRecord& error) = 0;
 };
 

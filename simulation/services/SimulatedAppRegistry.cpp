@@ -33,6 +33,10 @@ ErrorRecord packageRefused(const std::string& why) {
     return ErrorRecord::make(kInstallerErrorDomain, kPackageRefused, why);
 }
 
+bool isDemoted(std::uint64_t installType) {
+    return installType == kInstallTypeDowngrade || installType == kInstallTypeIntentionalDowngrade;
+}
+
 /// The identifier of install options, after they were checked.
 Result<std::string> checkedIdentifier(const PropertyList& options, std::string_view packageType) {
     const std::string* type = options.findString(PackageTypeKey);
@@ -277,7 +281,8 @@ Persistence SimulatedAppRegistry::beginPlaceholder(const std::string& identifier
     application.isUnsynced = proxy.installType == kInstallTypeSync && !application.placeholder;
     if (!application.isUnsynced) files_.sync();
     application.placeholder = std::move(proxy);
-    startProgress(identifier, application);
+    endProgress(application, kInstallStateCanceled);  // that of a placeholder before this one
+    if (!isDemoted(application.placeholder->installType)) startProgress(identifier, application);
     return application.isUnsynced ? Persistence::Committed : Persistence::OnDisk;
 }
 

@@ -1,5 +1,6 @@
 #include <gmock/gmock.h>
 #include <gtest/gtest.h>
+#include <algorithm>
 
 #include <memory>
 #include <mutex>
@@ -99,6 +100,26 @@ TEST_P(InstallProgressContract, ANewInstallHasANewRecord) {
     EXPECT_EQ(progress(kA)->completedUnitCount(), 0);
 }
 
+TEST_P(InstallProgressContract, ASecondPlaceholderBeginsItsInstallAnew) {
+    ASSERT_TRUE(installPlaceholder({kA}, kInstallTypeSync));
+    const auto first = progress(kA);
+    ASSERT_NE(first, nullptr);
+    first->setCompletedUnitCount(456);
+    ASSERT_TRUE(installPlaceholder({kA}, kInstallTypeSync));
+    const auto second = progress(kA);
+    ASSERT_NE(second, nullptr);
+    EXPECT_EQ(second->completedUnitCount(), 0);
+    first->setCompletedUnitCount(789);
+    EXPECT_EQ(second->completedUnitCount(), 0);
+}
+
+TEST_P(InstallProgressContract, NoInstallIsUnderWayForADemotedApplication) {
+    ASSERT_TRUE(installPlaceholder({kA}, kInstallTypeDowngrade));
+    ASSERT_TRUE(installPlaceholder({kB}, kInstallTypeIntentionalDowngrade));
+    EXPECT_EQ(progress(kA), nullptr);
+    EXPECT_EQ(progress(kB), nullptr);
+}
+
 TEST_P(InstallProgressContract, InstallingThePackageEndsTheInstall) {
     ASSERT_TRUE(installPlaceholder({kA}, kInstallTypeSync));
     const auto record = progress(kA);
@@ -141,6 +162,7 @@ class ReportKeeper : public AppRegistryObserver {
     static Identifiers identifiersOf(const std::vector<AppProxy>& proxies) {
         Identifiers identifiers;
         for (const AppProxy& proxy : proxies) identifiers.push_back(proxy.applicationIdentifier);
+        std::sort(identifiers.begin(), identifiers.end());  // they come in no particular order
         return identifiers;
     }
     bool says(const Identifiers& prioritized, const Identifiers& paused) {
@@ -224,6 +246,37 @@ TEST_P(RegistryObserverContract, ARemovedObserverHearsNoMore) {
     other->waitFor({kA}, {});
     EXPECT_EQ(removed->reports(), before);
     registry_.removeObserver(other.get());
+}
+
+/// Asks the registry, and leaves it, while it is being told something.
+class AskingObserver : public AppRegistryObserver {
+  public:
+    AskingObserver(AppRegistry& registry, Semaphore& done) : registry_(registry), done_(done) {}
+
+    void applicationInstallsArePrioritized(const std::vector<AppProxy>&,
+                                           const std::vector<AppProxy>&) override {
+        const auto proxy = registry_.proxyForIdentifier(kA, AppRegistry::Placeholders::Included);
+        if (proxy) record_ = registry_.installProgress(*proxy, kWholeInstall);
+        registry_.removeObserver(this);
+        done_.signal();
+    }
+    void applicationInstallsDidCancel(const std::vector<AppProxy>&) override {}
+
+    [[nodiscard]] bool foundARecord() const { return record_ != nullptr; }
+
+  private:
+    AppRegistry& registry_;
+    Semaphore& done_;
+    std::shared_ptr<InstallProgressRecord> record_;
+};
+
+TEST_P(RegistryObserverContract, AnObserverMayAskAndLeaveWhileItIsTold) {
+    ASSERT_TRUE(installPlaceholder({kA}, kInstallTypeSync));
+    const auto done = services_.queues.makeSemaphore(0);
+    const auto observer = std::make_shared<AskingObserver>(registry_, *done);
+    registry_.addObserver(observer);
+    ASSERT_TRUE(done->wait());
+    EXPECT_TRUE(observer->foundARecord());
 }
 
 /// Removes itself when it is destroyed.
