@@ -14,6 +14,7 @@
 #include "device/install/InstallContext.h"
 #include "device/install/KeptBundles.h"
 #include "device/install/ProgressBook.h"
+#include "device/install/UpdateUnderWay.h"
 #include "device/screen/IconDrawing.h"
 #include "device/values/DeviceError.h"
 #include "device/values/PackageText.h"
@@ -268,7 +269,7 @@ Status requireNotRunning(Database& database, const std::string& identifier) {
 Result<BundleRow> findDemotable(const InstallContext& context, const std::string& identifier) {
     std::optional<BundleRow> application;
     std::optional<BundleRow> covering;
-    bool isCoordinated = false;
+    std::optional<StoredCoordinator> coordinator;
     const Status status = context.database.read([&](Database& database) -> Status {
         auto placeholder = findBundle(database, BundleTable::Placeholders, identifier);
         if (!placeholder) return placeholder.error();
@@ -276,17 +277,15 @@ Result<BundleRow> findDemotable(const InstallContext& context, const std::string
         auto row = findBundle(database, BundleTable::Applications, identifier);
         if (!row) return row.error();
         application = std::move(*row);
-        const auto coordinator = findCoordinator(database, identifier);
-        if (!coordinator) return coordinator.error();
-        isCoordinated = coordinator->has_value();
+        auto found = findCoordinator(database, identifier);
+        if (!found) return found.error();
+        coordinator = std::move(*found);
         return requireNotRunning(database, identifier);
     });
     if (!status) return asRegistryStatus(status).error();
     if (!application) return notInstalled(identifier, covering);
-    if (!covering && !isCoordinated) return *std::move(application);
-    return registryError(
-        RegistryErrorCode::UpdateUnderWay,
-        "an update of " + identifier + " is under way; let a sync finish it, and offload it then");
+    if (!covering && !coordinator) return *std::move(application);
+    return updateIsUnderWay(identifier, coordinator, "offload it");
 }
 
 PlaceholderSource sourceOf(const InstallContext& context, const BundleRow& application,

@@ -15,6 +15,7 @@
 #include "device/install/InstallContext.h"
 #include "device/install/KeptBundles.h"
 #include "device/package/BundleSum.h"
+#include "device/install/UpdateUnderWay.h"
 #include "device/values/DeviceError.h"
 #include "device/values/DevicePaths.h"
 #include "device/values/WallClock.h"
@@ -73,9 +74,7 @@ Status refuseUnderPlaceholder(Database& database, const std::string& identifier,
     const auto coordinator = findCoordinator(database, identifier);
     if (!coordinator) return coordinator.error();
     if (!*covering && !*coordinator) return {};
-    return registryError(RegistryErrorCode::UpdateUnderWay,
-                         "an update of " + identifier +
-                             " is under way; let a sync finish it, and roll it back then");
+    return updateIsUnderWay(identifier, *coordinator, "roll it back");
 }
 
 Status findVersions(Database& database, const std::string& identifier, Versions& versions) {

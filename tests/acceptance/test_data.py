@@ -10,7 +10,7 @@ import zipfile
 import pytest
 
 import packages
-from conftest import DIRECTLY, ON_ONE_PATH, Device
+from conftest import COORDINATED, DIRECTLY, ON_ONE_PATH, Device
 from processes import with_default_signals
 from test_device import in_own_mounts
 from test_restore import DATA, data_of, write_data
@@ -311,6 +311,15 @@ def test_an_offloaded_application_gets_new_data(appsync, used, library, tmp_path
     appsync("data", "push", used.path, ID, folder, "--yes")
     appsync("send", used.path, ID, os.path.join(library, ID + ".zip"))
     assert ID in used.apps() and data_of(used, ID) == {"a": b"1"}
+
+
+@COORDINATED
+def test_an_update_that_waits_does_not_mind_new_data(appsync, used, tmp_path):
+    appsync("coordinator", used.path, "create", ID)
+    folder = with_files(tmp_path / "new", {"a": b"1"})
+    appsync("data", "push", used.path, ID, folder, "--yes")
+    appsync("coordinator", used.path, "cancel", ID)
+    assert data_of(used, ID) == {"a": b"1"} and used.apps()[ID]["version"] == "1.0"
 
 
 @ON_ONE_PATH

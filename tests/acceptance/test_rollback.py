@@ -2,12 +2,13 @@
 
 import json
 import os
+import re
 import shutil
 
 import pytest
 
 import packages
-from conftest import ON_ONE_PATH, Device
+from conftest import COORDINATED, ON_ONE_PATH, Device
 from test_device import in_own_mounts
 
 A, B = "com.example.orbit", "com.example.atlas"
@@ -295,3 +296,18 @@ def test_a_person_runs_quits_and_sets_on_a_full_disk_again_and_again(appsync, tm
         "test $(stat -c %s {disk}/d/space.reserve) -ge 200000", "{appsync} uninstall {disk}/d {b}"])
     assert statuses == [1, *[0] * 20, 0, 0], said
     assert list(apps) == [A]
+
+
+def command_of(advice):
+    found, = re.findall(r"\((appsync coordinator [^)]*)\)", advice)
+    return found.split()[1:]
+
+
+@COORDINATED
+@pytest.mark.parametrize("command", ["rollback", "demote"])
+def test_what_another_client_has_begun_is_cancelled_and_not_waited_for(appsync, updated, command):
+    appsync("coordinator", updated.path, "create", A, "--client", "7")
+    told = appsync(command, updated.path, A, expect=1).stderr
+    assert "sync" not in told.replace("appsync", "") and "client 7" in told
+    appsync(*[updated.path if word == "DEVICE" else word for word in command_of(told)])
+    appsync(command, updated.path, A)
