@@ -3,6 +3,8 @@
 #include <sys/ioctl.h>
 #include <unistd.h>
 
+#include <algorithm>
+#include <array>
 #include <cstdlib>
 #include <iostream>
 #include <string_view>
@@ -25,6 +27,22 @@ std::size_t terminalWidth() {
     return size.ws_col;
 }
 
+// Of the locale's names, the first that is given counts.
+std::string_view charactersOf() {
+    for (const char* name : {"LC_ALL", "LC_CTYPE", "LANG"}) {
+        const char* value = std::getenv(name);
+        if (value != nullptr && *value != '\0') return value;
+    }
+    return "";
+}
+
+bool hasUtf8() {
+    const std::string_view locale = charactersOf();
+    return std::ranges::any_of(
+        std::array<std::string_view, 4>{"UTF-8", "utf-8", "UTF8", "utf8"},
+        [&](std::string_view name) { return locale.find(name) != std::string_view::npos; });
+}
+
 }  // namespace
 
 void Console::complain(std::string_view text) const {
@@ -41,7 +59,7 @@ int Console::fail(const ErrorRecord& error) const {
 
 Console processConsole() {
     std::cerr.tie(nullptr);  // a complaint must not wait for an output that nobody reads
-    return {std::cout, std::cerr, canRedraw(), terminalWidth(), {}};
+    return {std::cout, std::cerr, canRedraw(), terminalWidth(), {}, hasUtf8() ? "\u2026" : "..."};
 }
 
 }  // namespace appsync

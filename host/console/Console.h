@@ -25,6 +25,8 @@ struct Console {
     std::size_t width = 80;
     /// What shows the help of the command that runs: "appsync apps --help". Empty: none does yet.
     std::string help{};
+    /// Ends what is cut off to fit.
+    std::string_view cutMark = "...";
 
     /// One line on the error stream: "appsync: " and the text, made safe to print.
     void complain(std::string_view text) const;

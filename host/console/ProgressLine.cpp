@@ -24,7 +24,7 @@ void ProgressLine::show(const std::function<std::string()>& text) {
     due_ = time + kBetweenLines;
     // Some terminals go on to the next line once the last column is filled.
     const std::size_t width = console_.width > 0 ? console_.width - 1 : 0;
-    console_.out << '\r' << fitted(printable(text()), width) << std::flush;
+    console_.out << '\r' << fitted(printable(text()), width, console_.cutMark) << std::flush;
     isDrawn_ = true;
 }
 

@@ -1,16 +1,26 @@
 #include "host/console/Table.h"
 
 #include <algorithm>
+#include <numeric>
 #include <string_view>
 #include <utility>
 
+#include "host/console/Console.h"
 #include "host/console/Text.h"
 
 namespace appsync {
 namespace {
 
 constexpr std::string_view kGap = "  ";
-constexpr std::size_t kFewest = 4;  // characters of a cell that still say something
+constexpr std::size_t kFewest = 8;  // characters of a cell that still say something
+
+// The characters in a line of so many columns, where each has the width that `widthOf` gives.
+template <typename Columns, typename Width>
+std::size_t lineWidth(const Columns& columns, Width widthOf) {
+    return std::accumulate(
+        columns.begin(), columns.end(), kGap.size() * (columns.size() - 1),
+        [&](std::size_t sum, const auto& column) { return sum + widthOf(column); });
+}
 
 }  // namespace
 
@@ -19,41 +29,60 @@ void Table::add(std::vector<std::string> cells) {
     rows_.push_back(std::move(cells));
 }
 
-std::vector<std::size_t> Table::columnWidths() const {
-    std::vector<std::size_t> widths(rows_.front().size());
-    for (const auto& row : rows_) {
-        for (std::size_t column = 0; column < widths.size(); ++column) {
-            widths[column] = std::max(widths[column], displayWidth(row[column]));
-        }
+std::vector<Table::Column> Table::columns() const {
+    std::vector<Column> columns;
+    columns.reserve(rows_.front().size());
+    for (std::size_t index = 0; index < rows_.front().size(); ++index) {
+        std::size_t width = 0;
+        for (const auto& row : rows_) width = std::max(width, displayWidth(row[index]));
+        columns.push_back({index, width});
     }
-    if (width_ == 0) return widths;
-    std::size_t taken = kGap.size() * (widths.size() - 1);
-    for (const std::size_t each : widths) taken += each;
-    for (; taken > width_; --taken) {
-        const auto widest = std::max_element(widths.begin(), widths.end());
-        if (*widest <= kFewest) break;
-        --*widest;
-    }
-    return widths;
+    return columns;
 }
 
-std::string Table::cell(const std::string& text, std::size_t column, std::size_t width) const {
-    const std::size_t length = displayWidth(text);
-    if (length <= width || !keptEnds_.contains(column)) return fitted(text, width);
-    return "~" + std::string(endOf(text, width - 1));
+std::vector<Table::Column> Table::columnsWithin(std::size_t width) const {
+    std::vector<Column> columns = this->columns();
+    const auto fewest = [](const Column& column) { return std::min(column.width, kFewest); };
+    const auto all = [](const Column& column) { return column.width; };
+    for (auto spared = spared_.begin(); columns.size() > 1 && lineWidth(columns, fewest) > width;) {
+        const std::size_t gone = spared != spared_.end() ? *spared++ : columns.back().index;
+        std::erase_if(columns, [&](const Column& column) { return column.index == gone; });
+    }
+    const std::size_t least = columns.size() > 1 ? kFewest : 1;
+    for (std::size_t taken = lineWidth(columns, all); taken > width; --taken) {
+        const auto widest = std::max_element(
+            columns.begin(), columns.end(),
+            [](const Column& left, const Column& right) { return left.width < right.width; });
+        if (widest->width <= least) break;
+        --widest->width;
+    }
+    return columns;
 }
 
-std::string Table::text() const {
-    const std::vector<std::size_t> widths = columnWidths();
+std::string Table::rowsIn(const std::vector<Column>& columns, std::string_view cutMark) const {
     std::string result;
     for (const auto& row : rows_) {
-        for (std::size_t column = 0; column + 1 < widths.size(); ++column) {
-            result.append(cell(row[column], column, widths[column])).append(kGap);
+        for (const auto& [index, width] : columns) {
+            const std::string& text = row[index];
+            const bool isLast = index == columns.back().index;
+            const bool isHeading = &row == &rows_.front();
+            if (isLast && displayWidth(text) <= width) {
+                result += text;
+            } else if (keptEnds_.contains(index) && !isHeading) {
+                result += fittedAtFront(text, width, cutMark);
+            } else {
+                result += fitted(text, width, cutMark);
+            }
+            result += isLast ? "\n" : kGap;
         }
-        const bool isCut = displayWidth(row.back()) > widths.back();
-        result += (isCut ? cell(row.back(), widths.size() - 1, widths.back()) : row.back()) + "\n";
     }
     return result;
+}
+
+std::string Table::text() const { return rowsIn(columns(), ""); }
+
+std::string Table::textFor(const Console& console) const {
+    return console.isTerminal ? rowsIn(columnsWithin(console.width), console.cutMark) : text();
 }
 
 }  // namespace appsync

@@ -165,16 +165,25 @@ std::size_t displayWidth(std::string_view text) {
         std::count_if(text.begin(), text.end(), [](char byte) { return !isContinuation(byte); }));
 }
 
-std::string fitted(std::string_view text, std::size_t width) {
+std::string fitted(std::string_view text, std::size_t width, std::string_view cutMark) {
     const std::size_t length = displayWidth(text);
-    std::string result(text);
-    if (length <= width) return result.append(width - length, ' ');
-    if (width == 0) return {};
+    if (length <= width) return std::string(text).append(width - length, ' ');
+    const std::string_view mark = beginOf(cutMark, width);
+    return std::string(beginOf(text, width - displayWidth(mark))).append(mark);
+}
+
+std::string fittedAtFront(std::string_view text, std::size_t width, std::string_view cutMark) {
+    if (displayWidth(text) <= width) return fitted(text, width, cutMark);
+    const std::string_view mark = beginOf(cutMark, width);
+    return std::string(mark).append(endOf(text, width - displayWidth(mark)));
+}
+
+std::string_view beginOf(std::string_view text, std::size_t width) {
     std::size_t end = 0;
     for (std::size_t characters = 0; end < text.size(); ++end) {
-        if (!isContinuation(text[end]) && ++characters == width) break;
+        if (!isContinuation(text[end]) && characters++ == width) break;
     }
-    return result.substr(0, end) + "~";
+    return text.substr(0, end);
 }
 
 std::string_view endOf(std::string_view text, std::size_t width) {
@@ -183,6 +192,21 @@ std::string_view endOf(std::string_view text, std::size_t width) {
         if (!isContinuation(text[--begin])) ++characters;
     }
     return text.substr(begin);
+}
+
+std::string wrapped(std::string line, std::size_t width, std::size_t indent) {
+    if (width == 0) return line;
+    if (indent >= width) indent = 0;
+    std::string text;
+    while (displayWidth(line) > width) {
+        const std::size_t end = beginOf(line, width).size();
+        const std::size_t blank = line.rfind(' ', end);
+        const bool isBetweenWords = blank != std::string::npos && blank > indent;
+        const std::size_t last = line.find_last_not_of(' ', isBetweenWords ? blank : end - 1);
+        text.append(line, 0, last + 1).append("\n");
+        line = std::string(indent, ' ') + line.substr(isBetweenWords ? blank + 1 : end);
+    }
+    return text + line;
 }
 
 std::string shellWord(std::string_view text) {

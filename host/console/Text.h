@@ -29,12 +29,24 @@ namespace appsync {
 /// broken UTF-8) replaced by "?".
 [[nodiscard]] std::string printable(std::string_view text);
 
-/// The first `width` characters of the text, the last of them "~" when something is cut off, filled
-/// up with blanks. Counts code points.
-[[nodiscard]] std::string fitted(std::string_view text, std::size_t width);
+/// The first characters of the text, `width` with the mark that ends them when something is cut
+/// off; else filled up with blanks. Counts code points.
+[[nodiscard]] std::string fitted(std::string_view text, std::size_t width,
+                                 std::string_view cutMark = "...");
+
+/// The same with the last characters of the text, behind the mark.
+[[nodiscard]] std::string fittedAtFront(std::string_view text, std::size_t width,
+                                        std::string_view cutMark = "...");
+
+/// The first `width` characters of the text, or all of it.
+[[nodiscard]] std::string_view beginOf(std::string_view text, std::size_t width);
 
 /// The last `width` characters of the text, or all of it.
 [[nodiscard]] std::string_view endOf(std::string_view text, std::size_t width);
+
+/// The line with line ends between its words, so that none has more than `width` characters; those
+/// that follow begin with `indent` blanks. A word that is longer is broken anywhere.
+[[nodiscard]] std::string wrapped(std::string line, std::size_t width, std::size_t indent);
 
 /// The number of code points.
 [[nodiscard]] std::size_t displayWidth(std::string_view text);

@@ -1,6 +1,8 @@
 #include "host/output/DeviceOverview.h"
 
 #include <algorithm>
+#include <sstream>
+#include <utility>
 
 #include <nlohmann/json.hpp>
 
@@ -105,6 +107,17 @@ std::string applicationsLine(const DeviceOverview& overview) {
            " restored, " + std::to_string(overview.arriving) + " arriving";
 }
 
+std::string wrappedLines(const std::string& text, std::size_t width) {
+    constexpr std::size_t kIndent = 15;  // below what the first line says
+    constexpr std::size_t kNarrow = 40;
+    std::string result;
+    std::istringstream lines(text);
+    for (std::string line; std::getline(lines, line);) {
+        result += wrapped(std::move(line), width, width < kNarrow ? 2 : kIndent) + "\n";
+    }
+    return result;
+}
+
 }  // namespace
 
 void count(DeviceOverview& overview, const ApplicationRecord& record) {
@@ -137,16 +150,17 @@ bool isOpenInstall(const CoordinatorRecord& coordinator) {
     return coordinator.client == SyncClientID && !coordinator.restores();
 }
 
-std::string overviewText(const DeviceOverview& overview) {
+std::string overviewText(const DeviceOverview& overview, std::size_t width) {
     const DeviceSettings& settings = overview.settings;
-    return std::string("installation:  ") + settingText(settings.installation) +
-           "\nremoval:       " + settingText(settings.removal) +
-           "\ncoordination:  " + settingText(settings.coordination) +
-           "\napplications:  " + applicationsLine(overview) +
-           "\nrunning:       " + runningLine(overview.running) +
-           "\nsession:       " + sessionLine(overview) +
-           "\nstaging area:  " + stagedLine(overview.staged) +
-           "\nfree space:    " + spaceLine(overview) + keptLine(overview) + "\n";
+    const std::string text = std::string("installation:  ") + settingText(settings.installation) +
+                             "\nremoval:       " + settingText(settings.removal) +
+                             "\ncoordination:  " + settingText(settings.coordination) +
+                             "\napplications:  " + applicationsLine(overview) +
+                             "\nrunning:       " + runningLine(overview.running) +
+                             "\nsession:       " + sessionLine(overview) +
+                             "\nstaging area:  " + stagedLine(overview.staged) +
+                             "\nfree space:    " + spaceLine(overview) + keptLine(overview) + "\n";
+    return wrappedLines(text, width);
 }
 
 std::string jsonText(const DeviceOverview& overview) {

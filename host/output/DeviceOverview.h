@@ -39,8 +39,8 @@ void count(DeviceOverview& overview, const ApplicationRecord& record);
 [[nodiscard]] bool isOpenInstall(const ApplicationRecord& record);
 [[nodiscard]] bool isOpenInstall(const CoordinatorRecord& coordinator);
 
-/// A line for each thing, for people.
-[[nodiscard]] std::string overviewText(const DeviceOverview& overview);
+/// A line for each thing, for people; where a width is given, several where it is longer.
+[[nodiscard]] std::string overviewText(const DeviceOverview& overview, std::size_t width = 0);
 /// One JSON object, over several lines, without a line end.
 [[nodiscard]] std::string jsonText(const DeviceOverview& overview);
 

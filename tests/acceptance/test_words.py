@@ -20,7 +20,7 @@ def one_line(text):
     return text.rstrip("\n")
 
 
-def on_a_terminal(appsync, *arguments, columns=80):
+def on_a_terminal(appsync, *arguments, columns=80, locale="C.UTF-8"):
     """What the command writes to a terminal, and its status."""
     leader, follower = pty.openpty()
     environment = dict(os.environ, TERM="xterm")
@@ -188,12 +188,44 @@ def test_lists_are_whole_in_a_pipe_and_fit_a_terminal(appsync, tmp_path):
     for command in ("apps", "history"):
         shown, status = on_a_terminal(appsync, command, device.path)
         assert status == 0 and max(map(len, shown.splitlines())) <= 80, shown
-        assert "~" in shown
+        assert "\u2026" in shown
     appsync("reset", device.path)
     for name in names:
         appsync("uninstall", device.path, name)
     shown, _ = on_a_terminal(appsync, "sync", device.path, library)
     assert "Installed 25: " in shown and names[0] in shown and " ...\n" in shown
+
+
+@COORDINATED
+@pytest.mark.parametrize("columns", [20, 40])
+@pytest.mark.parametrize("locale", ["C", "C.UTF-8"])
+def test_tables_fit_a_narrow_terminal(appsync, device, library, columns, locale):
+    packages.make_package(library, "com.example.an-application-with-a-long-name", name="A name that is long, too")
+    device.sync(library)
+    packages.make_package(library, A, "2.0")
+    device.sync(library)
+    appsync("run", device.path, A)
+    appsync("coordinator", device.path, "create", B)
+    os.makedirs(os.path.join(device.inside("/var/mobile/Containers/Data"), A, "a-folder-with-a-long-name"))
+    cut = 0
+    for command in (["apps", device.path], ["history", device.path], ["status", device.path],
+                    ["coordinator", device.path, "list"], ["package", "list", library], ["data", "ls", device.path, A]):
+        shown, status = on_a_terminal(appsync, *command, columns=columns, locale=locale)
+        assert status == 0 and max(map(len, shown.splitlines())) <= columns, shown
+        assert locale == "C.UTF-8" or shown.isascii()
+        cut += shown.count("..." if locale == "C" else "\u2026")
+    assert cut > 0
+    # A name is told by its end.
+    shown, _ = on_a_terminal(appsync, "apps", device.path, columns=columns, locale=locale)
+    assert "IDE" in shown and "00  " in shown and "name  " in shown
+
+
+@COORDINATED
+def test_a_narrow_terminal_gets_all_of_the_status(appsync, device):
+    whole = appsync("status", device.path).stdout
+    for columns in (20, 40, 80):
+        shown, _ = on_a_terminal(appsync, "status", device.path, columns=columns)
+        assert shown.split() == whole.split()
 
 
 @pytest.mark.parametrize("command", ["", "sync", "coordinator", "backup", "plist convert", "send", "stage"])

@@ -49,13 +49,13 @@ std::string coordinatorsTable(const std::vector<CoordinatorRecord>& coordinators
     if (coordinators.empty()) return "No coordinators.\n";
     Table table({"IDENTIFIER", "KIND", "CLIENT", "PLACEHOLDER", "PROMISES", "STATE"});
     table.keepEndsOf(0);
+    table.spare({3, 1, 4, 2});
     for (const CoordinatorRecord& each : coordinators) {
         table.add({each.identifier, each.kind, std::to_string(each.client),
                    each.placeholderStands ? "shown" : (each.hasPlaceholder ? "not shown" : "-"),
                    promisesText(each), coordinatorState(each)});
     }
-    if (console.isTerminal) table.fitInto(console.width);
-    return table.text();
+    return table.textFor(console);
 }
 
 int listCoordinators(Device& device, bool asJson, const Console& console) {

@@ -46,18 +46,19 @@ bool waitsForInstall(Device& device, const std::string& identifier) {
     return device.files().itemExists(Device::restoreDataPath(identifier));
 }
 
-std::string linesOf(const DataContents& data, bool isWaiting, bool isForTerminal) {
+std::string linesOf(const DataContents& data, bool isWaiting, const Console& console) {
     if (data.entries.empty()) {
         return isWaiting ? "No data: what a restore has left waits for the install.\n"
                          : "No data.\n";
     }
     Table table({"SIZE", "MODIFIED", "NAME"});
+    table.keepEndsOf(2);
+    table.spare({1, 0});
     for (const DataEntry& each : data.entries) {
         table.add({each.isDirectory ? "-" : formatBytes(each.size), formatLocalTime(each.modified),
                    each.name + (each.isDirectory ? "/" : "")});
     }
-    const std::string text = table.text() + amountOf(data) + "\n";
-    return isForTerminal ? text : table.text();
+    return table.textFor(console) + (console.isTerminal ? amountOf(data) + "\n" : "");
 }
 
 Json entriesJson(const DataContents& data) {
@@ -287,7 +288,7 @@ int runDataList(const DataArguments& arguments, const Console& console) {
         object["waiting"] = isWaiting;
         object["entries"] = entriesJson(*data);
         console.out << (arguments.asJson ? indented(object) + "\n"
-                                         : linesOf(*data, isWaiting, console.isTerminal));
+                                         : linesOf(*data, isWaiting, console));
         for (const LeftOutItem& each : data->leftOut) console.complain(each.why);
         return {};
     });

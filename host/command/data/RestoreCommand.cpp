@@ -51,12 +51,12 @@ void print(const RestoreArguments& arguments, const RestoreResult& result, doubl
     if (!result.screen.empty()) {
         Table table({"IDENTIFIER", "VERSION", "NAME", "STATE"});
         table.keepEndsOf(0);
+        table.spare({2, 1});
         for (const ShownApplication& each : result.screen) {
             table.add({each.identifier, each.version.value_or("-"), each.name,
                        each.isPlaceholder ? "placeholder" : "installed"});
         }
-        if (console.isTerminal) table.fitInto(console.width);
-        console.out << table.text();
+        console.out << table.textFor(console);
     }
     if (!bringsApplications(arguments.type)) {
         console.out << "a restore of type " << arguments.type << " brings no applications back\n";

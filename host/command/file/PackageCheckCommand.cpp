@@ -64,12 +64,12 @@ std::string packagesTable(const std::vector<LibraryPackage>& packages, const Con
     if (packages.empty()) return "No packages.\n";
     Table table({"FILE", "IDENTIFIER", "VERSION", "NAME", "SIZE"});
     for (const std::size_t column : {0U, 1U}) table.keepEndsOf(column);
+    table.spare({3, 4, 0});
     for (const LibraryPackage& each : packages) {
         table.add({each.file, each.identifier, each.version.empty() ? "-" : each.version, each.name,
                    formatBytes(each.bytes)});
     }
-    if (console.isTerminal) table.fitInto(console.width);
-    return table.text();
+    return table.textFor(console);
 }
 
 // One run of `package verify`.

@@ -33,6 +33,7 @@ std::string applicationsTable(const std::vector<ApplicationRecord>& records,
     if (anyKept) titles.emplace_back("KEPT");
     Table table(std::move(titles));
     table.keepEndsOf(0);
+    table.spare({4, 6, 5, 2, 1});
     for (const ApplicationRecord& record : records) {
         std::vector<std::string> cells{record.identifier,
                                        record.version.value_or("-"),
@@ -43,8 +44,7 @@ std::string applicationsTable(const std::vector<ApplicationRecord>& records,
         if (anyKept) cells.push_back(record.kept ? record.kept->version.value_or("-") : "");
         table.add(std::move(cells));
     }
-    if (console.isTerminal) table.fitInto(console.width);
-    return records.empty() ? "No applications.\n" : table.text();
+    return records.empty() ? "No applications.\n" : table.textFor(console);
 }
 
 }  // namespace

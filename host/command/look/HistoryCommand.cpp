@@ -22,12 +22,12 @@ std::string whatText(const HistoryRecord& record) {
 std::string historyTable(const std::vector<HistoryRecord>& records, const Console& console) {
     Table table({"TIME", "WHAT", "RESULT", "IDENTIFIER", "DESCRIPTION"});
     table.keepEndsOf(3);
+    table.spare({4, 0, 1});
     for (const HistoryRecord& record : records) {
         table.add({formatLocalTime(record.time), whatText(record), record.success ? "ok" : "failed",
                    record.identifier, record.description});
     }
-    if (console.isTerminal) table.fitInto(console.width);
-    return records.empty() ? "No history.\n" : table.text();
+    return records.empty() ? "No history.\n" : table.textFor(console);
 }
 
 // Of a failed install the log has every step that went well, and not always one that did not.
@@ -35,12 +35,12 @@ std::string failureTable(const std::vector<FailedInstall>& failed, const Console
     if (failed.empty()) return {};
     Table table({"TIME", "LAST INSTALL FAILED", "ERROR"});
     table.keepEndsOf(1);
+    table.spare({0});
     for (const FailedInstall& each : failed) {
         table.add({formatLocalTime(each.failure.when), each.identifier,
                    failureText(each.identifier, each.failure.error)});
     }
-    if (console.isTerminal) table.fitInto(console.width);
-    return "\n" + table.text();
+    return "\n" + table.textFor(console);
 }
 
 }  // namespace

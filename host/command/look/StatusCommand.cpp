@@ -71,7 +71,8 @@ int runStatus(const std::string& device, bool asJson, const Console& console) {
     return lookAt(device, console, [&](Device& opened) -> Status {
         const Result<DeviceOverview> overview = overviewOf(opened);
         if (!overview) return overview.error();
-        console.out << (asJson ? jsonText(*overview) + "\n" : overviewText(*overview));
+        const std::size_t width = console.isTerminal ? console.width : 0;
+        console.out << (asJson ? jsonText(*overview) + "\n" : overviewText(*overview, width));
         return {};
     });
 }

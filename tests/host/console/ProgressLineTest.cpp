@@ -42,7 +42,7 @@ TEST_F(ProgressLineTest, IsRedrawnNowAndThenAndGoes) {
 
 TEST_F(ProgressLineTest, StaysInItsLineWhateverTheText) {
     showAt(500ms, "longer than that\n");
-    EXPECT_EQ(out.str(), "\rlonger t~");
+    EXPECT_EQ(out.str(), "\rlonger...");
 }
 
 TEST_F(ProgressLineTest, SaysNothingWhereNoTerminalIs) {

@@ -4,7 +4,9 @@
 
 #include <cstdlib>
 #include <ctime>
+#include <sstream>
 
+#include "host/console/Console.h"
 #include "host/console/Table.h"
 
 namespace appsync {
@@ -39,8 +41,8 @@ TEST(Printable, ReplacesControlCharactersAndBrokenSequences) {
 
 TEST(Fitted, FillsUpOrCutsByCharacters) {
     EXPECT_EQ(fitted("ab", 4), "ab  ");
-    EXPECT_EQ(fitted("abcdef", 4), "abc~");
-    EXPECT_EQ(fitted("\u00fc\u00fc\u00fc", 2), "\u00fc~");
+    EXPECT_EQ(fitted("abcdef", 4, "~"), "abc~");
+    EXPECT_EQ(fitted("\u00fc\u00fc\u00fc", 2, "~"), "\u00fc~");
     EXPECT_EQ(fitted("abc", 0), "");
 }
 
@@ -64,23 +66,68 @@ TEST(Printable, ReplacesWhatIsNoCharacter) {
     EXPECT_EQ(printable("\xf4\x90\x80\x80"), "?");  // behind the last one
 }
 
-TEST(Table, CutsTheWidestColumnsWhereItMustFit) {
-    Table table({"A", "B", "C"});
+class FittedTable : public testing::Test {
+  protected:
+    std::string shownIn(std::size_t width, std::string_view cutMark = "~") {
+        const Console console{out, out, true, width, {}, cutMark};
+        return table.textFor(console);
+    }
+
+    std::ostringstream out;
+    Table table{{"ID", "B", "C"}};
+};
+
+TEST_F(FittedTable, CutsTheWidestColumns) {
     table.add({std::string(300, 'x'), "y", std::string(20, 'z')});
-    table.fitInto(17);
-    EXPECT_EQ(table.text(), "A       B  C\nxxxxx~  y  zzzzz~\n");
-    table.fitInto(1);
-    EXPECT_EQ(table.text(), "A     B  C\nxxx~  y  zzz~\n") << "no cell is cut to nothing";
+    EXPECT_EQ(shownIn(21), "ID        B  C\nxxxxxxx~  y  zzzzzzz~\n");
+    EXPECT_EQ(shownIn(25, "..."), "ID          B  C\nxxxxxxx...  y  zzzzzzz...\n");
 }
 
-TEST(Table, KeepsTheEndsOfAColumnWhereThatIsSaid) {
-    Table table({"ID", "B", "C"});
+TEST_F(FittedTable, KeepsTheEndsOfAColumnWhereThatIsSaid) {
+    table = Table({"IDENTIFIER", "B", "C"});
     table.keepEndsOf(0);
     table.keepEndsOf(2);
-    table.add({"com.example.app00", "y", "abcdefgh"});
+    table.add({"com.example.app00", "y", "abcdefghij"});
     table.add({"a", "y", "z"});
-    table.fitInto(17);
-    EXPECT_EQ(table.text(), "ID      B  C\n~app00  y  ~defgh\na       y  z\n");
+    EXPECT_EQ(shownIn(21), "IDENTIF~  B  C\n~e.app00  y  ~defghij\na         y  z\n");
+}
+
+TEST_F(FittedTable, LeavesOutColumnsBeforeNothingOfThemCanBeRead) {
+    table.add({"com.example.app00", "1.0.123456", "abcdefgh"});
+    EXPECT_EQ(shownIn(28), "ID        B         C\ncom.exa~  1.0.123~  abcdefgh\n");
+    EXPECT_EQ(shownIn(27), "ID               B\ncom.example.ap~  1.0.123456\n");
+    table.spare({1});
+    EXPECT_EQ(shownIn(20), "ID          C\ncom.examp~  abcdefgh\n");
+}
+
+TEST_F(FittedTable, NoTerminalIsTooNarrow) {
+    table.add({"com.example.app00", "1.0.1234", "\u00fcbergr\u00f6\u00dfe"});
+    for (std::size_t width = 1; width < 50; ++width) {
+        for (const std::string_view mark : {"...", "\u2026"}) {
+            std::istringstream lines(shownIn(width, mark));
+            for (std::string line; std::getline(lines, line);) {
+                EXPECT_LE(displayWidth(line), width) << line;
+            }
+        }
+    }
+}
+
+TEST_F(FittedTable, IsWholeWhereNoTerminalIs) {
+    table.add({std::string(300, 'x'), "y", "z"});
+    const Console pipe{out, out, false, 20};
+    EXPECT_EQ(table.textFor(pipe), table.text());
+    EXPECT_NE(table.text().find(std::string(300, 'x')), std::string::npos);
+}
+
+TEST(Wrapped, BreaksBetweenWordsAndIndentsWhatFollows) {
+    EXPECT_EQ(wrapped("label:  one two three", 14, 8), "label:  one\n        two\n        three");
+    EXPECT_EQ(wrapped("one two", 7, 2), "one two");
+    EXPECT_EQ(wrapped("one two", 0, 2), "one two");
+}
+
+TEST(Wrapped, BreaksAWordThatIsTooLong) {
+    EXPECT_EQ(wrapped("name:  abcdefghijklmno", 9, 2), "name:\n  abcdefg\n  hijklmn\n  o");
+    EXPECT_EQ(wrapped("\u00e4\u00f6\u00fc", 2, 5), "\u00e4\u00f6\n\u00fc");
 }
 
 TEST(Text, TheEndOfATextIsCountedInCharacters) {
