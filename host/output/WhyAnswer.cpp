@@ -31,9 +31,8 @@ AwaitedThing awaitedOfNextSync(const std::string& reason) {
 
 std::string storeCommand() { return "appsync store DEVICE FOLDER"; }
 
-std::string sendCommand(const std::string& identifier, const std::string& options = "",
-                        const std::string& file = "FILE") {
-    return "appsync send DEVICE " + identifier + " " + file + options;
+std::string sendCommand(const std::string& identifier, const std::string& options = "") {
+    return "appsync send DEVICE " + identifier + " FILE" + options;
 }
 
 std::optional<std::string> missingPromise(const CoordinatorRecord& coordinator) {
@@ -111,14 +110,8 @@ AwaitedThing awaitedOfRestored(const ApplicationRecord& placeholder, bool isCoor
 }
 
 AwaitedThing awaitedOfData(const std::string& identifier, bool packageWaits) {
-    const std::string package = sendCommand(identifier, " --restore --parts 1");
-    return awaited(
-        "restore data", "host",
-        (packageWaits ? "for its data, as its package is there: send it ("
-                      : "for its data: send its package (" + package + "), then its data (") +
-            sendCommand(identifier, " --restore --parts 2", "DATA") +
-            "), or the package alone, to use what the restore has left (" +
-            sendCommand(identifier, " --restore --parts 3") + ")");
+    const char* what = packageWaits ? "for its data, as its package is there: " : "for its data: ";
+    return awaited("restore data", "host", what + howRestoredDataComes(identifier, packageWaits));
 }
 
 std::optional<AwaitedThing> awaitedOfPlaceholder(const ApplicationRecord& placeholder,

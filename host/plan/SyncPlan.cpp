@@ -57,7 +57,8 @@ std::string commandToSend(const ApplicationRecord& placeholder) {
     return "appsync send DEVICE " + placeholder.identifier + " FILE";
 }
 
-std::string whyNot(const Present& present, bool isCoordinated) {
+template <typename Options>
+std::string whyNot(const Present& present, const Options& options) {
     if (present.isSystem()) {
         const bool comesBack = present.placeholder != nullptr && isOffloaded(*present.placeholder);
         return comesBack ? "it belongs to the system, and is offloaded: " +
@@ -69,11 +70,15 @@ std::string whyNot(const Present& present, bool isCoordinated) {
                " brings it back";
     }
     if (present.placeholder->installType == kInstallTypeRestore) {
-        return isCoordinated
-                   ? "a restore brought it back, and its package is the store's to bring: "
-                     "see appsync store"
-                   : "a restore brought it back: " + commandToSend(*present.placeholder) +
-                         " --restore brings its package";
+        if (options.bringsOffloaded) {
+            return "a restore brought it back, and its package is the store's to bring: see "
+                   "appsync store";
+        }
+        const std::string& identifier = present.placeholder->identifier;
+        return "a restore brought it back: " +
+               (options.howRestoredComes
+                    ? options.howRestoredComes(identifier)
+                    : commandToSend(*present.placeholder) + " --restore brings its package");
     }
     return "another install of it is under way on the device";
 }
@@ -146,7 +151,7 @@ class Planner {
         if (isAskedFor) {
             plan_.install.push_back(plannedInstall(package, {}));
         } else if (present.isSystem() || present.placeholder != nullptr) {
-            skip(package.identifier, whyNot(present, options_.bringsOffloaded), true);
+            skip(package.identifier, whyNot(present, options_), true);
         } else if (present.application->version.value_or("") != package.version) {
             plan_.update.push_back(
                 plannedInstall(package, present.application->version.value_or("")));
@@ -223,8 +228,7 @@ class StagedPlanner {
         const auto found = present_.find(identifier);
         const bool isThere = found != present_.end() && !removals_.contains(identifier);
         if (isThere && isNotAskedFor(found->second)) {
-            plan_.skipped.push_back(
-                {identifier, whyNot(found->second, options_.bringsOffloaded), true});
+            plan_.skipped.push_back({identifier, whyNot(found->second, options_), true});
             return;
         }
         const bool isInstalled = found != present_.end() && found->second.application != nullptr;

@@ -40,6 +40,8 @@ struct PlanOptions {
     /// coordinated.
     bool bringsOffloaded = false;
 };
+    /// How a person brings what a restore has left a placeholder of, where the sync does not.
+    std::function<std::string(const std::string& identifier)> howRestoredComes = nullptr;
 
 /// An application to bring to the device, or to bring up to date there.
 struct PlannedInstall {
@@ -148,3 +150,5 @@ struct StagedPlanOptions {
                                       const StagedPlanOptions& options);
 
 }  // namespace appsync
+    /// As in `PlanOptions`.
+    std::function<std::string(const std::string& identifier)> howRestoredComes = nullptr;

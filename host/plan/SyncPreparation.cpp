@@ -10,6 +10,7 @@
 #include "device/Device.h"
 #include "host/console/Problem.h"
 #include "host/plan/LibraryReader.h"
+#include "host/plan/RestoredParts.h"
 
 namespace appsync {
 namespace {
@@ -21,6 +22,9 @@ class Preparing {
     Result<SyncPreparation> ofLibrary(PlanOptions options) {
         if (Status looked = look(); !looked) return looked.error();
         options.bringsOffloaded = settings_.coordination;
+        options.howRestoredComes = [this](const std::string& identifier) {
+            return appsync::howRestoredComes(device_, identifier);
+        };
         sync_.plan = makePlan(library_, present_, options);
         sync_.givenUp = stagedWorkOn(device_);
         return finish();
@@ -31,6 +35,9 @@ class Preparing {
         sync_.staged = readStagedTodoList(device_);
         StagedPlanOptions options;
         options.bringsOffloaded = settings_.coordination;
+        options.howRestoredComes = [this](const std::string& identifier) {
+            return appsync::howRestoredComes(device_, identifier);
+        };
         options.packageOf = [this](const std::string& identifier) {
             return packageFor(library_, identifier, device_.propertyLists());
         };

@@ -9,8 +9,6 @@
 #include "device/values/PackageIdentifier.h"
 #include "host/console/Problem.h"
 #include "host/file/HostFile.h"
-#include "platform/FileSystem.h"
-#include "platform/PropertyListSerialization.h"
 
 namespace appsync {
 namespace {
@@ -61,19 +59,6 @@ Result<Session::Parcel> dataParcel(const ParcelContents& contents, const std::st
     parcel.directory = Device::dataPath(contents.identifier);
     parcel.name = std::filesystem::path(contents.file).filename().string();
     return parcel;
-}
-
-std::optional<std::string> versionThatWaitsForData(Device& device, const std::string& identifier) {
-    const Result<Bytes> bytes = device.files().readFile(std::string(kRestoreStatePath));
-    if (!bytes) return std::nullopt;
-    const Result<PropertyList> state = device.propertyLists().parse(*bytes);
-    if (!state) return std::nullopt;
-    const PropertyList* versions = state->find(identifier);
-    if (versions == nullptr || versions->entries().empty()) return std::nullopt;
-    const PropertyList::Entry& last = versions->entries().back();
-    const std::string* path = last.value.findString("path");
-    if (path == nullptr || !device.files().itemExists(*path)) return std::nullopt;
-    return last.key;
 }
 
 }  // namespace appsync

@@ -1,6 +1,5 @@
 #pragma once
 
-#include <optional>
 #include <string>
 
 #include "host/session/Session.h"
@@ -29,10 +28,5 @@ struct ParcelContents {
 /// device would not unpack is refused.
 [[nodiscard]] Result<Session::Parcel> dataParcel(const ParcelContents& contents,
                                                  const std::string& version);
-
-/// The version under which the package of a restore waits for its data; nothing when none does, or
-/// when a crash has taken the package, or what says that it was installed.
-[[nodiscard]] std::optional<std::string> versionThatWaitsForData(Device& device,
-                                                                 const std::string& identifier);
 
 }  // namespace appsync

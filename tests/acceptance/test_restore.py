@@ -6,6 +6,7 @@ import os
 import pathlib
 import plistlib
 import random
+import re
 import shutil
 import sqlite3
 import tempfile
@@ -332,6 +333,38 @@ def test_parked_package_survives_a_kill_and_its_data_installs_it(appsync, backup
     assert appsync.json("why", fresh.path, IDS[1])["waitsFor"]["what"] == "restore data"
     appsync("send", fresh.path, IDS[1], os.path.join(backup, "data", IDS[1] + ".zip"), "--restore", "--parts", "2")
     assert IDS[1] in fresh.apps()
+    assert data_of(fresh, IDS[1])["Documents/letter.txt"] == b"Dear"
+
+
+def next_commands(text, place):
+    """What a text says to do, with everything put in."""
+    found = re.findall(r"\((appsync send [^)]*)\)", text)
+    return [[place.get(word, word) for word in command.split()[1:]] for command in found]
+
+
+@DIRECTLY
+def test_a_sync_names_the_whole_way_to_a_restored_application_with_data(appsync, backup, fresh, store):
+    restore(fresh, backup)
+    place = {"DEVICE": fresh.path, "FILE": os.path.join(store, IDS[1] + ".zip"),
+             "DATA": os.path.join(backup, "data", IDS[1] + ".zip")}
+
+    def why_skipped():
+        return {each["identifier"]: each["why"] for each in fresh.sync(store, expect=1)["skipped"]}[IDS[1]]
+
+    package, data, both = next_commands(why_skipped(), place)
+    told = appsync(*package).stdout
+    assert "its package waits for its data" in told
+    assert next_commands(told, place) == next_commands(why_skipped(), place) == [data, both]
+    appsync(*data)
+    assert data_of(fresh, IDS[1])["Documents/letter.txt"] == b"Dear"
+
+
+@DIRECTLY
+def test_a_package_that_waits_can_use_the_data_that_the_restore_has_left(appsync, backup, fresh, store):
+    restore(fresh, backup)
+    place = {"DEVICE": fresh.path, "FILE": os.path.join(store, IDS[1] + ".zip")}
+    told = appsync("send", fresh.path, IDS[1], place["FILE"], "--restore").stdout
+    appsync(*next_commands(told, place)[-1])
     assert data_of(fresh, IDS[1])["Documents/letter.txt"] == b"Dear"
 
 

@@ -8,7 +8,6 @@
 #include "host/console/Problem.h"
 #include "host/output/JsonRecords.h"
 #include "host/output/WhyAnswer.h"
-#include "host/session/Parcels.h"
 
 namespace appsync {
 

@@ -284,8 +284,10 @@ class Sending {
         }
         SyncSummary summary = summarize(plan_, facts_, *aftermath);
         if (!plansInstall_ && summary.failed.empty()) {
-            summary.skipped.push_back(
-                {arguments_.identifier, "its package waits for its data", false});
+            summary.skipped.push_back({arguments_.identifier,
+                                       "its package waits for its data: " +
+                                           howRestoredDataComes(arguments_.identifier, true),
+                                       false});
         }
         return finish(std::move(summary));
     }
