@@ -45,7 +45,7 @@ std::string lossLine(const SyncPlan& plan) {
 }
 
 bool isInStep(const SyncPlan& plan) {
-    return plan.failed.empty() &&
+    return plan.bringsInStep && plan.failed.empty() &&
            std::none_of(plan.skipped.begin(), plan.skipped.end(),
                         [](const PlannedSkip& skip) { return skip.isUnmet; });
 }

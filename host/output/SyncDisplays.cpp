@@ -286,7 +286,9 @@ std::string summaryText(const SyncSummary& summary, bool isForTerminal) {
     std::vector<std::string> failed;
     for (const SyncFailure& each : summary.failed) failed.push_back(each.identifier);
     text += listed("Failed", failed, isForTerminal);
-    if (text.empty() && summary.requested.empty()) return "Nothing to do: all is in step.\n";
+    if (text.empty() && summary.requested.empty()) {
+        return summary.bringsInStep ? "Nothing to do: all is in step.\n" : "Nothing to do.\n";
+    }
     return text + amountLine(summary);
 }
 

@@ -19,6 +19,7 @@
 #include "host/plan/InterruptedStaging.h"
 #include "host/plan/Library.h"
 #include "host/plan/SyncPlan.h"
+#include "platform/AppRegistry.h"
 #include "platform/FileSystem.h"
 #include "platform/PropertyListSerialization.h"
 #include "system/RootDirectory.h"
@@ -280,6 +281,17 @@ StagedTodoList readStagedTodoList(Device& device) {
         staged.list = *std::move(list);
     }
     return staged;
+}
+
+std::optional<std::string> stagedVersion(Device& device, const StagedTodoList& staged,
+                                         const std::string& identifier) {
+    const std::string area(staged.isTakenUp ? kTodoDirectory : kStagingArea);
+    const Result<Bytes> bytes = device.files().readFile(area + "/" + identifier + "/Info.plist");
+    if (!bytes) return std::nullopt;
+    const Result<PropertyList> info = device.propertyLists().parse(*bytes);
+    const std::string* version = info ? info->findString(BundleVersionKey) : nullptr;
+    if (version == nullptr || version->empty()) return std::nullopt;
+    return *version;
 }
 
 Status removeStaleTransfers(Device& device, const std::set<std::string>& arrived) {

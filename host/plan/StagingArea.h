@@ -39,8 +39,15 @@ struct StagedTodoList {
     bool isTooLarge = false;
     /// No area waits, and this is what an interrupted session has left to do.
     bool isTakenUp = false;
+
+    /// Neither: nobody has staged anything.
+    [[nodiscard]] bool isAbsent() const { return list.isNull() && !error && !isTakenUp; }
 };
 [[nodiscard]] StagedTodoList readStagedTodoList(Device& device);
+
+/// The version that the area of that list has the name and icon of; nothing where it tells none.
+[[nodiscard]] std::optional<std::string> stagedVersion(Device& device, const StagedTodoList& staged,
+                                                       const std::string& identifier);
 
 /// Removes what an interrupted session left among the received files: packages, but not those that
 /// wait for their application's data nor those of the applications that have `arrived`, which are

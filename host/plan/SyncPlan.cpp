@@ -189,6 +189,12 @@ class Planner {
     SyncPlan plan_;
 };
 
+// An entry of a todo list.
+struct AskedInstall {
+    std::string identifier;
+    std::string version;  // empty where it tells none
+};
+
 // Plans what a todo list asks for; the list may be hostile.
 class StagedPlanner {
   public:
@@ -198,8 +204,10 @@ class StagedPlanner {
     // The device removes before it asks for anything, in whatever order the entries stand.
     SyncPlan make(const PropertyList& todoList) {
         std::size_t number = 0;
+        plan_.bringsInStep = false;
         for (const PropertyList& entry : todoList.elements()) add(entry, ++number);
-        for (const std::string& identifier : asked_) install(identifier);
+        for (const AskedInstall& each : asked_) install(each);
+        warnOfOtherVersions();
         return std::move(plan_);
     }
 
@@ -218,13 +226,16 @@ class StagedPlanner {
                         "it is not a legal identifier: " + std::string(kIdentifierRule));
         }
         if (isInstall) {
-            if (installs_.insert(*identifier).second) asked_.push_back(*identifier);
+            if (!installs_.insert(*identifier).second) return;
+            const std::string* version = entry.findString(kTodoVersionKey);
+            asked_.push_back({*identifier, version != nullptr ? *version : ""});
         } else {
             remove(*identifier);
         }
     }
 
-    void install(const std::string& identifier) {
+    void install(const AskedInstall& asked) {
+        const std::string& identifier = asked.identifier;
         const auto found = present_.find(identifier);
         const bool isThere = found != present_.end() && !removals_.contains(identifier);
         if (isThere && isNotAskedFor(found->second)) {
@@ -234,8 +245,44 @@ class StagedPlanner {
         const bool isInstalled = found != present_.end() && found->second.application != nullptr;
         const std::string oldVersion =
             isInstalled ? found->second.application->version.value_or("") : "";
-        (isThere && isInstalled ? plan_.update : plan_.install)
-            .push_back(planned(identifier, oldVersion));
+        const bool isUpdate = isThere && isInstalled;
+        PlannedInstall install = planned(identifier, oldVersion);
+        holdAgainstStaged(install, asked.version, isUpdate);
+        (isUpdate ? plan_.update : plan_.install).push_back(std::move(install));
+    }
+
+    // The library may have changed since, or be another one. What the device has already is not
+    // sent in place of what it is to have; anything else comes, and is told of.
+    void holdAgainstStaged(PlannedInstall& install, const std::string& listed, bool isUpdate) {
+        if (!install.doubt.empty() || !options_.stagedVersionOf) return;
+        const std::optional<std::string> staged = options_.stagedVersionOf(install.identifier);
+        const std::string& offered = install.newVersion;
+        if (!staged || offered.empty() || *staged == offered || listed == offered) return;
+        const std::string asked = listed.empty() ? *staged : listed;
+        const std::string what =
+            "the staging area asks for version " + asked + ", the library has " + offered;
+        if (isUpdate && install.oldVersion == offered) {
+            install.refusal = what + ", which is on the device already: put version " + asked +
+                              " into the library, or stage again (appsync stage DEVICE LIBRARY)";
+            install.doubt = install.refusal;
+        } else {
+            otherVersions_.push_back(install.identifier + " " + offered + " instead of " + asked);
+        }
+    }
+
+    void warnOfOtherVersions() {
+        if (otherVersions_.empty()) return;
+        constexpr std::size_t kNamed = 5;
+        const std::size_t named = std::min(otherVersions_.size(), kNamed);
+        std::string text =
+            "the library has other versions than the staging area asks for, which come: ";
+        for (std::size_t index = 0; index < named; ++index) {
+            text += (index == 0 ? "" : ", ") + otherVersions_[index];
+        }
+        if (otherVersions_.size() > named) {
+            text += " and " + std::to_string(otherVersions_.size() - named) + " more";
+        }
+        plan_.warnings.push_back(std::move(text));
     }
 
     // The device leaves alone what has a placeholder that is not of a sync.
@@ -273,8 +320,9 @@ class StagedPlanner {
 
     const StagedPlanOptions& options_;
     const PresentByIdentifier present_;
-    std::vector<std::string> asked_;  // to install, in the order of the list
-    std::set<std::string> installs_;  // the same
+    std::vector<AskedInstall> asked_;  // to install, in the order of the list
+    std::set<std::string> installs_;   // the same
+    std::vector<std::string> otherVersions_;
     std::set<std::string> removals_;
     SyncPlan plan_;
 };

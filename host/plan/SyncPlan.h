@@ -14,6 +14,7 @@
 
 #include <cstdint>
 #include <functional>
+#include <optional>
 #include <set>
 #include <string>
 #include <string_view>
@@ -39,9 +40,9 @@ struct PlanOptions {
     /// Bring offloaded applications back: the plug-in asks for those where installs are
     /// coordinated.
     bool bringsOffloaded = false;
-};
     /// How a person brings what a restore has left a placeholder of, where the sync does not.
     std::function<std::string(const std::string& identifier)> howRestoredComes = nullptr;
+};
 
 /// An application to bring to the device, or to bring up to date there.
 struct PlannedInstall {
@@ -56,6 +57,8 @@ struct PlannedInstall {
     bool isLeftOver = false;          // the plan does not ask for it: it comes all the same
     std::string doubt = {};           // why no good package of it can be sent, if there is none
     std::string file = {};            // its package on this machine, where there is one
+    /// Why the host sends nothing, although the device asks for it; empty where it does send.
+    std::string refusal = {};
 
     /// The device has a higher version than the one to come.
     [[nodiscard]] bool isDowngrade() const;
@@ -94,6 +97,10 @@ struct SyncPlan {
     std::vector<SyncFailure> failed;
     /// For people: packages of the library that others have hidden.
     std::vector<std::string> notes;
+    /// For people: what they may not have meant.
+    std::vector<std::string> warnings;
+    /// It brings the device in step with a library; a staging area only asks for this and that.
+    bool bringsInStep = true;
     /// Bytes on the device that the removals give back.
     std::uint64_t reclaimed = 0;
 
@@ -138,8 +145,13 @@ struct SpaceCheck {
 struct StagedPlanOptions {
     /// The package that would be sent for an identifier, or why there is none that a device takes.
     std::function<Result<LibraryPackage>(const std::string& identifier)> packageOf;
+    /// The version that the staging area has the name and icon of; nothing where it tells none.
+    std::function<std::optional<std::string>(const std::string& identifier)> stagedVersionOf =
+        nullptr;
     /// The device asks for offloaded applications: where installs are coordinated.
     bool bringsOffloaded = false;
+    /// As in `PlanOptions`.
+    std::function<std::string(const std::string& identifier)> howRestoredComes = nullptr;
 };
 
 /// The plan that a todo list asks for, whatever stands in it. Entries with another operation than
@@ -150,5 +162,3 @@ struct StagedPlanOptions {
                                       const StagedPlanOptions& options);
 
 }  // namespace appsync
-    /// As in `PlanOptions`.
-    std::function<std::string(const std::string& identifier)> howRestoredComes = nullptr;

@@ -41,8 +41,15 @@ class Preparing {
         options.packageOf = [this](const std::string& identifier) {
             return packageFor(library_, identifier, device_.propertyLists());
         };
+        options.stagedVersionOf = [this](const std::string& identifier) {
+            return stagedVersion(device_, sync_.staged, identifier);
+        };
         sync_.plan = makeStagedPlan(sync_.staged.list, present_, options);
         sync_.plan.notes = library_.notes;
+        if (sync_.staged.isAbsent()) {
+            sync_.plan.notes.emplace_back(
+                "no staging area waits on the device: appsync stage DEVICE LIBRARY leaves one");
+        }
         if (sync_.staged.isTakenUp) {
             sync_.plan.notes.emplace_back("this takes up the session that was interrupted");
         }
@@ -110,10 +117,22 @@ class Preparing {
         return rules;
     }
 
+    [[nodiscard]] std::string missingPermission() const {
+        const bool installs = !sync_.plan.install.empty() || !sync_.plan.update.empty();
+        std::string text;
+        if (installs && settings_.installation == PolicyAnswer::No) text = "installation=yes";
+        if (!sync_.plan.remove.empty() && settings_.removal == PolicyAnswer::No) {
+            text += text.empty() ? "removal=yes" : " removal=yes";
+        }
+        return text;
+    }
+
     Status checkSpace() {
         const Result<std::uint64_t> free = device_.freeSpace();
         if (!free) return unusable(free.error());
         sync_.allowed = allowedBy(settings_, sync_.plan);
+        sync_.forbidden = sync_.allowed.skipped.size() - sync_.plan.skipped.size();
+        sync_.permission = missingPermission();
         sync_.space = {sync_.allowed.needed(), *free, sync_.allowed.reclaimed};
         return {};
     }

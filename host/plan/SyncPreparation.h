@@ -1,5 +1,8 @@
 #pragma once
 
+#include <cstddef>
+#include <string>
+
 #include "host/plan/InterruptedStaging.h"
 #include "host/plan/StagingArea.h"
 #include "host/plan/StandingInstalls.h"
@@ -15,8 +18,10 @@ struct Library;
 /// What is known of a sync before anything of it is done.
 struct SyncPreparation {
     SyncPlan plan;
-    SyncPlan allowed;  // what of it policy lets happen
-    SpaceCheck space;  // for that
+    SyncPlan allowed;           // what of it policy lets happen
+    std::size_t forbidden = 0;  // how many applications of it policy does not
+    std::string permission;     // what `appsync set` has to be told for these
+    SpaceCheck space;           // for what is allowed
     StandingInstalls standing;
     /// The list stands here until the session begins.
     StagedTodoList staged;                  // only of a staged sync

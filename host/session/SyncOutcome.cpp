@@ -48,6 +48,7 @@ class Summarizer {
         summary_.bytes = facts_.bytesSent();
         summary_.failed = plan_.failed;
         summary_.skipped = plan_.skipped;
+        summary_.bringsInStep = plan_.bringsInStep;
         for (const std::string& identifier : plan_.remove) judgeRemoval(identifier);
         for (const PlannedInstall& each : plan_.install) judge(each, summary_.installed);
         for (const PlannedInstall& each : plan_.update) judge(each, summary_.updated);
@@ -252,6 +253,7 @@ SyncSummary summarizeRefused(const SyncPlan& allowed, const std::string& reason)
     for (const std::string& identifier : allowed.remove) {
         summary.failed.push_back({identifier, reason});
     }
+    summary.incomplete = !summary.failed.empty() || hasUnmet(summary.skipped);
     return summary;
 }
 

@@ -49,6 +49,8 @@ struct SyncSummary {
     std::vector<PlannedSkip> skipped;
     std::uint64_t bytes = 0;
     double seconds = 0;
+    /// Where nothing was to do: that is because all is in step with the library.
+    bool bringsInStep = true;
     /// Something that was asked for did not happen.
     bool incomplete = false;
 };

@@ -144,3 +144,95 @@ def test_the_names_of_the_area_are_those_that_are_documented(appsync, device, li
         assert name in text, name
     for key in {key for entry in listed(device) for key in entry}:
         assert "`%s`" % key in text
+
+
+# What the area asks for, and what the library has when it is sent.
+
+
+def sync_text(appsync, device, library, *options, expect=0):
+    return appsync("sync", device.path, library, "--staged", *options, expect=expect)
+
+
+def test_another_version_than_was_staged_is_told(appsync, device, library):
+    device.sync(library)
+    packages.make_package(library, A, "2.0")
+    packages.make_package(library, B, "2.0")
+    appsync("stage", device.path, library)
+    packages.make_package(library, A, "3.0")
+    note = "the library has other versions than the staging area asks for, which come: %s 3.0 instead of 2.0" % A
+    assert note in appsync.json("plan", device.path, library, "--staged")["notes"]
+    assert sync_text(appsync, device, library).stderr == "appsync: %s\n" % note
+    assert (device.versions()[A], device.versions()[B]) == ("3.0", "2.0")
+
+
+def test_a_staged_downgrade_whose_package_is_gone_has_failed(appsync, device, library, tmp_path):
+    packages.make_package(library, A, "2.0")
+    device.sync(library)
+    older = str(tmp_path / "older")
+    packages.make_package(older, A, "1.0")
+    appsync("stage", device.path, older)
+    planned = appsync.json("plan", device.path, library, "--staged", expect=1)
+    result = device.sync(library, "--staged", expect=1)
+    failed, = result["failed"]
+    assert failed in planned["failed"] and planned["update"] == []
+    assert failed["identifier"] == A and failed["error"].startswith(
+        "the staging area asks for version 1.0, the library has 2.0, which is on the device already: ")
+    assert result["updated"] == [] and result["bytes"] == 0 and device.versions()[A] == "2.0"
+    appsync("stage", device.path, older)
+    assert device.sync(older, "--staged")["updated"] == [A] and device.versions()[A] == "1.0"
+
+
+def test_an_area_that_tells_no_version_takes_what_the_library_has(appsync, device, library):
+    packages.make_package(library, A, "2.0")
+    device.sync(library)
+    area = stage(device, [install(A, "1.0"), install(B, "1.0")], side_files=[B])
+    with open(os.path.join(area, B, "Info.plist"), "wb") as file:
+        plistlib.dump({"BundleIdentifier": B}, file)
+    assert sync_text(appsync, device, library).stderr == ""
+    assert device.versions()[A] == "2.0"
+
+
+def test_a_list_that_names_the_version_of_the_library_is_its_own_word(appsync, device, library):
+    packages.make_package(library, A, "2.0")
+    stage(device, [install(A, "2.0")], side_files=[A])  # its Info.plist is that of 1.0
+    assert sync_text(appsync, device, library).stderr == ""
+    assert device.versions()[A] == "2.0"
+
+
+def test_a_staged_sync_without_an_area_says_that_there_is_none(appsync, device, library):
+    for command in ("plan", "sync"):
+        told = appsync(command, device.path, library, "--staged").stdout
+        assert "no staging area waits on the device" in told and "Nothing to do." in told and "in step" not in told
+    assert "no staging area waits" in sync_text(appsync, device, library, "--json").stderr
+    stage(device, [])
+    assert sync_text(appsync, device, library).stdout == "Nothing to do.\n"
+
+
+# Policy.
+
+
+def test_what_policy_forbids_stays_staged_and_is_told(appsync, device, library):
+    appsync("set", device.path, "installation=no")
+    told = appsync("stage", device.path, library).stderr
+    assert told == ("appsync: as device policy is now, sync --staged skips 5 applications of these: allow that first "
+                    "(appsync set DEVICE installation=yes)\n")
+    before = listed(device)
+    for _ in range(2):
+        done = sync_text(appsync, device, library, expect=1)
+        assert done.stdout.count("Skipped ") == 5
+        assert "so it stays there: allow that (appsync set DEVICE installation=yes)" in done.stderr
+        assert listed(device) == before
+    appsync("set", device.path, "installation=yes")
+    assert len(device.sync(library, "--staged")["installed"]) == 5
+
+
+def test_a_session_that_uses_up_what_policy_forbids_says_so(appsync, device, library):
+    device.sync(library)
+    packages.make_package(library, A, "2.0")
+    appsync("stage", device.path, library, "--remove", B)
+    appsync("set", device.path, "installation=no")
+    done = sync_text(appsync, device, library, expect=1)
+    assert "device policy leaves 1 application of the staging area alone" in done.stderr
+    assert "appsync set DEVICE installation=yes)" in done.stderr and "stage it again" in done.stderr
+    assert B not in device.apps() and device.versions()[A] == "1.0"
+    assert not os.path.exists(device.inside(AREA))

@@ -23,7 +23,7 @@ def one_line(text):
 def on_a_terminal(appsync, *arguments, columns=80, locale="C.UTF-8"):
     """What the command writes to a terminal, and its status."""
     leader, follower = pty.openpty()
-    environment = dict(os.environ, TERM="xterm")
+    environment = dict(os.environ, TERM="xterm", LC_ALL=locale)
     subprocess.run(["stty", "cols", str(columns), "rows", "40"], stdin=follower, check=True)
     process = subprocess.Popen([appsync.program, *map(str, arguments)], stdin=subprocess.DEVNULL, stdout=follower,
                                stderr=follower, env=environment, preexec_fn=with_default_signals)
@@ -298,6 +298,13 @@ def test_a_coordinator_tells_its_state_in_json_too(appsync, device):
 
 
 # Libraries.
+
+
+@pytest.mark.parametrize("option", ["--json", "--json-lines"])
+def test_programs_too_are_told_of_a_library_without_packages(appsync, device, tmp_path, option):
+    (tmp_path / "none").mkdir()
+    told = one_line(appsync("sync", device.path, tmp_path / "none", option).stderr)
+    assert "none holds no package" in told and "none holds no package" in appsync("sync", device.path, tmp_path / "none").stdout
 
 
 def test_a_package_counts_whatever_the_case_of_its_end(appsync, device, tmp_path):

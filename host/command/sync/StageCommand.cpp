@@ -24,12 +24,19 @@ Status checkPlace(StagedWork work) {
         "do that first (appsync sync DEVICE LIBRARY --staged), or replace it with --force");
 }
 
+std::string forbiddenWarning(const SyncPreparation& sync) {
+    return "as device policy is now, sync --staged skips " +
+           counted(sync.forbidden, "application") + " of these: allow that first (appsync set " +
+           "DEVICE " + sync.permission + ")";
+}
+
 void tell(const StageArguments& arguments, const SyncPreparation& sync, const std::string& area,
           const Console& console) {
     const SyncPlan& plan = sync.plan;
     for (const SyncFailure& each : plan.failed) {
         console.complain(each.identifier + ": " + each.error);
     }
+    if (sync.forbidden > 0) console.complain(forbiddenWarning(sync));
     const bool hasReplaced = sync.givenUp != StagedWork::None;
     if (arguments.asJson) {
         console.out << stagedJsonText(plan, area, hasReplaced) << '\n';

@@ -3,9 +3,11 @@
 #include <algorithm>
 #include <atomic>
 #include <chrono>
+#include <map>
 #include <memory>
 #include <optional>
 #include <ostream>
+#include <string>
 #include <string_view>
 #include <utility>
 #include <vector>
@@ -22,6 +24,7 @@
 #include "host/output/PlanText.h"
 #include "host/plan/LibraryReader.h"
 #include "host/plan/SyncPreparation.h"
+#include "host/plan/TransferError.h"
 #include "host/session/Interruption.h"
 #include "host/session/PlugIn.h"
 #include "host/session/Session.h"
@@ -48,6 +51,31 @@ std::string givenUpNote(StagedWork work) {
                                  ? "the staging area that waits on the device"
                                  : "what an interrupted sync --staged has left to do";
     return what + " is given up for this sync: stage it again afterwards";
+}
+
+std::map<std::string, std::string> refusalsOf(const SyncPlan& plan) {
+    std::map<std::string, std::string> refusals;
+    for (const PlannedInstall& each : plan.update) {
+        if (!each.refusal.empty()) refusals[each.identifier] = each.refusal;
+    }
+    return refusals;
+}
+
+ErrorRecord refusalOfTransfer(const std::string& why) {
+    return ErrorRecord::make(kTransferErrorDomain, kTransferNoPackage, why);
+}
+
+std::string usedUpWarning(const SyncPreparation& sync) {
+    return "device policy leaves " + counted(sync.forbidden, "application") +
+           " of the staging area alone, and this session takes the area away: allow that (appsync "
+           "set DEVICE " +
+           sync.permission + "), and stage it again";
+}
+
+std::string staysWarning(const SyncPreparation& sync) {
+    return "nothing of what the staging area asks for is allowed by device policy, so it stays "
+           "there: allow that (appsync set DEVICE " +
+           sync.permission + "), and run the same command again";
 }
 
 // One run of `sync` or `plan`.
@@ -87,6 +115,11 @@ class SyncRun {
         if (sync_.staged.isTooLarge) return refuse(sync_.plan.failed.back().error);
         if (!sync_.space.fits()) return refuse(sync_.space.description());
         if (sync_.givenUp != StagedWork::None) events_.complainSoon(givenUpNote(sync_.givenUp));
+        for (const std::string& each : sync_.plan.warnings) events_.complainSoon(each);
+        if (arguments_.isStaged && sync_.forbidden > 0) {
+            if (sync_.allowed.empty()) return leaveStaged();
+            events_.complainSoon(usedUpWarning(sync_));
+        }
         ready = makeReady();
         if (!ready) return ready.error();
         if (!signals_->stopRequested()) return hold();
@@ -135,6 +168,7 @@ class SyncRun {
         if (sync_.givenUp != StagedWork::None) {
             sync_.allowed.notes.push_back(givenUpNote(sync_.givenUp));
         }
+        for (const std::string& each : sync_.plan.warnings) sync_.allowed.notes.push_back(each);
         if (arguments_.display == SyncDisplayKind::Text) {
             console_.out << planText(sync_.allowed, sync_.space) << std::flush;
         } else {
@@ -152,6 +186,14 @@ class SyncRun {
     int refuse(const std::string& reason) {
         preparation_.fail(reason);
         return finish(summarizeRefused(sync_.allowed, reason));
+    }
+
+    // What policy may allow later is not used up by a session that does nothing.
+    int leaveStaged() {
+        const std::string why = "device policy allows nothing of it";
+        preparation_.fail(why);
+        events_.complainSoon(staysWarning(sync_));
+        return finish(summarizeRefused(sync_.allowed, why));
     }
 
     Status makeReady() {
@@ -172,12 +214,18 @@ class SyncRun {
             }
         }
         Session session(*device_, **plugIn, events_, facts_, signals_->stopRequested());
-        const SessionEnd end = session.sync(
-            {[this](const std::string& identifier) { return packageFileFor(library_, identifier); },
-             [this](const std::string& identifier) {
-                 return !sync_.standing.arrived.contains(identifier);
-             },
-             true, [this] { preparation_.finish(); }});
+        const std::map<std::string, std::string> refusals = refusalsOf(sync_.plan);
+        const SessionEnd end =
+            session.sync({[&](const std::string& identifier) -> Result<std::string> {
+                              const auto refused = refusals.find(identifier);
+                              if (refused == refusals.end())
+                                  return packageFileFor(library_, identifier);
+                              return refusalOfTransfer(refused->second);
+                          },
+                          [this](const std::string& identifier) {
+                              return !sync_.standing.arrived.contains(identifier);
+                          },
+                          true, [this] { preparation_.finish(); }});
         if (end.error) {
             preparation_.fail(end.error->description());
         } else {
@@ -245,9 +293,11 @@ class SyncRun {
 
     int finish(SyncSummary summary) {
         summary = timed(std::move(summary));
-        if (arguments_.display == SyncDisplayKind::Text) {
-            for (const std::string& note : sync_.plan.notes) {
+        for (const std::string& note : sync_.plan.notes) {
+            if (arguments_.display == SyncDisplayKind::Text) {
                 console_.out << printable(note) << '\n';
+            } else {
+                events_.complainSoon(note);
             }
         }
         endedWith_ = summary.incomplete ? kExitSomethingFailed : kExitDone;

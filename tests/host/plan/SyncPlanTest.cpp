@@ -256,6 +256,45 @@ TEST(StagedPlan, WhatIsRemovedFirstIsInstalledAndNotUpdated) {
     EXPECT_THAT(plan.update, IsEmpty());
 }
 
+class StagedVersions : public testing::Test {
+  protected:
+    // An area with the version 1 of com.a; the library has 3.
+    SyncPlan planWith(const char* listed, const char* onDevice) {
+        PropertyList asked = entry("com.a", "install");
+        if (listed != nullptr) asked.set("version", listed);
+        StagedPlanOptions options = packagesOf({"com.a"});
+        options.stagedVersionOf = [](const std::string&) {
+            return std::optional<std::string>("1");
+        };
+        return makeStagedPlan(PropertyList::array({asked}), {installed("com.a", onDevice)},
+                              options);
+    }
+};
+
+TEST_F(StagedVersions, AnotherPackageThanWasAskedForComesAndIsToldOf) {
+    for (const char* listed : {static_cast<const char*>(nullptr), "1"}) {
+        const SyncPlan plan = planWith(listed, "2");
+        ASSERT_THAT(identifiersOf(plan.update), ElementsAre("com.a"));
+        EXPECT_EQ(plan.update[0].refusal, "");
+        EXPECT_THAT(plan.warnings, ElementsAre(HasSubstr("com.a 3 instead of 1")));
+    }
+}
+
+TEST_F(StagedVersions, WhatTheDeviceHasAlreadyIsNoAnswerToWhatWasAskedFor) {
+    const SyncPlan plan = planWith("1", "3");
+    ASSERT_THAT(identifiersOf(plan.update), ElementsAre("com.a"));
+    EXPECT_THAT(plan.update[0].refusal, HasSubstr("which is on the device already"));
+    EXPECT_THAT(plan.warnings, IsEmpty());
+    EXPECT_THAT(allowedBy({}, plan).update, IsEmpty());
+    EXPECT_EQ(allowedBy({}, plan).failed[0].error, plan.update[0].refusal);
+}
+
+TEST_F(StagedVersions, TheListHasTheLastWord) {
+    const SyncPlan plan = planWith("3", "3");
+    EXPECT_EQ(plan.update[0].refusal, "");
+    EXPECT_THAT(plan.warnings, IsEmpty());
+}
+
 TEST(StagedPlan, AListThatIsNoneAsksForNothing) {
     EXPECT_TRUE(makeStagedPlan(PropertyList::map(), {}, packagesOf({})).empty());
     EXPECT_TRUE(makeStagedPlan(PropertyList(), {}, packagesOf({})).empty());
