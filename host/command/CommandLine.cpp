@@ -385,7 +385,8 @@ class Commands {
         return added;
     }
 
-    static void addDisplay(CLI::App& added, SyncDisplayKind& display) {
+    static void addDisplay(CLI::App& added, SyncDisplayKind& display, bool& isVerbose) {
+        added.add_flag("--verbose", isVerbose, "on a terminal, too, print long lists whole");
         CLI::Option* json = added.add_flag_callback(
             "--json", [&display] { display = SyncDisplayKind::Json; }, "print one JSON object");
         added
@@ -469,7 +470,7 @@ class Commands {
         addStaged(added, *values);
         added.add_flag("--dry-run", values->isDryRun, "only say what would be done (= plan)");
         addPlugIn(added, values->plugIn);
-        addDisplay(added, values->display);
+        addDisplay(added, values->display, values->isVerbose);
     }
 
     void addPlan() {
@@ -511,7 +512,7 @@ class Commands {
             ->type_name("N")
             ->check(wholeNumberFrom(1, 3));
         addPlugIn(added, values->plugIn);
-        addDisplay(added, values->display);
+        addDisplay(added, values->display, values->isVerbose);
     }
 
     struct DeviceValues {

@@ -27,6 +27,12 @@ std::size_t terminalWidth() {
     return size.ws_col;
 }
 
+std::size_t terminalHeight() {
+    winsize size{};
+    if (::ioctl(STDOUT_FILENO, TIOCGWINSZ, &size) != 0 || size.ws_row == 0) return 24;
+    return size.ws_row;
+}
+
 // Of the locale's names, the first that is given counts.
 std::string_view charactersOf() {
     for (const char* name : {"LC_ALL", "LC_CTYPE", "LANG"}) {
@@ -59,7 +65,9 @@ int Console::fail(const ErrorRecord& error) const {
 
 Console processConsole() {
     std::cerr.tie(nullptr);  // a complaint must not wait for an output that nobody reads
-    return {std::cout, std::cerr, canRedraw(), terminalWidth(), {}, hasUtf8() ? "\u2026" : "..."};
+    return {std::cout,        std::cerr,    canRedraw(),
+            terminalWidth(),  {},           hasUtf8() ? "\u2026" : "...",
+            terminalHeight(), terminalWidth};
 }
 
 }  // namespace appsync

@@ -27,6 +27,14 @@ struct Console {
     std::string help{};
     /// Ends what is cut off to fit.
     std::string_view cutMark = "...";
+    /// Lines of that terminal.
+    std::size_t height = 24;
+    /// Its width as it is now; null where that does not change.
+    std::size_t (*measure)() = nullptr;
+
+    [[nodiscard]] std::size_t currentWidth() const {
+        return measure != nullptr ? measure() : width;
+    }
 
     /// One line on the error stream: "appsync: " and the text, made safe to print.
     void complain(std::string_view text) const;

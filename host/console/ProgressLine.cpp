@@ -9,7 +9,7 @@
 namespace appsync {
 namespace {
 
-constexpr std::chrono::milliseconds kBeforeTheLine{500};
+constexpr std::chrono::milliseconds kBeforeTheLine{250};
 constexpr std::chrono::milliseconds kBetweenLines{100};
 
 }  // namespace

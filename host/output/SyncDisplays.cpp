@@ -11,6 +11,7 @@
 #include "host/console/Console.h"
 #include "host/console/Text.h"
 #include "host/output/JsonSync.h"
+#include "host/output/TerminalDisplay.h"
 
 namespace appsync {
 namespace {
@@ -48,41 +49,73 @@ std::string stateText(const SyncEvent& event) {
            ")";
 }
 
-// "com.a, com.b"; on a terminal the first few, and how many more.
-std::string enumerated(const std::vector<std::string>& identifiers, bool isForTerminal) {
-    constexpr std::size_t kMost = 5;
-    const std::size_t shown =
-        isForTerminal ? std::min(identifiers.size(), kMost) : identifiers.size();
+constexpr std::size_t kFew = 5;  // names that a terminal gets of many
+
+// "com.a, com.b"; of more than are to be shown the first, and how many more.
+std::string enumerated(const std::vector<std::string>& identifiers, std::size_t most) {
+    const std::size_t shown = std::min(identifiers.size(), most);
     std::string text;
     for (std::size_t index = 0; index < shown; ++index) {
         const std::string& name = identifiers[index];
         text += (index == 0 ? "" : ", ") + (name.empty() ? "''" : name);
     }
     if (identifiers.size() == shown) return text;
-    return text + " and " + std::to_string(identifiers.size() - shown) + " more";
+    return text + " and " + std::to_string(identifiers.size() - shown) +
+           " more, which --verbose names";
+}
+
+// What is alike in the reasons of several applications: each is called by the same name.
+std::string likeReason(std::string reason, const std::string& identifier) {
+    if (identifier.empty()) return reason;
+    constexpr std::string_view kEach = "ID";
+    std::size_t found = reason.find(identifier);
+    for (; found != std::string::npos; found = reason.find(identifier, found + kEach.size())) {
+        reason.replace(found, identifier.size(), kEach);
+    }
+    return reason;
+}
+
+// Those whom one reason befell, in their order; the reasons in the order in which they come first.
+struct Befallen {
+    std::string reason;
+    std::vector<std::string> identifiers;
+};
+
+class ReasonGroups {
+  public:
+    void add(const std::string& reason, const std::string& identifier) {
+        const auto [position, isNew] = places_.try_emplace(reason, groups_.size());
+        if (isNew) groups_.push_back({reason, {}});
+        groups_[position->second].identifiers.push_back(identifier);
+    }
+    [[nodiscard]] const std::vector<Befallen>& groups() const { return groups_; }
+
+  private:
+    std::map<std::string, std::size_t> places_;
+    std::vector<Befallen> groups_;
+};
+
+std::string failureLine(const Befallen& group, bool isCut) {
+    const std::size_t count = group.identifiers.size();
+    if (!isCut || count <= kFew) return enumerated(group.identifiers, count) + ": " + group.reason;
+    return std::to_string(count) + " not done: " + group.reason + " (" +
+           enumerated(group.identifiers, kFew) + ")";
 }
 
 class ConsoleDisplay : public SyncDisplay {
   public:
-    explicit ConsoleDisplay(const Console& console) : console_(console) {}
+    explicit ConsoleDisplay(const Console& console, bool isVerbose = false)
+        : console_(console), isVerbose_(isVerbose) {}
     void complain(std::string_view text) override { console_.complain(text); }
 
   protected:
-    // Errors are no part of the output. One line for each, whatever it befell.
-    void complainOfFailures(const SyncSummary& summary) const {
-        std::map<std::string_view, std::vector<std::string>> befallen;
-        for (const SyncFailure& each : summary.failed) {
-            befallen[each.error].push_back(each.identifier);
-        }
-        for (const SyncFailure& each : summary.failed) {
-            const auto found = befallen.find(each.error);
-            if (found == befallen.end()) continue;
-            console_.complain(enumerated(found->second, console_.isTerminal) + ": " + each.error);
-            befallen.erase(found);
-        }
+    // Errors are no part of the output.
+    void tellFailures(const SyncSummary& summary) const {
+        complainOfFailures(summary, console_, isVerbose_);
     }
 
     const Console& console_;
+    const bool isVerbose_;
 };
 
 // A line per event.
@@ -95,9 +128,11 @@ class LineDisplay : public ConsoleDisplay {
         console_.out << eventLine(event) << '\n' << std::flush;
     }
 
+    void note(std::string_view text) override { console_.out << printable(text) << '\n'; }
+
     void finish(const SyncSummary& summary) override {
-        console_.out << summaryText(summary, console_.isTerminal) << std::flush;
-        complainOfFailures(summary);
+        console_.out << summaryText(summary, console_.isTerminal, isVerbose_) << std::flush;
+        tellFailures(summary);
     }
 
   private:
@@ -109,80 +144,13 @@ class LineDisplay : public ConsoleDisplay {
     bool hasPrepared_ = false;
 };
 
-// What has ended scrolls up; what is under way is redrawn below it.
-class BarDisplay : public ConsoleDisplay {
-  public:
-    using ConsoleDisplay::ConsoleDisplay;
-
-    void show(const SyncEvent& event) override {
-        const auto drawn = std::find_if(bars_.begin(), bars_.end(), [&](const SyncEvent& bar) {
-            return bar.phase == event.phase && bar.identifier == event.identifier;
-        });
-        erase();
-        if (event.kind == SyncEventKind::Ended) {
-            if (drawn != bars_.end()) bars_.erase(drawn);
-            // Of what was before the first application, nothing is left to be told.
-            if (event.phase != SyncPhase::Prepare) {
-                console_.out << eventBar(event, barWidth()) << '\n';
-            }
-        } else if (drawn != bars_.end()) {
-            *drawn = event;
-        } else {
-            bars_.push_back(event);
-        }
-        draw();
-    }
-
-    // The error stream is most often the same terminal.
-    void complain(std::string_view text) override {
-        erase();
-        console_.complain(text);
-        draw();
-    }
-
-    void finish(const SyncSummary& summary) override {
-        erase();
-        console_.out << summaryText(summary, console_.isTerminal) << std::flush;
-        complainOfFailures(summary);
-    }
-
-    void close() override {
-        erase();
-        console_.out << std::flush;
-    }
-
-  private:
-    // Some terminals go on to the next line once the last column is filled.
-    [[nodiscard]] std::size_t barWidth() const {
-        return console_.width > 0 ? console_.width - 1 : 0;
-    }
-
-    // From the line's beginning: a terminal has shown what was typed meanwhile, such as "^C".
-    void erase() {
-        if (drawnLines_ > 0) console_.out << "\r\x1b[" << drawnLines_ << "A\x1b[J";
-        drawnLines_ = 0;
-    }
-
-    void draw() {
-        constexpr std::size_t kMostBars = 12;  // more could be taller than the window
-        drawnLines_ = std::min(bars_.size(), kMostBars);
-        for (std::size_t index = 0; index < drawnLines_; ++index) {
-            console_.out << eventBar(bars_[index], barWidth()) << '\n';
-        }
-        console_.out << std::flush;
-    }
-
-    std::vector<SyncEvent> bars_;
-    std::size_t drawnLines_ = 0;
-};
-
 class JsonDisplay : public ConsoleDisplay {
   public:
     using ConsoleDisplay::ConsoleDisplay;
     void show(const SyncEvent&) override {}
     void finish(const SyncSummary& summary) override {
         console_.out << jsonText(summary, JsonLayout::Indented) << '\n' << std::flush;
-        complainOfFailures(summary);
+        tellFailures(summary);
     }
 };
 
@@ -194,22 +162,36 @@ class JsonLinesDisplay : public ConsoleDisplay {
     }
     void finish(const SyncSummary& summary) override {
         console_.out << jsonText(summary, JsonLayout::EventLine) << '\n' << std::flush;
-        complainOfFailures(summary);
+        tellFailures(summary);
     }
 };
 
-std::string listed(const char* title, const std::vector<std::string>& identifiers,
-                   bool isForTerminal) {
+std::string listed(const char* title, const std::vector<std::string>& identifiers, bool isCut) {
     if (identifiers.empty()) return {};
     std::string text = std::string(title) + " " + std::to_string(identifiers.size()) + ":";
     constexpr std::size_t kMost = 20;
-    const std::size_t shown =
-        isForTerminal ? std::min(identifiers.size(), kMost) : identifiers.size();
+    const std::size_t shown = isCut ? std::min(identifiers.size(), kMost) : identifiers.size();
     for (std::size_t index = 0; index < shown; ++index) {
         text += " " + printable(identifiers[index]);
     }
     if (identifiers.size() > shown) text += " ...";
     return text + "\n";
+}
+
+std::string skippedLines(const std::vector<PlannedSkip>& skipped, bool isCut) {
+    ReasonGroups reasons;
+    std::string text;
+    for (const PlannedSkip& skip : skipped) {
+        reasons.add(likeReason(skip.why, skip.identifier), skip.identifier);
+        text += "Skipped " + printable(skip.identifier) + ": " + printable(skip.why) + "\n";
+    }
+    if (!isCut || skipped.size() <= kFew) return text;
+    text.clear();
+    for (const auto& [reason, identifiers] : reasons.groups()) {
+        text += "Skipped " + std::to_string(identifiers.size()) + ": " + printable(reason) + " (" +
+                printable(enumerated(identifiers, kFew)) + ")\n";
+    }
+    return text;
 }
 
 std::string amountLine(const SyncSummary& summary) {
@@ -218,15 +200,15 @@ std::string amountLine(const SyncSummary& summary) {
     return formatBytes(summary.bytes) + " sent in " + seconds.data() + " s\n";
 }
 
-std::string bar(unsigned percent, std::size_t width) {
+std::string barOf(unsigned percent, std::size_t width) {
     const std::size_t filled = percent * width / 100;
     std::array<char, 8> number{};
     std::snprintf(number.data(), number.size(), " %3u %%", percent);
     return "[" + std::string(filled, '#') + std::string(width - filled, '.') + "]" + number.data();
 }
 
-std::string cut(const std::string& text, std::size_t width) {
-    return displayWidth(text) > width ? fitted(text, width) : text;
+std::string cut(const std::string& text, std::size_t width, std::string_view cutMark) {
+    return displayWidth(text) > width ? fitted(text, width, cutMark) : text;
 }
 
 // When the next try comes is what must not be lost; which application runs, the line says already
@@ -246,7 +228,8 @@ std::vector<std::string> barStates(const SyncEvent& event) {
     if (event.state == SyncState::Waiting) return waitStates(event);
     if (event.state == SyncState::Failed) return {"failed"};  // the error stream says why
     const unsigned percent = percentOf(event.done, event.total);
-    return {bar(percent, kBarWidth), bar(percent, kShortBarWidth), std::to_string(percent) + " %"};
+    return {barOf(percent, kBarWidth), barOf(percent, kShortBarWidth),
+            std::to_string(percent) + " %"};
 }
 
 }  // namespace
@@ -257,7 +240,7 @@ std::string eventLine(const SyncEvent& event) {
            printable(stateText(event));
 }
 
-std::string eventBar(const SyncEvent& event, std::size_t width) {
+std::string eventBar(const SyncEvent& event, std::size_t width, std::string_view cutMark) {
     std::string bar = fitted(nameOf(event.phase), kPhaseWidth);
     const std::string name =
         printable(event.phase == SyncPhase::Prepare ? event.text : event.identifier);
@@ -266,33 +249,53 @@ std::string eventBar(const SyncEvent& event, std::size_t width) {
         const std::size_t taken = displayWidth(state) + 1;
         if (taken + kPhaseWidth + kShortNameWidth <= width) {
             const std::size_t room = std::min(width - taken - kPhaseWidth, kNameWidth);
-            bar.append(fitted(name, room)).append(" ").append(state);
+            bar.append(fittedAtFront(name, room, cutMark)).append(" ").append(state);
             return bar;
         }
     }
     const std::string& shortest = states.back();
     const std::size_t taken = displayWidth(shortest) + 1;
-    if (taken + kTinyNameWidth > width) return cut(shortest, width);
-    return fitted(name, std::min(width - taken, kNameWidth)) + " " + shortest;
+    if (taken + kTinyNameWidth > width) return cut(shortest, width, cutMark);
+    return fittedAtFront(name, std::min(width - taken, kNameWidth), cutMark) + " " + shortest;
 }
 
-std::string summaryText(const SyncSummary& summary, bool isForTerminal) {
-    std::string text = listed("Installed", summary.installed, isForTerminal) +
-                       listed("Updated", summary.updated, isForTerminal) +
-                       listed("Removed", summary.removed, isForTerminal);
-    for (const PlannedSkip& skip : summary.skipped) {
-        text += "Skipped " + printable(skip.identifier) + ": " + printable(skip.why) + "\n";
-    }
+std::string percentBar(unsigned percent, std::size_t width) {
+    constexpr std::size_t kWide = 100;
+    constexpr std::size_t kNarrow = 36;
+    if (width < kNarrow) return std::to_string(percent) + " %";
+    return barOf(percent, width < kWide ? kShortBarWidth : kBarWidth);
+}
+
+std::string summaryText(const SyncSummary& summary, bool isForTerminal, bool isVerbose) {
+    const bool isCut = isForTerminal && !isVerbose;
+    std::string text =
+        listed("Installed", summary.installed, isCut) + listed("Updated", summary.updated, isCut) +
+        listed("Removed", summary.removed, isCut) + skippedLines(summary.skipped, isCut);
     std::vector<std::string> failed;
+    failed.reserve(summary.failed.size());
     for (const SyncFailure& each : summary.failed) failed.push_back(each.identifier);
-    text += listed("Failed", failed, isForTerminal);
+    text += listed("Failed", failed, isCut);
     if (text.empty() && summary.requested.empty()) {
         return summary.bringsInStep ? "Nothing to do: all is in step.\n" : "Nothing to do.\n";
     }
     return text + amountLine(summary);
 }
 
-std::unique_ptr<SyncDisplay> makeSyncDisplay(SyncDisplayKind kind, const Console& console) {
+void complainOfFailures(const SyncSummary& summary, const Console& console, bool isVerbose) {
+    const bool isCut = console.isTerminal && !isVerbose;
+    const bool areMany = summary.failed.size() > kFew;
+    ReasonGroups reasons;
+    for (const SyncFailure& each : summary.failed) {
+        reasons.add(isCut && areMany ? likeReason(each.error, each.identifier) : each.error,
+                    each.identifier);
+    }
+    for (const Befallen& group : reasons.groups()) {
+        console.complain(failureLine(group, isCut));
+    }
+}
+
+std::unique_ptr<SyncDisplay> makeSyncDisplay(SyncDisplayKind kind, const Console& console,
+                                             bool isVerbose) {
     switch (kind) {
         case SyncDisplayKind::Json:
             return std::make_unique<JsonDisplay>(console);
@@ -301,8 +304,8 @@ std::unique_ptr<SyncDisplay> makeSyncDisplay(SyncDisplayKind kind, const Console
         case SyncDisplayKind::Text:
             break;
     }
-    if (console.isTerminal) return std::make_unique<BarDisplay>(console);
-    return std::make_unique<LineDisplay>(console);
+    if (console.isTerminal) return std::make_unique<TerminalDisplay>(console, isVerbose);
+    return std::make_unique<LineDisplay>(console, isVerbose);
 }
 
 }  // namespace appsync

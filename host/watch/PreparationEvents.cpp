@@ -66,8 +66,9 @@ void PreparationEvents::advance(Part part, std::size_t done, std::size_t count) 
     const std::uint64_t ofPart = count > 0 ? packages_ * done / count : packages_;
     done_ = std::max(done_, static_cast<std::uint64_t>(part) * packages_ + ofPart);
     if (events_ == nullptr || packages_ < kFewPackages) return;
-    events_->report(
-        preparationEvent(SyncEventKind::Progress, done_, total_, SyncState::Active, nameOf(part)));
+    events_->report(preparationEvent(
+        SyncEventKind::Progress, done_, total_, SyncState::Active,
+        nameOf(part) + (", " + std::to_string(done) + " of " + std::to_string(count))));
 }
 
 void PreparationEvents::end(const std::string& why) {

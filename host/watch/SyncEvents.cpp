@@ -1,6 +1,7 @@
 #include "host/watch/SyncEvents.h"
 
 #include <algorithm>
+#include <system_error>
 #include <thread>
 
 namespace appsync {
@@ -64,6 +65,45 @@ bool isNews(const SyncEvent& progress, const SyncEvent& last) {
 }
 
 }  // namespace
+
+void SyncEvents::tellOfTime() {
+    if (!display_.isLive() || ticker_.joinable()) return;
+    try {
+        ticker_ = std::thread([this] { tickOn(); });
+    } catch (const std::system_error&) {
+        // It is drawn at events only.
+    }
+}
+
+SyncEvents::~SyncEvents() {
+    {
+        const std::lock_guard guard(mutex_);
+        isFinished_ = true;
+    }
+    over_.notify_all();
+    if (ticker_.joinable()) ticker_.join();
+}
+
+void SyncEvents::tickOn() {
+    constexpr std::chrono::milliseconds kInterval{250};
+    std::unique_lock lock(mutex_);
+    while (!over_.wait_for(lock, kInterval, [this] { return isFinished_; })) display_.tick();
+}
+
+void SyncEvents::expect(const SyncTotals& totals) {
+    const std::lock_guard guard(mutex_);
+    if (!isFinished_) display_.expect(totals);
+}
+
+void SyncEvents::doing(std::string_view what) {
+    const std::lock_guard guard(mutex_);
+    if (!isFinished_) display_.doing(what);
+}
+
+void SyncEvents::note(std::string_view text) {
+    const std::lock_guard guard(mutex_);
+    if (!isFinished_) display_.note(text);
+}
 
 void SyncEvents::report(SyncEvent event) {
     const std::lock_guard guard(mutex_);

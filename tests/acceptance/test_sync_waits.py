@@ -1,21 +1,12 @@
-"""Syncs that wait for running applications for no longer than they are told to, and what a terminal shows."""
+"""Syncs that wait for running applications for no longer than they are told to."""
 
-import fcntl
 import json
-import os
-import pty
-import re
-import select
 import signal
-import struct
-import subprocess
-import termios
 
 import pytest
 
 import packages
-from conftest import ON_ONE_PATH, TIMEOUT
-from processes import with_default_signals
+from conftest import TIMEOUT
 from staging import install, stage
 
 A, B = "com.example.app00", "com.example.app01"
@@ -93,115 +84,6 @@ def test_what_quits_in_time_is_installed(appsync, device, running):
     appsync("quit", device.path, A)
     out, _ = sync.communicate(timeout=TIMEOUT)  # the direct path tries again after half a minute
     assert sync.returncode == 0 and A in json.loads(out.splitlines()[-1])["updated"]
-
-
-class Terminal:
-    """A command on a terminal of its own, and the lines that a person sees."""
-
-    WIDTH = 100
-
-    def __init__(self, program, arguments):
-        self.master, slave = pty.openpty()
-        fcntl.ioctl(slave, termios.TIOCSWINSZ, struct.pack("HHHH", 40, self.WIDTH, 0, 0))
-        self.process = subprocess.Popen(
-            [program, *map(str, arguments)], stdin=slave, stdout=slave, stderr=slave,
-            env={**os.environ, "TERM": "xterm"}, start_new_session=True, preexec_fn=self._take_terminal)
-        os.close(slave)
-        self.text = ""
-
-    @staticmethod
-    def _take_terminal():
-        with_default_signals()
-        fcntl.ioctl(0, termios.TIOCSCTTY, 0)
-
-    def type(self, keys):
-        os.write(self.master, keys)
-
-    def read_until(self, wanted):
-        """Reads until the text comes (None: until the command has ended)."""
-        while wanted is None or wanted not in self.text:
-            ready, _, _ = select.select([self.master], [], [], TIMEOUT)
-            assert ready, self.text
-            try:
-                piece = os.read(self.master, 65536)
-            except OSError:  # nobody has the other side open any more
-                piece = b""
-            if not piece:
-                assert wanted is None, self.text
-                return
-            self.text += piece.decode()
-
-    def screen(self):
-        """The lines as the terminal shows them in the end, for the little that the command uses."""
-        lines, row, column = [""], 0, 0
-        for token in re.findall(r"\x1b\[(\d*)([A-Z])|(\r)|(\n)|([^\x1b\r\n]+)", self.text):
-            count, code, carriage, feed, text = token
-            if code == "A":
-                row = max(0, row - int(count or 1))
-            elif code == "J":
-                lines = lines[:row] + [lines[row][:column]]
-            elif carriage:
-                column = 0
-            elif feed:
-                row += 1
-                lines += [""] * (row + 1 - len(lines))
-            elif text:
-                line = lines[row].ljust(column)
-                lines[row] = line[:column] + text + line[column + len(text):]
-                column += len(text)
-        return [line.rstrip() for line in lines]
-
-    def end(self):
-        self.process.kill()
-        self.process.wait()
-        os.close(self.master)
-
-
-@pytest.fixture
-def terminal(appsync):
-    opened = []
-
-    def start(*arguments):
-        opened.append(Terminal(appsync.program, arguments))
-        return opened[-1]
-
-    yield start
-    for each in opened:
-        each.end()
-
-
-def test_ctrl_c_during_the_wait_leaves_every_line_whole(device, running, terminal):
-    shown = terminal("sync", device.path, running)
-    shown.read_until("next try")
-    shown.type(b"\x03")
-    shown.read_until("stopping")
-    shown.read_until(None)
-    lines = shown.screen()
-    (notice,) = (line for line in lines if "stopping" in line)
-    assert notice.startswith("appsync: stopping: ")
-    assert any("%s: interrupted" % A in line for line in lines)
-    for line in lines:
-        # Nothing but what the command has to say, and what the terminal echoes on a line of its own.
-        assert re.match(r"(appsync: |install |transfer |Updated |Failed |\d.* sent in |\^C|$)", line), lines
-    assert shown.process.wait(timeout=TIMEOUT) == 1
-
-
-@ON_ONE_PATH
-def test_a_terminal_shows_the_preparation_and_keeps_nothing_of_it(device, library, terminal):
-    shown = terminal("sync", device.path, library)
-    shown.read_until(None)
-    assert shown.process.wait(timeout=TIMEOUT) == 0
-    assert "prepare  reading packages" in shown.text
-    assert not any("prepare" in line for line in shown.screen())
-
-
-@ON_ONE_PATH
-def test_a_plan_on_a_terminal_is_the_plan(appsync, device, library, terminal):
-    shown = terminal("plan", device.path, library)
-    shown.read_until(None)
-    assert shown.process.wait(timeout=TIMEOUT) == 0
-    expected = appsync("plan", device.path, library).stdout.splitlines()
-    assert [line for line in shown.screen() if line][:-1] == expected[:-1]  # the last line tells what is free
 
 
 def test_a_signal_ends_the_wait_before_its_time(appsync, device, running):

@@ -57,16 +57,26 @@ class Sending {
         : arguments_(arguments),
           module_(module),
           console_(console),
-          display_(makeSyncDisplay(arguments.display, console)),
+          display_(makeSyncDisplay(arguments.display, console, arguments.isVerbose)),
           events_(*display_),
           signals_(
-              kPatience, [this] { events_.complainSoon(stoppingNotice()); }, [this] { leave(); }) {}
+              kPatience, [this] { events_.complainSoon(stoppingNotice()); }, [this] { leave(); }) {
+        events_.tellOfTime();
+    }
     Sending(const Sending&) = delete;
     Sending& operator=(const Sending&) = delete;
     // Signals must not end the process in an instant before the device is closed.
     ~Sending() { device_.reset(); }
 
     Result<int> run() {
+        events_.doing("opening the device");
+        Result<int> status = attempt();
+        if (!status) events_.closeSoon();
+        return status;
+    }
+
+  private:
+    Result<int> attempt() {
         Result<std::unique_ptr<Device>> device =
             Device::open(arguments_.device, {DeviceAccess::Session});
         if (!device) return unusable(device.error());
@@ -89,7 +99,6 @@ class Sending {
         return hold();
     }
 
-  private:
     [[nodiscard]] bool isData() const { return parts_ == kAssetPartApplicationData; }
 
     [[nodiscard]] ParcelContents contents() const {
@@ -275,6 +284,9 @@ class Sending {
         Result<std::unique_ptr<PlugIn>> plugIn =
             PlugIn::load(*device_, events_, facts_, console_, module_.table());
         if (!plugIn) return plugIn.error();
+        std::error_code code;
+        const std::uint64_t bytes = std::filesystem::file_size(arguments_.file, code);
+        events_.expect({1, code ? 0 : bytes});
         Session session(*device_, **plugIn, events_, facts_, signals_.stopRequested());
         const SessionEnd end = holdSession(session, (*plugIn)->platform().coordination);
         const Result<SessionAftermath> aftermath = aftermathOf(*device_, end, facts_);

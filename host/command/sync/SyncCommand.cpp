@@ -53,6 +53,10 @@ std::string givenUpNote(StagedWork work) {
     return what + " is given up for this sync: stage it again afterwards";
 }
 
+SyncTotals totalsOf(const SyncPlan& plan) {
+    return {plan.install.size() + plan.update.size() + plan.remove.size(), plan.bytes()};
+}
+
 std::map<std::string, std::string> refusalsOf(const SyncPlan& plan) {
     std::map<std::string, std::string> refusals;
     for (const PlannedInstall& each : plan.update) {
@@ -85,12 +89,14 @@ class SyncRun {
         : arguments_(arguments),
           module_(module),
           console_(console),
-          display_(makeSyncDisplay(arguments.display, console)),
+          display_(makeSyncDisplay(arguments.display, console, arguments.isVerbose)),
           events_(*display_),
           preparation_(showsPreparation(arguments, console) ? &events_ : nullptr) {
-        if (arguments.isDryRun) return;
-        signals_.emplace(
-            kPatience, [this] { events_.complainSoon(stoppingNotice()); }, [this] { leave(); });
+        if (!arguments.isDryRun) {
+            signals_.emplace(
+                kPatience, [this] { events_.complainSoon(stoppingNotice()); }, [this] { leave(); });
+        }
+        events_.tellOfTime();
     }
     SyncRun(const SyncRun&) = delete;
     SyncRun& operator=(const SyncRun&) = delete;
@@ -102,7 +108,9 @@ class SyncRun {
 
     Result<int> run() {
         Result<int> status = attempt();
-        if (!status) preparation_.fail(status.error().description());
+        if (status) return status;
+        preparation_.fail(status.error().description());
+        events_.closeSoon();
         return status;
     }
 
@@ -120,6 +128,8 @@ class SyncRun {
             if (sync_.allowed.empty()) return leaveStaged();
             events_.complainSoon(usedUpWarning(sync_));
         }
+        events_.expect(totalsOf(sync_.allowed));
+        events_.doing("preparing the device");
         ready = makeReady();
         if (!ready) return ready.error();
         if (!signals_->stopRequested()) return hold();
@@ -128,8 +138,10 @@ class SyncRun {
     }
 
     Status prepare() {
+        events_.doing("opening the device");
         Status status = openDevice();
         if (status) status = openLibrary();
+        events_.doing("planning");
         if (status) status = makeThePlan();
         return status;
     }
@@ -165,6 +177,7 @@ class SyncRun {
 
     int showPlan() {
         preparation_.finish();
+        events_.closeSoon();
         if (sync_.givenUp != StagedWork::None) {
             sync_.allowed.notes.push_back(givenUpNote(sync_.givenUp));
         }
@@ -293,13 +306,7 @@ class SyncRun {
 
     int finish(SyncSummary summary) {
         summary = timed(std::move(summary));
-        for (const std::string& note : sync_.plan.notes) {
-            if (arguments_.display == SyncDisplayKind::Text) {
-                console_.out << printable(note) << '\n';
-            } else {
-                events_.complainSoon(note);
-            }
-        }
+        for (const std::string& note : sync_.plan.notes) events_.note(note);
         endedWith_ = summary.incomplete ? kExitSomethingFailed : kExitDone;
         events_.finish(summary);
         const bool isInterrupted = summary.incomplete && signals_->stopRequested() &&

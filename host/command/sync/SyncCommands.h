@@ -29,6 +29,8 @@ struct SyncArguments {
     /// The module with the plug-in; empty: the one that is built in.
     std::string plugIn{};
     SyncDisplayKind display = SyncDisplayKind::Text;
+    /// A terminal, too, gets long lists whole.
+    bool isVerbose = false;
 };
 [[nodiscard]] int runSync(const SyncArguments& arguments, const Console& console);
 
@@ -55,6 +57,7 @@ struct SendArguments {
     /// The module with the plug-in; empty: the one that is built in.
     std::string plugIn{};
     SyncDisplayKind display = SyncDisplayKind::Text;
+    bool isVerbose = false;
 };
 [[nodiscard]] int runSend(const SendArguments& arguments, const Console& console);
 

@@ -26,22 +26,22 @@ class ProgressLineTest : public testing::Test {
 };
 
 TEST_F(ProgressLineTest, SaysNothingOfWhatIsDoneSoon) {
-    showAt(499ms, "soon");
+    showAt(249ms, "soon");
     line.clear();
     EXPECT_EQ(out.str(), "");
 }
 
 TEST_F(ProgressLineTest, IsRedrawnNowAndThenAndGoes) {
-    showAt(500ms, "one");
-    showAt(599ms, "between");
-    showAt(600ms, "two");
+    showAt(250ms, "one");
+    showAt(349ms, "between");
+    showAt(350ms, "two");
     EXPECT_EQ(out.str(), "\rone      \rtwo      ");
     line.clear();
     EXPECT_EQ(out.str(), "\rone      \rtwo      \r\x1b[K");
 }
 
 TEST_F(ProgressLineTest, StaysInItsLineWhateverTheText) {
-    showAt(500ms, "longer than that\n");
+    showAt(250ms, "longer than that\n");
     EXPECT_EQ(out.str(), "\rlonger...");
 }
 

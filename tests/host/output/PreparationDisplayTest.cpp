@@ -1,4 +1,3 @@
-#include <gmock/gmock.h>
 #include <gtest/gtest.h>
 
 #include <sstream>
@@ -8,9 +7,6 @@
 
 namespace appsync {
 namespace {
-
-using testing::HasSubstr;
-using testing::StartsWith;
 
 SyncEvent prepared(SyncEventKind kind, std::uint64_t done, SyncState state = SyncState::Active) {
     return {kind, SyncPhase::Prepare, "", done, 400, state, std::nullopt, "reading packages"};
@@ -40,25 +36,6 @@ TEST_F(PreparationDisplay, HasNoLineWhereItIsOverInAMoment) {
     show(SyncDisplayKind::Text, {prepared(SyncEventKind::Started, 0),
                                  prepared(SyncEventKind::Ended, 400, SyncState::Finished)});
     EXPECT_EQ(out.str(), "");
-}
-
-TEST_F(PreparationDisplay, HasABarThatGoesAway) {
-    console.isTerminal = true;
-    show(SyncDisplayKind::Text, {prepared(SyncEventKind::Progress, 100)});
-    EXPECT_THAT(out.str(), StartsWith("prepare  reading packages "));
-    EXPECT_THAT(out.str(), HasSubstr("[#####...............]  25 %\n"));
-    out.str("");
-    show(SyncDisplayKind::Text, {prepared(SyncEventKind::Started, 0),
-                                 prepared(SyncEventKind::Ended, 400, SyncState::Finished)});
-    EXPECT_THAT(out.str(), testing::EndsWith("\r\x1b[1A\x1b[J"));
-}
-
-TEST_F(PreparationDisplay, GoesAwayToo) {
-    console.isTerminal = true;
-    const std::unique_ptr<SyncDisplay> display = makeSyncDisplay(SyncDisplayKind::Text, console);
-    display->show(prepared(SyncEventKind::Started, 0));
-    display->close();
-    EXPECT_THAT(out.str(), testing::EndsWith("\r\x1b[1A\x1b[J"));
 }
 
 TEST_F(PreparationDisplay, IsOfNoApplicationForPrograms) {

@@ -55,15 +55,6 @@ TEST_F(SyncDisplays, SaysWhichApplicationHoldsItUpAndWhenTheNextTryComes) {
         "install com.example.atlas: waiting: it is running; next try at " + formatClock(kNextTry));
 }
 
-TEST_F(SyncDisplays, RedrawsTheBarInPlace) {
-    console.isTerminal = true;
-    const std::string text =
-        shown(SyncDisplayKind::Text, {event(SyncEventKind::Progress, SyncState::Active),
-                                      event(SyncEventKind::Ended, SyncState::Finished, 1024)});
-    EXPECT_THAT(text, HasSubstr("[##########..........]  50 %\n\r\x1b[1A\x1b[J"));
-    EXPECT_THAT(text, HasSubstr("[####################] 100 %\n"));
-}
-
 TEST_F(SyncDisplays, NoBarIsWiderThanTheTerminal) {
     SyncEvent wide = waiting();
     wide.identifier = std::string(300, 'y');
@@ -141,19 +132,37 @@ TEST_F(SyncDisplays, OnlyATerminalGetsTheBeginningOfALongList) {
     err.str("");
     console.isTerminal = true;
     EXPECT_THAT(shown(SyncDisplayKind::Text, {}), HasSubstr("com.n19 ...\n"));
-    EXPECT_THAT(err.str(), HasSubstr("com.n4 and 25 more: lost\n"));
+    EXPECT_THAT(err.str(), HasSubstr("30 not done: lost (com.n0, "));
 }
 
-TEST_F(SyncDisplays, ANoticeStandsAboveTheBars) {
+TEST_F(SyncDisplays, ATerminalIsToldOfLikeReasonsOnce) {
     console.isTerminal = true;
-    const std::unique_ptr<SyncDisplay> display = makeSyncDisplay(SyncDisplayKind::Text, console);
-    display->show(event(SyncEventKind::Progress, SyncState::Active));
-    out.str("");
-    display->complain("stopping");
-    EXPECT_EQ(err.str(), "appsync: stopping\n");
-    // What was typed meanwhile stands there too.
-    EXPECT_THAT(out.str(), StartsWith("\r\x1b[1A\x1b[J"));
-    EXPECT_THAT(out.str(), HasSubstr("[##########..........]"));
+    for (int number = 0; number < 8; ++number) {
+        const std::string identifier = "com.n" + std::to_string(number);
+        summary.failed.push_back({identifier, identifier + " is running"});
+        summary.skipped.push_back(
+            {identifier, "send " + identifier + ", then " + identifier, true});
+    }
+    summary.failed.push_back({"com.other", "damaged"});
+    EXPECT_THAT(shown(SyncDisplayKind::Text, {}),
+                HasSubstr("Skipped 8: send ID, then ID (com.n0, com.n1, com.n2, com.n3, com.n4 and "
+                          "3 more, which --verbose names)\n"));
+    EXPECT_EQ(err.str(),
+              "appsync: 8 not done: ID is running (com.n0, com.n1, com.n2, com.n3, com.n4 and 3 "
+              "more, which --verbose names)\nappsync: com.other: damaged\n");
+}
+
+TEST_F(SyncDisplays, AVerboseTerminalGetsAllOfALongList) {
+    console.isTerminal = true;
+    for (int number = 0; number < 30; ++number) {
+        const std::string identifier = "com.n" + std::to_string(number);
+        summary.installed.push_back(identifier);
+        summary.failed.push_back({identifier, "lost"});
+        summary.skipped.push_back({identifier, "left", true});
+    }
+    makeSyncDisplay(SyncDisplayKind::Text, console, true)->finish(summary);
+    EXPECT_THAT(out.str(), HasSubstr("com.n28 com.n29\nSkipped com.n0: left\n"));
+    EXPECT_THAT(err.str(), HasSubstr("com.n28, com.n29: lost\n"));
 }
 
 SyncEvent waitingForItself() {
@@ -199,7 +208,7 @@ TEST_F(SyncDisplays, NoTerminalIsTooNarrow) {
     console.isTerminal = true;
     console.width = 1;
     EXPECT_THAT(shown(SyncDisplayKind::Text, {event(SyncEventKind::Progress, SyncState::Active)}),
-                StartsWith("\n\r\x1b[1A\x1b[J"));
+                StartsWith("\n\n\r\x1b[2A\x1b[J"));
 }
 
 }  // namespace

@@ -3,6 +3,7 @@
 #include <gtest/gtest.h>
 
 #include <functional>
+#include <future>
 #include <thread>
 
 namespace appsync {
@@ -149,6 +150,32 @@ TEST(SyncEvents, WhoeverLeavesDoesNotWaitForAnOutputThatIsStuck) {
     shown = &events;
     events.report(progress(50, 100));
     EXPECT_EQ(display.finishes, 0);
+}
+
+class LiveDisplay : public RecordingDisplay {
+  public:
+    [[nodiscard]] bool isLive() const override { return true; }
+    void tick() override {
+        EXPECT_EQ(finishes, 0);
+        if (ticks++ == 0) first_.set_value();
+    }
+    void waitForTick() { first_.get_future().wait(); }
+    int ticks = 0;
+
+  private:
+    std::promise<void> first_;
+};
+
+TEST(SyncEvents, ALiveDisplayIsToldThatTimeGoesByUntilTheEnd) {
+    LiveDisplay display;
+    SyncEvents events(display);
+    events.tellOfTime();
+    display.waitForTick();
+    events.finish({});
+    events.note("too late");
+    events.doing("nothing any more");
+    EXPECT_EQ(display.finishes, 1);
+    EXPECT_TRUE(display.complaints.empty());
 }
 
 }  // namespace
