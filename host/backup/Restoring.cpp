@@ -14,6 +14,7 @@
 #include "host/backup/RestoreDefects.h"
 #include "host/backup/RestoredData.h"
 #include "host/console/Problem.h"
+#include "host/console/Text.h"
 #include "host/file/HostFile.h"
 #include "host/plan/StandingInstalls.h"
 #include "host/session/PackageSender.h"
@@ -64,12 +65,18 @@ Status withWhatToDo(const Status& status) {
 class Restoring {
   public:
     Restoring(const std::string& backup, const BackupManifest& manifest, std::int64_t type,
-              Device& device, PlugIn& plugIn)
-        : backup_(backup), manifest_(manifest), type_(type), device_(device), plugIn_(plugIn) {}
+              Device& device, PlugIn& plugIn, const RestoreProgress& progress)
+        : backup_(backup),
+          manifest_(manifest),
+          type_(type),
+          device_(device),
+          plugIn_(plugIn),
+          progress_(progress) {}
 
     // An error when the device or the backup cannot be used at all.
     Result<RestoreResult> run() {
         Status status = findPresent();
+        say("checking the backup");
         if (status) status = readRestoreInfo();
         if (!status) return status.error();
         listData();
@@ -83,6 +90,7 @@ class Restoring {
         noteUnless(placeIconOrder(), kBackupIconOrder, "the order of the home screen stays");
         isPlaced_ = noteUnless(placeRestoreInfo(), kBackupRestoreInfo, "nothing is restored");
         if (isPlaced_) {
+            say("bringing back " + counted(wanted_.size(), "application"));
             plugIn_.client().reconcileRestoreOfType(type_, nullptr);
         }
         if (const auto error = device_.databaseFailure()) return unusable(*error);
@@ -92,6 +100,10 @@ class Restoring {
     }
 
   private:
+    void say(const std::string& what) const {
+        if (progress_) progress_(what);
+    }
+
     Status findPresent() {
         const Result<std::vector<ApplicationRecord>> records = device_.applications();
         if (!records) return unusable(records.error());
@@ -251,7 +263,9 @@ class Restoring {
 
     Status placeData() {
         PackageSender sender(device_);
+        std::size_t done = 0;
         for (const DataToPlace& each : data_) {
+            say("placing data, " + std::to_string(++done) + " of " + std::to_string(data_.size()));
             const Status sent = sendArchive(sender, each);
             if (sent) {
                 placing_.push_back(each.identifier);
@@ -437,6 +451,7 @@ class Restoring {
     std::vector<DataToPlace> data_;
     std::vector<std::string> placing_;  // whose data is aside
     std::vector<std::string> placed_;   // whose data waits on the device
+    const RestoreProgress& progress_;
     RestoreResult result_;
 };
 
@@ -448,8 +463,9 @@ bool bringsApplications(std::int64_t type) {
 }
 
 Result<RestoreResult> restoreBackup(const std::string& backup, const BackupManifest& manifest,
-                                    std::int64_t type, Device& device, PlugIn& plugIn) {
-    return Restoring(backup, manifest, type, device, plugIn).run();
+                                    std::int64_t type, Device& device, PlugIn& plugIn,
+                                    const RestoreProgress& progress) {
+    return Restoring(backup, manifest, type, device, plugIn, progress).run();
 }
 
 }  // namespace appsync

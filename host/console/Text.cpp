@@ -160,6 +160,13 @@ std::string printable(std::string_view text) {
     return result;
 }
 
+std::string formatDuration(std::chrono::seconds time) {
+    constexpr std::int64_t kMinute = 60;
+    const std::int64_t seconds = time.count() % kMinute;
+    return std::to_string(time.count() / kMinute) + (seconds < 10 ? ":0" : ":") +
+           std::to_string(seconds);
+}
+
 std::size_t displayWidth(std::string_view text) {
     return static_cast<std::size_t>(
         std::count_if(text.begin(), text.end(), [](char byte) { return !isContinuation(byte); }));

@@ -24,6 +24,9 @@ namespace appsync {
 /// The time of day in the machine's time zone: "13:00:00 +0100".
 [[nodiscard]] std::string formatClock(std::chrono::system_clock::time_point time);
 
+/// Minutes and seconds: "1:05".
+[[nodiscard]] std::string formatDuration(std::chrono::seconds time);
+
 /// The text with everything that a terminal could take for a command or that could make it show
 /// something else (control characters, those that change the direction of text or cannot be seen,
 /// broken UTF-8) replaced by "?".

@@ -1,8 +1,6 @@
 #include "host/output/TerminalDisplay.h"
 
 #include <algorithm>
-#include <array>
-#include <cstdio>
 #include <ostream>
 #include <utility>
 
@@ -33,14 +31,6 @@ std::string joined(const std::vector<std::string>& pieces, std::size_t width,
         }
     }
     return line;
-}
-
-std::string clockText(std::chrono::seconds time) {
-    std::array<char, 32> text{};
-    std::snprintf(text.data(), text.size(), "%lld:%02lld",
-                  static_cast<long long>(time.count() / 60),
-                  static_cast<long long>(time.count() % 60));
-    return text.data();
 }
 
 // Rounded, as it is an estimate.
@@ -142,7 +132,7 @@ std::size_t TerminalDisplay::mostBars() const {
 }
 
 std::string TerminalDisplay::elapsed() const {
-    return clockText(std::chrono::duration_cast<std::chrono::seconds>(now_() - begin_));
+    return formatDuration(std::chrono::duration_cast<std::chrono::seconds>(now_() - begin_));
 }
 
 std::vector<std::string> TerminalDisplay::preparationPieces() const {

@@ -244,14 +244,15 @@ Status writeStagingArea(Device& device, const SyncPlan& plan, const Library& lib
     return writeArea(device, plan, library, StagedFor::ThisSession, progress);
 }
 
-Result<std::string> stageForLater(Device& device, const SyncPlan& plan, const Library& library) {
+Result<std::string> stageForLater(Device& device, const SyncPlan& plan, const Library& library,
+                                  const StepProgress& progress) {
     // What has arrived by now the list asks for all the same: a later session cancels what nobody
     // asks for.
     SyncPlan asked = plan;
     for (auto* installs : {&asked.install, &asked.update}) {
         for (PlannedInstall& each : *installs) each.isInstalledUnasked = false;
     }
-    const Status status = writeArea(device, asked, library, StagedFor::Later, {});
+    const Status status = writeArea(device, asked, library, StagedFor::Later, progress);
     if (!status) return status.error();
     return std::string(kStagingArea);
 }

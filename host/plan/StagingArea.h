@@ -27,7 +27,8 @@ Status writeStagingArea(Device& device, const SyncPlan& plan, const Library& lib
 
 /// The same as a host leaves it for a session that comes later. Gives its path on the device.
 [[nodiscard]] Result<std::string> stageForLater(Device& device, const SyncPlan& plan,
-                                                const Library& library);
+                                                const Library& library,
+                                                const StepProgress& progress = {});
 
 /// What a host left in the staging area of the device, or a session that was interrupted of it.
 struct StagedTodoList {

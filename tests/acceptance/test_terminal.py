@@ -6,7 +6,7 @@ import re
 import pytest
 
 import packages
-from conftest import DIRECTLY, ON_ONE_PATH
+from conftest import DIRECTLY, ON_ONE_PATH, Device
 from terminal import Terminal
 
 A = "com.example.app00"
@@ -188,6 +188,25 @@ def test_a_plan_on_a_terminal_is_the_plan(appsync, device, library, terminal):
     assert shown.read_to_end() == 0
     expected = appsync("plan", device.path, library).stdout.splitlines()
     assert shown.everything()[:-1] == expected[:-1]  # the last line tells what is free
+
+
+def test_a_restore_a_staging_and_the_store_say_what_they_are_at(appsync, device, library, tmp_path, terminal):
+    device.sync(library)
+    appsync("backup", device.path, tmp_path / "backup")
+    fresh = Device(appsync, tmp_path / "fresh", device.coordination)
+
+    def lines_of(*arguments):
+        shown = terminal(*arguments, columns=100)
+        assert shown.read_to_end() == 0
+        return shown.written.split("\r")[1], shown.everything()
+
+    first, lines = lines_of("restore", fresh.path, tmp_path / "backup")
+    assert first.startswith("checking the backup  0:00") and lines[0].startswith("IDENTIFIER ")
+    first, lines = lines_of("store", fresh.path, library)
+    assert first.startswith("reading packages, 0 of 5  0:00") and "reading" not in " ".join(lines)
+    packages.make_package(library, A, "2.0")
+    first, lines = lines_of("stage", device.path, library)
+    assert first.startswith("reading packages, 0 of 5  0:00") and lines[0].startswith("staged on ")
 
 
 @ON_ONE_PATH

@@ -12,6 +12,7 @@
 #include "host/command/data/DataCommands.h"
 #include "host/console/Console.h"
 #include "host/console/JsonWriting.h"
+#include "host/console/LiveLine.h"
 #include "host/console/Problem.h"
 #include "host/console/Table.h"
 #include "host/console/Text.h"
@@ -81,8 +82,11 @@ int runRestore(const RestoreArguments& arguments, const Console& console) {
     const Result<std::unique_ptr<PlugIn>> plugIn =
         PlugIn::loadForRestore(**device, console, build->table());
     if (!plugIn) return console.fail(plugIn.error());
+    LiveLine line(console);
     const Result<RestoreResult> result =
-        restoreBackup(arguments.backup, *manifest, arguments.type, **device, **plugIn);
+        restoreBackup(arguments.backup, *manifest, arguments.type, **device, **plugIn,
+                      [&](const std::string& what) { line.say(what); });
+    line.clear();
     if (!result) return console.fail(classified(result.error()));
     const double seconds = std::chrono::duration<double>(Clock::now() - begin).count();
     for (const FailedRestore& each : result->failed) {

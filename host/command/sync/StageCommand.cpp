@@ -1,3 +1,4 @@
+#include <cstddef>
 #include <memory>
 #include <ostream>
 
@@ -6,6 +7,7 @@
 #include "host/command/sync/SyncCommands.h"
 #include "host/command/sync/SyncSource.h"
 #include "host/console/Console.h"
+#include "host/console/LiveLine.h"
 #include "host/console/Problem.h"
 #include "host/console/Text.h"
 #include "host/output/JsonSync.h"
@@ -52,6 +54,21 @@ void tell(const StageArguments& arguments, const SyncPreparation& sync, const st
                 << " --staged does it\n";
 }
 
+Result<Library> readTold(const StageArguments& arguments, Device& device, const Console& console) {
+    LiveLine line(console);
+    return readSyncLibrary(
+        arguments.sync, device.propertyLists(),
+        [&](std::size_t done, std::size_t count) { line.say("reading packages", done, count); });
+}
+
+Result<std::string> stageTold(Device& device, const SyncPlan& plan, const Library& library,
+                              const Console& console) {
+    LiveLine line(console);
+    return stageForLater(device, plan, library, [&](std::size_t done, std::size_t count) {
+        line.say("staging", done, count);
+    });
+}
+
 }  // namespace
 
 int runStage(const StageArguments& arguments, const Console& console) {
@@ -61,7 +78,7 @@ int runStage(const StageArguments& arguments, const Console& console) {
     const Result<std::unique_ptr<Device>> device =
         openDevice(arguments.sync.device, DeviceAccess::Session);
     if (!device) return console.fail(device.error());
-    const Result<Library> library = readSyncLibrary(arguments.sync, (*device)->propertyLists());
+    const Result<Library> library = readTold(arguments, **device, console);
     if (!library) return console.fail(library.error());
     Result<SyncPreparation> sync = prepareSync(**device, *library, arguments.sync.plan);
     if (!sync) return console.fail(sync.error());
@@ -71,7 +88,7 @@ int runStage(const StageArguments& arguments, const Console& console) {
         console.complain(sync->space.description());
         return kExitSomethingFailed;
     }
-    const Result<std::string> staged = stageForLater(**device, sync->plan, *library);
+    const Result<std::string> staged = stageTold(**device, sync->plan, *library, console);
     if (!staged) {
         return console.fail(unusable(staged.error().withContext("cannot stage on the device")));
     }

@@ -1,5 +1,7 @@
+#include <cstddef>
 #include <memory>
 #include <ostream>
+#include <string>
 #include <utility>
 
 #include <nlohmann/json.hpp>
@@ -9,6 +11,7 @@
 #include "host/command/sync/SyncCommands.h"
 #include "host/console/Console.h"
 #include "host/console/JsonWriting.h"
+#include "host/console/LiveLine.h"
 #include "host/console/Problem.h"
 #include "host/console/Text.h"
 #include "host/plan/LibraryReader.h"
@@ -40,19 +43,30 @@ void printKept(const StoreResult& result, const Console& console) {
                 << " failed\n";
 }
 
+Result<StoreResult> keepAllPromises(Device& device, const std::string& folder,
+                                    const Console& console) {
+    LiveLine line(console);
+    const Result<Library> library = readLibrary(
+        folder, device.propertyLists(),
+        [&](std::size_t done, std::size_t count) { line.say("reading packages", done, count); });
+    if (!library) return library.error();
+    line.say("bringing packages");
+    const Result<std::unique_ptr<PlugIn>> plugIn = PlugIn::load(device, console);
+    if (!plugIn) return plugIn.error();
+    Result<StoreResult> result = keepPromises(device, *library, (*plugIn)->platform().coordination);
+    line.clear();
+    if (!result) return classified(result.error());
+    return result;
+}
+
 }  // namespace
 
 int runStore(const std::string& device, const std::string& folder, bool asJson,
              const Console& console) {
     const Result<std::unique_ptr<Device>> opened = openDevice(device, DeviceAccess::Session);
     if (!opened) return console.fail(opened.error());
-    const Result<Library> library = readLibrary(folder, (*opened)->propertyLists());
-    if (!library) return console.fail(library.error());
-    const Result<std::unique_ptr<PlugIn>> plugIn = PlugIn::load(**opened, console);
-    if (!plugIn) return console.fail(plugIn.error());
-    const Result<StoreResult> result =
-        keepPromises(**opened, *library, (*plugIn)->platform().coordination);
-    if (!result) return console.fail(classified(result.error()));
+    const Result<StoreResult> result = keepAllPromises(**opened, folder, console);
+    if (!result) return console.fail(result.error());
     for (const FailedPromise& each : result->failed) {
         console.complain(each.identifier + ": " + each.error);
     }

@@ -119,6 +119,11 @@ TEST_F(FittedTable, IsWholeWhereNoTerminalIs) {
     EXPECT_NE(table.text().find(std::string(300, 'x')), std::string::npos);
 }
 
+TEST(FormatDuration, IsInMinutesAndSeconds) {
+    EXPECT_EQ(formatDuration(std::chrono::seconds(5)), "0:05");
+    EXPECT_EQ(formatDuration(std::chrono::seconds(7265)), "121:05");
+}
+
 TEST(Wrapped, BreaksBetweenWordsAndIndentsWhatFollows) {
     EXPECT_EQ(wrapped("label:  one two three", 14, 8), "label:  one\n        two\n        three");
     EXPECT_EQ(wrapped("one two", 7, 2), "one two");

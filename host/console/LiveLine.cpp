@@ -1,0 +1,60 @@
+#include "host/console/LiveLine.h"
+
+#include <ostream>
+#include <system_error>
+
+#include "host/console/Console.h"
+#include "host/console/Text.h"
+
+namespace appsync {
+namespace {
+
+constexpr std::chrono::milliseconds kBetweenTexts{50};
+constexpr std::chrono::milliseconds kBetweenTimes{250};
+
+}  // namespace
+
+LiveLine::LiveLine(const Console& console) : console_(console), isOver_(!console.isTerminal) {}
+
+void LiveLine::say(std::string_view what) {
+    const std::lock_guard guard(mutex_);
+    if (isOver_) return;
+    what_ = what;
+    if (Clock::now() - drawn_ >= kBetweenTexts) draw();
+    if (thread_.joinable()) return;
+    try {
+        thread_ = std::thread([this] { drawOn(); });
+    } catch (const std::system_error&) {
+        // It is drawn where there is something new only.
+    }
+}
+
+void LiveLine::say(std::string_view what, std::size_t done, std::size_t count) {
+    say(std::string(what) + ", " + std::to_string(done) + " of " + std::to_string(count));
+}
+
+void LiveLine::clear() {
+    {
+        const std::lock_guard guard(mutex_);
+        if (!isOver_ && !what_.empty()) console_.out << "\r\x1b[K" << std::flush;
+        isOver_ = true;
+    }
+    over_.notify_all();
+    if (thread_.joinable()) thread_.join();
+}
+
+void LiveLine::drawOn() {
+    std::unique_lock lock(mutex_);
+    while (!over_.wait_for(lock, kBetweenTimes, [this] { return isOver_; })) draw();
+}
+
+void LiveLine::draw() {
+    drawn_ = Clock::now();
+    const auto time = std::chrono::duration_cast<std::chrono::seconds>(drawn_ - begin_);
+    // Some terminals go on to the next line once the last column is filled.
+    const std::size_t width = console_.currentWidth();
+    const std::string text = printable(what_) + "  " + formatDuration(time);
+    console_.out << '\r' << fitted(text, width > 0 ? width - 1 : 0, console_.cutMark) << std::flush;
+}
+
+}  // namespace appsync
