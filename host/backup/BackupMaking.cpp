@@ -18,6 +18,8 @@
 #include "device/Device.h"
 #include "device/package/DataArchive.h"
 #include "device/screen/IconDrawing.h"
+#include "device/values/DevicePaths.h"
+#include "device/values/PackageIdentifier.h"
 #include "host/backup/BackupFolder.h"
 #include "host/console/Problem.h"
 #include "host/console/Text.h"
@@ -177,7 +179,43 @@ class BackupMaking {
         for (BackedUpApplication& application : result_.manifest.applications) {
             if (Status status = archive(application); !status) return status;
         }
+        return nameOtherData();
+    }
+
+    // Data whose application is gone (offloaded, then forgotten): no restore would bring it back.
+    Status nameOtherData() {
+        const Result<std::set<std::string>> known = withData();
+        if (!known) return known.error();
+        const std::string directory(kDataDirectory);
+        const Result<UniqueFd> open = device_.root().openDirectory(directory, "read");
+        if (!open) return open.error().code == ENOENT ? Status() : Status(open.error());
+        Result<std::vector<std::string>> names = namesIn(open->get(), directory);
+        if (!names) return names.error();
+        std::sort(names->begin(), names->end());
+        for (const std::string& identifier : *names) {
+            if (known->contains(identifier) || !isLegalIdentifier(identifier)) continue;
+            const Result<DataContents> data =
+                listData(device_.root(), Device::dataPath(identifier));
+            if (data && data->entries.empty() && data->leftOut.empty()) continue;
+            leaveOut(identifier,
+                     "its application is gone, so that no restore would bring it back; appsync "
+                     "data pull keeps it");
+        }
         return {};
+    }
+
+    // Whose data is in the backup, and the system's applications, which need none.
+    Result<std::set<std::string>> withData() {
+        const Result<std::vector<ApplicationRecord>> records = device_.applications();
+        if (!records) return records.error();
+        std::set<std::string> known;
+        for (const ApplicationRecord& record : *records) {
+            if (record.type != kApplicationTypeUser) known.insert(record.identifier);
+        }
+        for (const BackedUpApplication& each : result_.manifest.applications) {
+            known.insert(each.identifier);
+        }
+        return known;
     }
 
     // Of an application that is still to be restored, the data that waits for it.

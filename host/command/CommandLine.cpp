@@ -511,6 +511,7 @@ class Commands {
                 "where the device knows of data, else 3")
             ->type_name("N")
             ->check(wholeNumberFrom(1, 3));
+        added.add_flag("--yes", values->yes, "replace data that is there, unasked");
         addPlugIn(added, values->plugIn);
         addDisplay(added, values->display, values->isVerbose);
     }

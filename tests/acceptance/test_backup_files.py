@@ -112,3 +112,32 @@ def test_a_folder_that_is_no_backup_has_one_status(appsync, device, tmp_path):
                     ["backup", "--check", device.path], ["restore", device.path, device.path]):
         done = appsync(*command, "--json", expect=3)
         assert done.stderr.count("\n") == 1 and done.stdout == ""
+
+
+@ON_ONE_PATH
+def test_data_whose_application_is_gone_is_named(appsync, device, library, tmp_path):
+    device.sync(library)
+    write(device, A, "letter")
+    appsync("demote", device.path, A)
+    appsync("reset", device.path)
+    done = appsync("backup", device.path, tmp_path / "backup", "--json", expect=1)
+    (left,) = json.loads(done.stdout)["leftOut"]
+    assert left["identifier"] == A and left["file"] is None and "appsync data pull" in left["error"]
+    appsync("data", "pull", device.path, A, tmp_path / "kept.zip")
+    assert zipfile.ZipFile(tmp_path / "kept.zip").namelist() == ["letter"]
+
+
+def test_data_that_is_sent_replaces_that_of_an_application_only_when_it_is_said(appsync, library, tmp_path):
+    device = Device(appsync, tmp_path / "direct", "off")
+    device.sync(library)
+    write(device, A, "precious")
+    with zipfile.ZipFile(tmp_path / "data.zip", "w") as archive:
+        archive.writestr("new", "text")
+    package = os.path.join(library, A + ".zip")
+    appsync("send", device.path, A, package, "--restore", "--parts", "1")
+    sending = ("send", device.path, A, tmp_path / "data.zip", "--restore", "--parts", "2")
+    refused = appsync(*sending, expect=1)
+    assert "--yes" in refused.stderr and "has data" in refused.stderr
+    assert os.listdir(device.inside(DATA + A)) == ["precious"]
+    appsync(*sending, "--yes")
+    assert os.listdir(device.inside(DATA + A)) == ["new"]

@@ -10,6 +10,7 @@
 #include <utility>
 
 #include "device/Device.h"
+#include "device/package/DataArchive.h"
 #include "device/package/PackageReader.h"
 #include "host/command/argument/IdentifierArgument.h"
 #include "host/command/argument/OpenDevice.h"
@@ -256,10 +257,26 @@ class Sending {
             return failure("no package of " + arguments_.identifier + " waits for its data",
                            "send the package first, with --restore --parts 1");
         }
+        if (const Status harmless = refuseToLoseData(); !harmless) return harmless;
         Result<Session::Parcel> parcel = dataParcel(contents(), *version);
         if (!parcel) return parcel.error();
         parcel_ = *std::move(parcel);
         return planInstall({arguments_.identifier, {}, {}, *version, 0, 0});
+    }
+
+    // What a restore brings back has no data but the backup's; an application that stands has its
+    // own.
+    [[nodiscard]] Status refuseToLoseData() const {
+        const std::string& identifier = arguments_.identifier;
+        if (arguments_.yes) return {};
+        const Result<ApplicationStatus> status = device_->status(identifier);
+        if (!status) return unusable(status.error());
+        if (!status->installed) return {};
+        const Result<DataContents> data = listData(device_->root(), Device::dataPath(identifier));
+        if (!data) return data.error();
+        if (data->entries.empty() && data->leftOut.empty()) return {};
+        return failure(identifier + " is installed and has data on the device",
+                       "give --yes to replace it; appsync data pull keeps it");
     }
 
     Status planInstall(PlannedInstall planned) {

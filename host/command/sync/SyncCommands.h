@@ -54,6 +54,8 @@ struct SendArguments {
     bool isRestore = false;
     /// 1, 2 or 3, see AssetParts. Nothing: of a restore, what the device knows decides.
     std::optional<unsigned> parts;
+    /// Data that is there is replaced unasked.
+    bool yes = false;
     /// The module with the plug-in; empty: the one that is built in.
     std::string plugIn{};
     SyncDisplayKind display = SyncDisplayKind::Text;
