@@ -94,7 +94,7 @@ FILES = [
              "not a file"),
     unusable("missing", written(lambda path, place: None), "device.db"),
     unusable("cut in half", changed(lambda whole: whole[:len(whole) // 2]), "damaged"),
-    unusable("cut off in a page", changed(lambda whole: whole[:-1000]), "", status=0),
+    unusable("cut off in a page", changed(lambda whole: whole[:-1000]), "", status=SEEN_OR_NOT),
     unusable("one page", changed(lambda whole: whole[:4096]), "damaged"),
     unusable("zeros after the first page", changed(lambda whole: whole[:4096] + bytes(len(whole) - 4096)), "damaged"),
     unusable("a page size of 3", changed(put(16, b"\0\3")), "damaged"),
