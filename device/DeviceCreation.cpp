@@ -68,11 +68,12 @@ ErrorRecord alreadyExists(const fs::path& device) {
 // The reserve is for the day when the disk is full; a device without it could not even remove
 // something then.
 ErrorRecord noRoom(const fs::path& device) {
-    return deviceError(DeviceErrorCode::NoSpace,
-                       "cannot create the device " + displayPath(device.string()) +
-                           ": a device needs " + std::to_string(kSpaceOfNewDevice / 1024) +
-                           " KiB of free space to begin with, and there is less; free some, or "
-                           "give a path on another disk");
+    return deviceError(
+        DeviceErrorCode::NoSpace,
+        "cannot create the device " + displayPath(device.string()) + ": a device needs " +
+            std::to_string(kSpaceOfNewDevice / 1024) +
+            " KiB of free space beside its first files, and there is less; free some, or "
+            "give a path on another disk");
 }
 
 ErrorRecord liesInside(const fs::path& path, const fs::path& device) {

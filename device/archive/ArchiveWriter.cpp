@@ -114,8 +114,10 @@ using Archive = std::unique_ptr<zip_t, ArchiveDiscarder>;
 
 ErrorRecord archiveFailure(zip_error_t* error, const std::string& path) {
     if (::zip_error_system_type(error) == ZIP_ET_SYS) {
-        return posixError(::zip_error_code_system(error), "pack", path,
-                          ::zip_error_strerror(error));
+        const int code = ::zip_error_code_system(error);
+        std::string reason = ::zip_error_strerror(error);
+        if (code == ENOSPC || code == EDQUOT) reason += "; free space there, and run it again";
+        return posixError(code, "pack", path, reason);
     }
     return cannotPack(PackageErrorCode::Inconsistent, path, ::zip_error_strerror(error));
 }

@@ -1,6 +1,7 @@
 """`data`: an application's data listed, copied out and replaced."""
 
 import os
+import plistlib
 import pty
 import shutil
 import subprocess
@@ -289,7 +290,24 @@ ls disk/device/root%(data)s/%(id)s disk/device/root/var/mobile/tmp/RestoredData
     done = in_own_mounts(script.replace('"$APPSYNC"', appsync.program))
     assert done.stdout.split() == ["status", "1", "status", "1", "old", "disk/device/root" + DATA + "/" + ID + ":",
                                    "kept", "disk/device/root/var/mobile/tmp/RestoredData:"], done
-    assert done.stderr.count("free") == 2
+    assert done.stderr.count("free") == 2 and "new: cannot copy" in done.stderr
+
+
+def test_what_does_not_fit_elsewhere_is_named_with_what_to_do(appsync, used, tmp_path):
+    bundle = with_files(tmp_path / "source" / "Large.app", {"payload": os.urandom(3_000_000)})
+    with open(used.inside(DATA + "/" + ID + "/large"), "wb") as file:
+        file.write(os.urandom(3_000_000))
+    info = plistlib.dumps({"BundleIdentifier": "com.example.large", "BundleVersion": "1"})
+    (bundle / "Info.plist").write_bytes(info)
+    script = """
+cd %s && mkdir disk && mount -t tmpfs -o size=1m tmpfs disk
+for words in "data pull %s %s disk/out.zip" "package make source disk/out.zip"; do
+  "%s" $words; echo "status $?"; ls disk
+done
+""" % (tmp_path, used.path, ID, appsync.program)
+    done = in_own_mounts(script)
+    assert done.stdout.split() == ["status", "1", "status", "1"], done
+    assert done.stderr.count("free space there, and run it again") == 2 and ".part" not in done.stderr, done.stderr
 
 
 def test_a_restored_application_keeps_the_data_that_waits_for_it(appsync, used, tmp_path, coordination):

@@ -200,6 +200,10 @@ Status pullArchive(Device& device, const std::string& directory, const std::stri
     return written ? Status() : Status(written.error());
 }
 
+bool isForWantOfSpace(const ErrorRecord& error) {
+    return error.domain == kPosixErrorDomain && (error.code == ENOSPC || error.code == EDQUOT);
+}
+
 Status pull(Device& device, const DataArguments& arguments, const Console& console) {
     PulledItem item(arguments.place);
     if (const Status taken = item.takePlace(device); !taken) return taken;
@@ -208,6 +212,9 @@ Status pull(Device& device, const DataArguments& arguments, const Console& conso
     const auto copy = isArchiveName(arguments.place) ? pullArchive : pullFolder;
     const Status copied = copy(device, directory, item.path(), progress.heard());
     if (copied) return item.finish();
+    if (isArchiveName(arguments.place) && isForWantOfSpace(copied.error())) {
+        return cannotWriteFile(ENOSPC, arguments.place);
+    }
     return failure(copied.error().description(), "nothing was copied");
 }
 
@@ -216,7 +223,7 @@ Status fillFromFolder(const std::string& folder, int directory, const DataProgre
     const Result<RootDirectory> root = RootDirectory::open(folder);
     if (!root) return root.error();
     Result<DataContents> copied = copyData(*root, "/", directory, progress);
-    if (!copied) return copied.error();
+    if (!copied) return copied.error().withContext(folder);
     leftOut = std::move(copied->leftOut);
     return {};
 }
