@@ -3,6 +3,7 @@
 import json
 import os
 import subprocess
+import zlib
 
 import pytest
 
@@ -14,6 +15,28 @@ TIMEOUT = float(os.environ.get("APPSYNC_TEST_TIMEOUT", "120"))
 
 def pytest_collection_modifyitems(config, items):
     leave_out_what_measures(config, items)
+    if os.environ.get("APPSYNC_PATHS") == "one":
+        leave_out_a_path(config, items)
+
+
+def leave_out_a_path(config, items):
+    """Of a scenario that runs on both paths, one: which, its name decides."""
+    chosen = [item for item in items if not has_twin(item) or path_of(item) == choice(item)]
+    config.hook.pytest_deselected(items=[item for item in items if item not in chosen])
+    items[:] = chosen
+
+
+def has_twin(item):
+    return path_of(item) is not None and not any(
+        "coordination" in mark.args[0] for mark in item.iter_markers("parametrize"))
+
+
+def path_of(item):
+    return item.callspec.params.get("coordination") if hasattr(item, "callspec") else None
+
+
+def choice(item):
+    return ("off", "on")[zlib.crc32(item.originalname.encode()) % 2]
 
 
 class Command:
