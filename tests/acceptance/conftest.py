@@ -15,13 +15,14 @@ TIMEOUT = float(os.environ.get("APPSYNC_TEST_TIMEOUT", "120"))
 
 def pytest_collection_modifyitems(config, items):
     leave_out_what_measures(config, items)
-    if os.environ.get("APPSYNC_PATHS") == "one":
-        leave_out_a_path(config, items)
+    if os.environ.get("APPSYNC_SHORT"):
+        leave_out_most(config, items)
 
 
-def leave_out_a_path(config, items):
-    """Of a scenario that runs on both paths, one: which, its name decides."""
-    chosen = [item for item in items if not has_twin(item) or path_of(item) == choice(item)]
+def leave_out_most(config, items):
+    """Of a scenario that runs on both paths, one; of the rest, half. Which, the names decide."""
+    one_path = [item for item in items if not has_twin(item) or path_of(item) == choice(item)]
+    chosen = [item for item in one_path if zlib.crc32(item.name.encode()) % 2 == 0]
     config.hook.pytest_deselected(items=[item for item in items if item not in chosen])
     items[:] = chosen
 
