@@ -17,8 +17,8 @@
 #include "host/command/data/DataCommands.h"
 #include "host/console/Console.h"
 #include "host/console/JsonWriting.h"
+#include "host/console/LiveLine.h"
 #include "host/console/Problem.h"
-#include "host/console/ProgressLine.h"
 #include "host/console/Text.h"
 #include "host/session/PlugIn.h"
 #include "platform/SyncClient.h"
@@ -108,11 +108,11 @@ ErrorRecord unfinished(const std::string& backup, const ErrorRecord& cause) {
 
 Result<BackupResult> backUpShowingProgress(Device& device, BackupFolder& folder,
                                            const Console& console) {
-    ProgressLine line(console);
+    LiveLine line(console);
     std::uint64_t packed = 0;
     return makeBackup(device, folder, [&](const std::string& identifier, std::uint64_t bytes) {
         packed += bytes;
-        line.show([&] { return "packed " + formatBytes(packed) + "; now " + identifier; });
+        line.say("packed " + formatBytes(packed) + "; now " + identifier);
     });
 }
 

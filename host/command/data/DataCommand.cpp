@@ -22,8 +22,8 @@
 #include "host/command/data/DataCommands.h"
 #include "host/console/Console.h"
 #include "host/console/JsonWriting.h"
+#include "host/console/LiveLine.h"
 #include "host/console/Problem.h"
-#include "host/console/ProgressLine.h"
 #include "host/console/Question.h"
 #include "host/console/Table.h"
 #include "host/console/Text.h"
@@ -168,7 +168,7 @@ class PulledItem {
     bool isOurs_ = false;
 };
 
-// A line for what takes long: "copied 1.5 MiB".
+// A line on a terminal: "copied 1.5 MiB".
 class CopyProgress {
   public:
     explicit CopyProgress(const Console& console) : line_(console) {}
@@ -176,12 +176,12 @@ class CopyProgress {
     DataProgress heard() {
         return [this](std::uint64_t bytes) {
             done_ += bytes;
-            line_.show([this] { return "copied " + formatBytes(done_); });
+            line_.say("copied " + formatBytes(done_));
         };
     }
 
   private:
-    ProgressLine line_;
+    LiveLine line_;
     std::uint64_t done_ = 0;
 };
 

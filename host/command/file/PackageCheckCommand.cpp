@@ -8,8 +8,8 @@
 #include "host/command/file/FileCommands.h"
 #include "host/console/Console.h"
 #include "host/console/JsonWriting.h"
+#include "host/console/LiveLine.h"
 #include "host/console/Problem.h"
-#include "host/console/ProgressLine.h"
 #include "host/console/Table.h"
 #include "host/console/Text.h"
 #include "host/plan/LibraryReader.h"
@@ -111,15 +111,13 @@ class PackageCheck {
     void check(const std::string& file) {
         const auto progress = [&](std::uint64_t bytes) {
             read_ += bytes;
-            line_.show([&] {
-                return "checked " + counted(checked_.good.size(), "package") + ", " +
-                       formatBytes(read_) + "; now " + fs::path(file).filename().native();
-            });
+            line_.say("checked " + counted(checked_.good.size(), "package") + ", " +
+                      formatBytes(read_) + "; now " + fs::path(file).filename().native());
         };
         checked_.note(file, readWholePackage(file, codec_, progress));
     }
 
-    ProgressLine line_;
+    LiveLine line_;
     SystemPropertyLists codec_;
     CheckedPackages checked_;
     std::uint64_t read_ = 0;

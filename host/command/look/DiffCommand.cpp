@@ -8,8 +8,8 @@
 #include "host/compare/Holdings.h"
 #include "host/console/Console.h"
 #include "host/console/JsonWriting.h"
+#include "host/console/LiveLine.h"
 #include "host/console/Problem.h"
-#include "host/console/ProgressLine.h"
 #include "host/console/Text.h"
 #include "system/property_list/PropertyListCodec.h"
 
@@ -114,11 +114,11 @@ void sayKinds(const Holdings& left, const Holdings& right, const Console& consol
 
 Comparison compareShowingProgress(const Holdings& left, const Holdings& right,
                                   const Console& console) {
-    ProgressLine line(console);
+    LiveLine line(console);
     std::uint64_t read = 0;
     return compareHoldings(left, right, [&](const std::string& identifier, std::uint64_t bytes) {
         read += bytes;
-        line.show([&] { return "compared " + formatBytes(read) + "; now " + identifier; });
+        line.say("compared " + formatBytes(read) + "; now " + identifier);
     });
 }
 
