@@ -2,6 +2,7 @@
 
 #include <algorithm>
 #include <array>
+#include <cctype>
 #include <cstdio>
 #include <map>
 #include <ostream>
@@ -64,28 +65,47 @@ std::string enumerated(const std::vector<std::string>& identifiers, std::size_t 
            " more, which --verbose names";
 }
 
+bool isOfIdentifier(char each) {
+    return std::isalnum(static_cast<unsigned char>(each)) != 0 || each == '-' || each == '_';
+}
+
+// Whether what stands there is the whole of an identifier, and not a part of a longer one. A dot
+// may end a sentence.
+bool isWhole(std::string_view text, std::size_t begin, std::size_t length) {
+    const std::string_view before = text.substr(0, begin);
+    std::string_view after = text.substr(begin + length);
+    if (after.starts_with('.')) after.remove_prefix(1);
+    const bool goesOn = !after.empty() && isOfIdentifier(after.front());
+    return !goesOn && (before.empty() || (before.back() != '.' && !isOfIdentifier(before.back())));
+}
+
 // What is alike in the reasons of several applications: each is called by the same name.
 std::string likeReason(std::string reason, const std::string& identifier) {
     if (identifier.empty()) return reason;
     constexpr std::string_view kEach = "ID";
     std::size_t found = reason.find(identifier);
-    for (; found != std::string::npos; found = reason.find(identifier, found + kEach.size())) {
-        reason.replace(found, identifier.size(), kEach);
+    while (found != std::string::npos) {
+        const bool isName = isWhole(reason, found, identifier.size());
+        if (isName) reason.replace(found, identifier.size(), kEach);
+        found = reason.find(identifier, found + (isName ? kEach.size() : identifier.size()));
     }
     return reason;
 }
 
 // Those whom one reason befell, in their order; the reasons in the order in which they come first.
 struct Befallen {
-    std::string reason;
+    std::string reason;  // as it was told of the first
+    std::string like;    // as it is of all
     std::vector<std::string> identifiers;
+
+    [[nodiscard]] const std::string& told() const { return identifiers.size() > 1 ? like : reason; }
 };
 
 class ReasonGroups {
   public:
-    void add(const std::string& reason, const std::string& identifier) {
-        const auto [position, isNew] = places_.try_emplace(reason, groups_.size());
-        if (isNew) groups_.push_back({reason, {}});
+    void add(const std::string& reason, const std::string& like, const std::string& identifier) {
+        const auto [position, isNew] = places_.try_emplace(like, groups_.size());
+        if (isNew) groups_.push_back({reason, like, {}});
         groups_[position->second].identifiers.push_back(identifier);
     }
     [[nodiscard]] const std::vector<Befallen>& groups() const { return groups_; }
@@ -97,8 +117,8 @@ class ReasonGroups {
 
 std::string failureLine(const Befallen& group, bool isCut) {
     const std::size_t count = group.identifiers.size();
-    if (!isCut || count <= kFew) return enumerated(group.identifiers, count) + ": " + group.reason;
-    return std::to_string(count) + " not done: " + group.reason + " (" +
+    if (!isCut || count <= kFew) return enumerated(group.identifiers, count) + ": " + group.told();
+    return std::to_string(count) + " not done: " + group.told() + " (" +
            enumerated(group.identifiers, kFew) + ")";
 }
 
@@ -178,18 +198,28 @@ std::string listed(const char* title, const std::vector<std::string>& identifier
     return text + "\n";
 }
 
+std::string skippedLine(const std::string& whom, const std::string& why) {
+    return "Skipped " + printable(whom) + ": " + printable(why);
+}
+
 std::string skippedLines(const std::vector<PlannedSkip>& skipped, bool isCut) {
-    ReasonGroups reasons;
     std::string text;
-    for (const PlannedSkip& skip : skipped) {
-        reasons.add(likeReason(skip.why, skip.identifier), skip.identifier);
-        text += "Skipped " + printable(skip.identifier) + ": " + printable(skip.why) + "\n";
+    if (!isCut || skipped.size() <= kFew) {
+        for (const PlannedSkip& skip : skipped) {
+            text += skippedLine(skip.identifier, skip.why) + "\n";
+        }
+        return text;
     }
-    if (!isCut || skipped.size() <= kFew) return text;
-    text.clear();
-    for (const auto& [reason, identifiers] : reasons.groups()) {
-        text += "Skipped " + std::to_string(identifiers.size()) + ": " + printable(reason) + " (" +
-                printable(enumerated(identifiers, kFew)) + ")\n";
+    ReasonGroups reasons;
+    for (const PlannedSkip& skip : skipped) {
+        reasons.add(skip.why, likeReason(skip.why, skip.identifier), skip.identifier);
+    }
+    for (const Befallen& group : reasons.groups()) {
+        const std::size_t count = group.identifiers.size();
+        text += count == 1 ? skippedLine(group.identifiers.front(), group.told())
+                           : skippedLine(std::to_string(count), group.told()) + " (" +
+                                 printable(enumerated(group.identifiers, kFew)) + ")";
+        text += "\n";
     }
     return text;
 }
@@ -286,8 +316,9 @@ void complainOfFailures(const SyncSummary& summary, const Console& console, bool
     const bool areMany = summary.failed.size() > kFew;
     ReasonGroups reasons;
     for (const SyncFailure& each : summary.failed) {
-        reasons.add(isCut && areMany ? likeReason(each.error, each.identifier) : each.error,
-                    each.identifier);
+        const std::string& like =
+            isCut && areMany ? likeReason(each.error, each.identifier) : each.error;
+        reasons.add(each.error, like, each.identifier);
     }
     for (const Befallen& group : reasons.groups()) {
         console.complain(failureLine(group, isCut));

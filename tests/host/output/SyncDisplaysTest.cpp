@@ -152,6 +152,32 @@ TEST_F(SyncDisplays, ATerminalIsToldOfLikeReasonsOnce) {
               "more, which --verbose names)\nappsync: com.other: damaged\n");
 }
 
+TEST_F(SyncDisplays, AReasonThatIsAloneIsToldAsItIs) {
+    console.isTerminal = true;
+    for (int number = 0; number < 7; ++number) {
+        const std::string identifier = "com.n" + std::to_string(number);
+        summary.failed.push_back({identifier, "lost"});
+        summary.skipped.push_back({identifier, "left", true});
+    }
+    summary.failed.push_back({"com.a", "com.a is running"});
+    summary.skipped.push_back({"com.b", "send com.b", true});
+    EXPECT_THAT(shown(SyncDisplayKind::Text, {}), HasSubstr("Skipped com.b: send com.b\n"));
+    EXPECT_THAT(err.str(), HasSubstr("appsync: com.a: com.a is running\n"));
+}
+
+TEST_F(SyncDisplays, TheNameOfAnotherIsNoLikeReason) {
+    console.isTerminal = true;
+    for (const char* other : {"com.a.b", "com.ab", "de.com.a", "com.a-b"}) {
+        summary.failed.push_back({"com.a", std::string(other) + " is in its way, com.a."});
+        summary.failed.push_back({"com.x", std::string(other) + " is in its way, com.x."});
+    }
+    shown(SyncDisplayKind::Text, {});
+    for (const char* other : {"com.a.b", "com.ab", "de.com.a", "com.a-b"}) {
+        EXPECT_THAT(err.str(),
+                    HasSubstr("com.a, com.x: " + std::string(other) + " is in its way, ID.\n"));
+    }
+}
+
 TEST_F(SyncDisplays, AVerboseTerminalGetsAllOfALongList) {
     console.isTerminal = true;
     for (int number = 0; number < 30; ++number) {
