@@ -3,6 +3,7 @@
 #include "device/values/DeviceRecords.h"
 #include "host/console/Text.h"
 #include "host/output/FailureText.h"
+#include "host/plan/RestoredParts.h"
 #include "platform/AppRegistry.h"
 #include "platform/InstallProgressRecord.h"
 

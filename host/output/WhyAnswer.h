@@ -4,8 +4,6 @@
 #include <optional>
 #include <string>
 
-#include "host/plan/RestoredParts.h"  // versionThatWaitsForData tells whether a package waits
-
 namespace appsync {
 
 struct ApplicationStatus;

@@ -57,8 +57,9 @@ std::string commandToSend(const ApplicationRecord& placeholder) {
     return "appsync send DEVICE " + placeholder.identifier + " FILE";
 }
 
-template <typename Options>
-std::string whyNot(const Present& present, const Options& options) {
+std::string whyNot(
+    const Present& present, bool isStoreBringing,
+    const std::function<std::string(const std::string& identifier)>& howRestoredComes) {
     if (present.isSystem()) {
         const bool comesBack = present.placeholder != nullptr && isOffloaded(*present.placeholder);
         return comesBack ? "it belongs to the system, and is offloaded: " +
@@ -70,14 +71,14 @@ std::string whyNot(const Present& present, const Options& options) {
                " brings it back";
     }
     if (present.placeholder->installType == kInstallTypeRestore) {
-        if (options.bringsOffloaded) {
+        if (isStoreBringing) {
             return "a restore brought it back, and its package is the store's to bring: see "
                    "appsync store";
         }
         const std::string& identifier = present.placeholder->identifier;
         return "a restore brought it back: " +
-               (options.howRestoredComes
-                    ? options.howRestoredComes(identifier)
+               (howRestoredComes
+                    ? howRestoredComes(identifier)
                     : commandToSend(*present.placeholder) + " --restore brings its package");
     }
     return "another install of it is under way on the device";
@@ -151,7 +152,8 @@ class Planner {
         if (isAskedFor) {
             plan_.install.push_back(plannedInstall(package, {}));
         } else if (present.isSystem() || present.placeholder != nullptr) {
-            skip(package.identifier, whyNot(present, options_), true);
+            skip(package.identifier,
+                 whyNot(present, options_.bringsOffloaded, options_.howRestoredComes), true);
         } else if (present.application->version.value_or("") != package.version) {
             plan_.update.push_back(
                 plannedInstall(package, present.application->version.value_or("")));
@@ -239,7 +241,9 @@ class StagedPlanner {
         const auto found = present_.find(identifier);
         const bool isThere = found != present_.end() && !removals_.contains(identifier);
         if (isThere && isNotAskedFor(found->second)) {
-            plan_.skipped.push_back({identifier, whyNot(found->second, options_), true});
+            plan_.skipped.push_back(
+                {identifier,
+                 whyNot(found->second, options_.bringsOffloaded, options_.howRestoredComes), true});
             return;
         }
         const bool isInstalled = found != present_.end() && found->second.application != nullptr;

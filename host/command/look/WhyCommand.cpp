@@ -8,6 +8,7 @@
 #include "host/console/Problem.h"
 #include "host/output/JsonRecords.h"
 #include "host/output/WhyAnswer.h"
+#include "host/plan/RestoredParts.h"
 
 namespace appsync {
 

@@ -25,22 +25,29 @@ namespace {
 
 constexpr const char* kAtlas = "com.example.atlas";
 
-TEST(DurabilityBarrierTest, eachPassIsFollowedByASyncThatBeganAfterIt) {
+/// Each of its syncs makes durable what was written when it began.
+struct CountingDisk {
     std::atomic<int> written{0};
     std::atomic<int> durable{0};
-    DurabilityBarrier barrier([&] {
+
+    int sync() {
         const int seen = written;
         std::this_thread::yield();
         durable = seen;
         return 0;
-    });
+    }
+};
+
+TEST(DurabilityBarrierTest, eachPassIsFollowedByASyncThatBeganAfterIt) {
+    CountingDisk disk;
+    DurabilityBarrier barrier([&] { return disk.sync(); });
     std::vector<std::thread> threads;
     for (int thread = 0; thread < 8; ++thread) {
         threads.emplace_back([&] {
             for (int round = 0; round < 50; ++round) {
-                const int mine = ++written;
+                const int mine = ++disk.written;
                 EXPECT_TRUE(succeeded(barrier.pass()));
-                EXPECT_GE(durable.load(), mine);
+                EXPECT_GE(disk.durable.load(), mine);
             }
         });
     }
@@ -141,23 +148,17 @@ class JointCommitsTest : public DeviceFixture {
 };
 
 TEST_F(JointCommitsTest, eachIsSyncedBeforeItsChangeIsMadeAndIsThereAfterTheCall) {
-    std::atomic<int> written{0};
-    std::atomic<int> durable{0};
-    DurabilityBarrier barrier([&] {
-        const int seen = written;
-        std::this_thread::yield();
-        durable = seen;
-        return 0;
-    });
+    CountingDisk disk;
+    DurabilityBarrier barrier([&] { return disk.sync(); });
     JointCommits commits(barrier, *database_);
     std::vector<std::thread> threads;
     for (int thread = 0; thread < 8; ++thread) {
         threads.emplace_back([&, thread] {
             for (int round = 0; round < 10; ++round) {
                 const std::string name = "t" + std::to_string(thread) + "." + std::to_string(round);
-                const int mine = ++written;
+                const int mine = ++disk.written;
                 const auto outcome = commits.commit([&](Database& database) {
-                    EXPECT_GE(durable.load(), mine);
+                    EXPECT_GE(disk.durable.load(), mine);
                     return uninstalled(name)(database);
                 });
                 EXPECT_TRUE(succeeded(outcome.synced));
