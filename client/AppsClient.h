@@ -43,10 +43,9 @@ class AppsClient final : public SyncClient,
 
     /// `init`: a new client. Whether it installs directly or through coordinators is asked here,
     /// for its whole life. The references of the platform are copied; the services must outlive the
-    /// client and what it has queued. Queued work keeps the client alive, so that the client may
-    /// end on a thread of the queues': it is over when `assetTransferEndedWithSuccess` has returned
-    /// and no session is under way. Who lets a client go earlier ends the queues first, and keeps
-    /// registry, coordination and log until they have ended.
+    /// client and what it has queued. Queued work keeps the client alive, so that it may end on a
+    /// thread of the queues'. After `assetTransferEndedWithSuccess` no install is queued; who lets
+    /// a client go earlier keeps all services until the queues have ended.
     [[nodiscard]] static std::shared_ptr<AppsClient> create(const Platform& platform);
 
     /// `dealloc`: warns of what is outstanding, and stops listening. Any thread, an install's too.

@@ -21,8 +21,8 @@ inline constexpr std::string_view BundleDisplayNameKey = "BundleDisplayName";
 inline constexpr std::string_view BundleExecutableKey = "BundleExecutable";
 inline constexpr std::string_view BundleIconFileKey = "BundleIconFile";
 
-/// The "phase" of the progress record of a whole install, and the only one that the plug-in asks
-/// for. It has the number of `kInstallPhaseLoading`, which is no phase of an install in this sense.
+/// The "phase" of the progress record of a whole install, the only one that the plug-in asks for.
+/// It is no `InstallPhase`, although it has the number of one.
 inline constexpr std::uint64_t kWholeInstall = 0;
 
 /// Keys of install options. `BundleIdentifierKey` and "RGInstallType" (unsigned integer) are
