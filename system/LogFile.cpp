@@ -52,6 +52,7 @@ int LogFile::append(std::string_view line) {
     const std::string whole = lineIsCutOff_ ? "\n" + text : text;
     const WriteOutcome outcome = writeWhole(file_.get(), bytesOf(whole));
     if (outcome.written > 0) lineIsCutOff_ = outcome.written < whole.size();
+    size_ += static_cast<off_t>(outcome.written);
     return outcome.error;
 }
 
@@ -84,18 +85,26 @@ int LogFile::openFileInDirectory() {
         file_.reset();
         return ENXIO;
     }
-    lineIsCutOff_ = endsInsideLine(file_.get(), opened_.st_size);
+    size_ = opened_.st_size;
+    lineIsCutOff_ = endsInsideLine(file_.get(), size_);
     return 0;
 }
 
 int LogFile::makeRoom(off_t size) {
-    std::optional<off_t> now = sizeIfCurrent();
-    if (!now) {
-        // Another process has put it aside, or somebody has removed it.
-        if (const int error = openFile(); error != 0) return error;
-        now = opened_.st_size;
+    const auto now = std::chrono::steady_clock::now();
+    if (!file_ || now >= nextLook_) {
+        if (const int error = look(); error != 0) return error;
+        nextLook_ = now + limits_.unawareness;
     }
-    return isFull(*now, size) ? putAside() : 0;
+    return isFull(size_, size) ? putAside() : 0;
+}
+
+int LogFile::look() {
+    const std::optional<off_t> now = sizeIfCurrent();
+    // Another process has put it aside, or somebody has removed it.
+    if (!now) return openFile();
+    size_ = *now;
+    return 0;
 }
 
 int LogFile::putAside() {

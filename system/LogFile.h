@@ -3,6 +3,7 @@
 #include <sys/stat.h>
 #include <sys/types.h>
 
+#include <chrono>
 #include <optional>
 #include <string>
 #include <string_view>
@@ -19,6 +20,9 @@ struct LogLimits {
     /// Where less than that is free on the disk, a part ends at the next multiple of `shortPart`.
     off_t scarceSpace = off_t{4} << 20U;
     off_t shortPart = off_t{256} << 10U;
+    /// How long it may take to find out that others have put the file aside, added to it, or
+    /// removed it.
+    std::chrono::milliseconds unawareness{20};
 };
 
 /// Where the older part of the log at that path stands.
@@ -29,8 +33,8 @@ struct LogLimits {
 /// before, whose space comes free; so that takes none.
 ///
 /// Several processes may append to the same log: each line is one write, one of them at a time puts
-/// the file aside, and the others find that out with their next line. Not safe for use by several
-/// threads at once.
+/// the file aside, and the others find that out soon (their lines are in the older part until
+/// then). Not safe for use by several threads at once.
 class LogFile {
   public:
     /// Of the log at that path, in a directory that is made if it is lost. There is none where
@@ -52,6 +56,7 @@ class LogFile {
     int openFileInDirectory();
     int makeRoom(off_t size);
     int putAside();
+    int look();
     [[nodiscard]] std::optional<off_t> sizeIfCurrent() const;
     [[nodiscard]] bool isFull(off_t size, off_t added) const;
     [[nodiscard]] bool isSpaceScarce() const;
@@ -61,7 +66,9 @@ class LogFile {
     LogLimits limits_;
     UniqueFd directory_;
     UniqueFd file_;
-    struct stat opened_ {};      // what file_ is
+    struct stat opened_ {};  // what file_ is
+    off_t size_ = 0;         // as last looked at, and with what was added since
+    std::chrono::steady_clock::time_point nextLook_{};
     bool lineIsCutOff_ = false;  // the last line has no end
 };
 

@@ -5,6 +5,7 @@
 
 #include <algorithm>
 #include <cerrno>
+#include <chrono>
 #include <fstream>
 #include <limits>
 #include <optional>
@@ -26,7 +27,8 @@ constexpr off_t kMost = std::numeric_limits<off_t>::max();
 class LogFileTest : public ::testing::Test {
   protected:
     /// Where a part holds two of the lines below.
-    static constexpr LogLimits kTwoLines{.part = 10, .scarceSpace = 0, .shortPart = 10};
+    static constexpr LogLimits kTwoLines{
+        .part = 10, .scarceSpace = 0, .shortPart = 10, .unawareness = {}};
 
     [[nodiscard]] LogFile open(const LogLimits& limits = kTwoLines) const {
         return LogFile::open(path(), limits).value();
@@ -104,7 +106,8 @@ TEST_F(LogFileTest, NoLineIsLostWhileManyPutTheFileAside) {
     std::vector<std::thread> writers;
     for (int writer = 0; writer < kWriters; ++writer) {
         writers.emplace_back([this, writer] {
-            LogFile log = open({.part = 8000, .scarceSpace = 0, .shortPart = 8000});
+            LogFile log =
+                open({.part = 8000, .scarceSpace = 0, .shortPart = 8000, .unawareness = {}});
             for (int line = 0; line < kLines; ++line) {
                 EXPECT_EQ(log.append(std::to_string(1000 + writer * kLines + line)), 0);
             }
@@ -119,6 +122,21 @@ TEST_F(LogFileTest, NoLineIsLostWhileManyPutTheFileAside) {
     ASSERT_EQ(all.size(), 2000U);
     for (std::size_t i = 0; i < all.size(); ++i) EXPECT_EQ(all[i], std::to_string(1000 + i));
     EXPECT_GE(older().size(), 1600U);
+}
+
+TEST_F(LogFileTest, WhoHasJustLookedWritesIntoThePartThatWasPutAside) {
+    LogLimits unaware = kTwoLines;
+    unaware.unawareness = std::chrono::hours(1);
+    LogFile one = open(unaware);
+    LogFile other = open();
+    append(one, {"1111"});
+    append(other, {"2222", "3333"});
+    append(one, {"4444"});
+    EXPECT_EQ(older(), (Lines{"1111", "2222", "4444"}));
+    // Where its own lines fill the part it looks again, and takes nothing aside a second time.
+    append(one, {"5555"});
+    EXPECT_EQ(older(), (Lines{"1111", "2222", "4444"}));
+    EXPECT_EQ(current(), (Lines{"3333", "5555"}));
 }
 
 TEST_F(LogFileTest, WhoDoesNotGetTheLockWritesOn) {
