@@ -187,7 +187,7 @@ void DeviceDatabase::changeLater(Change change) {
     if (!writer_) return;
     const std::lock_guard lock(mutex_);
     later_.push_back(std::move(change));
-    if (later_.size() == 1) flusherWakes_.notify_all();
+    if (flusherIsIdle_) flusherWakes_.notify_all();
     if (flusher_.joinable() || closing_) return;
     try {
         flusher_ = std::thread([this] { flushNowAndThen(); });
@@ -200,7 +200,9 @@ void DeviceDatabase::changeLater(Change change) {
 void DeviceDatabase::flushNowAndThen() {
     std::unique_lock lock(mutex_);
     while (!closing_) {
+        flusherIsIdle_ = true;
         flusherWakes_.wait(lock, [this] { return closing_ || !later_.empty(); });
+        flusherIsIdle_ = false;
         flusherWakes_.wait_for(lock, kLongestDelay, [this] { return closing_; });
         if (later_.empty()) continue;
         lock.unlock();

@@ -128,6 +128,7 @@ class DeviceDatabase {
     bool isFrozen_ = false;
     std::optional<ErrorRecord> failure_;
     std::condition_variable flusherWakes_;
+    bool flusherIsIdle_ = false;  // it waits for the first change, not for the time to make it
     bool closing_ = false;
     std::thread flusher_;  // started with the first change that is left for later
 };

@@ -3,6 +3,7 @@
 #include <algorithm>
 #include <chrono>
 #include <system_error>
+#include <utility>
 
 namespace appsync {
 
@@ -77,8 +78,8 @@ void RegistryObservers::remove(const AppRegistryObserver* observer) {
 
 void RegistryObservers::touch() {
     const std::lock_guard lock(mutex_);
-    touched_ = true;
-    wakes_.notify_all();
+    // Whoever touched it first has woken the thread, or `add` will.
+    if (!std::exchange(touched_, true)) wakes_.notify_all();
 }
 
 void RegistryObservers::work() {
