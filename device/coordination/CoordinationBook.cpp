@@ -61,8 +61,7 @@ Lookup CoordinationBook::lookUp(CoordinatorKind kind, const std::string& identif
                                 InstallCoordinatorService::Creation creation) {
     if (closed_) return nothing(serviceClosed());
     if (Status legal = requireLegalIdentifier(identifier); !legal) return nothing(legal.error());
-    hearOfOthers();
-    Result<std::optional<StoredCoordinator>> found = read(identifier);
+    Result<std::optional<StoredCoordinator>> found = hearAndRead(identifier);
     if (!found) return nothing(found.error());
     bool wasCreated = false;
     if (!*found) {
@@ -79,8 +78,7 @@ Lookup CoordinationBook::lookUp(CoordinatorKind kind, const std::string& identif
 
 CoordinationBook::Coordinator CoordinationBook::find(const std::string& identifier) {
     if (closed_) return nullptr;
-    hearOfOthers();
-    const Result<std::optional<StoredCoordinator>> found = read(identifier);
+    const Result<std::optional<StoredCoordinator>> found = hearAndRead(identifier);
     if (!found || !*found) return nullptr;
     return adopt(**found);
 }
@@ -123,14 +121,19 @@ void CoordinationBook::resume() {
     });
 }
 
-Result<std::optional<StoredCoordinator>> CoordinationBook::read(const std::string& identifier) {
+// Hears of what others have ended, too: both are one reading of the database.
+Result<std::optional<StoredCoordinator>> CoordinationBook::hearAndRead(
+    const std::string& identifier) {
+    std::vector<Cancellation> news;
     std::optional<StoredCoordinator> found;
     const Status status = context_.database.read([&](Database& database) -> Status {
+        news = newsOfOthers(database);
         auto result = findCoordinator(database, identifier);
         if (!result) return result.error();
         found = std::move(*result);
         return {};
     });
+    hearAll(news);
     if (!status) return status.error();
     return found;
 }

@@ -96,7 +96,10 @@ class CoordinationBook : public std::enable_shared_from_this<CoordinationBook> {
 
   private:
     [[nodiscard]] Status requireSession() const;
-    [[nodiscard]] Result<std::optional<StoredCoordinator>> read(const std::string& identifier);
+    [[nodiscard]] Result<std::optional<StoredCoordinator>> hearAndRead(
+        const std::string& identifier);
+    [[nodiscard]] std::vector<Cancellation> newsOfOthers(Database& database) const;
+    void hearAll(const std::vector<Cancellation>& news);
     [[nodiscard]] Result<StoredCoordinator> findOrInsert(CoordinatorKind kind,
                                                          const std::string& identifier,
                                                          CoordinationClient client,

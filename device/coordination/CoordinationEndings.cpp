@@ -100,13 +100,21 @@ void CoordinationBook::hearOfOthers() {
     if (closed_ || access_ == Access::Look) return;
     std::vector<Cancellation> news;
     context_.database
-        .read([&](Database& database) -> Status {
-            Result<std::vector<Cancellation>> found = cancellationsSince(database, heardOf_);
-            if (!found) return found.error();
-            news = std::move(*found);
-            return {};
+        .read([&](Database& database) {
+            news = newsOfOthers(database);
+            return Status();
         })
         .ignore();
+    hearAll(news);
+}
+
+std::vector<Cancellation> CoordinationBook::newsOfOthers(Database& database) const {
+    if (closed_ || access_ == Access::Look) return {};
+    Result<std::vector<Cancellation>> news = cancellationsSince(database, heardOf_);
+    return news ? *std::move(news) : std::vector<Cancellation>();
+}
+
+void CoordinationBook::hearAll(const std::vector<Cancellation>& news) {
     if (news.empty()) return;
     for (const Cancellation& cancellation : news) hear(cancellation);
     const std::int64_t last = news.back().id;

@@ -16,7 +16,7 @@ std::optional<std::string> DeviceCoordinator::bundleIdentifier() const {
 CoordinationClient DeviceCoordinator::creatorIdentifier() const { return coordinator_->client; }
 
 std::optional<ErrorRecord> DeviceCoordinator::error() const {
-    book_->hearOfOthers();
+    if (!coordinator_->hasEnded()) book_->hearOfOthers();
     return coordinator_->error();
 }
 
