@@ -1,7 +1,7 @@
 # What is installed where, below any prefix:
 #
 #     bin/appsync                     lib/appsync/appsync-plugin.so
-#     include/appsync/                the headers of platform/, client/ (in part), system/ and simulation/
+#     include/appsync/                the headers of platform/, client/ (in part), system/, simulation/ and contract/
 #     lib/libappsync_*.a              with lib/cmake/appsync/ and lib/pkgconfig/
 #     share/doc/appsync/              share/man/man1/, and completions where bash, zsh and fish look for them
 #
@@ -33,7 +33,12 @@ appsync_install_library(plugin "the appsync plug-in" "appsync-platform")
 appsync_install_library(system "files, queues and property lists for appsync's plug-in" "appsync-platform pugixml")
 appsync_install_library(simulation "a device in memory for appsync's plug-in" "appsync-platform")
 
-foreach(folder platform system simulation)
+set(folders platform system simulation)
+if(APPSYNC_CONTRACT)
+    appsync_install_library(contract "what proves a device for appsync's plug-in" "appsync-platform gmock gtest")
+    list(APPEND folders contract)
+endif()
+foreach(folder IN LISTS folders)
     install(DIRECTORY "${PROJECT_SOURCE_DIR}/${folder}" DESTINATION "${header_place}" COMPONENT dev
             FILES_MATCHING PATTERN "*.h")
 endforeach()

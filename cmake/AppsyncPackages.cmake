@@ -26,9 +26,11 @@ that a sync daemon loads.")
 set(CPACK_DEBIAN_DEV_PACKAGE_NAME libappsync-dev)
 set(CPACK_DEBIAN_DEV_PACKAGE_SECTION libdevel)
 set(CPACK_DEBIAN_DEV_PACKAGE_DEPENDS libpugixml-dev)
+set(CPACK_DEBIAN_DEV_PACKAGE_SUGGESTS "libgtest-dev, libgmock-dev")
 set(CPACK_COMPONENT_DEV_DESCRIPTION "libraries and headers for a device of one's own
 The plug-in, and what a device may be made of: files, queues and property
-lists for Linux, and a device in memory to test with.")
+lists for Linux, a device in memory to test with, and the kit that proves one's
+own (with GoogleTest).")
 
 set(CPACK_DEBIAN_DOC_PACKAGE_NAME libappsync-doc)
 set(CPACK_DEBIAN_DOC_PACKAGE_SECTION doc)

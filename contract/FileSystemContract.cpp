@@ -5,7 +5,7 @@
 #include <functional>
 #include <string>
 
-#include "tests/contract/SystemUnderTest.h"
+#include "contract/SystemContract.h"
 
 namespace appsync {
 namespace {
@@ -42,8 +42,7 @@ class FileSystemContract : public SystemContract {
     FileSystem& files_;
 };
 
-INSTANTIATE_TEST_SUITE_P(, FileSystemContract, testing::ValuesIn(systemImplementations()),
-                         nameOfSystem);
+APPSYNC_CONTRACT_SUITE(FileSystemContract, systemPorts());
 
 TEST_P(FileSystemContract, ADirectoryThatWasMadeIsThere) {
     EXPECT_FALSE(files_.itemExists("/d/e"));
@@ -372,4 +371,7 @@ TEST_P(FileSystemContract, AnErrorNamesThePath) {
 }
 
 }  // namespace
+
+void linkFileSystemContract() {}
+
 }  // namespace appsync

@@ -10,7 +10,7 @@
 #include "system/SystemNotifications.h"
 #include "system/SystemWorkQueues.h"
 #include "system/property_list/PropertyListCodec.h"
-#include "tests/contract/SystemUnderTest.h"
+#include "tests/contract/OurPorts.h"
 #include "tests/contract/TemporaryMachineDirectory.h"
 
 namespace appsync {
@@ -123,17 +123,14 @@ class PosixSystem : public SystemUnderTest {
     SystemWorkQueues queues_;
 };
 
-SystemImplementation simulated(const std::string& name, Scheduling scheduling) {
-    return {name, [scheduling] { return std::make_unique<SimulatedSystem>(scheduling); }};
-}
-
 }  // namespace
 
-std::vector<SystemImplementation> systemImplementations() {
-    return {simulated("Simulation", Scheduling::runToCompletion()),
-            simulated("SimulationInterleaved", Scheduling::seeded(1)),
-            simulated("SimulationInterleavedOtherwise", Scheduling::seeded(2)),
-            {"Posix", [] { return std::make_unique<PosixSystem>(); }}};
+std::unique_ptr<SystemUnderTest> makeSimulatedSystem(Scheduling scheduling) {
+    return std::make_unique<SimulatedSystem>(scheduling);
+}
+
+ContractPort posixPort() {
+    return {"Posix", [] { return std::make_unique<PosixSystem>(); }, nullptr, {}};
 }
 
 }  // namespace appsync

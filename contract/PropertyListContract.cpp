@@ -4,7 +4,7 @@
 #include <limits>
 #include <string>
 
-#include "tests/contract/SystemUnderTest.h"
+#include "contract/SystemContract.h"
 
 namespace appsync {
 namespace {
@@ -19,8 +19,7 @@ class PropertyListContract : public SystemContract {
     PropertyListSerialization& lists_;
 };
 
-INSTANTIATE_TEST_SUITE_P(, PropertyListContract, testing::ValuesIn(systemImplementations()),
-                         nameOfSystem);
+APPSYNC_CONTRACT_SUITE(PropertyListContract, systemPorts());
 
 PropertyList everyKind() {
     return PropertyList::map({{"boolean", true},
@@ -68,4 +67,7 @@ TEST_P(PropertyListContract, WhatIsNoPropertyListIsRefusedWithASentence) {
 }
 
 }  // namespace
+
+void linkPropertyListContract() {}
+
 }  // namespace appsync

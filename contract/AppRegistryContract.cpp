@@ -4,7 +4,7 @@
 #include <string>
 #include <vector>
 
-#include "tests/contract/DeviceUnderTest.h"
+#include "contract/DeviceContract.h"
 
 namespace appsync {
 namespace {
@@ -17,8 +17,7 @@ constexpr const char* kB = "com.example.b";
 
 class AppRegistryContract : public DeviceContract {};
 
-INSTANTIATE_TEST_SUITE_P(, AppRegistryContract, testing::ValuesIn(deviceImplementations()),
-                         nameOfDevice);
+APPSYNC_CONTRACT_SUITE(AppRegistryContract, devicePorts());
 
 TEST_P(AppRegistryContract, AnEmptyDeviceKnowsNothing) {
     EXPECT_FALSE(application(kA));
@@ -246,4 +245,7 @@ TEST_P(AppRegistryContract, SeveralInstallAtOnce) {
 }
 
 }  // namespace
+
+void linkAppRegistryContract() {}
+
 }  // namespace appsync

@@ -7,7 +7,7 @@
 #include <string>
 #include <vector>
 
-#include "tests/contract/DeviceUnderTest.h"
+#include "contract/DeviceContract.h"
 
 namespace appsync {
 namespace {
@@ -20,8 +20,7 @@ constexpr const char* kB = "com.example.b";
 
 class InstallProgressContract : public DeviceContract {};
 
-INSTANTIATE_TEST_SUITE_P(, InstallProgressContract, testing::ValuesIn(deviceImplementations()),
-                         nameOfDevice);
+APPSYNC_CONTRACT_SUITE(InstallProgressContract, devicePorts());
 
 TEST_P(InstallProgressContract, OnlyAnInstallUnderWayHasARecord) {
     ASSERT_TRUE(installPackage({kA}));
@@ -187,8 +186,7 @@ class RegistryObserverContract : public DeviceContract {
     }
 };
 
-INSTANTIATE_TEST_SUITE_P(, RegistryObserverContract, testing::ValuesIn(deviceImplementations()),
-                         nameOfDevice);
+APPSYNC_CONTRACT_SUITE(RegistryObserverContract, devicePorts());
 
 TEST_P(RegistryObserverContract, AFirstReportComesEvenWhenNothingIsUnderWay) {
     const auto keeper = observe();
@@ -303,4 +301,7 @@ TEST_P(RegistryObserverContract, AnObserverIsNotKeptAliveAndMayRemoveItselfAtIts
 }
 
 }  // namespace
+
+void linkInstallProgressContract() {}
+
 }  // namespace appsync

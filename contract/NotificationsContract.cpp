@@ -4,7 +4,7 @@
 #include <memory>
 #include <vector>
 
-#include "tests/contract/SystemUnderTest.h"
+#include "contract/SystemContract.h"
 
 namespace appsync {
 namespace {
@@ -29,8 +29,7 @@ class NotificationsContract : public SystemContract {
     }
 };
 
-INSTANTIATE_TEST_SUITE_P(, NotificationsContract, testing::ValuesIn(systemImplementations()),
-                         nameOfSystem);
+APPSYNC_CONTRACT_SUITE(NotificationsContract, systemPorts());
 
 TEST_P(NotificationsContract, AStateIsSeenByEverybody) {
     NamedNotifications& notifications = system_->notifications();
@@ -95,4 +94,7 @@ TEST_P(NotificationsContract, AnObserverThatHasGoneIsCalledAsNull) {
 }
 
 }  // namespace
+
+void linkNotificationsContract() {}
+
 }  // namespace appsync

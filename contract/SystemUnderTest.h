@@ -1,12 +1,7 @@
 #pragma once
 
-#include <gtest/gtest.h>
-
 #include <chrono>
 #include <cstdint>
-#include <functional>
-#include <memory>
-#include <ostream>
 #include <string>
 #include <string_view>
 #include <vector>
@@ -21,7 +16,7 @@ namespace appsync {
 /// One implementation of the services that every process has, and what the contract tests need to
 /// do beside them. Made anew for each test, with an empty device root.
 ///
-/// Whoever ports the plug-in writes one of these and adds it to `systemImplementations()`.
+/// Whoever ports the plug-in writes one of these and hands it to the kit (contract/ContractKit.h).
 class SystemUnderTest {
   public:
     virtual ~SystemUnderTest() = default;
@@ -51,30 +46,5 @@ class SystemUnderTest {
     /// Time by the clock that delays and timeouts go by.
     virtual std::chrono::nanoseconds now() = 0;
 };
-
-struct SystemImplementation {
-    std::string name;
-    std::function<std::unique_ptr<SystemUnderTest>()> make;
-};
-
-inline std::ostream& operator<<(std::ostream& out, const SystemImplementation& implementation) {
-    return out << implementation.name;
-}
-
-/// Every implementation that the contract tests run over.
-std::vector<SystemImplementation> systemImplementations();
-
-/// A test of the contract of one of these services.
-class SystemContract : public testing::TestWithParam<SystemImplementation> {
-  protected:
-    SystemContract() : system_(GetParam().make()) {}
-
-    const std::unique_ptr<SystemUnderTest> system_;
-};
-
-/// The name of a parameterised test: that of the implementation.
-inline std::string nameOfSystem(const testing::TestParamInfo<SystemImplementation>& info) {
-    return info.param.name;
-}
 
 }  // namespace appsync

@@ -4,7 +4,7 @@
 #include <string>
 #include <vector>
 
-#include "tests/contract/DeviceUnderTest.h"
+#include "contract/DeviceContract.h"
 
 namespace appsync {
 namespace {
@@ -42,8 +42,7 @@ class HomeScreenContract : public DeviceContract {
     const std::shared_ptr<HomeScreenConnection> connection_;
 };
 
-INSTANTIATE_TEST_SUITE_P(, HomeScreenContract, testing::ValuesIn(deviceImplementations()),
-                         nameOfDevice);
+APPSYNC_CONTRACT_SUITE(HomeScreenContract, devicePorts({OptionalService::HomeScreen}));
 
 TEST_P(HomeScreenContract, ALayoutComesBackFlattened) {
     EXPECT_TRUE(setLayout(PropertyList::array({kB, kA})));
@@ -107,12 +106,11 @@ TEST_P(HomeScreenContract, WhatIsHeldDoesNotRunUntilTheLastAssertionIsReleased) 
     EXPECT_TRUE(device_->run(kA));
 }
 
-class DeviceServicesContract : public DeviceContract {};
+class PolicyContract : public DeviceContract {};
 
-INSTANTIATE_TEST_SUITE_P(, DeviceServicesContract, testing::ValuesIn(deviceImplementations()),
-                         nameOfDevice);
+APPSYNC_CONTRACT_SUITE(PolicyContract, devicePorts({OptionalService::Policy}));
 
-TEST_P(DeviceServicesContract, PolicyIsUnsetUntilItIsSet) {
+TEST_P(PolicyContract, PolicyIsUnsetUntilItIsSet) {
     DevicePolicyService& policy = services_.policy;
     EXPECT_EQ(policy.effectiveValue(PolicyFeature::AppInstallationAllowed), PolicyAnswer::Unset);
     device_->setPolicy(PolicyFeature::AppInstallationAllowed, PolicyAnswer::No);
@@ -122,11 +120,11 @@ TEST_P(DeviceServicesContract, PolicyIsUnsetUntilItIsSet) {
     EXPECT_EQ(policy.effectiveValue(PolicyFeature::AppRemovalAllowed), PolicyAnswer::Yes);
 }
 
-TEST_P(DeviceServicesContract, CoordinationIsOffAtFirst) {
-    EXPECT_FALSE(services_.coordination.isCoordinationEnabled());
-}
+class BackupContract : public DeviceContract {};
 
-TEST_P(DeviceServicesContract, RestoreDataIsThereUntilTheRestoreIsGivenUp) {
+APPSYNC_CONTRACT_SUITE(BackupContract, devicePorts({OptionalService::Backup}));
+
+TEST_P(BackupContract, RestoreDataIsThereUntilTheRestoreIsGivenUp) {
     const auto manager = services_.backup.makeManager();
     EXPECT_FALSE(manager->restoreDataExists(kA));
     manager->cancelApplicationRestore(kA);
@@ -137,7 +135,11 @@ TEST_P(DeviceServicesContract, RestoreDataIsThereUntilTheRestoreIsGivenUp) {
     EXPECT_FALSE(manager->restoreDataExists(kA));
 }
 
-TEST_P(DeviceServicesContract, WhatAPersonRemovesIsOnTheListUntilItIsCleared) {
+class InstallerContract : public DeviceContract {};
+
+APPSYNC_CONTRACT_SUITE(InstallerContract, devicePorts({OptionalService::UninstalledList}));
+
+TEST_P(InstallerContract, WhatAPersonRemovesIsOnTheListUntilItIsCleared) {
     InstallerService& installer = services_.installer;
     EXPECT_TRUE(installer.lookupUninstalled()->isMap());
     EXPECT_TRUE(installer.lookupUninstalled()->empty());
@@ -153,13 +155,17 @@ TEST_P(DeviceServicesContract, WhatAPersonRemovesIsOnTheListUntilItIsCleared) {
     EXPECT_NE(installer.lookupUninstalled()->find(kB), nullptr);
 }
 
-TEST_P(DeviceServicesContract, WhatTheRegistryUninstallsIsNotOnTheList) {
+TEST_P(InstallerContract, WhatTheRegistryUninstallsIsNotOnTheList) {
     ASSERT_TRUE(installPackage({kA}));
     ASSERT_TRUE(registry_.uninstallApplication(kA, {}));
     EXPECT_TRUE(services_.installer.lookupUninstalled()->empty());
 }
 
-TEST_P(DeviceServicesContract, TheTransactionLogKeepsTheOrder) {
+class TransactionLogContract : public DeviceContract {};
+
+APPSYNC_CONTRACT_SUITE(TransactionLogContract, devicePorts({OptionalService::TransactionLog}));
+
+TEST_P(TransactionLogContract, TheTransactionLogKeepsTheOrder) {
     InstallTransactionLog& log = services_.transactions;
     log.initialize(*services_.log.makeHandle("com.example", "first"));
     log.initialize(*services_.log.makeHandle("com.example", "second"));
@@ -173,8 +179,7 @@ TEST_P(DeviceServicesContract, TheTransactionLogKeepsTheOrder) {
 
 class IconRendererContract : public DeviceContract {};
 
-INSTANTIATE_TEST_SUITE_P(, IconRendererContract, testing::ValuesIn(deviceImplementations()),
-                         nameOfDevice);
+APPSYNC_CONTRACT_SUITE(IconRendererContract, devicePorts({OptionalService::Icons}));
 
 TEST_P(IconRendererContract, OnlyKnownImageTypesAreEncoded) {
     Bytes buffer;
@@ -191,4 +196,7 @@ TEST_P(IconRendererContract, NothingAddedIsNothingWritten) {
 }
 
 }  // namespace
+
+void linkDeviceServicesContract() {}
+
 }  // namespace appsync

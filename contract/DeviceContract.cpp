@@ -1,11 +1,13 @@
-#include "tests/contract/DeviceUnderTest.h"
+#include "contract/DeviceContract.h"
 
 #include <algorithm>
 
 namespace appsync {
 
 DeviceContract::DeviceContract()
-    : device_(GetParam().make()), services_(device_->services()), registry_(services_.registry) {}
+    : device_(GetParam().makeDevice()),
+      services_(device_->services()),
+      registry_(services_.registry) {}
 
 PropertyList packageOptions(const std::string& identifier) {
     return PropertyList::map(

@@ -2,13 +2,13 @@
 
 #include <gtest/gtest.h>
 
-#include <functional>
 #include <memory>
 #include <optional>
-#include <ostream>
 #include <string>
 #include <vector>
 
+#include "contract/ContractPorts.h"
+#include "contract/DeviceUnderTest.h"
 #include "platform/AppRegistry.h"
 #include "platform/BackupService.h"
 #include "platform/DevicePolicyService.h"
@@ -25,61 +25,8 @@
 
 namespace appsync {
 
-/// What a package or placeholder bundle says of itself.
-struct BundleInfo {
-    std::string identifier;
-    std::string version = "1.0";
-    std::string displayName = "Example";
-};
-
-/// One implementation of a device's services, and what the contract tests need to do beside them.
-/// Made anew for each test: an empty device.
-///
-/// Whoever ports the plug-in writes one of these and adds it to `deviceImplementations()`.
-class DeviceUnderTest {
-  public:
-    virtual ~DeviceUnderTest() = default;
-
-    /// Lives as long as this object.
-    virtual Platform services() = 0;
-
-    /// Puts a package that can be installed on the device. Gives its device path.
-    virtual std::string addPackage(const BundleInfo& info) = 0;
-
-    // What a person or a manager does on the device.
-    /// Starts an application that is installed. False when something keeps it from running.
-    virtual bool run(const std::string& identifier) = 0;
-    virtual void quit(const std::string& identifier) = 0;
-    virtual void uninstallAsPerson(const std::string& identifier) = 0;
-    virtual void setPolicy(PolicyFeature feature, PolicyAnswer answer) = 0;
-    virtual void addRestoreData(const std::string& identifier) = 0;
-
-    /// The transaction log's scenarios: "scenario|identifier|yes|description", oldest first.
-    virtual std::vector<std::string> scenarios() = 0;
-};
-
-struct DeviceImplementation {
-    std::string name;
-    std::function<std::unique_ptr<DeviceUnderTest>()> make;
-};
-
-inline std::ostream& operator<<(std::ostream& out, const DeviceImplementation& implementation) {
-    return out << implementation.name;
-}
-
-/// Every implementation that the contract tests run over.
-std::vector<DeviceImplementation> deviceImplementations();
-
-/// Those of them that can coordinate installs.
-std::vector<DeviceImplementation> coordinatingDeviceImplementations();
-
-/// The name of a parameterised test: that of the implementation.
-inline std::string nameOfDevice(const testing::TestParamInfo<DeviceImplementation>& info) {
-    return info.param.name;
-}
-
 /// A test of the contract of one of a device's services.
-class DeviceContract : public testing::TestWithParam<DeviceImplementation> {
+class DeviceContract : public testing::TestWithParam<ContractPort> {
   protected:
     DeviceContract();
 

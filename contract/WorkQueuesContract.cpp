@@ -8,7 +8,7 @@
 #include <string>
 #include <vector>
 
-#include "tests/contract/SystemUnderTest.h"
+#include "contract/SystemContract.h"
 
 namespace appsync {
 namespace {
@@ -30,8 +30,7 @@ class WorkQueuesContract : public SystemContract {
     std::vector<std::string> notes_;  // protected by lock_
 };
 
-INSTANTIATE_TEST_SUITE_P(, WorkQueuesContract, testing::ValuesIn(systemImplementations()),
-                         nameOfSystem);
+APPSYNC_CONTRACT_SUITE(WorkQueuesContract, systemPorts());
 
 TEST_P(WorkQueuesContract, ASerialQueueRunsATaskBeforeSyncReturns) {
     const auto queue = queues_.makeSerialQueue("queue");
@@ -292,4 +291,7 @@ TEST_P(WorkQueuesContract, WorkWithoutDelayRunsToo) {
 }
 
 }  // namespace
+
+void linkWorkQueuesContract() {}
+
 }  // namespace appsync

@@ -10,7 +10,7 @@
 #include "simulation/SimulatedPlatform.h"
 #include "system/JsonLogFacility.h"
 #include "system/property_list/PropertyListCodec.h"
-#include "tests/contract/DeviceUnderTest.h"
+#include "tests/contract/OurPorts.h"
 #include "tests/contract/TemporaryMachineDirectory.h"
 
 namespace appsync {
@@ -53,6 +53,7 @@ class SimulatedDevice : public DeviceUnderTest {
     void addRestoreData(const std::string& identifier) override {
         platform_.backup.addRestoreData(identifier);
     }
+    void turnCoordinationOn() override { platform_.coordination.setEnabled(true); }
     std::vector<std::string> scenarios() override { return platform_.transactions.scenarios(); }
 
   private:
@@ -72,9 +73,7 @@ class ReferenceDevice : public DeviceUnderTest {
   public:
     ReferenceDevice() : log_(LogFile::open(directory_.path() + "/log").value()) {
         require(Device::create(devicePath()));
-        auto opened = Device::open(devicePath(), {.access = DeviceAccess::Session});
-        if (!opened) throw std::runtime_error(opened.error().description());
-        device_ = *std::move(opened);
+        open();
     }
 
     Platform services() override { return device_->platform(host_, log_); }
@@ -107,6 +106,16 @@ class ReferenceDevice : public DeviceUnderTest {
     void addRestoreData(const std::string& identifier) override {
         require(device_->setRestoreDataExpected(identifier, true));
     }
+    void turnCoordinationOn() override {
+        DeviceSettingsChange change;
+        change.coordination = true;
+        require(device_->change(change));
+    }
+    bool reopen() override {
+        device_.reset();
+        open();
+        return true;
+    }
     std::vector<std::string> scenarios() override {
         const auto history = device_->history();
         if (!history) throw std::runtime_error(history.error().description());
@@ -120,6 +129,11 @@ class ReferenceDevice : public DeviceUnderTest {
     }
 
   private:
+    void open() {
+        auto opened = Device::open(devicePath(), {.access = DeviceAccess::Session});
+        if (!opened) throw std::runtime_error(opened.error().description());
+        device_ = *std::move(opened);
+    }
     static void require(const Status& status) {
         if (!status) throw std::runtime_error(status.error().description());
     }
@@ -132,26 +146,24 @@ class ReferenceDevice : public DeviceUnderTest {
     std::unique_ptr<Device> device_;
 };
 
-DeviceImplementation simulated(const std::string& name, Scheduling scheduling) {
-    return {name, [scheduling] { return std::make_unique<SimulatedDevice>(scheduling); }};
-}
-
 }  // namespace
 
-std::vector<DeviceImplementation> deviceImplementations() {
+std::unique_ptr<DeviceUnderTest> makeSimulatedDevice(Scheduling scheduling) {
+    return std::make_unique<SimulatedDevice>(scheduling);
+}
+
+ContractPort simulatedPort(const std::string& name, Scheduling scheduling) {
+    return {name,
+            [scheduling] { return makeSimulatedSystem(scheduling); },
+            [scheduling] { return makeSimulatedDevice(scheduling); },
+            {}};
+}
+
+ContractPort referencePort() {
     // Without a zone the C library frees and copies its default's name with each archive that is
     // opened, under a lock that ThreadSanitizer does not see.
     ::setenv("TZ", "UTC", 0);
-    return {simulated("Simulation", Scheduling::runToCompletion()),
-            simulated("SimulationInterleaved", Scheduling::seeded(1)),
-            {"Reference", [] { return std::make_unique<ReferenceDevice>(); }}};
-}
-
-std::vector<DeviceImplementation> coordinatingDeviceImplementations() {
-    return {simulated("Simulation", Scheduling::runToCompletion()),
-            simulated("SimulationInterleaved", Scheduling::seeded(1)),
-            simulated("SimulationInterleavedOtherwise", Scheduling::seeded(2)),
-            {"Reference", [] { return std::make_unique<ReferenceDevice>(); }}};
+    return {"Reference", nullptr, [] { return std::make_unique<ReferenceDevice>(); }, {}};
 }
 
 }  // namespace appsync

@@ -8,11 +8,11 @@
 #include <utility>
 #include <vector>
 
+#include "contract/DeviceContract.h"
 #include "platform/InstallCoordinator.h"
 #include "platform/InstallPlaceholder.h"
 #include "platform/InstallPromises.h"
 #include "platform/LogRendering.h"
-#include "tests/contract/DeviceUnderTest.h"
 
 namespace appsync {
 namespace {
@@ -154,8 +154,7 @@ class CoordinationContract : public DeviceContract {
         std::make_shared<HearingObserver>(services_.queues);
 };
 
-INSTANTIATE_TEST_SUITE_P(, CoordinationContract,
-                         testing::ValuesIn(coordinatingDeviceImplementations()), nameOfDevice);
+APPSYNC_CONTRACT_SUITE(CoordinationContract, devicePorts({OptionalService::Coordination}));
 
 TEST_P(CoordinationContract, NothingIsThereUntilItIsCreated) {
     const auto result = existing(Kind::Initiating, kA);
@@ -589,4 +588,7 @@ TEST_P(CoordinationContract, APersonsErrorHoldsTheUnderlyingOne) {
 }
 
 }  // namespace
+
+void linkCoordinationContract() {}
+
 }  // namespace appsync
