@@ -28,6 +28,7 @@ constexpr std::string_view kCreate = "create";
 constexpr std::string_view kCopy = "copy";
 constexpr std::string_view kCopyTo = "copy something to";
 constexpr std::string_view kExamine = "examine";
+constexpr std::string_view kList = "list";
 constexpr std::string_view kMove = "move";
 constexpr std::string_view kMoveTo = "move something to";
 constexpr std::string_view kRead = "read";
@@ -83,6 +84,10 @@ bool leavesDirectory(std::string_view path, std::string_view directory) {
         path.remove_prefix(std::min(end + 1, path.size()));
     }
     return depth < 0;
+}
+
+std::string below(const std::string& directory, const std::string& name) {
+    return directory.ends_with('/') ? directory + name : directory + "/" + name;
 }
 
 /// Gives an errno value, or 0. No system call is made that would change nothing: an ordinary
@@ -292,6 +297,54 @@ Status RootedFileSystem::copyItem(const std::string& from, const std::string& to
     const int error = target->mustBeDirectory ? EISDIR : copyInto(*source, *target);
     if (error != 0) return posixErrorBetween(error, kCopy, from, to);
     return {};
+}
+
+Result<std::vector<std::string>> RootedFileSystem::names(const std::string& directory) const {
+    const Result<UniqueFd> opened = root_.openDirectory(directory, kList);
+    if (!opened) return opened.error();
+    Result<std::vector<std::string>> found = namesIn(opened->get(), directory);
+    if (found) std::sort(found->begin(), found->end());
+    return found;
+}
+
+Status RootedFileSystem::copyDirectory(const std::string& from, const std::string& to) {
+    if (below(to, "").starts_with(below(from, ""))) {
+        return posixError(EINVAL, kCopy, from, "a directory cannot be copied into itself");
+    }
+    if (Result<UniqueFd> source = root_.openDirectory(from, kCopy); !source) return source.error();
+    if (Status made = createDirectory(to, false, nullptr); !made) return made;
+    Status copied = copyContents(from, to);
+    if (!copied) removeItem(to).ignore();
+    return copied;
+}
+
+Status RootedFileSystem::copyContents(const std::string& from, const std::string& to) {
+    std::vector<std::pair<std::string, std::string>> directories{{from, to}};
+    while (!directories.empty()) {
+        const auto [source, target] = std::move(directories.back());
+        directories.pop_back();
+        const Result<std::vector<std::string>> found = names(source);
+        if (!found) return found.error();
+        for (const std::string& name : *found) {
+            Status copied = copyEntry(below(source, name), below(target, name), directories);
+            if (!copied) return copied;
+        }
+    }
+    return {};
+}
+
+Status RootedFileSystem::copyEntry(const std::string& from, const std::string& to,
+                                   std::vector<std::pair<std::string, std::string>>& directories) {
+    const Result<UniqueFd> item = root_.openFile(from, O_PATH | O_NOFOLLOW, 0, kCopy);
+    if (!item) return item.error();
+    struct stat status {};
+    if (::fstat(item->get(), &status) != 0) return posixError(errno, kCopy, from);
+    if (S_ISREG(status.st_mode)) return copyItem(from, to);
+    if (!S_ISDIR(status.st_mode)) {
+        return posixError(EINVAL, kCopy, from, "it is neither a regular file nor a directory");
+    }
+    directories.emplace_back(from, to);
+    return createDirectory(to, false, nullptr);
 }
 
 Result<Bytes> RootedFileSystem::readFile(const std::string& path) {

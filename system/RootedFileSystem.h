@@ -20,6 +20,8 @@
 #include <memory>
 #include <string>
 #include <string_view>
+#include <utility>
+#include <vector>
 
 #include <sys/types.h>
 
@@ -82,6 +84,19 @@ class RootedFileSystem : public FileSystem {
     Status setTimesToNow(const std::string& path) override;
     [[nodiscard]] std::string temporaryDirectory() override;
 
+    // Beyond the interface: for the registry of a device, which copies and sweeps whole
+    // directories.
+
+    /// The names in a directory, sorted, without "." and "..".
+    [[nodiscard]] Result<std::vector<std::string>> names(const std::string& directory) const;
+
+    /// Copies a directory with everything in it, such as a placeholder bundle, at whatever depth a
+    /// path may have. EEXIST when something stands at `to`, whose parent must exist. What is
+    /// neither a regular file nor a directory is refused: EINVAL, for links too, and for a copy
+    /// into itself. After a failure nothing stands at `to`; a crash may leave a part. Nothing is
+    /// synced.
+    Status copyDirectory(const std::string& from, const std::string& to);
+
     /// Puts what stands at `from` in the place of `to`, in one step. What stood there stands at
     /// `from` afterwards; where nothing did, this is `moveItem`. An error on a file system that
     /// cannot do it in one step.
@@ -99,6 +114,10 @@ class RootedFileSystem : public FileSystem {
 
   private:
     RootedFileSystem(RootDirectory root, RootedFileSystemOptions options);
+
+    Status copyContents(const std::string& from, const std::string& to);
+    Status copyEntry(const std::string& from, const std::string& to,
+                     std::vector<std::pair<std::string, std::string>>& directories);
 
     /// Refuses a path to something in the temporary directory that lies elsewhere.
     [[nodiscard]] Status checkStays(const std::string& path, std::string_view operation) const;
