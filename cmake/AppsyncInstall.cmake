@@ -3,7 +3,7 @@
 #     bin/appsync                     lib/appsync/appsync-plugin.so
 #     include/appsync/                the headers of platform/, client/ (in part), system/, simulation/ and contract/
 #     lib/libappsync_*.a              with lib/cmake/appsync/ and lib/pkgconfig/
-#     share/doc/appsync/              share/man/man1/, and completions where bash, zsh and fish look for them
+#     share/doc/appsync/              share/man/, and completions where bash, zsh and fish look for them
 #
 # Nothing of it names the prefix, so an installed tree may be moved.
 
@@ -58,7 +58,7 @@ if(APPSYNC_COMMAND)
     install(TARGETS appsync RUNTIME DESTINATION "${CMAKE_INSTALL_BINDIR}" COMPONENT command)
     # Not there where only some of the targets were built.
     set(shell "${PROJECT_BINARY_DIR}/shell")
-    install(DIRECTORY "${shell}/man1/" DESTINATION "${CMAKE_INSTALL_MANDIR}/man1" COMPONENT command OPTIONAL)
+    install(DIRECTORY "${shell}/man1" "${shell}/man5" DESTINATION "${CMAKE_INSTALL_MANDIR}" COMPONENT command OPTIONAL)
     install(FILES "${shell}/appsync" DESTINATION "${CMAKE_INSTALL_DATADIR}/bash-completion/completions"
             COMPONENT command OPTIONAL)
     install(FILES "${shell}/_appsync" COMPONENT command OPTIONAL

@@ -53,7 +53,7 @@ foreach(pair command:appsync dev:libappsync-dev doc:libappsync-doc)
     install(FILES "${changelog}.gz" DESTINATION "share/doc/${package}" COMPONENT ${component})
 endforeach()
 install(CODE [[
-    file(GLOB pages "$ENV{DESTDIR}${CMAKE_INSTALL_PREFIX}/share/man/man1/*.1")
+    file(GLOB pages "$ENV{DESTDIR}${CMAKE_INSTALL_PREFIX}/share/man/man?/*.?")
     execute_process(COMMAND gzip -9nf ${pages} COMMAND_ERROR_IS_FATAL ANY)
 ]] COMPONENT command)
 

@@ -1,8 +1,12 @@
 """Completion in the real shells, and the pages of the manual in the real reader."""
 
+import json
 import os
+import pathlib
+import plistlib
 import re
 import shutil
+import sqlite3
 import subprocess
 
 import pytest
@@ -121,16 +125,70 @@ def test_directories_with_blanks_are_offered_whole(place, complete):
     assert {each.rstrip("/").replace("\\", "") for each in complete(place, "apps", "my")} == {"my phone"}
 
 
-def test_every_page_of_the_manual_is_read_without_a_warning(appsync, tmp_path):
+def read_page(page):
+    """What the reader shows of it, without a warning."""
     needs("man")
+    shown = subprocess.run(["man", "--warnings", "-l", "-Tutf8", page], capture_output=True, text=True,
+                           env={**os.environ, "MANWIDTH": "80"})
+    assert shown.returncode == 0 and shown.stderr == "", page
+    text = re.sub(".\b", "", shown.stdout)  # printed over itself, letters are bold
+    assert [line for line in text.splitlines() if len(line) > 80] == []
+    return text
+
+
+def test_every_page_of_the_manual_is_read_without_a_warning(appsync, tmp_path):
     pages = appsync.json("manual", tmp_path / "man")["pages"]
     assert "appsync.1" in pages and "appsync-package-make.1" in pages
     for page in pages:
-        shown = subprocess.run(["man", "--warnings", "-l", "-Tutf8", tmp_path / "man" / page],
-                               capture_output=True, text=True, env={**os.environ, "MANWIDTH": "80"})
-        assert shown.returncode == 0 and shown.stderr == "", page
-        text = re.sub(".\b", "", shown.stdout)  # printed over itself, letters are bold
+        text = read_page(tmp_path / "man" / page)
         assert "SYNOPSIS" in text and "--help" in text
+
+
+@pytest.fixture
+def format_pages(tmp_path):
+    """The pages of formats, by name, as the build makes them of their document."""
+    tree = pathlib.Path(__file__).resolve().parent.parent.parent
+    subprocess.run([tree / "cmake" / "format_pages.py", tree / "docs" / "device-format.md", tmp_path / "man5", "1.2.3"],
+                   check=True)
+    return {path.stem: read_page(path) for path in (tmp_path / "man5").glob("*.5")}
+
+
+def entries_of(page):
+    """What the page has an entry for; of a path its last name."""
+    return {line.split()[0].rstrip("/").rpartition("/")[2] for line in re.findall(r"^ {7}(\S.*)", page, re.MULTILINE)}
+
+
+def test_the_page_of_a_device_names_what_stands_in_one(appsync, place, format_pages):
+    device = place / "my phone"
+    database = sqlite3.connect(device / "device.db")
+    tables = {name for name, in database.execute("SELECT name FROM sqlite_master WHERE type = 'table'")}
+    database.close()
+    files = {path.name for path in [*device.iterdir(), *(device / "log").iterdir()]} - {"log"}
+    assert "applications" in tables and "system.log" in files
+    assert (tables | files) - entries_of(format_pages["appsync-device"]) - {"sqlite_sequence"} == set()
+
+
+def test_the_page_of_a_backup_names_what_stands_in_one(appsync, place, format_pages):
+    backup = place / "backup"
+    data = place / "my phone" / "root" / "var/mobile/Containers/Data" / A
+    data.mkdir(parents=True)
+    (data / "note").write_text("x")
+    appsync("backup", place / "my phone", backup)
+    names = {path.name.replace(A, "<identifier>") for path in backup.rglob("*") if path.is_file()}
+    keys = {key for map in (json.loads((backup / "manifest.json").read_text()),
+                            plistlib.loads((backup / "DemotedApps.plist").read_bytes())) for key in map}
+    assert {"<identifier>.zip", "manifest.json"} <= names and "AutomaticDowngrades" in keys
+    page = format_pages["appsync-backup"]
+    assert names - entries_of(page) == set()
+    assert {key for key in keys if '"%s"' % key not in page} == set()
+
+
+def test_pages_of_formats_show_their_document_as_it_stands(format_pages):
+    assert "appsync-device - a device directory" in format_pages["appsync-device"]
+    assert "appsync-backup - a backup" in format_pages["appsync-backup"]
+    for text in format_pages.values():
+        assert "1.2.3" in text and "SEE ALSO" in text
+        assert not re.search(r"`|\*\*|\\\\|^ *\||\]\(", text, re.MULTILINE)
 
 
 def test_the_manual_tells_what_the_help_tells(appsync, tmp_path):

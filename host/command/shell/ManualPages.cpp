@@ -2,6 +2,7 @@
 
 #include <algorithm>
 #include <cctype>
+#include <utility>
 
 namespace appsync {
 namespace {
@@ -79,12 +80,26 @@ std::string commandList(const std::string& typed, const CommandEntry& command) {
     return text.empty() ? text : ".SH COMMANDS\n" + text;
 }
 
+bool takes(const CommandEntry& command, const std::string& argument) {
+    return std::any_of(
+        command.options.begin(), command.options.end(),
+        [&argument](const OptionEntry& each) { return each.isPlaced && each.name == argument; });
+}
+
+// What is installed besides of a device's directory and of a backup (cmake/format_pages.py).
 std::string references(const std::string& page, const CommandEntry& command, bool isProgram) {
-    std::string text;
-    if (!isProgram) text = "\\fBappsync\\fR(1)";
+    std::vector<std::string> pages;
+    if (!isProgram) pages.push_back(bold("appsync") + "(1)");
     for (const CommandEntry& each : command.commands) {
-        text += (text.empty() ? "" : ",\n") + bold(page + "-" + each.name) + "(1)";
+        pages.push_back(bold(page + "-" + each.name) + "(1)");
     }
+    for (const auto& [argument, format] : {std::pair{"DEVICE", "device"}, {"BACKUP", "backup"}}) {
+        if (isProgram || takes(command, argument)) {
+            pages.push_back(bold(std::string("appsync-") + format) + "(5)");
+        }
+    }
+    std::string text;
+    for (const std::string& each : pages) text += (text.empty() ? "" : ",\n") + each;
     return text.empty() ? text : ".SH SEE ALSO\n" + text + "\n";
 }
 

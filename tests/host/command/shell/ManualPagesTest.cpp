@@ -38,6 +38,17 @@ TEST_F(Manual, HasAPageForEachCommand) {
     }
 }
 
+TEST_F(Manual, LeadsToThePagesOfWhatACommandTakes) {
+    const std::string ofDevice = "\\fBappsync\\-device\\fR(5)";
+    const std::string ofBackup = "\\fBappsync\\-backup\\fR(5)";
+    ASSERT_EQ(run({"manual", directory.path() + "/man"}), 0) << err.str();
+    EXPECT_THAT(page("appsync.1"), AllOf(HasSubstr(ofDevice), HasSubstr(ofBackup)));
+    EXPECT_THAT(page("appsync-restore.1"), AllOf(HasSubstr(ofDevice), HasSubstr(ofBackup)));
+    EXPECT_THAT(page("appsync-apps.1"), AllOf(HasSubstr(ofDevice), Not(HasSubstr(ofBackup))));
+    EXPECT_THAT(page("appsync-plist-show.1"),
+                AllOf(HasSubstr(".SH SEE ALSO\n\\fBappsync\\fR(1)\n"), Not(HasSubstr(ofDevice))));
+}
+
 TEST_F(Manual, PrintsWhatIsATroffRequestAsItIs) {
     const CommandEntry program{"p", ".so \\n", {{"F", "'x\n.y", "", true, true, true}}, {}};
     const std::vector<ManualPage> pages = manualPages(program, ".end", "1");
