@@ -155,7 +155,8 @@ def format_pages(tmp_path):
 
 def entries_of(page):
     """What the page has an entry for; of a path its last name."""
-    return {line.split()[0].rstrip("/").rpartition("/")[2] for line in re.findall(r"^ {7}(\S.*)", page, re.MULTILINE)}
+    names = re.findall(r"^ {7}(\S+)(?=\n {14}\S| {2,}\S)", page, re.MULTILINE)
+    return {name.rstrip("/").rpartition("/")[2] for name in names}
 
 
 def test_the_page_of_a_device_names_what_stands_in_one(appsync, place, format_pages):
