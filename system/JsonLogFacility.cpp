@@ -1,5 +1,6 @@
 #include "system/JsonLogFacility.h"
 
+#include <algorithm>
 #include <array>
 #include <cerrno>
 #include <cstdio>
@@ -76,9 +77,20 @@ void appendEscaped(std::string& json, char c) {
     }
 }
 
+/// How many characters at the beginning stand in JSON as they are, one byte each.
+std::size_t plainLength(std::string_view text) {
+    const auto isPlain = [](char c) { return c >= ' ' && c < '\x7F' && c != '"' && c != '\\'; };
+    return static_cast<std::size_t>(std::find_if_not(text.begin(), text.end(), isPlain) -
+                                    text.begin());
+}
+
 void appendString(std::string& json, std::string_view text) {
     json += '"';
-    while (!text.empty()) {
+    while (true) {
+        const std::size_t plain = plainLength(text);
+        json += text.substr(0, plain);
+        text.remove_prefix(plain);
+        if (text.empty()) break;
         const std::size_t length = characterLength(text);
         if (length == 0) {
             json += kReplacement;
