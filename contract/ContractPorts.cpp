@@ -12,10 +12,17 @@ std::vector<ContractPort>& allPorts() {
     return ports;
 }
 
-template <typename Predicate>
-std::vector<ContractPort> portsThat(Predicate can) {
+template <typename Made>
+std::vector<ContractPort> portsThatMake(std::function<Made()> ContractPort::*made,
+                                        const std::vector<OptionalService>& services) {
     std::vector<ContractPort> found;
-    std::copy_if(allPorts().begin(), allPorts().end(), std::back_inserter(found), can);
+    std::copy_if(allPorts().begin(), allPorts().end(), std::back_inserter(found),
+                 [&](const ContractPort& port) {
+                     return port.*made && std::none_of(services.begin(), services.end(),
+                                                       [&](OptionalService service) {
+                                                           return port.absent.contains(service);
+                                                       });
+                 });
     return found;
 }
 
@@ -23,16 +30,12 @@ std::vector<ContractPort> portsThat(Predicate can) {
 
 void setContractPorts(std::vector<ContractPort> ports) { allPorts() = std::move(ports); }
 
-std::vector<ContractPort> systemPorts() {
-    return portsThat([](const ContractPort& port) { return port.makeSystem != nullptr; });
+std::vector<ContractPort> systemPorts(const std::vector<OptionalService>& services) {
+    return portsThatMake(&ContractPort::makeSystem, services);
 }
 
 std::vector<ContractPort> devicePorts(const std::vector<OptionalService>& services) {
-    return portsThat([&](const ContractPort& port) {
-        return port.makeDevice != nullptr &&
-               std::none_of(services.begin(), services.end(),
-                            [&](OptionalService service) { return port.absent.contains(service); });
-    });
+    return portsThatMake(&ContractPort::makeDevice, services);
 }
 
 }  // namespace appsync

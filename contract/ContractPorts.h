@@ -13,10 +13,8 @@ namespace appsync {
 /// The ports that the suites run over. Set before GoogleTest is initialised, which asks for them.
 void setContractPorts(std::vector<ContractPort> ports);
 
-/// Those of them that can make a system.
-std::vector<ContractPort> systemPorts();
-
-/// Those of them that can make a device which has the services.
+/// Those of them that can make a system, or a device, which has the services.
+std::vector<ContractPort> systemPorts(const std::vector<OptionalService>& services = {});
 std::vector<ContractPort> devicePorts(const std::vector<OptionalService>& services = {});
 
 inline std::ostream& operator<<(std::ostream& out, const ContractPort& port) {

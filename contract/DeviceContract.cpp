@@ -9,6 +9,9 @@ DeviceContract::DeviceContract()
       services_(device_->services()),
       registry_(services_.registry) {}
 
+// What closing the device breaks is no sentence that the test has looked at.
+DeviceContract::~DeviceContract() { checks({}, {}); }
+
 PropertyList packageOptions(const std::string& identifier) {
     return PropertyList::map(
         {{PackageTypeKey, PackageTypeCustomer}, {BundleIdentifierKey, identifier}});

@@ -9,6 +9,7 @@
 
 #include "contract/ContractPorts.h"
 #include "contract/DeviceUnderTest.h"
+#include "contract/Sentence.h"
 #include "platform/AppRegistry.h"
 #include "platform/BackupService.h"
 #include "platform/DevicePolicyService.h"
@@ -29,6 +30,7 @@ namespace appsync {
 class DeviceContract : public testing::TestWithParam<ContractPort> {
   protected:
     DeviceContract();
+    ~DeviceContract() override;
 
     Status installPackage(const BundleInfo& info);
     /// Installs what stands at a path as the package of the identifier.

@@ -19,19 +19,11 @@ std::vector<void*> calledWith;
 
 void callback(void* observer) { calledWith.push_back(observer); }
 
-class NotificationsContract : public SystemContract {
-  protected:
-    NotificationsContract() { calledWith.clear(); }
+class NamedNotificationsContract : public SystemContract {};
 
-    void observe(const std::shared_ptr<int>& observer, std::string_view name) {
-        system_->notificationCenter().addObserver(observer, name, callback,
-                                                  NotificationCenter::SuspensionBehavior::Drop);
-    }
-};
+APPSYNC_CONTRACT_SUITE(NamedNotificationsContract, systemPorts({OptionalService::Notifications}));
 
-APPSYNC_CONTRACT_SUITE(NotificationsContract, systemPorts());
-
-TEST_P(NotificationsContract, AStateIsSeenByEverybody) {
+TEST_P(NamedNotificationsContract, AStateIsSeenByEverybody) {
     NamedNotifications& notifications = system_->notifications();
     const auto registration = notifications.registerForState(kName);
     ASSERT_EQ(registration.status, 0U);
@@ -41,7 +33,7 @@ TEST_P(NotificationsContract, AStateIsSeenByEverybody) {
     EXPECT_EQ(system_->notificationState("com.example.other"), 0U);
 }
 
-TEST_P(NotificationsContract, EveryRegistrationOfANameSetsTheSameState) {
+TEST_P(NamedNotificationsContract, EveryRegistrationOfANameSetsTheSameState) {
     NamedNotifications& notifications = system_->notifications();
     const auto first = notifications.registerForState(kName);
     const auto second = notifications.registerForState(kName);
@@ -50,7 +42,7 @@ TEST_P(NotificationsContract, EveryRegistrationOfANameSetsTheSameState) {
     EXPECT_EQ(system_->notificationState(kName), 0U);
 }
 
-TEST_P(NotificationsContract, TokensOfDifferentNamesAreDifferent) {
+TEST_P(NamedNotificationsContract, TokensOfDifferentNamesAreDifferent) {
     NamedNotifications& notifications = system_->notifications();
     const auto one = notifications.registerForState(kName);
     const auto other = notifications.registerForState("com.example.other");
@@ -59,7 +51,20 @@ TEST_P(NotificationsContract, TokensOfDifferentNamesAreDifferent) {
     EXPECT_EQ(system_->notificationState(kName), 5U);
 }
 
-TEST_P(NotificationsContract, AnObserverIsCalledForItsNameOnly) {
+class NotificationCenterContract : public SystemContract {
+  protected:
+    NotificationCenterContract() { calledWith.clear(); }
+
+    void observe(const std::shared_ptr<int>& observer, std::string_view name) {
+        system_->notificationCenter().addObserver(observer, name, callback,
+                                                  NotificationCenter::SuspensionBehavior::Drop);
+    }
+};
+
+APPSYNC_CONTRACT_SUITE(NotificationCenterContract,
+                       systemPorts({OptionalService::NotificationCenter}));
+
+TEST_P(NotificationCenterContract, AnObserverIsCalledForItsNameOnly) {
     const auto observer = std::make_shared<int>(1);
     observe(observer, kName);
     system_->post("com.example.other");
@@ -68,7 +73,7 @@ TEST_P(NotificationsContract, AnObserverIsCalledForItsNameOnly) {
     EXPECT_THAT(calledWith, ElementsAre(observer.get()));
 }
 
-TEST_P(NotificationsContract, EveryObserverOfANameIsCalled) {
+TEST_P(NotificationCenterContract, EveryObserverOfANameIsCalled) {
     const auto first = std::make_shared<int>(1);
     const auto second = std::make_shared<int>(2);
     observe(first, kName);
@@ -77,7 +82,7 @@ TEST_P(NotificationsContract, EveryObserverOfANameIsCalled) {
     EXPECT_THAT(calledWith, testing::UnorderedElementsAre(first.get(), second.get()));
 }
 
-TEST_P(NotificationsContract, ARemovedObserverIsNotCalled) {
+TEST_P(NotificationCenterContract, ARemovedObserverIsNotCalled) {
     const auto observer = std::make_shared<int>(1);
     observe(observer, kName);
     system_->notificationCenter().removeObserver(observer.get(), kName);
@@ -85,7 +90,7 @@ TEST_P(NotificationsContract, ARemovedObserverIsNotCalled) {
     EXPECT_THAT(calledWith, IsEmpty());
 }
 
-TEST_P(NotificationsContract, AnObserverThatHasGoneIsCalledAsNull) {
+TEST_P(NotificationCenterContract, AnObserverThatHasGoneIsCalledAsNull) {
     auto observer = std::make_shared<int>(1);
     observe(observer, kName);
     observer.reset();

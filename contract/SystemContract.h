@@ -5,6 +5,7 @@
 #include <memory>
 
 #include "contract/ContractPorts.h"
+#include "contract/Sentence.h"
 #include "contract/SystemUnderTest.h"
 
 namespace appsync {
@@ -13,6 +14,7 @@ namespace appsync {
 class SystemContract : public testing::TestWithParam<ContractPort> {
   protected:
     SystemContract() : system_(GetParam().makeSystem()) {}
+    ~SystemContract() override { checks({}, {}); }
 
     const std::unique_ptr<SystemUnderTest> system_;
 };

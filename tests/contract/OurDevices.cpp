@@ -159,11 +159,13 @@ ContractPort simulatedPort(const std::string& name, Scheduling scheduling) {
             {}};
 }
 
-ContractPort referencePort() {
+std::unique_ptr<DeviceUnderTest> makeReferenceDevice() {
     // Without a zone the C library frees and copies its default's name with each archive that is
     // opened, under a lock that ThreadSanitizer does not see.
     ::setenv("TZ", "UTC", 0);
-    return {"Reference", nullptr, [] { return std::make_unique<ReferenceDevice>(); }, {}};
+    return std::make_unique<ReferenceDevice>();
 }
+
+ContractPort referencePort() { return {"Reference", nullptr, makeReferenceDevice, {}}; }
 
 }  // namespace appsync

@@ -1,5 +1,6 @@
 #pragma once
 
+#include <memory>
 #include <string>
 
 #include "contract/ContractKit.h"
@@ -16,6 +17,7 @@ namespace appsync {
 
 /// The devices and systems that these are made of.
 [[nodiscard]] std::unique_ptr<DeviceUnderTest> makeSimulatedDevice(Scheduling scheduling);
+[[nodiscard]] std::unique_ptr<DeviceUnderTest> makeReferenceDevice();
 [[nodiscard]] std::unique_ptr<SystemUnderTest> makeSimulatedSystem(Scheduling scheduling);
 
 }  // namespace appsync
