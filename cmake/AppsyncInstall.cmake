@@ -67,4 +67,7 @@ if(APPSYNC_COMMAND)
             COMPONENT command OPTIONAL)
 endif()
 install(DIRECTORY "${PROJECT_SOURCE_DIR}/docs/" DESTINATION "${CMAKE_INSTALL_DOCDIR}/docs" COMPONENT doc)
+# What scripts/docs has put there; scripts/package has it do so.
+install(DIRECTORY "${PROJECT_BINARY_DIR}/reference/" DESTINATION "${CMAKE_INSTALL_DOCDIR}/reference" COMPONENT doc
+        OPTIONAL)
 install(FILES README.md CHANGELOG.md LICENSE DESTINATION "${CMAKE_INSTALL_DOCDIR}" COMPONENT doc)

@@ -13,6 +13,7 @@ inline constexpr std::string_view kStartupCompleteNotification =
 /// System-wide named notifications that carry a 64-bit state. Callable on any thread.
 class NamedNotifications {
   public:
+    /// What comes of a registration.
     struct Registration {
         /// 0 when the registration succeeded.
         std::uint32_t status = 0;

@@ -184,6 +184,7 @@ class PropertyList {
     Storage value_;
 };
 
+/// A key of a map, and its value.
 struct PropertyList::Entry {
     std::string key;
     PropertyList value;

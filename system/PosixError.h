@@ -10,7 +10,7 @@ namespace appsync {
 /// The operating system's sentence for an errno value. Any thread.
 [[nodiscard]] std::string posixReason(int code);
 
-/// A path as it stands in a message: control characters are written as \xNN, and the middle of a
+/// A path as it stands in a message: control characters are written as `\xNN`, and the middle of a
 /// very long path is left out, so that a message stays one readable line. An empty one is '', which
 /// can be seen.
 [[nodiscard]] std::string displayPath(std::string_view path);

@@ -10,8 +10,8 @@
 
 namespace appsync {
 
-/// Whether the name is one that `TemporaryFile` gives: ".<name>.appsync-XXXXXX", where each X is a
-/// small letter or a digit and a long <name> is cut short.
+/// Whether the name is one that `TemporaryFile` gives to what is to become NAME: a dot, NAME, and
+/// ".appsync-XXXXXX", where each X is a small letter or a digit; a long NAME is cut short.
 [[nodiscard]] bool isTemporaryName(std::string_view name);
 
 /// Removes the temporary file `name` of the open directory unless a living process is writing it.

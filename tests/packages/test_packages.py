@@ -60,7 +60,7 @@ def test_the_command_and_its_module_run_from_there(prefix, tmp_path):
 def test_what_shells_and_man_look_for_is_where_they_look(prefix):
     for name in ("bash-completion/completions/appsync", "zsh/vendor-completions/_appsync",
                  "fish/vendor_completions.d/appsync.fish", "man/man1/appsync.1.gz", "man/man5/appsync-device.5.gz",
-                 "man/man5/appsync-backup.5.gz", "doc/appsync/docs/module.md"):
+                 "man/man5/appsync-backup.5.gz", "doc/appsync/docs/module.md", "doc/appsync/reference/index.html"):
         assert (prefix / "share" / name).is_file(), name
 
 
