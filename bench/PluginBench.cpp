@@ -3,7 +3,8 @@
 // bytes. Files are written to the working directory: it should be on a disk.
 //
 // Names: planning/N, coordinating/N, restoring/N, restoringCoordinated/N (one call with N
-// applications), todoListEdit/N, todoListPlainRewrite/N (a list of N entries).
+// applications), beforePlanning/N, beforeCoordinating/N (all but that call, for who counts what it
+// adds), todoListEdit/N, todoListPlainRewrite/N (a list of N entries).
 
 #include <benchmark/benchmark.h>
 #include <fcntl.h>
@@ -73,6 +74,25 @@ void plan(benchmark::State& state, bool coordination) {
     }
     state.SetItemsProcessed(state.iterations() * count);
 }
+
+/// All that `plan` does besides.
+void doNotPlan(benchmark::State& state, bool coordination) {
+    const int count = static_cast<int>(state.range(0));
+    for (auto _ : state) {
+        SystemPropertyLists codec;
+        SimulatedPlatform platform(codec);
+        platform.recorder.setEnabled(false);
+        platform.coordination.setEnabled(coordination);
+        stage(platform, count);
+        const auto client = AppsClient::create(platform.services());
+    }
+}
+
+void beforePlanning(benchmark::State& state) { doNotPlan(state, false); }
+BENCHMARK(beforePlanning)->Arg(1000)->Arg(10000)->Unit(benchmark::kMillisecond);
+
+void beforeCoordinating(benchmark::State& state) { doNotPlan(state, true); }
+BENCHMARK(beforeCoordinating)->Arg(1000)->Arg(10000)->Unit(benchmark::kMillisecond);
 
 void planning(benchmark::State& state) { plan(state, false); }
 BENCHMARK(planning)->Arg(1000)->Arg(10000)->Unit(benchmark::kMillisecond);
