@@ -1,5 +1,6 @@
 #include "host/console/Console.h"
 
+#include <poll.h>
 #include <sys/ioctl.h>
 #include <unistd.h>
 
@@ -31,6 +32,11 @@ std::size_t terminalHeight() {
     winsize size{};
     if (::ioctl(STDOUT_FILENO, TIOCGWINSZ, &size) != 0 || size.ws_row == 0) return 24;
     return size.ws_row;
+}
+
+bool terminalHasRoom() {
+    pollfd terminal{STDOUT_FILENO, POLLOUT, 0};
+    return ::poll(&terminal, 1, 0) > 0;
 }
 
 // Of the locale's names, the first that is given counts.
@@ -65,9 +71,15 @@ int Console::fail(const ErrorRecord& error) const {
 
 Console processConsole() {
     std::cerr.tie(nullptr);  // a complaint must not wait for an output that nobody reads
-    return {std::cout,        std::cerr,    canRedraw(),
-            terminalWidth(),  {},           hasUtf8() ? "\u2026" : "...",
-            terminalHeight(), terminalWidth};
+    return {std::cout,
+            std::cerr,
+            canRedraw(),
+            terminalWidth(),
+            {},
+            hasUtf8() ? "\u2026" : "...",
+            terminalHeight(),
+            terminalWidth,
+            terminalHasRoom};
 }
 
 }  // namespace appsync

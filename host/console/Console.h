@@ -32,9 +32,15 @@ struct Console {
     /// Its width as it is now; null where that does not change.
     std::size_t (*measure)() = nullptr;
 
+    /// Whether it takes more now without a wait; null where it always does.
+    bool (*hasRoom)() = nullptr;
+
     [[nodiscard]] std::size_t currentWidth() const {
         return measure != nullptr ? measure() : width;
     }
+    /// Whether what is only to be seen may be written now: a slow line, or a terminal that was
+    /// stopped, must not hold up what is shown.
+    [[nodiscard]] bool takesMore() const { return hasRoom == nullptr || hasRoom(); }
 
     /// One line on the error stream: "appsync: " and the text, made safe to print.
     void complain(std::string_view text) const;

@@ -36,7 +36,7 @@ void LiveLine::say(std::string_view what, std::size_t done, std::size_t count) {
 void LiveLine::clear() {
     {
         const std::lock_guard guard(mutex_);
-        if (!isOver_ && !what_.empty()) console_.out << "\r\x1b[K" << std::flush;
+        if (!isOver_ && isDrawn_) console_.out << "\r\x1b[K" << std::flush;
         isOver_ = true;
     }
     over_.notify_all();
@@ -49,7 +49,9 @@ void LiveLine::drawOn() {
 }
 
 void LiveLine::draw() {
+    if (!console_.takesMore()) return;
     drawn_ = Clock::now();
+    isDrawn_ = true;
     const auto time = std::chrono::duration_cast<std::chrono::seconds>(drawn_ - begin_);
     // Some terminals go on to the next line once the last column is filled.
     const std::size_t width = console_.currentWidth();

@@ -43,6 +43,7 @@ class LiveLine {
     // Guarded by mutex_.
     std::string what_;
     Clock::time_point drawn_;
+    bool isDrawn_ = false;
     bool isOver_ = false;
     std::thread thread_;
 };

@@ -73,7 +73,7 @@ void TerminalDisplay::show(const SyncEvent& event) {
     const bool isToBeSeen = event.kind != SyncEventKind::Progress &&
                             progress_.totals().applications <= kFewApplications;
     if (isToBeSeen) {
-        draw();
+        drawIfTaken();
     } else {
         drawSoon();
     }
@@ -94,19 +94,19 @@ void TerminalDisplay::noteBar(const SyncEvent& event) {
 void TerminalDisplay::tellOfFailure(const SyncEvent& event) {
     if (++failures_[event.phase] > kMostFailures && !isVerbose_) return;
     console_.out << erasure() << eventBar(event, lineWidth(), console_.cutMark) << '\n';
-    draw();
+    drawIfTaken();
 }
 
 // The error stream is most often the same terminal.
 void TerminalDisplay::complain(std::string_view text) {
     console_.out << erasure();
     console_.complain(text);
-    draw();
+    drawIfTaken();
 }
 
 void TerminalDisplay::note(std::string_view text) {
     console_.out << erasure() << printable(text) << '\n';
-    draw();
+    drawIfTaken();
 }
 
 void TerminalDisplay::finish(const SyncSummary& summary) {
@@ -182,7 +182,11 @@ std::vector<std::string> TerminalDisplay::lines() const {
 }
 
 void TerminalDisplay::drawSoon() {
-    if (now_() - drawn_ >= kBetweenDraws) draw();
+    if (now_() - drawn_ >= kBetweenDraws) drawIfTaken();
+}
+
+void TerminalDisplay::drawIfTaken() {
+    if (console_.takesMore()) draw();
 }
 
 // From the line's beginning: a terminal has shown what was typed meanwhile, such as "^C".

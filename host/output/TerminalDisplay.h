@@ -19,7 +19,8 @@ struct Console;
 /// and install that is under way. What ends well goes away, what fails stays above.
 ///
 /// Before the first event the line says what is being done. It tells, too, for how long the session
-/// goes on, so that it never stands still, and is drawn no more often than eyes can follow.
+/// goes on, so that it never stands still, and is drawn no more often than eyes can follow and the
+/// terminal takes it.
 class TerminalDisplay : public SyncDisplay {
   public:
     using Clock = SessionProgress::Clock;
@@ -49,6 +50,7 @@ class TerminalDisplay : public SyncDisplay {
     [[nodiscard]] std::size_t lineWidth() const;
     [[nodiscard]] std::size_t mostBars() const;
     void drawSoon();
+    void drawIfTaken();
     void draw();
     [[nodiscard]] std::string erasure();
 

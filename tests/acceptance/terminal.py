@@ -18,7 +18,8 @@ TIMEOUT = float(os.environ.get("APPSYNC_TEST_TIMEOUT", "120"))
 
 
 class Terminal:
-    def __init__(self, program, arguments, columns=80, lines=24, locale="C.UTF-8", term="xterm"):
+    def __init__(self, program, arguments, columns=80, lines=24, locale="C.UTF-8", term="xterm",
+                 typed=b""):
         self.master, slave = pty.openpty()
         self.columns = columns
         self._set_size(slave, columns, lines)
@@ -26,6 +27,7 @@ class Terminal:
         self.stream = pyte.Stream(self.screen)
         self.decoder = codecs.getincrementaldecoder("utf-8")("replace")
         self.written = ""
+        self.type(typed)
         self.process = subprocess.Popen(
             [program, *map(str, arguments)], stdin=slave, stdout=slave, stderr=slave,
             env={**os.environ, "TERM": term, "LC_ALL": locale}, start_new_session=True,

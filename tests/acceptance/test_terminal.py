@@ -2,15 +2,17 @@
 
 import os
 import re
+import time
 
 import pytest
 
 import packages
 from conftest import DIRECTLY, ON_ONE_PATH, Device
-from terminal import Terminal
+from terminal import TIMEOUT, Terminal
 
 A = "com.example.app00"
 MANY = 300
+CTRL_S, CTRL_Q = b"\x13", b"\x11"
 
 pytestmark = pytest.mark.plain_build  # what it waits for comes with the time
 
@@ -177,6 +179,17 @@ def test_a_terminal_that_becomes_narrower_gets_lines_that_fit(device, waiting, t
     shown.read_until(lambda lines: shown.written.count("\x1b[J") > erased + 1 and has_come_to_wait(lines[-2:]))
     drawn = shown.written.split("\x1b[J")[-1].splitlines()
     assert drawn and max(map(len, drawn)) < 30
+
+
+def test_a_terminal_that_was_stopped_does_not_hold_the_sync(device, library, terminal):
+    shown = terminal("sync", device.path, library, typed=CTRL_S)
+    end = time.monotonic() + TIMEOUT
+    while len(device.versions()) < 5:
+        assert time.monotonic() < end, "it waits for the terminal"
+        time.sleep(0.05)
+    shown.type(CTRL_Q)
+    assert shown.read_to_end() == 0
+    assert shown.everything()[0].startswith("Installed 5: ")
 
 
 def test_a_terminal_that_cannot_redraw_gets_lines(device, library, terminal):

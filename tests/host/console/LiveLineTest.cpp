@@ -42,6 +42,14 @@ TEST_F(LiveLineTest, IsNotThereWhereNothingWasSaid) {
     EXPECT_EQ(out.str(), "");
 }
 
+TEST_F(LiveLineTest, SaysNothingToATerminalThatTakesNothing) {
+    terminal.hasRoom = [] { return false; };
+    LiveLine line(terminal);
+    line.say("never");
+    line.clear();
+    EXPECT_EQ(out.str(), "");
+}
+
 TEST_F(LiveLineTest, SaysNothingWhereNoTerminalIs) {
     const Console file{out, err, false, 80};
     LiveLine line(file);

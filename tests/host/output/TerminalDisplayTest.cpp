@@ -111,6 +111,20 @@ TEST_F(TerminalDisplayTest, IsNotDrawnMoreOftenThanEyesFollowWhereThereIsMuch) {
     EXPECT_NE(drawnAfter(installing("com.a", 30), 50ms), "");
 }
 
+// Whether the terminal of these tests takes more.
+bool terminalTakesMore = true;
+
+TEST_F(TerminalDisplayTest, IsNotDrawnWhereTheTerminalDoesNotTakeIt) {
+    console.hasRoom = [] { return terminalTakesMore; };
+    drawnAfter(installing("com.example.a"));
+    terminalTakesMore = false;
+    EXPECT_EQ(drawnAfter(installing("com.example.b")), "");
+    // What has failed is no picture of a moment: it is told in any case.
+    EXPECT_THAT(drawnAfter(failed("com.example.b")), HasSubstr("com.example.b"));
+    terminalTakesMore = true;
+    EXPECT_THAT(drawnAfter(installing("com.example.a")), HasSubstr("com.example.a"));
+}
+
 TEST_F(TerminalDisplayTest, BeginningAndEndAreDrawnWhereThereIsLittle) {
     display.expect({2, 0});
     drawnAfter(installing("com.a", 10));
