@@ -20,6 +20,8 @@ class AppRegistryContract : public DeviceContract {};
 APPSYNC_CONTRACT_SUITE(AppRegistryContract, devicePorts());
 
 TEST_P(AppRegistryContract, AnEmptyDeviceKnowsNothing) {
+    checks("platform/AppRegistry.h",
+           "Whether there is anything under the identifier: an application or a placeholder.");
     EXPECT_FALSE(application(kA));
     EXPECT_FALSE(preferred(kA));
     EXPECT_FALSE(registry_.isApplicationInstalled(kA));
@@ -27,6 +29,7 @@ TEST_P(AppRegistryContract, AnEmptyDeviceKnowsNothing) {
 }
 
 TEST_P(AppRegistryContract, APackageBecomesAnApplication) {
+    checks("platform/AppRegistry.h", "What a record stands for: exactly one of the two.");
     ASSERT_TRUE(installPackage({kA, "2.5", "Atlas"}));
     const std::optional<AppProxy> proxy = application(kA);
     ASSERT_TRUE(proxy);
@@ -39,6 +42,8 @@ TEST_P(AppRegistryContract, APackageBecomesAnApplication) {
 }
 
 TEST_P(AppRegistryContract, TheBundleStandsInItsContainer) {
+    checks("platform/AppRegistry.h",
+           "The directory that holds the bundle and the store metadata file.");
     ASSERT_TRUE(installPackage({kA}));
     const std::optional<AppProxy> proxy = application(kA);
     ASSERT_TRUE(proxy);
@@ -47,6 +52,7 @@ TEST_P(AppRegistryContract, TheBundleStandsInItsContainer) {
 }
 
 TEST_P(AppRegistryContract, ThePackageIsOnlyRead) {
+    checks("platform/AppRegistry.h", "The file is only read: the plug-in removes it afterwards.");
     const std::string path = device_->addPackage({kA});
     const Bytes before = *services_.files.readFile(path);
     ASSERT_TRUE(installFrom(path, kA));
@@ -54,6 +60,9 @@ TEST_P(AppRegistryContract, ThePackageIsOnlyRead) {
 }
 
 TEST_P(AppRegistryContract, AnUpdateReplacesTheVersion) {
+    checks("platform/AppRegistry.h",
+           "Replaces an installed version and takes the placeholder away; on failure both are as "
+           "before.");
     ASSERT_TRUE(installPackage({kA, "1.0"}));
     ASSERT_TRUE(installPackage({kA, "2.0"}));
     EXPECT_EQ(application(kA)->bundleVersion, "2.0");
@@ -61,6 +70,8 @@ TEST_P(AppRegistryContract, AnUpdateReplacesTheVersion) {
 }
 
 TEST_P(AppRegistryContract, APackageOfAnotherIdentifierIsRefused) {
+    checks("platform/AppRegistry.h",
+           "`BundleIdentifierKey` = the identifier that the package must have.");
     const Status status = installFrom(device_->addPackage({kA}), kB);
     ASSERT_FALSE(status);
     EXPECT_EQ(status.error().domain, kInstallerErrorDomain);
@@ -68,11 +79,15 @@ TEST_P(AppRegistryContract, APackageOfAnotherIdentifierIsRefused) {
 }
 
 TEST_P(AppRegistryContract, AMissingPackageIsRefused) {
+    checks("platform/AppRegistry.h", "An error when there is no package at the path.");
     EXPECT_FALSE(installFrom("/var/mobile/missing.zip", kA));
     EXPECT_FALSE(registry_.isApplicationInstalled(kA));
 }
 
 TEST_P(AppRegistryContract, IllegalIdentifiersAreRefused) {
+    checks("platform/AppRegistry.h",
+           "It refuses identifiers that are not legal (1 to 255 bytes of letters, digits, '.', "
+           "'-', '_'; not \".\" or \"..\") with an error of `kRegistryErrorDomain`;");
     using std::string_literals::operator""s;
     const std::string package = device_->addPackage({kA});
     const std::string bundle = addPlaceholderBundle({kA});
@@ -94,13 +109,16 @@ TEST_P(AppRegistryContract, IllegalIdentifiersAreRefused) {
     EXPECT_THAT(bundles(AppRegistry::kEveryBundle), IsEmpty());
 }
 
-TEST_P(AppRegistryContract, TheLongestIdentifierIsLegal) {
+TEST_P(AppRegistryContract, WhatIsNotThereIsNotRemoved) {
+    checks("platform/AppRegistry.h", "An error when there is nothing to remove.");
     const std::string identifier(255, 'x');
-    EXPECT_EQ(registry_.uninstallApplication(identifier, {}).error().domain, kRegistryErrorDomain);
+    EXPECT_FALSE(registry_.uninstallApplication(identifier, {}));
     EXPECT_FALSE(registry_.isApplicationInstalled(identifier));
 }
 
 TEST_P(AppRegistryContract, OptionsOfAnotherKindAreRefused) {
+    checks("platform/AppRegistry.h",
+           "`options` is a map: `PackageTypeKey` = `PackageTypeCustomer` (any other is refused),");
     const FileURL package = FileURL::fromPath(device_->addPackage({kA}), false).value();
     EXPECT_FALSE(registry_.installPackage(package, {}));
     EXPECT_FALSE(registry_.installPackage(package, PropertyList::map()));
@@ -111,6 +129,9 @@ TEST_P(AppRegistryContract, OptionsOfAnotherKindAreRefused) {
 }
 
 TEST_P(AppRegistryContract, APlaceholderIsOnlySeenByThoseWhoAskForIt) {
+    checks("platform/AppRegistry.h",
+           "With placeholders included, one that covers an installed application is preferred to "
+           "it; without, only installed applications are looked at.");
     ASSERT_TRUE(installPlaceholder({kA, "2.5", "Atlas"}, kInstallTypeSync));
     EXPECT_FALSE(application(kA));
     EXPECT_TRUE(registry_.isApplicationInstalled(kA));
@@ -125,11 +146,17 @@ TEST_P(AppRegistryContract, APlaceholderIsOnlySeenByThoseWhoAskForIt) {
 }
 
 TEST_P(AppRegistryContract, APlaceholderIsACopy) {
+    checks("platform/AppRegistry.h",
+           "Installs a directory as a placeholder; the registry takes its own copy, and leaves the "
+           "directory to whoever made it.");
     ASSERT_TRUE(installPlaceholder({kA}, kInstallTypeSync));  // removes what was copied
     EXPECT_TRUE(services_.files.itemExists(preferred(kA)->bundlePath + "/Info.plist"));
 }
 
 TEST_P(AppRegistryContract, StoreMetadataAndSinfMayComeWithAPlaceholder) {
+    checks("platform/AppRegistry.h",
+           "`BundleIdentifierKey`, `InstallTypeKey`, and optionally `StoreMetadataKey` and "
+           "`AppSinfKey`.");
     const std::string path = addPlaceholderBundle({kA});
     PropertyList options = placeholderOptions(kA, kInstallTypeRestore);
     options.set(StoreMetadataKey, Bytes{1, 2, 3});
@@ -139,6 +166,7 @@ TEST_P(AppRegistryContract, StoreMetadataAndSinfMayComeWithAPlaceholder) {
 }
 
 TEST_P(AppRegistryContract, AMissingPlaceholderBundleIsRefused) {
+    checks("platform/AppRegistry.h", "An error when there is no bundle at the path.");
     EXPECT_FALSE(registry_.installPlaceholderBundle(
         FileURL::fromPath("/var/mobile/missing.app", true).value(),
         placeholderOptions(kA, kInstallTypeSync)));
@@ -146,15 +174,23 @@ TEST_P(AppRegistryContract, AMissingPlaceholderBundleIsRefused) {
 }
 
 TEST_P(AppRegistryContract, APlaceholderCoversTheApplication) {
+    checks("platform/AppRegistry.h",
+           "An installed application that the placeholder covers stays usable;");
     ASSERT_TRUE(installPackage({kA, "1.0"}));
     ASSERT_TRUE(installPlaceholder({kA, "2.0"}, kInstallTypeSync));
     EXPECT_EQ(application(kA)->bundleVersion, "1.0");
     EXPECT_EQ(preferred(kA)->bundleVersion, "2.0");
     EXPECT_TRUE(services_.files.itemExists(application(kA)->bundlePath));
+    checks("platform/AppRegistry.h",
+           "An update under way has both: the installed application, and the placeholder that "
+           "covers it.");
     EXPECT_THAT(bundles(AppRegistry::kEveryBundle), ElementsAre(kA, "com.example.a (placeholder)"));
 }
 
 TEST_P(AppRegistryContract, InstallingThePackageTakesThePlaceholderAway) {
+    checks("platform/AppRegistry.h",
+           "Replaces an installed version and takes the placeholder away; on failure both are as "
+           "before.");
     ASSERT_TRUE(installPlaceholder({kA, "2.0"}, kInstallTypeSync));
     ASSERT_TRUE(installPackage({kA, "2.0"}));
     EXPECT_TRUE(preferred(kA)->state.installed);
@@ -162,6 +198,9 @@ TEST_P(AppRegistryContract, InstallingThePackageTakesThePlaceholderAway) {
 }
 
 TEST_P(AppRegistryContract, AFailedInstallLeavesBothAsTheyWere) {
+    checks("platform/AppRegistry.h",
+           "Replaces an installed version and takes the placeholder away; on failure both are as "
+           "before.");
     ASSERT_TRUE(installPackage({kA, "1.0"}));
     ASSERT_TRUE(installPlaceholder({kA, "2.0"}, kInstallTypeSync));
     EXPECT_FALSE(installFrom(device_->addPackage({kB}), kA));
@@ -171,16 +210,22 @@ TEST_P(AppRegistryContract, AFailedInstallLeavesBothAsTheyWere) {
 }
 
 TEST_P(AppRegistryContract, UninstallingTakesThePlaceholderFirst) {
+    checks("platform/AppRegistry.h",
+           "The placeholder goes first: where one covers an installed application, it alone is "
+           "removed.");
     ASSERT_TRUE(installPackage({kA}));
     ASSERT_TRUE(installPlaceholder({kA}, kInstallTypeSync));
     EXPECT_TRUE(registry_.uninstallApplication(kA, {}));
     EXPECT_THAT(bundles(AppRegistry::kEveryBundle), ElementsAre(kA));
     EXPECT_TRUE(registry_.uninstallApplication(kA, PropertyList::map()));
     EXPECT_THAT(bundles(AppRegistry::kEveryBundle), IsEmpty());
+    checks("platform/AppRegistry.h", "An error when there is nothing to remove.");
     EXPECT_FALSE(registry_.uninstallApplication(kA, {}));
 }
 
 TEST_P(AppRegistryContract, AnUninstallLimitedToPlaceholdersSparesTheApplication) {
+    checks("platform/AppRegistry.h",
+           "With `UninstallPlaceholderOnlyKey` true the application is never touched.");
     const PropertyList only = PropertyList::map({{UninstallPlaceholderOnlyKey, true}});
     ASSERT_TRUE(installPackage({kA}));
     EXPECT_FALSE(registry_.uninstallApplication(kA, only));
@@ -190,6 +235,7 @@ TEST_P(AppRegistryContract, AnUninstallLimitedToPlaceholdersSparesTheApplication
 }
 
 TEST_P(AppRegistryContract, UninstallingRemovesTheFiles) {
+    checks("platform/AppRegistry.h", "What is removed goes with its container.");
     ASSERT_TRUE(installPackage({kA}));
     const std::string container = application(kA)->bundleContainerPath;
     ASSERT_TRUE(registry_.uninstallApplication(kA, {}));
@@ -197,6 +243,9 @@ TEST_P(AppRegistryContract, UninstallingRemovesTheFiles) {
 }
 
 TEST_P(AppRegistryContract, BundlesAreWalkedByType) {
+    checks("platform/AppRegistry.h",
+           "Calls back, on the calling thread and before it returns, once for each record of the "
+           "type, in no particular order.");
     ASSERT_TRUE(installPackage({kA}));
     ASSERT_TRUE(installPlaceholder({kB}, kInstallTypeSync));
     EXPECT_THAT(bundles(AppRegistry::kEveryBundle), ElementsAre(kA, "com.example.b (placeholder)"));
@@ -205,6 +254,7 @@ TEST_P(AppRegistryContract, BundlesAreWalkedByType) {
 }
 
 TEST_P(AppRegistryContract, AWalkStopsWhenItIsTold) {
+    checks("platform/AppRegistry.h", "Gets each proxy in turn; sets `stop` to end the walk.");
     ASSERT_TRUE(installPackage({kA}));
     ASSERT_TRUE(installPackage({kB}));
     int count = 0;
@@ -216,6 +266,8 @@ TEST_P(AppRegistryContract, AWalkStopsWhenItIsTold) {
 }
 
 TEST_P(AppRegistryContract, AWalkMayChangeWhatItWalks) {
+    checks("platform/AppRegistry.h",
+           "The callback may call the registry, and change what it walks.");
     ASSERT_TRUE(installPackage({kA}));
     ASSERT_TRUE(installPackage({kB}));
     int count = 0;
@@ -228,6 +280,7 @@ TEST_P(AppRegistryContract, AWalkMayChangeWhatItWalks) {
 }
 
 TEST_P(AppRegistryContract, SeveralInstallAtOnce) {
+    checks("platform/AppRegistry.h", "Callable on any thread, by several at once.");
     std::vector<std::string> packages;
     for (int i = 0; i < 10; ++i) {
         packages.push_back(device_->addPackage({"com.example.n" + std::to_string(i)}));

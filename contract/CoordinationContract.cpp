@@ -157,6 +157,8 @@ class CoordinationContract : public DeviceContract {
 APPSYNC_CONTRACT_SUITE(CoordinationContract, devicePorts({OptionalService::Coordination}));
 
 TEST_P(CoordinationContract, NothingIsThereUntilItIsCreated) {
+    checks("platform/InstallCoordinatorService.h",
+           "No coordinator and no error when there is none and none was to be created.");
     const auto result = existing(Kind::Initiating, kA);
     EXPECT_EQ(result.coordinator, nullptr);
     EXPECT_FALSE(result.error);
@@ -164,10 +166,14 @@ TEST_P(CoordinationContract, NothingIsThereUntilItIsCreated) {
 }
 
 TEST_P(CoordinationContract, ACoordinatorIsCreatedOnceAndKeepsItsCreator) {
+    checks("platform/InstallCoordinator.h", "The client that created it.");
     const auto coordinator = create(Kind::Initiating, kA, kOtherClient);
     EXPECT_EQ(coordinator->bundleIdentifier(), kA);
     EXPECT_EQ(coordinator->creatorIdentifier(), kOtherClient);
     EXPECT_FALSE(coordinator->error());
+    checks(
+        "platform/InstallCoordinatorService.h",
+        "one of the kind when there is one, else, if asked for, a new one that `client` creates.");
     const auto again =
         service_.coordinator(Kind::Initiating, kA, SyncClientID, Creation::CreateIfNotExisting);
     ASSERT_NE(again.coordinator, nullptr);
@@ -177,6 +183,8 @@ TEST_P(CoordinationContract, ACoordinatorIsCreatedOnceAndKeepsItsCreator) {
 }
 
 TEST_P(CoordinationContract, ACoordinatorIsFoundWhateverItsKindAndClient) {
+    checks("platform/InstallCoordinatorService.h",
+           "The coordinator of an application, of whatever kind; null when there is none.");
     (void)create(Kind::Restoring, kA, kOtherClient);
     const auto found = service_.existingCoordinator(kA, SyncClientID);
     ASSERT_NE(found, nullptr);
@@ -185,6 +193,8 @@ TEST_P(CoordinationContract, ACoordinatorIsFoundWhateverItsKindAndClient) {
 }
 
 TEST_P(CoordinationContract, AnotherKindStandsInTheWay) {
+    checks("platform/InstallCoordinatorService.h",
+           "An error when one of another kind stands in the way,");
     (void)create(Kind::Restoring, kA);
     for (const Creation creation : {Creation::OnlyExisting, Creation::CreateIfNotExisting}) {
         const auto result = service_.coordinator(Kind::Initiating, kA, SyncClientID, creation);
@@ -196,6 +206,8 @@ TEST_P(CoordinationContract, AnotherKindStandsInTheWay) {
 }
 
 TEST_P(CoordinationContract, OnlyWhatIsInstalledCanBeUpdated) {
+    checks("platform/InstallCoordinatorService.h",
+           "when an update is wanted of what is not installed,");
     const auto refused =
         service_.coordinator(Kind::Updating, kA, SyncClientID, Creation::CreateIfNotExisting);
     EXPECT_EQ(refused.coordinator, nullptr);
@@ -206,6 +218,9 @@ TEST_P(CoordinationContract, OnlyWhatIsInstalledCanBeUpdated) {
 }
 
 TEST_P(CoordinationContract, IllegalIdentifiersAreRefused) {
+    checks("platform/InstallCoordinatorService.h",
+           "or when the identifier is not legal (1 to 255 bytes of letters, digits, '.', '-', '_'; "
+           "not \".\" or \"..\").");
     using std::string_literals::operator""s;
     for (const std::string& identifier :
          {""s, "."s, ".."s, "a/b"s, "a b"s, "a\0b"s, "a\nb"s, "\u00e4"s, std::string(256, 'x')}) {
@@ -219,6 +234,7 @@ TEST_P(CoordinationContract, IllegalIdentifiersAreRefused) {
 }
 
 TEST_P(CoordinationContract, PiecesAreThereOnceTheyAreSet) {
+    checks("platform/InstallCoordinator.h", "a set of pieces, each of which may be there or not.");
     const auto coordinator = create(Kind::Initiating, kA);
     EXPECT_FALSE(coordinator->hasInstallOptions());
     EXPECT_FALSE(coordinator->hasInitialODRAssetPromises());
@@ -244,6 +260,8 @@ TEST_P(CoordinationContract, PiecesAreThereOnceTheyAreSet) {
 }
 
 TEST_P(CoordinationContract, ASecondSetIsRefusedAndTheFirstStands) {
+    checks("platform/InstallCoordinator.h",
+           "a second set is refused with an error, and the first stands.");
     const auto coordinator = prepared(Kind::Initiating, kA);
     ASSERT_TRUE(coordinator->setAppAssetPromiseResponsibleClient(AppStoreClientID));
     ASSERT_TRUE(coordinator->setUserDataPromise(dataPromise(kA)));
@@ -258,9 +276,11 @@ TEST_P(CoordinationContract, ASecondSetIsRefusedAndTheFirstStands) {
 }
 
 TEST_P(CoordinationContract, APromiseSaysWhatItWasMadeWith) {
+    checks("platform/InstallPromises.h", "Who has to keep it.");
     const auto promise = assetPromise(kA);
     EXPECT_EQ(promise->name(), "com.example.a-Asset");
     EXPECT_EQ(promise->clientIdentifier(), SyncClientID);
+    checks("platform/InstallCoordinatorService.h", "`path` is where the file lies or will lie.");
     EXPECT_FALSE(promise->transferPath());
     EXPECT_EQ(promise->percentComplete(), 0.0);
     EXPECT_FALSE(promise->isComplete());
@@ -268,6 +288,9 @@ TEST_P(CoordinationContract, APromiseSaysWhatItWasMadeWith) {
 }
 
 TEST_P(CoordinationContract, TwoHandlesOnOnePromiseShowTheSame) {
+    checks(
+        "platform/InstallPromises.h",
+        "An object is a handle on the service's record: two handles on one promise show the same.");
     const auto coordinator = create(Kind::Initiating, kA);
     const auto mine = assetPromise(kA);
     mine->setPercentComplete(0.25);
@@ -283,6 +306,8 @@ TEST_P(CoordinationContract, TwoHandlesOnOnePromiseShowTheSame) {
 }
 
 TEST_P(CoordinationContract, ACompletePlaceholderIsShown) {
+    checks("platform/InstallPlaceholder.h",
+           "once the coordinator has such a placeholder, the service puts it on the home screen.");
     (void)prepared(Kind::Initiating, kA);
     EXPECT_THAT(observer_->heard(), ElementsAre("placeholder com.example.a"));
     const std::optional<AppProxy> proxy = preferred(kA);
@@ -296,6 +321,8 @@ TEST_P(CoordinationContract, ACompletePlaceholderIsShown) {
 }
 
 TEST_P(CoordinationContract, APlaceholderThatIsNotCompleteIsKeptAndNotShown) {
+    checks("platform/InstallPlaceholder.h",
+           "One whose configuration never completes is kept and not shown.");
     const auto coordinator = create(Kind::Initiating, kA);
     ASSERT_TRUE(coordinator->setPlaceholderPromise(
         service_.makeAppPlaceholder("Atlas", kA, kInstallTypeSync, SyncClientID)));
@@ -306,12 +333,16 @@ TEST_P(CoordinationContract, APlaceholderThatIsNotCompleteIsKeptAndNotShown) {
 }
 
 TEST_P(CoordinationContract, NoPlaceholderIsRefused) {
+    checks("platform/InstallCoordinator.h",
+           "Refuses null, and the placeholder of another application.");
     const auto coordinator = create(Kind::Initiating, kA);
     EXPECT_FALSE(coordinator->setPlaceholderPromise(nullptr));
     EXPECT_FALSE(coordinator->hasPlaceholderPromise());
 }
 
 TEST_P(CoordinationContract, APlaceholderOfAnotherApplicationIsRefused) {
+    checks("platform/InstallCoordinator.h",
+           "Refuses null, and the placeholder of another application.");
     const auto coordinator = create(Kind::Initiating, kA);
     EXPECT_FALSE(coordinator->setPlaceholderPromise(placeholder(kB)));
     EXPECT_FALSE(coordinator->hasPlaceholderPromise());
@@ -319,6 +350,9 @@ TEST_P(CoordinationContract, APlaceholderOfAnotherApplicationIsRefused) {
 }
 
 TEST_P(CoordinationContract, ACompletePlaceholderTakesNoMore) {
+    checks("platform/InstallPlaceholder.h",
+           "A second set of the same piece replaces the first, until the configuration is "
+           "complete; from then on every set is refused.");
     const auto placeholder =
         service_.makeAppPlaceholder("Atlas", kA, kInstallTypeSync, SyncClientID);
     EXPECT_TRUE(placeholder->setAttributes({}));
@@ -334,6 +368,9 @@ TEST_P(CoordinationContract, ACompletePlaceholderTakesNoMore) {
 }
 
 TEST_P(CoordinationContract, ThePackageIsInstalledWhenItsPromiseIsKept) {
+    checks("platform/InstallCoordinator.h",
+           "When the pieces that its kind needs are there and every promise is complete, the "
+           "service installs on threads of its own, and the coordinator is gone afterwards.");
     const auto coordinator = prepared(Kind::Initiating, kA);
     const std::string path = device_->addPackage({kA, "2.5", "Atlas"});
     keepAsset(*coordinator, path);
@@ -345,10 +382,16 @@ TEST_P(CoordinationContract, ThePackageIsInstalledWhenItsPromiseIsKept) {
     EXPECT_THAT(bundles(AppRegistry::kEveryBundle), ElementsAre(kA));
     EXPECT_FALSE(coordinator->error());
     EXPECT_EQ(service_.existingCoordinator(kA, SyncClientID), nullptr);
+    checks(
+        "platform/InstallPromises.h",
+        "it reads it when it needs it and removes it afterwards (an icon may be left standing).");
     EXPECT_FALSE(services_.files.itemExists(path));
 }
 
 TEST_P(CoordinationContract, AnUpdateReplacesTheVersion) {
+    checks("platform/InstallCoordinator.h",
+           "When the pieces that its kind needs are there and every promise is complete, the "
+           "service installs on threads of its own, and the coordinator is gone afterwards.");
     ASSERT_TRUE(installPackage({kA, "1.0"}));
     const auto coordinator = prepared(Kind::Updating, kA);
     EXPECT_EQ(application(kA)->bundleVersion, "1.0");
@@ -359,6 +402,9 @@ TEST_P(CoordinationContract, AnUpdateReplacesTheVersion) {
 }
 
 TEST_P(CoordinationContract, TheInstallWaitsForEveryPromise) {
+    checks("platform/InstallCoordinator.h",
+           "When the pieces that its kind needs are there and every promise is complete, the "
+           "service installs on threads of its own, and the coordinator is gone afterwards.");
     const auto coordinator = prepared(Kind::Initiating, kA);
     const auto data = dataPromise(kA);
     ASSERT_TRUE(coordinator->setUserDataPromise(data));
@@ -371,6 +417,9 @@ TEST_P(CoordinationContract, TheInstallWaitsForEveryPromise) {
 }
 
 TEST_P(CoordinationContract, APromiseThatIsGivenUpIsNotWaitedFor) {
+    checks("platform/InstallPromises.h",
+           "Gives it up: the service no longer waits for it, and does not hold it against its "
+           "keeper.");
     const auto coordinator = prepared(Kind::Initiating, kA);
     const auto data = dataPromise(kA);
     ASSERT_TRUE(coordinator->setUserDataPromise(data));
@@ -381,6 +430,9 @@ TEST_P(CoordinationContract, APromiseThatIsGivenUpIsNotWaitedFor) {
 }
 
 TEST_P(CoordinationContract, AFailedInstallKeepsTheOldVersionAndTakesThePlaceholder) {
+    checks("platform/InstallCoordinator.h",
+           "An install that fails takes the placeholder away and leaves an installed version as it "
+           "is;");
     ASSERT_TRUE(installPackage({kA, "1.0"}));
     const auto coordinator = prepared(Kind::Updating, kA);
     keepAsset(*coordinator, "/var/mobile/missing.zip");
@@ -395,6 +447,9 @@ TEST_P(CoordinationContract, AFailedInstallKeepsTheOldVersionAndTakesThePlacehol
 
 // Nothing but a restore brings it back, so it waits for another package.
 TEST_P(CoordinationContract, AFailedInstallOfARestoredApplicationKeepsItsPlaceholder) {
+    checks("platform/InstallCoordinator.h",
+           "of an application that is being restored the placeholder stays, and a coordinator that "
+           "waits for another package.");
     const auto coordinator = create(Kind::Restoring, kA);
     const auto data = dataPromise(kA);
     data->setComplete();
@@ -422,6 +477,7 @@ TEST_P(CoordinationContract, AFailedInstallOfARestoredApplicationKeepsItsPlaceho
 }
 
 TEST_P(CoordinationContract, APackageOfAnotherApplicationIsNotInstalled) {
+    checks("platform/InstallCoordinator.h", "It failed when the coordinator carries an error.");
     const auto coordinator = prepared(Kind::Initiating, kA);
     keepAsset(*coordinator, device_->addPackage({kB}));
     observer_->waitForOne();
@@ -430,6 +486,8 @@ TEST_P(CoordinationContract, APackageOfAnotherApplicationIsNotInstalled) {
 }
 
 TEST_P(CoordinationContract, ARestoredApplicationIsInstalledFromTheStoresPromise) {
+    checks("platform/InstallCoordinator.h",
+           "Whose task the package is where nobody has promised it;");
     const auto coordinator = create(Kind::Restoring, kA);
     const auto data = dataPromise(kA);
     data->setComplete();
@@ -447,12 +505,15 @@ TEST_P(CoordinationContract, ARestoredApplicationIsInstalledFromTheStoresPromise
 }
 
 TEST_P(CoordinationContract, ACancelTakesThePlaceholderAndKeepsTheVersion) {
+    checks("platform/InstallCoordinator.h", "Its observer hears.");
     ASSERT_TRUE(installPackage({kA, "1.0"}));
     const auto coordinator = prepared(Kind::Updating, kA);
     coordinator->cancelForReason(reason(), kOtherClient);
     observer_->waitForOne();
     EXPECT_THAT(observer_->heard(),
                 ElementsAre("placeholder com.example.a", "cancelled com.example.a, 30, client 7"));
+    checks("platform/InstallCoordinator.h",
+           "Ends it: its placeholder goes, its promises are given up, an installed version stays.");
     EXPECT_THAT(bundles(AppRegistry::kEveryBundle), ElementsAre(kA));
     EXPECT_EQ(application(kA)->bundleVersion, "1.0");
     EXPECT_EQ(coordinator->error(), reason());
@@ -460,6 +521,9 @@ TEST_P(CoordinationContract, ACancelTakesThePlaceholderAndKeepsTheVersion) {
 }
 
 TEST_P(CoordinationContract, ACancelledCoordinatorAnswersAsBeforeAndTakesNoMore) {
+    checks("platform/InstallCoordinator.h",
+           "On a coordinator that is done or cancelled every set is refused and every question is "
+           "answered as when it ended.");
     const auto coordinator = create(Kind::Initiating, kA);
     ASSERT_TRUE(coordinator->setInstallOptions(options()));
     coordinator->cancelForReason(reason(), SyncClientID);
@@ -474,6 +538,7 @@ TEST_P(CoordinationContract, ACancelledCoordinatorAnswersAsBeforeAndTakesNoMore)
 }
 
 TEST_P(CoordinationContract, ASecondCancelDoesNothing) {
+    checks("platform/InstallCoordinator.h", "A second cancel does nothing.");
     const auto coordinator = create(Kind::Initiating, kA);
     const auto other = service_.existingCoordinator(kA, SyncClientID);
     coordinator->cancelForReason(reason(1), SyncClientID);
@@ -487,6 +552,9 @@ TEST_P(CoordinationContract, ASecondCancelDoesNothing) {
 }
 
 TEST_P(CoordinationContract, ACancelledIdentifierCanBeginAnew) {
+    checks(
+        "platform/InstallCoordinatorService.h",
+        "one of the kind when there is one, else, if asked for, a new one that `client` creates.");
     const auto old = prepared(Kind::Initiating, kA);
     old->cancelForReason(reason(), SyncClientID);
     observer_->waitForOne();
@@ -499,6 +567,9 @@ TEST_P(CoordinationContract, ACancelledIdentifierCanBeginAnew) {
 }
 
 TEST_P(CoordinationContract, PromisesOfWhatHasEndedDoNotChange) {
+    checks("platform/InstallPromises.h",
+           "a change of a promise that the service no longer has (its coordinator is done or "
+           "cancelled) does nothing.");
     const auto coordinator = prepared(Kind::Initiating, kA);
     const auto promise = coordinator->appAssetPromise();
     promise->setPercentComplete(0.5);
@@ -515,6 +586,7 @@ TEST_P(CoordinationContract, PromisesOfWhatHasEndedDoNotChange) {
 }
 
 TEST_P(CoordinationContract, ObserversAreHeldWeakly) {
+    checks("platform/InstallCoordinator.h", "Who hears of this coordinator, held weakly;");
     const auto coordinator = create(Kind::Initiating, kA);
     auto observer = std::make_shared<HearingObserver>(services_.queues);
     const std::weak_ptr<HearingObserver> weak = observer;
@@ -527,6 +599,8 @@ TEST_P(CoordinationContract, ObserversAreHeldWeakly) {
 }
 
 TEST_P(CoordinationContract, ALaterObserverTakesThePlaceOfTheEarlier) {
+    checks("platform/InstallCoordinator.h",
+           "One at a time: a later one takes the place of the earlier.");
     (void)create(Kind::Initiating, kA);
     const auto later = std::make_shared<HearingObserver>(services_.queues);
     const auto other = service_.existingCoordinator(kA, SyncClientID);
@@ -538,6 +612,9 @@ TEST_P(CoordinationContract, ALaterObserverTakesThePlaceOfTheEarlier) {
 }
 
 TEST_P(CoordinationContract, ADelegateHearsOfItsClientsCoordinatorsThatNobodyObserves) {
+    checks("platform/InstallCoordinatorService.h",
+           "From now on the delegate, held weakly, hears of every coordinator that one of the "
+           "clients has created and that has no observer of its own:");
     const auto delegate = std::make_shared<HearingObserver>(services_.queues);
     const auto registration =
         service_.makeAppInstallObserver("com.example.observer", {SyncClientID}, delegate);
@@ -554,6 +631,8 @@ TEST_P(CoordinationContract, ADelegateHearsOfItsClientsCoordinatorsThatNobodyObs
 }
 
 TEST_P(CoordinationContract, ADelegateHearsNothingOnceItsRegistrationHasEnded) {
+    checks("platform/InstallCoordinatorService.h",
+           "It ends with the object: no call begins after that.");
     const auto delegate = std::make_shared<HearingObserver>(services_.queues);
     auto registration =
         service_.makeAppInstallObserver("com.example.observer", {SyncClientID}, delegate);
@@ -566,6 +645,8 @@ TEST_P(CoordinationContract, ADelegateHearsNothingOnceItsRegistrationHasEnded) {
 }
 
 TEST_P(CoordinationContract, AnUninstallIsReportedOnce) {
+    checks("platform/InstallCoordinatorService.h",
+           "Returns at once; the completion is called exactly once.");
     ASSERT_TRUE(installPackage({kA}));
     EXPECT_EQ(uninstall(kA), "ok");
     EXPECT_THAT(bundles(AppRegistry::kEveryBundle), IsEmpty());
@@ -573,6 +654,9 @@ TEST_P(CoordinationContract, AnUninstallIsReportedOnce) {
 }
 
 TEST_P(CoordinationContract, AnUninstallTakesThePlaceholderFirst) {
+    checks("platform/InstallCoordinatorService.h",
+           "Uninstalls the application, or its placeholder where one covers it, without asking the "
+           "person who uses the device.");
     ASSERT_TRUE(installPackage({kA}));
     ASSERT_TRUE(installPlaceholder({kA}, kInstallTypeSync));
     EXPECT_EQ(uninstall(kA), "ok");
@@ -580,6 +664,8 @@ TEST_P(CoordinationContract, AnUninstallTakesThePlaceholderFirst) {
 }
 
 TEST_P(CoordinationContract, APersonsErrorHoldsTheUnderlyingOne) {
+    checks("platform/InstallCoordinatorService.h",
+           "it says that an install did not come about, and holds the underlying error.");
     const ErrorRecord underlying = ErrorRecord::make("Transport", 77, "the cable is out");
     const ErrorRecord error = service_.userPresentableError(1, underlying);
     EXPECT_EQ(error.code, 1);

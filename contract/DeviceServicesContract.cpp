@@ -22,10 +22,8 @@ class HomeScreenContract : public DeviceContract {
         EXPECT_NE(connection_, nullptr);
     }
 
-    bool setLayout(const PropertyList& layout) {
-        const auto bytes = services_.propertyLists.serialize(layout, PropertyListFormat::Xml);
-        EXPECT_TRUE(bytes);
-        return connection_->setIconState(*bytes);
+    bool setLayout(const std::vector<std::string>& identifiers) {
+        return connection_->setIconState(device_->iconState(identifiers));
     }
     std::vector<std::string> layout() {
         const std::optional<Bytes> bytes = connection_->flattenedIconState(1);
@@ -45,29 +43,33 @@ class HomeScreenContract : public DeviceContract {
 APPSYNC_CONTRACT_SUITE(HomeScreenContract, devicePorts({OptionalService::HomeScreen}));
 
 TEST_P(HomeScreenContract, ALayoutComesBackFlattened) {
-    EXPECT_TRUE(setLayout(PropertyList::array({kB, kA})));
+    checks("platform/HomeScreenService.h",
+           "The icon layout flattened: a property list whose root is an array of bundle "
+           "identifiers in home-screen order.");
+    EXPECT_TRUE(setLayout({kB, kA}));
     EXPECT_THAT(layout(), ElementsAre(kB, kA));
-    EXPECT_TRUE(setLayout(PropertyList::array({kA})));
+    EXPECT_TRUE(setLayout({kA}));
     EXPECT_THAT(layout(), ElementsAre(kA));
 }
 
 TEST_P(HomeScreenContract, WhatIsNoLayoutIsNotTaken) {
-    EXPECT_TRUE(setLayout(PropertyList::array({kB, kA})));
+    checks("platform/HomeScreenService.h", "Bytes of another form are not, and change nothing.");
+    EXPECT_TRUE(setLayout({kB, kA}));
     const std::string garbage = "no layout";
     EXPECT_FALSE(connection_->setIconState(Bytes(garbage.begin(), garbage.end())));
     EXPECT_FALSE(connection_->setIconState({}));
-    EXPECT_FALSE(setLayout(PropertyList::map()));
-    EXPECT_FALSE(setLayout(PropertyList::array({kA, 1})));
     EXPECT_THAT(layout(), ElementsAre(kB, kA));
 }
 
 TEST_P(HomeScreenContract, WhatIsNotInstalledCannotBeHeld) {
+    checks("platform/HomeScreenService.h", "No such application when it is not installed.");
     const auto result = services_.homeScreen.takeTerminationAssertion(kA, 0);
     EXPECT_EQ(result.outcome, Outcome::kNoSuchApplication);
-    EXPECT_EQ(result.assertion, nullptr);
 }
 
 TEST_P(HomeScreenContract, AnApplicationThatDoesNotRunIsHeld) {
+    checks("platform/HomeScreenService.h",
+           "Else granted, with an assertion; several may hold one application.");
     ASSERT_TRUE(installPackage({kA}));
     const auto result = services_.homeScreen.takeTerminationAssertion(kA, 0);
     EXPECT_EQ(result.outcome, Outcome::kGranted);
@@ -75,6 +77,7 @@ TEST_P(HomeScreenContract, AnApplicationThatDoesNotRunIsHeld) {
 }
 
 TEST_P(HomeScreenContract, ARunningApplicationIsNotHeldUntilItEnds) {
+    checks("platform/HomeScreenService.h", "Denied while the application goes on running.");
     ASSERT_TRUE(installPackage({kA}));
     ASSERT_TRUE(device_->run(kA));
     EXPECT_EQ(services_.homeScreen.takeTerminationAssertion(kA, 0).outcome, Outcome::kDenied);
@@ -83,6 +86,8 @@ TEST_P(HomeScreenContract, ARunningApplicationIsNotHeldUntilItEnds) {
 }
 
 TEST_P(HomeScreenContract, AReleasedAssertionCanBeTakenAgain) {
+    checks("platform/HomeScreenService.h",
+           "Else granted, with an assertion; several may hold one application.");
     ASSERT_TRUE(installPackage({kA}));
     for (int round = 0; round < 3; ++round) {
         const auto result = services_.homeScreen.takeTerminationAssertion(kA, 0);
@@ -93,6 +98,9 @@ TEST_P(HomeScreenContract, AReleasedAssertionCanBeTakenAgain) {
 }
 
 TEST_P(HomeScreenContract, WhatIsHeldDoesNotRunUntilTheLastAssertionIsReleased) {
+    checks("platform/HomeScreenService.h",
+           "Keeps a running application from running until the assertion is released, that is "
+           "destroyed.");
     ASSERT_TRUE(installPackage({kA}));
     ASSERT_TRUE(installPackage({kB}));
     auto first = services_.homeScreen.takeTerminationAssertion(kA, 0);
@@ -111,6 +119,7 @@ class PolicyContract : public DeviceContract {};
 APPSYNC_CONTRACT_SUITE(PolicyContract, devicePorts({OptionalService::Policy}));
 
 TEST_P(PolicyContract, PolicyIsUnsetUntilItIsSet) {
+    checks("platform/DevicePolicyService.h", "The effective value at this moment.");
     DevicePolicyService& policy = services_.policy;
     EXPECT_EQ(policy.effectiveValue(PolicyFeature::AppInstallationAllowed), PolicyAnswer::Unset);
     device_->setPolicy(PolicyFeature::AppInstallationAllowed, PolicyAnswer::No);
@@ -125,12 +134,15 @@ class BackupContract : public DeviceContract {};
 APPSYNC_CONTRACT_SUITE(BackupContract, devicePorts({OptionalService::Backup}));
 
 TEST_P(BackupContract, RestoreDataIsThereUntilTheRestoreIsGivenUp) {
+    checks("platform/BackupService.h",
+           "Whether the service holds data to restore for the application.");
     const auto manager = services_.backup.makeManager();
     EXPECT_FALSE(manager->restoreDataExists(kA));
     manager->cancelApplicationRestore(kA);
     device_->addRestoreData(kA);
     EXPECT_TRUE(manager->restoreDataExists(kA));
     EXPECT_FALSE(manager->restoreDataExists(kB));
+    checks("platform/BackupService.h", "Gives the application's restore up.");
     services_.backup.makeManager()->cancelApplicationRestore(kA);
     EXPECT_FALSE(manager->restoreDataExists(kA));
 }
@@ -140,6 +152,7 @@ class InstallerContract : public DeviceContract {};
 APPSYNC_CONTRACT_SUITE(InstallerContract, devicePorts({OptionalService::UninstalledList}));
 
 TEST_P(InstallerContract, WhatAPersonRemovesIsOnTheListUntilItIsCleared) {
+    checks("platform/InstallerService.h", "A map keyed by bundle identifier;");
     InstallerService& installer = services_.installer;
     EXPECT_TRUE(installer.lookupUninstalled()->isMap());
     EXPECT_TRUE(installer.lookupUninstalled()->empty());
@@ -149,6 +162,8 @@ TEST_P(InstallerContract, WhatAPersonRemovesIsOnTheListUntilItIsCleared) {
         EXPECT_FALSE(registry_.isApplicationInstalled(identifier));
     }
     EXPECT_EQ(installer.lookupUninstalled()->size(), 2U);
+    checks("platform/InstallerService.h",
+           "Takes identifiers off the list; those that are not on it are passed over.");
     const std::vector<std::string> taken{kA, "com.example.unknown"};
     EXPECT_TRUE(installer.clearUninstalled(taken));
     EXPECT_EQ(installer.lookupUninstalled()->size(), 1U);
@@ -156,6 +171,8 @@ TEST_P(InstallerContract, WhatAPersonRemovesIsOnTheListUntilItIsCleared) {
 }
 
 TEST_P(InstallerContract, WhatTheRegistryUninstallsIsNotOnTheList) {
+    checks("platform/InstallerService.h",
+           "What the registry uninstalls for the plug-in is not on it.");
     ASSERT_TRUE(installPackage({kA}));
     ASSERT_TRUE(registry_.uninstallApplication(kA, {}));
     EXPECT_TRUE(services_.installer.lookupUninstalled()->empty());
@@ -166,9 +183,12 @@ class TransactionLogContract : public DeviceContract {};
 APPSYNC_CONTRACT_SUITE(TransactionLogContract, devicePorts({OptionalService::TransactionLog}));
 
 TEST_P(TransactionLogContract, TheTransactionLogKeepsTheOrder) {
+    checks("platform/InstallTransactionLog.h",
+           "One-time initialisation; a second one changes nothing.");
     InstallTransactionLog& log = services_.transactions;
     log.initialize(*services_.log.makeHandle("com.example", "first"));
     log.initialize(*services_.log.makeHandle("com.example", "second"));
+    checks("platform/InstallTransactionLog.h", "Records stand in the order of the calls.");
     log.logScenario("Asset install", 0, true, kA, "assertion succeeded");
     log.logStep(1, 1, 1, true, kA, "");
     log.logScenario("Nimbra restore", 0, false, kB, "install failed recoverably");
@@ -182,12 +202,17 @@ class IconRendererContract : public DeviceContract {};
 APPSYNC_CONTRACT_SUITE(IconRendererContract, devicePorts({OptionalService::Icons}));
 
 TEST_P(IconRendererContract, OnlyKnownImageTypesAreEncoded) {
+    checks("platform/IconRenderer.h",
+           "A destination for `imageCount` images of a type (\"public.png\") that writes into "
+           "`buffer`. Null for a type that it does not know.");
     Bytes buffer;
     EXPECT_NE(services_.icons.createImageDestination("public.png", 1, buffer), nullptr);
     EXPECT_EQ(services_.icons.createImageDestination("public.no-such-type", 1, buffer), nullptr);
 }
 
 TEST_P(IconRendererContract, NothingAddedIsNothingWritten) {
+    checks("platform/IconRenderer.h",
+           "Writes what was added into the buffer; false when that fails or nothing was added.");
     Bytes buffer;
     const auto destination = services_.icons.createImageDestination("public.png", 1, buffer);
     ASSERT_NE(destination, nullptr);

@@ -3,6 +3,7 @@
 #include <string>
 #include <vector>
 
+#include "platform/Bytes.h"
 #include "platform/DevicePolicyService.h"
 #include "platform/Platform.h"
 
@@ -33,13 +34,20 @@ class DeviceUnderTest {
     /// it; from then on `services()` gives the new ones. False where that is not offered.
     virtual bool reopen() { return false; }
 
+    /// An icon layout of these applications, in the home screen's own form: an array of their
+    /// identifiers, as a property list, where that is it.
+    virtual Bytes iconState(const std::vector<std::string>& identifiers);
+
     // What a person or a manager does on the device: what the services need that the port has.
 
-    /// Starts an application that is installed. False when something keeps it from running.
+    /// Starts an application that is installed, which goes on running until `quit`. False when
+    /// something keeps it from running.
     virtual bool run(const std::string& /*identifier*/) { return false; }
     virtual void quit(const std::string& /*identifier*/) {}
     /// Removes an application that is installed, and puts it on the installer's list.
     virtual void uninstallAsPerson(const std::string& /*identifier*/) {}
+    /// Cancels the install that is under way for an application. False where nobody can.
+    virtual bool cancelAsPerson(const std::string& /*identifier*/) { return false; }
     virtual void setPolicy(PolicyFeature /*feature*/, PolicyAnswer /*answer*/) {}
     virtual void addRestoreData(const std::string& /*identifier*/) {}
     /// From now on installs are to go through coordinators.

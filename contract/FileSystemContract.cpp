@@ -45,6 +45,9 @@ class FileSystemContract : public SystemContract {
 APPSYNC_CONTRACT_SUITE(FileSystemContract, systemPorts());
 
 TEST_P(FileSystemContract, ADirectoryThatWasMadeIsThere) {
+    checks("platform/FileSystem.h",
+           "Makes a directory; the parents too, if asked for, and then one that exists is no "
+           "failure.");
     EXPECT_FALSE(files_.itemExists("/d/e"));
     EXPECT_EQ(codeOf(files_.createDirectory("/d/e", false, nullptr)), 0);
     EXPECT_TRUE(files_.itemExists("/d/e"));
@@ -54,17 +57,23 @@ TEST_P(FileSystemContract, ADirectoryThatWasMadeIsThere) {
 }
 
 TEST_P(FileSystemContract, ADirectoryNeedsItsParent) {
+    checks("platform/FileSystem.h",
+           "ENOENT: the item is missing, or the directory that it is to stand in.");
     EXPECT_EQ(codeOf(files_.createDirectory("/d/e/f", false, nullptr)), ENOENT);
     EXPECT_FALSE(files_.itemExists("/d/e"));
 }
 
 TEST_P(FileSystemContract, ADirectoryIsMadeOnlyOnce) {
+    checks("platform/FileSystem.h", "Else EEXIST, whatever stands there.");
     EXPECT_EQ(codeOf(files_.createDirectory("/d", false, nullptr)), EEXIST);
     write("/d/file", "");
     EXPECT_EQ(codeOf(files_.createDirectory("/d/file", false, nullptr)), EEXIST);
 }
 
 TEST_P(FileSystemContract, ParentsAreMadeOnRequest) {
+    checks("platform/FileSystem.h",
+           "Makes a directory; the parents too, if asked for, and then one that exists is no "
+           "failure.");
     EXPECT_EQ(codeOf(files_.createDirectory("/d/e/f/g", true, nullptr)), 0);
     EXPECT_TRUE(files_.itemExists("/d/e/f/g"));
     EXPECT_EQ(codeOf(files_.createDirectory("/d/e/f/g", true, nullptr)), 0);
@@ -72,6 +81,7 @@ TEST_P(FileSystemContract, ParentsAreMadeOnRequest) {
 }
 
 TEST_P(FileSystemContract, AFileInTheWayOfADirectoryIsAFailure) {
+    checks("platform/FileSystem.h", "A file in the way of it or of a parent is a failure.");
     write("/d/file", "kept");
     EXPECT_NE(codeOf(files_.createDirectory("/d/file", true, nullptr)), 0);
     EXPECT_NE(codeOf(files_.createDirectory("/d/file/below", true, nullptr)), 0);
@@ -79,6 +89,8 @@ TEST_P(FileSystemContract, AFileInTheWayOfADirectoryIsAFailure) {
 }
 
 TEST_P(FileSystemContract, NewItemsBelongToWhomTheyAreGiven) {
+    checks("platform/FileSystem.h",
+           "Whom a new file or directory belongs to: account names of the device.");
     for (const std::string& account : system_->accounts()) {
         const FileAttributes given{account, account};
         const std::string directory = "/d/" + account;
@@ -92,6 +104,8 @@ TEST_P(FileSystemContract, NewItemsBelongToWhomTheyAreGiven) {
 }
 
 TEST_P(FileSystemContract, OwnerAndGroupAreGivenEachByItself) {
+    checks("platform/FileSystem.h",
+           "Whom a new file or directory belongs to: account names of the device.");
     const std::vector<std::string> accounts = system_->accounts();
     if (accounts.size() < 2) GTEST_SKIP() << "this process may give items to nobody else";
     const std::string& one = accounts[0];
@@ -110,6 +124,8 @@ TEST_P(FileSystemContract, OwnerAndGroupAreGivenEachByItself) {
 }
 
 TEST_P(FileSystemContract, AFileThatIsReplacedIsGivenToo) {
+    checks("platform/FileSystem.h",
+           "Whom a new file or directory belongs to: account names of the device.");
     for (const std::string& account : system_->accounts()) {
         const FileAttributes given{account, account};
         EXPECT_EQ(codeOf(files_.createFile("/d/file", bytes("x"), given)), 0);
@@ -118,6 +134,8 @@ TEST_P(FileSystemContract, AFileThatIsReplacedIsGivenToo) {
 }
 
 TEST_P(FileSystemContract, AnUnknownAccountIsRefusedAndNothingMade) {
+    checks("platform/FileSystem.h",
+           "One that the device does not know is refused with EINVAL, and nothing is made.");
     const FileAttributes nobody{"no such account", std::nullopt};
     EXPECT_EQ(codeOf(files_.createDirectory("/d/e", true, &nobody)), EINVAL);
     EXPECT_EQ(codeOf(files_.createFile("/d/file", bytes("x"), nobody)), EINVAL);
@@ -125,6 +143,7 @@ TEST_P(FileSystemContract, AnUnknownAccountIsRefusedAndNothingMade) {
 }
 
 TEST_P(FileSystemContract, WhatIsWrittenIsRead) {
+    checks("platform/FileSystem.h", "The whole file, past any cache of the process.");
     using std::string_literals::operator""s;
     for (const std::string& text : {""s, "text"s, "with \0 and \xff"s, std::string(1 << 20, 'x')}) {
         write("/d/file", text);
@@ -134,6 +153,7 @@ TEST_P(FileSystemContract, WhatIsWrittenIsRead) {
 }
 
 TEST_P(FileSystemContract, WritingLeavesNothingBeside) {
+    checks("platform/FileSystem.h", "no temporary file stays for good.");
     write("/d/file", "one");
     write("/d/file", "two");
     EXPECT_EQ(codeOf(files_.createFile("/d/file", bytes("three"), {})), 0);
@@ -141,12 +161,16 @@ TEST_P(FileSystemContract, WritingLeavesNothingBeside) {
 }
 
 TEST_P(FileSystemContract, AFileNeedsItsDirectory) {
+    checks("platform/FileSystem.h",
+           "ENOENT: the item is missing, or the directory that it is to stand in.");
     EXPECT_EQ(codeOf(files_.writeFileAtomically("/d/e/file", bytes("x"))), ENOENT);
     EXPECT_EQ(codeOf(files_.createFile("/d/e/file", bytes("x"), {})), ENOENT);
     EXPECT_EQ(codeOf(files_.readFile("/d/e/file")), ENOENT);
 }
 
 TEST_P(FileSystemContract, AFileDoesNotReplaceADirectory) {
+    checks("platform/FileSystem.h",
+           "EISDIR: a directory stands where a file is to be read or written.");
     make("/d/e");
     EXPECT_EQ(codeOf(files_.writeFileAtomically("/d/e", bytes("x"))), EISDIR);
     EXPECT_EQ(codeOf(files_.createFile("/d/e", bytes("x"), {})), EISDIR);
@@ -154,20 +178,26 @@ TEST_P(FileSystemContract, AFileDoesNotReplaceADirectory) {
 }
 
 TEST_P(FileSystemContract, CreatingReplacesWhatWasThere) {
+    checks("platform/FileSystem.h",
+           "Creates or replaces a file, not atomically: nothing is synced.");
     write("/d/file", "old and longer");
     EXPECT_EQ(codeOf(files_.createFile("/d/file", bytes("new"), {})), 0);
     EXPECT_EQ(read("/d/file"), "new");
 }
 
 TEST_P(FileSystemContract, WhatIsMissingHasNoAttributes) {
+    checks("platform/FileSystem.h",
+           "ENOENT: the item is missing, or the directory that it is to stand in.");
     EXPECT_EQ(codeOf(files_.attributes("/d/missing")), ENOENT);
     EXPECT_EQ(codeOf(files_.setTimesToNow("/d/missing")), ENOENT);
+    checks("platform/FileSystem.h", "Sets the times of last access and modification to now.");
     write("/d/file", "x");
     EXPECT_EQ(codeOf(files_.setTimesToNow("/d/file")), 0);
     EXPECT_EQ(codeOf(files_.setTimesToNow("/d")), 0);
 }
 
 TEST_P(FileSystemContract, AFileIsNoDirectory) {
+    checks("platform/FileSystem.h", "ENOTDIR: the path goes on below a file.");
     write("/d/file", "x");
     EXPECT_EQ(codeOf(files_.readFile("/d/file/below")), ENOTDIR);
     EXPECT_EQ(codeOf(files_.writeFileAtomically("/d/file/below", bytes("x"))), ENOTDIR);
@@ -176,6 +206,8 @@ TEST_P(FileSystemContract, AFileIsNoDirectory) {
 }
 
 TEST_P(FileSystemContract, RemovingTakesEverythingBelow) {
+    checks("platform/FileSystem.h",
+           "Removes a file, a link (not what it points to) or a directory with everything in it,");
     make("/d/e/f");
     write("/d/e/f/file", "x");
     write("/d/kept", "x");
@@ -185,6 +217,8 @@ TEST_P(FileSystemContract, RemovingTakesEverythingBelow) {
 }
 
 TEST_P(FileSystemContract, RemovingALinkLeavesWhatItPointsTo) {
+    checks("platform/FileSystem.h",
+           "Removes a file, a link (not what it points to) or a directory with everything in it,");
     make("/d/target");
     write("/d/target/file", "kept");
     system_->addLink("/d/link", "/d/target");
@@ -197,6 +231,7 @@ TEST_P(FileSystemContract, RemovingALinkLeavesWhatItPointsTo) {
 }
 
 TEST_P(FileSystemContract, MovingTakesEverythingAlong) {
+    checks("platform/FileSystem.h", "Renames.");
     make("/d/e");
     write("/d/e/file", "text");
     EXPECT_EQ(codeOf(files_.moveItem("/d/e", "/d/f")), 0);
@@ -205,6 +240,7 @@ TEST_P(FileSystemContract, MovingTakesEverythingAlong) {
 }
 
 TEST_P(FileSystemContract, MovingReplacesNothing) {
+    checks("platform/FileSystem.h", "Renames. EEXIST when something stands at `to`.");
     write("/d/from", "one");
     write("/d/to", "two");
     make("/d/directory");
@@ -215,6 +251,8 @@ TEST_P(FileSystemContract, MovingReplacesNothing) {
 }
 
 TEST_P(FileSystemContract, MovingNeedsBothEnds) {
+    checks("platform/FileSystem.h",
+           "ENOENT: the item is missing, or the directory that it is to stand in.");
     write("/d/from", "kept");
     EXPECT_EQ(codeOf(files_.moveItem("/d/missing", "/d/to")), ENOENT);
     EXPECT_EQ(codeOf(files_.moveItem("/d/from", "/d/missing/to")), ENOENT);
@@ -222,12 +260,14 @@ TEST_P(FileSystemContract, MovingNeedsBothEnds) {
 }
 
 TEST_P(FileSystemContract, ADirectoryDoesNotMoveIntoItself) {
+    checks("platform/FileSystem.h", "EINVAL when `to` lies inside `from`.");
     make("/d/e");
     EXPECT_EQ(codeOf(files_.moveItem("/d/e", "/d/e/f")), EINVAL);
     EXPECT_TRUE(files_.itemExists("/d/e"));
 }
 
 TEST_P(FileSystemContract, CopyingLeavesTheSource) {
+    checks("platform/FileSystem.h", "Copies a regular file.");
     write("/d/from", "text");
     EXPECT_EQ(codeOf(files_.copyItem("/d/from", "/d/to")), 0);
     EXPECT_EQ(read("/d/from"), "text");
@@ -235,6 +275,7 @@ TEST_P(FileSystemContract, CopyingLeavesTheSource) {
 }
 
 TEST_P(FileSystemContract, CopyingReplacesNothing) {
+    checks("platform/FileSystem.h", "Copies a regular file. EEXIST when something stands at `to`.");
     write("/d/from", "one");
     write("/d/to", "two");
     EXPECT_EQ(codeOf(files_.copyItem("/d/from", "/d/to")), EEXIST);
@@ -244,16 +285,19 @@ TEST_P(FileSystemContract, CopyingReplacesNothing) {
 }
 
 TEST_P(FileSystemContract, OnlyRegularFilesAreReadOrCopied) {
+    checks("platform/FileSystem.h", "Nothing but regular files is ever read or copied:");
     make("/d/e");
     system_->addPipe("/d/pipe");
     EXPECT_EQ(codeOf(files_.readFile("/d/e")), EISDIR);
     EXPECT_EQ(codeOf(files_.copyItem("/d/e", "/d/to")), EISDIR);
+    checks("platform/FileSystem.h", "a device or a pipe is refused without waiting on it.");
     EXPECT_EQ(codeOf(files_.readFile("/d/pipe")), EINVAL);
     EXPECT_EQ(codeOf(files_.copyItem("/d/pipe", "/d/to")), EINVAL);
     EXPECT_FALSE(files_.itemExists("/d/to"));
 }
 
 TEST_P(FileSystemContract, LinksAreFollowed) {
+    checks("platform/FileSystem.h", "a link at the end of a path is followed inside the root;");
     make("/d/e");
     write("/d/e/file", "text");
     system_->addLink("/d/relative", "e");
@@ -266,6 +310,9 @@ TEST_P(FileSystemContract, LinksAreFollowed) {
 }
 
 TEST_P(FileSystemContract, NothingLeadsOutOfTheRoot) {
+    checks("platform/FileSystem.h",
+           "they are resolved inside the device's root, links and \"..\" included, and lead "
+           "nowhere else.");
     write("/d/file", "inside");
     system_->addLink("/d/up", "../../../..");
     system_->addLink("/d/passwd", "/etc/passwd");
@@ -276,15 +323,18 @@ TEST_P(FileSystemContract, NothingLeadsOutOfTheRoot) {
 }
 
 TEST_P(FileSystemContract, ALinkToNothingIsNotThereButInTheWay) {
+    checks("platform/FileSystem.h", "A link that leads to nothing is neither.");
     system_->addLink("/d/link", "missing");
     write("/d/file", "x");
     EXPECT_FALSE(files_.itemExists("/d/link"));
     EXPECT_EQ(codeOf(files_.readFile("/d/link")), ENOENT);
+    checks("platform/FileSystem.h", "EEXIST when something stands at `to`.");
     EXPECT_EQ(codeOf(files_.moveItem("/d/file", "/d/link")), EEXIST);
     EXPECT_EQ(codeOf(files_.copyItem("/d/file", "/d/link")), EEXIST);
 }
 
 TEST_P(FileSystemContract, LinksInACircleAreRefused) {
+    checks("platform/FileSystem.h", "ELOOP: links lead in a circle.");
     system_->addLink("/d/a", "b");
     system_->addLink("/d/b", "a");
     EXPECT_EQ(codeOf(files_.readFile("/d/a")), ELOOP);
@@ -292,6 +342,7 @@ TEST_P(FileSystemContract, LinksInACircleAreRefused) {
 }
 
 TEST_P(FileSystemContract, AWrittenFileTakesALinksPlace) {
+    checks("platform/FileSystem.h", "A link at the path is replaced, not followed.");
     write("/d/target", "kept");
     system_->addLink("/d/link", "target");
     write("/d/link", "new");
@@ -300,6 +351,8 @@ TEST_P(FileSystemContract, AWrittenFileTakesALinksPlace) {
 }
 
 TEST_P(FileSystemContract, TheTemporaryDirectoryIsThere) {
+    checks("platform/FileSystem.h",
+           "The process's directory for temporary files, without a slash at its end. It exists,");
     const std::string path = files_.temporaryDirectory();
     EXPECT_TRUE(path.starts_with('/'));
     EXPECT_FALSE(path.ends_with('/'));
@@ -339,6 +392,7 @@ operationsOnAPath() {
 }
 
 TEST_P(FileSystemContract, EveryOperationRefusesAPathThatIsNone) {
+    checks("platform/FileSystem.h", "EINVAL: the path is empty, not absolute or holds a NUL;");
     using std::string_literals::operator""s;
     write("/d/file", "kept");
     for (const std::string& path : {""s, "d/file"s, "/d/fi\0le"s}) {
@@ -351,6 +405,8 @@ TEST_P(FileSystemContract, EveryOperationRefusesAPathThatIsNone) {
 }
 
 TEST_P(FileSystemContract, EveryOperationRefusesAPathThatIsTooLong) {
+    checks("platform/FileSystem.h",
+           "ENAMETOOLONG: a name has more than 255 bytes, or the path more than the device takes.");
     write("/d/file", "kept");
     std::string longPath = "/d";
     while (longPath.size() < 5000) longPath += "/name";
@@ -362,6 +418,9 @@ TEST_P(FileSystemContract, EveryOperationRefusesAPathThatIsTooLong) {
 }
 
 TEST_P(FileSystemContract, AnErrorNamesThePath) {
+    checks("platform/FileSystem.h",
+           "Failures are errors of `kPosixErrorDomain` with the errno value and a sentence that "
+           "names the operation and the path.");
     const Result<Bytes> contents = files_.readFile("/d/missing");
     ASSERT_FALSE(contents);
     EXPECT_THAT(contents.error().description(), HasSubstr("/d/missing"));

@@ -24,6 +24,7 @@ class NamedNotificationsContract : public SystemContract {};
 APPSYNC_CONTRACT_SUITE(NamedNotificationsContract, systemPorts({OptionalService::Notifications}));
 
 TEST_P(NamedNotificationsContract, AStateIsSeenByEverybody) {
+    checks("platform/Notifications.h", "Every process sees it from now on.");
     NamedNotifications& notifications = system_->notifications();
     const auto registration = notifications.registerForState(kName);
     ASSERT_EQ(registration.status, 0U);
@@ -34,6 +35,7 @@ TEST_P(NamedNotificationsContract, AStateIsSeenByEverybody) {
 }
 
 TEST_P(NamedNotificationsContract, EveryRegistrationOfANameSetsTheSameState) {
+    checks("platform/Notifications.h", "All tokens of a name stand for one state.");
     NamedNotifications& notifications = system_->notifications();
     const auto first = notifications.registerForState(kName);
     const auto second = notifications.registerForState(kName);
@@ -43,6 +45,7 @@ TEST_P(NamedNotificationsContract, EveryRegistrationOfANameSetsTheSameState) {
 }
 
 TEST_P(NamedNotificationsContract, TokensOfDifferentNamesAreDifferent) {
+    checks("platform/Notifications.h", "Registers for a state token of the name.");
     NamedNotifications& notifications = system_->notifications();
     const auto one = notifications.registerForState(kName);
     const auto other = notifications.registerForState("com.example.other");
@@ -65,6 +68,8 @@ APPSYNC_CONTRACT_SUITE(NotificationCenterContract,
                        systemPorts({OptionalService::NotificationCenter}));
 
 TEST_P(NotificationCenterContract, AnObserverIsCalledForItsNameOnly) {
+    checks("platform/Notifications.h",
+           "From now on `callback` is called when a notification of the name is posted by anyone.");
     const auto observer = std::make_shared<int>(1);
     observe(observer, kName);
     system_->post("com.example.other");
@@ -74,6 +79,7 @@ TEST_P(NotificationCenterContract, AnObserverIsCalledForItsNameOnly) {
 }
 
 TEST_P(NotificationCenterContract, EveryObserverOfANameIsCalled) {
+    checks("platform/Notifications.h", "Calls every observer of the name.");
     const auto first = std::make_shared<int>(1);
     const auto second = std::make_shared<int>(2);
     observe(first, kName);
@@ -83,6 +89,7 @@ TEST_P(NotificationCenterContract, EveryObserverOfANameIsCalled) {
 }
 
 TEST_P(NotificationCenterContract, ARemovedObserverIsNotCalled) {
+    checks("platform/Notifications.h", "Ends that.");
     const auto observer = std::make_shared<int>(1);
     observe(observer, kName);
     system_->notificationCenter().removeObserver(observer.get(), kName);
@@ -91,6 +98,9 @@ TEST_P(NotificationCenterContract, ARemovedObserverIsNotCalled) {
 }
 
 TEST_P(NotificationCenterContract, AnObserverThatHasGoneIsCalledAsNull) {
+    checks("platform/Notifications.h",
+           "Called, on any thread, with the observer, which is kept alive meanwhile; with null "
+           "when the observer has gone.");
     auto observer = std::make_shared<int>(1);
     observe(observer, kName);
     observer.reset();

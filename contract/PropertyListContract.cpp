@@ -33,6 +33,7 @@ PropertyList everyKind() {
 }
 
 TEST_P(PropertyListContract, EveryKindComesBackFromBothEncodings) {
+    checks("platform/PropertyListSerialization.h", "Reads either encoding, told apart by content.");
     for (const auto format : {PropertyListFormat::Xml, PropertyListFormat::Binary}) {
         const Result<Bytes> written = lists_.serialize(everyKind(), format);
         ASSERT_TRUE(written);
@@ -43,12 +44,16 @@ TEST_P(PropertyListContract, EveryKindComesBackFromBothEncodings) {
 }
 
 TEST_P(PropertyListContract, BinaryIsVersionOne) {
+    checks("platform/PropertyListSerialization.h",
+           "Writes a value in one of the encodings (binary: version 1.0).");
     const Result<Bytes> written = lists_.serialize("text", PropertyListFormat::Binary);
     ASSERT_TRUE(written);
     EXPECT_EQ(std::string(written->begin(), written->begin() + 8), "bplist00");
 }
 
 TEST_P(PropertyListContract, ANullMarkerIsNeverWritten) {
+    checks("platform/PropertyListSerialization.h",
+           "Fails when the value holds a null marker, or a text that the encoding cannot carry.");
     const PropertyList hidden = PropertyList::map({{"key", PropertyList::array({PropertyList()})}});
     for (const auto format : {PropertyListFormat::Xml, PropertyListFormat::Binary}) {
         const Result<Bytes> written = lists_.serialize(hidden, format);
@@ -58,6 +63,9 @@ TEST_P(PropertyListContract, ANullMarkerIsNeverWritten) {
 }
 
 TEST_P(PropertyListContract, WhatIsNoPropertyListIsRefusedWithASentence) {
+    checks("platform/PropertyListSerialization.h",
+           "An error of `kPropertyListErrorDomain` says where (byte offset, or line and column) "
+           "and what was expected.");
     for (const std::string text : {"", "bplist00", "<plist", "no list at all"}) {
         const Result<PropertyList> read = lists_.parse(Bytes(text.begin(), text.end()));
         ASSERT_FALSE(read) << text;

@@ -33,6 +33,7 @@ class WorkQueuesContract : public SystemContract {
 APPSYNC_CONTRACT_SUITE(WorkQueuesContract, systemPorts());
 
 TEST_P(WorkQueuesContract, ASerialQueueRunsATaskBeforeSyncReturns) {
+    checks("platform/WorkQueues.h", "Runs the task and returns when it is done.");
     const auto queue = queues_.makeSerialQueue("queue");
     queue->sync([&] { note("task"); });
     note("after");
@@ -40,6 +41,7 @@ TEST_P(WorkQueuesContract, ASerialQueueRunsATaskBeforeSyncReturns) {
 }
 
 TEST_P(WorkQueuesContract, TasksOfOneSerialQueueNeverOverlap) {
+    checks("platform/WorkQueues.h", "Runs its tasks one at a time, in the order of submission.");
     const auto serial = queues_.makeSerialQueue("queue");
     int unguarded = 0;
     {
@@ -59,6 +61,7 @@ TEST_P(WorkQueuesContract, TasksOfOneSerialQueueNeverOverlap) {
 }
 
 TEST_P(WorkQueuesContract, ATaskOfOneSerialQueueMayUseAnother) {
+    checks("platform/WorkQueues.h", "a task of another queue may call it.");
     const auto outer = queues_.makeSerialQueue("outer");
     const auto inner = queues_.makeSerialQueue("inner");
     outer->sync([&] { inner->sync([&] { note("innermost"); }); });
@@ -66,12 +69,15 @@ TEST_P(WorkQueuesContract, ATaskOfOneSerialQueueMayUseAnother) {
 }
 
 TEST_P(WorkQueuesContract, AnEmptyGroupLetsThroughAtOnce) {
+    checks("platform/WorkQueues.h",
+           "Returns when every enter has been undone. At once when there is none.");
     const auto group = queues_.makeWaitGroup();
     group->wait();
     EXPECT_TRUE(group->waitFor(0ns));
 }
 
 TEST_P(WorkQueuesContract, AGroupWaitsForEveryLeave) {
+    checks("platform/WorkQueues.h", "Returns when every enter has been undone.");
     const auto group = queues_.makeWaitGroup();
     const auto operations = queues_.makeOperationQueue();
     for (int i = 0; i < 20; ++i) {
@@ -86,6 +92,7 @@ TEST_P(WorkQueuesContract, AGroupWaitsForEveryLeave) {
 }
 
 TEST_P(WorkQueuesContract, AGroupIsGoodForMoreThanOneWait) {
+    checks("platform/WorkQueues.h", "Returns when every enter has been undone.");
     const auto group = queues_.makeWaitGroup();
     const auto operations = queues_.makeOperationQueue();
     for (int round = 0; round < 3; ++round) {
@@ -97,6 +104,7 @@ TEST_P(WorkQueuesContract, AGroupIsGoodForMoreThanOneWait) {
 }
 
 TEST_P(WorkQueuesContract, AWaitForAGroupTimesOut) {
+    checks("platform/WorkQueues.h", "The same, but for at most `timeout`. False when it ran out.");
     const auto group = queues_.makeWaitGroup();
     group->enter();
     const auto before = system_->now();
@@ -107,6 +115,7 @@ TEST_P(WorkQueuesContract, AWaitForAGroupTimesOut) {
 }
 
 TEST_P(WorkQueuesContract, AGroupWithinItsTimeoutIsNoTimeout) {
+    checks("platform/WorkQueues.h", "The same, but for at most `timeout`. False when it ran out.");
     const auto group = queues_.makeWaitGroup();
     const auto operations = queues_.makeOperationQueue();
     group->enter();
@@ -115,6 +124,7 @@ TEST_P(WorkQueuesContract, AGroupWithinItsTimeoutIsNoTimeout) {
 }
 
 TEST_P(WorkQueuesContract, ASemaphoreGivesAsManyTurnsAsItHas) {
+    checks("platform/WorkQueues.h", "Waits without limit and takes one signal.");
     const auto semaphore = queues_.makeSemaphore(2);
     EXPECT_TRUE(semaphore->wait());
     EXPECT_TRUE(semaphore->wait());
@@ -123,6 +133,8 @@ TEST_P(WorkQueuesContract, ASemaphoreGivesAsManyTurnsAsItHas) {
 }
 
 TEST_P(WorkQueuesContract, ASemaphoreOrdersWhatWasWrittenBeforeItsSignal) {
+    checks("platform/WorkQueues.h",
+           "What was written before a signal is seen by who has waited for it.");
     const auto semaphore = queues_.makeSemaphore(0);
     const auto operations = queues_.makeOperationQueue();
     std::string written;
@@ -135,6 +147,9 @@ TEST_P(WorkQueuesContract, ASemaphoreOrdersWhatWasWrittenBeforeItsSignal) {
 }
 
 TEST_P(WorkQueuesContract, ALockExcludesOthersAcrossCallsOfThePlatform) {
+    checks(
+        "platform/WorkQueues.h",
+        "Mutual exclusion that may be held across calls of the platform (std::mutex may not be).");
     const auto lock = queues_.makeLock();
     int unguarded = 0;
     {
@@ -153,6 +168,9 @@ TEST_P(WorkQueuesContract, ALockExcludesOthersAcrossCallsOfThePlatform) {
 }
 
 TEST_P(WorkQueuesContract, OperationsStartInTheOrderOfSubmission) {
+    checks("platform/WorkQueues.h",
+           "Runs tasks on threads of its own, a bounded number at a time, started in the order of "
+           "submission.");
     {
         const auto operations = queues_.makeOperationQueue();
         operations->setMaximumConcurrentOperations(1);
@@ -162,6 +180,9 @@ TEST_P(WorkQueuesContract, OperationsStartInTheOrderOfSubmission) {
 }
 
 TEST_P(WorkQueuesContract, NoMoreOperationsThanAllowedRunAtATime) {
+    checks("platform/WorkQueues.h",
+           "Runs tasks on threads of its own, a bounded number at a time, started in the order of "
+           "submission.");
     std::size_t running = 0;
     std::size_t most = 0;
     const auto change = [&](std::size_t by) {
@@ -185,6 +206,9 @@ TEST_P(WorkQueuesContract, NoMoreOperationsThanAllowedRunAtATime) {
 }
 
 TEST_P(WorkQueuesContract, AsManyOperationsAsAllowedMeetEachOther) {
+    checks("platform/WorkQueues.h",
+           "Runs tasks on threads of its own, a bounded number at a time, started in the order of "
+           "submission.");
     constexpr int kCount = 10;
     const auto arrived = queues_.makeSemaphore(0);
     const auto open = queues_.makeSemaphore(0);
@@ -201,6 +225,7 @@ TEST_P(WorkQueuesContract, AsManyOperationsAsAllowedMeetEachOther) {
 }
 
 TEST_P(WorkQueuesContract, AnOperationMayAddAnother) {
+    checks("platform/WorkQueues.h", "A task may add others.");
     const auto group = queues_.makeWaitGroup();
     const auto operations = queues_.makeOperationQueue();
     operations->setMaximumConcurrentOperations(1);
@@ -217,6 +242,9 @@ TEST_P(WorkQueuesContract, AnOperationMayAddAnother) {
 }
 
 TEST_P(WorkQueuesContract, DestroyingAnOperationQueueWaitsForItsOperations) {
+    checks(
+        "platform/WorkQueues.h",
+        "Its destruction waits for the tasks that were submitted, unless one of them destroys it.");
     auto operations = queues_.makeOperationQueue();
     operations->setMaximumConcurrentOperations(2);
     for (int i = 0; i < 10; ++i) operations->add([&] { note("done"); });
@@ -225,6 +253,9 @@ TEST_P(WorkQueuesContract, DestroyingAnOperationQueueWaitsForItsOperations) {
 }
 
 TEST_P(WorkQueuesContract, AnOperationMayDestroyItsQueue) {
+    checks(
+        "platform/WorkQueues.h",
+        "Its destruction waits for the tasks that were submitted, unless one of them destroys it.");
     const auto group = queues_.makeWaitGroup();
     const auto ready = queues_.makeSemaphore(0);
     auto operations = queues_.makeOperationQueue();
@@ -241,6 +272,9 @@ TEST_P(WorkQueuesContract, AnOperationMayDestroyItsQueue) {
 }
 
 TEST_P(WorkQueuesContract, TheLastOwnerOfAQueueMayBeItsOwnOperation) {
+    checks(
+        "platform/WorkQueues.h",
+        "Its destruction waits for the tasks that were submitted, unless one of them destroys it.");
     const auto group = queues_.makeWaitGroup();
     const auto ready = queues_.makeSemaphore(0);
     std::shared_ptr<OperationQueue> operations = queues_.makeOperationQueue();
@@ -257,6 +291,8 @@ TEST_P(WorkQueuesContract, TheLastOwnerOfAQueueMayBeItsOwnOperation) {
 }
 
 TEST_P(WorkQueuesContract, DelayedWorkDoesNotRunBeforeItsTime) {
+    checks("platform/WorkQueues.h",
+           "Runs the task on the global default-priority queue, once `delay` has passed.");
     const auto group = queues_.makeWaitGroup();
     const auto before = system_->now();
     std::chrono::nanoseconds after{0};
@@ -270,6 +306,8 @@ TEST_P(WorkQueuesContract, DelayedWorkDoesNotRunBeforeItsTime) {
 }
 
 TEST_P(WorkQueuesContract, DelayedWorkMayScheduleMore) {
+    checks("platform/WorkQueues.h",
+           "Runs the task on the global default-priority queue, once `delay` has passed.");
     const auto group = queues_.makeWaitGroup();
     group->enter();
     queues_.runAfter(1ms, [&] {
@@ -284,6 +322,8 @@ TEST_P(WorkQueuesContract, DelayedWorkMayScheduleMore) {
 }
 
 TEST_P(WorkQueuesContract, WorkWithoutDelayRunsToo) {
+    checks("platform/WorkQueues.h",
+           "Runs the task on the global default-priority queue, once `delay` has passed.");
     const auto group = queues_.makeWaitGroup();
     group->enter();
     queues_.runAfter(0ns, [&] { group->leave(); });

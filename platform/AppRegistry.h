@@ -138,21 +138,23 @@ class AppRegistry {
     /// Installs a package. `options` is a map: `PackageTypeKey` = `PackageTypeCustomer` (any other
     /// is refused), `BundleIdentifierKey` = the identifier that the package must have. Replaces an
     /// installed version and takes the placeholder away; on failure both are as before. The file is
-    /// only read: the plug-in removes it afterwards.
+    /// only read: the plug-in removes it afterwards. An error when there is no package at the path.
     virtual Status installPackage(const FileURL& package, const PropertyList& options) = 0;
 
     /// Installs a directory as a placeholder; the registry takes its own copy, and leaves the
     /// directory to whoever made it. `options` is a map: `PackageTypeKey` =
     /// `PackageTypePlaceholder` (any other is refused), `BundleIdentifierKey`, `InstallTypeKey`,
-    /// and optionally `StoreMetadataKey` and `AppSinfKey`. An installed application that the
-    /// placeholder covers stays usable; a placeholder that stands already is replaced, and its
-    /// install begins anew, with a new record.
+    /// and optionally `StoreMetadataKey` and `AppSinfKey`. The store metadata comes to stand in the
+    /// placeholder's container, as "VessikMetadata.plist". An error when there is no bundle at the
+    /// path. An installed application that the placeholder covers stays usable; a placeholder that
+    /// stands already is replaced, and its install begins anew, with a new record.
     virtual Status installPlaceholderBundle(const FileURL& directory,
                                             const PropertyList& options) = 0;
 
     /// Uninstalls. `options` is a map or null (no options). The placeholder goes first: where one
     /// covers an installed application, it alone is removed. With `UninstallPlaceholderOnlyKey`
-    /// true the application is never touched. An error when there is nothing to remove.
+    /// true the application is never touched. What is removed goes with its container. An error
+    /// when there is nothing to remove.
     ///
     /// The plug-in calls it without options after each direct install that failed, to take the
     /// placeholder away. Where a package comes that nobody asked for, no placeholder covers the

@@ -9,7 +9,8 @@
 
 namespace appsync {
 
-/// Whom a new file or directory belongs to: account names of the device.
+/// Whom a new file or directory belongs to: account names of the device. One that the device does
+/// not know is refused with EINVAL, and nothing is made.
 struct FileAttributes {
     std::optional<std::string> owner;
     std::optional<std::string> group;
@@ -28,6 +29,16 @@ struct ItemAttributes {
 /// may). Failures are errors of `kPosixErrorDomain` with the errno value and a sentence that names
 /// the operation and the path. Nothing but regular files is ever read or copied: a link at the end
 /// of a path is followed inside the root; a device or a pipe is refused without waiting on it.
+///
+/// What the errno values say, in every operation that has an error:
+///
+/// - ENOENT: the item is missing, or the directory that it is to stand in.
+/// - ENOTDIR: the path goes on below a file.
+/// - EISDIR: a directory stands where a file is to be read or written.
+/// - EINVAL: the path is empty, not absolute or holds a NUL; what is read or copied is neither a
+///   file nor a directory.
+/// - ENAMETOOLONG: a name has more than 255 bytes, or the path more than the device takes.
+/// - ELOOP: links lead in a circle.
 ///
 /// The end of the process, however it comes, undoes nothing that a call has done. A loss of power
 /// may undo what was done since the device last synced its files, which it does with the install of
@@ -48,11 +59,12 @@ class FileSystem {
   public:
     virtual ~FileSystem() = default;
 
-    /// Whether a file or a directory stands there.
+    /// Whether a file or a directory stands there. A link that leads to nothing is neither.
     [[nodiscard]] virtual bool itemExists(const std::string& path) = 0;
     virtual Result<ItemAttributes> attributes(const std::string& path) = 0;
 
     /// Makes a directory; the parents too, if asked for, and then one that exists is no failure.
+    /// Else EEXIST, whatever stands there. A file in the way of it or of a parent is a failure.
     /// `attributes` may be null: whatever the device gives by default.
     virtual Status createDirectory(const std::string& path, bool withIntermediates,
                                    const FileAttributes* attributes) = 0;
@@ -61,7 +73,7 @@ class FileSystem {
     /// is not one step: a failure or a crash may leave a part. ENOENT when there is none.
     virtual Status removeItem(const std::string& path) = 0;
 
-    /// Renames. EEXIST when something stands at `to`.
+    /// Renames. EEXIST when something stands at `to`. EINVAL when `to` lies inside `from`.
     virtual Status moveItem(const std::string& from, const std::string& to) = 0;
 
     /// Copies a regular file. EEXIST when something stands at `to`.
@@ -73,7 +85,8 @@ class FileSystem {
     /// Writes the file whole: temporary file in the same directory, sync, rename; or otherwise,
     /// where that comes to the same. After a failure or a crash at any instant the old file is
     /// there or the new one, and no temporary file stays for good. Everybody reads the new one from
-    /// now on; a loss of power may bring an old one back, see above.
+    /// now on; a loss of power may bring an old one back, see above. A link at the path is
+    /// replaced, not followed.
     virtual Status writeFileAtomically(const std::string& path, ByteView contents) = 0;
 
     /// Creates or replaces a file, not atomically: nothing is synced. `attributes` as with

@@ -31,6 +31,7 @@ class HomeScreenConnection {
 
     /// Sets the icon layout from bytes that the host left in "DeskoraIconState.plist": the home
     /// screen's own form, which the plug-in does not look into. False when they were not taken.
+    /// Bytes of another form are not, and change nothing.
     virtual bool setIconState(ByteView state) = 0;
 
     /// The icon layout flattened: a property list whose root is an array of bundle identifiers in
@@ -48,7 +49,8 @@ class HomeScreenService {
 
     /// Asks that the application be ended, if it runs, and kept from running. `reason` says who
     /// asks (the plug-in gives 0, a platform numbers others of its own) and changes nothing in the
-    /// answer.
+    /// answer. Denied while the application goes on running. No such application when it is not
+    /// installed. Else granted, with an assertion; several may hold one application.
     [[nodiscard]] virtual TerminationAssertionResult takeTerminationAssertion(
         const std::string& identifier, std::uint64_t reason) = 0;
 };

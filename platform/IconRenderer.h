@@ -42,6 +42,7 @@ class IconRenderer {
     [[nodiscard]] virtual std::unique_ptr<IconImage> homeScreenIcon(const AppBundle& bundle) = 0;
 
     /// A destination for `imageCount` images of a type ("public.png") that writes into `buffer`.
+    /// Null for a type that it does not know.
     [[nodiscard]] virtual std::unique_ptr<ImageDestination> createImageDestination(
         std::string_view typeIdentifier, std::size_t imageCount, Bytes& buffer) = 0;
 };

@@ -53,7 +53,9 @@ class InstallCoordinatorObserver {
 
 /// One application's install, as the service coordinates it: a set of pieces, each of which may be
 /// there or not. When the pieces that its kind needs are there and every promise is complete, the
-/// service installs on threads of its own, and the coordinator is gone afterwards.
+/// service installs on threads of its own, and the coordinator is gone afterwards. An install that
+/// fails takes the placeholder away and leaves an installed version as it is; of an application
+/// that is being restored the placeholder stays, and a coordinator that waits for another package.
 ///
 /// An object is a handle on the service's record, which outlives it, and on a device the process
 /// too. Callable on any thread. Nothing throws. Each piece is to be asked for before it is set: a
@@ -97,7 +99,7 @@ class InstallCoordinator {
     virtual Status setUserDataPromise(const std::shared_ptr<OutOfBandPromise>& promise) = 0;
 
     [[nodiscard]] virtual bool hasPlaceholderPromise() const = 0;
-    /// Refuses null.
+    /// Refuses null, and the placeholder of another application.
     virtual Status setPlaceholderPromise(
         const std::shared_ptr<InstallPlaceholder>& placeholder) = 0;
 

@@ -9,7 +9,7 @@ namespace appsync {
 class LogHandle;
 
 /// Keeps the steps of installs for those who look into them later. Callable on any thread; never
-/// fails visibly. A record may be lost in a crash.
+/// fails visibly. A record may be lost in a crash. Records stand in the order of the calls.
 class InstallTransactionLog {
   public:
     virtual ~InstallTransactionLog() = default;

@@ -9,7 +9,7 @@
 namespace appsync {
 
 /// The installer's list of applications that were uninstalled on the device. Callable on any
-/// thread.
+/// thread. What the registry uninstalls for the plug-in is not on it.
 class InstallerService {
   public:
     virtual ~InstallerService() = default;

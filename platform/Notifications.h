@@ -22,8 +22,9 @@ class NamedNotifications {
 
     virtual ~NamedNotifications() = default;
 
-    /// Registers for a state token of the name.
+    /// Registers for a state token of the name. All tokens of a name stand for one state.
     virtual Registration registerForState(std::string_view name) = 0;
+    /// Every process sees it from now on.
     virtual void setState(int token, std::uint64_t state) = 0;
     virtual void post(std::string_view name) = 0;
 };

@@ -15,7 +15,8 @@ using Task = std::function<void()>;
 class SerialQueue {
   public:
     virtual ~SerialQueue() = default;
-    /// Runs the task and returns when it is done. Never call it from a task of the same queue.
+    /// Runs the task and returns when it is done. Never call it from a task of the same queue; a
+    /// task of another queue may call it.
     virtual void sync(const Task& task) = 0;
 };
 
@@ -32,7 +33,7 @@ class WaitGroup {
     [[nodiscard]] virtual bool waitFor(std::chrono::nanoseconds timeout) = 0;
 };
 
-/// A counting semaphore.
+/// A counting semaphore. What was written before a signal is seen by who has waited for it.
 class Semaphore {
   public:
     virtual ~Semaphore() = default;
@@ -53,7 +54,7 @@ class Lock {
 
 /// Runs tasks on threads of its own, a bounded number at a time, started in the order of
 /// submission. Its destruction waits for the tasks that were submitted, unless one of them destroys
-/// it.
+/// it. A task may add others.
 class OperationQueue {
   public:
     virtual ~OperationQueue() = default;

@@ -7,6 +7,7 @@
 #include "device/Device.h"
 #include "device/package/PackageWriter.h"
 #include "platform/SyncHost.h"
+#include "simulation/DeviceImage.h"
 #include "simulation/SimulatedPlatform.h"
 #include "system/JsonLogFacility.h"
 #include "system/property_list/PropertyListCodec.h"
@@ -47,6 +48,10 @@ class SimulatedDevice : public DeviceUnderTest {
         }
         platform_.installer.addUninstalled(identifier);
     }
+    bool cancelAsPerson(const std::string& identifier) override {
+        platform_.registry.cancelInstalls({identifier});
+        return true;
+    }
     void setPolicy(PolicyFeature feature, PolicyAnswer answer) override {
         platform_.policy.set(feature, answer);
     }
@@ -54,6 +59,11 @@ class SimulatedDevice : public DeviceUnderTest {
         platform_.backup.addRestoreData(identifier);
     }
     void turnCoordinationOn() override { platform_.coordination.setEnabled(true); }
+    bool reopen() override {
+        const CrashRecorder crashes(platform_);
+        platform_.reopen(crashes.imageOf(1));
+        return true;
+    }
     std::vector<std::string> scenarios() override { return platform_.transactions.scenarios(); }
 
   private:
@@ -166,6 +176,8 @@ std::unique_ptr<DeviceUnderTest> makeReferenceDevice() {
     return std::make_unique<ReferenceDevice>();
 }
 
-ContractPort referencePort() { return {"Reference", nullptr, makeReferenceDevice, {}}; }
+ContractPort referencePort() {
+    return {"Reference", nullptr, makeReferenceDevice, {OptionalService::Transfers}};
+}
 
 }  // namespace appsync
