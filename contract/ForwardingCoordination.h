@@ -173,7 +173,8 @@ class ForwardingCoordinatorObserver : public InstallCoordinatorObserver {
     void coordinatorCanceledWithReason(const std::shared_ptr<InstallCoordinator>& coordinator,
                                        const ErrorRecord& reason,
                                        CoordinationClient client) override {
-        if (const auto to = target()) to->coordinatorCanceledWithReason(coordinator, reason, client);
+        if (const auto to = target())
+            to->coordinatorCanceledWithReason(coordinator, reason, client);
     }
     void coordinatorShouldPrioritize(
         const std::shared_ptr<InstallCoordinator>& coordinator) override {

@@ -166,7 +166,9 @@ struct PercentOfOneHandle : ForwardingPathTransferPromise {
 };
 struct PercentOfAHundred : ForwardingPathTransferPromise {
     using ForwardingPathTransferPromise::ForwardingPathTransferPromise;
-    void setPercentComplete(double percent) override { target()->setPercentComplete(percent * 100); }
+    void setPercentComplete(double percent) override {
+        target()->setPercentComplete(percent * 100);
+    }
 };
 struct PathsAreForgotten : ForwardingPathTransferPromise {
     using ForwardingPathTransferPromise::ForwardingPathTransferPromise;
@@ -454,9 +456,7 @@ struct EarlierObserversHearToo : ForwardingCoordination {
 
 struct SecondCancelsCount : ForwardingCoordinator {
     using ForwardingCoordinator::ForwardingCoordinator;
-    std::optional<ErrorRecord> error() const override {
-        return last ? last : target()->error();
-    }
+    std::optional<ErrorRecord> error() const override { return last ? last : target()->error(); }
     void cancelForReason(const ErrorRecord& reason, CoordinationClient client) override {
         last = reason;
         target()->cancelForReason(reason, client);
@@ -555,8 +555,7 @@ struct UninstallsOnTheCallersThread : CoordinationWithPlatform {
 struct UninstallsTakeTheApplicationToo : CoordinationWithPlatform {
     using CoordinationWithPlatform::CoordinationWithPlatform;
     void uninstallApp(const std::string& identifier, UninstallCompletion completion) override {
-        if (platform.registry
-                .proxyForIdentifier(identifier, AppRegistry::Placeholders::Excluded)) {
+        if (platform.registry.proxyForIdentifier(identifier, AppRegistry::Placeholders::Excluded)) {
             const PropertyList only = PropertyList::map({{UninstallPlaceholderOnlyKey, true}});
             platform.registry.uninstallApplication(identifier, only).ignore();
         }
@@ -592,9 +591,9 @@ struct DelegatesHearOfEverybody : ForwardingCoordination {
 };
 struct DelegatesHearNothing : ForwardingCoordination {
     using ForwardingCoordination::ForwardingCoordination;
-    std::shared_ptr<AppInstallObserver> makeAppInstallObserver(
-        const std::string& serviceName, const std::set<CoordinationClient>&,
-        WeakListener delegate) override {
+    std::shared_ptr<AppInstallObserver> makeAppInstallObserver(const std::string& serviceName,
+                                                               const std::set<CoordinationClient>&,
+                                                               WeakListener delegate) override {
         return target().makeAppInstallObserver(serviceName, {}, std::move(delegate));
     }
 };
@@ -673,8 +672,7 @@ void addPromises(std::vector<Violator>& all) {
     v.device<WithAsset<PathsAreForgotten>>("PathsAreForgotten", path);
     v.device<WithCoordinator<WithAttachedAsset<PathsAreNotSet>>>("PathsAreNotSet", path);
     v.device<WithCoordinator<WithAttachedAsset<KeepingIsLost>>>(
-        "KeepingIsLost",
-        "What waited for this promise goes on, on threads of the service's own.");
+        "KeepingIsLost", "What waited for this promise goes on, on threads of the service's own.");
     v.device<WithCoordinator<WithAttachedAsset<ChangingAfterTheEnd>>>(
         "ChangingAfterTheEnd",
         "Nothing throws; a change of a promise that the service no longer has (its coordinator is "
@@ -731,9 +729,10 @@ void addPieces(Violators& v) {
     v.device<WithCoordinator<NobodyIsResponsible>>(
         "NobodyIsResponsible",
         "Whose task the package is where nobody has promised it; nothing when that is not said.");
-    v.device<WithCoordinator<NullPlaceholdersAreTaken>>("NullPlaceholdersAreTaken",
-                                                        "Refuses null.");
-    v.device<WithCoordinator<EveryPlaceholderIsTaken>>("EveryPlaceholderIsTaken", "Refuses null");
+    v.device<WithCoordinator<NullPlaceholdersAreTaken>>(
+        "NullPlaceholdersAreTaken", "Refuses null, and the placeholder of another application.");
+    v.device<WithCoordinator<EveryPlaceholderIsTaken>>(
+        "EveryPlaceholderIsTaken", "Refuses null, and the placeholder of another application.");
     v.device<WithCoordinator<DataIsNotWaitedFor>>(
         "DataIsNotWaitedFor",
         "When the pieces that its kind needs are there and every promise is complete, the service "
@@ -745,8 +744,7 @@ void addReports(Violators& v) {
         "PlaceholdersAreNotTold",
         "`coordinatorDidInstallPlaceholder:`: the placeholder stands on the home screen, or could "
         "not be put there: then the coordinator carries the error.");
-    const std::string completes =
-        "`coordinatorDidCompleteSuccessfully:`: the install has ended.";
+    const std::string completes = "`coordinatorDidCompleteSuccessfully:`: the install has ended.";
     v.device<WithCoordinator<WithListener<CompletionsAreNotTold>>>("CompletionsAreNotTold",
                                                                    completes);
     v.device<WithCoordinator<WithListener<CompletionsAreToldTwice>>>("CompletionsAreToldTwice",
@@ -768,8 +766,8 @@ void addReports(Violators& v) {
     v.device<WithCoordinator<CoordinatorObserversAreOwned>>(
         "CoordinatorObserversAreOwned",
         "Who hears of this coordinator, held weakly; kept alive while it is being called.");
-    v.device<EarlierObserversHearToo>(
-        "EarlierObserversHearToo", "One at a time: a later one takes the place of the earlier.");
+    v.device<EarlierObserversHearToo>("EarlierObserversHearToo",
+                                      "One at a time: a later one takes the place of the earlier.");
 }
 
 void addEnds(Violators& v) {

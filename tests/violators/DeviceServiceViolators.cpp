@@ -401,17 +401,21 @@ void addHomeScreen(std::vector<Violator>& all) {
                                              "Nothing when the home screen does not answer.");
     v.device<NoConnection>("NoConnection",
                            "The connection; null when the home screen cannot be reached.");
-    const std::string asks = "Asks that the application be ended, if it runs, and kept from running.";
-    v.device<RunningApplicationsAreGranted>("RunningApplicationsAreGranted", asks);
-    v.device<UnknownApplicationsAreGranted>("UnknownApplicationsAreGranted", asks);
-    v.device<EverythingIsDenied>("EverythingIsDenied", asks);
+    v.device<RunningApplicationsAreGranted>("RunningApplicationsAreGranted",
+                                            "Denied while the application goes on running.");
+    v.device<UnknownApplicationsAreGranted>("UnknownApplicationsAreGranted",
+                                            "No such application when it is not installed.");
+    v.device<EverythingIsDenied>(
+        "EverythingIsDenied", "Else granted, with an assertion; several may hold one application.");
     const std::string keeps =
         "Keeps a running application from running until the assertion is released, that is "
         "destroyed.";
     v.device<AssertionsDoNotHold>("AssertionsDoNotHold", keeps);
     v.device<AssertionsAreNeverReleased>("AssertionsAreNeverReleased", keeps);
     v.device<TheFirstReleaseIsEverybodys>("TheFirstReleaseIsEverybodys", keeps);
-    v.device<GrantedWithoutAnAssertion>("GrantedWithoutAnAssertion", keeps);
+    v.device<GrantedWithoutAnAssertion>(
+        "GrantedWithoutAnAssertion",
+        "Else granted, with an assertion; several may hold one application.");
     v.device<ReasonsMatter>(
         "ReasonsMatter",
         "`reason` says who asks (the plug-in gives 0, a platform numbers others of its own) and "
@@ -420,13 +424,13 @@ void addHomeScreen(std::vector<Violator>& all) {
 }
 
 void addPolicyAndBackup(std::vector<Violator>& all) {
-    Violators policy("platform/DevicePolicyService.h", "*DeviceServices*");
+    Violators policy("platform/DevicePolicyService.h", "*Policy*");
     policy.device<UnsetIsNo>("UnsetIsNo", "The policy service's tri-state answer; its numbers.");
     policy.device<FeaturesAreMixedUp>("FeaturesAreMixedUp", "The effective value at this moment.");
     policy.device<AnswersAreKept>("AnswersAreKept", "The effective value at this moment.");
     for (Violator& each : policy.take()) all.push_back(std::move(each));
 
-    Violators backup("platform/BackupService.h", "*DeviceServices*");
+    Violators backup("platform/BackupService.h", "*Backup*");
     const std::string holds = "Whether the service holds data to restore for the application.";
     backup.device<WithManager<NoRestoreData>>("NoRestoreData", holds);
     backup.device<WithManager<RestoreDataOfEverybody>>("RestoreDataOfEverybody", holds);
@@ -437,7 +441,7 @@ void addPolicyAndBackup(std::vector<Violator>& all) {
 }
 
 void addInstaller(std::vector<Violator>& all) {
-    Violators v("platform/InstallerService.h", "*DeviceServices*:*Reopen*");
+    Violators v("platform/InstallerService.h", "*Installer*:*Reopen*");
     const std::string map =
         "A map keyed by bundle identifier; nothing when the installer does not answer.";
     v.device<NothingWasUninstalled>("NothingWasUninstalled", map);
@@ -449,7 +453,8 @@ void addInstaller(std::vector<Violator>& all) {
     v.device<UnknownIdentifiersStopTheClearing>("UnknownIdentifiersStopTheClearing", takes);
     v.device<ClearingSaysThatItFailed>("ClearingSaysThatItFailed",
                                        "False when it could not: the list is then as before.");
-    v.add({"TheListDoesNotLast", nullptr,
+    v.add({"TheListDoesNotLast",
+           nullptr,
            [] { return std::make_unique<TheListDoesNotLast>(referencePort().makeDevice()); },
            {}},
           "The list outlives the process.");
@@ -457,10 +462,10 @@ void addInstaller(std::vector<Violator>& all) {
 }
 
 void addLogAndIcons(std::vector<Violator>& all) {
-    Violators log("platform/InstallTransactionLog.h", "*DeviceServices*");
+    Violators log("platform/InstallTransactionLog.h", "*TransactionLog*");
     const std::string keeps = "Keeps the steps of installs for those who look into them later.";
     log.device<ScenariosAreLost>("ScenariosAreLost", keeps);
-    log.device<ScenariosComeLate>("ScenariosComeLate", keeps);
+    log.device<ScenariosComeLate>("ScenariosComeLate", "Records stand in the order of the calls.");
     log.device<OutcomesAreInverted>("OutcomesAreInverted",
                                     "`logScenario`: something happened in a scenario.");
     log.device<TheSecondInitialisationCounts>("TheSecondInitialisationCounts",
@@ -469,9 +474,8 @@ void addLogAndIcons(std::vector<Violator>& all) {
     for (Violator& each : log.take()) all.push_back(std::move(each));
 
     Violators icons("platform/IconRenderer.h", "*IconRenderer*");
-    const std::string null =
-        "Callable on any thread; every result is the caller's, and null when the step fails.";
-    icons.device<EveryImageTypeIsKnown>("EveryImageTypeIsKnown", null);
+    icons.device<EveryImageTypeIsKnown>("EveryImageTypeIsKnown",
+                                        "Null for a type that it does not know.");
     icons.device<NoImageTypeIsKnown>(
         "NoImageTypeIsKnown",
         "A destination for `imageCount` images of a type (\"public.png\") that writes into "

@@ -219,9 +219,8 @@ struct ReadingStopsAtAZero : ForwardingFileSystem {
         auto contents = target().readFile(path);
         if (!contents) return contents;
         const std::string text(contents->begin(), contents->end());
-        return Bytes(contents->begin(),
-                     contents->begin() + static_cast<std::ptrdiff_t>(
-                                             std::min(text.find('\0'), text.size())));
+        return Bytes(contents->begin(), contents->begin() + static_cast<std::ptrdiff_t>(std::min(
+                                                                text.find('\0'), text.size())));
     }
 };
 struct TemporaryFilesStay : ForwardingFileSystem {
@@ -402,12 +401,11 @@ class PrefixedSystem : public SystemWith<PrefixedFileSystem> {
 };
 
 ContractPort prefixedPort() {
-    return {"PathsLeaveTheRoot",
-            [] {
-                return std::make_unique<PrefixedSystem>(makeSimulatedSystem(Scheduling::seeded(1)));
-            },
-            nullptr,
-            {}};
+    return {
+        "PathsLeaveTheRoot",
+        [] { return std::make_unique<PrefixedSystem>(makeSimulatedSystem(Scheduling::seeded(1))); },
+        nullptr,
+        {}};
 }
 
 }  // namespace
@@ -419,27 +417,27 @@ std::vector<Violator> fileSystemViolators() {
                                     "Whether a file or a directory stands there.");
     v.system<NoSizes>("NoSizes", "What stands at a path.");
     v.system<NothingIsADirectory>("NothingIsADirectory", "What stands at a path.");
-    v.system<ExistingParentsAreFailures>(
-        "ExistingParentsAreFailures",
-        "Makes a directory; the parents too, if asked for, and then one that exists is no failure.");
-    v.system<ParentsAreAlwaysMade>(
-        "ParentsAreAlwaysMade",
-        "Makes a directory; the parents too, if asked for, and then one that exists is no failure.");
-    v.system<ParentsAreNeverMade>(
-        "ParentsAreNeverMade",
-        "Makes a directory; the parents too, if asked for, and then one that exists is no failure.");
+    v.system<ExistingParentsAreFailures>("ExistingParentsAreFailures",
+                                         "Makes a directory; the parents too, if asked for, and "
+                                         "then one that exists is no failure.");
+    v.system<ParentsAreAlwaysMade>("ParentsAreAlwaysMade",
+                                   "Makes a directory; the parents too, if asked for, and then one "
+                                   "that exists is no failure.");
+    v.system<ParentsAreNeverMade>("ParentsAreNeverMade",
+                                  "Makes a directory; the parents too, if asked for, and then one "
+                                  "that exists is no failure.");
     v.system<DirectoriesBelongToNobody>(
         "DirectoriesBelongToNobody",
         "Whom a new file or directory belongs to: account names of the device.");
     v.system<GroupsAreForgotten>(
         "GroupsAreForgotten",
         "Whom a new file or directory belongs to: account names of the device.");
-    v.system<UnknownOwnersAreIgnored>("UnknownOwnersAreIgnored",
-                                      "A name that the device does not have is refused (EINVAL), "
-                                      "and nothing is made.");
-    v.system<UnknownOwnersLeaveADirectory>("UnknownOwnersLeaveADirectory",
-                                           "A name that the device does not have is refused "
-                                           "(EINVAL), and nothing is made.");
+    v.system<UnknownOwnersAreIgnored>(
+        "UnknownOwnersAreIgnored",
+        "One that the device does not know is refused with EINVAL, and nothing is made.");
+    v.system<UnknownOwnersLeaveADirectory>(
+        "UnknownOwnersLeaveADirectory",
+        "One that the device does not know is refused with EINVAL, and nothing is made.");
     v.system<OnlyFilesAreRemoved>(
         "OnlyFilesAreRemoved",
         "Removes a file, a link (not what it points to) or a directory with everything in it, "
@@ -486,13 +484,10 @@ std::vector<Violator> fileSystemViolators() {
         "RemovesBeforeItWrites",
         "Writes the file whole: temporary file in the same directory, sync, rename; or otherwise, "
         "where that comes to the same.");
-    v.system<WritesThroughLinks>(
-        "WritesThroughLinks",
-        "Writes the file whole: temporary file in the same directory, sync, rename; or otherwise, "
-        "where that comes to the same.");
+    v.system<WritesThroughLinks>("WritesThroughLinks",
+                                 "A link at the path is replaced, not followed.");
     v.system<CreatingDoesNotReplace>(
-        "CreatingDoesNotReplace",
-        "Creates or replaces a file, not atomically: nothing is synced.");
+        "CreatingDoesNotReplace", "Creates or replaces a file, not atomically: nothing is synced.");
     v.system<CreatingDoesNotTruncate>(
         "CreatingDoesNotTruncate",
         "Creates or replaces a file, not atomically: nothing is synced.");
@@ -506,7 +501,8 @@ std::vector<Violator> fileSystemViolators() {
         "It exists, and what is in it goes with the process: the device empties it before the next "
         "one begins.");
     v.system<PathsEndAtAZero>("PathsEndAtAZero", "A path that holds a NUL is refused.");
-    v.system<RelativePathsAreTaken>("RelativePathsAreTaken", "Paths are absolute device paths;");
+    v.system<RelativePathsAreTaken>("RelativePathsAreTaken",
+                                    "EINVAL: the path is empty, not absolute or holds a NUL;");
     v.add(prefixedPort(),
           "Paths are absolute device paths; they are resolved inside the device's root, links and "
           "\"..\" included, and lead nowhere else.");

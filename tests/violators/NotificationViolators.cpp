@@ -139,12 +139,12 @@ std::vector<Violator> notificationViolators() {
     v.system<EveryRegistrationFails>("EveryRegistrationFails",
                                      "0 when the registration succeeded.");
     const std::string state = "System-wide named notifications that carry a 64-bit state.";
-    v.system<StatesAreNotKept>("StatesAreNotKept", state);
+    v.system<StatesAreNotKept>("StatesAreNotKept", "Every process sees it from now on.");
     v.system<StatesOfThirtyTwoBits>("StatesOfThirtyTwoBits", state);
     v.system<OneTokenForAllNames>("OneTokenForAllNames",
                                   "Registers for a state token of the name.");
     v.system<LaterRegistrationsSetNothing>("LaterRegistrationsSetNothing",
-                                           "Registers for a state token of the name.");
+                                           "All tokens of a name stand for one state.");
     const std::string now =
         "From now on `callback` is called when a notification of the name is posted by anyone.";
     v.system<EveryNameIsOne>("EveryNameIsOne", now);

@@ -44,7 +44,8 @@ struct NoFirstReport : Between {
     using Between::Between;
     void applicationInstallsArePrioritized(const Proxies& prioritized,
                                            const Proxies& paused) override {
-        if (!first) ForwardingRegistryObserver::applicationInstallsArePrioritized(prioritized, paused);
+        if (!first)
+            ForwardingRegistryObserver::applicationInstallsArePrioritized(prioritized, paused);
         first = false;
     }
     bool first = true;
@@ -73,7 +74,8 @@ struct OnlyAFirstReport : Between {
     using Between::Between;
     void applicationInstallsArePrioritized(const Proxies& prioritized,
                                            const Proxies& paused) override {
-        if (first) ForwardingRegistryObserver::applicationInstallsArePrioritized(prioritized, paused);
+        if (first)
+            ForwardingRegistryObserver::applicationInstallsArePrioritized(prioritized, paused);
         first = false;
     }
     bool first = true;
@@ -133,9 +135,9 @@ struct DemotedAreUnderWay : Between {
         Proxies all = prioritized;
         platform.registry.enumerateBundles(
             AppRegistry::kEveryBundle, [&](const AppProxy& proxy, bool&) {
-                if (proxy.state.placeholder && (proxy.installType == kInstallTypeDowngrade ||
-                                                proxy.installType ==
-                                                    kInstallTypeIntentionalDowngrade)) {
+                if (proxy.state.placeholder &&
+                    (proxy.installType == kInstallTypeDowngrade ||
+                     proxy.installType == kInstallTypeIntentionalDowngrade)) {
                     all.push_back(proxy);
                 }
             });

@@ -166,8 +166,8 @@ struct WalksGoOnLater : RegistryWithPlatform {
     using RegistryWithPlatform::RegistryWithPlatform;
     void enumerateBundles(BundleType type, const ProxyCallback& callback) override {
         std::vector<AppProxy> proxies;
-        target().enumerateBundles(
-            type, [&](const AppProxy& proxy, bool&) { proxies.push_back(proxy); });
+        target().enumerateBundles(type,
+                                  [&](const AppProxy& proxy, bool&) { proxies.push_back(proxy); });
         queues().runAfter(std::chrono::nanoseconds(0), [proxies, callback] {
             bool stop = false;
             for (const AppProxy& proxy : proxies) {
@@ -258,8 +258,7 @@ struct UpdatesKeepTheOldVersion : ForwardingAppRegistry {
     }
     Status installPackage(const FileURL& package, const PropertyList& options) override {
         Status status = target().installPackage(package, options);
-        const auto now =
-            target().proxyForIdentifier(identifierOf(options), Placeholders::Excluded);
+        const auto now = target().proxyForIdentifier(identifierOf(options), Placeholders::Excluded);
         if (now) versions.emplace(now->applicationIdentifier, now->bundleVersion.value_or(""));
         return status;
     }
@@ -535,7 +534,8 @@ void addInstalls(Violators& v) {
     v.device<PlaceholdersStay>("PlaceholdersStay", replaces);
     v.device<FailedInstallsRemoveTheVersion>("FailedInstallsRemoveTheVersion", replaces);
     v.device<FailedInstallsRemoveThePlaceholder>("FailedInstallsRemoveThePlaceholder", replaces);
-    v.device<MissingPackagesAreInstalled>("MissingPackagesAreInstalled", "Installs a package.");
+    v.device<MissingPackagesAreInstalled>("MissingPackagesAreInstalled",
+                                          "An error when there is no package at the path.");
     const std::string legal =
         "It refuses identifiers that are not legal (1 to 255 bytes of letters, digits, '.', '-', "
         "'_'; not \".\" or \"..\") with an error of `kRegistryErrorDomain`; for errors that a "
@@ -543,8 +543,7 @@ void addInstalls(Violators& v) {
     v.device<RefusalsOfAnotherDomain>("RefusalsOfAnotherDomain", legal);
     v.device<PackageErrorsOfAnotherDomain>("PackageErrorsOfAnotherDomain", legal);
     v.device<UninstallErrorsWithoutADomain>("UninstallErrorsWithoutADomain", legal);
-    v.device<OneInstallAtATime>("OneInstallAtATime",
-                                "Callable on any thread, by several at once.");
+    v.device<OneInstallAtATime>("OneInstallAtATime", "Callable on any thread, by several at once.");
 }
 
 void addPlaceholders(Violators& v) {
@@ -562,7 +561,9 @@ void addPlaceholders(Violators& v) {
     v.device<NullSinfIsRefused>("NullSinfIsRefused", options);
     v.device<StoreMetadataIsNotWritten>(
         "StoreMetadataIsNotWritten",
-        "The directory that holds the bundle and the store metadata file.", Around::OurDevice);
+        "The store metadata comes to stand in the placeholder's container, as "
+        "\"VessikMetadata.plist\".",
+        Around::OurDevice);
     const std::string covers =
         "An installed application that the placeholder covers stays usable; a placeholder that "
         "stands already is replaced, and its install begins anew, with a new record.";
@@ -579,7 +580,8 @@ void addPlaceholders(Violators& v) {
                                           "An error when there is nothing to remove.");
     v.device<UninstallsNeedOptions>("UninstallsNeedOptions",
                                     "`options` is a map or null (no options).");
-    v.device<UninstallsLeaveFiles>("UninstallsLeaveFiles", "Uninstalls.");
+    v.device<UninstallsLeaveFiles>("UninstallsLeaveFiles",
+                                   "What is removed goes with its container.");
 }
 
 }  // namespace

@@ -93,10 +93,16 @@ class ForwardingDevice : public DeviceUnderTest {
     Platform services() override { return device_->services(); }
     std::string addPackage(const BundleInfo& info) override { return device_->addPackage(info); }
     bool reopen() override { return device_->reopen(); }
+    Bytes iconState(const std::vector<std::string>& identifiers) override {
+        return device_->iconState(identifiers);
+    }
     bool run(const std::string& identifier) override { return device_->run(identifier); }
     void quit(const std::string& identifier) override { device_->quit(identifier); }
     void uninstallAsPerson(const std::string& identifier) override {
         device_->uninstallAsPerson(identifier);
+    }
+    bool cancelAsPerson(const std::string& identifier) override {
+        return device_->cancelAsPerson(identifier);
     }
     void setPolicy(PolicyFeature feature, PolicyAnswer answer) override {
         device_->setPolicy(feature, answer);
@@ -114,14 +120,11 @@ class ForwardingDevice : public DeviceUnderTest {
 /// The platform with one service in another's place.
 template <typename Service>
 Platform substituted(const Platform& good, Service& service) {
-    std::tuple services{&good.host,          &good.log,
-                        &good.registry,      &good.installer,
-                        &good.coordination,  &good.policy,
-                        &good.backup,        &good.homeScreen,
-                        &good.icons,         &good.transactions,
-                        &good.queues,        &good.files,
-                        &good.propertyLists, &good.notifications,
-                        &good.notificationCenter};
+    std::tuple services{&good.host,          &good.log,           &good.registry,
+                        &good.installer,     &good.coordination,  &good.policy,
+                        &good.backup,        &good.homeScreen,    &good.icons,
+                        &good.transactions,  &good.queues,        &good.files,
+                        &good.propertyLists, &good.notifications, &good.notificationCenter};
     std::get<Service*>(services) = &service;
     return std::apply([](auto*... each) { return Platform{*each...}; }, services);
 }
@@ -208,7 +211,8 @@ enum class Around { Simulation, OurDevice };
 
 template <typename Wrapper>
 ContractPort deviceWith(const std::string& name, Around base = Around::Simulation) {
-    return {name, nullptr,
+    return {name,
+            nullptr,
             [base]() -> std::unique_ptr<DeviceUnderTest> {
                 return std::make_unique<DeviceWith<Wrapper>>(
                     base == Around::Simulation ? makeSimulatedDevice(Scheduling::seeded(1))

@@ -337,9 +337,9 @@ std::vector<Violator> workQueueViolators() {
     v.system<WithSerialQueue<RunningTwice>>("SyncRunsTwice", sync);
     v.system<WithSerialQueue<Losing>>("SyncLosesTasks", sync);
     v.system<WithSerialQueue<Overlapping>>("SerialTasksOverlap", serial);
-    v.system<OneSerialQueueForAll>("OneSerialQueueForAll",
-                                   "Never call it from a task of the same queue.");
-    v.system<WithGroup<NotWaiting>>("GroupDoesNotWait", "Returns when every enter has been undone.");
+    v.system<OneSerialQueueForAll>("OneSerialQueueForAll", "a task of another queue may call it.");
+    v.system<WithGroup<NotWaiting>>("GroupDoesNotWait",
+                                    "Returns when every enter has been undone.");
     v.system<WithGroup<NeverEmpty>>("GroupIsNeverEmpty", "At once when there is none.");
     v.system<WithGroup<NeverTimingOut>>("GroupNeverTimesOut", "False when it ran out.");
     v.system<WithGroup<AlwaysTimingOut>>("GroupAlwaysTimesOut", "False when it ran out.");

@@ -50,10 +50,9 @@ const std::map<std::string, std::string>& knownToEscape() {
 
 std::vector<Violator> allViolators() {
     std::vector<Violator> all;
-    for (auto* violators :
-         {fileSystemViolators, workQueueViolators, propertyListViolators, notificationViolators,
-          registryViolators, registryObserverViolators, progressViolators, deviceServiceViolators,
-          coordinationViolators}) {
+    for (auto* violators : {fileSystemViolators, workQueueViolators, propertyListViolators,
+                            notificationViolators, registryViolators, registryObserverViolators,
+                            progressViolators, deviceServiceViolators, coordinationViolators}) {
         for (Violator& each : violators()) all.push_back(std::move(each));
     }
     return all;
@@ -171,8 +170,7 @@ int countWrong(const TemporaryMachineDirectory& directory, const std::vector<Vio
     int wrong = 0;
     std::size_t caught = 0;
     for (const Violator& violator : violators) {
-        const Outcome outcome =
-            lookAt(directory, violator.suites, {violator.port}, kSecondsForOne);
+        const Outcome outcome = lookAt(directory, violator.suites, {violator.port}, kSecondsForOne);
         if (!isAsExpected(violator, outcome)) ++wrong;
         if (!outcome.passed) ++caught;
         if (showsOutput) std::cout << outcome.output;
