@@ -10,6 +10,7 @@
 
 #include "host/console/Problem.h"
 #include "host/module/ModuleFile.h"
+#include "host/module/Trial.h"
 #include "system/PosixError.h"
 
 namespace appsync {
@@ -102,10 +103,31 @@ Result<const PlugInTable*> PlugInModule::tableOf(void* handle, const std::string
     return table;
 }
 
+Status PlugInModule::tryFile(const std::string& path) {
+    const auto load = [&path]() -> std::string {
+        const Result<PlugInModule> loaded = openHere(path);
+        return loaded ? "" : loaded.error().description();
+    };
+    const Result<TrialOutcome> trial = tryInAnotherProcess(load);
+    if (!trial) return unusable(trial.error());
+    if (!trial->answer) {
+        return unusable(displayPath(path) + " ends the process that loads it, with " + trial->end,
+                        kNameABuild);
+    }
+    if (trial->answer->empty()) return {};
+    return ErrorRecord::make(kCommandErrorDomain, kExitUnusable, *trial->answer);
+}
+
 Result<PlugInModule> PlugInModule::open(const std::string& path) {
     if (path.empty()) return PlugInModule();
     const Status whole = checkModuleFile(path);
     if (!whole) return whole.error();
+    const Status tried = tryFile(path);
+    if (!tried) return tried.error();
+    return openHere(path);
+}
+
+Result<PlugInModule> PlugInModule::openHere(const std::string& path) {
     Result<Handle> handle = loadFile(path);
     if (!handle) return handle.error();
     const Result<const PlugInTable*> table = tableOf(handle->get(), path);

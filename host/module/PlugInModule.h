@@ -1,8 +1,9 @@
 #pragma once
 
 // host/module: the plug-in as a file that is loaded (docs/module.md): PlugInModule.h loads it,
-// ModuleFile.h looks at it before anything of it runs. Includes console, file and platform/. Called
-// by session and by the commands that hold one.
+// ModuleFile.h looks at it before anything of it runs, Trial.h has a process of its own load it
+// first. Includes console, file, platform/ and system/. Called by session and by the commands that
+// hold one.
 
 #include <memory>
 #include <string>
@@ -23,9 +24,10 @@ class PlugInModule {
 
     /// Loads the module in that file of this machine; the built-in plug-in where `path` is empty.
     /// What cannot be used is refused as such: what has no right name, is no shared object, is of
-    /// another machine or cut short, cannot be loaded or throws meanwhile, has no table, or one of
-    /// another major version. What a module does while it is loaded is its own: it runs in this
-    /// process.
+    /// another machine or cut short, cannot be loaded, throws or ends the process meanwhile, has no
+    /// table, or one of another major version. A copy of this process finds that out, so that
+    /// nothing of a module that is refused was ever in this one. What a module does while it is
+    /// loaded is its own otherwise: it does it twice, with this process's rights.
     [[nodiscard]] static Result<PlugInModule> open(const std::string& path);
 
     [[nodiscard]] const PlugInTable& table() const { return *table_; }
@@ -39,6 +41,8 @@ class PlugInModule {
     PlugInModule(Handle handle, const PlugInTable& table)
         : handle_(std::move(handle)), table_(&table) {}
 
+    [[nodiscard]] static Status tryFile(const std::string& path);
+    [[nodiscard]] static Result<PlugInModule> openHere(const std::string& path);
     [[nodiscard]] static Result<Handle> loadFile(const std::string& path);
     [[nodiscard]] static Result<const PlugInTable*> tableOf(void* handle, const std::string& path);
 

@@ -106,6 +106,29 @@ def test_a_module_that_is_no_good_leaves_nothing_behind(appsync, tmp_path, modul
     assert (device.tree(), sorted(os.listdir(device.path))) == before
 
 
+@pytest.mark.parametrize("name, told", [
+    ("NoTable", r"has no appsyncPlugInTable, so it is no build of the plug-in: name a build of appsync-plugin\.so"),
+    ("NullTable", r"gives no table: name a build of appsync-plugin\.so"),
+    ("NoFunctions", r"lacks a function in its table: name a build of appsync-plugin\.so"),
+    ("OtherMajorVersion", r"has version 42\.3 of the module interface, and this command wants 1\.x: name a build with"),
+    ("NeedsMore", r"cannot be loaded: .*undefined symbol: appsyncTableOfAnotherLibrary: name a build of"),
+    ("ThrowsWhenAsked", r"threw an exception while it was loaded: it does not say why: name a build that can be loaded"),
+    ("ThrowsWhileLoaded", r"threw an exception while it was loaded: no licence: name a build that can be loaded"),
+    ("AbortsWhileLoaded", r"ends the process that loads it, with signal 6: name a build of appsync-plugin\.so"),
+    ("ExitsWhileLoaded", r"ends the process that loads it, with status 3: name a build of appsync-plugin\.so"),
+])
+def test_another_library_is_no_module_and_leaves_nothing_behind(appsync, tmp_path, module, name, told):
+    other = module.parent / "tests" / "modules" / (name + ".so")
+    library = tmp_path / "library"
+    packages.make_library(str(library), 1)
+    device = Device(appsync, tmp_path / "device")
+    before = device.tree(), sorted(os.listdir(device.path))
+    refused = appsync("sync", device.path, library, "--plug-in", other, expect=3)
+    assert refused.stdout == ""
+    assert re.fullmatch(r"appsync: /.*/%s\.so %s.*\n" % (name, told), refused.stderr)
+    assert (device.tree(), sorted(os.listdir(device.path))) == before
+
+
 def test_a_module_is_found_from_where_the_command_runs(appsync, tmp_path, module):
     shutil.copy(module, tmp_path / "mine.so")
     library = tmp_path / "library"

@@ -24,6 +24,7 @@ namespace {
 using testing::AllOf;
 using testing::ElementsAre;
 using testing::HasSubstr;
+using testing::IsEmpty;
 using testing::SizeIs;
 
 std::filesystem::path testsFolder() {
@@ -62,7 +63,12 @@ class SessionInMemory {
                                                     {kTodoNameKey, "A"}})}));
         made_ = table.makeClient(platform_.services());
     }
-    ~SessionInMemory() { table_.destroyClient(made_); }
+    ~SessionInMemory() {
+        table_.destroyClient(made_);
+        platform_.runUntilIdle();
+        EXPECT_EQ(platform_.scheduler.delayedTasks(), 0U);
+        EXPECT_THAT(platform_.scheduler.blockedTasks(), IsEmpty());
+    }
     SessionInMemory(const SessionInMemory&) = delete;
     SessionInMemory& operator=(const SessionInMemory&) = delete;
 
@@ -74,6 +80,10 @@ class SessionInMemory {
             client().assetTransferSucceeded(asset, true, nullptr);
         }
     }
+    void denyItsTerminationOnce() {
+        platform_.registry.addApplication("com.a", "0.9");
+        platform_.homeScreen.scriptTermination("com.a", {1, 0});
+    }
     void end() {
         client().assetTransferEndedWithSuccess(true);
         client().syncEndedWithSuccess(true);
@@ -81,6 +91,9 @@ class SessionInMemory {
 
     [[nodiscard]] std::vector<std::string> installs() const {
         return platform_.callsTo({"AppRegistry.installPackage"});
+    }
+    [[nodiscard]] std::vector<std::string> terminations() const {
+        return platform_.callsTo({"HomeScreenService.takeTerminationAssertion"});
     }
     [[nodiscard]] std::vector<std::string> lines() const { return platform_.lines(); }
 
@@ -132,6 +145,18 @@ TEST(PlugInModule, TwoBuildsWorkSideBySide) {
     second.end();
     EXPECT_THAT(first.installs(), SizeIs(1));
     EXPECT_EQ(first.lines(), second.lines());
+}
+
+TEST(PlugInModule, LeavesNoTimerOfWhatItHadToWaitFor) {
+    const Result<PlugInModule> loaded = PlugInModule::open(builtModule());
+    ASSERT_TRUE(loaded.ok());
+    SessionInMemory session(loaded->table());
+    session.denyItsTerminationOnce();
+    session.begin();
+    session.transfer();
+    session.end();
+    EXPECT_THAT(session.installs(), SizeIs(1));
+    EXPECT_THAT(session.terminations(), SizeIs(2));
 }
 
 TEST(PlugInModule, LeavesNothingBehindWhenItIsUnloaded) {
@@ -200,6 +225,7 @@ TEST_P(RefusedModule, IsUnusableAndSaysWhy) {
     ASSERT_FALSE(loaded.ok());
     EXPECT_EQ(exitStatusOf(loaded.error()), kExitUnusable);
     EXPECT_THAT(loaded.error().description(), AllOf(HasSubstr(path), HasSubstr(GetParam().told)));
+    EXPECT_FALSE(isLoaded(path));
 }
 
 INSTANTIATE_TEST_SUITE_P(
@@ -212,6 +238,11 @@ INSTANTIATE_TEST_SUITE_P(
                               "1.x: name a build with that version"},
                     BadModule{"NeedsMore", "undefined symbol: appsyncTableOfAnotherLibrary"},
                     BadModule{"ThrowsWhenAsked", " threw an exception while it was loaded: it"},
+                    BadModule{"AbortsWhileLoaded",
+                              " ends the process that loads it, with signal 6: name a build of"},
+                    BadModule{"ExitsWhileLoaded", " ends the process that loads it, with status 3"},
+                    BadModule{"AbortsWhileUnloaded",
+                              " ends the process that loads it, with signal 6"},
                     BadModule{"Missing", "No such file or directory"}));
 
 #if !defined(__has_feature)
