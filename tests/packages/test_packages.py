@@ -2,6 +2,7 @@
 
 import os
 import pathlib
+import re
 import shutil
 import subprocess
 
@@ -68,3 +69,54 @@ def test_a_project_is_built_with_what_is_there_alone(prefix, tmp_path):
     run("cmake", "-G", "Ninja", "-S", TREE / "tests" / "consumer", "-B", tmp_path, "-DCMAKE_PREFIX_PATH=%s" % prefix)
     run("cmake", "--build", tmp_path)
     assert "AppRegistry.installPackage" in run(tmp_path / "consumer")
+
+
+def sought(prefix, place, components):
+    """What CMake says where a project asks for these components."""
+    place.mkdir()
+    (place / "CMakeLists.txt").write_text(
+        "cmake_minimum_required(VERSION 3.25)\nproject(seeker LANGUAGES CXX)\n"
+        "find_package(appsync CONFIG REQUIRED %s)\n" % components)
+    done = subprocess.run(["cmake", "-G", "Ninja", "-S", place, "-B", place / "build",
+                           "-DCMAKE_PREFIX_PATH=%s" % prefix], capture_output=True, text=True)
+    return done.returncode, re.sub(r"\s+", " ", done.stderr)
+
+
+@pytest.fixture
+def without_system(prefix, tmp_path):
+    """A prefix of somebody who has left out the component system."""
+    place = tmp_path / "without"
+    shutil.copytree(prefix / "lib", place / "lib", symlinks=True)
+    for path in [*(place / "lib" / "cmake" / "appsync").glob("appsync-system-targets*"),
+                 place / "lib" / "pkgconfig" / "appsync-system.pc"]:
+        path.unlink()
+    return place
+
+
+def test_a_component_that_is_not_installed_is_named(without_system, tmp_path):
+    status, told = sought(without_system, tmp_path / "one", "COMPONENTS plugin system")
+    assert status != 0
+    assert "the component system of appsync is not installed in %s" % without_system in told
+    assert sought(without_system, tmp_path / "other", "COMPONENTS plugin simulation OPTIONAL_COMPONENTS system")[0] == 0
+    assert sought(without_system, tmp_path / "all", "")[0] == 0
+
+
+def test_a_component_that_appsync_has_not_is_named_with_those_that_it_has(prefix, tmp_path):
+    status, told = sought(prefix, tmp_path / "project", "COMPONENTS plugin cloud")
+    assert status != 0
+    assert re.search(r"appsync has no component cloud; it has: plugin, system, simulation", told)
+
+
+def test_a_prefix_without_what_all_components_need_says_so(without_system, tmp_path):
+    for path in (without_system / "lib" / "cmake" / "appsync").glob("appsync-platform-targets*"):
+        path.unlink()
+    status, told = sought(without_system, tmp_path / "project", "COMPONENTS plugin")
+    assert status != 0 and "appsync is not whole in %s" % without_system in told
+
+
+def test_pkg_config_says_what_is_not_there(without_system):
+    environment = {**os.environ, "PKG_CONFIG_LIBDIR": str(without_system / "lib" / "pkgconfig")}
+    asked = subprocess.run(["pkg-config", "--exists", "--print-errors", "appsync-plugin", "appsync-system"],
+                           capture_output=True, text=True, env=environment)
+    assert asked.returncode != 0 and "appsync-system" in asked.stderr
+    assert subprocess.run(["pkg-config", "--exists", "appsync-plugin"], env=environment).returncode == 0
