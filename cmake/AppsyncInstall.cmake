@@ -35,7 +35,7 @@ appsync_install_library(simulation "a device in memory for appsync's plug-in" "a
 
 set(folders platform system simulation)
 if(APPSYNC_CONTRACT)
-    appsync_install_library(contract "what proves a device for appsync's plug-in" "appsync-platform gmock gtest")
+    appsync_install_library(contract "what proves a device for appsync's plug-in" "appsync-plugin gmock gtest")
     list(APPEND folders contract)
 endif()
 foreach(folder IN LISTS folders)

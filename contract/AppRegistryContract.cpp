@@ -165,6 +165,29 @@ TEST_P(AppRegistryContract, StoreMetadataAndSinfMayComeWithAPlaceholder) {
     EXPECT_EQ(preferred(kA)->installType, std::uint64_t{kInstallTypeRestore});
 }
 
+TEST_P(AppRegistryContract, StoreMetadataComesToStandInTheContainer) {
+    checks("platform/AppRegistry.h",
+           "The store metadata comes to stand in the placeholder's container, as "
+           "\"VessikMetadata.plist\".");
+    const Result<Bytes> metadata = services_.propertyLists.serialize(
+        PropertyList::map({{"title", "Atlas"}}), PropertyListFormat::Binary);
+    ASSERT_TRUE(metadata);
+    const std::string path = addPlaceholderBundle({kA});
+    PropertyList options = placeholderOptions(kA, kInstallTypeRestore);
+    options.set(StoreMetadataKey, *metadata);
+    ASSERT_TRUE(registry_.installPlaceholderBundle(FileURL::fromPath(path, true).value(), options));
+    const Result<Bytes> written =
+        services_.files.readFile(preferred(kA)->bundleContainerPath + "/VessikMetadata.plist");
+    ASSERT_TRUE(written) << written.error().description();
+    EXPECT_EQ(*written, *metadata);
+}
+
+TEST_P(AppRegistryContract, ABundleTakesRoomOnDisk) {
+    checks("platform/AppRegistry.h", "Bytes that the bundle takes on disk.");
+    ASSERT_TRUE(installPackage({kA}));
+    EXPECT_GT(application(kA)->staticDiskUsage, 0U);
+}
+
 TEST_P(AppRegistryContract, AMissingPlaceholderBundleIsRefused) {
     checks("platform/AppRegistry.h", "An error when there is no bundle at the path.");
     EXPECT_FALSE(registry_.installPlaceholderBundle(

@@ -12,6 +12,12 @@ DeviceContract::DeviceContract()
 // What closing the device breaks is no sentence that the test has looked at.
 DeviceContract::~DeviceContract() { checks({}, {}); }
 
+void pause(WorkQueues& queues, std::chrono::nanoseconds time) {
+    const std::shared_ptr<Semaphore> over = queues.makeSemaphore(0);
+    queues.runAfter(time, [over] { over->signal(); });
+    EXPECT_TRUE(over->wait());
+}
+
 PropertyList packageOptions(const std::string& identifier) {
     return PropertyList::map(
         {{PackageTypeKey, PackageTypeCustomer}, {BundleIdentifierKey, identifier}});

@@ -2,6 +2,7 @@
 
 #include <gtest/gtest.h>
 
+#include <chrono>
 #include <memory>
 #include <optional>
 #include <string>
@@ -52,6 +53,9 @@ class DeviceContract : public testing::TestWithParam<ContractPort> {
     const Platform services_;
     AppRegistry& registry_;
 };
+
+/// Lets time pass, by the clock of the queues.
+void pause(WorkQueues& queues, std::chrono::nanoseconds time);
 
 /// Install options of a package, and of a placeholder.
 [[nodiscard]] PropertyList packageOptions(const std::string& identifier);

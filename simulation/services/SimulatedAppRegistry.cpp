@@ -189,7 +189,7 @@ Status SimulatedAppRegistry::install(const std::string& identifier, const std::s
     Status status = takeFailure(installFailures_, identifier);
     if (status) status = checkPackage(identifier, path);
     if (status) {
-        commitPackage(identifier);
+        commitPackage(identifier, path);
     } else {
         markFailed(identifier);
     }
@@ -227,7 +227,7 @@ void SimulatedAppRegistry::markFailed(const std::string& identifier) {
     reportChange();
 }
 
-void SimulatedAppRegistry::commitPackage(const std::string& identifier) {
+void SimulatedAppRegistry::commitPackage(const std::string& identifier, const std::string& path) {
     Application& application = applications_[identifier];
     AppProxy proxy = proxyWithUsualPaths(identifier, false);
     const std::optional<AppProxy> before =
@@ -242,6 +242,7 @@ void SimulatedAppRegistry::commitPackage(const std::string& identifier) {
         proxy.bundleVersion = package->second.version;
         proxy.displayName = package->second.displayName;
     }
+    if (const auto bytes = files_.contents(path)) proxy.staticDiskUsage = bytes->size();
     files_.addDirectory(proxy.bundlePath);
     files_.sync();
     application.installed = std::move(proxy);
@@ -267,6 +268,10 @@ Status SimulatedAppRegistry::installPlaceholderNow(const FileURL& directory,
     proxy.installType = *installType;
     if (Status status = describeFromBundle(directory.path(), proxy); !status) return status;
     files_.copyTree(directory.path(), proxy.bundlePath);
+    const PropertyList* metadata = options.find(StoreMetadataKey);
+    if (const Bytes* bytes = metadata != nullptr ? metadata->asData() : nullptr) {
+        files_.addFile(proxy.bundleContainerPath + "/VessikMetadata.plist", *bytes);
+    }
     Application& application = applications_[*identifier];
     if (application.installed) proxy.applicationType = application.installed->applicationType;
     application.placeholderOptions = options;

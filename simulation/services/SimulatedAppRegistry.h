@@ -160,7 +160,7 @@ class SimulatedAppRegistry : public AppRegistry {
     [[nodiscard]] Status uninstallNow(const std::string& identifier, const PropertyList& options);
     [[nodiscard]] Status checkPackage(const std::string& identifier, const std::string& path);
     void markFailed(const std::string& identifier);
-    void commitPackage(const std::string& identifier);
+    void commitPackage(const std::string& identifier, const std::string& path);
     void removePlaceholder(Application& application, std::uint64_t finalState);
     void startProgress(const std::string& identifier, Application& application);
     void endProgress(Application& application, std::uint64_t state);
