@@ -21,22 +21,6 @@ using testing::ElementsAre;
 constexpr const char* kA = "com.example.a";
 constexpr const char* kB = "com.example.b";
 
-class HomeScreenDetailsContract : public DeviceContract {};
-
-APPSYNC_CONTRACT_SUITE(HomeScreenDetailsContract, devicePorts({OptionalService::HomeScreen}));
-
-TEST_P(HomeScreenDetailsContract, WhoAsksMakesNoDifference) {
-    checks("platform/HomeScreenService.h",
-           "`reason` says who asks (the plug-in gives 0, a platform numbers others of its own) and "
-           "changes nothing in the answer.");
-    ASSERT_TRUE(installPackage({kA}));
-    for (const std::uint64_t reason : {0U, 1U, 99U}) {
-        const auto result = services_.homeScreen.takeTerminationAssertion(kA, reason);
-        EXPECT_EQ(result.outcome, TerminationAssertionResult::kGranted);
-        EXPECT_NE(result.assertion, nullptr);
-    }
-}
-
 class BackupDetailsContract : public DeviceContract {};
 
 APPSYNC_CONTRACT_SUITE(BackupDetailsContract, devicePorts({OptionalService::Backup}));

@@ -221,15 +221,6 @@ struct TheFirstReleaseIsEverybodys : ForwardingHomeScreen {
     }
     Held held;
 };
-struct ReasonsMatter : ForwardingHomeScreen {
-    using ForwardingHomeScreen::ForwardingHomeScreen;
-    TerminationAssertionResult takeTerminationAssertion(const std::string& identifier,
-                                                        std::uint64_t reason) override {
-        auto result = target().takeTerminationAssertion(identifier, reason);
-        if (reason != 0) result.outcome = TerminationAssertionResult::kDenied;
-        return result;
-    }
-};
 struct GrantedWithoutAnAssertion : ForwardingHomeScreen {
     using ForwardingHomeScreen::ForwardingHomeScreen;
     TerminationAssertionResult takeTerminationAssertion(const std::string& identifier,
@@ -416,10 +407,6 @@ void addHomeScreen(std::vector<Violator>& all) {
     v.device<GrantedWithoutAnAssertion>(
         "GrantedWithoutAnAssertion",
         "Else granted, with an assertion; several may hold one application.");
-    v.device<ReasonsMatter>(
-        "ReasonsMatter",
-        "`reason` says who asks (the plug-in gives 0, a platform numbers others of its own) and "
-        "changes nothing in the answer.");
     for (Violator& each : v.take()) all.push_back(std::move(each));
 }
 

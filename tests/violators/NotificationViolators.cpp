@@ -135,7 +135,7 @@ struct PostingReachesNobody : ForwardingNotificationCenter {
 }  // namespace
 
 std::vector<Violator> notificationViolators() {
-    Violators v("platform/Notifications.h", "*Notifications*");
+    Violators v("platform/Notifications.h", "*Notification*");
     v.system<EveryRegistrationFails>("EveryRegistrationFails",
                                      "0 when the registration succeeded.");
     const std::string state = "System-wide named notifications that carry a 64-bit state.";

@@ -22,6 +22,7 @@
 #include <iostream>
 #include <map>
 #include <string>
+#include <string_view>
 #include <utility>
 #include <vector>
 
@@ -85,12 +86,15 @@ std::string contentsOf(const std::string& path) {
     return {std::istreambuf_iterator<char>(file), {}};
 }
 
-/// What stands behind the last `mark`, up to the end of the line or a comma.
-std::string lastAfter(const std::string& text, const std::string& mark) {
-    const std::size_t found = text.rfind(mark);
+/// The test that failed first, or else the one that had begun last.
+std::string failedTest(const std::string& output) {
+    constexpr std::string_view kFailed = "[  FAILED  ] ";
+    constexpr std::string_view kBegun = "[ RUN      ] ";
+    std::size_t found = output.find(kFailed);
+    if (found == std::string::npos) found = output.rfind(kBegun);
     if (found == std::string::npos) return {};
-    const std::size_t begin = found + mark.size();
-    return text.substr(begin, text.find_first_of(", \n", begin) - begin);
+    const std::size_t begin = found + kFailed.size();
+    return output.substr(begin, output.find_first_of(", \n", begin) - begin);
 }
 
 Outcome lookAt(const TemporaryMachineDirectory& directory, const std::string& filter,
@@ -103,7 +107,7 @@ Outcome lookAt(const TemporaryMachineDirectory& directory, const std::string& fi
     int status = 0;
     (void)::waitpid(child, &status, 0);
     Outcome outcome{WIFEXITED(status) && WEXITSTATUS(status) == 0, contentsOf(path), {}};
-    outcome.test = lastAfter(outcome.output, "[ RUN      ] ");
+    outcome.test = failedTest(outcome.output);
     if (WIFSIGNALED(status)) {
         outcome.test += WTERMSIG(status) == SIGALRM ? " (no end)" : " (crash)";
     }
