@@ -428,7 +428,7 @@ void addPolicyAndBackup(std::vector<Violator>& all) {
 }
 
 void addInstaller(std::vector<Violator>& all) {
-    Violators v("platform/InstallerService.h", "*Installer*:*Reopen*");
+    Violators v("platform/InstallerService.h", "*Installer*:*Lasting*");
     const std::string map =
         "A map keyed by bundle identifier; nothing when the installer does not answer.";
     v.device<NothingWasUninstalled>("NothingWasUninstalled", map);

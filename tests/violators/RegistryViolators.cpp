@@ -587,7 +587,7 @@ void addPlaceholders(Violators& v) {
 }  // namespace
 
 std::vector<Violator> registryViolators() {
-    Violators v("platform/AppRegistry.h", "*AppRegistry*:*InstallProgress*");
+    Violators v("platform/AppRegistry.h", "*AppRegistry*:*InstallProgress*:*Lasting*");
     addLookUps(v);
     addInstalls(v);
     addPlaceholders(v);
