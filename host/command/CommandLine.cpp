@@ -578,6 +578,7 @@ class Commands {
                                             return runCreate(parsed.device, parsed.other == "on",
                                                              parsed.flag, console_);
                                         });
+        added.get_option("DEVICE")->description("the directory to make")->type_name(kNewPlace);
         added.add_option("--coordination", values->other, "whether installs are coordinated")
             ->type_name("on|off")
             ->check(oneOf({"on", "off"}));

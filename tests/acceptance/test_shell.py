@@ -75,6 +75,7 @@ def in_zsh(place, *words):
             if [[ ${@[1,(i)(-|--)]} == *-(O|A|D)\ * ]]; then builtin compadd "$@"; return; fi
             local -a hits; builtin compadd -A hits "$@"
             local hit; for hit in $hits; do print -r -- "offer:$hit"; done
+            builtin compadd "$@"
         }'
         zpty -w shell 'comppostfuncs=(tell-the-end); tell-the-end() { print the-end; }; print ready-"now"'
         zpty -m -r shell heard '*ready-now*'
@@ -84,7 +85,7 @@ def in_zsh(place, *words):
         zpty -d shell
     """
     line = " ".join(["appsync", *words])
-    return set(re.findall(r"offer:(\S+)", run(place, "zsh", "-f", "-c", script, "zsh", line)))
+    return set(re.findall(r"offer:([^\r\n]+)", run(place, "zsh", "-f", "-c", script, "zsh", line)))
 
 
 SHELLS = pytest.mark.parametrize("complete", [in_bash, in_fish, in_zsh])
@@ -113,16 +114,51 @@ def test_where_there_is_no_device_nothing_is_offered_and_nothing_said(place, com
     assert complete(place, "why", "nowhere", "c") == set()
 
 
-@pytest.mark.parametrize("complete", [in_bash, in_fish])
+@SHELLS
+def test_the_identifiers_are_offered_to_options_too(place, complete):
+    assert complete(place, "sync", "my\\ phone", "library", "--remove", "com.example.b") == {B}
+    assert complete(place, "sync", "my\\ phone", "library", "--remove", "x") == set()
+
+
+def directories(offered):
+    return {each.rstrip("/").replace("\\", "") for each in offered}
+
+
+@SHELLS
 def test_a_shell_completes_directories_and_files(place, complete):
-    assert {each.rstrip("/") for each in complete(place, "apps", "li")} == {"library"}
+    assert directories(complete(place, "apps", "li")) == {"library"}
     assert complete(place, "apps", "no") == set()
     assert complete(place, "plist", "show", "no") == {"note.txt"}
 
 
-@pytest.mark.parametrize("complete", [in_bash, in_fish])
-def test_directories_with_blanks_are_offered_whole(place, complete):
-    assert {each.rstrip("/").replace("\\", "") for each in complete(place, "apps", "my")} == {"my phone"}
+@SHELLS
+def test_where_there_are_devices_no_other_directory_is_offered(place, complete):
+    for each in ("mine", "myriad"):
+        (place / each).mkdir()
+    assert directories(complete(place, "apps", "my")) == {"my phone"}
+    assert directories(complete(place, "apps", "")) == {"my phone"}
+    assert directories(complete(place, "apps", "mi")) == {"mine"}
+    assert directories(complete(place, "create", "my")) == {"my phone", "myriad"}
+    assert {"library", "mine", "my phone"} <= directories(complete(place, "sync", "my\\ phone", ""))
+
+
+@SHELLS
+def test_in_a_directory_without_devices_nothing_is_made_up(place, complete):
+    (place / "none" / "inner").mkdir(parents=True)
+    (place / "none" / "inner" / "file").write_text("")
+    assert {each.rpartition("/")[2] for each in directories(complete(place, "apps", "none/"))} == {"inner"}
+    assert complete(place, "apps", "none/inner/") == set()
+    assert complete(place, "why", "none", "") == set()
+
+
+@SHELLS
+def test_devices_are_found_below_and_at_home(place, complete):
+    (place / "shelf").mkdir()
+    (place / "my phone").rename(place / "shelf" / "old phone")
+    (place / "shelf" / "old").mkdir()
+    assert directories(complete(place, "apps", "sh")) == {"shelf"}
+    assert {each.rpartition("/")[2] for each in directories(complete(place, "apps", "shelf/ol"))} == {"old phone"}
+    assert {each.rpartition("/")[2] for each in directories(complete(place, "apps", "~/shelf/ol"))} == {"old phone"}
 
 
 def read_page(page):

@@ -22,6 +22,9 @@ struct OptionEntry {
     bool isRepeated = false;
 };
 
+/// The value of an argument that names what is not there yet.
+inline constexpr const char* kNewPlace = "NEW";
+
 /// A command as it was declared.
 struct CommandEntry {
     std::string name;

@@ -61,7 +61,7 @@ LineSoFar understand(const CommandEntry& program, const std::vector<std::string>
 }
 
 bool isDirectory(const std::string& value) {
-    return value == "DEVICE" || value == "LIBRARY" || value == "BACKUP" || value == "FOLDER";
+    return value == kNewPlace || value == "LIBRARY" || value == "BACKUP" || value == "FOLDER";
 }
 
 // The argument that stands at this place; the last may stand there several times.
@@ -100,7 +100,7 @@ class Finder {
         } else if (isCommand) {
             if (line_.placed.empty()) addCommands();
         } else {
-            addValues(wordsOfValue(next->value).empty() ? next->name : next->value);
+            addArgument(*next);
         }
         return std::move(found_);
     }
@@ -121,12 +121,19 @@ class Finder {
         }
     }
 
+    void addArgument(const OptionEntry& argument) {
+        const bool saysMore = argument.value == kNewPlace || !wordsOfValue(argument.value).empty();
+        addValues(saysMore ? argument.value : argument.name);
+    }
+
     void addValues(const std::string& value) {
         const std::vector<std::string> words = wordsOfValue(value);
         if (value == "ID") {
             for (const std::string& each : identifiers_(deviceOf(line_))) add(each);
         } else if (!words.empty()) {
             for (const std::string& each : words) add(each);
+        } else if (value == "DEVICE") {
+            found_.paths = Completions::Paths::Devices;
         } else if (isDirectory(value)) {
             found_.paths = Completions::Paths::Directories;
         } else if (value != "N" && value != "TIME" && value != "NAME=VALUE") {
@@ -144,12 +151,19 @@ class Finder {
 constexpr std::string_view kBashScript =
     R"(# bash completion of appsync: made by "appsync completion bash".
 _appsync() {
-    local line word words=("${COMP_WORDS[@]:1:COMP_CWORD}")
+    local line each found words=("${COMP_WORDS[@]:1:COMP_CWORD}")
     words=("${words[@]//\\/}")
     words=("${words[@]/#\~\//$HOME/}")
     COMPREPLY=()
     while IFS= read -r line; do
         case $line in
+        :devices)
+            compopt -o filenames 2>/dev/null
+            mapfile -t found < <(compgen -d -- "${COMP_WORDS[COMP_CWORD]}")
+            for each in "${found[@]}"; do
+                if [ -f "${each/#\~\//$HOME/}/device.db" ]; then COMPREPLY+=("$each"); fi
+            done
+            if [ ${#COMPREPLY[@]} -eq 0 ]; then COMPREPLY=("${found[@]}"); fi ;;
         :directories) compopt -o filenames 2>/dev/null; mapfile -t COMPREPLY < <(compgen -d -- "${COMP_WORDS[COMP_CWORD]}") ;;
         :files) compopt -o filenames 2>/dev/null; mapfile -t COMPREPLY < <(compgen -f -- "${COMP_WORDS[COMP_CWORD]}") ;;
         *) COMPREPLY+=("${line%%$'\t'*}") ;;
@@ -161,13 +175,15 @@ complete -F _appsync appsync
 
 constexpr std::string_view kZshScript = R"(#compdef appsync
 # zsh completion of appsync: made by "appsync completion zsh".
+_appsync_is_device() { [[ -f $REPLY/device.db ]] }
 _appsync() {
     local line
     local -a described
     for line in "${(@f)$("${(Q)words[1]}" complete -- "${(@Q)words[2,CURRENT]}" 2>/dev/null)}"; do
         case $line in
         '') ;;
-        :directories) _files -/ ;;
+        :devices) _path_files -g '*(-/+_appsync_is_device)' || _path_files -/ ;;
+        :directories) _path_files -/ ;;
         :files) _files ;;
         *) described+=("${${line%%$'\t'*}//:/\\:}:${line#*$'\t'}") ;;
         esac
@@ -184,6 +200,15 @@ function __appsync_complete
     set -l current (commandline -ct)
     for line in ($words[1] complete -- $words[2..-1] $current 2>/dev/null)
         switch $line
+            case ':devices'
+                set -l found (__fish_complete_directories $current)
+                set -l devices
+                for each in $found
+                    set -l place (string replace -r '^~/' "$HOME/" -- (string split -m 1 \t -- $each)[1])
+                    test -f "$place/device.db"; and set -a devices $each
+                end
+                set -q devices[1]; or set devices $found
+                set -q devices[1]; and printf '%s\n' $devices
             case ':directories'
                 __fish_complete_directories $current
             case ':files'
@@ -221,6 +246,7 @@ std::string completionLines(const Completions& completions) {
     for (const auto& [word, description] : completions.candidates) {
         lines += printable(word) + '\t' + printable(description) + '\n';
     }
+    if (completions.paths == Completions::Paths::Devices) lines += ":devices\n";
     if (completions.paths == Completions::Paths::Directories) lines += ":directories\n";
     if (completions.paths == Completions::Paths::Files) lines += ":files\n";
     return lines;

@@ -8,9 +8,10 @@
 
 namespace appsync {
 
-/// What can stand at the end of a line. Files and directories are the shell's to find.
+/// What can stand at the end of a line. Files and directories are the shell's to find; where it is
+/// to be a device, all directories are good only where none of them is one.
 struct Completions {
-    enum class Paths { None, Directories, Files };
+    enum class Paths { None, Devices, Directories, Files };
 
     struct Candidate {
         std::string word;
@@ -32,8 +33,8 @@ using IdentifiersOfDevice = std::function<std::vector<std::string>(const std::st
                                         const std::vector<std::string>& words,
                                         const IdentifiersOfDevice& identifiers);
 
-/// As the scripts read it: "word<TAB>description" a line; at last ":files" or ":directories" where
-/// the shell is to find these.
+/// As the scripts read it: "word<TAB>description" a line; at last ":files", ":directories" or
+/// ":devices" where the shell is to find these.
 [[nodiscard]] std::string completionLines(const Completions& completions);
 
 /// The script that has a shell (bash, zsh or fish) complete the lines of the command; empty for

@@ -56,7 +56,8 @@ TEST_F(Completion, OfADashIsTheOptionsThatAreNotThereYet) {
 }
 
 TEST_F(Completion, OfAnArgumentIsItsKind) {
-    EXPECT_THAT(wordsOf({"sync", ""}), ElementsAre(":directories"));
+    EXPECT_THAT(wordsOf({"sync", ""}), ElementsAre(":devices"));
+    EXPECT_THAT(wordsOf({"create", ""}), ElementsAre(":directories"));
     EXPECT_THAT(wordsOf({"sync", device, ""}), ElementsAre(":directories"));
     EXPECT_THAT(wordsOf({"screen", device, "p"}), ElementsAre(":files"));
     EXPECT_THAT(wordsOf({"package", "verify", "a.zip", "b"}), ElementsAre(":files"));
@@ -70,8 +71,8 @@ TEST_F(Completion, OfAnOptionsValueIsItsKind) {
     EXPECT_THAT(wordsOf({"log", device, "--level", "d"}), ElementsAre("debug", "default"));
     EXPECT_THAT(wordsOf({"sync", device, library, "--plug-in", ""}), ElementsAre(":files"));
     EXPECT_THAT(wordsOf({"sync", device, library, "--wait", ""}), IsEmpty());
-    EXPECT_THAT(wordsOf({"sync", "--wait", "5m", ""}), ElementsAre(":directories"));
-    EXPECT_THAT(wordsOf({"sync", "--mirror", ""}), ElementsAre(":directories"));
+    EXPECT_THAT(wordsOf({"sync", "--wait", "5m", ""}), ElementsAre(":devices"));
+    EXPECT_THAT(wordsOf({"sync", "--mirror", ""}), ElementsAre(":devices"));
 }
 
 TEST_F(Completion, OfAnIdentifierIsWhatIsOnTheDevice) {
