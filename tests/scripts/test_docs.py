@@ -5,7 +5,8 @@ import subprocess
 import pytest
 
 ROOT = pathlib.Path(__file__).resolve().parent.parent.parent
-PARTS = ["CMakeLists.txt", "CONTRIBUTING.md", "cmake", "docs", "scripts", "client", "platform", "system", "simulation"]
+PARTS = ["CMakeLists.txt", "CONTRIBUTING.md", "cmake", "docs", "scripts", "client", "platform", "system", "simulation",
+         "contract"]
 
 
 @pytest.fixture
