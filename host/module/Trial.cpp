@@ -44,7 +44,7 @@ std::optional<std::string> answerFrom(int descriptor) {
     return std::string(bytes.begin(), bytes.end() - 1);
 }
 
-std::string endOf(pid_t process) {
+std::string waitForEnd(pid_t process) {
     int status = 0;
     while (::waitpid(process, &status, 0) < 0) {
         if (errno != EINTR) return posixReason(errno);
@@ -66,7 +66,7 @@ Result<TrialOutcome> tryInAnotherProcess(const std::function<std::string()>& act
     told.reset();
     TrialOutcome outcome;
     outcome.answer = answerFrom(heard.get());
-    outcome.end = endOf(process);
+    outcome.end = waitForEnd(process);
     return outcome;
 }
 
