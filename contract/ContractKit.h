@@ -11,7 +11,8 @@
 
 namespace appsync {
 
-/// What a device may lack: its service then answers as platform/ says of one that is not there.
+/// What a device may lack: its service then answers as the class of platform/absent/ does, or is
+/// null where that is allowed.
 enum class OptionalService {
     Coordination,        // InstallCoordinatorService.h
     Transfers,           // TransferService.h

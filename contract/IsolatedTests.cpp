@@ -22,6 +22,8 @@
 #include <stdexcept>
 #include <utility>
 
+#include "contract/TemporaryMachineDirectory.h"
+
 namespace appsync {
 namespace {
 
@@ -194,25 +196,6 @@ class IsolatedTest {
     std::string records_;
 };
 
-/// A directory for what the tests leave, removed with it.
-class OwnDirectory {
-  public:
-    OwnDirectory() : path_(std::filesystem::temp_directory_path() / "appsync-contract-XXXXXX") {
-        if (::mkdtemp(path_.data()) == nullptr) throw std::runtime_error("no directory " + path_);
-    }
-    ~OwnDirectory() {
-        std::error_code ignored;
-        std::filesystem::remove_all(path_, ignored);
-    }
-    OwnDirectory(const OwnDirectory&) = delete;
-    OwnDirectory& operator=(const OwnDirectory&) = delete;
-
-    [[nodiscard]] const std::string& path() const { return path_; }
-
-  private:
-    std::string path_;
-};
-
 /// Several at a time.
 class IsolatedTests {
   public:
@@ -270,7 +253,7 @@ class IsolatedTests {
 
     const IsolationOptions options_;
     const std::vector<std::string> names_;
-    const OwnDirectory directory_;
+    const TemporaryMachineDirectory directory_;  // of what the tests leave
     std::vector<Slot> running_;
     std::size_t next_ = 0;
     std::vector<TestOutcome> outcomes_;

@@ -239,32 +239,34 @@ TEST_P(RegistryObserverContract, TheFirstReportComesOnce) {
 /// Takes a lock when it is called.
 class LockingObserver : public AppRegistryObserver {
   public:
-    LockingObserver(Lock& lock, Semaphore& called) : lock_(lock), called_(called) {}
+    explicit LockingObserver(WorkQueues& queues)
+        : lock_(queues.makeLock()), called_(queues.makeSemaphore(0)) {}
 
     void applicationInstallsArePrioritized(const std::vector<AppProxy>&,
                                            const std::vector<AppProxy>&) override {
-        { const std::lock_guard<Lock> held(lock_); }
-        called_.signal();
+        { const std::lock_guard<Lock> held(*lock_); }
+        called_->signal();
     }
     void applicationInstallsDidCancel(const std::vector<AppProxy>&) override {}
 
+    [[nodiscard]] Lock& lock() { return *lock_; }
+    void waitForOne() { EXPECT_TRUE(called_->wait()); }
+
   private:
-    Lock& lock_;
-    Semaphore& called_;
+    const std::unique_ptr<Lock> lock_;
+    const std::unique_ptr<Semaphore> called_;
 };
 
 // Were it called on this thread it could never take the lock.
 TEST_P(RegistryObserverContract, AnObserverIsNotCalledOnTheThreadThatAddsIt) {
     checks("platform/AppRegistry.h",
            "never on the thread that added it before `addObserver` has returned;");
-    const auto lock = services_.queues.makeLock();
-    const auto called = services_.queues.makeSemaphore(0);
-    const auto observer = std::make_shared<LockingObserver>(*lock, *called);
+    const auto observer = std::make_shared<LockingObserver>(services_.queues);
     {
-        const std::lock_guard<Lock> held(*lock);
+        const std::lock_guard<Lock> held(observer->lock());
         registry_.addObserver(observer);
     }
-    EXPECT_TRUE(called->wait());
+    observer->waitForOne();
     registry_.removeObserver(observer.get());
 }
 

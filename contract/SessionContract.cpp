@@ -196,7 +196,8 @@ TEST_P(SessionContract, ASessionInstallsUpdatesAndRemoves) {
     end();
 }
 
-TEST_P(SessionContract, APackageThatIsRefusedFails) {
+TEST_P(SessionContract, AnUpdateThatIsRefusedLeavesTheOldVersion) {
+    ASSERT_TRUE(installPackage({kA, "1.0"}));
     stage({kA, kB}, {}, {kA, kB});
     begin();
     for (const SyncAssetPointer& asset : assets_) {
@@ -205,7 +206,7 @@ TEST_P(SessionContract, APackageThatIsRefusedFails) {
         client_->assetTransferSucceeded(asset, true, nullptr);
     }
     client_->assetTransferEndedWithSuccess(true);
-    EXPECT_THAT(present(), ElementsAre("com.example.b 2.0"));
+    EXPECT_THAT(present(), ElementsAre("com.example.a 1.0", "com.example.b 2.0"));
     EXPECT_THAT(outcomes(), ElementsAre("com.example.a FAILED", "com.example.b INSTALLED"));
     end();
 }

@@ -4,6 +4,7 @@
 #include <fstream>
 #include <stdexcept>
 
+#include "contract/TemporaryMachineDirectory.h"
 #include "device/Device.h"
 #include "device/package/PackageWriter.h"
 #include "platform/SyncHost.h"
@@ -12,7 +13,6 @@
 #include "system/JsonLogFacility.h"
 #include "system/property_list/PropertyListCodec.h"
 #include "tests/contract/OurPorts.h"
-#include "tests/contract/TemporaryMachineDirectory.h"
 
 namespace appsync {
 namespace {

@@ -5,13 +5,13 @@
 #include <filesystem>
 #include <stdexcept>
 
+#include "contract/TemporaryMachineDirectory.h"
 #include "simulation/SimulatedPlatform.h"
 #include "system/RootedFileSystem.h"
 #include "system/SystemNotifications.h"
 #include "system/SystemWorkQueues.h"
 #include "system/property_list/PropertyListCodec.h"
 #include "tests/contract/OurPorts.h"
-#include "tests/contract/TemporaryMachineDirectory.h"
 
 namespace appsync {
 namespace {

@@ -8,9 +8,9 @@
 #include <string>
 #include <vector>
 
+#include "contract/TemporaryMachineDirectory.h"
 #include "device/Device.h"
 #include "host/console/Console.h"
-#include "tests/contract/TemporaryMachineDirectory.h"
 
 namespace appsync {
 

@@ -11,11 +11,11 @@
 
 #include "client/Paths.h"
 #include "client/TodoList.h"
+#include "contract/TemporaryMachineDirectory.h"
 #include "host/console/Problem.h"
 #include "platform/SyncClient.h"
 #include "simulation/SimulatedPlatform.h"
 #include "system/property_list/PropertyListCodec.h"
-#include "tests/contract/TemporaryMachineDirectory.h"
 #include "tests/host/HostFixture.h"
 
 namespace appsync {

@@ -5,8 +5,8 @@
 #include <fstream>
 #include <iterator>
 
+#include "contract/TemporaryMachineDirectory.h"
 #include "system/RootedFileSystem.h"
-#include "tests/contract/TemporaryMachineDirectory.h"
 
 namespace appsync {
 

@@ -12,13 +12,13 @@
 #include "client/AppsClient.h"
 #include "client/Paths.h"
 #include "client/TodoList.h"
+#include "contract/TemporaryMachineDirectory.h"
 #include "device/Device.h"
 #include "device/package/PackageWriter.h"
 #include "platform/LogFacility.h"
 #include "platform/Notifications.h"
 #include "platform/SyncHost.h"
 #include "system/property_list/PropertyListCodec.h"
-#include "tests/contract/TemporaryMachineDirectory.h"
 
 namespace appsync {
 namespace {

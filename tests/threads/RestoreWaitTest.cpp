@@ -13,13 +13,13 @@
 
 #include "client/AppsClient.h"
 #include "client/Paths.h"
+#include "contract/TemporaryMachineDirectory.h"
 #include "device/Device.h"
 #include "platform/LogFacility.h"
 #include "platform/LogRendering.h"
 #include "platform/SyncHost.h"
 #include "platform/WorkQueues.h"
 #include "system/property_list/PropertyListCodec.h"
-#include "tests/contract/TemporaryMachineDirectory.h"
 
 namespace appsync {
 namespace {

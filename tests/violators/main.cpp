@@ -32,7 +32,7 @@
 #include "contract/ForwardingFileSystem.h"
 #include "contract/ForwardingSystemServices.h"
 #include "contract/ForwardingWorkQueues.h"
-#include "tests/contract/TemporaryMachineDirectory.h"
+#include "contract/TemporaryMachineDirectory.h"
 #include "tests/violators/Violator.h"
 
 namespace appsync {

@@ -8,10 +8,10 @@
 #include <fstream>
 #include <iterator>
 
+#include "contract/TemporaryMachineDirectory.h"
 #include "device/archive/PackageFolder.h"
 #include "device/package/DataArchive.h"
 #include "system/UniqueFd.h"
-#include "tests/contract/TemporaryMachineDirectory.h"
 
 namespace appsync {
 

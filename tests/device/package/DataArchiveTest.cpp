@@ -12,9 +12,9 @@
 #include <fstream>
 #include <iterator>
 
+#include "contract/TemporaryMachineDirectory.h"
 #include "device/archive/PackageError.h"
 #include "system/RootDirectory.h"
-#include "tests/contract/TemporaryMachineDirectory.h"
 #include "tests/device/package/PackageZip.h"
 
 namespace appsync {

@@ -8,7 +8,8 @@
 
 namespace appsync {
 
-/// A directory of this machine that lives as long as the object, for implementations that need one.
+/// A directory of this machine, below TMPDIR, that lives as long as the object: for implementations
+/// that need one.
 class TemporaryMachineDirectory {
   public:
     TemporaryMachineDirectory() {

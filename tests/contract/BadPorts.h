@@ -1,0 +1,13 @@
+#pragma once
+
+#include <vector>
+
+#include "contract/ContractKit.h"
+
+namespace appsync {
+
+/// Simulated devices whose registry crashes, hangs or throws when it is asked whether something is
+/// installed, and one that says that nothing ever is.
+[[nodiscard]] std::vector<ContractPort> badPorts();
+
+}  // namespace appsync
