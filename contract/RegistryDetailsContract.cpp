@@ -1,6 +1,6 @@
-#include <gmock/gmock.h>
 #include <gtest/gtest.h>
 
+#include <chrono>
 #include <memory>
 #include <mutex>
 #include <set>
@@ -16,9 +16,6 @@ namespace appsync {
 void linkRegistryDetailsContract() {}
 
 namespace {
-
-using testing::ElementsAre;
-using testing::IsEmpty;
 
 constexpr const char* kA = "com.example.a";
 constexpr const char* kB = "com.example.b";

@@ -61,6 +61,22 @@ TEST_P(PropertyListDetailsContract, AReplacedTextIsReadAndNothingElseHasChanged)
     }
 }
 
+TEST_P(PropertyListDetailsContract, AnyThreadReadsAndWrites) {
+    checks("platform/PropertyListSerialization.h", "Callable on any thread.");
+    const auto operations = system_->queues().makeOperationQueue();
+    operations->setMaximumConcurrentOperations(4);
+    for (int operation = 0; operation < 8; ++operation) {
+        operations->add([this, operation] {
+            const PropertyList value = PropertyList::array({operation, "text"});
+            const Result<Bytes> written = lists_.serialize(value, PropertyListFormat::Binary);
+            ASSERT_TRUE(written);
+            const Result<PropertyList> read = lists_.parse(*written);
+            ASSERT_TRUE(read);
+            EXPECT_EQ(*read, value);
+        });
+    }
+}
+
 class NotificationDetailsContract : public SystemContract {};
 
 APPSYNC_CONTRACT_SUITE(NotificationDetailsContract,
@@ -94,6 +110,30 @@ TEST_P(NotificationDetailsContract, WhoeverPostsReachesTheObserversThatAreLeft) 
     center.post("com.example.left");
     system_->post("com.example.ended");  // returns when everybody has been told
     EXPECT_EQ(calls, 1);
+}
+
+/// Ends its observation when it is destroyed.
+struct LeavingObserver {
+    explicit LeavingObserver(NotificationCenter& from) : center(from) {}
+    ~LeavingObserver() { center.removeObserver(this, "com.example.left"); }
+    LeavingObserver(const LeavingObserver&) = delete;
+    LeavingObserver& operator=(const LeavingObserver&) = delete;
+    NotificationCenter& center;
+};
+
+TEST_P(NotificationDetailsContract, AnObserverMayRemoveItselfAtItsEnd) {
+    static int calls;
+    calls = 0;
+    checks("platform/Notifications.h",
+           "The observer is known by its address: it may be in its destructor.");
+    NotificationCenter& center = system_->notificationCenter();
+    auto observer = std::make_shared<LeavingObserver>(center);
+    center.addObserver(
+        observer, "com.example.left", [](void*) { ++calls; },
+        NotificationCenter::SuspensionBehavior::Drop);
+    observer.reset();
+    system_->post("com.example.left");
+    EXPECT_EQ(calls, 0);
 }
 
 }  // namespace

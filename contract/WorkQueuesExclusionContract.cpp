@@ -19,8 +19,6 @@ namespace {
 using namespace std::chrono_literals;
 using testing::ElementsAre;
 
-constexpr const char* kHeader = "platform/WorkQueues.h";
-
 class WorkQueuesExclusionContract : public SystemContract {
   protected:
     void note(const std::string& text) {
@@ -43,7 +41,8 @@ class WorkQueuesExclusionContract : public SystemContract {
 APPSYNC_CONTRACT_SUITE(WorkQueuesExclusionContract, systemPorts());
 
 TEST_P(WorkQueuesExclusionContract, ALockIsHeldWhileItsHolderWaits) {
-    checks(kHeader, "Mutual exclusion that may be held across calls of the platform");
+    checks("platform/WorkQueues.h",
+           "Mutual exclusion that may be held across calls of the platform");
     const auto lock = queues_.makeLock();
     const auto held = queues_.makeSemaphore(0);
     const auto operations = queues_.makeOperationQueue();
@@ -67,7 +66,7 @@ TEST_P(WorkQueuesExclusionContract, ALockIsHeldWhileItsHolderWaits) {
 }
 
 TEST_P(WorkQueuesExclusionContract, ASerialTaskIsAloneWhileItWaits) {
-    checks(kHeader, "Runs its tasks one at a time, in the order of submission.");
+    checks("platform/WorkQueues.h", "Runs its tasks one at a time, in the order of submission.");
     const auto queue = queues_.makeSerialQueue("queue");
     const auto begun = queues_.makeSemaphore(0);
     const auto over = queues_.makeWaitGroup();
@@ -88,7 +87,7 @@ TEST_P(WorkQueuesExclusionContract, ASerialTaskIsAloneWhileItWaits) {
 }
 
 TEST_P(WorkQueuesExclusionContract, ASemaphoreGivesNoMoreTurnsThanItHas) {
-    checks(kHeader, "Waits without limit and takes one signal.");
+    checks("platform/WorkQueues.h", "Waits without limit and takes one signal.");
     const auto semaphore = queues_.makeSemaphore(1);
     EXPECT_TRUE(semaphore->wait());
     const auto over = queues_.makeWaitGroup();
@@ -107,7 +106,7 @@ TEST_P(WorkQueuesExclusionContract, ASemaphoreGivesNoMoreTurnsThanItHas) {
 }
 
 TEST_P(WorkQueuesExclusionContract, AGroupWaitsInEachRound) {
-    checks(kHeader, "Returns when every enter has been undone.");
+    checks("platform/WorkQueues.h", "Returns when every enter has been undone.");
     const auto group = queues_.makeWaitGroup();
     const auto operations = queues_.makeOperationQueue();
     for (const char* round : {"first", "second"}) {
@@ -125,7 +124,8 @@ TEST_P(WorkQueuesExclusionContract, AGroupWaitsInEachRound) {
 
 // The task needs the lock that its caller holds: it would wait for itself.
 TEST_P(WorkQueuesExclusionContract, WorkWithoutDelayIsNotRunByItsCaller) {
-    checks(kHeader, "Runs the task on the global default-priority queue, once `delay` has passed.");
+    checks("platform/WorkQueues.h",
+           "Runs the task on the global default-priority queue, once `delay` has passed.");
     const auto lock = queues_.makeLock();
     const auto over = queues_.makeWaitGroup();
     over->enter();
@@ -143,7 +143,7 @@ TEST_P(WorkQueuesExclusionContract, WorkWithoutDelayIsNotRunByItsCaller) {
 }
 
 TEST_P(WorkQueuesExclusionContract, AnOperationIsNotRunByItsCaller) {
-    checks(kHeader,
+    checks("platform/WorkQueues.h",
            "Runs tasks on threads of its own, a bounded number at a time, started in the order of "
            "submission.");
     const auto lock = queues_.makeLock();

@@ -2,6 +2,7 @@
 // end it or never come to an end.
 //
 //     violators              every violator; the good implementations under a few seeds
+//     violators --report FILE  the same, and a line "passed NAME" or "failed NAME" for each
 //     violators NAME...      these, with what the kit says of them
 //     violators --list       names, headers and sentences, separated by tabs
 //     violators --seeds N    only the good implementations, the simulation under N seeds
@@ -131,56 +132,78 @@ std::vector<ContractPort> forwardingPorts() {
             deviceWith<ForwardingCoordination>("ForwardingCoordination")};
 }
 
-/// What is good and caught all the same, with what the kit says.
-int countFalseAlarms(const TemporaryMachineDirectory& directory, std::uint64_t seeds) {
-    std::vector<std::vector<ContractPort>> rounds;
-    for (std::uint64_t seed = 1; seed <= seeds; ++seed) {
-        if (seed % kSeedsAtOnce == 1 || kSeedsAtOnce == 1) rounds.emplace_back();
-        rounds.back().push_back(
-            simulatedPort("Seed" + std::to_string(seed), Scheduling::seeded(seed)));
+/// Says what came of each thing that was looked at; also in a file, where one is asked for.
+class Report {
+  public:
+    explicit Report(const std::string& path) {
+        if (!path.empty()) file_.open(path);
     }
-    rounds.push_back(forwardingPorts());
-    rounds.push_back({posixPort(), referencePort()});
-    int alarms = 0;
-    for (const auto& ports : rounds) {
-        const Outcome outcome = lookAt(directory, "*", ports, kSecondsForSeeds);
-        if (outcome.passed) continue;
-        std::cout << "false alarm: " << outcome.test << '\n' << outcome.output;
-        ++alarms;
+    void say(const std::string& name, bool isGood) {
+        file_ << (isGood ? "passed " : "failed ") << name << '\n';
+        if (!isGood) ++failed_;
     }
-    std::cout << "good implementations: the simulation under " << seeds << " seeds, "
-              << forwardingPorts().size()
-              << " wrappers that break nothing, system/ and device/: " << alarms
-              << " false alarms\n";
-    return alarms;
+    [[nodiscard]] int failed() const { return failed_; }
+
+  private:
+    std::ofstream file_;
+    int failed_ = 0;
+};
+
+struct GoodOnes {
+    std::string name;
+    std::vector<ContractPort> ports;
+};
+
+std::vector<GoodOnes> goodOnes(std::uint64_t seeds) {
+    std::vector<GoodOnes> all{{"wrappers that break nothing", forwardingPorts()},
+                              {"system/ and device/", {posixPort(), referencePort()}}};
+    for (std::uint64_t first = 1; first <= seeds; first += kSeedsAtOnce) {
+        const std::uint64_t last = std::min(first + kSeedsAtOnce - 1, seeds);
+        GoodOnes some{
+            "the simulation, seeds " + std::to_string(first) + " to " + std::to_string(last), {}};
+        some.ports.reserve(kSeedsAtOnce);
+        for (std::uint64_t seed = first; seed <= last; ++seed) {
+            some.ports.push_back(
+                simulatedPort("Seed" + std::to_string(seed), Scheduling::seeded(seed)));
+        }
+        all.push_back(std::move(some));
+    }
+    return all;
 }
 
-/// True when it is as it should be.
+void lookForFalseAlarms(const TemporaryMachineDirectory& directory, std::uint64_t seeds,
+                        Report& report) {
+    for (const GoodOnes& good : goodOnes(seeds)) {
+        const Outcome outcome = lookAt(directory, "*", good.ports, kSecondsForSeeds);
+        report.say(good.name, outcome.passed);
+        std::cout << (outcome.passed ? "good    " : "FALSE ALARM ") << good.name;
+        if (!outcome.passed) std::cout << ": " << outcome.test << '\n' << outcome.output;
+        std::cout << '\n';
+    }
+}
+
+/// True when it is caught, or known to escape.
 bool isAsExpected(const Violator& violator, const Outcome& outcome) {
     const auto known = knownToEscape().find(violator.name);
     const bool mayEscape = known != knownToEscape().end();
     std::cout << (outcome.passed ? "ESCAPED " : "caught  ") << violator.name;
     if (!outcome.passed) std::cout << ": " << outcome.test;
     if (outcome.passed && mayEscape) std::cout << ": " << known->second;
+    if (!outcome.passed && mayEscape) std::cout << ", which was known to escape";
     std::cout << '\n';
-    if (!outcome.passed && mayEscape) {
-        std::cout << "    is on the list of those that escape: take it off\n";
-    }
     return outcome.passed == mayEscape;
 }
 
-int countWrong(const TemporaryMachineDirectory& directory, const std::vector<Violator>& violators,
-               bool showsOutput) {
-    int wrong = 0;
+void lookAtViolators(const TemporaryMachineDirectory& directory,
+                     const std::vector<Violator>& violators, bool showsOutput, Report& report) {
     std::size_t caught = 0;
     for (const Violator& violator : violators) {
         const Outcome outcome = lookAt(directory, violator.suites, {violator.port}, kSecondsForOne);
-        if (!isAsExpected(violator, outcome)) ++wrong;
+        report.say(violator.name, isAsExpected(violator, outcome));
         if (!outcome.passed) ++caught;
         if (showsOutput) std::cout << outcome.output;
     }
     std::cout << caught << " of " << violators.size() << " violators caught\n";
-    return wrong;
 }
 
 void list(const std::vector<Violator>& violators) {
@@ -192,25 +215,26 @@ void list(const std::vector<Violator>& violators) {
 int run(const std::vector<std::string>& arguments) {
     std::vector<Violator> violators = allViolators();
     const std::string first = arguments.empty() ? std::string() : arguments.front();
+    const std::string second = arguments.size() == 2 ? arguments.back() : std::string();
     if (first == "--list") {
         list(violators);
         return EXIT_SUCCESS;
     }
     const TemporaryMachineDirectory directory;
-    if (first == "--seeds" && arguments.size() == 2) {
-        return countFalseAlarms(directory, std::stoull(arguments[1])) == 0 ? EXIT_SUCCESS
-                                                                           : EXIT_FAILURE;
-    }
-    if (!arguments.empty()) {
+    Report report(first == "--report" ? second : std::string());
+    if (first == "--seeds" && !second.empty()) {
+        lookForFalseAlarms(directory, std::stoull(second), report);
+    } else if (first.empty() || first == "--report") {
+        lookForFalseAlarms(directory, kFewSeeds, report);
+        lookAtViolators(directory, violators, false, report);
+        report.say("few are known to escape", knownToEscape().size() * 20 <= violators.size());
+    } else {
         std::erase_if(violators, [&](const Violator& each) {
             return std::find(arguments.begin(), arguments.end(), each.name) == arguments.end();
         });
-        return countWrong(directory, violators, true) == 0 ? EXIT_SUCCESS : EXIT_FAILURE;
+        lookAtViolators(directory, violators, true, report);
     }
-    const int alarms = countFalseAlarms(directory, kFewSeeds);
-    const int wrong = countWrong(directory, violators, false);
-    const bool areFew = knownToEscape().size() * 20 <= violators.size();
-    return alarms == 0 && wrong == 0 && areFew ? EXIT_SUCCESS : EXIT_FAILURE;
+    return report.failed() == 0 ? EXIT_SUCCESS : EXIT_FAILURE;
 }
 
 }  // namespace
