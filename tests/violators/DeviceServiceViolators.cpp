@@ -207,7 +207,7 @@ struct TheFirstReleaseIsEverybodys : ForwardingHomeScreen {
     using Held = std::map<std::string, std::unique_ptr<TerminationAssertion>>;
     struct Shared : TerminationAssertion {
         Shared(Held& all, std::string name) : held(all), identifier(std::move(name)) {}
-        ~Shared() override { held.erase(identifier); }
+        ~Shared() override { const auto released = held.extract(identifier); }
         Held& held;
         const std::string identifier;
     };
@@ -215,7 +215,7 @@ struct TheFirstReleaseIsEverybodys : ForwardingHomeScreen {
                                                         std::uint64_t reason) override {
         auto result = target().takeTerminationAssertion(identifier, reason);
         if (result.assertion == nullptr) return result;
-        held[identifier] = std::move(result.assertion);
+        const auto earlier = std::exchange(held[identifier], std::move(result.assertion));
         result.assertion = std::make_unique<Shared>(held, identifier);
         return result;
     }

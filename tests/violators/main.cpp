@@ -60,17 +60,24 @@ std::vector<Violator> allViolators() {
     return all;
 }
 
+/// Which suites are to look at ports, for how long, and whether all of their tests.
+struct Look {
+    std::string suites = "*";
+    unsigned seconds = kSecondsForOne;
+    bool stopsAtAFailure = true;
+};
+
 /// In the child: its output goes into the file, and it ends by itself.
-[[noreturn]] void runKit(const std::string& output, unsigned seconds, std::string filter,
+[[noreturn]] void runKit(const std::string& output, const Look& look,
                          std::vector<ContractPort> ports) {
     const int file = ::open(output.c_str(), O_WRONLY | O_CREAT | O_TRUNC | O_CLOEXEC, 0600);
     if (file < 0 || ::dup2(file, 1) < 0 || ::dup2(file, 2) < 0) ::_exit(EXIT_FAILURE);
     const struct rlimit none {};
     (void)::setrlimit(RLIMIT_CORE, &none);
-    ::alarm(seconds);
+    ::alarm(look.seconds);
     std::string program = "violators";
-    filter.insert(0, "--gtest_filter=");
-    std::string failFast = "--gtest_fail_fast";
+    std::string filter = "--gtest_filter=" + look.suites;
+    std::string failFast = look.stopsAtAFailure ? "--gtest_fail_fast=1" : "--gtest_fail_fast=0";
     std::array<char*, 4> arguments{program.data(), filter.data(), failFast.data(), nullptr};
     std::exit(runContractSuites(3, arguments.data(), std::move(ports)));
 }
@@ -98,13 +105,13 @@ std::string failedTest(const std::string& output) {
     return output.substr(begin, output.find_first_of(", \n", begin) - begin);
 }
 
-Outcome lookAt(const TemporaryMachineDirectory& directory, const std::string& filter,
-               const std::vector<ContractPort>& ports, unsigned seconds) {
+Outcome lookAt(const TemporaryMachineDirectory& directory, const Look& look,
+               const std::vector<ContractPort>& ports) {
     const std::string path = directory.path() + "/output";
     std::cout.flush();
     const pid_t child = ::fork();
     if (child < 0) return {false, "there is no process for it\n", {}};
-    if (child == 0) runKit(path, seconds, filter, ports);
+    if (child == 0) runKit(path, look, ports);
     int status = 0;
     (void)::waitpid(child, &status, 0);
     Outcome outcome{WIFEXITED(status) && WEXITSTATUS(status) == 0, contentsOf(path), {}};
@@ -174,7 +181,7 @@ std::vector<GoodOnes> goodOnes(std::uint64_t seeds) {
 void lookForFalseAlarms(const TemporaryMachineDirectory& directory, std::uint64_t seeds,
                         Report& report) {
     for (const GoodOnes& good : goodOnes(seeds)) {
-        const Outcome outcome = lookAt(directory, "*", good.ports, kSecondsForSeeds);
+        const Outcome outcome = lookAt(directory, {"*", kSecondsForSeeds, false}, good.ports);
         report.say(good.name, outcome.passed);
         std::cout << (outcome.passed ? "good    " : "FALSE ALARM ") << good.name;
         if (!outcome.passed) std::cout << ": " << outcome.test << '\n' << outcome.output;
@@ -198,7 +205,7 @@ void lookAtViolators(const TemporaryMachineDirectory& directory,
                      const std::vector<Violator>& violators, bool showsOutput, Report& report) {
     std::size_t caught = 0;
     for (const Violator& violator : violators) {
-        const Outcome outcome = lookAt(directory, violator.suites, {violator.port}, kSecondsForOne);
+        const Outcome outcome = lookAt(directory, {violator.suites}, {violator.port});
         report.say(violator.name, isAsExpected(violator, outcome));
         if (!outcome.passed) ++caught;
         if (showsOutput) std::cout << outcome.output;
