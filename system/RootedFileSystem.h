@@ -9,6 +9,8 @@
 //     work            SystemWorkQueues.h, with ThreadedOperationQueue.h and DelayedWork.h
 //     log             JsonLogFacility.h, over LogFile.h, which bounds it
 //     notifications   SystemNotifications.h
+//     registry        RegistryObservers.h, which calls those who observe one, and
+//                     MemoryProgressRecord.h
 //     accounts        ActingAccount.h
 //     property_list/  both encodings, a room of its own
 //

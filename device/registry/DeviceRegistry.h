@@ -2,9 +2,9 @@
 
 // device/registry: the platform's `AppRegistry`. `DeviceRegistry` (this header) answers from the
 // database what is installed and turns installs, placeholders and removals into operations of
-// device/install; `RegistryObservers` (RegistryObservers.h) tells observers, on a thread of its
-// own, of installs that are under way. Includes install, database and values. Called by the plug-in
-// through platform/ and by `Device`.
+// device/install; `RegistryObservers` (of system/) tells observers of the installs under way.
+// Includes install, database, values and system. Called by the plug-in through platform/ and by
+// `Device`.
 
 #include <memory>
 #include <mutex>
@@ -13,8 +13,8 @@
 #include <string>
 
 #include "device/install/InstallContext.h"
-#include "device/registry/RegistryObservers.h"
 #include "platform/AppRegistry.h"
+#include "system/RegistryObservers.h"
 
 namespace appsync {
 

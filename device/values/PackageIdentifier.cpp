@@ -1,7 +1,5 @@
 #include "device/values/PackageIdentifier.h"
 
-#include <algorithm>
-
 #include "device/values/DeviceError.h"
 #include "device/values/PackageText.h"
 
@@ -14,19 +12,7 @@ constexpr std::string_view kArchiveSuffix = ".zip";
 constexpr std::string_view kReplacedSuffix = "~zip";
 constexpr std::size_t kLongestFileName = 255;
 
-bool isIdentifierCharacter(char character) noexcept {
-    return (character >= 'a' && character <= 'z') || (character >= 'A' && character <= 'Z') ||
-           (character >= '0' && character <= '9') || character == '.' || character == '-' ||
-           character == '_';
-}
-
 }  // namespace
-
-bool isLegalIdentifier(std::string_view text) noexcept {
-    if (text.empty() || text.size() > kMaximumIdentifierLength) return false;
-    if (text == "." || text == "..") return false;
-    return std::all_of(text.begin(), text.end(), isIdentifierCharacter);
-}
 
 Status requireLegalIdentifier(const std::string& identifier) {
     if (isLegalIdentifier(identifier)) return {};

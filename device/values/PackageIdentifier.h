@@ -1,24 +1,16 @@
 #pragma once
 
-#include <cstddef>
 #include <optional>
 #include <string>
 #include <string_view>
 
+#include "platform/LegalIdentifier.h"
 #include "platform/Result.h"
 
 namespace appsync {
 
-/// The longest identifier of an application, in bytes.
-inline constexpr std::size_t kMaximumIdentifierLength = 255;
-
 /// What a legal identifier consists of, for the sentences that refuse one.
 inline constexpr std::string_view kIdentifierRule = "1 to 255 letters, digits, '.', '-' and '_'";
-
-/// Whether a device accepts the text as the identifier of an application: 1 to 255 bytes of
-/// letters, digits, '.', '-' and '_', and neither "." nor "..". Such a text is safe as the name of
-/// a file.
-[[nodiscard]] bool isLegalIdentifier(std::string_view text) noexcept;
 
 /// An error of `kRegistryErrorDomain` unless the identifier is a legal one.
 Status requireLegalIdentifier(const std::string& identifier);

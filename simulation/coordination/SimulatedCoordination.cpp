@@ -5,6 +5,7 @@
 #include <string_view>
 
 #include "platform/AppRegistry.h"
+#include "platform/LegalIdentifier.h"
 #include "simulation/coordination/SimulatedCoordinator.h"
 #include "simulation/coordination/SimulatedPlaceholder.h"
 #include "simulation/coordination/SimulatedPromises.h"
@@ -203,7 +204,7 @@ SimulatedCoordination::Coordinator SimulatedCoordination::lookUp(CoordinatorKind
     if (const Status status = takeFailure(CoordinationStep::LookUp, identifier); !status) {
         return failure(status.error());
     }
-    if (!SimulatedAppRegistry::isLegalIdentifier(identifier)) {
+    if (!isLegalIdentifier(identifier)) {
         return failure(refused("'" + identifier + "' is no identifier"));
     }
     if (const State found = find(identifier)) {

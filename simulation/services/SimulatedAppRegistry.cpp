@@ -4,6 +4,7 @@
 #include <cerrno>
 #include <utility>
 
+#include "platform/LegalIdentifier.h"
 #include "platform/PropertyListSerialization.h"
 #include "simulation/files/SimulatedFileSystem.h"
 #include "simulation/recording/RecordedCall.h"
@@ -16,14 +17,8 @@ constexpr std::string_view kObserver = "AppRegistryObserver";
 constexpr std::int64_t kRefused = 1;
 constexpr std::int64_t kNotFound = 2;
 constexpr std::int64_t kPackageRefused = 1;
-constexpr std::size_t kLongestIdentifier = 255;
 constexpr const char* kPlaceholders = "/var/containers/Bundle/Placeholder";
 constexpr const char* kApplications = "/var/containers/Bundle/Application";
-
-bool isLegalCharacter(char c) {
-    return (c >= 'a' && c <= 'z') || (c >= 'A' && c <= 'Z') || (c >= '0' && c <= '9') || c == '.' ||
-           c == '-' || c == '_';
-}
 
 ErrorRecord refused(const std::string& why) {
     return ErrorRecord::make(kRegistryErrorDomain, kRefused, why);
@@ -45,8 +40,7 @@ Result<std::string> checkedIdentifier(const PropertyList& options, std::string_v
     }
     const std::string* identifier = options.findString(BundleIdentifierKey);
     if (identifier == nullptr) return refused("the options name no bundle identifier");
-    if (!SimulatedAppRegistry::isLegalIdentifier(*identifier))
-        return refused("'" + *identifier + "' is no identifier");
+    if (!isLegalIdentifier(*identifier)) return refused("'" + *identifier + "' is no identifier");
     return *identifier;
 }
 
@@ -545,12 +539,6 @@ void SimulatedAppRegistry::removeStrayContainers() {
 }
 
 // Other services.
-
-bool SimulatedAppRegistry::isLegalIdentifier(std::string_view identifier) {
-    return !identifier.empty() && identifier.size() <= kLongestIdentifier && identifier != "." &&
-           identifier != ".." &&
-           std::all_of(identifier.begin(), identifier.end(), isLegalCharacter);
-}
 
 Result<Persistence> SimulatedAppRegistry::showPlaceholder(AppProxy proxy) {
     const std::string identifier = proxy.applicationIdentifier;

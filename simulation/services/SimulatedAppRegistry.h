@@ -88,7 +88,6 @@ class SimulatedAppRegistry : public AppRegistry {
     [[nodiscard]] std::size_t observers() const { return subscriptions_.size(); }
 
     // What other services of the device do with it.
-    [[nodiscard]] static bool isLegalIdentifier(std::string_view identifier);
     /// Installs the file at a path as the package of the identifier; fails as `installPackage`
     /// does. Who calls it says that something has changed.
     Status install(const std::string& identifier, const std::string& path);

@@ -1,16 +1,7 @@
 #include <functional>
 #include <ostream>
 
-#include "platform/absent/NoBackup.h"
-#include "platform/absent/NoCoordination.h"
-#include "platform/absent/NoHomeScreen.h"
-#include "platform/absent/NoIcons.h"
-#include "platform/absent/NoLog.h"
-#include "platform/absent/NoNotificationCenter.h"
-#include "platform/absent/NoNotifications.h"
-#include "platform/absent/NoPolicy.h"
-#include "platform/absent/NoTransactionLog.h"
-#include "platform/absent/NoUninstalledList.h"
+#include "platform/absent/AbsentServices.h"
 #include "tests/client/AppsClientFixture.h"
 
 namespace appsync {
@@ -21,20 +12,6 @@ using testing::ElementsAre;
 using testing::HasSubstr;
 using testing::IsEmpty;
 using testing::Not;
-
-/// One of each, for as long as a test runs.
-struct AbsentServices {
-    NoBackup backup;
-    NoCoordination coordination;
-    NoHomeScreen homeScreen;
-    NoIcons icons;
-    NoLog log;
-    NoNotificationCenter notificationCenter;
-    NoNotifications notifications;
-    NoPolicy policy;
-    NoTransactionLog transactions;
-    NoUninstalledList installer;
-};
 
 /// Sessions on a device in memory that lacks some of its services.
 class AbsentServicesTest : public AppsClientFixture {
@@ -51,7 +28,7 @@ class AbsentServicesTest : public AppsClientFixture {
             .host = full.host,
             .log = lacks("log") ? absent_.log : full.log,
             .registry = full.registry,
-            .installer = lacks("installer") ? absent_.installer : full.installer,
+            .installer = lacks("installer") ? absent_.uninstalled : full.installer,
             .coordination = lacks("coordination") ? absent_.coordination : full.coordination,
             .policy = lacks("policy") ? absent_.policy : full.policy,
             .backup = lacks("backup") ? absent_.backup : full.backup,
@@ -121,8 +98,10 @@ TEST_P(EachAbsentService, IsNoHindranceToASync) {
 }
 
 TEST_F(AbsentServicesTest, ASyncNeedsNoneOfThem) {
-    makeClientLacking({"backup", "coordination", "homeScreen", "icons", "log", "notificationCenter",
-                       "notifications", "policy", "transactions", "installer"});
+    const Platform full = platform_.services();
+    client_ = AppsClient::create(
+        absent_.completed(full.host, full.registry, full.queues, full.files, full.propertyLists));
+    platform_.clearRecording();
     sync();
     expectSynced();
     EXPECT_THAT(platform_.messages(), IsEmpty());

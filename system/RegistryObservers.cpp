@@ -1,4 +1,4 @@
-#include "device/registry/RegistryObservers.h"
+#include "system/RegistryObservers.h"
 
 #include <algorithm>
 #include <chrono>

@@ -1,6 +1,7 @@
 #pragma once
 
 #include <condition_variable>
+#include <cstdint>
 #include <functional>
 #include <memory>
 #include <mutex>
@@ -17,14 +18,21 @@ namespace appsync {
 struct InstallsUnderWay {
     std::vector<AppProxy> prioritized;
     std::vector<AppProxy> paused;
+
+    /// Adds an install whose record has this state to the list that it belongs to, if to any.
+    void add(const AppProxy& proxy, std::uint64_t state) {
+        if (state == kInstallStatePaused) paused.push_back(proxy);
+        if (state < kInstallStatePaused) prioritized.push_back(proxy);
+    }
 };
 
-/// Tells observers of the installs under way, on a thread of its own: each new observer once, soon
-/// after it was added, and all of them when the lists have changed, a few times a second at most.
+/// Tells the observers of a registry of the installs under way, as `AppRegistryObserver` wants it,
+/// on a thread of its own: each new observer once, soon after it was added, and all of them when
+/// the lists have changed, a few times a second at most. No lock is held while one is called.
 /// Callable on any thread.
 class RegistryObservers {
   public:
-    /// `list` makes the lists, on that thread.
+    /// `list` makes the lists, on that thread; it may take the registry's locks.
     explicit RegistryObservers(std::function<InstallsUnderWay()> list);
     /// No call begins any more. An observer must not destroy this.
     ~RegistryObservers();
