@@ -120,3 +120,49 @@ def test_pkg_config_says_what_is_not_there(without_system):
                            capture_output=True, text=True, env=environment)
     assert asked.returncode != 0 and "appsync-system" in asked.stderr
     assert subprocess.run(["pkg-config", "--exists", "appsync-plugin"], env=environment).returncode == 0
+
+
+LINES_OF_A_PORT = 300
+
+
+@pytest.fixture(scope="module")
+def port(prefix, tmp_path_factory):
+    """The example of a port, built with the packages alone: its sources, and where it was built."""
+    sources = tmp_path_factory.mktemp("port") / "sources"
+    shutil.copytree(TREE / "examples" / "port", sources)
+    built = sources.parent / "built"
+    run("cmake", "-G", "Ninja", "-S", sources, "-B", built, "-DCMAKE_PREFIX_PATH=%s" % prefix,
+        "-DCMAKE_CXX_FLAGS=-Wall -Wextra -Werror")
+    run("cmake", "--build", built)
+    return sources, built
+
+
+def test_the_example_of_a_port_is_small():
+    texts = [(TREE / "examples" / "port" / name).read_text() for name in ("Device.h", "Registry.cpp", "install_one.cpp")]
+    lines = [line.strip() for text in texts for line in text.splitlines()]
+    assert len([line for line in lines if line and not line.startswith("//")]) <= LINES_OF_A_PORT
+
+
+def test_the_example_of_a_port_installs_a_package_again_and_again(port, tmp_path):
+    for _ in range(2):
+        assert run(port[1] / "install_one", tmp_path / "device") == "com.example.hello 1.0\n"
+
+
+def test_the_example_of_a_port_passes_the_kit(port):
+    assert "0 broken" in run(port[1] / "prove")
+
+
+def test_a_broken_contract_in_a_port_is_named_with_its_sentence(port):
+    sources, built = port
+    registry = sources / "Registry.cpp"
+    kept = registry.read_text()
+    broken = kept.replace("(options.findFlag(UninstallPlaceholderOnlyKey) || !record.erase(kApplication))",
+                          "!record.erase(kApplication)")
+    assert broken != kept
+    registry.write_text(broken)
+    run("cmake", "--build", built, "--target", "prove")
+    proved = subprocess.run([built / "prove"], capture_output=True, text=True)
+    assert proved.returncode == 1
+    said = " ".join(proved.stdout.split())
+    assert "platform/AppRegistry.h" in said
+    assert "With `UninstallPlaceholderOnlyKey` true the application is never touched." in said
