@@ -1,6 +1,7 @@
 """Days of random use: every command, in an order that a seed decides, held against what must always be so.
 
-APPSYNC_WALKS=50 walks fifty days on each path instead of four; a day that fails names its seed and its commands.
+APPSYNC_WALKS=50 walks fifty days on each path instead of four, APPSYNC_FIRST_WALK=1000 begins at that seed; a day that
+fails names its seed and its commands.
 """
 
 import json
@@ -13,6 +14,7 @@ import pytest
 import packages
 from conftest import Device, names_of
 
+FIRST_DAY = int(os.environ.get("APPSYNC_FIRST_WALK", "0"))
 DAYS = int(os.environ.get("APPSYNC_WALKS", "4"))
 STEPS = 40
 IDS = ["com.example.app%d" % number for number in range(6)]
@@ -197,7 +199,7 @@ ACTIONS = (
 LOSING = {"sync", "stage", "uninstall"}
 
 
-@pytest.mark.parametrize("seed", range(DAYS))
+@pytest.mark.parametrize("seed", range(FIRST_DAY, FIRST_DAY + DAYS))
 def test_a_day_of_random_use(appsync, tmp_path, coordination, seed):
     walk = Walk(appsync, tmp_path, coordination, seed)
     for _ in range(STEPS):

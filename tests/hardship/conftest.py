@@ -1,7 +1,8 @@
 """The built command, named by APPSYNC, against kills, failing calls, a full disk and hostile neighbours.
 
 APPSYNC_HARDSHIP=long tries everything; without it a share of that is tried, which APPSYNC_SEED chooses
-(a number; printed with each run, 1 if it is not set).
+(a number; printed with each run, 1 if it is not set). APPSYNC_CALLS=5/64 tries every 64th call of a command from the 5th on
+in the long form, APPSYNC_CALLS=217 that one.
 """
 
 import importlib.util
@@ -23,6 +24,15 @@ appsync = acceptance.appsync
 
 IS_LONG = os.environ.get("APPSYNC_HARDSHIP") == "long"
 SEED = int(os.environ.get("APPSYNC_SEED", "1"))
+CALLS = os.environ.get("APPSYNC_CALLS", "")
+
+
+def long_form(count):
+    """The numbers of the calls that the long form meddles with, of so many."""
+    first, _, apart = CALLS.partition("/")
+    if not first:
+        return range(1, count + 1)
+    return range(int(first), count + 1 if apart else int(first) + 1, int(apart or 1))
 
 
 def pytest_report_header():

@@ -8,7 +8,7 @@ import re
 
 import pytest
 
-from conftest import IS_LONG, SEED
+from conftest import IS_LONG, SEED, long_form
 from devices import SCENARIOS, check_intact, check_same, leave_out, look_at, without_session
 
 # Which calls fail, and with what.
@@ -46,7 +46,7 @@ SHARE = 40  # of the combinations of scenario and fault, one call each, in the s
 
 def chosen(count, label):
     if IS_LONG:
-        return range(1, count + 1)
+        return long_form(count)
     return [random.Random("%d %s" % (SEED, label)).randint(1, count)]
 
 
@@ -130,8 +130,9 @@ def test_a_failing_call_is_told_and_survived(meddling, prepared, name, fault, ev
     count = scenario.meddled("--calls", calls).count
     assert count > 0, "no such call is made"
     options = ["--calls", calls, "--fail", error] + (["--ever"] if ever else [])
-    problems = []
+    tried, problems = 0, []
     for number in chosen(count, "%s %s %s" % (name, fault, ever)):
+        tried += 1
         outcome = injected(scenario, options, number)
         try:
             check_said(scenario, outcome, fault, ever)
@@ -141,6 +142,7 @@ def test_a_failing_call_is_told_and_survived(meddling, prepared, name, fault, ev
         except AssertionError as problem:
             problems.append("%s --at %d: %s -> %s\n%s\n%s" % (
                 " ".join(options), number, outcome.hit, outcome.status, outcome.said, problem))
+    print("%s: %d failing calls of %d" % (name, tried, count))
     assert not problems, "\n\n".join(problems)
 
 

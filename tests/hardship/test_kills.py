@@ -4,7 +4,7 @@ import random
 
 import pytest
 
-from conftest import IS_LONG, SEED
+from conftest import CALLS, IS_LONG, SEED, long_form
 from devices import SCENARIOS
 
 KILLS = 12  # of each scenario in the short form
@@ -13,7 +13,7 @@ KILLS = 12  # of each scenario in the short form
 def chosen(count):
     """The numbers of the calls to be killed at: all, or a few that are evenly apart."""
     if IS_LONG:
-        return range(1, count + 1)
+        return long_form(count)
     stride = max(1, count // KILLS)
     return range(1 + random.Random(SEED).randrange(stride), count + 1, stride)
 
@@ -36,4 +36,4 @@ def test_a_kill_at_any_call_loses_nothing(meddling, prepared, name):
             problems.append("--kill %d: %s\n%s" % (number, outcome.hit, problem))
     print("%s: %d kills in %d calls" % (name, killed, undisturbed.count))
     assert not problems, "\n\n".join(problems)
-    assert killed >= min(KILLS, undisturbed.count) - 2
+    assert CALLS or killed >= min(KILLS, undisturbed.count) - 2

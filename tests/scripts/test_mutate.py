@@ -1,3 +1,5 @@
+import pytest
+
 from scripts import load
 
 mutate = load("mutate")
@@ -20,3 +22,29 @@ def test_the_summary_tells_how_many(capsys):
     assert mutate.summary([(edit, "test_client failed", True) for edit in edits("a", "b")], 7)
     out = capsys.readouterr().out
     assert "2 mutants, 2 caught, 0 survived" in out and "7 changes more do not compile" in out
+
+
+def test_what_was_prepared_is_met_by_number(tmp_path, monkeypatch, capsys):
+    monkeypatch.setattr(mutate, "PREPARED", tmp_path / "prepared.json")
+    monkeypatch.setattr(mutate, "remembered", set)
+    monkeypatch.setattr(mutate, "sources", lambda: ["client/Paths.cpp"])
+    every, _ = mutate.find_edits(set())
+    sessions = mutate.Suite("test_reliability", "Seeds.", 2.0, {2})
+    mutate.save_prepared(every, [mutate.Suite("test_client", "Paths.", 0.1, {1, 2})], sessions)
+    monkeypatch.setattr(mutate, "run", lambda *_: ("failed", 0.1))
+    monkeypatch.setattr(mutate, "run_sessions", lambda *_: ("", 0.1))
+    mutate.meet_numbers(2, 3)
+    out = capsys.readouterr().out
+    assert out.startswith("2 caught: test_client failed: client/Paths.cpp:")
+    assert "\n3 survived: client/Paths.cpp:" in out and out.endswith("2 mutants, 1 caught\n")
+
+
+def test_what_was_prepared_of_other_sources_is_not_met(tmp_path, monkeypatch):
+    monkeypatch.setattr(mutate, "PREPARED", tmp_path / "prepared.json")
+    with pytest.raises(SystemExit, match="--prepare"):
+        mutate.read_prepared()
+    mutate.save_prepared([], [], mutate.Suite("test_reliability", "Seeds.", 2.0, set()))
+    assert mutate.read_prepared()[0] == []
+    monkeypatch.setattr(mutate, "digest", lambda: "another")
+    with pytest.raises(SystemExit, match="--prepare"):
+        mutate.read_prepared()
