@@ -132,8 +132,10 @@ TEST_P(WorkQueuesExclusionContract, WorkWithoutDelayIsNotRunByItsCaller) {
     {
         const std::lock_guard<Lock> guard(*lock);
         queues_.runAfter(0ns, [&] {
-            const std::lock_guard<Lock> inner(*lock);
-            note("task");
+            {
+                const std::lock_guard<Lock> inner(*lock);
+                note("task");
+            }
             over->leave();
         });
         note("returned");
@@ -153,8 +155,10 @@ TEST_P(WorkQueuesExclusionContract, AnOperationIsNotRunByItsCaller) {
     {
         const std::lock_guard<Lock> guard(*lock);
         operations->add([&] {
-            const std::lock_guard<Lock> inner(*lock);
-            note("task");
+            {
+                const std::lock_guard<Lock> inner(*lock);
+                note("task");
+            }
             over->leave();
         });
         note("returned");
