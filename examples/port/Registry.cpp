@@ -38,16 +38,15 @@ std::optional<std::string> textAt(const PropertyList& map, std::string_view key)
 }
 
 AppProxy proxyOf(const std::string& identifier, std::string_view kind, const PropertyList& bundle) {
-    AppProxy proxy;
-    proxy.applicationIdentifier = identifier;
-    proxy.bundleVersion = textAt(bundle, BundleVersionKey);
-    proxy.displayName = textAt(bundle, BundleDisplayNameKey);
-    proxy.bundleContainerPath = textAt(bundle, kContainer).value_or("");
-    proxy.bundlePath = proxy.bundleContainerPath + kBundle;
-    proxy.installType = numberAt(bundle, InstallTypeKey);
-    proxy.state = {kind == kApplication, kind == kPlaceholder};
-    proxy.staticDiskUsage = numberAt(bundle, kBytes);
-    return proxy;
+    const std::string container = textAt(bundle, kContainer).value_or("");
+    return {.applicationIdentifier = identifier,
+            .bundleVersion = textAt(bundle, BundleVersionKey),
+            .displayName = textAt(bundle, BundleDisplayNameKey),
+            .bundlePath = container + kBundle,
+            .bundleContainerPath = container,
+            .installType = numberAt(bundle, InstallTypeKey),
+            .state = {kind == kApplication, kind == kPlaceholder},
+            .staticDiskUsage = numberAt(bundle, kBytes)};
 }
 
 class Registry : public AppRegistry {
@@ -55,7 +54,7 @@ class Registry : public AppRegistry {
     Registry(RootedFileSystem& files, PropertyListSerialization& codec)
         : files_(files), codec_(codec), observers_([this] { return installsUnderWay(); }) {
         if (const auto bytes = files_.readFile(kBook)) book_ = *codec_.parse(*bytes);
-        for (const auto& [identifier, record] : book_.entries()) beginInstall(identifier);
+        for (const auto& [identifier, record] : book_.entries()) beginInstall(identifier, record);
         removeStrayContainers();
     }
 
@@ -63,10 +62,9 @@ class Registry : public AppRegistry {
                                                Placeholders placeholders) override {
         const std::lock_guard guard(mutex_);
         const PropertyList record = recordOf(identifier);
-        const PropertyList* bundle = record.find(kPlaceholder);
-        const bool covers = bundle != nullptr && placeholders == Placeholders::Included;
+        const bool covers = placeholders == Placeholders::Included && record.find(kPlaceholder);
         const std::string_view kind = covers ? kPlaceholder : kApplication;
-        bundle = record.find(kind);
+        const PropertyList* bundle = record.find(kind);
         return bundle != nullptr ? std::optional(proxyOf(identifier, kind, *bundle)) : std::nullopt;
     }
 
@@ -97,7 +95,12 @@ class Registry : public AppRegistry {
     }
 
     Status installPackage(const FileURL& package, const PropertyList& options) override {
-        return install(kApplication, PackageTypeCustomer, package.path(), options);
+        Status installed = install(kApplication, PackageTypeCustomer, package.path(), options);
+        const std::string identifier = textAt(options, BundleIdentifierKey).value_or("");
+        const auto proxy = proxyForIdentifier(identifier, Placeholders::Included);
+        const auto record = proxy ? installProgress(*proxy, kWholeInstall) : nullptr;
+        if (!installed && record != nullptr) record->setInstallState(kInstallStateFailed);
+        return installed;
     }
     Status installPlaceholderBundle(const FileURL& directory,
                                     const PropertyList& options) override {
@@ -137,12 +140,11 @@ class Registry : public AppRegistry {
         const auto now = std::chrono::system_clock::now().time_since_epoch();
         const std::string container = std::string(kContainers) + "/" + std::to_string(now.count());
         const std::string bundle = container + kBundle;
-        const bool isPlaceholder = kind == kPlaceholder;
-        Status made = files_.createDirectory(isPlaceholder ? container : bundle, true, nullptr);
-        if (made) {
-            made = isPlaceholder ? files_.copyDirectory(source, bundle)
-                                 : files_.copyItem(source, bundle + "/Info.plist");
-        }
+        Status made =
+            files_.createDirectory(kind == kPlaceholder ? container : bundle, true, nullptr);
+        if (made)
+            made = kind == kPlaceholder ? files_.copyDirectory(source, bundle)
+                                        : files_.copyItem(source, bundle + "/Info.plist");
         const PropertyList* metadata = options.find(StoreMetadataKey);
         if (made && metadata != nullptr && metadata->asData() != nullptr)
             made = files_.createFile(container + "/VessikMetadata.plist", *metadata->asData(), {});
@@ -186,7 +188,7 @@ class Registry : public AppRegistry {
             book_ = std::move(book);
             const auto install = installs_.extract(identifier);
             if (!install.empty()) install.mapped()->end(endState);
-            beginInstall(identifier);
+            beginInstall(identifier, recordOf(identifier));
         }
         observers_.touch();
         removeStrayContainers();
@@ -194,8 +196,7 @@ class Registry : public AppRegistry {
     }
 
     /// Where a placeholder stands that is no demoted application's.
-    void beginInstall(const std::string& identifier) {
-        const PropertyList record = recordOf(identifier);
+    void beginInstall(const std::string& identifier, const PropertyList& record) {
         const PropertyList* bundle = record.find(kPlaceholder);
         if (bundle == nullptr || numberAt(*bundle, InstallTypeKey) >= kInstallTypeDowngrade) return;
         installs_[identifier] =

@@ -42,8 +42,7 @@ void send(const Platform& platform, AppsClient& client, const SyncAssetPointer& 
     const PropertyList info = PropertyList::map({{BundleIdentifierKey, asset->identifier},
                                                  {BundleVersionKey, "1.0"},
                                                  {BundleDisplayNameKey, "Hello"}});
-    const bool isThere = write(platform, *asset->path, info);
-    client.assetTransferSucceeded(asset, isThere, nullptr);
+    client.assetTransferSucceeded(asset, write(platform, *asset->path, info), nullptr);
 }
 
 }  // namespace

@@ -14,6 +14,7 @@
 
 #include "client/AppsClient.h"
 #include "client/Paths.h"
+#include "platform/LegalIdentifier.h"
 #include "simulation/SimulatedPlatform.h"
 #include "system/property_list/PropertyListCodec.h"
 
@@ -125,7 +126,7 @@ class ReaderDevice {
     void send(const SyncAssetPointer& asset, bool arrives) {
         const ErrorRecord lost = ErrorRecord::make(kPosixErrorDomain, 5, "the cable was pulled");
         client_->assetTransferUpdatedProgress(asset, 0.5);
-        if (arrives && SimulatedAppRegistry::isLegalIdentifier(asset->identifier)) {
+        if (arrives && isLegalIdentifier(asset->identifier)) {
             asset->path = formatPath("%s/%@.zip", {kPublicStaging, asset->identifier});
             platform_.files.addFile(*asset->path, "package");
             client_->assetTransferSucceeded(asset, true, nullptr);
