@@ -51,7 +51,7 @@ class Campaign:
                 with engine.connect(self.address) as client:
                     self.pump(client)
                     return
-            except (Gone, *engine.AWAY):
+            except (Gone, *engine.AWAY, *engine.LOST):
                 self.forget()
                 self.bar.say("the scheduler is away; trying again")
                 time.sleep(1)

@@ -4,6 +4,8 @@ A worker offers, as a resource of the engine, the builds that it has and their c
 worker of another commit gets nothing.
 """
 
+import asyncio
+import concurrent.futures
 import logging
 import os
 import subprocess
@@ -28,7 +30,10 @@ except ImportError as error:
 
 logging.getLogger("asyncio").setLevel(logging.CRITICAL)  # what the engine leaves behind at its end
 
-AWAY = (OSError, TimeoutError)  # how the engine says that the scheduler cannot be reached
+# How the engine says that the scheduler cannot be reached, or has lost what it was given.
+AWAY = (OSError, TimeoutError)
+LOST = (asyncio.CancelledError, concurrent.futures.CancelledError)
+PAGES = "127.0.0.1:0"  # the engine's own pages are for this machine alone, and none of ours
 CONNECT = 10  # seconds for one try
 ASKED = "campaign"  # under this name the scheduler tells what is asked for
 
@@ -40,7 +45,8 @@ def resource(name, commit):
 def local(count, resources):
     """A scheduler and so many workers, on this machine alone."""
     return distributed.LocalCluster(
-        n_workers=count, threads_per_worker=1, host="127.0.0.1", dashboard_address=None, memory_limit=0,
+        n_workers=count, threads_per_worker=1, host="127.0.0.1", memory_limit=0, dashboard_address=PAGES,
+        worker_dashboard_address=PAGES, scheduler_kwargs={"dashboard": False},
         resources={each: 1 for each in resources},
     )
 
@@ -103,7 +109,8 @@ def ready(wanted, is_built, say):
 def serve(address, count, tree, offered, say):
     """The engine's own workers, until they lose their scheduler."""
     command = [sys.executable, "-m", "distributed.cli.dask_worker", address, "--nworkers", str(count), "--nthreads", "1"]
-    command += ["--memory-limit", "0", "--resources", f"{offered}=1", "--no-dashboard", "--death-timeout", "30"]
+    command += ["--memory-limit", "0", "--resources", f"{offered}=1", "--death-timeout", "30"]
+    command += ["--no-dashboard", "--dashboard-address", PAGES]
     with connect(address) as client:
         process = subprocess.Popen(
             [*command, "--local-directory", str(WORK / "engine")], cwd=tree, stdin=subprocess.DEVNULL,

@@ -87,10 +87,19 @@ def finish(command, environment, limit, made):
     except subprocess.TimeoutExpired:
         hangs = True
         kill(process)
-        output = process.communicate()[0]
+        output = what_it_said(process)
     if report.exists():
         output += report.read_text(errors="replace")
     return Ended(process.returncode, output, hangs, made)
+
+
+def what_it_said(process):
+    """Of a program that was ended. What it has started apart from itself may hold its output open."""
+    try:
+        return process.communicate(timeout=10)[0]
+    except subprocess.TimeoutExpired:
+        process.stdout.close()
+        return ""
 
 
 def kill(process):

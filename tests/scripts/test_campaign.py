@@ -251,6 +251,7 @@ class Scheduler:
 
     def start(self):
         command = ["/usr/bin/python3", "-m", "distributed.cli.dask_scheduler", "--host", "127.0.0.1", "--no-dashboard"]
+        command += ["--dashboard-address", "127.0.0.1:0"]
         self.process = subprocess.Popen(
             [*command, "--port", str(self.port)], cwd=self.folder, stdin=subprocess.DEVNULL, stdout=subprocess.DEVNULL,
             stderr=subprocess.DEVNULL, env={**os.environ, "DASK_CONFIG": str(self.folder)},
@@ -303,6 +304,28 @@ def test_a_worker_of_another_commit_is_refused(tree, tmp_path, scheduler):
     finally:
         campaign.send_signal(signal.SIGINT)
         assert "0 units" in campaign.communicate(timeout=LIMIT)[0]
+
+
+def test_a_worker_that_has_built_something_else_gets_nothing(tmp_path):
+    from campaigns import driver, engine, kinds, report
+    from campaigns.state import State
+
+    class Stopping(report.Bar):
+        said = ""
+
+        def say(self, text):
+            self.said += text
+            campaign.stop()
+
+    state = State(tmp_path / "state.db")
+    state.belong_to("seeds", "this", None)
+    bar = Stopping("seeds")
+    with engine.local(1, [engine.resource("release", "another")]) as cluster:
+        campaign = driver.Campaign(kinds.KINDS["seeds"], state, "this", bar, cluster.scheduler_address)
+        campaign.go()
+    assert "is refused: it offers release@another, and this campaign needs release@this" in bar.said
+    assert state.done() == set() and campaign.tries == 0
+    state.close()
 
 
 # --- kinds ---------------------------------------------------------------------------------------
