@@ -24,6 +24,7 @@ enum class OptionalService {
     TransactionLog,      // InstallTransactionLog.h
     Notifications,       // Notifications.h, NamedNotifications
     NotificationCenter,  // Notifications.h
+    CancelByPerson,      // AppRegistry.h: nobody on the device cancels an install
 };
 
 /// An implementation of platform/, as the kit takes it: how its services are made, anew for each

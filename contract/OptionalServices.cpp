@@ -24,6 +24,8 @@ std::string_view nameOf(OptionalService service) {
             return "named notifications";
         case OptionalService::NotificationCenter:
             return "notification center";
+        case OptionalService::CancelByPerson:
+            return "cancelling by a person";
     }
     return "?";
 }
@@ -53,6 +55,8 @@ std::string_view meaningOfAbsence(OptionalService service) {
             return "the home screen is not told that a sync begins and ends";
         case OptionalService::NotificationCenter:
             return "coordinators that the client has not touched itself are not observed";
+        case OptionalService::CancelByPerson:
+            return "only the plug-in itself gives up an install";
     }
     return "?";
 }

@@ -329,7 +329,12 @@ TEST_P(RegistryObserverContract, WhatHasFailedIsNotUnderWay) {
     registry_.removeObserver(keeper.get());
 }
 
-TEST_P(RegistryObserverContract, WhatAPersonCancelsIsTold) {
+class RegistryObserverCancelContract : public RegistryObserverContract {};
+
+APPSYNC_CONTRACT_SUITE(RegistryObserverCancelContract,
+                       devicePorts({OptionalService::CancelByPerson}));
+
+TEST_P(RegistryObserverCancelContract, WhatAPersonCancelsIsTold) {
     checks("platform/AppRegistry.h",
            "`applicationInstallsDidCancel:`: somebody on the device cancelled these installs.");
     ASSERT_TRUE(installPlaceholder({kA}, kInstallTypeSync));

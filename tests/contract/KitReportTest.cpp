@@ -76,7 +76,7 @@ TEST(KitReportTest, JsonCarriesWhateverWasSeen) {
 }
 
 TEST(KitReportTest, EveryAbsenceHasANameAndAMeaning) {
-    for (int i = 0; i <= static_cast<int>(OptionalService::NotificationCenter); ++i) {
+    for (int i = 0; i <= static_cast<int>(OptionalService::CancelByPerson); ++i) {
         EXPECT_NE(nameOf(static_cast<OptionalService>(i)), "?");
         EXPECT_NE(meaningOfAbsence(static_cast<OptionalService>(i)), "?");
     }

@@ -177,7 +177,10 @@ std::unique_ptr<DeviceUnderTest> makeReferenceDevice() {
 }
 
 ContractPort referencePort() {
-    return {"Reference", nullptr, makeReferenceDevice, {OptionalService::Transfers}};
+    return {"Reference",
+            nullptr,
+            makeReferenceDevice,
+            {OptionalService::Transfers, OptionalService::CancelByPerson}};
 }
 
 }  // namespace appsync
