@@ -1,7 +1,8 @@
 # What is installed where, below any prefix:
 #
 #     bin/appsync                     lib/appsync/appsync-plugin.so
-#     include/appsync/                the headers of platform/, client/ (in part), system/, simulation/, checked/ and contract/
+#     include/appsync/                the headers of platform/, client/ (in part), system/, simulation/, checked/,
+#                                     recording/ and contract/
 #     lib/libappsync_*.a              with lib/cmake/appsync/ and lib/pkgconfig/
 #     share/doc/appsync/              share/man/, and completions where bash, zsh and fish look for them
 #
@@ -33,8 +34,9 @@ appsync_install_library(plugin "the appsync plug-in" "appsync-platform")
 appsync_install_library(system "files, queues and property lists for appsync's plug-in" "appsync-platform pugixml")
 appsync_install_library(simulation "a device in memory for appsync's plug-in" "appsync-platform")
 appsync_install_library(checked "what tells of broken contracts while appsync's plug-in runs" "appsync-platform")
+appsync_install_library(recording "recordings of sessions with appsync's plug-in" "appsync-platform")
 
-set(folders platform system simulation checked)
+set(folders platform system simulation checked recording)
 if(APPSYNC_CONTRACT)
     appsync_install_library(contract "what proves a device for appsync's plug-in" "appsync-plugin gmock gtest")
     list(APPEND folders contract)
