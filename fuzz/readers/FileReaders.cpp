@@ -19,6 +19,8 @@
 #include "host/output/JsonRecords.h"
 #include "host/plan/LibraryIndex.h"
 #include "host/plan/Versions.h"
+#include "host/replay/RecordingReader.h"
+#include "host/replay/RecordingText.h"
 #include "system/property_list/PropertyListBinaryEdit.h"
 #include "system/property_list/PropertyListBinaryReader.h"
 #include "system/property_list/PropertyListCodec.h"
@@ -158,6 +160,28 @@ Reading readManifest(ByteView bytes) {
     return Reading::read()
         .unless(std::ranges::all_of(manifest->applications, isLegal), "an illegal identifier")
         .unless(std::ranges::all_of(manifest->files, isInside), "a file outside the backup");
+}
+
+Reading readSessionRecording(ByteView bytes) {
+    const Result<RecordedSession> session =
+        readRecording({reinterpret_cast<const char*>(bytes.data()), bytes.size()});
+    if (!session) {
+        const std::string why = session.error().description();
+        return Reading::refused(why).unless(why.find("recording") != std::string::npos,
+                                            "the refusal does not say of what");
+    }
+    const auto isPlaced = [&session](const RecordStretch& stretch) {
+        return std::ranges::all_of(stretch.lines, [&](std::size_t line) {
+            return line > stretch.beginning && line < session->lines.size();
+        });
+    };
+    const auto isShown = [](const RecordLine& line) {
+        static_cast<void>(mentions(line, "a"));
+        return !recordText(line).empty();
+    };
+    return Reading::read()
+        .unless(std::ranges::all_of(session->stretches, isPlaced), "a line before its beginning")
+        .unless(std::ranges::all_of(session->lines, isShown), "a line that shows nothing");
 }
 
 Reading readLibraryIndex(ByteView bytes) {

@@ -35,6 +35,10 @@ namespace appsync {
 /// written as it was, and names legal identifiers alone.
 [[nodiscard]] Reading readLibraryIndex(ByteView bytes);
 
+/// A recording of a session. A refusal names a line, or says that it is none; of what was read each
+/// line belongs to a stretch that has begun, and can be shown.
+[[nodiscard]] Reading readSessionRecording(ByteView bytes);
+
 /// Three versions, one a line: comparing them is an order.
 [[nodiscard]] Reading readVersions(ByteView bytes);
 

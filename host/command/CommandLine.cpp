@@ -3,8 +3,10 @@
 #include <algorithm>
 #include <charconv>
 #include <chrono>
+#include <cmath>
 #include <cstdint>
 #include <functional>
+#include <limits>
 #include <map>
 #include <memory>
 #include <optional>
@@ -118,6 +120,14 @@ std::optional<std::chrono::seconds> duration(std::string_view text) {
     return std::chrono::seconds(*number * factor);
 }
 
+// "1.5": not negative.
+std::optional<double> secondsIn(std::string_view text) {
+    double number = 0;
+    const auto [end, error] = std::from_chars(text.data(), text.data() + text.size(), number);
+    const bool isNumber = error == std::errc() && end == text.data() + text.size();
+    return isNumber && std::isfinite(number) && number >= 0 ? std::optional(number) : std::nullopt;
+}
+
 // Declares the commands and remembers which one was chosen. The values that options are parsed into
 // live as long as the commands' actions.
 class Commands {
@@ -143,6 +153,8 @@ class Commands {
         addPackage();
         addData();
         addPropertyList();
+        addRecordings();
+        addReplay();
         addShell();
         app_.add_subcommand("help", "Show the help of a command (= COMMAND --help)");
         refuseEmptyValues(app_);
@@ -423,6 +435,13 @@ class Commands {
             ->type_name("MODULE");
     }
 
+    static void addRecording(CLI::App& added, RecordingArguments& recording) {
+        added.add_option("--record", recording.path, "write a recording of the session")
+            ->type_name("FILE");
+        added.add_flag("--anonymous", recording.isAnonymous,
+                       "record with made-up names, and without contents");
+    }
+
     static void addMirror(CLI::App& added, SyncArguments& values) {
         added.add_flag("--mirror")
             ->description("remove every user application that LIBRARY lacks")
@@ -468,8 +487,11 @@ class Commands {
             [this](const SyncArguments& parsed) { return runSync(parsed, console_); });
         addPlanOptions(added, *values);
         addStaged(added, *values);
-        added.add_flag("--dry-run", values->isDryRun, "only say what would be done (= plan)");
+        CLI::Option* dry =
+            added.add_flag("--dry-run", values->isDryRun, "only say what would be done (= plan)");
         addPlugIn(added, values->plugIn);
+        addRecording(added, values->recording);
+        added.get_option("--record")->excludes(dry);
         addDisplay(added, values->display, values->isVerbose);
     }
 
@@ -513,6 +535,7 @@ class Commands {
             ->check(wholeNumberFrom(1, 3));
         added.add_flag("--yes", values->yes, "replace data that is there, unasked");
         addPlugIn(added, values->plugIn);
+        addRecording(added, values->recording);
         addDisplay(added, values->display, values->isVerbose);
     }
 
@@ -770,6 +793,7 @@ class Commands {
             ->type_name("N")
             ->check(anyWholeNumber());
         addPlugIn(added, values->plugIn);
+        addRecording(added, values->recording);
         added.add_flag("--json", values->asJson, "print JSON");
     }
 
@@ -898,6 +922,54 @@ class Commands {
             ->required();
         show.add_flag("--json", shown->asJson, "print JSON");
         addConvert(parent);
+    }
+
+    // A time within a session.
+    static void addSeconds(CLI::App& added, const std::string& name, std::optional<double>& value,
+                           const std::string& description) {
+        added
+            .add_option_function<std::string>(
+                name, [&value](const std::string& text) { value = secondsIn(text); }, description)
+            ->type_name("SECONDS")
+            ->check(CLI::Validator(
+                [](const std::string& given) {
+                    return secondsIn(given) ? std::string()
+                                            : shownArgument(given) + " is no number of seconds";
+                },
+                ""));
+    }
+
+    void addRecordings() {
+        CLI::App& parent = group("recording", "Look at recordings of sessions (--record)");
+        const auto shown = std::make_shared<ShowRecordingArguments>();
+        CLI::App& show = command<ShowRecordingArguments>(
+            parent, "show", "Show what crossed between plug-in and device in a session", shown,
+            [this](const ShowRecordingArguments& parsed) {
+                return runRecordingShow(parsed, console_);
+            });
+        show.add_option("FILE", shown->file, "the recording")->required();
+        show.add_option("--app", shown->identifier, "what is about this application")
+            ->type_name("ID");
+        show.add_option("--service", shown->service, "what goes through this service")
+            ->type_name("NAME");
+        show.add_option("--thread", shown->thread, "what this thread did")
+            ->type_name("N")
+            ->check(wholeNumberFrom(1, std::numeric_limits<std::int32_t>::max()));
+        addSeconds(show, "--from", shown->from, "what was not before this time");
+        addSeconds(show, "--to", shown->to, "what was not after this time");
+        show.add_flag("--json", shown->asJson, "print JSON");
+    }
+
+    void addReplay() {
+        const auto values = std::make_shared<ReplayArguments>();
+        CLI::App& added = command<ReplayArguments>(
+            app_, "replay", "Run the plug-in against a recording in the place of a device", values,
+            [this](const ReplayArguments& parsed) { return runReplay(parsed, console_); });
+        added.add_option("FILE", values->file, "the recording")->required();
+        addPlugIn(added, values->plugIn);
+        added.add_flag("--strict", values->isStrict,
+                       "calls of different threads, too, come in the recorded order");
+        added.add_flag("--json", values->asJson, "print JSON");
     }
 
     void addConvert(CLI::App& parent) {

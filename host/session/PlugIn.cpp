@@ -9,6 +9,9 @@
 #include "host/console/Problem.h"
 #include "host/watch/SessionWatch.h"
 #include "platform/Notifications.h"
+#include "recording/RecordedClient.h"
+#include "recording/Recording.h"
+#include "recording/RecordingPlatform.h"
 #include "system/JsonLogFacility.h"
 
 namespace appsync {
@@ -34,10 +37,17 @@ PlugIn::~PlugIn() {
     } else {
         device_->closeCoordination();
     }
+    letClientGo();
+    if (recording_ != nullptr) recording_->finish();
+    tellLogLoss();
+}
+
+void PlugIn::letClientGo() {
+    std::optional<SpanRecord> span;
+    if (recording_ != nullptr) span.emplace(*recording_, "host", "destroyClient", 0);
     // Or else the client might go on the registry's thread, after what it stands on.
     if (client_.client != nullptr) registry_->removeObserver(client_.observer);
     table_.destroyClient(client_);  // its last messages come now
-    tellLogLoss();
 }
 
 Status PlugIn::openLog(Device& device) {
@@ -69,41 +79,57 @@ Result<std::unique_ptr<PlugIn>> PlugIn::loadIn(SyncDaemon::Process process, Devi
     return plugIn;
 }
 
-Status PlugIn::makeClient(const Platform& platform) {
-    registry_ = &platform.registry;
-    client_ = table_.makeClient(platform);
+Status PlugIn::makeClient(const Platform& platform, const RecordingOrder& order) {
+    if (order.sink == nullptr) {
+        registry_ = &platform.registry;
+        client_ = table_.makeClient(platform);
+    } else {
+        RecordingOptions options;
+        options.isAnonymous = order.isAnonymous;
+        recording_ = std::make_shared<Recording>(*order.sink, daemon_, table_.plugInVersion,
+                                                 std::move(options));
+        recordingPlatform_ = std::make_unique<RecordingPlatform>(platform, *recording_);
+        registry_ = &recordingPlatform_->services().registry;
+        const SpanRecord span(*recording_, "host", "makeClient", 0);
+        client_ = table_.makeClient(recordingPlatform_->services());
+        if (client_.client != nullptr) {
+            recordedClient_ = std::make_unique<RecordedClient>(*client_.client, *recording_);
+        }
+    }
     if (client_.client != nullptr) return {};
     return failure("out of means: the plug-in cannot make its client", "run it again");
 }
 
 Result<std::unique_ptr<PlugIn>> PlugIn::loadPlain(SyncDaemon::Process process, Device& device,
-                                                  const Console& console,
-                                                  const PlugInTable& table) {
+                                                  const Console& console, const PlugInTable& table,
+                                                  const RecordingOrder& order) {
     Result<std::unique_ptr<PlugIn>> plugIn = loadIn(process, device, console, table);
     if (!plugIn) return plugIn;
-    const Status made = (*plugIn)->makeClient((*plugIn)->platform());
+    const Status made = (*plugIn)->makeClient((*plugIn)->platform(), order);
     if (!made) return made.error();
     return plugIn;
 }
 
 Result<std::unique_ptr<PlugIn>> PlugIn::load(Device& device, const Console& console) {
-    return loadPlain(SyncDaemon::Process::Daemon, device, console, *appsyncPlugInTable());
+    return loadPlain(SyncDaemon::Process::Daemon, device, console, *appsyncPlugInTable(), {});
 }
 
 Result<std::unique_ptr<PlugIn>> PlugIn::loadForRestore(Device& device, const Console& console,
-                                                       const PlugInTable& table) {
-    return loadPlain(SyncDaemon::Process::Restore, device, console, table);
+                                                       const PlugInTable& table,
+                                                       const RecordingOrder& order) {
+    return loadPlain(SyncDaemon::Process::Restore, device, console, table, order);
 }
 
 Result<std::unique_ptr<PlugIn>> PlugIn::load(Device& device, SyncEvents& events,
                                              SessionFacts& facts, const Console& console,
-                                             const PlugInTable& table) {
+                                             const PlugInTable& table,
+                                             const RecordingOrder& order) {
     Result<std::unique_ptr<PlugIn>> loaded =
         loadIn(SyncDaemon::Process::Daemon, device, console, table);
     if (!loaded) return loaded;
     PlugIn& plugIn = **loaded;
     plugIn.watch_ = std::make_unique<SessionWatch>(device, plugIn.platform(), events, facts);
-    const Status made = plugIn.makeClient(watched(plugIn.platform(), *plugIn.watch_));
+    const Status made = plugIn.makeClient(watched(plugIn.platform(), *plugIn.watch_), order);
     if (!made) return made.error();
     // What an interrupted session has delivered must not end while the plug-in looks what there is.
     device.holdCoordinatedInstalls();
@@ -111,6 +137,8 @@ Result<std::unique_ptr<PlugIn>> PlugIn::load(Device& device, SyncEvents& events,
     return loaded;
 }
 
-SyncClient& PlugIn::client() { return *client_.client; }
+SyncClient& PlugIn::client() {
+    return recordedClient_ != nullptr ? *recordedClient_ : *client_.client;
+}
 
 }  // namespace appsync

@@ -13,10 +13,21 @@ namespace appsync {
 class AppRegistry;
 class Device;
 class JsonLogFacility;
+class RecordedClient;
+class Recording;
+class RecordingPlatform;
+class RecordingSink;
 class SessionFacts;
 class SessionWatch;
 class SyncClient;
 class SyncEvents;
+
+/// Whether and how a session is recorded.
+struct RecordingOrder {
+    /// Null: it is not. It must outlive the plug-in.
+    RecordingSink* sink = nullptr;
+    bool isAnonymous = false;
+};
 
 /// The plug-in, loaded on a device: what the sync daemon does at its start. Its log is the
 /// device's; what cannot be written to it is told on the console, at the end. The device and the
@@ -31,10 +42,11 @@ class PlugIn {
     /// session lets them go. Events and facts must outlive it.
     [[nodiscard]] static Result<std::unique_ptr<PlugIn>> load(
         Device& device, SyncEvents& events, SessionFacts& facts, const Console& console,
-        const PlugInTable& table = *appsyncPlugInTable());
+        const PlugInTable& table = *appsyncPlugInTable(), const RecordingOrder& order = {});
     /// In the process that restores backups, which is not the sync daemon.
     [[nodiscard]] static Result<std::unique_ptr<PlugIn>> loadForRestore(
-        Device& device, const Console& console, const PlugInTable& table = *appsyncPlugInTable());
+        Device& device, const Console& console, const PlugInTable& table = *appsyncPlugInTable(),
+        const RecordingOrder& order = {});
     ~PlugIn();
 
     [[nodiscard]] SyncClient& client();
@@ -55,8 +67,10 @@ class PlugIn {
     [[nodiscard]] static Result<std::unique_ptr<PlugIn>> loadPlain(SyncDaemon::Process process,
                                                                    Device& device,
                                                                    const Console& console,
-                                                                   const PlugInTable& table);
-    Status makeClient(const Platform& platform);
+                                                                   const PlugInTable& table,
+                                                                   const RecordingOrder& order);
+    Status makeClient(const Platform& platform, const RecordingOrder& order);
+    void letClientGo();
     Status openLog(Device& device);
     void tellLogLoss() const;
 
@@ -68,6 +82,10 @@ class PlugIn {
     std::unique_ptr<JsonLogFacility> log_;
     std::unique_ptr<const Platform> platform_;
     std::unique_ptr<SessionWatch> watch_;
+    // Of a session that is recorded.
+    std::shared_ptr<Recording> recording_;
+    std::unique_ptr<RecordingPlatform> recordingPlatform_;
+    std::unique_ptr<RecordedClient> recordedClient_;
     PlugInClient client_;  // goes first
 };
 

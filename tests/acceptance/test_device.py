@@ -254,7 +254,7 @@ def test_wrong_usage(appsync, arguments):
 
 @pytest.mark.parametrize("command", ["create", "sync", "plan", "apps", "screen", "why", "inventory", "set",
                                      "run", "quit", "uninstall", "reset", "log", "history", "status", "coordinator",
-                                     "demote", "store", "send", "package", "plist"])
+                                     "demote", "store", "send", "package", "plist", "recording", "replay"])
 def test_every_command_has_help(appsync, command):
     assert "sage" in appsync(command, "--help").stdout
 

@@ -49,6 +49,7 @@ const std::array kKinds = {
     Kind{"DataArchive", smallDataArchive, readDataArchive, Pace::Slow},
     Kind{"Icon", smallIcon, readIcon, Pace::Slow},
     Kind{"Manifest", smallManifest, readManifest, Pace::Quick},
+    Kind{"Recording", smallRecording, readSessionRecording, Pace::Quick},
     Kind{"LibraryIndex", smallLibraryIndex, readLibraryIndex, Pace::Quick},
     Kind{"TodoList", smallTodoList, direct<readTodoList>(), Pace::Slow},
     Kind{"CoordinatedTodoList", smallTodoList, coordinated<readTodoList>(), Pace::Slow},

@@ -117,6 +117,24 @@ Bytes smallManifest() {
                    sum + R"("},"data/com.example.a.zip":{"size":0,"sha256":")" + sum + "\"}}}");
 }
 
+Bytes smallRecording() {
+    return bytesOf(R"({"recording":1,"plug-in":"1","process":"p","bundle":"b","anonymous":false}
+{"t":0,"w":1,"host":"makeClient"}
+{"t":1,"w":1,"call":"WorkQueues.runAfter","a":[5,1]}
+{"t":2,"w":1,"call":"A.b","on":2,"a":["com.example.a"],"r":{"ok":null},"kept":["c",{"bytes":"/w=="}]}
+{"t":3,"w":1,"walk":"A.c","a":[0]}
+{"t":3,"w":1,"each":"D","a":[[]]}
+{"t":3,"w":1,"end":true,"r":false}
+{"t":3,"w":1,"end":true}
+{"t":3,"w":1,"end":true}
+{"t":4,"w":2,"run":"item","on":1}
+{"t":4,"w":2,"end":true}
+{"t":5,"w":2,"callback":"A.d","on":3}
+{"t":5,"w":2,"end":true}
+{"t":6,"w":1,"finished":true}
+)");
+}
+
 Bytes smallLibraryIndex() {
     constexpr std::size_t kNoFolderLength = 8;
     const IndexedPackage package{{1, 2, 300, 4, 5}, {kA, "1.0", "\u00e9", "a.zip", 300, 4096}};

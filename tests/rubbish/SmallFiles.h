@@ -14,6 +14,7 @@ namespace appsync {
 [[nodiscard]] Bytes smallDataArchive();
 [[nodiscard]] Bytes smallIcon();
 [[nodiscard]] Bytes smallManifest();
+[[nodiscard]] Bytes smallRecording();
 /// What an index says after its sum.
 [[nodiscard]] Bytes smallLibraryIndex();
 [[nodiscard]] Bytes smallTodoList();

@@ -6,6 +6,8 @@
 #include <cstdint>
 #include <string>
 
+#include "host/replay/RecordingFile.h"
+
 namespace appsync {
 
 struct Console;
@@ -44,6 +46,7 @@ struct RestoreArguments {
     std::int64_t type = 2;
     /// The module with the plug-in; empty: the one that is built in.
     std::string plugIn{};
+    RecordingArguments recording{};
     bool asJson = false;
 };
 [[nodiscard]] int runRestore(const RestoreArguments& arguments, const Console& console);

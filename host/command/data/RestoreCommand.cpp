@@ -68,19 +68,16 @@ void print(const RestoreArguments& arguments, const RestoreResult& result, doubl
                 << Json(std::round(seconds * 100) / 100) << " s\n";
 }
 
-}  // namespace
-
-int runRestore(const RestoreArguments& arguments, const Console& console) {
+int restoreWith(const PlugInModule& build, RecordingSink* recording,
+                const RestoreArguments& arguments, const Console& console) {
     const Clock::time_point begin = Clock::now();
-    const Result<PlugInModule> build = PlugInModule::open(arguments.plugIn);
-    if (!build) return console.fail(build.error());
     const Result<BackupManifest> manifest = readBackupManifest(arguments.backup);
     if (!manifest) return console.fail(manifest.error());
     const Result<std::unique_ptr<Device>> device =
         openDevice(arguments.device, DeviceAccess::Session);
     if (!device) return console.fail(device.error());
-    const Result<std::unique_ptr<PlugIn>> plugIn =
-        PlugIn::loadForRestore(**device, console, build->table());
+    const Result<std::unique_ptr<PlugIn>> plugIn = PlugIn::loadForRestore(
+        **device, console, build.table(), {recording, arguments.recording.isAnonymous});
     if (!plugIn) return console.fail(plugIn.error());
     LiveLine line(console);
     const Result<RestoreResult> result =
@@ -94,6 +91,18 @@ int runRestore(const RestoreArguments& arguments, const Console& console) {
     }
     (arguments.asJson ? printJson : print)(arguments, *result, seconds, console);
     return result->failed.empty() ? kExitDone : kExitSomethingFailed;
+}
+
+}  // namespace
+
+int runRestore(const RestoreArguments& arguments, const Console& console) {
+    const Result<PlugInModule> build = PlugInModule::open(arguments.plugIn);
+    if (!build) return console.fail(build.error());
+    const Result<std::unique_ptr<RecordingFile>> recording = createRecording(arguments.recording);
+    if (!recording) return console.fail(recording.error());
+    const int status = restoreWith(*build, recording->get(), arguments, console);
+    if (*recording != nullptr) (*recording)->tellLoss(console);
+    return status;
 }
 
 }  // namespace appsync

@@ -54,9 +54,12 @@ Status checkArguments(const SendArguments& arguments) {
 
 class Sending {
   public:
-    Sending(const SendArguments& arguments, const PlugInModule& module, const Console& console)
+    /// Without a sink the session is not recorded.
+    Sending(const SendArguments& arguments, const PlugInModule& module, RecordingSink* recording,
+            const Console& console)
         : arguments_(arguments),
           module_(module),
+          recording_{recording, arguments.recording.isAnonymous},
           console_(console),
           display_(makeSyncDisplay(arguments.display, console, arguments.isVerbose)),
           events_(*display_),
@@ -299,7 +302,7 @@ class Sending {
 
     Result<int> hold() {
         Result<std::unique_ptr<PlugIn>> plugIn =
-            PlugIn::load(*device_, events_, facts_, console_, module_.table());
+            PlugIn::load(*device_, events_, facts_, console_, module_.table(), recording_);
         if (!plugIn) return plugIn.error();
         std::error_code code;
         const std::uint64_t bytes = std::filesystem::file_size(arguments_.file, code);
@@ -346,6 +349,7 @@ class Sending {
 
     const SendArguments& arguments_;
     const PlugInModule& module_;
+    const RecordingOrder recording_;
     const Console& console_;
     std::unique_ptr<SyncDisplay> display_;
     SyncEvents events_;
@@ -372,7 +376,10 @@ int runSend(const SendArguments& arguments, const Console& console) {
     if (!checked) return console.fail(checked.error());
     const Result<PlugInModule> build = PlugInModule::open(arguments.plugIn);
     if (!build) return console.fail(build.error());
-    const Result<int> status = Sending(arguments, *build, console).run();
+    const Result<std::unique_ptr<RecordingFile>> recording = createRecording(arguments.recording);
+    if (!recording) return console.fail(recording.error());
+    const Result<int> status = Sending(arguments, *build, recording->get(), console).run();
+    if (*recording != nullptr) (*recording)->tellLoss(console);
     return status ? *status : console.fail(status.error());
 }
 

@@ -85,9 +85,12 @@ std::string staysWarning(const SyncPreparation& sync) {
 // One run of `sync` or `plan`.
 class SyncRun {
   public:
-    SyncRun(const SyncArguments& arguments, const PlugInModule& module, const Console& console)
+    /// Without a sink the session is not recorded.
+    SyncRun(const SyncArguments& arguments, const PlugInModule& module, RecordingSink* recording,
+            const Console& console)
         : arguments_(arguments),
           module_(module),
+          recording_{recording, arguments.recording.isAnonymous},
           console_(console),
           display_(makeSyncDisplay(arguments.display, console, arguments.isVerbose)),
           events_(*display_),
@@ -218,7 +221,7 @@ class SyncRun {
 
     Result<int> hold() {
         Result<std::unique_ptr<PlugIn>> plugIn =
-            PlugIn::load(*device_, events_, facts_, console_, module_.table());
+            PlugIn::load(*device_, events_, facts_, console_, module_.table(), recording_);
         if (!plugIn) return plugIn.error();
         watchOver((*plugIn)->watch());
         for (const auto* installs : {&sync_.plan.install, &sync_.plan.update}) {
@@ -317,6 +320,7 @@ class SyncRun {
 
     const SyncArguments& arguments_;
     const PlugInModule& module_;
+    const RecordingOrder recording_;
     const Console& console_;
     std::unique_ptr<SyncDisplay> display_;
     SyncEvents events_;
@@ -342,7 +346,10 @@ int runSync(const SyncArguments& arguments, const Console& console) {
     if (!checked) return console.fail(checked.error());
     const Result<PlugInModule> build = PlugInModule::open(arguments.plugIn);
     if (!build) return console.fail(build.error());
-    const Result<int> status = SyncRun(arguments, *build, console).run();
+    const Result<std::unique_ptr<RecordingFile>> recording = createRecording(arguments.recording);
+    if (!recording) return console.fail(recording.error());
+    const Result<int> status = SyncRun(arguments, *build, recording->get(), console).run();
+    if (*recording != nullptr) (*recording)->tellLoss(console);
     return status ? *status : console.fail(status.error());
 }
 

@@ -9,6 +9,7 @@
 
 #include "host/output/SyncDisplays.h"
 #include "host/plan/SyncPlan.h"
+#include "host/replay/RecordingFile.h"
 
 namespace appsync {
 
@@ -28,6 +29,7 @@ struct SyncArguments {
     std::optional<std::chrono::seconds> longestWait;
     /// The module with the plug-in; empty: the one that is built in.
     std::string plugIn{};
+    RecordingArguments recording{};
     SyncDisplayKind display = SyncDisplayKind::Text;
     /// A terminal, too, gets long lists whole.
     bool isVerbose = false;
@@ -58,6 +60,7 @@ struct SendArguments {
     bool yes = false;
     /// The module with the plug-in; empty: the one that is built in.
     std::string plugIn{};
+    RecordingArguments recording{};
     SyncDisplayKind display = SyncDisplayKind::Text;
     bool isVerbose = false;
 };

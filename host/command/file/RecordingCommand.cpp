@@ -1,0 +1,91 @@
+#include <array>
+#include <chrono>
+#include <cstdio>
+#include <ostream>
+#include <utility>
+
+#include <nlohmann/json.hpp>
+
+#include "host/command/file/FileCommands.h"
+#include "host/console/Console.h"
+#include "host/console/JsonWriting.h"
+#include "host/console/Problem.h"
+#include "host/console/Table.h"
+#include "host/replay/RecordingReader.h"
+#include "host/replay/RecordingText.h"
+
+namespace appsync {
+namespace {
+
+using Json = nlohmann::ordered_json;
+
+double recordSecondsOf(const RecordLine& line) {
+    return std::chrono::duration<double>(line.time).count();
+}
+
+std::string microsecondsOf(const RecordLine& line) {
+    constexpr std::size_t kLongest = 40;
+    std::array<char, kLongest> text{};
+    const int length = std::snprintf(text.data(), text.size(), "%.6f", recordSecondsOf(line));
+    return {text.data(), static_cast<std::size_t>(length)};
+}
+
+bool isShown(const RecordLine& line, const ShowRecordingArguments& arguments) {
+    if (arguments.identifier && !mentions(line, *arguments.identifier)) return false;
+    if (arguments.service && serviceOf(line) != *arguments.service) return false;
+    if (arguments.thread && line.thread != *arguments.thread) return false;
+    if (arguments.from && recordSecondsOf(line) < *arguments.from) return false;
+    return !arguments.to || recordSecondsOf(line) <= *arguments.to;
+}
+
+const char* recordKindName(RecordKind kind) {
+    static constexpr std::array<const char*, 8> kNames = {"call", "host", "run", "callback",
+                                                          "walk", "each", "end", "finished"};
+    return kNames.at(static_cast<std::size_t>(kind));
+}
+
+Json jsonOf(const RecordLine& line) {
+    return {{"seconds", recordSecondsOf(line)},
+            {"thread", line.thread},
+            {"kind", recordKindName(line.kind)},
+            {"name", line.name},
+            {"object", line.object == 0 ? Json() : Json(line.object)},
+            {"arguments", Json(line.arguments)},
+            {"answer", Json(line.answer)}};
+}
+
+void printLinesAsJson(const RecordedSession& session, const ShowRecordingArguments& arguments,
+                      const Console& console) {
+    Json lines = Json::array();
+    for (const RecordLine& each : session.lines) {
+        if (isShown(each, arguments)) lines.push_back(jsonOf(each));
+    }
+    console.out << indented({{"plugIn", session.plugInVersion},
+                             {"process", session.process},
+                             {"anonymous", session.isAnonymous},
+                             {"cutOff", session.isCutOff},
+                             {"lines", std::move(lines)}})
+                << '\n';
+}
+
+void printLinesAsTable(const RecordedSession& session, const ShowRecordingArguments& arguments,
+                       const Console& console) {
+    Table table({"SECONDS", "THREAD", "WHAT"});
+    for (const RecordLine& each : session.lines) {
+        if (!isShown(each, arguments)) continue;
+        table.add({microsecondsOf(each), std::to_string(each.thread), recordText(each)});
+    }
+    console.out << table.textFor(console);
+    if (session.isCutOff) console.out << "the recording is cut off: the session went on\n";
+}
+
+}  // namespace
+
+int runRecordingShow(const ShowRecordingArguments& arguments, const Console& console) {
+    const Result<RecordedSession> session = readRecordingFile(arguments.file);
+    if (!session) return console.fail(session.error());
+    (arguments.asJson ? printLinesAsJson : printLinesAsTable)(*session, arguments, console);
+    return kExitDone;
+}
+
+}  // namespace appsync
