@@ -1,5 +1,6 @@
 #include "recording/RecordText.h"
 
+#include <algorithm>
 #include <array>
 #include <charconv>
 #include <cmath>

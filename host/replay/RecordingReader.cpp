@@ -3,6 +3,7 @@
 #include <algorithm>
 #include <array>
 #include <limits>
+#include <set>
 #include <utility>
 
 #include "host/console/Problem.h"

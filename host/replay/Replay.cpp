@@ -6,6 +6,7 @@
 #include <set>
 #include <string_view>
 #include <utility>
+#include <vector>
 
 #include "host/console/Problem.h"
 #include "host/replay/ReplayRun.h"
