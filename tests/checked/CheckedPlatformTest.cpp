@@ -5,12 +5,12 @@
 #include <optional>
 #include <utility>
 
-#include "contract/ForwardingAppRegistry.h"
-#include "contract/ForwardingCoordination.h"
-#include "contract/ForwardingDeviceServices.h"
-#include "contract/ForwardingFileSystem.h"
-#include "contract/ForwardingSystemServices.h"
-#include "contract/ForwardingWorkQueues.h"
+#include "contract/forwarding/ForwardingAppRegistry.h"
+#include "contract/forwarding/ForwardingCoordination.h"
+#include "contract/forwarding/ForwardingDeviceServices.h"
+#include "contract/forwarding/ForwardingFileSystem.h"
+#include "contract/forwarding/ForwardingSystemServices.h"
+#include "contract/forwarding/ForwardingWorkQueues.h"
 #include "tests/client/AppsClientFixture.h"
 
 namespace appsync {

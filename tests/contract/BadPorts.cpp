@@ -10,7 +10,7 @@
 #include <thread>
 #include <utility>
 
-#include "contract/ForwardingAppRegistry.h"
+#include "contract/forwarding/ForwardingAppRegistry.h"
 #include "tests/contract/OurPorts.h"
 
 namespace appsync {

@@ -7,7 +7,7 @@
 #include <utility>
 #include <vector>
 
-#include "contract/ForwardingCoordination.h"
+#include "contract/forwarding/ForwardingCoordination.h"
 #include "platform/AppRegistry.h"
 #include "platform/FileSystem.h"
 #include "platform/WorkQueues.h"

@@ -8,7 +8,7 @@
 #include <utility>
 #include <vector>
 
-#include "contract/ForwardingDeviceServices.h"
+#include "contract/forwarding/ForwardingDeviceServices.h"
 #include "platform/PropertyListSerialization.h"
 #include "tests/violators/Violator.h"
 

@@ -5,7 +5,7 @@
 #include <string>
 #include <vector>
 
-#include "contract/ForwardingFileSystem.h"
+#include "contract/forwarding/ForwardingFileSystem.h"
 #include "platform/Error.h"
 #include "tests/violators/Violator.h"
 

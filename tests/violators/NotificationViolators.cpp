@@ -4,7 +4,7 @@
 #include <utility>
 #include <vector>
 
-#include "contract/ForwardingSystemServices.h"
+#include "contract/forwarding/ForwardingSystemServices.h"
 #include "tests/violators/Violator.h"
 
 namespace appsync {

@@ -4,7 +4,7 @@
 #include <string>
 #include <utility>
 
-#include "contract/ForwardingAppRegistry.h"
+#include "contract/forwarding/ForwardingAppRegistry.h"
 #include "tests/violators/Violator.h"
 
 namespace appsync {

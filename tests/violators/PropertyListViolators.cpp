@@ -1,7 +1,7 @@
 #include <string>
 #include <vector>
 
-#include "contract/ForwardingSystemServices.h"
+#include "contract/forwarding/ForwardingSystemServices.h"
 #include "tests/violators/Violator.h"
 
 namespace appsync {

@@ -7,7 +7,7 @@
 #include <utility>
 #include <vector>
 
-#include "contract/ForwardingAppRegistry.h"
+#include "contract/forwarding/ForwardingAppRegistry.h"
 #include "platform/WorkQueues.h"
 #include "tests/violators/Violator.h"
 

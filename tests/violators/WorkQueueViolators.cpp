@@ -5,7 +5,7 @@
 #include <utility>
 #include <vector>
 
-#include "contract/ForwardingWorkQueues.h"
+#include "contract/forwarding/ForwardingWorkQueues.h"
 #include "tests/violators/Violator.h"
 
 namespace appsync {

@@ -27,13 +27,13 @@
 #include <utility>
 #include <vector>
 
-#include "contract/ForwardingAppRegistry.h"
-#include "contract/ForwardingCoordination.h"
-#include "contract/ForwardingDeviceServices.h"
-#include "contract/ForwardingFileSystem.h"
-#include "contract/ForwardingSystemServices.h"
-#include "contract/ForwardingWorkQueues.h"
 #include "contract/TemporaryMachineDirectory.h"
+#include "contract/forwarding/ForwardingAppRegistry.h"
+#include "contract/forwarding/ForwardingCoordination.h"
+#include "contract/forwarding/ForwardingDeviceServices.h"
+#include "contract/forwarding/ForwardingFileSystem.h"
+#include "contract/forwarding/ForwardingSystemServices.h"
+#include "contract/forwarding/ForwardingWorkQueues.h"
 #include "tests/violators/Violator.h"
 
 namespace appsync {
