@@ -43,12 +43,21 @@ void Demands::willReconcile(const PropertyList& list) {
 
 void Demands::willAsk() {
     wanted_.clear();
-    const auto list = world_.platform.propertyListAt(std::string(kTodoListPath));
-    if (!list) return;
-    for (const PropertyList& entry : list->elements()) {
-        const std::string* identifier = entry.findString(kTodoIdentifierKey);
-        if (hasOperation(entry, kTodoInstall) && isFree(*identifier)) wanted_.insert(*identifier);
+    for (const std::string& identifier : listedToInstall()) {
+        if (isFree(identifier)) wanted_.insert(identifier);
     }
+}
+
+std::set<std::string> Demands::listedToInstall() const {
+    std::set<std::string> identifiers;
+    const auto list = world_.platform.propertyListAt(std::string(kTodoListPath));
+    if (!list) return identifiers;
+    for (const PropertyList& entry : list->elements()) {
+        if (hasOperation(entry, kTodoInstall)) {
+            identifiers.insert(*entry.findString(kTodoIdentifierKey));
+        }
+    }
+    return identifiers;
 }
 
 /// Whether nothing stands in the way of its install.
@@ -64,7 +73,10 @@ bool Demands::isFree(const std::string& identifier) const {
 
 void Demands::wereAskedFor(const std::vector<SyncAssetPointer>& assets) {
     if (!isDemanding() || !allowsInstalls_) return;
+    const std::set<std::string> listed = listedToInstall();
     for (const std::string& identifier : wanted_) {
+        // An install of an earlier session has been told of meanwhile: the entry is done with.
+        if (!listed.contains(identifier)) continue;
         const bool isAskedFor =
             std::any_of(assets.begin(), assets.end(), [&identifier](const SyncAssetPointer& asset) {
                 return asset->identifier == identifier;
@@ -90,6 +102,7 @@ void Demands::sessionHasEnded() {
     if (!allowsRemovals_) return;
     for (const std::string& identifier : removed_) {
         if (delivered_.contains(identifier) || placed_.contains(identifier)) continue;
+        if (mayBePlaced_.contains(identifier)) continue;
         demand(!registry.installed(identifier), identifier + " was to be removed and is there");
     }
 }

@@ -24,6 +24,8 @@ class Demands {
 
     /// A restore of these is over.
     void restored(const std::vector<std::string>& identifiers);
+    /// Somebody else restores it, at any time: a removal may find the placeholder, and take that.
+    void mayBePlaced(const std::string& identifier) { mayBePlaced_.insert(identifier); }
     /// The host is about to have the list reconciled that it has staged.
     void willReconcile(const PropertyList& list);
     /// The host is about to ask which packages it is to send.
@@ -41,6 +43,8 @@ class Demands {
 
   private:
     [[nodiscard]] bool isDemanding() const { return world_.faults.injected().empty(); }
+    /// The identifiers of the entries that ask for an install.
+    [[nodiscard]] std::set<std::string> listedToInstall() const;
     [[nodiscard]] bool isFree(const std::string& identifier) const;
     void demand(bool isDone, const std::string& otherwise);
 
@@ -53,6 +57,7 @@ class Demands {
     std::set<std::string> delivered_;  // by any session
     std::set<std::string> removed_;    // by any session
     std::set<std::string> placed_;     // of the removed ones, those under a placeholder
+    std::set<std::string> mayBePlaced_;
     std::size_t count_ = 0;
 };
 

@@ -136,7 +136,9 @@ bool Invariants::maySucceed(const std::string& identifier, const std::string& wa
                             const std::string& is) const {
     if (is == was || rankOf(is) > rankOf(was)) return true;
     if (!world_.coordinated) return false;
-    if (rankOf(is) == 2) return earlier_.contains(identifier);
+    // A restore that comes from elsewhere meanwhile marks its end, too, whatever the session's own
+    // install has come to, or comes to.
+    if (rankOf(is) == 2) return earlier_.contains(identifier) || restored_.contains(identifier);
     // The end of a transfer is marked whatever its install has come to meanwhile: a coordinator can
     // end before the transfer does. The mark says what the host has done, and nobody is left who
     // would install it.
@@ -147,6 +149,7 @@ void Invariants::noteInstalled(const std::string& identifier) {
     const auto* ended = world_.platform.coordination.ended(identifier);
     if (ended != nullptr && ended->kind == CoordinatorKind::RestoringDemoted) {
         markedByRestore_.insert(identifier);
+        restored_.insert(identifier);
     } else {
         markedByRestore_.erase(identifier);
     }

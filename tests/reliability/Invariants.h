@@ -85,6 +85,7 @@ class Invariants {
     std::set<std::string> earlier_;
     /// Marked as installed because the restore of an offloaded application is done.
     std::set<std::string> markedByRestore_;
+    std::set<std::string> restored_;  // whose entry a restore has marked, whatever came later
     /// What went with a direct install that has failed for good, although it was installed: no
     /// placeholder stood above it.
     std::set<std::string> undone_;

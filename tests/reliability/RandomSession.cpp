@@ -152,6 +152,7 @@ void RandomSession::disturbRestore() {
 
 void RandomSession::restoreAnother(const std::string& identifier, bool isSound) {
     demands_.leaveOut(identifier);
+    demands_.mayBePlaced(identifier);
     const Bytes metadata = isSound ? world_.restoreMetadata() : Bytes{};
     const std::uint64_t demotionStatus = random_() % 3;
     world_.platform.scheduler.spawnAfter(
