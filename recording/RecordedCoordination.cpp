@@ -144,9 +144,9 @@ class RecordedCoordinatorObserver
       public std::enable_shared_from_this<RecordedCoordinatorObserver> {
   public:
     RecordedCoordinatorObserver(std::weak_ptr<InstallCoordinatorObserver> plugIn,
-                                Observers observers, Recording& recording)
+                                const Observers& observers, Recording& recording)
         : plugIn_(std::move(plugIn)),
-          observers_(std::move(observers)),
+          observers_(observers),
           number_(recording.newNumber()),
           recording_(recording.shared_from_this()) {}
 

@@ -222,6 +222,8 @@ class ReplayInstallObserver : public AppInstallObserver {
     ReplayInstallObserver(ReplayRun& run, std::uint64_t number) : run_(run), number_(number) {}
     ReplayInstallObserver(const ReplayInstallObserver&) = delete;
     ReplayInstallObserver& operator=(const ReplayInstallObserver&) = delete;
+    // Only a lack of memory throws here, and ends the command.
+    // NOLINTNEXTLINE(bugprone-exception-escape)
     ~ReplayInstallObserver() override { run_.call("AppInstallObserver.release", number_); }
 
   private:

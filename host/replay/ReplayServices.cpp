@@ -96,6 +96,8 @@ class ReplayLog : public LogFacility {
   public:
     explicit ReplayLog(ReplayRun& run) : run_(run) {}
 
+    // Only a lack of memory throws here, and ends the command.
+    // NOLINTNEXTLINE(bugprone-exception-escape)
     void write(const LogMessage& message) noexcept override {
         RecordText format = run_.newText();
         format.addPlain(message.format);
@@ -307,6 +309,8 @@ class ReplayAssertion : public TerminationAssertion {
     ReplayAssertion(ReplayRun& run, std::uint64_t number) : run_(run), number_(number) {}
     ReplayAssertion(const ReplayAssertion&) = delete;
     ReplayAssertion& operator=(const ReplayAssertion&) = delete;
+    // Only a lack of memory throws here, and ends the command.
+    // NOLINTNEXTLINE(bugprone-exception-escape)
     ~ReplayAssertion() override { run_.call("TerminationAssertion.release", number_); }
 
   private:
@@ -349,8 +353,9 @@ class ReplayDestination : public ImageDestination {
     bool finalize() override {
         auto written =
             run_.answer<std::optional<Bytes>>(run_.call("ImageDestination.finalize", number_));
-        if (written) buffer_ = *std::move(written);
-        return written.has_value();
+        if (!written) return false;
+        buffer_ = *std::move(written);
+        return true;
     }
 
   private:

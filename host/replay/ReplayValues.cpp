@@ -55,8 +55,9 @@ bool ReplayValues::read(const ParsedJson& json, double& value) const {
 
 bool ReplayValues::read(const ParsedJson& json, std::string& value) const {
     std::optional<std::string> text = textIn(json);
-    if (text) value = *std::move(text);
-    return text.has_value();
+    if (!text) return false;
+    value = *std::move(text);
+    return true;
 }
 
 /// Bytes of that size that nothing but this replay knows, where the recording has none.

@@ -6,7 +6,7 @@ import pytest
 
 ROOT = pathlib.Path(__file__).resolve().parent.parent.parent
 PARTS = ["CMakeLists.txt", "CONTRIBUTING.md", "cmake", "docs", "scripts", "client", "platform", "system", "simulation",
-         "recording", "contract"]
+         "checked", "recording", "contract"]
 
 
 @pytest.fixture

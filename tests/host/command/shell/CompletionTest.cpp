@@ -51,7 +51,8 @@ TEST_F(Completion, OfTheBeginningOfACommandIsThoseThatBeginSo) {
 TEST_F(Completion, OfADashIsTheOptionsThatAreNotThereYet) {
     EXPECT_THAT(wordsOf({"apps", "-"}), ElementsAre("--help", "--json"));
     EXPECT_THAT(wordsOf({"apps", "--json", "-"}), ElementsAre("--help"));
-    EXPECT_THAT(wordsOf({"sync", "--remove", "com.a", "--re"}), ElementsAre("--remove"));
+    EXPECT_THAT(wordsOf({"sync", "--remove", "com.a", "--re"}),
+                ElementsAre("--remove", "--record"));
     EXPECT_THAT(wordsOf({"sync", "--plug"}), ElementsAre("--plug-in"));
 }
 
