@@ -24,6 +24,7 @@ void Demands::demand(bool isDone, const std::string& otherwise) {
 }
 
 void Demands::restored(const std::vector<std::string>& identifiers) {
+    if (world_.coordinated) mayBePlaced_.insert(identifiers.begin(), identifiers.end());
     if (!isDemanding()) return;
     for (const std::string& identifier : identifiers) {
         if (leftOut_.contains(identifier)) continue;
@@ -72,6 +73,9 @@ bool Demands::isFree(const std::string& identifier) const {
 }
 
 void Demands::wereAskedFor(const std::vector<SyncAssetPointer>& assets) {
+    if (world_.coordinated) {
+        for (const SyncAssetPointer& asset : assets) mayBePlaced_.insert(asset->identifier);
+    }
     if (!isDemanding() || !allowsInstalls_) return;
     const std::set<std::string> listed = listedToInstall();
     for (const std::string& identifier : wanted_) {

@@ -24,7 +24,8 @@ class Demands {
 
     /// A restore of these is over.
     void restored(const std::vector<std::string>& identifiers);
-    /// Somebody else restores it, at any time: a removal may find the placeholder, and take that.
+    /// Its restore or its update may put a placeholder there at any time: a removal may find that,
+    /// and take it.
     void mayBePlaced(const std::string& identifier) { mayBePlaced_.insert(identifier); }
     /// The host is about to have the list reconciled that it has staged.
     void willReconcile(const PropertyList& list);

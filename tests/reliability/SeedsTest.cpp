@@ -72,9 +72,11 @@ TEST(Seeds, One) {
 
 // What longer runs have stumbled over: an install of an earlier session that is told of between the
 // taking over of the next list and its reading; a restore from elsewhere whose end is marked beside
-// that of the session's own install, or whose placeholder an uninstall takes.
+// that of the session's own install; a placeholder of a restore or an update that comes late,
+// and that an uninstall takes.
 TEST(Seeds, ThatWereFound) {
-    for (const std::uint64_t seed : {2644U, 8968U, 14216U, 17069U, 24793U, 24953U}) tryOut(seed);
+    for (const std::uint64_t seed : {2644U, 8968U, 14216U, 17069U, 24793U, 24953U, 46102U, 48892U})
+        tryOut(seed);
 }
 
 TEST(Seeds, MakeSessionsThatDiffer) {
