@@ -17,9 +17,11 @@
 namespace appsync {
 namespace {
 
+using testing::Contains;
 using testing::ElementsAre;
 using testing::HasSubstr;
 using testing::IsEmpty;
+using testing::Not;
 
 using Creation = InstallCoordinatorService::Creation;
 using Kind = CoordinatorKind;
@@ -329,6 +331,20 @@ TEST_P(CoordinationContract, APlaceholderThatIsNotCompleteIsKeptAndNotShown) {
     waitForReportOfB();
     EXPECT_TRUE(coordinator->hasPlaceholderPromise());
     EXPECT_THAT(observer_->heard(), ElementsAre("cancelled com.example.b, 30, client 3"));
+    EXPECT_FALSE(preferred(kA));
+}
+
+TEST_P(CoordinationContract, APlaceholderThatIsGivenUpIsNotShown) {
+    checks("platform/InstallPlaceholder.h",
+           "Gives it up: it never comes to stand on the home screen.");
+    const auto coordinator = create(Kind::Initiating, kA);
+    const auto given = service_.makeAppPlaceholder("Atlas", kA, kInstallTypeSync, SyncClientID);
+    ASSERT_TRUE(given->setAttributes({}));
+    ASSERT_TRUE(coordinator->setPlaceholderPromise(given));
+    given->cancelForReason(reason(), SyncClientID);
+    static_cast<void>(given->setConfigurationComplete());
+    waitForReportOfB();
+    EXPECT_THAT(observer_->heard(), Not(Contains("placeholder com.example.a")));
     EXPECT_FALSE(preferred(kA));
 }
 

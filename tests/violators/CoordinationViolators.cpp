@@ -329,6 +329,10 @@ struct ConfigurationsNeverComplete : ForwardingPlaceholder {
     using ForwardingPlaceholder::ForwardingPlaceholder;
     Status setConfigurationComplete() override { return {}; }
 };
+struct PlaceholdersAreNotGivenUp : ForwardingPlaceholder {
+    using ForwardingPlaceholder::ForwardingPlaceholder;
+    void cancelForReason(const ErrorRecord&, CoordinationClient) override {}
+};
 /// Completes the configuration with the first piece.
 struct ConfigurationsCompleteThemselves : ForwardingCoordinator {
     using ForwardingCoordinator::ForwardingCoordinator;
@@ -705,6 +709,8 @@ void addPlaceholders(std::vector<Violator>& all) {
     v.device<WithCoordinator<ConfigurationsCompleteThemselves>>(
         "ConfigurationsCompleteThemselves",
         "One whose configuration never completes is kept and not shown.");
+    v.device<WithPlaceholder<PlaceholdersAreNotGivenUp>>(
+        "PlaceholdersAreNotGivenUp", "Gives it up: it never comes to stand on the home screen.");
     v.device<WithPlaceholder<VersionsOfPlaceholdersAreLost>>(
         "VersionsOfPlaceholdersAreLost",
         "What a placeholder tells of the application that is to come.");
