@@ -127,7 +127,7 @@ Result<std::optional<StoredCoordinator>> CoordinationBook::hearAndRead(
     std::vector<Cancellation> news;
     std::optional<StoredCoordinator> found;
     const Status status = context_.database.read([&](Database& database) -> Status {
-        news = newsOfOthers(database);
+        if (Status heard = readNews(database, news); !heard) return heard;
         auto result = findCoordinator(database, identifier);
         if (!result) return result.error();
         found = std::move(*result);

@@ -98,7 +98,8 @@ class CoordinationBook : public std::enable_shared_from_this<CoordinationBook> {
     [[nodiscard]] Status requireSession() const;
     [[nodiscard]] Result<std::optional<StoredCoordinator>> hearAndRead(
         const std::string& identifier);
-    [[nodiscard]] std::vector<Cancellation> newsOfOthers(Database& database) const;
+    /// What others have ended since it was last heard of.
+    Status readNews(Database& database, std::vector<Cancellation>& news) const;
     void hearAll(const std::vector<Cancellation>& news);
     [[nodiscard]] Result<StoredCoordinator> findOrInsert(CoordinatorKind kind,
                                                          const std::string& identifier,

@@ -99,19 +99,16 @@ void CoordinationBook::fail(const Coordinator& coordinator, const ErrorRecord& e
 void CoordinationBook::hearOfOthers() {
     if (closed_ || access_ == Access::Look) return;
     std::vector<Cancellation> news;
-    context_.database
-        .read([&](Database& database) {
-            news = newsOfOthers(database);
-            return Status();
-        })
-        .ignore();
+    context_.database.read([&](Database& database) { return readNews(database, news); }).ignore();
     hearAll(news);
 }
 
-std::vector<Cancellation> CoordinationBook::newsOfOthers(Database& database) const {
+Status CoordinationBook::readNews(Database& database, std::vector<Cancellation>& news) const {
     if (closed_ || access_ == Access::Look) return {};
-    Result<std::vector<Cancellation>> news = cancellationsSince(database, heardOf_);
-    return news ? *std::move(news) : std::vector<Cancellation>();
+    Result<std::vector<Cancellation>> found = cancellationsSince(database, heardOf_);
+    if (!found) return found.error();
+    news = *std::move(found);
+    return {};
 }
 
 void CoordinationBook::hearAll(const std::vector<Cancellation>& news) {
