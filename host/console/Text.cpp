@@ -1,5 +1,7 @@
 #include "host/console/Text.h"
 
+#include <utf8proc.h>
+
 #include <algorithm>
 #include <array>
 #include <cstdio>
@@ -50,52 +52,44 @@ std::optional<WrittenTime> parsedTime(std::string_view text) {
     return WrittenTime{std::chrono::system_clock::from_time_t(::timegm(&parts)), fraction};
 }
 
-bool isContinuation(char byte) { return (static_cast<unsigned char>(byte) & 0xC0U) == 0x80U; }
+// A character at the start of a text.
+struct Character {
+    std::size_t length;  // in bytes
+    std::optional<utf8proc_int32_t>
+        point;  // nothing where the bytes are none: a single one is taken
+};
 
-std::size_t sequenceLength(unsigned char lead) {
-    if (lead < 0x80) return 1;
-    if (lead >= 0xC2 && lead < 0xE0) return 2;
-    if (lead >= 0xE0 && lead < 0xF0) return 3;
-    if (lead >= 0xF0 && lead < 0xF5) return 4;
-    return 0;
+Character firstOf(std::string_view text) {
+    utf8proc_int32_t point = 0;
+    const utf8proc_ssize_t length =
+        utf8proc_iterate(reinterpret_cast<const utf8proc_uint8_t*>(text.data()),
+                         static_cast<utf8proc_ssize_t>(text.size()), &point);
+    if (length <= 0) return {1, std::nullopt};
+    return {static_cast<std::size_t>(length), point};
 }
 
-// The code point of a sequence whose bytes fit together.
-char32_t decoded(std::string_view sequence) {
-    const auto lead = static_cast<unsigned char>(sequence.front());
-    if (sequence.size() == 1) return lead;
-    char32_t point = lead & (0xFFU >> (sequence.size() + 1));
-    for (const char byte : sequence.substr(1)) {
-        point = (point << 6U) | (static_cast<unsigned char>(byte) & 0x3FU);
-    }
-    return point;
+// The columns that a terminal gives to it.
+std::size_t columnsOf(const Character& character) {
+    if (!character.point) return 1;
+    return static_cast<std::size_t>(std::max(utf8proc_charwidth(*character.point), 0));
 }
 
 struct Range {
-    char32_t first;
-    char32_t last;
+    utf8proc_int32_t first;
+    utf8proc_int32_t last;
 };
 
 // Control characters, and what reorders, hides or breaks a line of text.
 constexpr std::array kUnprintable = {
-    Range{0x00, 0x1F},     Range{0x7F, 0x9F},     Range{0x061C, 0x061C}, Range{0x200B, 0x200B},
-    Range{0x200E, 0x200F}, Range{0x2028, 0x202E}, Range{0x2060, 0x206F}, Range{0xD800, 0xDFFF},
-    Range{0xFEFF, 0xFEFF}, Range{0xFFF9, 0xFFFB}};
+    Range{0x00, 0x1F},     Range{0x7F, 0x9F},     Range{0x061C, 0x061C},
+    Range{0x200B, 0x200B}, Range{0x200E, 0x200F}, Range{0x2028, 0x202E},
+    Range{0x2060, 0x206F}, Range{0xFEFF, 0xFEFF}, Range{0xFFF9, 0xFFFB}};
 
-bool isPrintable(char32_t point, std::size_t length) {
-    constexpr std::array<char32_t, 5> kSmallest = {0, 0, 0x80, 0x800, 0x10000};
-    if (point < kSmallest.at(length) || point > 0x10FFFF) return false;
-    return std::none_of(kUnprintable.begin(), kUnprintable.end(), [point](const Range& range) {
-        return point >= range.first && point <= range.last;
-    });
-}
-
-// The length of the well-formed character at the start of the text; 0 when there is none.
-std::size_t characterLength(std::string_view text) {
-    const std::size_t length = sequenceLength(static_cast<unsigned char>(text.front()));
-    if (length == 0 || length > text.size()) return 0;
-    const std::string_view tail = text.substr(1, length - 1);
-    return std::all_of(tail.begin(), tail.end(), isContinuation) ? length : 0;
+bool isPrintable(const Character& character) {
+    return character.point &&
+           std::none_of(kUnprintable.begin(), kUnprintable.end(), [&](const Range& range) {
+               return *character.point >= range.first && *character.point <= range.last;
+           });
 }
 
 // How much of the text is ASCII without control characters: nearly all of it, mostly.
@@ -149,13 +143,9 @@ std::string printable(std::string_view text) {
         result += text.substr(0, plain);
         text.remove_prefix(plain);
         if (text.empty()) break;
-        const std::size_t length = characterLength(text);
-        if (length != 0 && isPrintable(decoded(text.substr(0, length)), length)) {
-            result += text.substr(0, length);
-        } else {
-            result += '?';
-        }
-        text.remove_prefix(std::max<std::size_t>(length, 1));
+        const Character character = firstOf(text);
+        result += isPrintable(character) ? text.substr(0, character.length) : "?";
+        text.remove_prefix(character.length);
     }
     return result;
 }
@@ -168,45 +158,64 @@ std::string formatDuration(std::chrono::seconds time) {
 }
 
 std::size_t displayWidth(std::string_view text) {
-    return static_cast<std::size_t>(
-        std::count_if(text.begin(), text.end(), [](char byte) { return !isContinuation(byte); }));
+    std::size_t width = 0;
+    while (!text.empty()) {
+        const std::size_t plain = plainLength(text);
+        width += plain;
+        text.remove_prefix(plain);
+        if (text.empty()) break;
+        const Character character = firstOf(text);
+        width += columnsOf(character);
+        text.remove_prefix(character.length);
+    }
+    return width;
 }
 
 std::string fitted(std::string_view text, std::size_t width, std::string_view cutMark) {
     const std::size_t length = displayWidth(text);
     if (length <= width) return std::string(text).append(width - length, ' ');
     const std::string_view mark = beginOf(cutMark, width);
-    return std::string(beginOf(text, width - displayWidth(mark))).append(mark);
+    return fitted(std::string(beginOf(text, width - displayWidth(mark))).append(mark), width);
 }
 
 std::string fittedAtFront(std::string_view text, std::size_t width, std::string_view cutMark) {
     if (displayWidth(text) <= width) return fitted(text, width, cutMark);
     const std::string_view mark = beginOf(cutMark, width);
-    return std::string(mark).append(endOf(text, width - displayWidth(mark)));
+    return fitted(std::string(mark).append(endOf(text, width - displayWidth(mark))), width);
 }
 
 std::string_view beginOf(std::string_view text, std::size_t width) {
     std::size_t end = 0;
-    for (std::size_t characters = 0; end < text.size(); ++end) {
-        if (!isContinuation(text[end]) && characters++ == width) break;
+    while (end < text.size()) {
+        const Character character = firstOf(text.substr(end));
+        const std::size_t columns = columnsOf(character);
+        if (columns > width) break;
+        width -= columns;
+        end += character.length;
     }
     return text.substr(0, end);
 }
 
 std::string_view endOf(std::string_view text, std::size_t width) {
-    std::size_t begin = text.size();
-    for (std::size_t characters = 0; begin > 0 && characters < width;) {
-        if (!isContinuation(text[--begin])) ++characters;
+    std::size_t left = displayWidth(text);
+    bool isCut = left > width;
+    while (isCut && !text.empty()) {
+        const Character character = firstOf(text);
+        // An accent goes with the letter that it stands on.
+        isCut = left > width || columnsOf(character) == 0;
+        if (!isCut) break;
+        left -= columnsOf(character);
+        text.remove_prefix(character.length);
     }
-    return text.substr(begin);
+    return text;
 }
 
 std::string wrapped(std::string line, std::size_t width, std::size_t indent) {
     if (width == 0) return line;
     if (indent >= width) indent = 0;
     std::string text;
-    while (displayWidth(line) > width) {
-        const std::size_t end = beginOf(line, width).size();
+    while (displayWidth(line) > width && firstOf(line).length < line.size()) {
+        const std::size_t end = std::max(beginOf(line, width).size(), firstOf(line).length);
         const std::size_t blank = line.rfind(' ', end);
         const bool isBetweenWords = blank != std::string::npos && blank > indent;
         const std::size_t last = line.find_last_not_of(' ', isBetweenWords ? blank : end - 1);

@@ -32,8 +32,8 @@ namespace appsync {
 /// broken UTF-8) replaced by "?".
 [[nodiscard]] std::string printable(std::string_view text);
 
-/// The first characters of the text, `width` with the mark that ends them when something is cut
-/// off; else filled up with blanks. Counts code points.
+/// The first characters of the text, `width` columns of a terminal with the mark that ends them
+/// when something is cut off, and with blanks where they are fewer.
 [[nodiscard]] std::string fitted(std::string_view text, std::size_t width,
                                  std::string_view cutMark = "...");
 
@@ -41,17 +41,18 @@ namespace appsync {
 [[nodiscard]] std::string fittedAtFront(std::string_view text, std::size_t width,
                                         std::string_view cutMark = "...");
 
-/// The first `width` characters of the text, or all of it.
+/// As many characters from the text's begin as `width` columns hold.
 [[nodiscard]] std::string_view beginOf(std::string_view text, std::size_t width);
 
-/// The last `width` characters of the text, or all of it.
+/// As many characters from the text's end as `width` columns hold.
 [[nodiscard]] std::string_view endOf(std::string_view text, std::size_t width);
 
-/// The line with line ends between its words, so that none has more than `width` characters; those
+/// The line with line ends between its words, so that none has more than `width` columns; those
 /// that follow begin with `indent` blanks. A word that is longer is broken anywhere.
 [[nodiscard]] std::string wrapped(std::string line, std::size_t width, std::size_t indent);
 
-/// The number of code points.
+/// The columns that the text takes on a terminal: two for a character of East Asian writing or an
+/// emoji, none for an accent that stands on the letter before it.
 [[nodiscard]] std::size_t displayWidth(std::string_view text);
 
 /// The text as a shell takes it for one word, made safe to print.

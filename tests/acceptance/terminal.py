@@ -19,7 +19,7 @@ TIMEOUT = float(os.environ.get("APPSYNC_TEST_TIMEOUT", "120"))
 
 class Terminal:
     def __init__(self, program, arguments, columns=80, lines=24, locale="C.UTF-8", term="xterm",
-                 typed=b""):
+                 typed=b"", environment=None):
         self.master, slave = pty.openpty()
         self.columns = columns
         self._set_size(slave, columns, lines)
@@ -30,7 +30,7 @@ class Terminal:
         self.type(typed)
         self.process = subprocess.Popen(
             [program, *map(str, arguments)], stdin=slave, stdout=slave, stderr=slave,
-            env={**os.environ, "TERM": term, "LC_ALL": locale}, start_new_session=True,
+            env={**os.environ, "TERM": term, "LC_ALL": locale, **(environment or {})}, start_new_session=True,
             preexec_fn=self._take_terminal)
         os.close(slave)
 
@@ -50,13 +50,13 @@ class Terminal:
         self._set_size(self.master, columns, lines)
         self.screen.resize(lines, columns)
 
-    def read_some(self, limit=TIMEOUT):
+    def read_some(self, limit=TIMEOUT, most=65536):
         """Whether something came within that time."""
         ready, _, _ = select.select([self.master], [], [], limit)
         if not ready:
             return False
         try:
-            piece = os.read(self.master, 65536)
+            piece = os.read(self.master, most)
         except OSError:  # nobody has the other side open any more
             return False
         text = self.decoder.decode(piece)

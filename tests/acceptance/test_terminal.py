@@ -2,6 +2,8 @@
 
 import os
 import re
+import shlex
+import subprocess
 import time
 
 import pytest
@@ -21,8 +23,8 @@ pytestmark = pytest.mark.plain_build  # what it waits for comes with the time
 def terminal(appsync):
     opened = []
 
-    def start(*arguments, **more):
-        opened.append(Terminal(appsync.program, arguments, **more))
+    def start(*arguments, program=appsync.program, **more):
+        opened.append(Terminal(program, arguments, **more))
         return opened[-1]
 
     yield start
@@ -190,6 +192,71 @@ def test_a_terminal_that_was_stopped_does_not_hold_the_sync(device, library, ter
     shown.type(CTRL_Q)
     assert shown.read_to_end() == 0
     assert shown.everything()[0].startswith("Installed 5: ")
+
+
+def test_a_slow_line_gets_whole_lines_and_not_all_of_them(device, many, terminal):
+    shown = terminal("sync", device.path, many)
+    while shown.read_some(most=256):
+        time.sleep(0.02)
+    assert shown.process.wait(timeout=TIMEOUT) == 0
+    assert shown.everything()[0].startswith("Installed %d: " % MANY)
+    assert " sent in " in shown.everything()[-1]
+    assert not any("[#" in line for line in shown.everything())
+
+
+def test_under_script_it_is_as_without(appsync, device, library, tmp_path, terminal):
+    line = shlex.join([appsync.program, "sync", device.path, library])
+    shown = terminal("-qec", line, tmp_path / "typescript", program="script")
+    assert shown.read_to_end() == 0
+    assert shown.everything()[0].startswith("Installed 5: ")
+    assert not any("[#" in line for line in shown.everything())
+
+
+def test_in_tmux_it_is_as_without(appsync, device, waiting, tmp_path):
+    tmux = ["tmux", "-S", str(tmp_path / "socket"), "-f", "/dev/null"]
+    line = shlex.join([appsync.program, "sync", device.path, waiting]) + "; echo status $?; cat"
+    subprocess.run([*tmux, "new-session", "-d", "-x", "70", "-y", "20", line], check=True)
+
+    def lines_when(condition):
+        end = time.monotonic() + TIMEOUT
+        while True:
+            done = subprocess.run([*tmux, "capture-pane", "-p"], check=True, capture_output=True, text=True)
+            lines = [each.rstrip() for each in done.stdout.splitlines() if each.strip()]
+            if condition(lines):
+                return lines
+            assert time.monotonic() < end, lines
+            time.sleep(0.05)
+
+    try:
+        lines_when(lambda lines: has_come_to_wait(lines) and "  4 of 5  " in lines[0])
+        subprocess.run([*tmux, "send-keys", "C-c"], check=True)
+        lines = lines_when(lambda lines: lines and lines[-1] == "status 1")
+        assert any("%s: interrupted" % A in "".join(lines) for line in lines)
+        assert not any("[#" in line for line in lines)
+    finally:
+        subprocess.run([*tmux, "kill-server"], check=False)
+
+
+@pytest.mark.parametrize("more", [{}, {"NO_COLOR": "1"}])
+def test_nothing_is_coloured(device, library, terminal, more):
+    shown = terminal("sync", device.path, library, environment=more)
+    assert shown.read_to_end() == 0
+    assert not re.search(r"\x1b\[[0-9;]*m", shown.written)
+
+
+def test_wide_characters_take_the_columns_that_they_take(appsync, device, tmp_path, terminal):
+    folder = str(tmp_path / "wide")
+    names = ["Notes", "\u65e5\u8a18", "\U0001F680", "Cafe\u0301"]
+    for index, name in enumerate(names):
+        packages.make_package(folder, "com.example.wide%d" % index, name=name)
+    device.sync(folder)
+    shown = terminal("apps", device.path, columns=100)
+    assert shown.read_to_end() == 0
+    column = next(line for line in shown.screen.display if "NAME" in line).index("STATE")
+    rows = [shown.screen.buffer[row] for row, line in enumerate(shown.screen.display) if "com.example.wide" in line]
+    assert len(rows) == len(names)
+    for row in rows:
+        assert row[column].data == "i" and row[column - 1].data == " "
 
 
 def test_a_terminal_that_cannot_redraw_gets_lines(device, library, terminal):

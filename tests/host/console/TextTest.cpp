@@ -46,6 +46,30 @@ TEST(Fitted, FillsUpOrCutsByCharacters) {
     EXPECT_EQ(fitted("abc", 0), "");
 }
 
+TEST(DisplayWidth, IsTheColumnsOfATerminal) {
+    EXPECT_EQ(displayWidth("abc"), 3U);
+    EXPECT_EQ(displayWidth("Gr\u00fc\u00dfe"), 5U);
+    EXPECT_EQ(displayWidth("\u65e5\u672c\u8a9e"), 6U);
+    EXPECT_EQ(displayWidth("\uff21"), 2U);
+    EXPECT_EQ(displayWidth("\U0001F680"), 2U);
+    EXPECT_EQ(displayWidth("e\u0301"), 1U);
+    EXPECT_EQ(displayWidth(""), 0U);
+}
+
+TEST(Fitted, CutsWideCharactersWhole) {
+    EXPECT_EQ(fitted("\u65e5\u672c\u8a9e", 8), "\u65e5\u672c\u8a9e  ");
+    EXPECT_EQ(fitted("\u65e5\u672c\u8a9e", 5, "~"), "\u65e5\u672c~");
+    EXPECT_EQ(fitted("\u65e5\u672c\u8a9e", 4, "~"), "\u65e5~ ");
+    EXPECT_EQ(fittedAtFront("\u65e5\u672c\u8a9e", 4, "~"), "~\u8a9e ");
+    EXPECT_EQ(fitted("\u65e5", 1, "~"), "~");
+}
+
+TEST(Fitted, LeavesAccentsOnTheirLetters) {
+    EXPECT_EQ(beginOf("ae\u0301b", 2), "ae\u0301");
+    EXPECT_EQ(endOf("ae\u0301b", 1), "b");
+    EXPECT_EQ(endOf("ae\u0301b", 2), "e\u0301b");
+}
+
 TEST(Table, MakesColumnsAsWideAsTheyMustBe) {
     Table table({"A", "B"});
     table.add({"long\n", "x"});
@@ -61,9 +85,9 @@ TEST(Printable, ReplacesWhatReordersText) {
 }
 
 TEST(Printable, ReplacesWhatIsNoCharacter) {
-    EXPECT_EQ(printable("\xe0\x80\x9b"), "?");      // longer than it need be
-    EXPECT_EQ(printable("\xed\xa0\x80"), "?");      // half of a pair
-    EXPECT_EQ(printable("\xf4\x90\x80\x80"), "?");  // behind the last one
+    EXPECT_EQ(printable("\xe0\x80\x9b"), "???");       // longer than it need be
+    EXPECT_EQ(printable("\xed\xa0\x80"), "???");       // half of a pair
+    EXPECT_EQ(printable("\xf4\x90\x80\x80"), "????");  // behind the last one
 }
 
 class FittedTable : public testing::Test {
@@ -135,7 +159,12 @@ TEST(Wrapped, BreaksAWordThatIsTooLong) {
     EXPECT_EQ(wrapped("\u00e4\u00f6\u00fc", 2, 5), "\u00e4\u00f6\n\u00fc");
 }
 
-TEST(Text, TheEndOfATextIsCountedInCharacters) {
+TEST(Wrapped, ACharacterThatIsTooWideStandsAlone) {
+    EXPECT_EQ(wrapped("\u65e5\u672c", 1, 0), "\u65e5\n\u672c");
+    EXPECT_EQ(wrapped("\u65e5\u672c\u8a9e", 5, 0), "\u65e5\u672c\n\u8a9e");
+}
+
+TEST(Text, TheEndOfATextIsCountedInColumns) {
     EXPECT_EQ(endOf("abc", 2), "bc");
     EXPECT_EQ(endOf("abc", 9), "abc");
     EXPECT_EQ(endOf("abc", 0), "");
