@@ -8,6 +8,7 @@
 
 #include "simulation/SimulatedPlatform.h"
 #include "simulation/recording/KnownCalls.h"
+#include "simulation/scheduling/Chance.h"
 
 namespace appsync {
 
@@ -257,15 +258,19 @@ void FaultPlan::failAt(std::size_t call, std::size_t way, FaultExtent extent) {
     aim_ = Aim{call, way, extent};
 }
 
-void FaultPlan::failSometimes(std::uint64_t seed, std::uint64_t oneIn) {
-    generator_.emplace(seed);
+void FaultPlan::failSometimes(std::shared_ptr<Chance> chance, std::uint64_t oneIn) {
+    chance_ = std::move(chance);
     oneIn_ = oneIn;
+}
+
+void FaultPlan::failSometimes(std::uint64_t seed, std::uint64_t oneIn) {
+    failSometimes(std::make_shared<Chance>(seed), oneIn);
 }
 
 void FaultPlan::stop() {
     aim_.reset();
     aimedAt_.clear();
-    generator_.reset();
+    chance_.reset();
     platform_.files.stopFailing();
 }
 
@@ -286,9 +291,9 @@ std::optional<ErrorRecord> FaultPlan::willCall(const RecordEntry& entry) {
 
 /// In which way the call fails that is about to be counted, if it does.
 std::optional<std::size_t> FaultPlan::wayOf(const std::string& name, std::size_t ways) {
-    if (generator_) {
-        if ((*generator_)() % oneIn_ != 0) return std::nullopt;
-        return static_cast<std::size_t>((*generator_)() % ways);
+    if (chance_ != nullptr) {
+        if (!chance_->oneIn(oneIn_)) return std::nullopt;
+        return static_cast<std::size_t>(chance_->detail(ways));
     }
     if (!aim_ || opportunities_.size() < aim_->call) return std::nullopt;
     if (opportunities_.size() == aim_->call) {

@@ -4,7 +4,6 @@
 #include <cstdint>
 #include <memory>
 #include <optional>
-#include <random>
 #include <string>
 #include <string_view>
 #include <vector>
@@ -13,6 +12,7 @@
 
 namespace appsync {
 
+class Chance;
 class SimulatedPlatform;
 
 /// How long a fault lasts.
@@ -49,7 +49,8 @@ class FaultPlan : public CallInterceptor {
 
     /// The call of this number (the first is 0) among those that can fail does, in one of its ways.
     void failAt(std::size_t call, std::size_t way, FaultExtent extent);
-    /// From now on one call of `oneIn` fails, in a way that the seed chooses too.
+    /// From now on one call of `oneIn` fails, in a way that is drawn too; none does at rest.
+    void failSometimes(std::shared_ptr<Chance> chance, std::uint64_t oneIn);
     void failSometimes(std::uint64_t seed, std::uint64_t oneIn);
     /// Nothing fails any more; what was armed and not met is taken back.
     void stop();
@@ -79,7 +80,7 @@ class FaultPlan : public CallInterceptor {
     SimulatedPlatform& platform_;
     std::optional<Aim> aim_;
     std::string aimedAt_;  // the name of the call of the aim, once it was met
-    std::optional<std::mt19937_64> generator_;
+    std::shared_ptr<Chance> chance_;
     std::uint64_t oneIn_ = 0;
     const Way* pending_ = nullptr;  // what is to be undone when the call is over
     std::size_t denials_ = 0;

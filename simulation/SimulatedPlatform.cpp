@@ -66,7 +66,7 @@ std::vector<std::string> linesOf(const std::vector<RecordEntry>& entries, const 
 }  // namespace
 
 SimulatedPlatform::SimulatedPlatform(PropertyListSerialization& codec, Scheduling scheduling)
-    : scheduler(scheduling),
+    : scheduler(std::move(scheduling)),
       recorder(scheduler),
       transfers(recorder),
       host(recorder, &transfers),

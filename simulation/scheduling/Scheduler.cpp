@@ -7,6 +7,7 @@
 #include <string>
 #include <utility>
 
+#include "simulation/scheduling/Chance.h"
 #include "simulation/scheduling/Fiber.h"
 
 namespace appsync {
@@ -54,13 +55,13 @@ void Scheduler::abandon(std::unique_ptr<Turn> turn) {
 }
 
 Scheduler::Scheduler(Scheduling scheduling)
-    : scheduling_(scheduling),
-      generator_(scheduling.seed),
+    : scheduling_(std::move(scheduling)),
+      chance_(scheduling_.chance ? scheduling_.chance : std::make_shared<Chance>(scheduling_.seed)),
       thread_(std::this_thread::get_id()),
       timeLimit_(kDefaultTimeLimit),
       host_(std::make_unique<Turn>("host")),
       current_(host_.get()),
-      changesLeft_(scheduling.changePoints.value_or(0)),
+      changesLeft_(scheduling_.changePoints.value_or(0)),
       lowestPriority_(kMiddlePriority) {
     givePriority(*host_);
     host_->fiber = std::make_unique<Fiber>();
@@ -112,7 +113,7 @@ void Scheduler::workerLoop(Turn& turn) {
 void Scheduler::switchPoint() noexcept {
     checkThread();
     if (!scheduling_.interleaved || broken_) return;
-    if (random(kTimePassesOneIn) == 0) {
+    if (chance_->oneIn(kTimePassesOneIn)) {
         const std::optional<SimulatedTime> event = nextEvent();
         if (event && *event <= timeLimit_) (void)jumpToNextEvent();
     }
@@ -176,18 +177,23 @@ Scheduler::Turn* Scheduler::chosenTurn() {
     std::copy_if(order_.begin(), order_.end(), std::back_inserter(runnable),
                  [this](const Turn* turn) { return isRunnable(*turn); });
     if (runnable.empty()) return nullptr;
-    if (!scheduling_.changePoints) return runnable[random(runnable.size())];
+    if (!scheduling_.changePoints) {
+        const auto running = std::find(runnable.begin(), runnable.end(), current_);
+        const std::ptrdiff_t goesOn = running != runnable.end() ? running - runnable.begin() : 0;
+        return runnable[chance_->below(runnable.size(), static_cast<std::size_t>(goesOn))];
+    }
     return *std::max_element(runnable.begin(), runnable.end(), [](const Turn* a, const Turn* b) {
         return a->priority < b->priority;
     });
 }
 
 void Scheduler::givePriority(Turn& turn) {
-    if (scheduling_.changePoints) turn.priority = kMiddlePriority + random(kMiddlePriority);
+    if (scheduling_.changePoints)
+        turn.priority = kMiddlePriority + chance_->below(kMiddlePriority, 0);
 }
 
 void Scheduler::maybeFallBehind() {
-    if (changesLeft_ == 0 || random(kPriorityChangesOneIn) != 0) return;
+    if (changesLeft_ == 0 || !chance_->oneIn(kPriorityChangesOneIn)) return;
     --changesLeft_;
     current_->priority = --lowestPriority_;
 }
@@ -307,7 +313,5 @@ void Scheduler::checkThread() const {
         endProcess("called on another thread than the one that made it; it has only one");
     }
 }
-
-std::uint64_t Scheduler::random(std::uint64_t bound) { return generator_() % bound; }
 
 }  // namespace appsync

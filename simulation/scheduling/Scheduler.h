@@ -14,7 +14,6 @@
 #include <map>
 #include <memory>
 #include <optional>
-#include <random>
 #include <stdexcept>
 #include <string>
 #include <thread>
@@ -22,6 +21,7 @@
 
 namespace appsync {
 
+class Chance;
 class Fiber;
 
 /// The virtual time since the simulation began.
@@ -46,12 +46,17 @@ struct Scheduling {
     /// always the same one of those that can run goes first. Nothing: whoever the seed says goes on
     /// at each call.
     std::optional<std::size_t> changePoints = std::nullopt;
+    /// Interleaved: what to choose by in place of the seed; at rest the one that runs goes on.
+    /// Null: the seed.
+    std::shared_ptr<Chance> chance = nullptr;
 
     [[nodiscard]] static Scheduling runToCompletion() { return {}; }
-    [[nodiscard]] static Scheduling seeded(std::uint64_t seed) { return {true, seed}; }
+    [[nodiscard]] static Scheduling seeded(std::uint64_t seed) {
+        return {.interleaved = true, .seed = seed};
+    }
     /// Few changes of turn: what takes a certain order of a few events to go wrong shows sooner.
     [[nodiscard]] static Scheduling prioritized(std::uint64_t seed, std::size_t changePoints) {
-        return {true, seed, changePoints};
+        return {.interleaved = true, .seed = seed, .changePoints = changePoints};
     }
 };
 
@@ -134,10 +139,9 @@ class Scheduler {
     static void abandon(std::unique_ptr<Turn> turn);
     void checkThread() const;
     [[nodiscard]] std::string standstill(const std::string& headline) const;
-    [[nodiscard]] std::uint64_t random(std::uint64_t bound);
 
     const Scheduling scheduling_;
-    std::mt19937_64 generator_;
+    const std::shared_ptr<Chance> chance_;
     const std::thread::id thread_;
     SimulatedTime now_{0};
     SimulatedTime timeLimit_;

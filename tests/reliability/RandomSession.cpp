@@ -16,18 +16,28 @@ constexpr std::uint64_t kLongestShortDelay = 15;
 constexpr std::uint64_t kLongestPlaceholder = 12;
 constexpr CoordinationClient kAnotherClient = 9;
 
+std::set<std::size_t> keysOf(const std::map<std::size_t, std::uint64_t>& numbers) {
+    std::set<std::size_t> keys;
+    for (const auto& [key, number] : numbers) keys.insert(key);
+    return keys;
+}
+
 ErrorRecord somebodysReason() { return ErrorRecord::make("Person", 1, "cancelled"); }
 
 }  // namespace
 
-Scheduling RandomSession::schedulingOf(std::uint64_t seed) {
-    if (seed % 2 == 0) return Scheduling::seeded(seed);
-    return Scheduling::prioritized(seed, kChangePoints);
+Scheduling RandomSession::schedulingOf(std::uint64_t seed, std::shared_ptr<Chance> turns) {
+    Scheduling scheduling =
+        seed % 2 == 0 ? Scheduling::seeded(seed) : Scheduling::prioritized(seed, kChangePoints);
+    scheduling.chance = std::move(turns);
+    return scheduling;
 }
 
-RandomSession::RandomSession(std::uint64_t seed)
-    : random_(seed),
-      world_(schedulingOf(seed)),
+RandomSession::RandomSession(std::uint64_t seed, const SessionChanges& changes)
+    : changes_(changes),
+      choices_(seed, changes.choices),
+      turns_(std::make_shared<Chance>(changes.turnSeed.value_or(seed), changes.turns)),
+      world_(schedulingOf(seed, turns_)),
       invariants_(world_),
       demands_(world_, invariants_) {}
 
@@ -43,7 +53,7 @@ std::vector<std::string> RandomSession::run() {
 void RandomSession::runThrowing() {
     arrange();
     world_.startClient();
-    if (oneIn(2)) world_.faults.failSometimes(random_(), 10 + random_() % 90);
+    arrangeFaults();
     if (oneIn(3)) {
         restore();
         if (oneIn(3)) restore();
@@ -63,23 +73,37 @@ void RandomSession::runThrowing() {
     invariants_.clientGoes();
 }
 
-std::string RandomSession::anyIdentifier() {
-    return "com.example.app" + std::to_string(random_() % kIdentifiers);
+std::array<std::size_t, 3> RandomSession::draws() const {
+    return {choices_.draws(), faultChance_ != nullptr ? faultChance_->draws() : 0, turns_->draws()};
 }
 
-std::chrono::seconds RandomSession::anyDelay() {
-    return std::chrono::seconds(random_() % kLongestDelay);
+SessionChanges RandomSession::unrest() const {
+    const auto of = [](const std::vector<std::size_t>& draws) {
+        return std::set<std::size_t>(draws.begin(), draws.end());
+    };
+    SessionChanges changes = changes_;
+    changes.choices.kept = of(choices_.unrest());
+    changes.faults.kept =
+        of(faultChance_ != nullptr ? faultChance_->unrest() : std::vector<std::size_t>());
+    changes.turns.kept = of(turns_->unrest());
+    return changes;
 }
+
+std::string RandomSession::anyIdentifier() {
+    return "com.example.app" + std::to_string(any(kIdentifiers));
+}
+
+std::chrono::seconds RandomSession::anyDelay() { return std::chrono::seconds(any(kLongestDelay)); }
 
 /// Within the time that it is waited for a few placeholders.
 std::chrono::seconds RandomSession::shortDelay() {
-    return std::chrono::seconds(random_() % kLongestShortDelay);
+    return std::chrono::seconds(any(kLongestShortDelay));
 }
 
 void RandomSession::arrange() {
     world_.coordinated = oneIn(2);
     world_.isInDaemon = !oneIn(4);
-    for (std::uint64_t i = random_() % kIdentifiers; i > 0; --i) {
+    for (std::uint64_t i = any(kIdentifiers); i > 0; --i) {
         const std::string identifier = anyIdentifier();
         world_.platform.registry.addApplication(identifier, "0.9");
         invariants_.mustKeep(identifier);
@@ -92,6 +116,18 @@ void RandomSession::arrange() {
     if (oneIn(6)) world_.platform.host.setTransferService(nullptr);
     arrangePolicy();
     arrangeOffloaded();
+}
+
+void RandomSession::arrangeFaults() {
+    const bool someFail = oneIn(2);
+    if (!someFail && changes_.faults.replaced.empty()) return;
+    constexpr std::uint64_t kOften = 10;
+    const std::uint64_t count = kOften + any(90);
+    const std::uint64_t seed = choices_.seed();
+    ChanceChanges changes = changes_.faults;
+    if (!someFail && !changes.kept) changes.kept = keysOf(changes.replaced);
+    faultChance_ = std::make_shared<Chance>(changes_.faultSeed.value_or(seed), std::move(changes));
+    world_.faults.failSometimes(faultChance_, count);
 }
 
 void RandomSession::arrangePolicy() {
@@ -121,7 +157,7 @@ void RandomSession::arrangeOffloaded() {
     world_.stageDemoted(automatically, intentionally);
     if (oneIn(2)) {
         world_.platform.coordination.setPlaceholderDuration(
-            std::chrono::seconds(random_() % kLongestPlaceholder));
+            std::chrono::seconds(any(kLongestPlaceholder)));
     }
 }
 
@@ -154,7 +190,7 @@ void RandomSession::restoreAnother(const std::string& identifier, bool isSound) 
     demands_.leaveOut(identifier);
     demands_.mayBePlaced(identifier);
     const Bytes metadata = isSound ? world_.restoreMetadata() : Bytes{};
-    const std::uint64_t demotionStatus = random_() % 3;
+    const std::uint64_t demotionStatus = any(3);
     world_.platform.scheduler.spawnAfter(
         shortDelay(), "another restore", [this, identifier, metadata, demotionStatus] {
             const std::shared_ptr<AppsClient> client = world_.client;
@@ -198,7 +234,7 @@ PropertyList RandomSession::anyTodoList() {
     PropertyList list = PropertyList::array();
     for (std::uint64_t i = 0; i < kIdentifiers; ++i) {
         const std::string identifier = "com.example.app" + std::to_string(i);
-        if (oneIn(3)) continue;
+        if (oneIn(3, true)) continue;
         list.append(World::entry(identifier, oneIn(4) ? "remove" : "install"));
     }
     return list;
@@ -275,7 +311,7 @@ void RandomSession::transferRestore() {
     if (oneIn(2)) world_.platform.backup.addRestoreData(identifier);
     for (const unsigned parts :
          {unsigned{kAssetPartApplication}, unsigned{kAssetPartApplicationData}}) {
-        if (oneIn(4)) continue;
+        if (oneIn(4, true)) continue;
         auto asset = std::make_shared<SyncAsset>();
         asset->identifier = identifier;
         asset->dataclass = "Application";

@@ -1,13 +1,16 @@
 #pragma once
 
+#include <array>
 #include <chrono>
 #include <cstdint>
-#include <random>
+#include <memory>
 #include <string>
 #include <vector>
 
+#include "simulation/scheduling/Chance.h"
 #include "tests/reliability/Demands.h"
 #include "tests/reliability/Invariants.h"
+#include "tests/reliability/SessionChanges.h"
 #include "tests/reliability/World.h"
 
 namespace appsync {
@@ -18,7 +21,7 @@ namespace appsync {
 /// has a turn when.
 class RandomSession {
   public:
-    explicit RandomSession(std::uint64_t seed);
+    explicit RandomSession(std::uint64_t seed, const SessionChanges& changes = {});
 
     /// What was broken; nothing is thrown.
     std::vector<std::string> run();
@@ -27,16 +30,25 @@ class RandomSession {
     [[nodiscard]] std::size_t faults() const { return world_.faults.injected().size(); }
     /// How many things the plug-in had to get done.
     [[nodiscard]] std::size_t demands() const { return demands_.count(); }
+    /// How many draws have decided what there is, which calls fail, and who has a turn.
+    [[nodiscard]] std::array<std::size_t, 3> draws() const;
+    /// The session with all draws named that gave something else than at rest.
+    [[nodiscard]] SessionChanges unrest() const;
 
   private:
-    [[nodiscard]] static Scheduling schedulingOf(std::uint64_t seed);
+    [[nodiscard]] static Scheduling schedulingOf(std::uint64_t seed, std::shared_ptr<Chance> turns);
     /// True once in so many times.
-    [[nodiscard]] bool oneIn(std::uint64_t count) { return random_() % count == 0; }
+    [[nodiscard]] bool oneIn(std::uint64_t count, bool atRest = false) {
+        return choices_.oneIn(count, atRest);
+    }
+    /// A number below `bound`.
+    [[nodiscard]] std::uint64_t any(std::uint64_t bound) { return choices_.below(bound, 0); }
     [[nodiscard]] std::string anyIdentifier();
     [[nodiscard]] std::chrono::seconds anyDelay();
     [[nodiscard]] std::chrono::seconds shortDelay();
 
     void arrange();
+    void arrangeFaults();
     void arrangePolicy();
     void arrangeOffloaded();
     void restore();
@@ -52,7 +64,10 @@ class RandomSession {
     void loseTransfer(const SyncAssetPointer& asset);
     void runThrowing();
 
-    std::mt19937_64 random_;
+    const SessionChanges changes_;
+    Chance choices_;
+    std::shared_ptr<Chance> turns_;
+    std::shared_ptr<Chance> faultChance_;  // null where nothing fails
     World world_;
     bool leaves_ = false;  // the host does, in the middle of a session
     Invariants invariants_;

@@ -2,28 +2,22 @@
 #include <cstdint>
 #include <cstdio>
 #include <cstdlib>
-#include <optional>
 #include <string>
 #include <vector>
 
 #include "tests/reliability/RandomSession.h"
+#include "tests/reliability/Reduction.h"
+#include "tests/reliability/SeedRange.h"
 
 namespace appsync {
 namespace {
 
 using testing::IsEmpty;
 
-/// The environment variable that names one seed; those that say how many to try, from which on.
-constexpr const char* kOneSeed = "APPSYNC_SEED";
-constexpr const char* kManySeeds = "APPSYNC_SEEDS";
-constexpr const char* kFirstSeed = "APPSYNC_FIRST_SEED";
+/// The environment variable that asks for the least of a seed that fails.
+constexpr const char* kSmall = "APPSYNC_SMALL";
 constexpr std::uint64_t kSeeds = 2000;
-constexpr std::uint64_t kParts = 8;
-
-std::optional<std::uint64_t> numberIn(const char* variable) {
-    const char* text = std::getenv(variable);
-    return text != nullptr ? std::optional<std::uint64_t>(std::stoull(text)) : std::nullopt;
-}
+constexpr std::uint64_t kChangess = 8;
 
 std::string firstDifference(const std::vector<std::string>& one,
                             const std::vector<std::string>& other) {
@@ -34,12 +28,12 @@ std::string firstDifference(const std::vector<std::string>& one,
 }
 
 /// How many calls were made to fail.
-std::size_t tryOut(std::uint64_t seed) {
+std::size_t tryOut(std::uint64_t seed, const SessionChanges& changes = {}) {
     SCOPED_TRACE(std::string(kOneSeed) + "=" + std::to_string(seed) +
                  " build/release/tests/test_reliability --gtest_filter=Seeds.One");
-    RandomSession first(seed);
+    RandomSession first(seed, changes);
     EXPECT_THAT(first.run(), IsEmpty());
-    RandomSession second(seed);
+    RandomSession second(seed, changes);
     second.run();
     EXPECT_EQ(firstDifference(first.trace(), second.trace()), "");
     return first.faults();
@@ -53,19 +47,39 @@ TEST_P(ManySeeds, KeepTheInvariantsAndRepeatThemselves) {
     const std::uint64_t count = numberIn(kManySeeds).value_or(kSeeds);
     std::size_t seeds = 0;
     std::size_t faults = 0;
-    for (std::uint64_t i = GetParam(); i < count; i += kParts, ++seeds) faults += tryOut(first + i);
+    for (std::uint64_t i = GetParam(); i < count; i += kChangess, ++seeds)
+        faults += tryOut(first + i);
     RecordProperty("seeds", static_cast<int>(seeds));
     RecordProperty("faults", static_cast<int>(faults));
 }
 
-INSTANTIATE_TEST_SUITE_P(Part, ManySeeds, testing::Range(std::uint64_t{0}, kParts));
+INSTANTIATE_TEST_SUITE_P(Part, ManySeeds, testing::Range(std::uint64_t{0}, kChangess));
 
-/// With APPSYNC_TRACE it also prints what crossed platform/.
+SessionChanges givenChanges() {
+    const char* text = std::getenv(kChanges);
+    return changesOf(text != nullptr ? text : "");
+}
+
+void printSmall(std::uint64_t seed) {
+    const ReducedSession small = reducedSession(seed, givenChanges());
+    if (small.violations.empty()) return;
+    std::printf(
+        "small: %zu applications, %zu choices, %zu faults, %zu switches, in %zu sessions: %s\n",
+        small.applications, small.changes.choices.kept->size(), small.changes.faults.kept->size(),
+        small.changes.turns.kept->size(), small.tries, small.violations.front().c_str());
+    std::printf(
+        "again: %s=%llu %s='%s' build/release/tests/test_reliability --gtest_filter=Seeds.One\n",
+        kOneSeed, static_cast<unsigned long long>(seed), kChanges, textOf(small.changes).c_str());
+}
+
+/// With APPSYNC_TRACE it also prints what crossed platform/; with APPSYNC_SMALL, where it fails,
+/// the least of it that does, too.
 TEST(Seeds, One) {
     const std::uint64_t seed = numberIn(kOneSeed).value_or(1);
-    tryOut(seed);
+    tryOut(seed, givenChanges());
+    if (std::getenv(kSmall) != nullptr) printSmall(seed);
     if (std::getenv("APPSYNC_TRACE") == nullptr) return;
-    RandomSession session(seed);
+    RandomSession session(seed, givenChanges());
     session.run();
     for (const std::string& line : session.trace()) std::puts(line.c_str());
 }
