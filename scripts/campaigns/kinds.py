@@ -12,7 +12,7 @@ import subprocess
 import typing
 
 from campaigns.tree import ROOT, Refusal
-from campaigns.units import TAIL, Finding, Record, Unit, by_hand
+from campaigns.units import TAIL, Finding, Record, Unit, by_hand, finish
 
 RELIABILITY = ROOT / "build" / "release" / "tests" / "test_reliability"
 COMMAND = ROOT / "build" / "release" / "appsync"
@@ -37,6 +37,7 @@ class Kind:
     read: typing.Callable  # (unit, how it ended) -> record
     size: int = 1  # of a unit's range
     rounds: typing.Callable = lambda: None  # how many ranges each part has; nothing: there is no end
+    smaller: typing.Callable = lambda finding, _made: finding  # the least of it that still fails
 
     def missing(self):
         """Why it cannot be run; nothing when it can."""
@@ -109,7 +110,7 @@ def names_in(suite, test=r"\w+"):
     return re.findall(rf"^ +({test}/\w+)", listing.stdout, re.MULTILINE)
 
 
-def gtest(name, says, suite, environment, tried, covered, size=1, rounds=lambda: None, parts=None):
+def gtest(name, says, suite, environment, tried, covered, size=1, rounds=lambda: None, parts=None, smaller=Kind.smaller):
     """A kind that is a suite of test_reliability; its parts are the suite's tests if nothing else is said."""
 
     def command(unit):
@@ -120,7 +121,29 @@ def gtest(name, says, suite, environment, tried, covered, size=1, rounds=lambda:
         return GTEST_REPLAY.findall(output)
 
     read = reader(tried, covered, replays, command)
-    return Kind(name, says, "release", RELIABILITY, parts or (lambda: names_in(suite)), command, read, size, rounds)
+    return Kind(name, says, "release", RELIABILITY, parts or (lambda: names_in(suite)), command, read, size, rounds,
+                smaller)
+
+
+SMALL_LIMIT = 300  # seconds that it may take to make a finding small
+
+
+def small_session(finding, made):
+    """A session that a seed decides, with as much of it at rest as can be."""
+    seed = re.search(r"\bAPPSYNC_SEED=(\d+)", finding.replay)
+    if not seed:
+        return finding
+    words = [str(RELIABILITY), "--gtest_brief=1", "--gtest_filter=Seeds.One"]
+    variables = {"APPSYNC_SEED": seed[1], "APPSYNC_SMALL": 1}
+    changes = re.search(r"\bAPPSYNC_CHANGES='([^']*)'", finding.replay)
+    if changes:
+        variables["APPSYNC_CHANGES"] = changes[1]
+    ended = finish(words, variables, SMALL_LIMIT, made)
+    small = re.search(r"^small: (.*)$", ended.output, re.MULTILINE)
+    again = re.search(r"^again: (.*)$", ended.output, re.MULTILINE)
+    if not small or not again:  # it has ended the program, or does not fail alone
+        return finding
+    return Finding(small[1], again[1], f"of: {finding.replay}\n{finding.what}\n{finding.output}")
 
 
 # --- pytest --------------------------------------------------------------------------------------
@@ -242,7 +265,11 @@ KINDS = {
     for kind in (
         gtest("seeds", "250 sessions that seeds decide, of both paths", "ManySeeds",
               lambda unit: {"APPSYNC_FIRST_SEED": unit.first, "APPSYNC_SEEDS": unit.count},
-              r'"seeds": "(\d+)"', {"faults": r'"faults": "(\d+)"'}, 250, parts=lambda: [""]),
+              r'"seeds": "(\d+)"', {"faults": r'"faults": "(\d+)"'}, 250, parts=lambda: [""], smaller=small_session),
+        gtest("guided", "1,000 such sessions, half of them variations of those that have reached more than others",
+              "GuidedSearch", lambda unit: {"APPSYNC_FIRST_SEED": unit.first, "APPSYNC_SEEDS": unit.count},
+              r'"seeds": "(\d+)"', {"faults": r'"faults": "(\d+)"'}, 1000,
+              parts=lambda: ["OfManySessionsKeepsTheInvariants"], smaller=small_session),
         gtest("faults", "each call of a scenario fails, in one of the ways of the sweep", "EveryFault", lambda _unit: {},
               r'"runs": "(\d+)"', {"faults": r'"faults": "(\d+)"'}, rounds=lambda: 1,
               parts=lambda: names_in("EveryFault", r"\w+IsSurvived")),

@@ -21,6 +21,7 @@ LIMIT = 120
 PROGRAM = """#!/bin/sh
 seed=$APPSYNC_FIRST_SEED
 place=${PLACE:-$(cd "$(dirname "$0")/../.." && pwd)}
+if [ -n "$APPSYNC_SMALL" ]; then . "$place/does/small"; exit 1; fi
 echo "$seed" >>"$place/ran"
 if [ -e "$place/does/$seed" ]; then . "$place/does/$seed"; fi
 echo '"seeds": "250", "faults": "3"'
@@ -123,6 +124,30 @@ def test_a_campaign_counts_what_it_did_and_writes_a_page(tree):
     page = (tree.path / "build" / "campaign" / "seeds.html").read_text()
     assert "<svg" in page and "<polyline" in page and figures["commit"] in page
     assert tree.ran() == {seed: 1 for seed in range(0, 1500, 250)}
+
+
+FAILS = """for each in 1 2 3 4; do echo "APPSYNC_SEED=$each build/release/tests/test_reliability --gtest_filter=Seeds.One"; done
+exit 1"""
+
+
+def test_findings_are_made_small(tree):
+    tree.does(0, FAILS)
+    tree.does("small", """echo "small: 1 applications, 2 choices: lost"
+echo "again: APPSYNC_SEED=$APPSYNC_SEED APPSYNC_CHANGES='choices:1,2' build/release/tests/test_reliability" """)
+    tree.campaign("seeds", "--local", 1, "--units", 1, status=1)
+    *small, last = tree.figures()["findings"]
+    assert [each["what"] for each in small] == ["1 applications, 2 choices: lost"] * 3
+    assert small[0]["replay"] == "APPSYNC_SEED=1 APPSYNC_CHANGES='choices:1,2' build/release/tests/test_reliability"
+    assert "of: APPSYNC_SEED=1 build/release" in small[0]["output"]
+    assert last["replay"].startswith("APPSYNC_SEED=4 ") and "APPSYNC_CHANGES" not in last["replay"]
+
+
+def test_what_cannot_be_made_small_stays_as_it_was(tree):
+    tree.does(0, FAILS)
+    tree.does("small", "kill -ABRT $$")
+    tree.campaign("seeds", "--local", 1, "--units", 1, status=1)
+    findings = tree.figures()["findings"]
+    assert [each["replay"].split()[0] for each in findings] == [f"APPSYNC_SEED={each}" for each in (1, 2, 3, 4)]
 
 
 def test_a_campaign_that_was_killed_goes_on_where_it_was(tree):
