@@ -2,6 +2,7 @@
 
 #include <algorithm>
 #include <array>
+#include <bit>
 #include <charconv>
 #include <cmath>
 #include <cstring>
@@ -32,6 +33,52 @@ std::string hexadecimal(std::uint64_t number) {
     return {digits.data(), end.ptr};
 }
 
+// A sum takes words in turn into lanes that do not wait for each other.
+constexpr std::size_t kLanes = 8;
+constexpr std::size_t kBlock = kLanes * sizeof(std::uint64_t);
+
+/// The same on every machine.
+std::uint64_t wordAt(const std::uint8_t* bytes) {
+    std::uint64_t word = 0;
+    if constexpr (std::endian::native == std::endian::little) {
+        std::memcpy(&word, bytes, sizeof word);
+    } else {
+        constexpr unsigned kBits = 8;
+        for (std::size_t i = sizeof word; i-- > 0;) word = word << kBits | bytes[i];
+    }
+    return word;
+}
+
+std::uint64_t mixed(std::uint64_t sum, std::uint64_t word) {
+    constexpr std::uint64_t kFactor = 0x9E3779B97F4A7C15U;
+    constexpr int kTurn = 29;
+    return std::rotl((sum ^ word) * kFactor, kTurn);
+}
+
+/// Each lane is named, so that all of them stay in registers.
+template <std::size_t... Lane>
+ContentSum sumInLanes(ByteView contents, std::index_sequence<Lane...>) {
+    std::uint64_t sum = contents.size();
+    std::array<std::uint64_t, kLanes> lanes{(Lane + 1)...};
+    const auto take = [&lanes](const std::uint8_t* block) {
+        ((lanes[Lane] = mixed(lanes[Lane], wordAt(block + Lane * sizeof(std::uint64_t)))), ...);
+    };
+    for (; contents.size() >= kBlock; contents = contents.subspan(kBlock)) take(contents.data());
+    std::array<std::uint8_t, kBlock> rest{};
+    std::copy(contents.begin(), contents.end(), rest.begin());
+    take(rest.data());
+    ((sum = mixed(sum, lanes[Lane])), ...);
+    return sum;
+}
+
+/// Whether JSON takes all of it as it stands; most texts are so.
+bool needsNoEscapes(std::string_view text) {
+    return std::all_of(text.begin(), text.end(), [](char each) {
+        const auto byte = static_cast<unsigned char>(each);
+        return byte >= ' ' && byte < 0x7F && each != '"' && each != '\\';
+    });
+}
+
 /// How many bytes the character that begins so has; 0 where none does.
 std::size_t lengthOfCharacter(unsigned char first) {
     if (first < 0x80) return 1;
@@ -55,18 +102,7 @@ bool isWhole(std::string_view character) {
 }  // namespace
 
 ContentSum sumOf(ByteView contents) {
-    constexpr std::uint64_t kFactor = 0x9E3779B97F4A7C15U;
-    constexpr unsigned kShift = 29;
-    std::uint64_t sum = contents.size() * kFactor;
-    while (!contents.empty()) {
-        std::uint64_t word = 0;
-        const std::size_t count = std::min(sizeof word, contents.size());
-        std::memcpy(&word, contents.data(), count);
-        sum = (sum ^ word) * kFactor;
-        sum ^= sum >> kShift;
-        contents = contents.subspan(count);
-    }
-    return sum;
+    return sumInLanes(contents, std::make_index_sequence<kLanes>());
 }
 
 bool isUtf8(std::string_view bytes) {
@@ -137,12 +173,25 @@ void RecordText::begin(char bracket) {
 
 void RecordText::end(char bracket) { text_ += bracket; }
 
-void RecordText::addQuoted(std::string_view text) {
+void RecordText::addLiteral(std::string_view text) {
     separate();
-    text_ += quoted(text);
+    text_ += text;
 }
 
+void RecordText::addName(std::string_view name) {
+    separate();
+    text_ += '"';
+    text_ += name;
+    text_ += '"';
+}
+
+void RecordText::addQuoted(std::string_view text) { addLiteral(quoted(text)); }
+
 void RecordText::addPlain(std::string_view text) {
+    if (needsNoEscapes(text)) {
+        addName(text);
+        return;
+    }
     if (isUtf8(text)) {
         addQuoted(text);
         return;
@@ -161,10 +210,7 @@ void RecordText::add(const RecordText& value) {
                          value.longContents_.end());
 }
 
-void RecordText::addNull() {
-    separate();
-    text_ += "null";
-}
+void RecordText::addNull() { addLiteral("null"); }
 
 void RecordText::addLeftOut() {
     begin('{');
@@ -181,10 +227,7 @@ void RecordText::add(std::string_view text) {
     }
 }
 
-void RecordText::add(bool value) {
-    separate();
-    text_ += value ? "true" : "false";
-}
+void RecordText::add(bool value) { addLiteral(value ? "true" : "false"); }
 
 void RecordText::add(double value) {
     if (!std::isfinite(value)) {
@@ -194,16 +237,14 @@ void RecordText::add(double value) {
     constexpr std::size_t kLongest = 40;
     std::array<char, kLongest> digits{};
     const auto end = std::to_chars(digits.data(), digits.data() + digits.size(), value);
-    separate();
-    text_.append(digits.data(), end.ptr);
+    addLiteral({digits.data(), end.ptr});
 }
 
 void RecordText::addPersonal(const std::string& decimal) {
     if (anonymizer_ != nullptr) {
         addQuoted(anonymizer_->madeUpFor(decimal));
     } else {
-        separate();
-        text_ += decimal;
+        addLiteral(decimal);
     }
 }
 
@@ -220,7 +261,7 @@ void RecordText::add(ByteView contents) {
         member("sum");
         addQuoted(hexadecimal(sum));
         if (contents.size() <= limit_) {
-            contents_.push_back({sum, Bytes(contents.begin(), contents.end())});
+            contents_.push_back({sum, contents});
         } else if (!isAnswer_) {
             longContents_.push_back(sum);
         }
@@ -369,12 +410,12 @@ void RecordText::add(const LogArgument& argument) {
     std::visit(addOne, argument);
 }
 
-void RecordText::addMessage(std::span<const LogArgument> arguments,
-                            std::string_view ownIdentifier) {
+void RecordText::add(const MessageArguments& message) {
     begin('[');
-    for (const LogArgument& each : arguments) {
+    for (const LogArgument& each : message.arguments) {
         const auto* text = std::get_if<std::string_view>(&each);
-        if (text != nullptr && &each == arguments.data() && *text == ownIdentifier) {
+        const bool isFirst = &each == message.arguments.data();
+        if (text != nullptr && isFirst && *text == message.ownIdentifier) {
             add(0);
         } else {
             add(each);

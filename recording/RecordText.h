@@ -1,5 +1,7 @@
 #pragma once
 
+#include <array>
+#include <charconv>
 #include <concepts>
 #include <cstddef>
 #include <cstdint>
@@ -38,7 +40,18 @@ using ContentSum = std::uint64_t;
 /// Contents that a record names by size and sum.
 struct NamedContents {
     ContentSum sum = 0;
-    Bytes bytes;
+    ByteView bytes;
+};
+
+/// A text that nobody has chosen.
+struct PlainText {
+    std::string_view text;
+};
+
+/// What a message is made with. The identifier with which the plug-in's messages begin is 0 there.
+struct MessageArguments {
+    std::span<const LogArgument> arguments;
+    std::string_view ownIdentifier;
 };
 
 /// The JSON text of a record in the making: values are added one behind the other, commas come by
@@ -48,9 +61,11 @@ struct NamedContents {
 /// is left out.
 class RecordText {
   public:
-    /// Contents of up to `limit` bytes are collected beside the text.
-    RecordText(Anonymizer* anonymizer, std::size_t limit)
-        : anonymizer_(anonymizer), limit_(limit) {}
+    /// Contents of up to `limit` bytes are collected beside the text. They are not copied: who has
+    /// them keeps them until the record is written.
+    RecordText(Anonymizer* anonymizer, std::size_t limit) : anonymizer_(anonymizer), limit_(limit) {
+        text_.reserve(kUsualLength);
+    }
 
     /// The sums that contents are named by in the place of their own.
     void setAliases(const std::map<ContentSum, ContentSum>* aliases) { aliases_ = aliases; }
@@ -70,6 +85,8 @@ class RecordText {
     void member(std::string_view name);
     void begin(char bracket);
     void end(char bracket);
+    /// The name of a call, which JSON needs no escapes for.
+    void addName(std::string_view name);
     /// A text that nobody has chosen: it stays as it is.
     void addPlain(std::string_view text);
     void addNull();
@@ -83,8 +100,10 @@ class RecordText {
     void add(double value);
     template <std::integral Number>
     requires(!std::same_as<Number, bool>) void add(Number value) {
-        separate();
-        text_ += std::to_string(value);
+        constexpr std::size_t kLongest = 24;
+        std::array<char, kLongest> digits{};
+        const auto end = std::to_chars(digits.data(), digits.data() + digits.size(), value);
+        addLiteral({digits.data(), end.ptr});
     }
     template <typename Enumeration>
     requires std::is_enum_v<Enumeration>
@@ -104,9 +123,8 @@ class RecordText {
     void add(const PlaceholderAttributes& attributes);
     void add(const StoreMetadata& metadata);
     void add(const LogArgument& argument);
-    /// What a message is made with, as a list. The identifier with which the plug-in's messages
-    /// begin is 0 there.
-    void addMessage(std::span<const LogArgument> arguments, std::string_view ownIdentifier);
+    void add(const MessageArguments& message);
+    void add(const PlainText& plain) { addPlain(plain.text); }
     void add(const PersonIdentifier& person);
     void add(const SyncAccountInfo& account);
     void add(const Status& status);
@@ -146,7 +164,11 @@ class RecordText {
     void add(std::span<const std::string> values) { addEach(values); }
 
   private:
+    /// Most records are shorter.
+    static constexpr std::size_t kUsualLength = 256;
+
     void separate();
+    void addLiteral(std::string_view text);
     void addQuoted(std::string_view text);
     void addTree(const PropertyList& list);
     void addLeftOut();

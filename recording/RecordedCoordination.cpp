@@ -1,5 +1,6 @@
 #include "recording/RecordedCoordination.h"
 
+#include <string_view>
 #include <utility>
 #include <vector>
 
@@ -69,11 +70,11 @@ class RecordedPromise : public RecordedHandle<Interface> {
         return call("isComplete").answer(this->inner()->isComplete());
     }
     void setComplete() override {
-        call("setComplete").announce();
+        const AnnouncedCall call = announced("setComplete");
         this->inner()->setComplete();
     }
     void cancelForReason(const ErrorRecord& reason, CoordinationClient client) override {
-        call("cancelForReason", reason, client).announce();
+        const AnnouncedCall call = announced("cancelForReason", reason, client);
         this->inner()->cancelForReason(reason, client);
     }
 
@@ -82,6 +83,11 @@ class RecordedPromise : public RecordedHandle<Interface> {
     CallRecord call(const char* method, const Arguments&... arguments) const {
         return CallRecord(this->recording(), std::string(kPromise<Interface>) + method,
                           this->number(), arguments...);
+    }
+    template <typename... Arguments>
+    AnnouncedCall announced(const char* method, const Arguments&... arguments) const {
+        return AnnouncedCall(this->recording(), std::string(kPromise<Interface>) + method,
+                             this->number(), arguments...);
     }
 };
 
@@ -168,6 +174,9 @@ class RecordedCoordinatorObserver
 
   private:
     [[nodiscard]] InstallCoordinatorPointer handleOn(const InstallCoordinatorPointer& inner) const;
+    template <auto Method, typename... Arguments>
+    void pass(std::string_view callback, const InstallCoordinatorPointer& coordinator,
+              const Arguments&... arguments) const;
 
     const std::weak_ptr<InstallCoordinatorObserver> plugIn_;
     const std::weak_ptr<RecordedCoordinatorObservers> observers_;
@@ -205,7 +214,7 @@ class RecordedCoordinator : public RecordedHandle<InstallCoordinator> {
     }
     void setObserver(std::weak_ptr<InstallCoordinatorObserver> observer) override {
         const auto standIn = standInFor(observers_, observer, recording());
-        call("setObserver", standIn->number()).announce();
+        const AnnouncedCall call = announced("setObserver", standIn->number());
         inner()->setObserver(standIn);
     }
     bool hasInstallOptions() const override {
@@ -266,7 +275,7 @@ class RecordedCoordinator : public RecordedHandle<InstallCoordinator> {
             .answer(inner()->setPlaceholderPromise(innerOf(placeholder)));
     }
     void cancelForReason(const ErrorRecord& reason, CoordinationClient client) override {
-        call("cancelForReason", reason, client).announce();
+        const AnnouncedCall call = announced("cancelForReason", reason, client);
         inner()->cancelForReason(reason, client);
     }
 
@@ -275,6 +284,11 @@ class RecordedCoordinator : public RecordedHandle<InstallCoordinator> {
     CallRecord call(const char* method, const Arguments&... arguments) const {
         return CallRecord(recording(), std::string("InstallCoordinator.") + method, number(),
                           arguments...);
+    }
+    template <typename... Arguments>
+    AnnouncedCall announced(const char* method, const Arguments&... arguments) const {
+        return AnnouncedCall(recording(), std::string("InstallCoordinator.") + method, number(),
+                             arguments...);
     }
 
     const Observers observers_;
@@ -305,45 +319,41 @@ InstallCoordinatorPointer RecordedCoordinatorObserver::handleOn(
     return std::make_shared<RecordedCoordinator>(inner, observers_.lock(), *recording_);
 }
 
+/// Hands on what is told of a coordinator.
+template <auto Method, typename... Arguments>
+void RecordedCoordinatorObserver::pass(std::string_view callback,
+                                       const InstallCoordinatorPointer& coordinator,
+                                       const Arguments&... arguments) const {
+    const InstallCoordinatorPointer handle = handleOn(coordinator);
+    const SpanRecord span(*recording_, "callback", callback, number_, numberOf(handle),
+                          arguments...);
+    const auto plugIn = plugIn_.lock();
+    if (plugIn != nullptr) (plugIn.get()->*Method)(handle, arguments...);
+}
+
 void RecordedCoordinatorObserver::coordinatorDidInstallPlaceholder(
     const InstallCoordinatorPointer& coordinator) {
-    const InstallCoordinatorPointer handle = handleOn(coordinator);
-    const SpanRecord span(*recording_, "callback",
-                          "InstallCoordinatorObserver.coordinatorDidInstallPlaceholder", number_,
-                          numberOf(handle));
-    const auto plugIn = plugIn_.lock();
-    if (plugIn != nullptr) plugIn->coordinatorDidInstallPlaceholder(handle);
+    pass<&InstallCoordinatorObserver::coordinatorDidInstallPlaceholder>(
+        "InstallCoordinatorObserver.coordinatorDidInstallPlaceholder", coordinator);
 }
 
 void RecordedCoordinatorObserver::coordinatorDidCompleteSuccessfully(
     const InstallCoordinatorPointer& coordinator) {
-    const InstallCoordinatorPointer handle = handleOn(coordinator);
-    const SpanRecord span(*recording_, "callback",
-                          "InstallCoordinatorObserver.coordinatorDidCompleteSuccessfully", number_,
-                          numberOf(handle));
-    const auto plugIn = plugIn_.lock();
-    if (plugIn != nullptr) plugIn->coordinatorDidCompleteSuccessfully(handle);
+    pass<&InstallCoordinatorObserver::coordinatorDidCompleteSuccessfully>(
+        "InstallCoordinatorObserver.coordinatorDidCompleteSuccessfully", coordinator);
 }
 
 void RecordedCoordinatorObserver::coordinatorCanceledWithReason(
     const InstallCoordinatorPointer& coordinator, const ErrorRecord& reason,
     CoordinationClient client) {
-    const InstallCoordinatorPointer handle = handleOn(coordinator);
-    const SpanRecord span(*recording_, "callback",
-                          "InstallCoordinatorObserver.coordinatorCanceledWithReason", number_,
-                          numberOf(handle), reason, client);
-    const auto plugIn = plugIn_.lock();
-    if (plugIn != nullptr) plugIn->coordinatorCanceledWithReason(handle, reason, client);
+    pass<&InstallCoordinatorObserver::coordinatorCanceledWithReason>(
+        "InstallCoordinatorObserver.coordinatorCanceledWithReason", coordinator, reason, client);
 }
 
 void RecordedCoordinatorObserver::coordinatorShouldPrioritize(
     const InstallCoordinatorPointer& coordinator) {
-    const InstallCoordinatorPointer handle = handleOn(coordinator);
-    const SpanRecord span(*recording_, "callback",
-                          "InstallCoordinatorObserver.coordinatorShouldPrioritize", number_,
-                          numberOf(handle));
-    const auto plugIn = plugIn_.lock();
-    if (plugIn != nullptr) plugIn->coordinatorShouldPrioritize(handle);
+    pass<&InstallCoordinatorObserver::coordinatorShouldPrioritize>(
+        "InstallCoordinatorObserver.coordinatorShouldPrioritize", coordinator);
 }
 
 RecordedCoordination::RecordedCoordination(InstallCoordinatorService& inner, Recording& recording)
@@ -431,8 +441,8 @@ std::shared_ptr<InstallPlaceholder> RecordedCoordination::makeAppPlaceholder(
 void RecordedCoordination::uninstallApp(const std::string& identifier,
                                         UninstallCompletion completion) {
     const std::uint64_t number = recording_.newNumber();
-    CallRecord(recording_, "InstallCoordinatorService.uninstallApp", 0, identifier, number)
-        .announce();
+    const AnnouncedCall call(recording_, "InstallCoordinatorService.uninstallApp", 0, identifier,
+                             number);
     inner_.uninstallApp(
         identifier, [recording = recording_.shared_from_this(), number,
                      completion = std::move(completion)](const ErrorRecord* error) mutable {

@@ -26,7 +26,7 @@ class RecordedSerialQueue : public SerialQueue {
 
     void sync(const Task& task) override {
         const std::uint64_t item = recording_.newNumber();
-        CallRecord(recording_, "SerialQueue.sync", number_, item).announce();
+        const AnnouncedCall call(recording_, "SerialQueue.sync", number_, item);
         inner_->sync([this, item, &task] {
             const SpanRecord span(recording_, "run", "item", item);
             task();
@@ -47,12 +47,12 @@ class RecordedOperationQueue : public OperationQueue {
 
     void add(Task task) override {
         const std::uint64_t item = recording_.newNumber();
-        CallRecord(recording_, "OperationQueue.add", number_, item).announce();
+        const AnnouncedCall call(recording_, "OperationQueue.add", number_, item);
         inner_->add(recordedItem(recording_, item, std::move(task)));
     }
     void setMaximumConcurrentOperations(std::size_t count) override {
-        CallRecord(recording_, "OperationQueue.setMaximumConcurrentOperations", number_, count)
-            .announce();
+        const AnnouncedCall call(recording_, "OperationQueue.setMaximumConcurrentOperations",
+                                 number_, count);
         inner_->setMaximumConcurrentOperations(count);
     }
 
@@ -68,12 +68,12 @@ class RecordedWaitGroup : public WaitGroup {
         : inner_(std::move(inner)), number_(number), recording_(recording) {}
 
     void enter() override {
-        CallRecord(recording_, "WaitGroup.enter", number_).announce();
+        const AnnouncedCall call(recording_, "WaitGroup.enter", number_);
         inner_->enter();
     }
     // The last one to leave may not touch the group afterwards.
     void leave() override {
-        CallRecord(recording_, "WaitGroup.leave", number_).announce();
+        const AnnouncedCall call(recording_, "WaitGroup.leave", number_);
         inner_->leave();
     }
     void wait() override {
@@ -97,7 +97,7 @@ class RecordedSemaphore : public Semaphore {
         : inner_(std::move(inner)), number_(number), recording_(recording) {}
 
     void signal() override {
-        CallRecord(recording_, "Semaphore.signal", number_).announce();
+        const AnnouncedCall call(recording_, "Semaphore.signal", number_);
         inner_->signal();
     }
     bool wait() override {
@@ -120,7 +120,7 @@ class RecordedLock : public Lock {
         inner_->lock();
     }
     void unlock() override {
-        CallRecord(recording_, "Lock.unlock", number_).announce();
+        const AnnouncedCall call(recording_, "Lock.unlock", number_);
         inner_->unlock();
     }
 
@@ -164,7 +164,7 @@ std::unique_ptr<Lock> RecordedQueues::makeLock() {
 
 void RecordedQueues::runAfter(std::chrono::nanoseconds delay, Task task) {
     const std::uint64_t item = recording_.newNumber();
-    CallRecord(recording_, "WorkQueues.runAfter", 0, delay.count(), item).announce();
+    const AnnouncedCall call(recording_, "WorkQueues.runAfter", 0, delay.count(), item);
     inner_.runAfter(delay, recordedItem(recording_, item, std::move(task)));
 }
 

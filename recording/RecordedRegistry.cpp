@@ -1,5 +1,6 @@
 #include "recording/RecordedRegistry.h"
 
+#include <string_view>
 #include <utility>
 #include <vector>
 
@@ -51,51 +52,51 @@ class RecordedProgress : public InstallProgressRecord {
     [[nodiscard]] std::uint64_t number() const { return number_; }
 
     std::uint64_t installState() const override {
-        return CallRecord(recording_, "InstallProgressRecord.installState", number_)
-            .answer(inner_->installState());
+        return ask("InstallProgressRecord.installState", &InstallProgressRecord::installState);
     }
     void setInstallState(std::uint64_t state) override {
-        const CallRecord record(recording_, "InstallProgressRecord.setInstallState", number_,
-                                state);
-        inner_->setInstallState(state);
+        tell("InstallProgressRecord.setInstallState", &InstallProgressRecord::setInstallState,
+             state);
     }
     std::uint64_t installPhase() const override {
-        return CallRecord(recording_, "InstallProgressRecord.installPhase", number_)
-            .answer(inner_->installPhase());
+        return ask("InstallProgressRecord.installPhase", &InstallProgressRecord::installPhase);
     }
     void setInstallPhase(std::uint64_t phase) override {
-        const CallRecord record(recording_, "InstallProgressRecord.setInstallPhase", number_,
-                                phase);
-        inner_->setInstallPhase(phase);
+        tell("InstallProgressRecord.setInstallPhase", &InstallProgressRecord::setInstallPhase,
+             phase);
     }
     std::int64_t totalUnitCount() const override {
-        return CallRecord(recording_, "InstallProgressRecord.totalUnitCount", number_)
-            .answer(inner_->totalUnitCount());
+        return ask("InstallProgressRecord.totalUnitCount", &InstallProgressRecord::totalUnitCount);
     }
     void setTotalUnitCount(std::int64_t count) override {
-        const CallRecord record(recording_, "InstallProgressRecord.setTotalUnitCount", number_,
-                                count);
-        inner_->setTotalUnitCount(count);
+        tell("InstallProgressRecord.setTotalUnitCount", &InstallProgressRecord::setTotalUnitCount,
+             count);
     }
     std::int64_t completedUnitCount() const override {
-        return CallRecord(recording_, "InstallProgressRecord.completedUnitCount", number_)
-            .answer(inner_->completedUnitCount());
+        return ask("InstallProgressRecord.completedUnitCount",
+                   &InstallProgressRecord::completedUnitCount);
     }
     void setCompletedUnitCount(std::int64_t count) override {
-        const CallRecord record(recording_, "InstallProgressRecord.setCompletedUnitCount", number_,
-                                count);
-        inner_->setCompletedUnitCount(count);
+        tell("InstallProgressRecord.setCompletedUnitCount",
+             &InstallProgressRecord::setCompletedUnitCount, count);
     }
-    void cancel() override {
-        const CallRecord record(recording_, "InstallProgressRecord.cancel", number_);
-        inner_->cancel();
-    }
+    void cancel() override { tell("InstallProgressRecord.cancel", &InstallProgressRecord::cancel); }
     std::string description() const override {
-        return CallRecord(recording_, "InstallProgressRecord.description", number_)
-            .answer(inner_->description());
+        return ask("InstallProgressRecord.description", &InstallProgressRecord::description);
     }
 
   private:
+    template <typename Answer>
+    Answer ask(std::string_view call, Answer (InstallProgressRecord::*method)() const) const {
+        return CallRecord(recording_, call, number_).answer((inner_.get()->*method)());
+    }
+    template <typename... Arguments>
+    void tell(std::string_view call, void (InstallProgressRecord::*method)(Arguments...),
+              Arguments... arguments) const {
+        const CallRecord record(recording_, call, number_, arguments...);
+        (inner_.get()->*method)(arguments...);
+    }
+
     const std::shared_ptr<InstallProgressRecord> inner_;
     const std::uint64_t number_;
     Recording& recording_;
@@ -172,7 +173,7 @@ void RecordedRegistry::addObserver(std::weak_ptr<AppRegistryObserver> observer) 
         return std::make_shared<RecordedRegistryObserver>(observer, recording_.newNumber(),
                                                           recording_);
     });
-    CallRecord(recording_, "AppRegistry.addObserver", 0, standIn->number()).announce();
+    const AnnouncedCall call(recording_, "AppRegistry.addObserver", 0, standIn->number());
     inner_.addObserver(standIn);
 }
 

@@ -28,9 +28,8 @@ bool RecordedTransfers::canPrioritizeAssets() const {
 
 void RecordedTransfers::prioritizeAsset(const SyncAsset& asset, PrioritizeCompletion completion) {
     const std::uint64_t number = recording_.newNumber();
-    CallRecord(recording_, "TransferService.prioritizeAsset", 0, asset.identifier, asset.dataclass,
-               number)
-        .announce();
+    const AnnouncedCall call(recording_, "TransferService.prioritizeAsset", 0, asset.identifier,
+                             asset.dataclass, number);
     inner_->prioritizeAsset(
         asset, [recording = recording_.shared_from_this(), number,
                 completion = std::move(completion)](const ErrorRecord* error) mutable {
@@ -70,12 +69,8 @@ class RecordedLogHandle : public LogHandle {
 void RecordedLog::write(const LogMessage& message) noexcept {
     inner_.write(message);
     try {
-        RecordText arguments = recording_.newText();
-        arguments.addMessage(message.arguments, ownIdentifier_);
-        RecordText format = recording_.newText();
-        format.addPlain(message.format);
-        CallRecord(recording_, "LogFacility.write", 0, message.category, message.level, format,
-                   arguments)
+        CallRecord(recording_, "LogFacility.write", 0, message.category, message.level,
+                   PlainText{message.format}, MessageArguments{message.arguments, ownIdentifier_})
             .announce();
     } catch (...) {
         // Out of memory: the message is in the log, and the recording goes without it.
@@ -160,11 +155,12 @@ class RecordedAssertion : public TerminationAssertion {
     RecordedAssertion(const RecordedAssertion&) = delete;
     RecordedAssertion& operator=(const RecordedAssertion&) = delete;
     ~RecordedAssertion() override {
-        CallRecord(recording_, "TerminationAssertion.release", number_).announce();
+        const AnnouncedCall call(recording_, "TerminationAssertion.release", number_);
+        inner_.reset();
     }
 
   private:
-    const std::unique_ptr<TerminationAssertion> inner_;
+    std::unique_ptr<TerminationAssertion> inner_;
     const std::uint64_t number_;
     Recording& recording_;
 };
@@ -338,7 +334,7 @@ void RecordedNotifications::setState(int token, std::uint64_t state) {
 }
 
 void RecordedNotifications::post(std::string_view name) {
-    CallRecord(recording_, "NamedNotifications.post", 0, name).announce();
+    const AnnouncedCall call(recording_, "NamedNotifications.post", 0, name);
     inner_.post(name);
 }
 
@@ -370,7 +366,8 @@ void RecordedNotificationCenter::addObserver(std::weak_ptr<void> observer, std::
         const std::lock_guard guard(mutex_);
         standIns_.push_back(standIn);
     }
-    CallRecord(recording_, "NotificationCenter.addObserver", 0, name, standIn->number).announce();
+    const AnnouncedCall call(recording_, "NotificationCenter.addObserver", 0, name,
+                             standIn->number);
     inner_.addObserver(standIn, name, &RecordedNotificationCenter::hear, behavior);
 }
 

@@ -2,6 +2,7 @@
 
 #include <algorithm>
 #include <array>
+#include <charconv>
 
 #include "platform/SyncHost.h"
 
@@ -10,6 +11,13 @@ namespace {
 
 std::chrono::nanoseconds steadyTime() {
     return std::chrono::steady_clock::now().time_since_epoch();
+}
+
+void appendNumber(std::string& line, std::uint64_t number) {
+    constexpr std::size_t kLongest = 20;
+    std::array<char, kLongest> digits{};
+    line.append(digits.data(),
+                std::to_chars(digits.data(), digits.data() + digits.size(), number).ptr);
 }
 
 const void* threadOfMachine() {
@@ -75,13 +83,32 @@ void Recording::addContents(const RecordText& record, std::string& line) {
     if (!isFirst) line += ']';
 }
 
+std::size_t Recording::threadNumber() {
+    return threads_.try_emplace(options_.thread(), threads_.size() + 1).first->second;
+}
+
 void Recording::write(const RecordText& record) {
     const std::lock_guard guard(mutex_);
-    if (isOver_) return;
-    const std::size_t thread =
-        threads_.try_emplace(options_.thread(), threads_.size() + 1).first->second;
-    line_ = "{\"t\":" + std::to_string((options_.clock() - begin_).count()) +
-            ",\"w\":" + std::to_string(thread) + ",";
+    if (!isOver_) writeLine(threadNumber(), record);
+}
+
+void Recording::writeReturn() {
+    const std::lock_guard guard(mutex_);
+    const std::size_t thread = threadNumber();
+    if (isOver_ || lastThread_ == thread) return;
+    RecordText text = newText();
+    text.member("back");
+    text.add(true);
+    writeLine(thread, text);
+}
+
+void Recording::writeLine(std::size_t thread, const RecordText& record) {
+    lastThread_ = thread;
+    line_ = "{\"t\":";
+    appendNumber(line_, static_cast<std::uint64_t>((options_.clock() - begin_).count()));
+    line_ += ",\"w\":";
+    appendNumber(line_, thread);
+    line_ += ',';
     line_ += record.text();
     addContents(record, line_);
     for (const ContentSum sum : record.longContents()) remember(sum);

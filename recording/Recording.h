@@ -14,9 +14,9 @@
 #include <map>
 #include <memory>
 #include <mutex>
-#include <set>
 #include <string>
 #include <string_view>
+#include <unordered_set>
 #include <utility>
 
 #include "platform/Bytes.h"
@@ -39,7 +39,8 @@ inline constexpr std::size_t kAnsweredContentLimit = std::size_t{1024} * 1024;
 inline constexpr std::size_t kRememberedContents = 16;
 
 /// Takes the lines of a recording, whole and with their ends. What it has taken should outlast the
-/// process however that ends: one write for each line does. Called by one thread at a time.
+/// process however that ends: one write for each line does, or a file that is mapped into memory.
+/// Called by one thread at a time.
 class RecordingSink {
   public:
     virtual ~RecordingSink() = default;
@@ -73,11 +74,16 @@ class Recording : public std::enable_shared_from_this<Recording> {
     [[nodiscard]] RecordText newText();
     /// Writes a record with these members, and when and by whom.
     void write(const RecordText& record);
+    /// A call that this thread has written is over: writes that, where another thread has written
+    /// since.
+    void writeReturn();
     /// Writes that the session is over. What comes later is not written.
     void finish();
 
   private:
     [[nodiscard]] bool isKnown(ContentSum sum) const;
+    [[nodiscard]] std::size_t threadNumber();
+    void writeLine(std::size_t thread, const RecordText& record);
     void addContents(const RecordText& record, std::string& line);
     void remember(ContentSum sum);
 
@@ -90,13 +96,13 @@ class Recording : public std::enable_shared_from_this<Recording> {
     bool isOver_ = false;
     std::uint64_t numbers_ = 0;
     std::map<const void*, std::size_t> threads_;
-    std::set<ContentSum> kept_;
+    std::size_t lastThread_ = 0;  // the one that wrote last
+    std::unordered_set<ContentSum> kept_;
     std::deque<ContentSum> passed_;  // lately, by the plug-in
     std::string line_;
 };
 
-/// One call across platform/, written when it is answered or this goes. Of a call that others may
-/// answer to before it is over, `announce` is what is written.
+/// One call across platform/, written when it is answered, when it says so, or when this goes.
 class CallRecord {
   public:
     /// `object` is the number of what is called; 0 for a service.
@@ -105,7 +111,7 @@ class CallRecord {
                const Arguments&... arguments)
         : recording_(recording), text_(recording.newText()) {
         text_.member("call");
-        text_.addPlain(call);
+        text_.addName(call);
         if (object != 0) {
             text_.member("on");
             text_.add(object);
@@ -123,6 +129,7 @@ class CallRecord {
         if (!isWritten_) recording_.write(text_);
     }
 
+    /// Writes it without an answer.
     void announce() { write(); }
     /// Writes the answer, and gives it back.
     template <typename Answer>
@@ -154,6 +161,24 @@ class CallRecord {
     bool isWritten_ = false;
 };
 
+/// A call that lets others go on before it is over: written when this is made. What they have done
+/// when it is over comes before what the plug-in does next, so that is written then.
+class AnnouncedCall {
+  public:
+    template <typename... Arguments>
+    AnnouncedCall(Recording& recording, std::string_view call, std::uint64_t object,
+                  const Arguments&... arguments)
+        : recording_(recording) {
+        CallRecord(recording, call, object, arguments...).announce();
+    }
+    AnnouncedCall(const AnnouncedCall&) = delete;
+    AnnouncedCall& operator=(const AnnouncedCall&) = delete;
+    ~AnnouncedCall() { recording_.writeReturn(); }
+
+  private:
+    Recording& recording_;
+};
+
 /// A stretch of time in which one thread does what somebody asked for: a call of the host, a work
 /// item, a callback. Its end is written when it is answered or this goes.
 class SpanRecord {
@@ -165,7 +190,7 @@ class SpanRecord {
         : recording_(recording) {
         RecordText text = recording_.newText();
         text.member(kind);
-        text.addPlain(name);
+        text.addName(name);
         if (object != 0) {
             text.member("on");
             text.add(object);

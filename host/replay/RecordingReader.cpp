@@ -161,7 +161,8 @@ class Reading {
             ++kinds;
         }
         for (const auto& [name, kind] :
-             {std::pair("end", RecordKind::End), std::pair("finished", RecordKind::Finished)}) {
+             {std::pair("back", RecordKind::Back), std::pair("end", RecordKind::End),
+              std::pair("finished", RecordKind::Finished)}) {
             if (!value.contains(name)) continue;
             line.kind = kind;
             ++kinds;
@@ -221,6 +222,10 @@ class Reading {
                 join(line, open.back());
                 if (line.kind == RecordKind::Walk) break;
                 return noteItem(line);
+            case RecordKind::Back:
+                if (!isInside || !hasCalled(open.back())) return "it comes back from no call";
+                join(line, open.back());
+                return {};
             case RecordKind::End:
                 if (!isInside) return "it ends what has not begun";
                 join(line, open.back());
@@ -264,6 +269,12 @@ class Reading {
 
     [[nodiscard]] bool walks(std::size_t stretch) const {
         return session_.lines[session_.stretches[stretch].beginning].kind == RecordKind::Walk;
+    }
+
+    /// Whether a call was the last of the stretch.
+    [[nodiscard]] bool hasCalled(std::size_t stretch) const {
+        const std::vector<std::size_t>& lines = session_.stretches[stretch].lines;
+        return !lines.empty() && session_.lines[lines.back()].kind == RecordKind::Call;
     }
 
     RecordedSession session_;

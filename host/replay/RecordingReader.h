@@ -25,6 +25,7 @@ enum class RecordKind {
     Callback,  // a service begins to call the plug-in
     Walk,      // a call of the plug-in that is answered piece by piece begins
     Each,      // a piece of it
+    Back,      // the call that the same thread has made last is over, after what others did
     End,       // of the stretch that the same thread has begun last
     Finished,  // of the session
 };

@@ -74,6 +74,8 @@ std::string recordText(const RecordLine& line) {
             return call + ", piece by piece";
         case RecordKind::Each:
             return "piece: " + shown(line.arguments);
+        case RecordKind::Back:
+            return "back from it";
         case RecordKind::End:
             return "end" + answer;
         case RecordKind::Finished:

@@ -109,6 +109,20 @@ const RecordLine& ReplayRun::match(std::string_view name, std::uint64_t object,
     return expected;
 }
 
+/// A call that was over late is so again, when what others had done by then is done.
+void ReplayRun::comeBack() {
+    const Flow& here = flow();
+    if (here.empty()) return;
+    const Cursor& cursor = here.back();
+    const std::vector<std::size_t>& lines = session_.stretches[cursor.stretch].lines;
+    if (cursor.next == lines.size()) return;
+    const std::size_t index = lines[cursor.next];
+    if (session_.lines[index].kind != RecordKind::Back) return;
+    awaitTurn(index);
+    ++flow().back().next;
+    consume(index);
+}
+
 void ReplayRun::awaitTurn(std::size_t line) {
     waiting_[scheduler_.current()] = line;
     scheduler_.wait("line " + std::to_string(line + 2), [this, line] {
@@ -204,15 +218,18 @@ void ReplayRun::spawn(const std::string& name, std::size_t line, std::function<v
 
 void ReplayRun::listen(std::uint64_t number, Callback callback) {
     callbacks_[number] = std::move(callback);
+    comeBack();
 }
 
 void ReplayRun::complete(std::uint64_t number, Callback callback) {
     completions_[number] = std::move(callback);
+    comeBack();
 }
 
 void ReplayRun::queue(std::uint64_t item, Task task) {
     items_[item] = std::move(task);
     deliver();
+    comeBack();
 }
 
 bool ReplayRun::isOn(std::uint64_t item) {
@@ -228,6 +245,7 @@ void ReplayRun::runHere(std::uint64_t item, const Task& task) {
     beginStretch(run->second);
     task();
     endStretch(nullptr);
+    comeBack();
 }
 
 void ReplayRun::walk(std::string_view name, const RecordText& arguments,

@@ -55,10 +55,12 @@ class ReplayRun {
         text.begin('[');
         (text.add(arguments), ...);
         text.end(']');
-        return match(name, object, text, false);
+        const RecordLine& line = match(name, object, text, false);
+        comeBack();
+        return line;
     }
     /// The same of a call whose last argument is a number that the recorder gave: that of an item,
-    /// a callback or an observer.
+    /// a callback or an observer. It is over when that was handed to one of those below.
     template <typename... Arguments>
     const RecordLine& numberedCall(std::string_view name, std::uint64_t object,
                                    const Arguments&... arguments) {
@@ -120,6 +122,7 @@ class ReplayRun {
                             bool isNumbered);
     [[nodiscard]] Flow& flow() { return flows_[scheduler_.current()]; }
     [[nodiscard]] std::size_t nextLine(const std::string& came);
+    void comeBack();
     void beginStretch(std::size_t line);
     void awaitTurn(std::size_t line);
     void consume(std::size_t line);

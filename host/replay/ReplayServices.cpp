@@ -99,11 +99,9 @@ class ReplayLog : public LogFacility {
     // Only a lack of memory throws here, and ends the command.
     // NOLINTNEXTLINE(bugprone-exception-escape)
     void write(const LogMessage& message) noexcept override {
-        RecordText format = run_.newText();
-        format.addPlain(message.format);
-        RecordText arguments = run_.newText();
-        arguments.addMessage(message.arguments, run_.session().bundle);
-        run_.call("LogFacility.write", 0, message.category, message.level, format, arguments);
+        run_.call("LogFacility.write", 0, message.category, message.level,
+                  PlainText{message.format},
+                  MessageArguments{message.arguments, run_.session().bundle});
     }
     std::unique_ptr<LogHandle> makeHandle(std::string_view subsystem,
                                           std::string_view category) override {

@@ -28,7 +28,7 @@ std::optional<ContentSum> sumIn(const ParsedJson& json) {
 void ReplayValues::remember(const std::vector<NamedContents>& passed) {
     for (const NamedContents& each : passed) {
         if (each.bytes.size() <= kPassedContentLimit) continue;
-        passed_.push_back(each);
+        passed_.emplace_back(each.sum, Bytes(each.bytes.begin(), each.bytes.end()));
         if (passed_.size() > kRememberedContents) passed_.pop_front();
     }
 }
@@ -63,8 +63,8 @@ bool ReplayValues::read(const ParsedJson& json, std::string& value) const {
 /// Bytes of that size that nothing but this replay knows, where the recording has none.
 std::optional<Bytes> ReplayValues::contentsOf(ContentSum sum, std::uint64_t size) {
     if (const auto kept = contents_.find(sum); kept != contents_.end()) return kept->second;
-    for (const NamedContents& each : passed_) {
-        if (each.sum == sum) return each.bytes;
+    for (const auto& [passed, bytes] : passed_) {
+        if (passed == sum) return bytes;
     }
     if (size > kLargestStandIn) return std::nullopt;
     constexpr unsigned kByte = 8;

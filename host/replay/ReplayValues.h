@@ -99,7 +99,7 @@ class ReplayValues {
     [[nodiscard]] bool readMap(const nlohmann::json& json, PropertyList& value);
 
     const std::map<ContentSum, Bytes>& contents_;
-    std::deque<NamedContents> passed_;
+    std::deque<std::pair<ContentSum, Bytes>> passed_;
     std::map<ContentSum, ContentSum> aliases_;
 };
 

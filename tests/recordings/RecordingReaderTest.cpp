@@ -84,6 +84,7 @@ TEST(RecordingReader, RefusesLinesThatCannotStandThere) {
         {R"({"t":2,"w":2,"run":"item","on":3})", "it runs what was not queued"},
         {R"({"t":2,"w":2,"end":true})", "it ends what has not begun"},
         {R"({"t":2,"w":1,"each":"AppProxy"})", "it is a piece of nothing"},
+        {R"({"t":2,"w":1,"back":true})", "it comes back from no call"},
         {R"({"t":2,"w":2,"callback":"A.b"})", "does not say who is called"},
         {R"({"t":2,"w":1,"call":"OperationQueue.add","on":1})", "what it queues has no number"}};
     for (const auto& [line, why] : cases) {

@@ -67,6 +67,24 @@ TEST_F(RecordingFixture, KeepsLongContentsThatAreAnswered) {
     EXPECT_THAT(last(), HasSubstr("kept"));
 }
 
+TEST_F(RecordingFixture, TellsWhenACallCameBackAfterWhatAnotherThreadDid) {
+    const std::pair<int, int> threads;
+    const void* runs = &threads.first;
+    RecordingOptions options;
+    options.thread = [&runs] { return runs; };
+    const auto shared = make(std::move(options));
+    {
+        const AnnouncedCall call(*shared, "WaitGroup.leave", 1);
+        EXPECT_THAT(last(), HasSubstr("WaitGroup.leave"));
+        runs = &threads.second;
+        CallRecord(*shared, "A.b", 0).announce();
+        runs = &threads.first;
+    }
+    EXPECT_EQ(last(), R"({"t":0,"w":1,"back":true})");
+    { const AnnouncedCall call(*shared, "WaitGroup.leave", 1); }
+    EXPECT_THAT(last(), HasSubstr("WaitGroup.leave"));
+}
+
 TEST_F(RecordingFixture, WritesNothingAfterItsEnd) {
     recording->finish();
     const std::string before = sink.text;

@@ -59,6 +59,14 @@ TEST(Replay, RepeatsSessionsOfEveryKind) {
     }
 }
 
+// What the last one to leave a group does next was replayed too early, when it had come back after
+// what others did.
+TEST(Replay, HasACallComeBackAsLateAsItDid) {
+    for (const std::uint64_t seed : {130U, 570U, 590U, 804U}) {
+        EXPECT_EQ(whatDiverges(SeededRecording(seed).record()), "") << "seed " << seed;
+    }
+}
+
 TEST(Replay, GoesToTheEndOfARecordingThatIsCutOff) {
     for (std::uint64_t seed = 0; seed < 12; ++seed) {
         const std::string text = SeededRecording(seed).record();

@@ -39,8 +39,8 @@ bool isShown(const RecordLine& line, const ShowRecordingArguments& arguments) {
 }
 
 const char* recordKindName(RecordKind kind) {
-    static constexpr std::array<const char*, 8> kNames = {"call", "host", "run", "callback",
-                                                          "walk", "each", "end", "finished"};
+    static constexpr std::array<const char*, 9> kNames = {"call", "host", "run", "callback", "walk",
+                                                          "each", "back", "end", "finished"};
     return kNames.at(static_cast<std::size_t>(kind));
 }
 
