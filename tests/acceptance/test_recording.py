@@ -1,6 +1,7 @@
 """Sessions that are recorded, what a recording shows, and replays of it."""
 
 import json
+import shutil
 import signal
 import time
 
@@ -68,7 +69,12 @@ def test_a_session_that_fails_replays_from_the_file_alone(appsync, tmp_path, lib
     (library / "com.example.app02.zip").write_bytes(b"rubbish")
     appsync("run", device.path, "com.example.app01", expect=None)
     device.sync(library, "--record", tmp_path / "recording", expect=1)
-    replayed(appsync, tmp_path / "recording")
+    elsewhere = tmp_path / "elsewhere" / "recording"
+    elsewhere.parent.mkdir()
+    shutil.move(tmp_path / "recording", elsewhere)
+    shutil.rmtree(device.path)
+    shutil.rmtree(library)
+    replayed(appsync, elsewhere)
 
 
 def test_a_session_that_is_killed_replays_to_where_it_was(appsync, tmp_path, library, coordination):
