@@ -286,6 +286,16 @@ Result<std::vector<ApplicationRecord>> Device::homeScreenApplications() {
     return shown;
 }
 
+Result<std::vector<std::string>> Device::homeScreenOrder() { return state_->homeScreen.order(); }
+
+Bytes Device::homeScreenIcon(const ApplicationRecord& record) const {
+    return appsync::homeScreenIcon(record, state_->files->root());
+}
+
+Result<DeviceMoment> Device::moment() {
+    return deviceMoment(*state_->database, SessionLock::isHeld(state_->path));
+}
+
 Result<std::vector<HistoryRecord>> Device::history(std::size_t limit) {
     return state_->history.records(limit);
 }

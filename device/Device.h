@@ -148,6 +148,13 @@ class Device {
     [[nodiscard]] Result<std::vector<HomeScreenItem>> homeScreen();
     /// The same applications in the same order, without rendering their icons.
     [[nodiscard]] Result<std::vector<ApplicationRecord>> homeScreenApplications();
+    /// The identifiers of what stands there, or would if it were installed, in that order.
+    [[nodiscard]] Result<std::vector<std::string>> homeScreenOrder();
+    /// The icon of one application, as a PNG; empty where its bundle has none that can be read.
+    [[nodiscard]] Bytes homeScreenIcon(const ApplicationRecord& record) const;
+    /// The same as `applications`, `coordinators`, `session` and `status` of each, of one moment.
+    /// For whoever looks again and again: one pass through the database.
+    [[nodiscard]] Result<DeviceMoment> moment();
     /// The transaction log, oldest first; at most the last `limit` records.
     [[nodiscard]] Result<std::vector<HistoryRecord>> history(std::size_t limit = 100'000);
 

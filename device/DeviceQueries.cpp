@@ -3,6 +3,7 @@
 #include <algorithm>
 #include <functional>
 #include <unordered_map>
+#include <utility>
 
 #include "device/database/CoordinationTables.h"
 #include "device/database/Database.h"
@@ -132,20 +133,127 @@ Status findCoordination(Database& database, const std::string& identifier,
     return addLastFailure(database, *status.coordinator);
 }
 
-Bytes iconOf(const ApplicationRecord& record, const RootDirectory& root) {
-    const Result<RegularFile> file = root.openRegularFile(record.bundle + "/" + record.iconFile);
-    if (!file) return {};
-    Bytes bytes;
-    if (readWhole(file->descriptor.get(), file->size, kMaximumIconFileBytes, bytes) != 0) return {};
-    Result<Bytes> icon = renderIcon(bytes);
-    return icon ? std::move(*icon) : Bytes();
+Status findSession(Database& database, std::optional<std::int64_t>& process,
+                   std::optional<WallTime>& since) {
+    Query rows = database.query("SELECT process, started FROM session");
+    if (rows.next()) {
+        process = rows.integer(0);
+        since = wallTime(rows.integer(1));
+    }
+    return rows.status();
+}
+
+// A session is noted after it has the lock, and its note goes before the lock.
+SessionRecord sessionOf(std::optional<std::int64_t> process, std::optional<WallTime> since,
+                        bool isUnderWay) {
+    if (isUnderWay) return {true, process, since, false};
+    return {false, std::nullopt, std::nullopt, process.has_value()};
+}
+
+// What is read sees nothing that others commit meanwhile.
+Status atOneMoment(Database& database, const std::function<Status()>& reading) {
+    if (database.inTransaction()) return reading();
+    if (Status begun = database.execute("BEGIN"); !begun) return begun;
+    Status read = reading();
+    const Status ended = database.execute("COMMIT");
+    return read ? ended : read;
+}
+
+using StatusByIdentifier = std::map<std::string, ApplicationStatus>;
+
+// Calls `take` with each row whose first column is an identifier that is known.
+Status withRows(Database& database, const char* sql, StatusByIdentifier& known,
+                const std::function<void(ApplicationStatus&, const Query&)>& take) {
+    Query rows = database.query(sql);
+    while (rows.next()) {
+        const auto found = known.find(rows.text(0));
+        if (found != known.end()) take(found->second, rows);
+    }
+    return rows.status();
+}
+
+Status gatherRecords(Database& database, StatusByIdentifier& known) {
+    std::vector<ApplicationRecord> records;
+    Status read = appendRecords(database, BundleTable::Applications, records);
+    if (read) read = appendRecords(database, BundleTable::Placeholders, records);
+    if (read) read = addProgress(database, records);
+    if (read) read = addKept(database, records);
+    if (!read) return read;
+    for (ApplicationRecord& record : records) {
+        ApplicationStatus& status = known[record.identifier];
+        (record.isPlaceholder ? status.placeholder : status.installed) = std::move(record);
+    }
+    return {};
+}
+
+Status gatherCoordinators(Database& database, StatusByIdentifier& known) {
+    const auto coordinators = allCoordinators(database);
+    if (!coordinators) return coordinators.error();
+    for (const StoredCoordinator& each : *coordinators) {
+        CoordinatorRecord record = recordOf(each);
+        known[record.identifier].coordinator = std::move(record);
+    }
+    return {};
+}
+
+Status gatherMarks(Database& database, StatusByIdentifier& known) {
+    Status read =
+        withRows(database, "SELECT identifier FROM running", known,
+                 [](ApplicationStatus& status, const Query&) { status.isRunning = true; });
+    if (!read) return read;
+    return withRows(
+        database, "SELECT identifier FROM restore_data", known,
+        [](ApplicationStatus& status, const Query&) { status.awaitsRestoreData = true; });
+}
+
+// What is void without a session.
+Status gatherOfSession(Database& database, StatusByIdentifier& known) {
+    Status read = withRows(database, "SELECT identifier FROM assertions", known,
+                           [](ApplicationStatus& status, const Query&) { status.isHeld = true; });
+    if (!read) return read;
+    return withRows(
+        database, "SELECT identifier, time, next_try FROM denials", known,
+        [](ApplicationStatus& status, const Query& row) {
+            status.denial = TerminationDenial{wallTime(row.integer(1)), wallTime(row.integer(2))};
+        });
+}
+
+Status gatherEvents(Database& database, StatusByIdentifier& known) {
+    Status read =
+        withRows(database, "SELECT identifier, time, domain, code, description FROM failures",
+                 known, [](ApplicationStatus& status, const Query& row) {
+                     status.lastFailure = InstallFailure{
+                         wallTime(row.integer(1)),
+                         ErrorRecord::make(row.text(2), row.integer(3), row.text(4))};
+                     if (status.coordinator) status.coordinator->error = status.lastFailure->error;
+                 });
+    if (!read) return read;
+    return withRows(database, "SELECT identifier, time FROM uninstalled", known,
+                    [](ApplicationStatus& status, const Query& row) {
+                        status.uninstalled = wallTime(row.integer(1));
+                    });
+}
+
+Status gatherMoment(Database& database, bool isUnderWay, DeviceMoment& moment) {
+    std::optional<std::int64_t> process;
+    std::optional<WallTime> since;
+    Status read = findSession(database, process, since);
+    moment.session = sessionOf(process, since, isUnderWay);
+    StatusByIdentifier& known = moment.applications;
+    if (read) read = gatherRecords(database, known);
+    if (read) read = gatherCoordinators(database, known);
+    if (read) read = gatherMarks(database, known);
+    if (read && isUnderWay) read = gatherOfSession(database, known);
+    if (read) read = gatherEvents(database, known);
+    for (auto& [identifier, status] : known) status.sessionUnderWay = isUnderWay;
+    return read;
 }
 
 HomeScreenItem itemOf(const ApplicationRecord& record, const RootDirectory& root) {
     HomeScreenItem item;
     item.identifier = record.identifier;
     item.name = record.name.value_or(record.identifier);
-    item.icon = iconOf(record, root);
+    item.icon = homeScreenIcon(record, root);
     item.isPlaceholder = record.isPlaceholder;
     if (record.progress) item.progress = record.progress->fraction();
     return item;
@@ -252,17 +360,25 @@ Result<std::vector<std::string>> runningApplications(DeviceDatabase& database) {
     return identifiers;
 }
 
-// A session is noted after it has the lock, and its note goes before the lock.
 Result<SessionRecord> sessionRecord(DeviceDatabase& database, bool isUnderWay) {
     std::optional<std::int64_t> process;
+    std::optional<WallTime> since;
+    const Status status = database.read(
+        [&](Database& connection) { return findSession(connection, process, since); });
+    if (!status) return status.error();
+    return sessionOf(process, since, isUnderWay);
+}
+
+Result<DeviceMoment> deviceMoment(DeviceDatabase& database, bool isUnderWay) {
+    database.flush().ignore();
+    DeviceMoment moment;
     const Status status = database.read([&](Database& connection) {
-        Query rows = connection.query("SELECT process FROM session");
-        if (rows.next()) process = rows.integer(0);
-        return rows.status();
+        moment = {};
+        return atOneMoment(connection,
+                           [&] { return gatherMoment(connection, isUnderWay, moment); });
     });
     if (!status) return status.error();
-    if (isUnderWay) return SessionRecord{true, process, false};
-    return SessionRecord{false, std::nullopt, process.has_value()};
+    return moment;
 }
 
 std::vector<const ApplicationRecord*> homeScreenRecords(
@@ -275,6 +391,15 @@ std::vector<const ApplicationRecord*> homeScreenRecords(
         if (found != byIdentifier.end()) shown.push_back(found->second);
     }
     return shown;
+}
+
+Bytes homeScreenIcon(const ApplicationRecord& record, const RootDirectory& root) {
+    const Result<RegularFile> file = root.openRegularFile(record.bundle + "/" + record.iconFile);
+    if (!file) return {};
+    Bytes bytes;
+    if (readWhole(file->descriptor.get(), file->size, kMaximumIconFileBytes, bytes) != 0) return {};
+    Result<Bytes> icon = renderIcon(bytes);
+    return icon ? std::move(*icon) : Bytes();
 }
 
 std::vector<HomeScreenItem> homeScreenItems(std::span<const std::string> order,

@@ -41,6 +41,12 @@ class RootDirectory;
 /// What the database says of a session, beside whether one is under way.
 [[nodiscard]] Result<SessionRecord> sessionRecord(DeviceDatabase& database, bool isUnderWay);
 
+/// See Device::moment.
+[[nodiscard]] Result<DeviceMoment> deviceMoment(DeviceDatabase& database, bool isUnderWay);
+
+/// See Device::homeScreenIcon.
+[[nodiscard]] Bytes homeScreenIcon(const ApplicationRecord& record, const RootDirectory& root);
+
 /// What stands on the home screen: of `order` those that `records` hold. A placeholder stands
 /// before the application that it covers. The results point into `records`.
 [[nodiscard]] std::vector<const ApplicationRecord*> homeScreenRecords(

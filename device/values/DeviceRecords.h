@@ -10,6 +10,7 @@
 
 #include <chrono>
 #include <cstdint>
+#include <map>
 #include <optional>
 #include <string>
 #include <vector>
@@ -87,6 +88,8 @@ struct SessionRecord {
     bool isUnderWay = false;
     /// Its process, where that is known.
     std::optional<std::int64_t> process;
+    /// Since when, where that is known.
+    std::optional<WallTime> since;
     /// None does, and the last one did not come to its end.
     bool wasInterrupted = false;
 };
@@ -175,6 +178,13 @@ struct ApplicationStatus {
     bool awaitsRestoreData = false;
     /// When a person removed it from the device, if the host has not taken note of that yet.
     std::optional<WallTime> uninstalled;
+};
+
+/// What a device holds, all of it of one moment.
+struct DeviceMoment {
+    SessionRecord session;
+    /// By identifier: what is installed, or has a placeholder or a coordinator.
+    std::map<std::string, ApplicationStatus> applications;
 };
 
 }  // namespace appsync

@@ -146,6 +146,7 @@ class Commands {
         addDevice();
         addLook();
         addLog();
+        addServe();
         addCoordination();
         addBackup();
         addRestore();
@@ -714,6 +715,26 @@ class Commands {
             ->check(wholeNumberFrom(1, 1'000'000'000));
         added.add_flag("--follow", values->follows, "go on as lines come");
         added.add_flag("--json", values->asJson, "print the lines as they are kept");
+    }
+
+    void addServe() {
+        const auto values = std::make_shared<ServeArguments>();
+        values->version = APPSYNC_VERSION;
+        CLI::App& added = command<ServeArguments>(
+            app_, "serve", "Show a device, or a folder of them, live in a browser", values,
+            [this](const ServeArguments& parsed) { return runServe(parsed, console_); });
+        added.add_option("DEVICE", values->place, "the device's directory, or a folder of devices")
+            ->required()
+            ->type_name("DEVICE|FOLDER");
+        added
+            .add_option_function<std::string>(
+                "--port",
+                [values](const std::string& text) {
+                    values->port = static_cast<std::uint16_t>(*wholeNumber(text));
+                },
+                "the port of 127.0.0.1 to listen on; 0 takes one that is free (default 8017)")
+            ->type_name("N")
+            ->check(wholeNumberFrom(0, 65535));
     }
 
     void addCoordination() {

@@ -6,7 +6,9 @@
 
 #include <nlohmann/json.hpp>
 
+#include "device/Device.h"
 #include "host/console/JsonWriting.h"
+#include "host/console/Problem.h"
 #include "host/console/Text.h"
 #include "platform/InstallCoordinatorService.h"
 #include "platform/InstallProgressRecord.h"
@@ -118,7 +120,45 @@ std::string wrappedLines(const std::string& text, std::size_t width) {
     return result;
 }
 
+// Of a session that is over.
+std::vector<std::string> openInstalls(const DeviceMoment& moment, bool isCoordinated) {
+    std::vector<std::string> open;
+    for (const auto& [identifier, status] : moment.applications) {
+        const bool isOpen = isCoordinated
+                                ? status.coordinator && isOpenInstall(*status.coordinator)
+                                : status.placeholder && isOpenInstall(*status.placeholder);
+        if (isOpen) open.push_back(identifier);
+    }
+    return open;
+}
+
+void countAll(DeviceOverview& overview, const DeviceMoment& moment) {
+    for (const auto& [identifier, status] : moment.applications) {
+        if (status.installed) count(overview, *status.installed);
+        if (status.placeholder) count(overview, *status.placeholder);
+        if (status.isRunning) overview.running.push_back(identifier);
+    }
+}
+
 }  // namespace
+
+Result<DeviceOverview> overviewOf(Device& device, const DeviceMoment& moment) {
+    DeviceOverview overview;
+    const Result<DeviceSettings> settings = device.settings();
+    if (!settings) return unusable(settings.error());
+    overview.settings = *settings;
+    countAll(overview, moment);
+    overview.session = moment.session;
+    if (!moment.session.isUnderWay) {
+        overview.staged = stagedWorkOn(device);
+        overview.open = openInstalls(moment, settings->coordination);
+    }
+    const Result<std::uint64_t> free = device.freeSpace();
+    if (!free) return unusable(free.error());
+    overview.free = *free;
+    overview.reserve = device.spaceReserve();
+    return overview;
+}
 
 void count(DeviceOverview& overview, const ApplicationRecord& record) {
     if (record.kept) {
@@ -163,26 +203,28 @@ std::string overviewText(const DeviceOverview& overview, std::size_t width) {
     return wrappedLines(text, width);
 }
 
-std::string jsonText(const DeviceOverview& overview) {
+std::string jsonText(const DeviceOverview& overview) { return indented(jsonOf(overview)); }
+
+nlohmann::ordered_json jsonOf(const DeviceOverview& overview) {
     using Json = nlohmann::ordered_json;
     const DeviceSettings& settings = overview.settings;
     const std::optional<std::int64_t>& process = overview.session.process;
-    return indented({{"installation", settingText(settings.installation)},
-                     {"removal", settingText(settings.removal)},
-                     {"coordination", settingText(settings.coordination)},
-                     {"installed", overview.installed},
-                     {"offloaded", overview.offloaded},
-                     {"restored", overview.restored},
-                     {"arriving", overview.arriving},
-                     {"running", overview.running},
-                     {"session", sessionText(overview)},
-                     {"process", process ? Json(*process) : Json()},
-                     {"open", overview.open},
-                     {"staged", stagedText(overview.staged)},
-                     {"free", overview.free},
-                     {"reserve", overview.reserve},
-                     {"kept", overview.kept},
-                     {"keptBytes", overview.keptBytes}});
+    return {{"installation", settingText(settings.installation)},
+            {"removal", settingText(settings.removal)},
+            {"coordination", settingText(settings.coordination)},
+            {"installed", overview.installed},
+            {"offloaded", overview.offloaded},
+            {"restored", overview.restored},
+            {"arriving", overview.arriving},
+            {"running", overview.running},
+            {"session", sessionText(overview)},
+            {"process", process ? Json(*process) : Json()},
+            {"open", overview.open},
+            {"staged", stagedText(overview.staged)},
+            {"free", overview.free},
+            {"reserve", overview.reserve},
+            {"kept", overview.kept},
+            {"keptBytes", overview.keptBytes}};
 }
 
 }  // namespace appsync

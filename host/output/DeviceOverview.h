@@ -5,10 +5,15 @@
 #include <string>
 #include <vector>
 
+#include <nlohmann/json_fwd.hpp>
+
 #include "device/values/DeviceRecords.h"
 #include "host/plan/InterruptedStaging.h"
+#include "platform/Result.h"
 
 namespace appsync {
+
+class Device;
 
 /// A device at a glance.
 struct DeviceOverview {
@@ -31,6 +36,10 @@ struct DeviceOverview {
     std::uint64_t keptBytes = 0;
 };
 
+/// What there is to say of a device that was asked for its `moment`; the error has the exit status
+/// "unusable".
+[[nodiscard]] Result<DeviceOverview> overviewOf(Device& device, const DeviceMoment& moment);
+
 /// Counts an application or a placeholder.
 void count(DeviceOverview& overview, const ApplicationRecord& record);
 
@@ -43,5 +52,7 @@ void count(DeviceOverview& overview, const ApplicationRecord& record);
 [[nodiscard]] std::string overviewText(const DeviceOverview& overview, std::size_t width = 0);
 /// One JSON object, over several lines, without a line end.
 [[nodiscard]] std::string jsonText(const DeviceOverview& overview);
+/// The same for a text that holds more.
+[[nodiscard]] nlohmann::ordered_json jsonOf(const DeviceOverview& overview);
 
 }  // namespace appsync

@@ -28,48 +28,8 @@ Json jsonOf(const KeptVersion& kept) {
     return {{"version", orNull(kept.version)}, {"bytes", kept.bytes}};
 }
 
-Json jsonOf(const ApplicationRecord& record) {
-    return {{"identifier", record.identifier},
-            {"version", orNull(record.version)},
-            {"name", orNull(record.name)},
-            {"state", record.isPlaceholder ? "placeholder" : "installed"},
-            {"placeholder", record.isPlaceholder ? Json(placeholderKind(record)) : Json()},
-            {"type", record.type},
-            {"installType", record.installType},
-            {"container", record.container},
-            {"bytes", record.bytes},
-            {"kept", record.kept ? jsonOf(*record.kept) : Json()}};
-}
-
-Json jsonOf(const HistoryRecord& record) {
-    const bool isScenario = record.kind == HistoryRecord::Kind::Scenario;
-    Json object = {{"time", formatTime(record.time)}, {"kind", isScenario ? "scenario" : "step"}};
-    if (isScenario) {
-        object["scenario"] = record.scenario;
-    } else {
-        object["step"] = record.step;
-    }
-    object["party"] = isScenario ? Json() : Json(record.party);
-    object["phase"] = isScenario ? Json() : Json(record.phase);
-    object["success"] = record.success;
-    object["identifier"] = record.identifier;
-    object["description"] = record.description;
-    return object;
-}
-
 Json jsonOf(const PromiseRecord& record) {
     return {{"name", record.name}, {"complete", record.complete}, {"percent", record.percent}};
-}
-
-Json jsonOf(const CoordinatorRecord& record) {
-    Json promises = Json::array();
-    for (const PromiseRecord& promise : record.promises) promises.push_back(jsonOf(promise));
-    return {{"identifier", record.identifier},
-            {"kind", record.kind},
-            {"client", record.client},
-            {"promises", std::move(promises)},
-            {"placeholder", record.placeholderStands},
-            {"state", coordinatorState(record)}};
 }
 
 template <typename Record>
@@ -144,6 +104,62 @@ Json jsonOf(const PropertyList& value) {
 
 }  // namespace
 
+nlohmann::ordered_json jsonOf(const ApplicationRecord& record) {
+    return {{"identifier", record.identifier},
+            {"version", orNull(record.version)},
+            {"name", orNull(record.name)},
+            {"state", record.isPlaceholder ? "placeholder" : "installed"},
+            {"placeholder", record.isPlaceholder ? Json(placeholderKind(record)) : Json()},
+            {"type", record.type},
+            {"installType", record.installType},
+            {"container", record.container},
+            {"bytes", record.bytes},
+            {"kept", record.kept ? jsonOf(*record.kept) : Json()}};
+}
+
+nlohmann::ordered_json jsonOf(const HistoryRecord& record) {
+    const bool isScenario = record.kind == HistoryRecord::Kind::Scenario;
+    Json object = {{"time", formatTime(record.time)}, {"kind", isScenario ? "scenario" : "step"}};
+    if (isScenario) {
+        object["scenario"] = record.scenario;
+    } else {
+        object["step"] = record.step;
+    }
+    object["party"] = isScenario ? Json() : Json(record.party);
+    object["phase"] = isScenario ? Json() : Json(record.phase);
+    object["success"] = record.success;
+    object["identifier"] = record.identifier;
+    object["description"] = record.description;
+    return object;
+}
+
+nlohmann::ordered_json jsonOf(const CoordinatorRecord& record) {
+    Json promises = Json::array();
+    for (const PromiseRecord& promise : record.promises) promises.push_back(jsonOf(promise));
+    return {{"identifier", record.identifier},
+            {"kind", record.kind},
+            {"client", record.client},
+            {"promises", std::move(promises)},
+            {"placeholder", record.placeholderStands},
+            {"state", coordinatorState(record)}};
+}
+
+nlohmann::ordered_json jsonOf(const AwaitedThing& thing) {
+    return {{"what", thing.what},
+            {"who", thing.who},
+            {"nextTry", thing.nextTry ? Json(formatTime(*thing.nextTry)) : Json()},
+            {"promise", orNull(thing.promise)}};
+}
+
+nlohmann::ordered_json jsonOf(const WhyAnswer& answer) {
+    Json waitsFor;
+    if (answer.waitsFor) waitsFor = jsonOf(*answer.waitsFor);
+    return {{"identifier", answer.identifier},
+            {"state", answer.state},
+            {"waitsFor", std::move(waitsFor)},
+            {"lastError", orNull(answer.lastError)}};
+}
+
 std::string_view placeholderKind(const ApplicationRecord& record) {
     switch (record.installType) {
         case kInstallTypeDowngrade:
@@ -177,19 +193,7 @@ std::string jsonText(const Inventory& inventory) {
                      {"accounts", std::move(accounts)}});
 }
 
-std::string jsonText(const WhyAnswer& answer) {
-    Json waitsFor;
-    if (answer.waitsFor) {
-        waitsFor = {{"what", answer.waitsFor->what}, {"who", answer.waitsFor->who}};
-        waitsFor["nextTry"] =
-            answer.waitsFor->nextTry ? Json(formatTime(*answer.waitsFor->nextTry)) : Json();
-        waitsFor["promise"] = orNull(answer.waitsFor->promise);
-    }
-    return indented({{"identifier", answer.identifier},
-                     {"state", answer.state},
-                     {"waitsFor", std::move(waitsFor)},
-                     {"lastError", orNull(answer.lastError)}});
-}
+std::string jsonText(const WhyAnswer& answer) { return indented(jsonOf(answer)); }
 
 std::string jsonText(const PackageInfo& info) { return indented(jsonOf(info)); }
 

@@ -4,11 +4,14 @@
 #include <string_view>
 #include <vector>
 
+#include <nlohmann/json_fwd.hpp>
+
 #include "device/values/DeviceRecords.h"
 
 namespace appsync {
 
 class PropertyList;
+struct AwaitedThing;
 struct Inventory;
 struct PackageInfo;
 struct WhyAnswer;
@@ -24,6 +27,15 @@ struct WhyAnswer;
 [[nodiscard]] std::string jsonText(const PackageInfo& info);
 /// The same of a package that was written, and whether one was replaced.
 [[nodiscard]] std::string jsonText(const PackageInfo& info, bool hasReplaced);
+
+// The same of one record, for a text that holds more.
+
+[[nodiscard]] nlohmann::ordered_json jsonOf(const ApplicationRecord& record);
+[[nodiscard]] nlohmann::ordered_json jsonOf(const HistoryRecord& record);
+[[nodiscard]] nlohmann::ordered_json jsonOf(const CoordinatorRecord& record);
+[[nodiscard]] nlohmann::ordered_json jsonOf(const AwaitedThing& thing);
+[[nodiscard]] nlohmann::ordered_json jsonOf(const WhyAnswer& answer);
+
 /// What a placeholder stands for: "offloaded", "restored" by a backup, or "arriving" with a sync or
 /// from the store.
 [[nodiscard]] std::string_view placeholderKind(const ApplicationRecord& record);

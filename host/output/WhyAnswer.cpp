@@ -1,6 +1,8 @@
 #include "host/output/WhyAnswer.h"
 
+#include "device/Device.h"
 #include "device/values/DeviceRecords.h"
+#include "host/console/Problem.h"
 #include "host/console/Text.h"
 #include "host/output/FailureText.h"
 #include "host/plan/RestoredParts.h"
@@ -223,6 +225,22 @@ WhyAnswer explain(const std::string& identifier, const ApplicationStatus& status
         answer.lastError = failureText(identifier, *status.coordinator->error);
     }
     answer.sentence = stateSentence(status);
+    return answer;
+}
+
+Result<WhyAnswer> whyOf(Device& device, const std::string& identifier) {
+    const Result<ApplicationStatus> status = device.status(identifier);
+    if (!status) return unusable(status.error());
+    const Result<DeviceSettings> settings = device.settings();
+    if (!settings) return unusable(settings.error());
+    WhyAnswer answer = explain(identifier, *status, *settings,
+                               versionThatWaitsForData(device, identifier).has_value());
+    const bool isUnknown =
+        answer.state == "absent" && !answer.lastError && !answer.waitsFor && !status->uninstalled;
+    if (isUnknown) {
+        return failure("the device knows nothing of " + identifier,
+                       "appsync apps shows what there is");
+    }
     return answer;
 }
 

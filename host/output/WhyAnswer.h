@@ -4,8 +4,11 @@
 #include <optional>
 #include <string>
 
+#include "platform/Result.h"
+
 namespace appsync {
 
+class Device;
 struct ApplicationStatus;
 struct DeviceSettings;
 
@@ -38,6 +41,9 @@ struct WhyAnswer {
 /// `packageWaits`: the package of a restored application has come, and waits for its data.
 [[nodiscard]] WhyAnswer explain(const std::string& identifier, const ApplicationStatus& status,
                                 const DeviceSettings& settings, bool packageWaits = false);
+
+/// The answer of a device; an error where it knows nothing of the application.
+[[nodiscard]] Result<WhyAnswer> whyOf(Device& device, const std::string& identifier);
 
 /// The answer for people; ends with a line end.
 [[nodiscard]] std::string whyText(const WhyAnswer& answer);

@@ -11,9 +11,6 @@ namespace appsync {
 
 struct Console;
 
-/// Whether the text names the application, and not only one whose identifier holds that one.
-[[nodiscard]] bool namesApplication(std::string_view text, std::string_view identifier);
-
 /// Puts the lines of a log together from the pieces that are read, and shows those that are wanted.
 /// Arguments and console outlive it.
 class LogLines {

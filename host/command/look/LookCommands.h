@@ -4,6 +4,7 @@
 // LogCommand.cpp. Called by host/command only.
 
 #include <cstddef>
+#include <cstdint>
 #include <optional>
 #include <string>
 
@@ -29,6 +30,16 @@ struct HistoryArguments {
 
 [[nodiscard]] int runScreen(const std::string& device, const std::string& picture, bool asJson,
                             const Console& console);
+
+struct ServeArguments {
+    /// A device, or a folder of devices.
+    std::string place;
+    /// 0: one that is free.
+    std::uint16_t port = 8017;
+    /// The command's.
+    std::string version;
+};
+[[nodiscard]] int runServe(const ServeArguments& arguments, const Console& console);
 
 // DiffCommand.cpp
 

@@ -9,27 +9,6 @@
 namespace appsync {
 namespace {
 
-TEST(NamesApplication, WhereTheIdentifierStandsByItself) {
-    for (const char* text :
-         {"com.a", "com.a.", "me|com.a", "com.a is here", "(com.a)", "/x/com.a.zip",
-          "/x/com.a.app/Info.plist", "/x/com.a.zip.", "com.a.b and com.a", "com.a: x"}) {
-        EXPECT_TRUE(namesApplication(text, "com.a")) << text;
-    }
-}
-
-TEST(NamesApplication, NotWhereItIsAPartOfAnother) {
-    for (const char* text : {"", "com.a.b", "xcom.a", "org.com.a", "com.ab", "com.a-b", "com.a_b",
-                             "com.a.zipper", "com.a.application", "com.A"}) {
-        EXPECT_FALSE(namesApplication(text, "com.a")) << text;
-    }
-}
-
-TEST(NamesApplication, WhoseNameEndsLikeAFile) {
-    EXPECT_TRUE(namesApplication("x/com.app.zip.zip", "com.app.zip"));
-    EXPECT_TRUE(namesApplication("com.app is here", "com.app"));
-    EXPECT_FALSE(namesApplication("com.app.app2", "com.app"));
-}
-
 class LogLinesTest : public testing::Test {
   protected:
     static std::string line(const std::string& message) {
