@@ -82,7 +82,7 @@ export class ApplicationPanel {
         element("h2", { id: "application-name" }, name),
         element("p", { class: "identifier" }, this.identifier),
         element("p", { class: "application-state" }, application ? applicationState(application) : "not on the device")),
-      element("div", { class: "application-actions" }, log, close));
+      log, close);
   }
 
   historyPart() {

@@ -53,6 +53,7 @@ export class DeviceView {
       const answer = await ask(deviceUrl(model.name, since));
       if (model !== this.model) return;
       this.draw(model.take(answer));
+      if (since === "") performance.mark("drawn");
       this.tell("");
     } catch (error) {
       if (model === this.model) this.tell(error.message);

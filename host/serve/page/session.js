@@ -85,21 +85,20 @@ export class SessionView {
 
 function badge(model) {
   if (model.status?.session === "interrupted") return "interrupted";
-  return model.session ? "over" : "none yet";
+  return model.session || model.timeline ? "over" : "none yet";
 }
 
 function sessionText(model) {
   const session = model.session;
-  if (!session) return "No session has been held on this device yet.";
-  if (session.running) {
+  if (session?.running) {
     const steps = session.total ? `: ${session.done} of ${count(session.total, "application")}` : "";
     return `${phase(session.phase)}${steps}${session.began ? `, since ${clock(session.began)}` : ""}.`;
   }
-  const when = session.ended ?? session.began;
   if (model.status?.session === "interrupted") {
     return "The last session was interrupted; the same command, run again, brings the device in step.";
   }
-  return when ? `The last session ended at ${clock(when)}.` : "No session is under way.";
+  if (session?.ended) return `The last session ended at ${clock(session.ended)}.`;
+  return session || model.timeline ? "No session is under way." : "No session has been held here yet.";
 }
 
 function updateBar(session) {

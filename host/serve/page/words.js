@@ -15,18 +15,12 @@ export function size(bytes) {
 export function clock(time) {
   const date = new Date(time);
   if (Number.isNaN(date.getTime())) return "–";
-  const hours = date.toLocaleTimeString([], { hour12: false });
-  return isToday(date) ? hours : `${day(date)} ${hours}`;
+  const hours = [date.getHours(), date.getMinutes(), date.getSeconds()].map(two).join(":");
+  return day(date) === day(new Date()) ? hours : `${day(date)} ${hours}`;
 }
 
-function isToday(date) {
-  return day(date) === day(new Date());
-}
-
-function day(date) {
-  const two = (number) => String(number).padStart(2, "0");
-  return `${date.getFullYear()}-${two(date.getMonth() + 1)}-${two(date.getDate())}`;
-}
+const two = (number) => String(number).padStart(2, "0");
+const day = (date) => [date.getFullYear(), two(date.getMonth() + 1), two(date.getDate())].join("-");
 
 export function count(number, one, many = `${one}s`) {
   return number === 1 ? `1 ${one}` : `${number.toLocaleString("en")} ${many}`;
