@@ -36,14 +36,14 @@ def states_of(device):
 def test_a_sync_is_seen_without_a_reload(appsync, tmp_path, serve, page):
     device = Device(appsync, tmp_path / "phone", "on")
     page.open(serve(device.path))
-    page.wait_for_text("#session-badge", "none yet")
+    page.wait_for_text("#session-badge", "none under way")
     page.run("window.isTheSame = true")
     sync = appsync.start("sync", device.path, library_of(tmp_path, 12), "--json")
     page.wait("return document.querySelectorAll('#icons .app').length > 0")
     sync.communicate()
     page.wait_for_tiles(states_of(device))
     assert set(states_of(device).values()) == {"installed"}
-    page.wait_for_text("#session-badge", "over")
+    page.wait_for_text("#session-badge", "none under way")
     page.wait_for_text("#facts", "12")
     assert page.run("return window.isTheSame")
     page.wait("return document.querySelector('#icons img').naturalWidth > 0")
@@ -66,7 +66,7 @@ def test_a_waiting_install_says_for_whom_and_goes_on(appsync, tmp_path, serve, p
     sync.communicate()
     assert sync.returncode == 0
     page.wait("return document.querySelectorAll('#waits li').length === 0")
-    page.wait_for_text("#session-badge", "over")
+    page.wait_for_text("#session-badge", "none under way")
     page.wait("return document.querySelector('.versions .version').innerText === '2.0'")
     page.wait_for_text(".versions", "Kept for a rollback\t1.0")
     page.wait_for_tiles({name: "installed" for name in device.apps()})

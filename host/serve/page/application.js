@@ -3,7 +3,7 @@
 import { byId, element, show } from "./elements.js";
 import { iconOf } from "./icon.js";
 import { ask, Coalesced, deviceUrl } from "./live.js";
-import { applicationState, clock, installType, size, waitSentence } from "./words.js";
+import { applicationState, clock, installType, size } from "./words.js";
 
 const HISTORY_LENGTH = 50; // entries that are shown until all are asked for
 
@@ -106,14 +106,9 @@ export class ApplicationPanel {
 
 // What `why` says; the commands in it are set apart.
 function whyPart(why) {
-  const lines = why ? (why.text ?? whyText(why)).trim().split("\n") : ["…"];
+  const lines = why ? why.text.trim().split("\n") : ["…"];
   const paragraphs = lines.map((line) => element("p", {}, ...withCommands(line)));
   return element("div", { class: "part why", id: "why" }, element("h3", {}, "Why"), ...paragraphs);
-}
-
-function whyText(why) {
-  const waits = why.waitsFor ? `It ${waitSentence(why.waitsFor)}.` : "It waits for nothing.";
-  return `${waits}${why.lastError ? `\n${why.lastError}` : ""}`;
 }
 
 export function withCommands(line) {

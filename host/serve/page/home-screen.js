@@ -124,7 +124,7 @@ class Tile {
     setText(this.name, application.name);
     setAttribute(this.button, "title", application.identifier);
     setAttribute(this.button, "aria-label", `${application.name}, ${applicationState(application)}`);
-    setAttribute(this.button, "data-state", application.installed ? "installed" : "placeholder");
+    setAttribute(this.button, "data-state", application.placeholder ? "placeholder" : "installed");
     setAttribute(this.button, "data-placeholder", application.placeholderKind);
     setAttribute(this.button, "data-waiting", application.waitingFor ? "yes" : null);
     setAttribute(this.button, "data-running", application.running ? "yes" : null);

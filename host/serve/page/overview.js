@@ -61,7 +61,7 @@ function countsOf(device) {
 }
 
 function lastSession(session) {
-  if (!session) return "no session yet";
+  if (!session) return "";
   if (session.running) return session.began ? `session since ${clock(session.began)}` : "session under way";
   const when = session.ended ?? session.began;
   return when ? `last session ${clock(when)}` : "no session under way";

@@ -83,9 +83,10 @@ export class SessionView {
   }
 }
 
+const wasInterrupted = (model) => model.status?.session === "interrupted";
+
 function badge(model) {
-  if (model.status?.session === "interrupted") return "interrupted";
-  return model.session || model.timeline ? "over" : "none yet";
+  return wasInterrupted(model) ? "interrupted" : "none under way";
 }
 
 function sessionText(model) {
@@ -94,11 +95,10 @@ function sessionText(model) {
     const steps = session.total ? `: ${session.done} of ${count(session.total, "application")}` : "";
     return `${phase(session.phase)}${steps}${session.began ? `, since ${clock(session.began)}` : ""}.`;
   }
-  if (model.status?.session === "interrupted") {
+  if (wasInterrupted(model)) {
     return "The last session was interrupted; the same command, run again, brings the device in step.";
   }
-  if (session?.ended) return `The last session ended at ${clock(session.ended)}.`;
-  return session || model.timeline ? "No session is under way." : "No session has been held here yet.";
+  return model.timeline ? "The last session went like this:" : "No session has been held here yet.";
 }
 
 function updateBar(session) {

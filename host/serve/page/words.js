@@ -58,14 +58,11 @@ export const phase = (name) => PHASES[name] ?? "A session is under way";
 // What an application is at this moment, in a few words.
 export function applicationState(application) {
   const waits = application.waitingFor ? ", waiting" : "";
-  if (application.progress !== null) return `${percent(application.progress)} installed${waits}`;
+  if (application.progress !== null) {
+    return `${percent(application.progress)} ${application.installed ? "updated" : "installed"}${waits}`;
+  }
   if (application.installed) return `installed${application.running ? ", running" : ""}${waits}`;
   return `${application.placeholderKind ?? "placeholder"}${waits}`;
 }
 
-// "It waits for ...", as a sentence, with the time of the next try where there is one.
-export function waitSentence(waitingFor) {
-  const sentence = waitingFor.sentence ?? `for ${waitingFor.who} (${waitingFor.what})`;
-  const next = waitingFor.nextTry ? `; next try at ${clock(waitingFor.nextTry)}` : "";
-  return `waits ${sentence}${next}`;
-}
+export const waitSentence = (waitingFor) => `waits ${waitingFor.sentence}`;
