@@ -5,6 +5,7 @@ import { iconOf } from "./icon.js";
 import { ask, Coalesced, deviceUrl } from "./live.js";
 import { applicationState, clock, installType, size } from "./words.js";
 
+const ABSENT = { text: "The device has nothing of it." };
 const HISTORY_LENGTH = 50; // entries that are shown until all are asked for
 
 export class ApplicationPanel {
@@ -42,10 +43,11 @@ export class ApplicationPanel {
 
   async load() {
     const { model, identifier } = this;
-    if (!identifier) return;
+    if (!identifier || model.stamp === null) return;
     const id = encodeURIComponent(identifier);
+    const isThere = model.applications.has(identifier);
     const [why, history] = await Promise.all([
-      ask(deviceUrl(model.name, `/why/${id}`)).catch((error) => ({ text: error.message })),
+      isThere ? ask(deviceUrl(model.name, `/why/${id}`)).catch((error) => ({ text: error.message })) : ABSENT,
       ask(deviceUrl(model.name, `/history/${id}`)).catch(() => []),
     ]);
     if (this.identifier !== identifier || this.model !== model) return;

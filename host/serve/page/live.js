@@ -31,14 +31,18 @@ export class Live {
     this.source.addEventListener("error", () => this.tryAgain());
   }
 
-  tryAgain() {
+  // Also a server that is there may have no such events, or too many readers at this moment.
+  async tryAgain() {
     this.close();
-    this.onState("gone");
     this.timer = setTimeout(() => this.open(), RETRY_MS);
+    const { timer } = this;
+    const state = await ask("/api/devices").then(() => "connecting", () => "gone");
+    if (timer === this.timer && this.source?.readyState !== EventSource.OPEN) this.onState(state);
   }
 
   close() {
     clearTimeout(this.timer);
+    this.timer = null;
     this.source?.close();
     this.source = null;
   }

@@ -45,7 +45,7 @@ class Card {
     setAttribute(this.badge, "data-state", device.state);
     setAttribute(this.link, "data-state", device.state);
     setText(this.counts, device.state === "damaged" || device.state === "gone" ? device.message : countsOf(device));
-    const session = device.lastSession;
+    const session = device.session ?? device.lastSession;
     show(this.bar, Boolean(session?.running));
     setAttribute(this.bar, "max", session?.total || null);
     setAttribute(this.bar, "value", session?.total ? session.done ?? 0 : null);
