@@ -43,6 +43,11 @@ auto guarded(const std::string& path, const Action& action) -> Result<decltype(a
     }
 }
 
+std::string timeText(std::chrono::milliseconds time) {
+    return time < std::chrono::seconds(1) ? std::to_string(time.count()) + " ms"
+                                          : std::to_string(time.count() / 1000) + " s";
+}
+
 std::string lastLoadError() {
     const char* const text = ::dlerror();
     return text != nullptr ? text : "the system does not say why";
@@ -103,13 +108,18 @@ Result<const PlugInTable*> PlugInModule::tableOf(void* handle, const std::string
     return table;
 }
 
-Status PlugInModule::tryFile(const std::string& path) {
+Status PlugInModule::tryFile(const std::string& path, std::chrono::milliseconds limit) {
     const auto load = [&path]() -> std::string {
         const Result<PlugInModule> loaded = openHere(path);
         return loaded ? "" : loaded.error().description();
     };
-    const Result<TrialOutcome> trial = tryInAnotherProcess(load);
+    const Result<TrialOutcome> trial = tryInAnotherProcess(load, limit);
     if (!trial) return unusable(trial.error());
+    if (trial->isOverdue) {
+        return unusable(
+            displayPath(path) + " hangs: loading it had not ended after " + timeText(limit),
+            kNameABuild);
+    }
     if (!trial->answer) {
         return unusable(displayPath(path) + " ends the process that loads it, with " + trial->end,
                         kNameABuild);
@@ -118,11 +128,11 @@ Status PlugInModule::tryFile(const std::string& path) {
     return ErrorRecord::make(kCommandErrorDomain, kExitUnusable, *trial->answer);
 }
 
-Result<PlugInModule> PlugInModule::open(const std::string& path) {
+Result<PlugInModule> PlugInModule::open(const std::string& path, std::chrono::milliseconds limit) {
     if (path.empty()) return PlugInModule();
     const Status whole = checkModuleFile(path);
     if (!whole) return whole.error();
-    const Status tried = tryFile(path);
+    const Status tried = tryFile(path, limit);
     if (!tried) return tried.error();
     return openHere(path);
 }

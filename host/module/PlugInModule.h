@@ -5,6 +5,7 @@
 // first. Includes console, file, platform/ and system/. Called by session and by the commands that
 // hold one.
 
+#include <chrono>
 #include <memory>
 #include <string>
 #include <utility>
@@ -26,9 +27,11 @@ class PlugInModule {
     /// What cannot be used is refused as such: what has no right name, is no shared object, is of
     /// another machine or cut short, cannot be loaded, throws or ends the process meanwhile, has no
     /// table, or one of another major version. A copy of this process finds that out, so that
-    /// nothing of a module that is refused was ever in this one. What a module does while it is
-    /// loaded is its own otherwise: it does it twice, with this process's rights.
-    [[nodiscard]] static Result<PlugInModule> open(const std::string& path);
+    /// nothing of a module that is refused was ever in this one; so is one that hangs: the copy has
+    /// `limit` for all of it. What a module does while it is loaded is its own otherwise: it does
+    /// it twice, with this process's rights.
+    [[nodiscard]] static Result<PlugInModule> open(
+        const std::string& path, std::chrono::milliseconds limit = std::chrono::seconds(10));
 
     [[nodiscard]] const PlugInTable& table() const { return *table_; }
 
@@ -41,7 +44,7 @@ class PlugInModule {
     PlugInModule(Handle handle, const PlugInTable& table)
         : handle_(std::move(handle)), table_(&table) {}
 
-    [[nodiscard]] static Status tryFile(const std::string& path);
+    [[nodiscard]] static Status tryFile(const std::string& path, std::chrono::milliseconds limit);
     [[nodiscard]] static Result<PlugInModule> openHere(const std::string& path);
     [[nodiscard]] static Result<Handle> loadFile(const std::string& path);
     [[nodiscard]] static Result<const PlugInTable*> tableOf(void* handle, const std::string& path);

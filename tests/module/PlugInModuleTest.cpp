@@ -2,7 +2,9 @@
 
 #include <elf.h>
 #include <sys/stat.h>
+#include <sys/wait.h>
 
+#include <chrono>
 #include <filesystem>
 #include <fstream>
 #include <iterator>
@@ -244,6 +246,17 @@ INSTANTIATE_TEST_SUITE_P(
                     BadModule{"AbortsWhileUnloaded",
                               " ends the process that loads it, with signal 6"},
                     BadModule{"Missing", "No such file or directory"}));
+
+TEST(PlugInModule, ThatHangsWhileItIsLoadedIsGivenUp) {
+    const std::string path = testModule("HangsWhileLoaded");
+    const Result<PlugInModule> loaded = PlugInModule::open(path, std::chrono::milliseconds(50));
+    ASSERT_FALSE(loaded.ok());
+    EXPECT_EQ(exitStatusOf(loaded.error()), kExitUnusable);
+    EXPECT_THAT(loaded.error().description(),
+                HasSubstr(path + " hangs: loading it had not ended after 50 ms: name a build of "));
+    EXPECT_FALSE(isLoaded(path));
+    EXPECT_EQ(::waitpid(-1, nullptr, WNOHANG), -1) << "a process is left";
+}
 
 #if !defined(__has_feature)
 #define __has_feature(feature) 0
