@@ -9,6 +9,7 @@
 #include <stdlib.h>
 #include <string.h>
 #include <sys/prctl.h>
+#include <sys/syscall.h>
 #include <sys/wait.h>
 #include <unistd.h>
 
@@ -130,8 +131,11 @@ class IsolatedTest {
         ::close(ends[1]);
         pipe_ = ends[0];
         ::fcntl(pipe_, F_SETFL, O_NONBLOCK);
+        end_ = static_cast<int>(::syscall(SYS_pidfd_open, process_, 0));
+        if (end_ < 0) throw std::runtime_error("no view of a process");
     }
     ~IsolatedTest() {
+        ::close(end_);
         ::close(pipe_);
         std::error_code ignored;
         std::filesystem::remove_all(directory_, ignored);
@@ -139,17 +143,19 @@ class IsolatedTest {
     IsolatedTest(const IsolatedTest&) = delete;
     IsolatedTest& operator=(const IsolatedTest&) = delete;
 
-    [[nodiscard]] int pipe() const { return pipe_; }
+    /// Where it tells something, -1 when it tells no more; and where its end shows.
+    [[nodiscard]] int pipe() const { return tellsNoMore_ ? -1 : pipe_; }
+    [[nodiscard]] int end() const { return end_; }
     [[nodiscard]] Clock::time_point deadline() const { return deadline_; }
 
-    /// Takes what the process has told by now. False when it tells no more.
-    bool read() {
+    /// Takes what the process has told by now.
+    void read() {
         std::array<char, 4096> buffer{};
         ssize_t count = 0;
         while ((count = ::read(pipe_, buffer.data(), buffer.size())) > 0) {
             records_.append(buffer.data(), static_cast<std::size_t>(count));
         }
-        return count < 0;
+        tellsNoMore_ = count == 0;
     }
 
     /// Ends the process, if it has not ended yet.
@@ -159,7 +165,7 @@ class IsolatedTest {
         while (::waitpid(process_, &status, 0) < 0 && errno == EINTR) {
         }
         ::kill(-process_, SIGKILL);  // what it has started
-        static_cast<void>(read());
+        read();
         TestOutcome outcome;
         const std::size_t slash = name_.rfind('/');
         outcome.test = name_.substr(0, slash);
@@ -193,6 +199,8 @@ class IsolatedTest {
     const Clock::time_point deadline_ = Clock::now() + limit_;
     pid_t process_ = 0;
     int pipe_ = -1;
+    int end_ = -1;
+    bool tellsNoMore_ = false;
     std::string records_;
 };
 
@@ -227,26 +235,30 @@ class IsolatedTests {
         }
     }
 
-    /// Waits until one of them has told something or its time is over. False when none runs.
+    /// Waits until one of them has told something, has ended, or its time is over. False when none
+    /// runs.
     bool waitForOne() {
-        std::vector<pollfd> pipes;
-        pipes.reserve(running_.size());
+        std::vector<pollfd> awaited;
+        awaited.reserve(2 * running_.size());
         Clock::time_point first = Clock::time_point::max();
         for (const Slot& slot : running_) {
-            pipes.push_back({slot.test != nullptr ? slot.test->pipe() : -1, POLLIN, 0});
+            awaited.push_back({slot.test != nullptr ? slot.test->pipe() : -1, POLLIN, 0});
+            awaited.push_back({slot.test != nullptr ? slot.test->end() : -1, POLLIN, 0});
             if (slot.test != nullptr) first = std::min(first, slot.test->deadline());
         }
         if (first == Clock::time_point::max()) return false;
         const auto left = std::chrono::ceil<std::chrono::milliseconds>(first - Clock::now());
-        ::poll(pipes.data(), pipes.size(), std::max(0, static_cast<int>(left.count())));
-        for (std::size_t i = 0; i < running_.size(); ++i) look(running_[i], pipes[i].revents != 0);
+        ::poll(awaited.data(), awaited.size(), std::max(0, static_cast<int>(left.count())));
+        for (std::size_t i = 0; i < running_.size(); ++i)
+            look(running_[i], awaited[2 * i].revents != 0, awaited[2 * i + 1].revents != 0);
         return true;
     }
 
-    void look(Slot& slot, bool isReadable) {
+    void look(Slot& slot, bool isReadable, bool hasEnded) {
         if (slot.test == nullptr) return;
-        const bool isLate = Clock::now() >= slot.test->deadline();
-        if (!isLate && (!isReadable || slot.test->read())) return;
+        if (isReadable) slot.test->read();
+        const bool isLate = !hasEnded && Clock::now() >= slot.test->deadline();
+        if (!isLate && !hasEnded) return;
         outcomes_[slot.number] = slot.test->finish(isLate);
         slot.test.reset();
     }

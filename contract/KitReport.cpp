@@ -55,9 +55,38 @@ std::string textOfBroken(const ContractSentence& sentence,
     return text;
 }
 
+/// How many bytes the character has that the text begins with; 0 where it is none of UTF-8, such as
+/// a process prints that dies.
+std::size_t characterLength(std::string_view text) {
+    const auto first = static_cast<unsigned char>(text.front());
+    if (first < 0x80) return 1;
+    if (first < 0xc2 || first > 0xf4) return 0;
+    const std::size_t length = first < 0xe0 ? 2 : first < 0xf0 ? 3 : 4;
+    if (text.size() < length) return 0;
+    const auto second = static_cast<unsigned char>(text[1]);
+    const bool isTooLong = (first == 0xe0 && second < 0xa0) || (first == 0xf0 && second < 0x90);
+    const bool isBeyond = (first == 0xed && second > 0x9f) || (first == 0xf4 && second > 0x8f);
+    const std::string_view rest = text.substr(1, length - 1);
+    const bool goesOn = std::all_of(rest.begin(), rest.end(), [](char byte) {
+        return (static_cast<unsigned char>(byte) & 0xc0U) == 0x80U;
+    });
+    return goesOn && !isTooLong && !isBeyond ? length : 0;
+}
+
+/// The text, with a mark in the place of each byte that is no part of a character.
+std::string readable(std::string_view text) {
+    std::string characters;
+    while (!text.empty()) {
+        const std::size_t length = characterLength(text);
+        characters += length == 0 ? "\xef\xbf\xbd" : std::string(text.substr(0, length));
+        text.remove_prefix(std::max<std::size_t>(length, 1));
+    }
+    return characters;
+}
+
 std::string jsonString(std::string_view text) {
     std::string json = "\"";
-    for (const char character : text) {
+    for (const char character : readable(text)) {
         if (character == '"' || character == '\\') {
             json += '\\';
             json += character;

@@ -49,6 +49,12 @@ class RecordReader {
     std::string_view rest_;
 };
 
+/// The sentence that was to be looked at is not.
+void skip(const std::string& why, TestOutcome& outcome) {
+    outcome.skipped = why;
+    if (!outcome.lookedAt.empty()) outcome.lookedAt.pop_back();
+}
+
 }  // namespace
 
 std::string recordOfSentence(const ContractSentence& sentence) {
@@ -70,7 +76,7 @@ void readRecords(std::string_view records, TestOutcome& outcome) {
             if (!now.header.empty()) outcome.lookedAt.push_back(now);
         } else {
             if (!reader.field(text)) return;
-            if (kind == kSkip) outcome.skipped = text;
+            if (kind == kSkip) skip(text, outcome);
             if (kind == kFailure) outcome.broken.push_back({now, text});
         }
     }

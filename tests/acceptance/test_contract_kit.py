@@ -30,7 +30,9 @@ def test_a_service_that_ends_badly_fails_one_test_and_the_kit_goes_on(kit, tmp_p
     assert done.returncode == 1
     ports = {port["port"]: port for port in json.loads(report.read_text())["ports"]}
     assert {name: port["tests"] for name, port in ports.items()} == dict.fromkeys(ports, 3)
-    for name, what in (("Crashes", "ended by signal 6"), ("Hangs", "no end within 2000 ms"), ("Throws", "out of order")):
+    late = "no end within 2000 ms"
+    for name, what in (("Crashes", "ended by signal 6"), ("Hangs", late), ("HangsInSilence", late),
+                       ("Throws", "out of order")):
         assert list(broken(ports[name])) == [ASKED], name
         assert what in broken(ports[name])[ASKED][0], name
         assert len(ports[name]["kept"]) == 2

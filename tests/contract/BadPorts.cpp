@@ -1,5 +1,7 @@
 #include "tests/contract/BadPorts.h"
 
+#include <unistd.h>
+
 #include <chrono>
 #include <cstdlib>
 #include <functional>
@@ -60,6 +62,12 @@ std::vector<ContractPort> badPorts() {
     return {badPort("Crashes", []() -> bool { std::abort(); }),
             badPort("Hangs",
                     [] {
+                        std::this_thread::sleep_for(std::chrono::hours(1));
+                        return false;
+                    }),
+            badPort("HangsInSilence",
+                    [] {
+                        ::closefrom(STDIN_FILENO);  // what the kit hears it through, too
                         std::this_thread::sleep_for(std::chrono::hours(1));
                         return false;
                     }),

@@ -60,6 +60,15 @@ TEST(KitReportTest, ASentenceThatOneTestBreaksIsNotKept) {
     EXPECT_TRUE(report.broken.contains(kRenames));
 }
 
+TEST(KitReportTest, ASentenceThatATestPassesOverIsNotKept) {
+    const TestOutcome skipped = outcomeOf(recordOfSentence(kRenames) + recordOfSentence(kCopies) +
+                                          recordOfSkip("it cannot be had") + recordOfEnd());
+    EXPECT_THAT(reportOf({skipped}).kept, ElementsAre(kRenames));
+    const TestOutcome another = outcomeOf(recordOfSentence(kCopies) + recordOfEnd());
+    EXPECT_THAT(reportOf({skipped, another}).kept,
+                testing::UnorderedElementsAre(kRenames, kCopies));
+}
+
 TEST(KitReportTest, TheTextNamesHeaderSentenceAndWhatWasSeen) {
     const std::string text = textOf(reportOf(
         {outcomeOf(recordOfSentence(kRenames) + recordOfFailure("no\nfile") + recordOfEnd())}));
@@ -73,6 +82,18 @@ TEST(KitReportTest, JsonCarriesWhateverWasSeen) {
     const std::string json = jsonOf({reportOf(
         {outcomeOf(recordOfSentence(kRenames) + recordOfFailure("\"\\\n\x01") + recordOfEnd())})});
     EXPECT_THAT(json, HasSubstr(R"("what": "\"\\\u000a\u0001")"));
+}
+
+TEST(KitReportTest, JsonHasAMarkForBytesThatAreNoCharacters) {
+    const std::string kept = "h\u00e9\u20ac\U0001f600";
+    for (const std::string bad : {"\xff", "\xc0\x80", "\xe0\x80\x80", "\xed\xa0\x80",
+                                  "\xf4\x90\x80\x80", "\xe2\x82", "\x80"}) {
+        std::string marks;
+        for (std::size_t i = 0; i < bad.size(); ++i) marks += "\ufffd";
+        const std::string json = jsonOf({reportOf({outcomeOf(
+            recordOfSentence(kRenames) + recordOfFailure(kept + bad) + recordOfEnd())})});
+        EXPECT_THAT(json, HasSubstr("\"what\": \"" + kept + marks + "\""));
+    }
 }
 
 TEST(KitReportTest, EveryAbsenceHasANameAndAMeaning) {
