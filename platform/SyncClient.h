@@ -30,7 +30,8 @@ using SyncProgressCallback = std::function<void(double)>;
 ///
 /// `supportedDataclasses`, `currentSyncAnchor`, `disabledAssetTypes`, `clearSyncData` and
 /// `prepareForBackup` may be called outside a session. A call blocks while it works. Nothing
-/// throws; failures are told by a false or absent result, and by the error where there is one.
+/// throws; failures are told by a false or absent result, and by the error where there is one. No
+/// asset is null, neither one that is handed out nor one that is handed in.
 class SyncClient {
   public:
     virtual ~SyncClient() = default;

@@ -126,6 +126,20 @@ class CoordinationContract : public DeviceContract {
         observer_->waitForOne();
         return coordinator;
     }
+    /// Gives a restore of A everything but the package, which the store promises: the store's
+    /// handle on it.
+    std::shared_ptr<InstallCoordinator> restoredByTheStore(InstallCoordinator& coordinator) {
+        const auto data = dataPromise(kA);
+        data->setComplete();
+        EXPECT_TRUE(coordinator.setUserDataPromise(data));
+        EXPECT_TRUE(coordinator.setPlaceholderPromise(placeholder(kA)));
+        EXPECT_TRUE(coordinator.setAppAssetPromiseResponsibleClient(AppStoreClientID));
+        observer_->waitForOne();
+        auto theirs = service_.existingCoordinator(kA, AppStoreClientID);
+        if (theirs == nullptr) return nullptr;
+        EXPECT_TRUE(theirs->setAppAssetPromise(assetPromise(kA)));
+        return theirs;
+    }
     /// Keeps the promise of the package.
     static void keepAsset(const InstallCoordinator& coordinator, const std::string& path) {
         const auto promise = coordinator.appAssetPromise();
@@ -236,11 +250,12 @@ TEST_P(CoordinationContract, IllegalIdentifiersAreRefused) {
 }
 
 TEST_P(CoordinationContract, PiecesAreThereOnceTheyAreSet) {
-    checks("platform/InstallCoordinator.h", "a set of pieces, each of which may be there or not.");
+    checks("platform/InstallCoordinator.h", "Null when there is none.");
     const auto coordinator = create(Kind::Initiating, kA);
+    EXPECT_EQ(coordinator->appAssetPromise(), nullptr);
+    checks("platform/InstallCoordinator.h", "a set of pieces, each of which may be there or not.");
     EXPECT_FALSE(coordinator->hasInstallOptions());
     EXPECT_FALSE(coordinator->hasInitialODRAssetPromises());
-    EXPECT_EQ(coordinator->appAssetPromise(), nullptr);
     EXPECT_FALSE(coordinator->appAssetPromiseResponsibleClient());
     EXPECT_FALSE(coordinator->hasUserDataPromise());
     EXPECT_FALSE(coordinator->hasPlaceholderPromise());
@@ -467,14 +482,8 @@ TEST_P(CoordinationContract, AFailedInstallOfARestoredApplicationKeepsItsPlaceho
            "of an application that is being restored the placeholder stays, and a coordinator that "
            "waits for another package.");
     const auto coordinator = create(Kind::Restoring, kA);
-    const auto data = dataPromise(kA);
-    data->setComplete();
-    ASSERT_TRUE(coordinator->setUserDataPromise(data));
-    ASSERT_TRUE(coordinator->setPlaceholderPromise(placeholder(kA)));
-    ASSERT_TRUE(coordinator->setAppAssetPromiseResponsibleClient(AppStoreClientID));
-    observer_->waitForOne();
-    const auto theirs = service_.existingCoordinator(kA, AppStoreClientID);
-    ASSERT_TRUE(theirs->setAppAssetPromise(assetPromise(kA)));
+    const auto theirs = restoredByTheStore(*coordinator);
+    ASSERT_NE(theirs, nullptr);
     keepAsset(*theirs, "/var/mobile/missing.zip");
     observer_->waitForOne();
     EXPECT_THAT(observer_->heard(),
@@ -505,14 +514,8 @@ TEST_P(CoordinationContract, ARestoredApplicationIsInstalledFromTheStoresPromise
     checks("platform/InstallCoordinator.h",
            "Whose task the package is where nobody has promised it;");
     const auto coordinator = create(Kind::Restoring, kA);
-    const auto data = dataPromise(kA);
-    data->setComplete();
-    ASSERT_TRUE(coordinator->setUserDataPromise(data));
-    ASSERT_TRUE(coordinator->setPlaceholderPromise(placeholder(kA)));
-    ASSERT_TRUE(coordinator->setAppAssetPromiseResponsibleClient(AppStoreClientID));
-    observer_->waitForOne();
-    const auto theirs = service_.existingCoordinator(kA, AppStoreClientID);
-    ASSERT_TRUE(theirs->setAppAssetPromise(assetPromise(kA)));
+    const auto theirs = restoredByTheStore(*coordinator);
+    ASSERT_NE(theirs, nullptr);
     keepAsset(*theirs, device_->addPackage({kA}));
     observer_->waitForOne();
     EXPECT_THAT(observer_->heard(),

@@ -16,7 +16,14 @@ using testing::IsEmpty;
 constexpr const char* kA = "com.example.a";
 constexpr const char* kB = "com.example.b";
 
-class InstallProgressContract : public DeviceContract {};
+class InstallProgressContract : public DeviceContract {
+  protected:
+    /// Of an install that has just begun.
+    [[nodiscard]] std::shared_ptr<InstallProgressRecord> progressOfAPlaceholder() {
+        EXPECT_TRUE(installPlaceholder({kA}, kInstallTypeSync));
+        return progress(kA);
+    }
+};
 
 APPSYNC_CONTRACT_SUITE(InstallProgressContract, devicePorts());
 
@@ -32,8 +39,7 @@ TEST_P(InstallProgressContract, AnInstallBeginsByLoading) {
     checks("platform/AppRegistry.h",
            "An install begins waiting (0) or active (1), in the phase loading (0), with nothing "
            "completed;");
-    ASSERT_TRUE(installPlaceholder({kA}, kInstallTypeSync));
-    const auto record = progress(kA);
+    const auto record = progressOfAPlaceholder();
     ASSERT_NE(record, nullptr);
     EXPECT_LT(record->installState(), std::uint64_t{kInstallStatePaused});
     EXPECT_EQ(record->installPhase(), std::uint64_t{kInstallPhaseLoading});
@@ -43,8 +49,7 @@ TEST_P(InstallProgressContract, AnInstallBeginsByLoading) {
 TEST_P(InstallProgressContract, AChangeIsSeenByEverybodyAtOnce) {
     checks("platform/InstallProgressRecord.h",
            "Every call takes effect at once for everybody who looks.");
-    ASSERT_TRUE(installPlaceholder({kA}, kInstallTypeSync));
-    const auto one = progress(kA);
+    const auto one = progressOfAPlaceholder();
     const auto other = progress(kA);
     ASSERT_NE(one, nullptr);
     one->setInstallState(kInstallStateActive);
@@ -60,8 +65,7 @@ TEST_P(InstallProgressContract, AChangeIsSeenByEverybodyAtOnce) {
 TEST_P(InstallProgressContract, FinishingTheLoadingPhaseBeginsTheInstalling) {
     checks("platform/AppRegistry.h",
            "Ends the install phase that the record is in: loading is over, installing begins.");
-    ASSERT_TRUE(installPlaceholder({kA}, kInstallTypeSync));
-    const auto record = progress(kA);
+    const auto record = progressOfAPlaceholder();
     ASSERT_NE(record, nullptr);
     registry_.finishInstallPhase(*record);
     EXPECT_EQ(record->installPhase(), std::uint64_t{kInstallPhaseInstalling});
@@ -70,8 +74,7 @@ TEST_P(InstallProgressContract, FinishingTheLoadingPhaseBeginsTheInstalling) {
 TEST_P(InstallProgressContract, CancellingSaysSo) {
     checks("platform/InstallProgressRecord.h",
            "Cancels the install: its state becomes canceled (3).");
-    ASSERT_TRUE(installPlaceholder({kA}, kInstallTypeSync));
-    const auto record = progress(kA);
+    const auto record = progressOfAPlaceholder();
     ASSERT_NE(record, nullptr);
     record->cancel();
     EXPECT_EQ(record->installState(), std::uint64_t{kInstallStateCanceled});
@@ -89,8 +92,7 @@ TEST_P(InstallProgressContract, ARecordHasADescription) {
 TEST_P(InstallProgressContract, ARecordWhoseInstallIsOverChangesNothingAnyMore) {
     checks("platform/InstallProgressRecord.h",
            "from then on the record keeps its values and changes nothing any more.");
-    ASSERT_TRUE(installPlaceholder({kA}, kInstallTypeSync));
-    const auto record = progress(kA);
+    const auto record = progressOfAPlaceholder();
     ASSERT_NE(record, nullptr);
     record->setCompletedUnitCount(456);
     ASSERT_TRUE(registry_.uninstallApplication(kA, {}));
@@ -141,8 +143,7 @@ TEST_P(InstallProgressContract, NoInstallIsUnderWayForADemotedApplication) {
 TEST_P(InstallProgressContract, InstallingThePackageEndsTheInstall) {
     checks("platform/InstallProgressRecord.h",
            "When the install ends, the state becomes finished (5), failed (4) or canceled (3);");
-    ASSERT_TRUE(installPlaceholder({kA}, kInstallTypeSync));
-    const auto record = progress(kA);
+    const auto record = progressOfAPlaceholder();
     ASSERT_NE(record, nullptr);
     ASSERT_TRUE(installPackage({kA}));
     EXPECT_EQ(progress(kA), nullptr);

@@ -147,39 +147,24 @@ struct NoConnection : ForwardingHomeScreen {
     std::shared_ptr<HomeScreenConnection> blockableConnection() override { return nullptr; }
 };
 
-struct RunningApplicationsAreGranted : ForwardingHomeScreen {
+/// Answers `Told` where the outcome is `Outcome`.
+template <TerminationAssertionResult::Outcome Outcome, TerminationAssertionResult::Outcome Told>
+struct OutcomeIsToldAs : ForwardingHomeScreen {
     using ForwardingHomeScreen::ForwardingHomeScreen;
     TerminationAssertionResult takeTerminationAssertion(const std::string& identifier,
                                                         std::uint64_t reason) override {
         auto result = target().takeTerminationAssertion(identifier, reason);
-        if (result.outcome == TerminationAssertionResult::kDenied) {
-            result.outcome = TerminationAssertionResult::kGranted;
-        }
+        if (result.outcome == Outcome) result.outcome = Told;
         return result;
     }
 };
-struct UnknownApplicationsAreGranted : ForwardingHomeScreen {
-    using ForwardingHomeScreen::ForwardingHomeScreen;
-    TerminationAssertionResult takeTerminationAssertion(const std::string& identifier,
-                                                        std::uint64_t reason) override {
-        auto result = target().takeTerminationAssertion(identifier, reason);
-        if (result.outcome == TerminationAssertionResult::kNoSuchApplication) {
-            result.outcome = TerminationAssertionResult::kGranted;
-        }
-        return result;
-    }
-};
-struct EverythingIsDenied : ForwardingHomeScreen {
-    using ForwardingHomeScreen::ForwardingHomeScreen;
-    TerminationAssertionResult takeTerminationAssertion(const std::string& identifier,
-                                                        std::uint64_t reason) override {
-        auto result = target().takeTerminationAssertion(identifier, reason);
-        if (result.outcome == TerminationAssertionResult::kGranted) {
-            result.outcome = TerminationAssertionResult::kDenied;
-        }
-        return result;
-    }
-};
+using RunningApplicationsAreGranted =
+    OutcomeIsToldAs<TerminationAssertionResult::kDenied, TerminationAssertionResult::kGranted>;
+using UnknownApplicationsAreGranted =
+    OutcomeIsToldAs<TerminationAssertionResult::kNoSuchApplication,
+                    TerminationAssertionResult::kGranted>;
+using EverythingIsDenied =
+    OutcomeIsToldAs<TerminationAssertionResult::kGranted, TerminationAssertionResult::kDenied>;
 struct AssertionsDoNotHold : ForwardingHomeScreen {
     using ForwardingHomeScreen::ForwardingHomeScreen;
     struct Nothing : TerminationAssertion {};

@@ -185,18 +185,12 @@ struct ObserversAreOwned : Between {
     const std::shared_ptr<AppRegistryObserver> owned;
 };
 
-/// A report under the lock that every call takes.
+/// Reports come under a lock.
 class ReportsUnderALock : public ForwardingAppRegistry {
   public:
     ReportsUnderALock(AppRegistry& target, const Platform& platform)
         : ForwardingAppRegistry(target), lock_(platform.queues.makeLock()) {}
 
-    std::optional<AppProxy> proxyForIdentifier(const std::string& identifier,
-                                               Placeholders placeholders) override {
-        const std::lock_guard<Lock> held(*lock_);
-        return target().proxyForIdentifier(identifier, placeholders);
-    }
-
   protected:
     struct Locking : ForwardingRegistryObserver {
         Locking(WeakObserver target, Lock& lock)
@@ -211,39 +205,31 @@ class ReportsUnderALock : public ForwardingAppRegistry {
     Observer observerFor(WeakObserver observer) override {
         return std::make_shared<Locking>(std::move(observer), *lock_);
     }
+    [[nodiscard]] Lock& lock() { return *lock_; }
 
   private:
     const std::unique_ptr<Lock> lock_;
 };
 
-/// `removeObserver` waits for the report that is under way, also from within it.
-class RemovingWaitsForTheReport : public ForwardingAppRegistry {
+/// Every look-up takes the lock, too.
+class ReportsUnderTheLockOfLookUps : public ReportsUnderALock {
   public:
-    RemovingWaitsForTheReport(AppRegistry& target, const Platform& platform)
-        : ForwardingAppRegistry(target), lock_(platform.queues.makeLock()) {}
+    using ReportsUnderALock::ReportsUnderALock;
+    std::optional<AppProxy> proxyForIdentifier(const std::string& identifier,
+                                               Placeholders placeholders) override {
+        const std::lock_guard<Lock> held(lock());
+        return target().proxyForIdentifier(identifier, placeholders);
+    }
+};
 
+/// `removeObserver` waits for the report that is under way, also from within it.
+class RemovingWaitsForTheReport : public ReportsUnderALock {
+  public:
+    using ReportsUnderALock::ReportsUnderALock;
     void removeObserver(const AppRegistryObserver* observer) override {
-        const std::lock_guard<Lock> held(*lock_);
+        const std::lock_guard<Lock> held(lock());
         ForwardingAppRegistry::removeObserver(observer);
     }
-
-  protected:
-    struct Locking : ForwardingRegistryObserver {
-        Locking(WeakObserver target, Lock& lock)
-            : ForwardingRegistryObserver(std::move(target)), lock_(lock) {}
-        void applicationInstallsArePrioritized(const Proxies& prioritized,
-                                               const Proxies& paused) override {
-            const std::lock_guard<Lock> held(lock_);
-            ForwardingRegistryObserver::applicationInstallsArePrioritized(prioritized, paused);
-        }
-        Lock& lock_;
-    };
-    Observer observerFor(WeakObserver observer) override {
-        return std::make_shared<Locking>(std::move(observer), *lock_);
-    }
-
-  private:
-    const std::unique_ptr<Lock> lock_;
 };
 
 struct RemovedRegistryObserversHear : ForwardingAppRegistry {
@@ -343,7 +329,7 @@ std::vector<Violator> registryObserverViolators() {
     const std::string lock =
         "It may call the registry and remove itself meanwhile, so a registry holds no lock when it "
         "calls.";
-    v.device<ReportsUnderALock>("ReportsUnderALock", lock);
+    v.device<ReportsUnderTheLockOfLookUps>("ReportsUnderALock", lock);
     v.device<RemovingWaitsForTheReport>("RemovingWaitsForTheReport", lock);
     v.device<WithObserver<ObserversAreOwned>>(
         "ObserversAreOwned",

@@ -378,16 +378,35 @@ struct PlaceholderBundlesAreNotCopied : ForwardingAppRegistry {
     }
     std::map<std::string, std::string> paths;
 };
-struct SecondPlaceholdersAreRefused : ForwardingAppRegistry {
+/// Refuses some placeholders.
+struct RefusesPlaceholders : ForwardingAppRegistry {
     using ForwardingAppRegistry::ForwardingAppRegistry;
     Status installPlaceholderBundle(const FileURL& directory,
                                     const PropertyList& options) override {
+        if (refuses(options)) return ErrorRecord::make(kRegistryErrorDomain, 1, "not this one");
+        return target().installPlaceholderBundle(directory, options);
+    }
+    virtual bool refuses(const PropertyList& options) = 0;
+};
+struct SecondPlaceholdersAreRefused : RefusesPlaceholders {
+    using RefusesPlaceholders::RefusesPlaceholders;
+    bool refuses(const PropertyList& options) override {
         const auto found =
             target().proxyForIdentifier(identifierOf(options), Placeholders::Included);
-        if (found && found->state.placeholder) {
-            return ErrorRecord::make(kRegistryErrorDomain, 1, "one stands already");
-        }
-        return target().installPlaceholderBundle(directory, options);
+        return found && found->state.placeholder;
+    }
+};
+struct StoreMetadataIsRefused : RefusesPlaceholders {
+    using RefusesPlaceholders::RefusesPlaceholders;
+    bool refuses(const PropertyList& options) override {
+        return options.find(StoreMetadataKey) != nullptr;
+    }
+};
+struct NullSinfIsRefused : RefusesPlaceholders {
+    using RefusesPlaceholders::RefusesPlaceholders;
+    bool refuses(const PropertyList& options) override {
+        const PropertyList* sinf = options.find(AppSinfKey);
+        return sinf != nullptr && sinf->isNull();
     }
 };
 struct PlaceholdersReplaceApplications : ForwardingAppRegistry {
@@ -397,27 +416,6 @@ struct PlaceholdersReplaceApplications : ForwardingAppRegistry {
         const std::string identifier = identifierOf(options);
         if (target().proxyForIdentifier(identifier, Placeholders::Excluded)) {
             target().uninstallApplication(identifier, {}).ignore();
-        }
-        return target().installPlaceholderBundle(directory, options);
-    }
-};
-struct StoreMetadataIsRefused : ForwardingAppRegistry {
-    using ForwardingAppRegistry::ForwardingAppRegistry;
-    Status installPlaceholderBundle(const FileURL& directory,
-                                    const PropertyList& options) override {
-        if (options.find(StoreMetadataKey) != nullptr) {
-            return ErrorRecord::make(kRegistryErrorDomain, 1, "an option that is not known");
-        }
-        return target().installPlaceholderBundle(directory, options);
-    }
-};
-struct NullSinfIsRefused : ForwardingAppRegistry {
-    using ForwardingAppRegistry::ForwardingAppRegistry;
-    Status installPlaceholderBundle(const FileURL& directory,
-                                    const PropertyList& options) override {
-        const PropertyList* sinf = options.find(AppSinfKey);
-        if (sinf != nullptr && sinf->isNull()) {
-            return ErrorRecord::make(kRegistryErrorDomain, 1, "no data");
         }
         return target().installPlaceholderBundle(directory, options);
     }
