@@ -656,6 +656,27 @@ class Commands {
                           });
         screen.add_option("OUT", values->other, "the picture to write")->required();
         addJson(screen, values);
+        addTimeline();
+    }
+
+    void addTimeline() {
+        const auto values = std::make_shared<TimelineArguments>();
+        CLI::App& added = command<TimelineArguments>(
+            app_, "timeline", "Draw what happened in a session, application by application", values,
+            [this](const TimelineArguments& parsed) { return runTimeline(parsed, console_); });
+        added
+            .add_option("DEVICE|RECORDING", values->source,
+                        "the device directory, or a recording of a session")
+            ->required();
+        added.add_option("--out", values->picture, "the picture to write: .svg, .png or .html")
+            ->type_name("FILE")
+            ->required();
+        added
+            .add_option("--session", values->session,
+                        "which of the device's sessions, counted back: 1 is the last")
+            ->type_name("N")
+            ->check(wholeNumberFrom(1, std::numeric_limits<std::int32_t>::max()));
+        added.add_flag("--json", values->asJson, "print JSON");
     }
 
     void addLook(const std::string& name, const std::string& description,

@@ -31,6 +31,20 @@ struct HistoryArguments {
 [[nodiscard]] int runScreen(const std::string& device, const std::string& picture, bool asJson,
                             const Console& console);
 
+// TimelineCommand.cpp
+
+struct TimelineArguments {
+    /// A device, or a recording.
+    std::string source;
+    std::string picture;
+    /// Which of a device's sessions, counted back; nothing: the last.
+    std::optional<std::size_t> session;
+    bool asJson = false;
+};
+[[nodiscard]] int runTimeline(const TimelineArguments& arguments, const Console& console);
+
+// ServeCommand.cpp
+
 struct ServeArguments {
     /// A device, or a folder of devices.
     std::string place;

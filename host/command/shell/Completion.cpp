@@ -122,6 +122,11 @@ class Finder {
     }
 
     void addArgument(const OptionEntry& argument) {
+        // One of two things that are there: a directory or a file.
+        if (!wordsOfValue(argument.name).empty()) {
+            found_.paths = Completions::Paths::Files;
+            return;
+        }
         const bool saysMore = argument.value == kNewPlace || !wordsOfValue(argument.value).empty();
         addValues(saysMore ? argument.value : argument.name);
     }

@@ -208,7 +208,8 @@ INSTANTIATE_TEST_SUITE_P(Help, EachCommand,
 
 INSTANTIATE_TEST_SUITE_P(HelpWithoutASession, EachCommand,
                          testing::Values("completion", "manual", "package list", "package verify",
-                                         "data", "data ls", "data pull", "data push", "diff"));
+                                         "data", "data ls", "data pull", "data push", "diff",
+                                         "timeline"));
 
 TEST_F(CommandLine, HelpShowsTheHelpOfACommand) {
     EXPECT_EQ(run({"help", "package", "make"}), 0);

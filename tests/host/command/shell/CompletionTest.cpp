@@ -62,6 +62,7 @@ TEST_F(Completion, OfAnArgumentIsItsKind) {
     EXPECT_THAT(wordsOf({"sync", device, ""}), ElementsAre(":directories"));
     EXPECT_THAT(wordsOf({"screen", device, "p"}), ElementsAre(":files"));
     EXPECT_THAT(wordsOf({"package", "verify", "a.zip", "b"}), ElementsAre(":files"));
+    EXPECT_THAT(wordsOf({"timeline", ""}), ElementsAre(":files"));
     EXPECT_THAT(wordsOf({"coordinator", device, "c"}), ElementsAre("create", "cancel"));
     EXPECT_THAT(wordsOf({"completion", ""}), ElementsAre("bash", "zsh", "fish"));
     EXPECT_THAT(wordsOf({"apps", device, ""}), ElementsAre("--help", "--json"));

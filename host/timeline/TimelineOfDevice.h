@@ -1,0 +1,34 @@
+#pragma once
+
+#include <chrono>
+#include <cstddef>
+#include <optional>
+#include <string>
+#include <vector>
+
+#include "device/values/DeviceRecords.h"
+#include "host/timeline/Timeline.h"
+#include "host/timeline/TimelineEvents.h"
+#include "platform/Result.h"
+
+namespace appsync {
+
+class Device;
+
+struct DeviceTimelineOptions {
+    /// Which session, counted back: 1 is the last, or the one that is under way.
+    std::size_t session = 1;
+    /// Until when a session that is under way is drawn; nothing: until its last message.
+    std::optional<WallTime> now;
+};
+
+/// What the device's log tells of a session; where the log has lost it, its history. A device that
+/// knows of no session gives an empty timeline. An error where log or database cannot be read, and
+/// where there are fewer sessions.
+[[nodiscard]] Result<Timeline> timelineOfDevice(Device& device, const std::string& shownName,
+                                                const DeviceTimelineOptions& options = {});
+
+/// What a record of the transaction log tells of; nothing where that is of no interest here.
+[[nodiscard]] std::optional<TimelineEvent> eventOfHistory(const HistoryRecord& record);
+
+}  // namespace appsync
