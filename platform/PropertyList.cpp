@@ -49,16 +49,30 @@ std::optional<std::size_t> indexedFind(const PropertyListKeyIndex& index, std::u
     return index.find(hash, key, keyAt);
 }
 
+/// A bit that equal keys have in common. Few keys share one with another.
+std::uint64_t markOf(std::string_view key) {
+    if (key.empty()) return 1;
+    const auto at = [key](std::size_t i) { return static_cast<unsigned char>(key[i]); };
+    return std::uint64_t{1} << ((key.size() * 7 + at(0) * 3U + at(key.size() - 1)) & 63U);
+}
+
+std::optional<std::size_t> repeatedAmongFew(Entries entries) {
+    std::uint64_t marks = 0;
+    for (std::size_t i = 0; i < entries.size(); ++i) {
+        const std::string& key = entries[i].key;
+        const std::uint64_t mark = markOf(key);
+        if ((marks & mark) != 0 && linearFind(entries.first(i), key)) return i;
+        marks |= mark;
+    }
+    return std::nullopt;
+}
+
 /// The first entry whose key an earlier one has too. Leaves an index of all entries, if there are
 /// enough of them to have one and none is repeated.
 std::optional<std::size_t> repeatedKey(Entries entries, PropertyListKeyIndex& index) {
-    const bool few = entries.size() <= kLinearEntries;
+    if (entries.size() <= kLinearEntries) return repeatedAmongFew(entries);
     for (std::size_t i = 0; i < entries.size(); ++i) {
         const std::string& key = entries[i].key;
-        if (few) {
-            if (linearFind(entries.first(i), key)) return i;
-            continue;
-        }
         const std::uint32_t hash = PropertyListKeyIndex::hashOf(key);
         if (indexedFind(index, hash, entries, key)) return i;
         index.add(hash, i);

@@ -243,8 +243,15 @@ class BinaryReader {
 
     bool makeBlock(std::size_t at, Span span, PropertyList& value) {
         const ByteView content = bytes_.subspan(span.at, span.size);
-        if (kindOf(bytes_[at]) == kBinaryData) {
+        const std::uint8_t kind = kindOf(bytes_[at]);
+        if (kind == kBinaryData) {
             value = Bytes(content.begin(), content.end());
+            return true;
+        }
+        if (kind == kBinaryAscii && span.size <= kBinaryCopiedSize) {
+            std::string_view text;
+            if (!readAscii(span, text)) return false;
+            value = PropertyList(text);
             return true;
         }
         std::string text;
@@ -256,17 +263,22 @@ class BinaryReader {
     }
 
     bool readText(std::size_t at, Span span, std::string& text) {
-        const ByteView content = bytes_.subspan(span.at, span.size);
         if (kindOf(bytes_[at]) == kBinaryUtf16) {
-            const auto bad = appendUtf16AsUtf8(content, text);
+            const auto bad = appendUtf16AsUtf8(bytes_.subspan(span.at, span.size), text);
             return !bad ||
                    refuse(span.at + *bad, "expected UTF-16, found half of a surrogate pair");
         }
-        const std::string_view all(reinterpret_cast<const char*>(content.data()), content.size());
-        const std::size_t ascii = asciiPrefix(all);
-        if (ascii != all.size()) return refuse(span.at + ascii, "expected an ASCII character");
-        text.assign(all);
+        std::string_view ascii;
+        if (!readAscii(span, ascii)) return false;
+        text.assign(ascii);
         return true;
+    }
+
+    bool readAscii(Span span, std::string_view& text) {
+        const ByteView content = bytes_.subspan(span.at, span.size);
+        text = {reinterpret_cast<const char*>(content.data()), content.size()};
+        const std::size_t ascii = asciiPrefix(text);
+        return ascii == text.size() || refuse(span.at + ascii, "expected an ASCII character");
     }
 
     using ReadContent = bool (BinaryReader::*)(Span, PropertyList&);

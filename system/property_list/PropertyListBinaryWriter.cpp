@@ -1,9 +1,12 @@
 #include "system/property_list/PropertyListBinaryWriter.h"
 
+#include <algorithm>
 #include <array>
 #include <bit>
 #include <cmath>
+#include <cstring>
 #include <optional>
+#include <string>
 #include <string_view>
 #include <utility>
 #include <vector>
@@ -42,30 +45,35 @@ class BinaryWriter {
         // neither this loop nor the next recurses.
         addValue(root);
         for (std::size_t i = 0; i < objects_.size(); ++i) {
-            if (const PropertyList* value = objects_[i].value) addElements(*value);
+            if (objects_[i].text == nullptr) addElements(objects_[i].value());
         }
         referenceWidth_ = tightWidthOf(objects_.size() - 1);
-        bytes_.reserve(kBinaryMagic.size() + textBytes_ + references_.size() * referenceWidth_ +
-                       objects_.size() * 16 + kBinaryTrailerSize);
-        bytes_.assign(kBinaryMagic.begin(), kBinaryMagic.end());
+        bytes_.resize(kBinaryMagic.size() + textBytes_ + references_.size() * referenceWidth_ +
+                      objects_.size() * 16 + kBinaryTrailerSize);
+        putBytes(kBinaryMagic.data(), kBinaryMagic.size());
         offsets_.reserve(objects_.size());
         for (const Object& object : objects_) {
-            offsets_.push_back(bytes_.size());
+            offsets_.push_back(size_);
             if (!writeObject(object)) return writeError(root, object.part, problem_);
         }
         writeTableAndTrailer();
-        if (keyBytes_ > bytes_.size() * kBinaryCopiedSize + kBinaryFreeKeyBytes) {
+        if (keyBytes_ > size_ * kBinaryCopiedSize + kBinaryFreeKeyBytes) {
             return writeError(root, &root, "the same long keys repeat too often; write it as XML");
         }
+        bytes_.resize(size_);
         return std::move(bytes_);
     }
 
   private:
-    /// One object of the output: a value other than a string, or a string.
+    /// One object of the output: a value other than a string, or a string. Small, as there are
+    /// many.
     struct Object {
-        const PropertyList* value = nullptr;
-        std::string_view text;
         const void* part = nullptr;  // the first value or key that it stands for
+        const std::string* text = nullptr;
+
+        [[nodiscard]] const PropertyList& value() const {
+            return *static_cast<const PropertyList*>(part);
+        }
     };
 
     std::size_t add(const Object& object) {
@@ -77,19 +85,19 @@ class BinaryWriter {
         if (const std::string* text = value.asString()) return addText(*text, &value);
         if (const auto content = value.asBoolean()) {
             std::optional<std::size_t>& known = booleans_[*content ? 1 : 0];
-            if (!known) known = add({&value, {}, &value});
+            if (!known) known = add({&value, nullptr});
             return *known;
         }
-        return add({&value, {}, &value});
+        return add({&value, nullptr});
     }
 
     /// Maps of one list mostly have the same keys, and often the same texts, at the same places:
     /// what the map before had there is tried first. `place` counts keys and values.
-    std::size_t addTextAt(std::size_t place, std::string_view text, const void* part) {
+    std::size_t addTextAt(std::size_t place, const std::string& text, const void* part) {
         if (place >= kRememberedPlaces) return addText(text, part);
         std::size_t& before = textOfPlace_[place];
-        if (before >= objects_.size() || objects_[before].value != nullptr ||
-            objects_[before].text != text) {
+        if (before >= objects_.size() || objects_[before].text == nullptr ||
+            *objects_[before].text != text) {
             before = addText(text, part);
         }
         return before;
@@ -100,16 +108,18 @@ class BinaryWriter {
         return addValue(value);
     }
 
-    std::size_t addText(std::string_view text, const void* part) {
+    std::size_t addText(const std::string& text, const void* part) {
         const std::uint32_t hash = PropertyListKeyIndex::hashOf(text);
-        const auto textAt = [this](std::size_t i) { return objects_[textObjects_[i]].text; };
+        const auto textAt = [this](std::size_t i) -> std::string_view {
+            return *objects_[textObjects_[i]].text;
+        };
         if (const auto known = textIndex_.find(hash, text, textAt)) return textObjects_[*known];
         if (textObjects_.size() < PropertyListKeyIndex::kMaximumSize) {
             textIndex_.add(hash, textObjects_.size());
             textObjects_.push_back(objects_.size());
         }
         textBytes_ += text.size();
-        return add({nullptr, text, part});
+        return add({part, &text});
     }
 
     void addElements(const PropertyList& container) {
@@ -127,8 +137,8 @@ class BinaryWriter {
     }
 
     bool writeObject(const Object& object) {
-        if (object.value == nullptr) return writeText(object.text);
-        const PropertyList& value = *object.value;
+        if (object.text != nullptr) return writeText(*object.text);
+        const PropertyList& value = object.value();
         using Kind = PropertyList::Kind;
         switch (value.kind()) {
             case Kind::Null:
@@ -144,8 +154,7 @@ class BinaryWriter {
             case Kind::Date:
                 return writeDate(value.asDate()->secondsSince2001);
             case Kind::Data:
-                putMarker(kBinaryData, value.asData()->size());
-                return putBytes(*value.asData()), true;
+                return putBlock(kBinaryData, *value.asData()), true;
             case Kind::Array:
                 putMarker(kBinaryArray, value.size());
                 return writeReferences(value.size()), true;
@@ -197,8 +206,7 @@ class BinaryWriter {
     bool writeText(std::string_view text) {
         if (asciiPrefix(text) == text.size()) {
             putMarker(kBinaryAscii, text.size());
-            const auto* bytes = reinterpret_cast<const std::uint8_t*>(text.data());
-            return putBytes({bytes, text.size()}), true;
+            return putBytes(text.data(), text.size()), true;
         }
         const auto wide = utf16FromUtf8(text);
         if (!wide) {
@@ -206,25 +214,25 @@ class BinaryWriter {
             return false;
         }
         putMarker(kBinaryUtf16, wide->size() / 2);
-        return putBytes(*wide), true;
+        return putBytes(wide->data(), wide->size()), true;
+    }
+
+    void putBlock(std::uint8_t kind, ByteView bytes) {
+        putMarker(kind, bytes.size());
+        putBytes(bytes.data(), bytes.size());
     }
 
     /// Containers are met in the order in which their references were noted.
     void writeReferences(std::size_t count) {
-        std::uint8_t* at = extend(count * referenceWidth_);
-        for (; count != 0; --count, at += referenceWidth_) {
-            store(at, references_[nextReference_++], referenceWidth_);
-        }
+        makeRoom(count * referenceWidth_);
+        for (; count != 0; --count) store(references_[nextReference_++], referenceWidth_);
     }
 
     void writeTableAndTrailer() {
-        const std::size_t table = bytes_.size();
+        const std::size_t table = size_;
         const std::size_t width = tightWidthOf(table);
-        std::uint8_t* at = extend(offsets_.size() * width);
-        for (const std::size_t offset : offsets_) {
-            store(at, offset, width);
-            at += width;
-        }
+        makeRoom(offsets_.size() * width);
+        for (const std::size_t offset : offsets_) store(offset, width);
         putNumber(0, 6);
         putByte(static_cast<std::uint8_t>(width));
         putByte(static_cast<std::uint8_t>(referenceWidth_));
@@ -239,24 +247,34 @@ class BinaryWriter {
         putInteger(count);
     }
 
-    void putByte(std::uint8_t byte) { bytes_.push_back(byte); }
-    void putBytes(ByteView bytes) { bytes_.insert(bytes_.end(), bytes.begin(), bytes.end()); }
+    void putByte(std::uint8_t byte) { putNumber(byte, 1); }
     void putBits(double value) { putNumber(std::bit_cast<std::uint64_t>(value), 8); }
 
-    void putNumber(std::uint64_t value, std::size_t width) { store(extend(width), value, width); }
-
-    /// Makes the output longer; where what is new begins.
-    std::uint8_t* extend(std::size_t size) {
-        const std::size_t end = bytes_.size();
-        bytes_.resize(end + size);
-        return bytes_.data() + end;
+    void putBytes(const void* bytes, std::size_t count) {
+        if (count == 0) return;
+        makeRoom(count);
+        std::memcpy(bytes_.data() + size_, bytes, count);
+        size_ += count;
     }
 
-    /// The last `width` bytes of a number, the highest first.
-    static void store(std::uint8_t* at, std::uint64_t value, std::size_t width) {
-        for (std::size_t i = width; i != 0; --i, value >>= 8U) {
-            at[i - 1] = static_cast<std::uint8_t>(value & 0xFFU);
-        }
+    void putNumber(std::uint64_t value, std::size_t width) {
+        makeRoom(width);
+        store(value, width);
+    }
+
+    /// Has so many bytes, and those that `store` writes beyond, fit.
+    void makeRoom(std::size_t count) {
+        const std::size_t needed = size_ + count + sizeof(std::uint64_t);
+        if (needed > bytes_.size()) bytes_.resize(std::max(needed, bytes_.size() * 2));
+    }
+
+    /// The last `width` bytes of a number, 1 to 8, the highest first; those behind them are written
+    /// over by what follows.
+    void store(std::uint64_t value, std::size_t width) {
+        value <<= 8 * (sizeof(value) - width);
+        if constexpr (std::endian::native == std::endian::little) value = __builtin_bswap64(value);
+        std::memcpy(bytes_.data() + size_, &value, sizeof(value));
+        size_ += width;
     }
 
     static constexpr std::size_t kRememberedPlaces = 16;
@@ -271,6 +289,7 @@ class BinaryWriter {
     std::size_t keyBytes_ = 0;
 
     Bytes bytes_;
+    std::size_t size_ = 0;  // of what is written of them
     std::vector<std::size_t> offsets_;
     std::size_t referenceWidth_ = 1;
     std::size_t nextReference_ = 0;
