@@ -15,6 +15,8 @@ namespace appsync {
 namespace {
 
 constexpr std::chrono::milliseconds kLongestDelay{100};
+// How often those that have come meanwhile join a transaction before it is committed.
+constexpr int kMostJoins = 8;
 
 Status makeReady(Database& database) {
     if (Status status = checkDeviceSchema(database); !status) return status;
@@ -35,6 +37,7 @@ Result<std::unique_ptr<Database>> connect(const std::string& path,
 struct DeviceDatabase::Waiting {
     const Change& change;
     Durability durability;
+    std::condition_variable& wakes;  // of those that came together
     Status status = {};
     bool done = false;
 };
@@ -85,8 +88,36 @@ DeviceDatabase::~DeviceDatabase() {
 
 Status DeviceDatabase::read(const Reading& reading) {
     if (!reader_) return change(Durability::Soon, reading);
+    if (borrowWriter()) {
+        Status status = reading(*writer_);
+        giveWriterBack();
+        return noteFailure(std::move(status));
+    }
     const std::lock_guard lock(readerMutex_);
     return noteFailure(reading(*reader_));
+}
+
+// Its cache holds what it has written; the reader has to fetch that anew after each commit.
+bool DeviceDatabase::borrowWriter() {
+    const std::lock_guard lock(mutex_);
+    if (!writer_ || isWriterInUse_ || isFrozen_ || !queue_.empty()) return false;
+    isWriterInUse_ = true;
+    return true;
+}
+
+void DeviceDatabase::giveWriterBack() {
+    const std::lock_guard lock(mutex_);
+    isWriterInUse_ = false;
+    wakeNext();
+}
+
+// With the lock held.
+void DeviceDatabase::wakeNext() {
+    if (isFrozen_) {
+        writerIsFree_.notify_all();
+    } else if (!queue_.empty()) {
+        queue_.front()->wakes.notify_one();
+    }
 }
 
 Status DeviceDatabase::change(Durability durability, const Change& change) {
@@ -97,9 +128,10 @@ Status DeviceDatabase::change(Durability durability, const Change& change) {
 }
 
 void DeviceDatabase::changeAll(Durability durability, std::vector<Joint>& changes) {
+    std::condition_variable wakes;
     std::vector<Waiting> own;
     own.reserve(changes.size());
-    for (const Joint& each : changes) own.push_back({each.change, durability});
+    for (const Joint& each : changes) own.push_back({each.change, durability, wakes});
     if (writer_) {
         makeInTurn(own);
     } else {
@@ -116,37 +148,61 @@ void DeviceDatabase::makeInTurn(std::vector<Waiting>& own) {
     const Waiting& first = own.front();
     std::unique_lock lock(mutex_);
     for (Waiting& each : own) queue_.push_back(&each);
-    turn_.wait(lock, [&] { return first.done || (queue_.front() == &first && !isFrozen_); });
+    first.wakes.wait(lock, [&] {
+        return first.done || (queue_.front() == &first && !isWriterInUse_ && !isFrozen_);
+    });
     if (!first.done) lead(lock);
 }
 
 // Commits for everybody in the queue, the caller being the first of them.
 void DeviceDatabase::lead(std::unique_lock<std::mutex>& lock) {
-    const std::vector<Waiting*> batch(queue_.begin(), queue_.end());
-    const std::vector<Change> later = std::exchange(later_, {});
-    isLeading_ = true;
+    std::vector<Waiting*> batch(queue_.begin(), queue_.end());
+    std::vector<Change> later = std::exchange(later_, {});
+    isWriterInUse_ = true;
     lock.unlock();
-    commitTogether(batch, later);
+    commitTogether(batch, std::move(later));
     lock.lock();
-    isLeading_ = false;
+    isWriterInUse_ = false;
     queue_.erase(queue_.begin(), queue_.begin() + static_cast<std::ptrdiff_t>(batch.size()));
-    for (Waiting* waiting : batch) waiting->done = true;
-    turn_.notify_all();
+    for (Waiting* waiting : batch) {
+        waiting->done = true;
+        waiting->wakes.notify_one();
+    }
+    wakeNext();
 }
 
-void DeviceDatabase::commitTogether(const std::vector<Waiting*>& batch,
-                                    const std::vector<Change>& later) {
+// Those that come until the commit begins join.
+void DeviceDatabase::commitTogether(std::vector<Waiting*>& batch, std::vector<Change> later) {
     const bool onDisk = std::any_of(batch.begin(), batch.end(), [](const Waiting* waiting) {
         return waiting->durability == Durability::OnDisk;
     });
-    const Status begun = beginTransaction(onDisk ? Durability::OnDisk : Durability::Soon);
+    const Durability durability = onDisk ? Durability::OnDisk : Durability::Soon;
+    const Status begun = beginTransaction(durability);
     if (!begun) {
         for (Waiting* waiting : batch) waiting->status = begun;
         return;
     }
-    for (const Change& change : later) noteFailure(makeChange(change)).ignore();
-    for (Waiting* waiting : batch) waiting->status = makeChange(waiting->change);
+    std::size_t made = 0;
+    for (int joins = kMostJoins; made < batch.size() || !later.empty(); --joins) {
+        for (const Change& change : later) noteFailure(change(*writer_)).ignore();
+        later.clear();
+        for (; made < batch.size(); ++made) batch[made]->status = makeChange(batch[made]->change);
+        if (joins > 0) later = joinArrived(batch, durability);
+    }
     endTransaction(batch);
+}
+
+// How safe a transaction is going to be cannot be changed any more.
+std::vector<DeviceDatabase::Change> DeviceDatabase::joinArrived(std::vector<Waiting*>& batch,
+                                                                Durability durability) {
+    const std::lock_guard lock(mutex_);
+    if (isFrozen_) return {};
+    while (batch.size() < queue_.size()) {
+        Waiting* arrived = queue_[batch.size()];
+        if (arrived->durability == Durability::OnDisk && durability == Durability::Soon) break;
+        batch.push_back(arrived);
+    }
+    return std::exchange(later_, {});
 }
 
 Status DeviceDatabase::beginTransaction(Durability durability) {
@@ -222,7 +278,7 @@ Status DeviceDatabase::flush() {
 bool DeviceDatabase::freeze(std::chrono::milliseconds longest) {
     std::unique_lock lock(mutex_);
     isFrozen_ = true;
-    return turn_.wait_for(lock, longest, [this] { return !isLeading_; });
+    return writerIsFree_.wait_for(lock, longest, [this] { return !isWriterInUse_; });
 }
 
 std::optional<ErrorRecord> DeviceDatabase::failure() const {

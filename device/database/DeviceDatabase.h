@@ -39,9 +39,9 @@ enum class Durability {
 /// who may only read, a single one.
 ///
 /// Writers that come at the same time share one transaction and one sync: the first of them
-/// commits for all that wait by then. Callable on any thread. The functions that are passed in may
-/// run on another thread than the caller's, but not after the call has returned; they must not call
-/// this object.
+/// commits for all that wait by then, or come before the commit. Callable on any thread. The
+/// functions that are passed in may run on another thread than the caller's, but not after the call
+/// has returned; they must not call this object.
 class DeviceDatabase {
   public:
     using Change = std::function<Status(Database&)>;
@@ -82,8 +82,9 @@ class DeviceDatabase {
     void changeAll(Durability durability, std::vector<Joint>& changes);
 
     /// Leaves a change for later: it goes with the next change of anyone's, at the latest a tenth
-    /// of a second from now. It runs after those that were left before it. What fails is dropped,
-    /// and a crash may lose it. It may run after this call has returned.
+    /// of a second from now. It runs after those that were left before it. A statement that fails
+    /// changes nothing; what the change did before is kept. A crash may lose it. It may run after
+    /// this call has returned.
     void changeLater(Change change);
 
     /// Makes the changes that were left for later, now.
@@ -104,9 +105,13 @@ class DeviceDatabase {
     [[nodiscard]] static Result<std::unique_ptr<DeviceDatabase>> openCopy(
         const std::string& path, const ErrorRecord& whyNotWritable);
 
+    [[nodiscard]] bool borrowWriter();
+    void giveWriterBack();
+    void wakeNext();
     void makeInTurn(std::vector<Waiting>& own);
     void lead(std::unique_lock<std::mutex>& lock);
-    void commitTogether(const std::vector<Waiting*>& batch, const std::vector<Change>& later);
+    void commitTogether(std::vector<Waiting*>& batch, std::vector<Change> later);
+    std::vector<Change> joinArrived(std::vector<Waiting*>& batch, Durability durability);
     Status beginTransaction(Durability durability);
     Status makeChange(const Change& change);
     void endTransaction(const std::vector<Waiting*>& batch);
@@ -115,16 +120,16 @@ class DeviceDatabase {
 
     std::mutex readerMutex_;
     const std::unique_ptr<Database> reader_;     // protected by readerMutex_; none when not shared
-    const std::unique_ptr<Database> writer_;     // used by whoever stands first in queue_, if any
+    const std::unique_ptr<Database> writer_;     // used by whoever has set isWriterInUse_
     std::optional<ErrorRecord> whyNotWritable_;  // where there is no writer_
     Durability writerDurability_ = Durability::OnDisk;  // likewise
 
     mutable std::mutex mutex_;
     // Protected by mutex_.
-    std::condition_variable turn_;
+    std::condition_variable writerIsFree_;  // told of where it is frozen
     std::deque<Waiting*> queue_;
     std::vector<Change> later_;
-    bool isLeading_ = false;  // somebody commits
+    bool isWriterInUse_ = false;  // somebody commits, or reads by way of it
     bool isFrozen_ = false;
     std::optional<ErrorRecord> failure_;
     std::condition_variable flusherWakes_;

@@ -1,5 +1,6 @@
 #include "device/install/JointCommits.h"
 
+#include <condition_variable>
 #include <cstddef>
 #include <utility>
 
@@ -12,13 +13,15 @@ struct JointCommits::Waiting {
     const Change& change;
     Outcome outcome = {};
     bool done = false;
+    // Its own, so that nobody wakes who has to go on waiting.
+    std::condition_variable wakes = {};
 };
 
 JointCommits::Outcome JointCommits::commit(const Change& change) {
     Waiting own{change};
     std::unique_lock lock(mutex_);
     queue_.push_back(&own);
-    ended_.wait(lock, [&] { return own.done || !isLeading_; });
+    own.wakes.wait(lock, [&] { return own.done || (!isLeading_ && queue_.front() == &own); });
     if (!own.done) lead(lock);
     return std::move(own.outcome);
 }
@@ -31,8 +34,11 @@ void JointCommits::lead(std::unique_lock<std::mutex>& lock) {
     commitTogether(batch);
     lock.lock();
     isLeading_ = false;
-    for (Waiting* waiting : batch) waiting->done = true;
-    ended_.notify_all();
+    for (Waiting* waiting : batch) {
+        waiting->done = true;
+        waiting->wakes.notify_one();
+    }
+    if (!queue_.empty()) queue_.front()->wakes.notify_one();
 }
 
 void JointCommits::commitTogether(const std::vector<Waiting*>& batch) {

@@ -1,6 +1,5 @@
 #pragma once
 
-#include <condition_variable>
 #include <functional>
 #include <mutex>
 #include <vector>
@@ -45,7 +44,6 @@ class JointCommits {
 
     std::mutex mutex_;
     // Protected by mutex_.
-    std::condition_variable ended_;
     std::vector<Waiting*> queue_;
     bool isLeading_ = false;
 };

@@ -159,6 +159,17 @@ TEST_F(DeviceDatabaseTest, changesAtTheSameTimeAreIndependent) {
     EXPECT_EQ(rows(), kThreads * kEach * 4 / 5);
 }
 
+TEST_F(DeviceDatabaseTest, aReadingWaitsForNoOther) {
+    const auto database = open();
+    const auto readNothing = [&] {
+        EXPECT_TRUE(succeeded(database->read([](Database&) { return Status(); })));
+    };
+    ASSERT_TRUE(succeeded(database->read([&](Database&) {
+        std::thread(readNothing).join();
+        return Status();
+    })));
+}
+
 TEST_F(DeviceDatabaseTest, whatWasLeftForLaterGoesWithTheNextChange) {
     const auto database = open();
     database->changeLater([](Database& writer) { return insert(writer, "later"); });
