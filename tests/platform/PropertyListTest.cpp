@@ -390,6 +390,15 @@ TEST(PropertyListReaders, AreRefusedWhatIsTooDeep) {
     EXPECT_EQ(entries[0].value.depth(), PropertyList::kMaximumDepth);
 }
 
+TEST(PropertyListReaders, TellKeysApartThatDifferInTheMiddleOnly) {
+    std::vector<PropertyList::Entry> entries;
+    for (const char* key : {"kay", "key", "kny"}) entries.push_back({key, key});
+    PropertyList value;
+    ASSERT_TRUE(value.becomeMap(entries));
+    EXPECT_EQ(value.size(), 3U);
+    EXPECT_EQ(*value.findString("key"), "key");
+}
+
 /// Few keys are compared one after the other, many are looked up by their hashes.
 class PropertyListRepeatedKeys : public testing::TestWithParam<int> {
   protected:
