@@ -161,6 +161,26 @@ Result<std::optional<BundleRow>> findBundle(Database& database, BundleTable tabl
     return row;
 }
 
+// One statement, so that the database is locked and looked through once.
+Result<std::optional<FoundBundle>> findUppermost(Database& database,
+                                                 const std::string& identifier) {
+    Query rows = database.query(
+        "SELECT identifier, version, name, type, install_type, container, bundle, icon, bytes, 1"
+        " FROM placeholders WHERE identifier = ?1"
+        " UNION ALL"
+        " SELECT identifier, version, name, type, install_type, container, bundle, icon, bytes, 0"
+        " FROM applications WHERE identifier = ?1");
+    rows.bind(identifier);
+    std::optional<FoundBundle> found;
+    while (rows.next()) {
+        const auto table =
+            rows.integer(9) != 0 ? BundleTable::Placeholders : BundleTable::Applications;
+        if (!found || table == BundleTable::Placeholders) found = {readRow(rows), table};
+    }
+    if (Status status = rows.status(); !status) return status.error();
+    return found;
+}
+
 Result<bool> isInstalled(Database& database, const std::string& identifier) {
     Query rows = database.query("SELECT 1 FROM applications WHERE identifier = ?");
     rows.bind(identifier);

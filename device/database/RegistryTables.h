@@ -56,6 +56,15 @@ struct FreedContainers {
 [[nodiscard]] Result<std::optional<BundleRow>> findBundle(Database& database, BundleTable table,
                                                           const std::string& identifier);
 
+/// A row, and the table that has it.
+struct FoundBundle {
+    BundleRow row;
+    BundleTable table = BundleTable::Applications;
+};
+/// The placeholder of that identifier where there is one, else the application.
+[[nodiscard]] Result<std::optional<FoundBundle>> findUppermost(Database& database,
+                                                               const std::string& identifier);
+
 /// Whether there is an application, no mere placeholder, of that identifier.
 [[nodiscard]] Result<bool> isInstalled(Database& database, const std::string& identifier);
 

@@ -45,11 +45,19 @@ Status appendProxies(Database& database, BundleTable table, AppRegistry::BundleT
     return {};
 }
 
-Status find(Database& database, BundleTable table, const std::string& identifier,
-            std::optional<AppProxy>& proxy) {
-    const Result<std::optional<BundleRow>> row = findBundle(database, table, identifier);
+Status findApplication(Database& database, const std::string& identifier,
+                       std::optional<AppProxy>& proxy) {
+    const auto row = findBundle(database, BundleTable::Applications, identifier);
     if (!row) return row.error();
-    if (*row) proxy = proxyOf(**row, table);
+    if (*row) proxy = proxyOf(**row, BundleTable::Applications);
+    return {};
+}
+
+Status findUppermost(Database& database, const std::string& identifier,
+                     std::optional<AppProxy>& proxy) {
+    const auto found = findUppermost(database, identifier);
+    if (!found) return found.error();
+    if (*found) proxy = proxyOf((*found)->row, (*found)->table);
     return {};
 }
 
@@ -94,11 +102,9 @@ std::optional<AppProxy> DeviceRegistry::proxyForIdentifier(const std::string& id
     context_.database
         .read([&](Database& database) -> Status {
             proxy.reset();
-            if (placeholders == Placeholders::Included) {
-                Status status = find(database, BundleTable::Placeholders, identifier, proxy);
-                if (!status || proxy) return status;
-            }
-            return find(database, BundleTable::Applications, identifier, proxy);
+            return placeholders == Placeholders::Included
+                       ? findUppermost(database, identifier, proxy)
+                       : findApplication(database, identifier, proxy);
         })
         .ignore();
     return proxy;
