@@ -128,6 +128,7 @@ void CoordinatedInstaller::work() {
 
 void CoordinatedInstaller::installNow(const Coordinator& coordinator) {
     if (coordinator->hasEnded()) return;
+    const CoordinationHerald::Help help = book_.helpToTell();
     TerminationAssertionResult asked =
         homeScreen_.takeTerminationAssertion(coordinator->identifier, kAssertionReason);
     if (asked.outcome == TerminationAssertionResult::kDenied) {

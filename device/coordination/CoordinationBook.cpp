@@ -19,27 +19,16 @@ ErrorRecord serviceClosed() {
     return coordinationError(CoordinationErrorCode::Over, "the device is closed");
 }
 
-ErrorRecord standsAlready(const StoredCoordinator& stored, CoordinationErrorCode code) {
-    return coordinationError(code, "client " + std::to_string(stored.client) +
-                                       " has a coordinator (" + nameOf(stored.kind) + ") for " +
-                                       stored.identifier + "; let it finish, or cancel it first");
+template <typename AnyCoordinator>
+ErrorRecord standsAlready(const AnyCoordinator& other, CoordinationErrorCode code) {
+    return coordinationError(code, "client " + std::to_string(other.client) +
+                                       " has a coordinator (" + nameOf(other.kind) + ") for " +
+                                       other.identifier + "; let it finish, or cancel it first");
 }
 
 ErrorRecord notInstalled(const std::string& identifier) {
     return coordinationError(CoordinationErrorCode::NotInstalled,
                              identifier + " is not installed, so there is nothing to update");
-}
-
-Result<StoredCoordinator> insert(Database& database, CoordinatorKind kind,
-                                 const std::string& identifier, CoordinationClient client) {
-    const Result<std::int64_t> id = insertCoordinator(database, identifier, kind, client);
-    if (!id) return id.error();
-    StoredCoordinator stored;
-    stored.id = *id;
-    stored.identifier = identifier;
-    stored.kind = kind;
-    stored.client = client;
-    return stored;
 }
 
 }  // namespace
@@ -61,26 +50,91 @@ Lookup CoordinationBook::lookUp(CoordinatorKind kind, const std::string& identif
                                 InstallCoordinatorService::Creation creation) {
     if (closed_) return nothing(serviceClosed());
     if (Status legal = requireLegalIdentifier(identifier); !legal) return nothing(legal.error());
-    Result<std::optional<StoredCoordinator>> found = hearAndRead(identifier);
+    const Result<Coordinator> found = hearAndFind(identifier);
     if (!found) return nothing(found.error());
-    bool wasCreated = false;
-    if (!*found) {
-        if (creation == InstallCoordinatorService::Creation::OnlyExisting) return {};
-        Result<StoredCoordinator> made = findOrInsert(kind, identifier, client, wasCreated);
-        if (!made) return nothing(made.error());
-        *found = std::move(*made);
+    if (*found != nullptr) return answer(kind, *found);
+    if (creation == InstallCoordinatorService::Creation::OnlyExisting) return {};
+    return begin(kind, identifier, client);
+}
+
+Lookup CoordinationBook::answer(CoordinatorKind kind, const Coordinator& found) {
+    if (found->kind == kind) return {handle(found), false, std::nullopt};
+    return nothing(standsAlready(*found, CoordinationErrorCode::OtherKind));
+}
+
+// It is written with the first of its pieces, or with whatever is written before.
+Lookup CoordinationBook::begin(CoordinatorKind kind, const std::string& identifier,
+                               CoordinationClient client) {
+    if (kind == CoordinatorKind::Updating) {
+        if (Status installed = requireInstalled(identifier); !installed) {
+            return nothing(installed.error());
+        }
     }
-    if ((*found)->kind != kind) {
-        return nothing(standsAlready(**found, CoordinationErrorCode::OtherKind));
+    const Result<std::int64_t> id = takeId();
+    if (!id) return nothing(id.error());
+    StoredCoordinator stored;
+    stored.id = *id;
+    stored.identifier = identifier;
+    stored.kind = kind;
+    stored.client = client;
+    const auto made = std::make_shared<LiveCoordinator>(stored, LiveCoordinator::Origin::New);
+    if (access_ == Access::Look) {
+        saveNow(made);
+        return {handle(made), true, std::nullopt};
     }
-    return {handle(adopt(**found)), wasCreated, std::nullopt};
+    const Coordinator known = keepUnlessBegun(made);
+    if (known != made) return answer(kind, known);
+    saveLater(made);
+    return {handle(made), true, std::nullopt};
+}
+
+// What another thread has begun meanwhile stays.
+CoordinationBook::Coordinator CoordinationBook::keepUnlessBegun(const Coordinator& made) {
+    const std::lock_guard lock(mutex_);
+    Coordinator& known = coordinators_[made->identifier];
+    if (known == nullptr || !known->isBegun()) known = made;
+    return known;
+}
+
+Status CoordinationBook::requireInstalled(const std::string& identifier) {
+    return context_.database.read([&](Database& database) -> Status {
+        const Result<bool> installed = isInstalled(database, identifier);
+        if (!installed) return installed.error();
+        return *installed ? Status() : notInstalled(identifier);
+    });
+}
+
+// A reservation is a transaction, so it is one of many.
+Result<std::int64_t> CoordinationBook::takeId() {
+    constexpr std::int64_t kReserved = 64;
+    {
+        const std::lock_guard lock(mutex_);
+        if (nextId_ <= lastId_) return nextId_++;
+    }
+    std::int64_t first = 0;
+    const Status status = context_.database.change(Durability::Soon, [&](Database& database) {
+        const Result<std::int64_t> reserved = reserveCoordinatorIds(database, kReserved);
+        if (!reserved) return Status(reserved.error());
+        first = *reserved;
+        return Status();
+    });
+    if (!status) return status.error();
+    const std::lock_guard lock(mutex_);
+    nextId_ = first + 1;
+    lastId_ = first + kReserved - 1;
+    return first;
+}
+
+CoordinationBook::Coordinator CoordinationBook::begun(const std::string& identifier) const {
+    const std::lock_guard lock(mutex_);
+    const auto known = coordinators_.find(identifier);
+    return known != coordinators_.end() && known->second->isBegun() ? known->second : nullptr;
 }
 
 CoordinationBook::Coordinator CoordinationBook::find(const std::string& identifier) {
     if (closed_) return nullptr;
-    const Result<std::optional<StoredCoordinator>> found = hearAndRead(identifier);
-    if (!found || !*found) return nullptr;
-    return adopt(**found);
+    const Result<Coordinator> found = hearAndFind(identifier);
+    return found ? *found : nullptr;
 }
 
 std::shared_ptr<InstallCoordinator> CoordinationBook::existing(const std::string& identifier) {
@@ -97,7 +151,7 @@ Status CoordinationBook::create(const std::string& identifier, CoordinationClien
         const Result<bool> installed = isInstalled(database, identifier);
         if (!installed) return installed.error();
         const auto kind = *installed ? CoordinatorKind::Updating : CoordinatorKind::Initiating;
-        const Result<StoredCoordinator> made = insert(database, kind, identifier, client);
+        const Result<std::int64_t> made = insertCoordinator(database, identifier, kind, client);
         return made ? Status() : Status(made.error());
     });
 }
@@ -121,52 +175,30 @@ void CoordinationBook::resume() {
     });
 }
 
-// Hears of what others have ended, too: both are one reading of the database.
-Result<std::optional<StoredCoordinator>> CoordinationBook::hearAndRead(
-    const std::string& identifier) {
+// Hears of what others have ended, too: both are of one state of the database. So what is known and
+// not there has yet to be written.
+Result<CoordinationBook::Coordinator> CoordinationBook::hearAndFind(const std::string& identifier) {
     std::vector<Cancellation> news;
     std::optional<StoredCoordinator> found;
     const Status status = context_.database.read([&](Database& database) -> Status {
-        if (Status heard = readNews(database, news); !heard) return heard;
+        if (Status begun = database.query("SAVEPOINT look").run(); !begun) return begun;
+        Status read = readNews(database, news);
         auto result = findCoordinator(database, identifier);
+        database.query("RELEASE look").run().ignore();
+        if (!read) return read;
         if (!result) return result.error();
         found = std::move(*result);
         return {};
     });
     hearAll(news);
     if (!status) return status.error();
-    return found;
-}
-
-Result<StoredCoordinator> CoordinationBook::findOrInsert(CoordinatorKind kind,
-                                                         const std::string& identifier,
-                                                         CoordinationClient client,
-                                                         bool& wasCreated) {
-    StoredCoordinator stored;
-    const Status status =
-        context_.database.change(Durability::Soon, [&](Database& database) -> Status {
-            auto found = findCoordinator(database, identifier);
-            if (!found) return found.error();
-            wasCreated = !found->has_value();
-            if (*found) {
-                stored = std::move(**found);
-                return {};
-            }
-            const Result<bool> installed = isInstalled(database, identifier);
-            if (!installed) return installed.error();
-            if (kind == CoordinatorKind::Updating && !*installed) return notInstalled(identifier);
-            Result<StoredCoordinator> made = insert(database, kind, identifier, client);
-            if (!made) return made.error();
-            stored = std::move(*made);
-            return {};
-        });
-    if (!status) return status.error();
-    return stored;
+    return found ? adopt(*found) : begun(identifier);
 }
 
 // Beside a session, others may change what was read at any time, so nothing is kept.
 CoordinationBook::Coordinator CoordinationBook::adopt(const StoredCoordinator& stored) {
-    if (access_ == Access::Look) return std::make_shared<LiveCoordinator>(stored);
+    constexpr auto kOrigin = LiveCoordinator::Origin::Database;
+    if (access_ == Access::Look) return std::make_shared<LiveCoordinator>(stored, kOrigin);
     // Whoever ended the former one tells of it; if that was somebody else, while it is still known.
     if (knowsAnother(stored)) hearOfOthers();
     Coordinator made;
@@ -174,7 +206,7 @@ CoordinationBook::Coordinator CoordinationBook::adopt(const StoredCoordinator& s
         const std::lock_guard lock(mutex_);
         Coordinator& known = coordinators_[stored.identifier];
         if (known != nullptr && known->id == stored.id) return known;
-        made = std::make_shared<LiveCoordinator>(stored);
+        made = std::make_shared<LiveCoordinator>(stored, kOrigin);
         for (const auto& [role, promise] : made->promisesByRole()) {
             (void)promise->attach(listener(made, role, promise));
         }

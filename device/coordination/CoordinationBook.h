@@ -21,6 +21,7 @@
 
 namespace appsync {
 
+struct BundleRow;
 class Database;
 class DevicePlaceholder;
 
@@ -86,6 +87,11 @@ class CoordinationBook : public std::enable_shared_from_this<CoordinationBook> {
     /// Tells of what others have cancelled through the database. Cheap when that is nothing.
     void hearOfOthers();
 
+    /// For a thread of the service's that is going to end something: see CoordinationHerald::Help.
+    [[nodiscard]] CoordinationHerald::Help helpToTell() {
+        return CoordinationHerald::Help(herald_);
+    }
+
     // What the sync client has delivered and is not yet installed, or not yet told of.
 
     [[nodiscard]] std::vector<std::string> installsUnderWay();
@@ -96,15 +102,20 @@ class CoordinationBook : public std::enable_shared_from_this<CoordinationBook> {
 
   private:
     [[nodiscard]] Status requireSession() const;
-    [[nodiscard]] Result<std::optional<StoredCoordinator>> hearAndRead(
-        const std::string& identifier);
+    /// Null when there is none.
+    [[nodiscard]] Result<Coordinator> hearAndFind(const std::string& identifier);
     /// What others have ended since it was last heard of.
     Status readNews(Database& database, std::vector<Cancellation>& news) const;
     void hearAll(const std::vector<Cancellation>& news);
-    [[nodiscard]] Result<StoredCoordinator> findOrInsert(CoordinatorKind kind,
-                                                         const std::string& identifier,
-                                                         CoordinationClient client,
-                                                         bool& wasCreated);
+    [[nodiscard]] InstallCoordinatorService::Coordinator begin(CoordinatorKind kind,
+                                                               const std::string& identifier,
+                                                               CoordinationClient client);
+    [[nodiscard]] Status requireInstalled(const std::string& identifier);
+    [[nodiscard]] Result<std::int64_t> takeId();
+    [[nodiscard]] Coordinator begun(const std::string& identifier) const;
+    [[nodiscard]] Coordinator keepUnlessBegun(const Coordinator& made);
+    [[nodiscard]] InstallCoordinatorService::Coordinator answer(CoordinatorKind kind,
+                                                                const Coordinator& found);
     Coordinator adopt(const StoredCoordinator& stored);
     [[nodiscard]] bool knowsAnother(const StoredCoordinator& stored) const;
     [[nodiscard]] std::shared_ptr<InstallCoordinator> handle(const Coordinator& coordinator);
@@ -126,7 +137,9 @@ class CoordinationBook : public std::enable_shared_from_this<CoordinationBook> {
 
     Status show(const Coordinator& coordinator, const DevicePlaceholder& placeholder);
     Status putOnHomeScreen(const Coordinator& coordinator, const DevicePlaceholder& placeholder);
-    [[nodiscard]] Result<bool> borrowDemoted(const Coordinator& coordinator);
+    [[nodiscard]] Result<std::optional<BundleRow>> standingPlaceholder(
+        const std::string& identifier) const;
+    Status borrow(const Coordinator& coordinator);
     Status recordShown(const Coordinator& coordinator, PlaceholderState state, Database& database);
 
     void hear(const Cancellation& cancellation);
@@ -136,6 +149,9 @@ class CoordinationBook : public std::enable_shared_from_this<CoordinationBook> {
     [[nodiscard]] bool retire(const Coordinator& coordinator,
                               const std::optional<ErrorRecord>& error);
     void removeFiles(const LiveCoordinator& coordinator);
+    void removePackage(const LiveCoordinator& coordinator);
+    /// The directory of them, with a slash at its end.
+    [[nodiscard]] static std::string placeholderFilesOf(const std::string& identifier);
     void removePlaceholderFiles(const std::string& identifier);
     void removeFile(const std::string& path);
     void tell(const Coordinator& coordinator, CoordinationHerald::Call call);
@@ -156,6 +172,8 @@ class CoordinationBook : public std::enable_shared_from_this<CoordinationBook> {
     mutable std::mutex mutex_;
     // Protected by mutex_.
     std::unordered_map<std::string, Coordinator> coordinators_;
+    std::int64_t nextId_ = 0;  // of those that were reserved
+    std::int64_t lastId_ = -1;
     std::map<std::string, std::int64_t> underWay_;  // identifiers, and which coordinator of theirs
     std::condition_variable underWayShrank_;
 };

@@ -59,7 +59,11 @@ void CoordinationBook::cancel(const Coordinator& coordinator, const ErrorRecord&
 }
 
 void CoordinationBook::installed(const Coordinator& coordinator) {
-    removeFiles(*coordinator);
+    removePackage(*coordinator);
+    // Those of a placeholder that came to stand went then.
+    if (coordinator->snapshot().placeholder == PlaceholderState::Kept) {
+        removePlaceholderFiles(coordinator->identifier);
+    }
     if (retire(coordinator, std::nullopt)) tellCompletion(coordinator);
 }
 
@@ -144,17 +148,24 @@ bool CoordinationBook::retire(const Coordinator& coordinator,
 }
 
 void CoordinationBook::removeFiles(const LiveCoordinator& coordinator) {
+    removePackage(coordinator);
+    removePlaceholderFiles(coordinator.identifier);
+}
+
+void CoordinationBook::removePackage(const LiveCoordinator& coordinator) {
     const auto asset = coordinator.promise(PromiseRole::Asset);
     if (asset != nullptr) {
         const PromiseValues values = asset->values();
         if (values.complete && values.path) removeFile(*values.path);
     }
-    removePlaceholderFiles(coordinator.identifier);
+}
+
+std::string CoordinationBook::placeholderFilesOf(const std::string& identifier) {
+    return std::string(kPlaceholderFilesDirectory) + "/" + identifier + ".app/";
 }
 
 void CoordinationBook::removePlaceholderFiles(const std::string& identifier) {
-    const std::string directory = std::string(kPlaceholderFilesDirectory) + "/" + identifier;
-    context_.files.removeItem(directory + ".app").ignore();
+    context_.files.removeItem(placeholderFilesOf(identifier)).ignore();
 }
 
 // A promise is kept with a file; whatever else stands at the path is not the service's to remove.

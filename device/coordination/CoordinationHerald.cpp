@@ -9,6 +9,13 @@
 
 namespace appsync {
 
+namespace {
+
+// Whom this thread helps.
+thread_local const CoordinationHerald* helped = nullptr;
+
+}  // namespace
+
 /// Who observes which clients.
 class CoordinationHerald::Registrations {
   public:
@@ -91,10 +98,19 @@ void CoordinationHerald::tell(std::shared_ptr<LiveCoordinator> coordinator, Call
     const std::lock_guard lock(mutex_);
     if (closing_) return;
     const auto held = held_.find(coordinator->id);
+    const bool isHelping = helped == this;
     News news{std::move(coordinator), std::move(call), std::move(told)};
     if (held != held_.end()) return held->second.push_back(std::move(news));
     news_.push_back(std::move(news));
-    wake();
+    if (!isHelping) wake();
+}
+
+CoordinationHerald::Help::Help(CoordinationHerald& herald) : herald_(herald) { helped = &herald; }
+
+CoordinationHerald::Help::~Help() {
+    helped = nullptr;
+    std::unique_lock lock(herald_.mutex_);
+    herald_.deliverAll(lock);
 }
 
 void CoordinationHerald::hold(const LiveCoordinator& coordinator) {
@@ -134,13 +150,23 @@ void CoordinationHerald::close() {
         wakes_.notify_all();
     }
     if (thread_.joinable()) thread_.join();
+    std::unique_lock lock(mutex_);
+    wakes_.wait(lock, [this] { return !isTelling_; });
 }
 
 void CoordinationHerald::work() {
     std::unique_lock lock(mutex_);
     while (true) {
-        wakes_.wait(lock, [this] { return closing_ || !news_.empty(); });
+        wakes_.wait(lock, [this] { return closing_ || (!news_.empty() && !isTelling_); });
         if (closing_) return;
+        deliverAll(lock);
+    }
+}
+
+void CoordinationHerald::deliverAll(std::unique_lock<std::mutex>& lock) {
+    if (isTelling_) return;
+    isTelling_ = true;
+    while (!closing_ && !news_.empty()) {
         {
             const News news = std::move(news_.front());
             news_.pop_front();
@@ -149,6 +175,8 @@ void CoordinationHerald::work() {
         }
         lock.lock();
     }
+    isTelling_ = false;
+    if (closing_) wakes_.notify_all();
 }
 
 void CoordinationHerald::deliver(const News& news) {

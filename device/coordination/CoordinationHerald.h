@@ -17,9 +17,9 @@ namespace appsync {
 
 class LiveCoordinator;
 
-/// Tells observers of coordinators what happens to them, on a thread of its own, one call after
-/// the other, in the order in which it happened. A coordinator without an observer of its own is
-/// told to whoever observes the client that created it.
+/// Tells observers of coordinators what happens to them, on a thread of its own or of one that
+/// helps, one call after the other, in the order in which it happened. A coordinator without an
+/// observer of its own is told to whoever observes the client that created it.
 ///
 /// Callable on any thread. Its registrations may outlive it.
 class CoordinationHerald {
@@ -45,6 +45,19 @@ class CoordinationHerald {
     /// Tells what was held back. Does nothing where nothing is held.
     void release(const LiveCoordinator& coordinator);
 
+    /// As long as it lives, what its thread tells wakes nobody; as it goes, its thread, which is
+    /// one of the service's, tells it itself, unless another is at it.
+    class Help {
+      public:
+        explicit Help(CoordinationHerald& herald);
+        ~Help();
+        Help(const Help&) = delete;
+        Help& operator=(const Help&) = delete;
+
+      private:
+        CoordinationHerald& herald_;
+    };
+
     /// No call begins any more; waits for one that has begun. Not to be called by an observer.
     void close();
 
@@ -59,6 +72,7 @@ class CoordinationHerald {
 
     void wake();
     void work();
+    void deliverAll(std::unique_lock<std::mutex>& lock);
     void deliver(const News& news);
 
     const std::shared_ptr<Registrations> registrations_;
@@ -66,6 +80,7 @@ class CoordinationHerald {
     std::mutex mutex_;
     // Protected by mutex_.
     std::condition_variable wakes_;
+    bool isTelling_ = false;  // some thread delivers news, until there is none
     std::deque<News> news_;
     std::map<std::int64_t, std::vector<News>> held_;  // by the ids of their coordinators
     bool closing_ = false;

@@ -45,6 +45,13 @@ PropertyList infoOf(const PlaceholderConfiguration& configuration) {
     return info;
 }
 
+// Whether the placeholder that stands there is to stay, as that of a demoted application.
+bool borrows(const LiveCoordinator& coordinator, const std::optional<BundleRow>& standing) {
+    const bool isOfSync = coordinator.kind == CoordinatorKind::Initiating ||
+                          coordinator.kind == CoordinatorKind::Updating;
+    return isOfSync && standing && isDemotedType(standing->installType);
+}
+
 }  // namespace
 
 Status CoordinationBook::requireSession() const {
@@ -150,8 +157,9 @@ void CoordinationBook::promiseChanged(const Coordinator& coordinator, PromiseRol
             if (role == PromiseRole::Asset) noteDelivery(*coordinator);
             [[fallthrough]];
         case LivePromise::Change::Cancelled:
-            saveNow(coordinator);
+            // The install need not wait for what is written about it.
             proceed(coordinator);
+            saveNow(coordinator);
     }
 }
 
@@ -268,7 +276,9 @@ Status CoordinationBook::show(const Coordinator& coordinator,
     }
     if (const auto icon = placeholder.configuration().icon) {
         const PromiseValues values = icon->values();
-        if (values.complete && values.path) removeFile(*values.path);
+        const bool goesWithOthers =
+            values.path && values.path->starts_with(placeholderFilesOf(coordinator->identifier));
+        if (values.complete && values.path && !goesWithOthers) removeFile(*values.path);
     }
     removePlaceholderFiles(coordinator->identifier);
     const auto asset = coordinator->promise(PromiseRole::Asset);
@@ -279,13 +289,14 @@ Status CoordinationBook::show(const Coordinator& coordinator,
 
 Status CoordinationBook::putOnHomeScreen(const Coordinator& coordinator,
                                          const DevicePlaceholder& placeholder) {
-    const Result<bool> borrowed = borrowDemoted(coordinator);
-    if (!borrowed) return borrowed.error();
-    if (*borrowed) return {};
+    const Result<std::optional<BundleRow>> standing = standingPlaceholder(coordinator->identifier);
+    if (!standing) return standing.error();
+    if (borrows(*coordinator, *standing)) return borrow(coordinator);
     const PlaceholderConfiguration configuration = placeholder.configuration();
     const PropertyList info = infoOf(configuration);
     PlaceholderContents contents{configuration.identifier,  info,         std::nullopt,
-                                 configuration.installType, std::nullopt, configuration.sinf};
+                                 configuration.installType, std::nullopt, configuration.sinf,
+                                 !standing->has_value()};
     if (configuration.icon != nullptr) {
         const PromiseValues icon = configuration.icon->values();
         if (icon.complete) contents.iconFile = icon.path;
@@ -303,28 +314,27 @@ Status CoordinationBook::putOnHomeScreen(const Coordinator& coordinator,
     return shown;
 }
 
-// The placeholder of a demoted application holds its place for its data; the install takes it away
-// when it succeeds, and nothing else does.
-Result<bool> CoordinationBook::borrowDemoted(const Coordinator& coordinator) {
-    if (coordinator->kind != CoordinatorKind::Initiating &&
-        coordinator->kind != CoordinatorKind::Updating) {
-        return false;
-    }
-    bool demoted = false;
-    Status status = context_.database.read([&](Database& database) -> Status {
-        const auto row = findBundle(database, BundleTable::Placeholders, coordinator->identifier);
+Result<std::optional<BundleRow>> CoordinationBook::standingPlaceholder(
+    const std::string& identifier) const {
+    std::optional<BundleRow> standing;
+    const Status status = context_.database.read([&](Database& database) -> Status {
+        auto row = findBundle(database, BundleTable::Placeholders, identifier);
         if (!row) return row.error();
-        demoted = row->has_value() && isDemotedType((*row)->installType);
+        standing = *std::move(row);
         return {};
     });
     if (!status) return status.error();
-    if (!demoted) return false;
-    status = context_.database.change(Durability::Soon, [&](Database& database) {
+    return standing;
+}
+
+// The placeholder of a demoted application holds its place for its data; the install takes it away
+// when it succeeds, and nothing else does.
+Status CoordinationBook::borrow(const Coordinator& coordinator) {
+    Status status = context_.database.change(Durability::Soon, [&](Database& database) {
         return recordShown(coordinator, PlaceholderState::Borrowed, database);
     });
-    if (!status) return status.error();
-    coordinator->setPlaceholderState(PlaceholderState::Borrowed);
-    return true;
+    if (status) coordinator->setPlaceholderState(PlaceholderState::Borrowed);
+    return status;
 }
 
 Status CoordinationBook::recordShown(const Coordinator& coordinator, PlaceholderState state,

@@ -15,10 +15,7 @@ std::optional<std::string> DeviceCoordinator::bundleIdentifier() const {
 
 CoordinationClient DeviceCoordinator::creatorIdentifier() const { return coordinator_->client; }
 
-std::optional<ErrorRecord> DeviceCoordinator::error() const {
-    if (!coordinator_->hasEnded()) book_->hearOfOthers();
-    return coordinator_->error();
-}
+std::optional<ErrorRecord> DeviceCoordinator::error() const { return coordinator_->error(); }
 
 std::string DeviceCoordinator::description() const {
     return coordinator_->identifier + " (" + nameOf(coordinator_->kind) + ", client " +

@@ -16,15 +16,17 @@ std::shared_ptr<LivePromise> unlessCancelled(std::shared_ptr<LivePromise> promis
 
 }  // namespace
 
-LiveCoordinator::LiveCoordinator(const StoredCoordinator& stored)
+LiveCoordinator::LiveCoordinator(const StoredCoordinator& stored, Origin comesFrom)
     : id(stored.id),
       identifier(stored.identifier),
       kind(stored.kind),
       client(stored.client),
+      origin(comesFrom),
       responsible_(stored.responsible),
       options_(stored.options),
       hasInitialAssets_(stored.hasInitialAssets),
-      placeholder_(stored.placeholder) {
+      placeholder_(stored.placeholder),
+      isWritten_(comesFrom == Origin::Database) {
     for (const StoredPromise& promise : stored.promises) {
         pieces_.push_back(
             {promise.role, promise.position, std::make_shared<LivePromise>(promise.values)});
@@ -171,6 +173,12 @@ bool LiveCoordinator::claimInstall() {
     return true;
 }
 
+// One whose pieces are all there was written with its placeholder.
+bool LiveCoordinator::isBegun() const {
+    const std::lock_guard lock(mutex_);
+    return origin == Origin::New && !claimed_ && !ending_ && !ended_;
+}
+
 bool LiveCoordinator::beginEnding() {
     const std::lock_guard lock(mutex_);
     if (ending_ || ended_) return false;
@@ -214,16 +222,19 @@ bool LiveCoordinator::beginSaving() {
 Result<bool> LiveCoordinator::save(Database& database) {
     std::vector<Piece> pieces;
     std::optional<StoredCoordinator> now;
+    bool isNew = false;
     {
         const std::lock_guard lock(mutex_);
         saving_ = false;
         if (ended_) return false;
-        if (std::exchange(rowChanged_, false)) now = snapshotLocked();
+        isNew = !std::exchange(isWritten_, true);
+        if (std::exchange(rowChanged_, false) || isNew) now = snapshotLocked();
         pieces = pieces_;
     }
     if (now) {
-        const Result<bool> updated = updateCoordinator(database, *now);
-        if (!updated || !*updated) return updated;
+        const Result<bool> written =
+            isNew ? insertReserved(database, *now) : updateCoordinator(database, *now);
+        if (!written || !*written) return written;
     }
     for (const Piece& piece : pieces) {
         const std::optional<PromiseValues> values = piece.promise->takeChanged();

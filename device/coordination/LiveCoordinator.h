@@ -25,13 +25,17 @@ class Database;
 /// any time, once.
 class LiveCoordinator {
   public:
-    /// Its promises are for the caller to attach.
-    explicit LiveCoordinator(const StoredCoordinator& stored);
+    enum class Origin { Database, New };
+
+    /// Its promises are for the caller to attach. A new one stands in the database once it is
+    /// saved.
+    LiveCoordinator(const StoredCoordinator& stored, Origin comesFrom);
 
     const std::int64_t id;
     const std::string identifier;
     const CoordinatorKind kind;
     const CoordinationClient client;
+    const Origin origin;
 
     [[nodiscard]] StoredCoordinator snapshot() const;
     [[nodiscard]] std::vector<std::pair<PromiseRole, std::shared_ptr<LivePromise>>> promisesByRole()
@@ -56,6 +60,9 @@ class LiveCoordinator {
     [[nodiscard]] bool beginFulfillment();
     /// True the first time that everything is there.
     [[nodiscard]] bool claimInstall();
+
+    /// Whether it is a new one that goes on and that the database need not have yet.
+    [[nodiscard]] bool isBegun() const;
 
     /// True for the one caller who may try to end it.
     [[nodiscard]] bool beginEnding();
@@ -98,6 +105,7 @@ class LiveCoordinator {
     bool ended_ = false;
     bool saving_ = false;
     bool rowChanged_ = false;
+    bool isWritten_ = false;
 };
 
 }  // namespace appsync

@@ -194,6 +194,39 @@ Result<std::int64_t> insertCoordinator(Database& database, const std::string& id
     return id;
 }
 
+Result<std::int64_t> reserveCoordinatorIds(Database& database, std::int64_t count) {
+    const Status known = database
+                             .query(
+                                 "INSERT INTO sqlite_sequence (name, seq) SELECT 'coordinators', 0"
+                                 " WHERE NOT EXISTS"
+                                 " (SELECT 1 FROM sqlite_sequence WHERE name = 'coordinators')")
+                             .run();
+    if (!known) return known.error();
+    Query reserve = database.query(
+        "UPDATE sqlite_sequence SET seq = seq + ? WHERE name = 'coordinators' RETURNING seq");
+    reserve.bind(count);
+    std::int64_t last = 0;
+    while (reserve.next()) last = reserve.integer(0);
+    if (Status status = reserve.status(); !status) return status.error();
+    return last - count + 1;
+}
+
+Result<bool> insertReserved(Database& database, const StoredCoordinator& coordinator) {
+    const Status status =
+        database
+            .query(
+                "INSERT INTO coordinators (id, identifier, kind, client, created, responsible,"
+                " options, initial_assets, placeholder) VALUES (?, ?, ?, ?, ?, ?, ?, ?, ?)"
+                " ON CONFLICT (identifier) DO NOTHING")
+            .bind(coordinator.id, coordinator.identifier,
+                  static_cast<std::int64_t>(coordinator.kind), coordinator.client,
+                  milliseconds(wallNow()), coordinator.responsible, coordinator.options,
+                  coordinator.hasInitialAssets, static_cast<std::int64_t>(coordinator.placeholder))
+            .run();
+    if (!status) return status.error();
+    return database.changedRows() > 0;
+}
+
 Result<bool> updateCoordinator(Database& database, const StoredCoordinator& coordinator) {
     const Status status =
         database

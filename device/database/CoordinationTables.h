@@ -98,6 +98,12 @@ struct MissingPiece {
                                                      const std::string& identifier,
                                                      CoordinatorKind kind,
                                                      CoordinationClient client);
+/// Takes ids that no coordinator has or had, and none of another process's gets: so many, from the
+/// one that it gives on.
+[[nodiscard]] Result<std::int64_t> reserveCoordinatorIds(Database& database, std::int64_t count);
+/// Writes a new coordinator with an id that was reserved, except its promises. False when the
+/// identifier has one by now.
+[[nodiscard]] Result<bool> insertReserved(Database& database, const StoredCoordinator& coordinator);
 /// Writes what changes of a coordinator, except its promises. False when it is no longer there.
 [[nodiscard]] Result<bool> updateCoordinator(Database& database,
                                              const StoredCoordinator& coordinator);

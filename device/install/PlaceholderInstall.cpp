@@ -180,9 +180,7 @@ Status beginProgress(Database& database, const BundleRow& row) {
         .run();
 }
 
-// Whether a loss of power may take the placeholder with it.
-bool mayBeLost(const InstallContext& context, const PlaceholderSource& source) {
-    if (source.installType != kInstallTypeSync || context.boot.empty()) return false;
+bool isNew(const InstallContext& context, const PlaceholderSource& source) {
     bool isNew = false;
     const Status status = context.database.read([&](Database& database) -> Status {
         const auto row = findBundle(database, BundleTable::Placeholders, source.identifier);
@@ -191,6 +189,11 @@ bool mayBeLost(const InstallContext& context, const PlaceholderSource& source) {
         return {};
     });
     return status && isNew;
+}
+
+// Whether a loss of power may take a new placeholder with it.
+bool mayBeLost(const InstallContext& context, const PlaceholderSource& source) {
+    return source.installType == kInstallTypeSync && !context.boot.empty();
 }
 
 Status commitPlaceholder(const InstallContext& context, const BundleRow& row,
@@ -212,11 +215,12 @@ Status commitPlaceholder(const InstallContext& context, const BundleRow& row,
 }
 
 Status installBundle(const InstallContext& context, const Bundle& bundle,
-                     const PlaceholderSource& source, const AlsoCommitted& alsoCommitted) {
+                     const PlaceholderSource& source, bool isNew,
+                     const AlsoCommitted& alsoCommitted) {
     Result<NewContainer> container = writeContainer(context, bundle, source);
     if (!container) return container.error();
     PlaceholderExtras extras{source.sinf, std::nullopt};
-    if (mayBeLost(context, source)) {
+    if (isNew && mayBeLost(context, source)) {
         extras.unsyncedBoot = context.boot;
     } else if (Status status = context.barrier.pass(); !status) {
         return status;
@@ -228,7 +232,7 @@ Status installBundle(const InstallContext& context, const Bundle& bundle,
 Status install(const InstallContext& context, const PlaceholderSource& source) {
     const Result<Bundle> bundle = readBundle(context, source);
     if (!bundle) return bundle.error();
-    return installBundle(context, *bundle, source, {});
+    return installBundle(context, *bundle, source, isNew(context, source), {});
 }
 
 Result<Bundle> makeBundle(const InstallContext& context, const PlaceholderContents& contents) {
@@ -318,7 +322,7 @@ Status installPlaceholderWith(const InstallContext& context, const PlaceholderCo
     source.installType = contents.installType;
     source.storeMetadata = contents.storeMetadata;
     source.sinf = contents.sinf;
-    return installBundle(context, *bundle, source, alsoCommitted);
+    return installBundle(context, *bundle, source, contents.isNew, alsoCommitted);
 }
 
 bool isDemotedType(std::uint64_t installType) noexcept {

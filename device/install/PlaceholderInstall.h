@@ -44,6 +44,7 @@ struct PlaceholderContents {
     std::uint64_t installType = 0;
     std::optional<Bytes> storeMetadata;
     std::optional<Bytes> sinf;
+    bool isNew = false;  // the caller has looked: no placeholder of the application stands yet
 };
 
 /// The same for a placeholder that is made here. `alsoCommitted` goes into the transaction that

@@ -36,6 +36,32 @@ class DeviceCoordinationInstallTest : public DeviceCoordinationFixture {
     }
 };
 
+TEST_F(DeviceCoordinationInstallTest, aNewCoordinatorIsFoundBeforeAnythingOfItIsWritten) {
+    for (int turn = 0; turn < 100; ++turn) {
+        const std::string identifier = kAtlas + std::to_string(turn);
+        static_cast<void>(coordinator(identifier, CoordinatorKind::Initiating));
+        const auto again =
+            service().coordinator(CoordinatorKind::Initiating, identifier, SyncClientID,
+                                  InstallCoordinatorService::Creation::CreateIfNotExisting);
+        ASSERT_NE(again.coordinator, nullptr);
+        EXPECT_FALSE(again.wasCreated);
+        EXPECT_NE(service().existingCoordinator(identifier, SyncClientID), nullptr);
+    }
+    EXPECT_EQ(device().coordinators()->size(), 100U);
+}
+
+TEST_F(DeviceCoordinationInstallTest, ofTwoProcessesThatBeginAnInstallOneHasIt) {
+    const auto beside = look();
+    const auto made = coordinator(kAtlas, CoordinatorKind::Initiating);
+    const Status theirs = beside->createCoordinator(kAtlas, AppStoreClientID);
+    const auto shown = placeholder(kAtlas);
+    EXPECT_TRUE(succeeded(shown->setConfigurationComplete()));
+    const Status ours = made->setPlaceholderPromise(shown);
+    EXPECT_NE(ours.ok(), theirs.ok());
+    EXPECT_EQ(number("SELECT count(*) FROM coordinators"), 1);
+    EXPECT_EQ(hasPlaceholder(kAtlas), ours.ok());
+}
+
 TEST_F(DeviceCoordinationInstallTest, aConfiguredPlaceholderStandsAtOnceWithAllThatItWasGiven) {
     const auto made = prepare(kAtlas);
     const std::optional<AppProxy> proxy = either(kAtlas);
