@@ -14,6 +14,7 @@ class Page {
     this.device = new DeviceView((name, identifier) => go(name, identifier), (message) => this.tell(message));
     this.listing = new Coalesced(() => this.list());
     this.isFolder = true;
+    this.known = new Set(); // names of devices
     this.name = undefined; // of the device that is shown; null: all of them
   }
 
@@ -34,6 +35,7 @@ class Page {
       const { devices, folder } = await ask("/api/devices");
       this.isFolder = folder ?? devices.length !== 1;
       this.only = this.isFolder ? null : devices[0]?.name;
+      this.known = new Set(devices.map((device) => device.name));
       this.route();
     } catch (error) {
       this.connection("gone");
@@ -44,8 +46,11 @@ class Page {
 
   route() {
     const [name, identifier] = placeNow();
-    const shown = name ?? this.only ?? null;
+    const wanted = name ?? this.only ?? null;
+    const isKnown = wanted === null || this.known.has(wanted);
+    const shown = isKnown ? wanted : null;
     if (shown !== this.name) this.showDevice(shown);
+    if (shown === null) this.tell(isKnown ? "" : `There is no device called ${wanted} here.`);
     if (shown) this.device.choose(identifier ?? null);
   }
 
@@ -73,8 +78,9 @@ class Page {
     try {
       const { devices } = await ask("/api/devices");
       if (this.name !== null) return;
+      this.known = new Set(devices.map((device) => device.name));
       this.overview.update(devices);
-      this.tell("");
+      this.route(); // what was asked for may be there now
     } catch (error) {
       this.tell(error.message);
     }
