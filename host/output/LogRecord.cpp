@@ -72,7 +72,7 @@ class LineListener final : public JsonListener {
     std::size_t depth_ = 0;
 };
 
-bool isOfIdentifier(char character) {
+bool isIdentifierCharacter(char character) {
     return std::isalnum(static_cast<unsigned char>(character)) != 0 || character == '-' ||
            character == '_' || character == '.';
 }
@@ -81,7 +81,7 @@ bool isOfIdentifier(char character) {
 bool endsIdentifier(std::string_view rest) {
     if (rest.starts_with(".zip") || rest.starts_with(".app")) rest.remove_prefix(4);
     if (rest.starts_with('.')) rest.remove_prefix(1);
-    return rest.empty() || !isOfIdentifier(rest.front());
+    return rest.empty() || !isIdentifierCharacter(rest.front());
 }
 
 char lowered(char character) {
@@ -100,7 +100,7 @@ bool holdsText(std::string_view text, std::string_view part) {
 bool namesApplication(std::string_view text, std::string_view identifier) {
     for (std::size_t at = text.find(identifier); at != text.npos;
          at = text.find(identifier, at + 1)) {
-        const bool begins = at == 0 || !isOfIdentifier(text[at - 1]);
+        const bool begins = at == 0 || !isIdentifierCharacter(text[at - 1]);
         if (begins && endsIdentifier(text.substr(at + identifier.size()))) return true;
     }
     return false;

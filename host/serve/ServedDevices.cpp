@@ -31,7 +31,7 @@ bool holdsDevice(const fs::path& folder, ServedDevices::IsDevice isDevice) {
     return false;
 }
 
-Result<std::string> placeOf(const std::string& path) {
+Result<std::string> servedPlace(const std::string& path) {
     std::error_code code;
     const fs::path place = fs::canonical(path, code);
     if (code) {
@@ -48,7 +48,7 @@ ServedDevices::ServedDevices(std::string path, bool isFolder, IsDevice isDevice,
 
 Result<std::unique_ptr<ServedDevices>> ServedDevices::open(const std::string& path,
                                                            IsDevice isDevice, ChangeBell& bell) {
-    const Result<std::string> place = placeOf(path);
+    const Result<std::string> place = servedPlace(path);
     if (!place) return place.error();
     const bool isFolder = !isDevice(*place);
     if (isFolder && !holdsDevice(*place, isDevice)) {
