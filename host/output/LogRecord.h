@@ -22,13 +22,13 @@ struct LogRecord {
 
 /// Which messages are wanted; without anything, all of them.
 struct LogFilter {
-    std::optional<std::int64_t> category;
+    std::optional<std::int64_t> category{};
     /// This level and those above it.
-    std::optional<LogLevel> level;
+    std::optional<LogLevel> level{};
     /// Those that name this application.
-    std::optional<std::string> application;
+    std::optional<std::string> application{};
     /// Those that hold this text, whatever its case.
-    std::optional<std::string> text = std::nullopt;
+    std::optional<std::string> text{};
 };
 [[nodiscard]] bool isWanted(const LogRecord& record, const LogFilter& filter);
 
