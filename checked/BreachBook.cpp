@@ -43,4 +43,12 @@ void BreachBook::checkDomain(const ErrorRecord& error, std::string_view call) {
            std::string(call) + " gave an error of the unknown domain '" + error.domain + "'");
 }
 
+void BreachBook::checkHasDomain(const ErrorRecord& error, std::string_view call) {
+    if (!error.domain.empty()) return;
+    broken("platform/Error.h",
+           "An error as it crosses interfaces: who says it (domain), which one (code), and what a "
+           "person or a program may want to know",
+           std::string(call) + " gave an error without a domain");
+}
+
 }  // namespace appsync

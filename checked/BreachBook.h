@@ -24,6 +24,8 @@ class BreachBook {
     void broken(std::string_view header, std::string_view sentence, const std::string& seen);
     /// Breaks Error.h's contract where the error's domain is none of those that are known there.
     void checkDomain(const ErrorRecord& error, std::string_view call);
+    /// Breaks it where the error of a service that has a domain of its own has none.
+    void checkHasDomain(const ErrorRecord& error, std::string_view call);
 
     /// Whether somebody else than the plug-in installs, too: the coordination service.
     [[nodiscard]] bool othersInstall() const { return othersInstall_; }

@@ -8,6 +8,7 @@
 #include "checked/CheckedQueues.h"
 #include "checked/CheckedRegistry.h"
 #include "checked/CheckedServices.h"
+#include "checked/CheckedTransfers.h"
 
 namespace appsync {
 
@@ -18,7 +19,8 @@ struct CheckedPlatform::Services {
                                             std::move(options.currentThread))),
           registry(checked.registry, checked.queues, book,
                    {options.patience, options.lockPatience}),
-          coordination(checked.coordination, checked.queues, book, options.patience) {}
+          coordination(checked.coordination, checked.queues, book, options.patience),
+          host(checked.host, checked.queues, book, options.patience) {}
 
     const Platform platform;
     const std::shared_ptr<BreachBook> book;  // shared with what comes due after this has gone
@@ -32,6 +34,7 @@ struct CheckedPlatform::Services {
     CheckedWorkQueues queues{platform.queues, book};
     CheckedRegistry registry;
     CheckedCoordination coordination;
+    CheckedSyncHost host;
 };
 
 CheckedPlatform::CheckedPlatform(const Platform& platform, CheckedPlatformOptions options)
@@ -41,7 +44,7 @@ CheckedPlatform::~CheckedPlatform() = default;
 
 Platform CheckedPlatform::services() {
     Services& checked = *services_;
-    return {.host = checked.platform.host,
+    return {.host = checked.host,
             .log = checked.log,
             .registry = checked.registry,
             .installer = checked.installer,

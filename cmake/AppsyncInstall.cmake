@@ -36,13 +36,13 @@ appsync_install_library(simulation "a device in memory for appsync's plug-in" "a
 appsync_install_library(checked "what tells of broken contracts while appsync's plug-in runs" "appsync-platform")
 appsync_install_library(recording "recordings of sessions with appsync's plug-in" "appsync-platform")
 
-set(folders platform system simulation checked recording)
+set(folders platform system simulation contract/forwarding checked recording) # checked/ includes the forwarding wrappers
 if(APPSYNC_CONTRACT)
     appsync_install_library(contract "what proves a device for appsync's plug-in" "appsync-plugin gmock gtest")
     list(APPEND folders contract)
 endif()
 foreach(folder IN LISTS folders)
-    install(DIRECTORY "${PROJECT_SOURCE_DIR}/${folder}" DESTINATION "${header_place}" COMPONENT dev
+    install(DIRECTORY "${PROJECT_SOURCE_DIR}/${folder}/" DESTINATION "${header_place}/${folder}" COMPONENT dev
             FILES_MATCHING PATTERN "*.h")
 endforeach()
 # What AppsClient.h includes, and the paths that a host needs.
@@ -73,4 +73,5 @@ install(DIRECTORY "${PROJECT_SOURCE_DIR}/docs/" DESTINATION "${CMAKE_INSTALL_DOC
 # What scripts/docs has put there; scripts/package has it do so.
 install(DIRECTORY "${PROJECT_BINARY_DIR}/reference/" DESTINATION "${CMAKE_INSTALL_DOCDIR}/reference" COMPONENT doc
         OPTIONAL)
+install(DIRECTORY "${PROJECT_SOURCE_DIR}/examples" DESTINATION "${CMAKE_INSTALL_DOCDIR}" COMPONENT doc)
 install(FILES README.md CHANGELOG.md LICENSE DESTINATION "${CMAKE_INSTALL_DOCDIR}" COMPONENT doc)

@@ -159,6 +159,8 @@ class ForwardingCoordinatorObserver : public InstallCoordinatorObserver {
     explicit ForwardingCoordinatorObserver(std::weak_ptr<InstallCoordinatorObserver> target)
         : target_(std::move(target)) {}
 
+    [[nodiscard]] bool isExpired() const { return target_.expired(); }
+
     void promiseDidBeginFulfillmentWithIdentifier(std::uint64_t promise) override {
         if (const auto to = target()) to->promiseDidBeginFulfillmentWithIdentifier(promise);
     }

@@ -1,8 +1,5 @@
-#include "checked/CheckedPlatform.h"
-
 #include <chrono>
 #include <functional>
-#include <optional>
 #include <utility>
 
 #include "contract/forwarding/ForwardingAppRegistry.h"
@@ -11,7 +8,7 @@
 #include "contract/forwarding/ForwardingFileSystem.h"
 #include "contract/forwarding/ForwardingSystemServices.h"
 #include "contract/forwarding/ForwardingWorkQueues.h"
-#include "tests/client/AppsClientFixture.h"
+#include "tests/checked/CheckedPlatformFixture.h"
 
 namespace appsync {
 namespace {
@@ -21,125 +18,7 @@ using testing::ElementsAre;
 using testing::HasSubstr;
 using testing::IsEmpty;
 
-/// Services that stand in the place of those of a platform.
-struct Replaced {
-    AppRegistry* registry = nullptr;
-    FileSystem* files = nullptr;
-    PropertyListSerialization* propertyLists = nullptr;
-    WorkQueues* queues = nullptr;
-    InstallCoordinatorService* coordination = nullptr;
-    HomeScreenService* homeScreen = nullptr;
-    LogFacility* log = nullptr;
-    BackupService* backup = nullptr;
-    DevicePolicyService* policy = nullptr;
-    InstallerService* installer = nullptr;
-};
-
-template <typename Service>
-Service& either(Service* replaced, Service& own) {
-    return replaced != nullptr ? *replaced : own;
-}
-
-Platform with(const Platform& full, const Replaced& replaced) {
-    return {.host = full.host,
-            .log = either(replaced.log, full.log),
-            .registry = either(replaced.registry, full.registry),
-            .installer = either(replaced.installer, full.installer),
-            .coordination = either(replaced.coordination, full.coordination),
-            .policy = either(replaced.policy, full.policy),
-            .backup = either(replaced.backup, full.backup),
-            .homeScreen = either(replaced.homeScreen, full.homeScreen),
-            .icons = full.icons,
-            .transactions = full.transactions,
-            .queues = either(replaced.queues, full.queues),
-            .files = either(replaced.files, full.files),
-            .propertyLists = either(replaced.propertyLists, full.propertyLists),
-            .notifications = full.notifications,
-            .notificationCenter = full.notificationCenter};
-}
-
-/// A device in memory, a platform that checks it or a part of it that is broken, and a client.
-class CheckedPlatformTest : public testing::TestWithParam<std::uint64_t> {
-  protected:
-    explicit CheckedPlatformTest(Scheduling scheduling = Scheduling::runToCompletion())
-        : platform_(codec_, scheduling) {}
-    ~CheckedPlatformTest() override {
-        client_.reset();
-        platform_.runUntilIdle();
-    }
-    CheckedPlatformTest(const CheckedPlatformTest&) = delete;
-    CheckedPlatformTest& operator=(const CheckedPlatformTest&) = delete;
-
-    void check(const Platform& platform) {
-        checked_.emplace(
-            platform,
-            CheckedPlatformOptions{
-                .sink = [this](const ContractBreach& breach) { breaches_.push_back(breach); },
-                .patience = seconds(30),
-                .lockPatience = seconds(20),
-                .currentThread =
-                    [this] {
-                        return reinterpret_cast<std::uintptr_t>(platform_.scheduler.current());
-                    }});
-    }
-    void checkWith(const Replaced& replaced) { check(with(platform_.services(), replaced)); }
-    void makeClient() { client_ = AppsClient::create(checked_->services()); }
-
-    void stage(const PropertyList& todoList) {
-        platform_.addPropertyList(std::string(kStagingArea) + "/ApplicationsSync.plist", todoList);
-    }
-    /// A session in which one application goes, one is updated, one comes and one does not.
-    void sync() {
-        platform_.registry.addApplication(kA);
-        platform_.registry.addApplication(kB);
-        stage(PropertyList::array({todoEntry(kA, kTodoRemove), todoEntry(kB, kTodoInstall),
-                                   todoEntry(kC, kTodoInstall),
-                                   todoEntry("com.example.d", kTodoInstall)}));
-        client_->reconcileSync(PropertyList::map(), "1", {}, nullptr);
-        static_cast<void>(client_->installedAssets());
-        static_cast<void>(client_->installedAssetMetrics());
-        for (const SyncAssetPointer& asset : client_->outstandingAssetTransfers()) transfer(asset);
-        client_->assetTransferEndedWithSuccess(true);
-        platform_.advance(seconds(60));
-        client_->syncEndedWithSuccess(true);
-        static_cast<void>(client_->installedAssets());
-    }
-    void transfer(const SyncAssetPointer& asset) {
-        asset->path = std::string(kPublicStaging) + "/" + asset->identifier + ".zip";
-        client_->assetTransferUpdatedProgress(asset, 0.5);
-        if (asset->identifier == "com.example.d") {
-            const ErrorRecord error = ErrorRecord::make(kSyncErrorDomain, 1, "it did not come");
-            client_->assetTransferSucceeded(asset, false, &error);
-            return;
-        }
-        platform_.files.addFile(*asset->path, "package");
-        client_->assetTransferSucceeded(asset, true, nullptr);
-    }
-    void restore() {
-        const auto metadata =
-            codec_.serialize(PropertyList::map({{"title", "Shown"}}), PropertyListFormat::Binary);
-        const PropertyList info = PropertyList::map({{"VessikMetadata", *metadata}});
-        platform_.files.addDirectory("/var/mobile/Library/Logs/MediaServices");
-        platform_.addPropertyList(std::string(kRestoreInfoPath),
-                                  PropertyList::map({{"com.example.e", info}}));
-        client_->reconcileRestoreOfType(2, nullptr);
-        platform_.advance(seconds(60));
-    }
-
-    /// What was told, "header: sentence (seen)".
-    [[nodiscard]] std::vector<std::string> told() const {
-        std::vector<std::string> texts;
-        for (const ContractBreach& breach : breaches_)
-            texts.push_back(breach.header + ": " + breach.sentence + " (" + breach.seen + ")");
-        return texts;
-    }
-
-    SystemPropertyLists codec_;
-    SimulatedPlatform platform_;
-    std::vector<ContractBreach> breaches_;
-    std::optional<CheckedPlatform> checked_;
-    std::shared_ptr<AppsClient> client_;
-};
+class CheckedPlatformTest : public CheckedPlatformFixture {};
 
 TEST_F(CheckedPlatformTest, SaysNothingOfAGoodPlatform) {
     check(platform_.services());
@@ -165,9 +44,10 @@ TEST_F(CheckedPlatformTest, SaysNothingOfAGoodPlatformThatCoordinates) {
 }
 
 /// The same in other orders.
-class CheckedSeeds : public CheckedPlatformTest {
+class CheckedSeeds : public CheckedPlatformFixture,
+                     public testing::WithParamInterface<std::uint64_t> {
   protected:
-    CheckedSeeds() : CheckedPlatformTest(Scheduling::seeded(GetParam())) {}
+    CheckedSeeds() : CheckedPlatformFixture(Scheduling::seeded(GetParam())) {}
 };
 
 INSTANTIATE_TEST_SUITE_P(, CheckedSeeds, testing::Range<std::uint64_t>(1, 101));
@@ -196,7 +76,7 @@ class IgnoringObserver : public AppRegistryObserver {
     int reports = 0;
 };
 
-class BrokenRegistryTest : public CheckedPlatformTest {
+class BrokenRegistryTest : public CheckedPlatformFixture {
   protected:
     void observe(AppRegistry& broken) {
         checkWith({.registry = &broken});
@@ -416,7 +296,7 @@ class FailingBadly : public ForwardingFileSystem {
     ErrorRecord error;
 };
 
-class BrokenServicesTest : public CheckedPlatformTest {};
+class BrokenServicesTest : public CheckedPlatformFixture {};
 
 TEST_F(BrokenServicesTest, ErrorsOfFilesWithoutDomainNumberOrSentence) {
     FailingBadly broken(platform_.files);
@@ -525,7 +405,8 @@ TEST_F(BrokenServicesTest, ACompletionThatIsLost) {
     checkWith({.coordination = &broken});
     checked_->services().coordination.uninstallApp(kA, [](const ErrorRecord*) {});
     platform_.advance(seconds(31));
-    EXPECT_THAT(told(), ElementsAre(HasSubstr("the completion was not called in time")));
+    EXPECT_THAT(told(),
+                ElementsAre(HasSubstr("the completion of uninstallApp was not called in time")));
 }
 
 TEST_F(BrokenServicesTest, ACompletionThatComesTwice) {
@@ -537,7 +418,7 @@ TEST_F(BrokenServicesTest, ACompletionThatComesTwice) {
     broken.completed(nullptr);
     broken.completed(nullptr);
     EXPECT_EQ(completions, 1);
-    EXPECT_THAT(told(), ElementsAre(HasSubstr("the completion was called again")));
+    EXPECT_THAT(told(), ElementsAre(HasSubstr("the completion of uninstallApp was called again")));
 }
 
 TEST_F(BrokenServicesTest, ACompletionOnTheCallersThread) {
