@@ -129,15 +129,25 @@ Status addHistory(Device& device, DeviceSession& session, bool isLogged) {
     return {};
 }
 
+std::set<std::string> installsUnderWay(const TimedEvents& events) {
+    std::set<std::string> identifiers;
+    for (const TimedEvent& each : events) {
+        const TimelineEventKind kind = each.event.kind;
+        if (kind == TimelineEventKind::InstallBegins) identifiers.insert(each.event.identifier);
+        const bool isOver =
+            kind == TimelineEventKind::InstallEnds || kind == TimelineEventKind::Cancelled;
+        if (isOver) identifiers.erase(each.event.identifier);
+    }
+    return identifiers;
+}
+
 /// An install that waits for its application to end: on the coordinated path only the device knows.
 Status addDenials(Device& device, DeviceSession& session) {
     const Result<std::vector<std::string>> running = device.running();
     if (!running) return running.error();
-    std::map<std::string, TimelineEventKind> last;
-    for (const TimedEvent& each : session.events) last[each.event.identifier] = each.event.kind;
+    const std::set<std::string> installing = installsUnderWay(session.events);
     for (const std::string& identifier : *running) {
-        const auto found = last.find(identifier);
-        if (found == last.end() || found->second != TimelineEventKind::InstallBegins) continue;
+        if (!installing.contains(identifier)) continue;
         const Result<ApplicationStatus> status = device.status(identifier);
         if (!status) return status.error();
         const WallTime latest = session.events.back().time;
