@@ -16,6 +16,7 @@
 #include "device/values/DevicePaths.h"
 #include "device/values/PackageIdentifier.h"
 #include "host/console/JsonWriting.h"
+#include "host/console/Problem.h"
 #include "host/output/JsonRecords.h"
 #include "host/output/WhyAnswer.h"
 #include "host/serve/ChangeEvents.h"
@@ -74,7 +75,8 @@ PageJson cardOf(const ServedDevice& device, const DeviceView& view) {
 HttpAnswer whyAnswer(Device& device, const std::string& identifier) {
     const Result<WhyAnswer> answer = whyOf(device, identifier);
     if (!answer) {
-        const bool isUnknown = answer.error().domain == "appsync" && answer.error().code == 1;
+        const bool isUnknown = answer.error().domain == kCommandErrorDomain &&
+                               exitStatusOf(answer.error()) == kExitSomethingFailed;
         return refusal(isUnknown ? 404 : 503, answer.error().description());
     }
     PageJson json = jsonOf(*answer);
