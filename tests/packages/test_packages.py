@@ -1,5 +1,6 @@
 """The Debian packages: what is in them, and what they are good for in an empty prefix."""
 
+import concurrent.futures
 import os
 import pathlib
 import re
@@ -71,6 +72,35 @@ def test_a_project_is_built_with_what_is_there_alone(prefix, tmp_path):
     assert "AppRegistry.installPackage" in run(tmp_path / "consumer")
 
 
+def complaints_of(compiler, headers, include):
+    """What a compiler says of each header that does not compile in a source file of its own."""
+
+    def compiled(header):
+        done = subprocess.run([compiler, "-std=c++20", "-fsyntax-only", "-Wall", "-Wextra", "-Werror", "-I", include,
+                               "-x", "c++", "-"], input='#include "%s"\n' % header, capture_output=True, text=True)
+        return "" if done.returncode == 0 else "%s: %s" % (header, done.stderr)
+
+    with concurrent.futures.ThreadPoolExecutor(2) as pool:
+        return [said for said in pool.map(compiled, headers) if said]
+
+
+@pytest.mark.parametrize("compiler", ["g++", "clang++"])
+def test_every_header_compiles_alone(prefix, compiler):
+    include = prefix / "include" / "appsync"
+    headers = sorted(path.relative_to(include) for path in include.rglob("*.h"))
+    rooms = {header.parts[0] for header in headers}
+    assert rooms == {"platform", "client", "system", "simulation", "checked", "recording", "contract"}
+    assert complaints_of(compiler, headers, include) == []
+
+
+@pytest.mark.parametrize("compiler", ["g++", "clang++"])
+def test_a_header_that_needs_another_one_before_it_is_found(tmp_path, compiler):
+    (tmp_path / "Alone.h").write_text("#pragma once\n#include <string>\nstd::string alone();\n")
+    (tmp_path / "Leans.h").write_text("#pragma once\nstd::string leans();\n")
+    complaints = complaints_of(compiler, ["Alone.h", "Leans.h"], tmp_path)
+    assert len(complaints) == 1 and complaints[0].startswith("Leans.h: ")
+
+
 def sought(prefix, place, components):
     """What CMake says where a project asks for these components."""
     place.mkdir()
@@ -101,6 +131,14 @@ def test_a_component_that_is_not_installed_is_named(without_system, tmp_path):
     assert sought(without_system, tmp_path / "all", "")[0] == 0
 
 
+def test_a_component_that_another_one_needs_is_named(without_system, tmp_path):
+    for path in (without_system / "lib" / "cmake" / "appsync").glob("appsync-plugin-targets*"):
+        path.unlink()
+    status, told = sought(without_system, tmp_path / "one", "COMPONENTS contract")
+    assert status != 0
+    assert "the component plugin of appsync, which contract needs, is not installed in %s" % without_system in told
+
+
 def test_a_component_that_appsync_has_not_is_named_with_those_that_it_has(prefix, tmp_path):
     status, told = sought(prefix, tmp_path / "project", "COMPONENTS plugin cloud")
     assert status != 0
@@ -129,7 +167,7 @@ LINES_OF_A_PORT = 300
 def port(prefix, tmp_path_factory):
     """The example of a port, built with the packages alone: its sources, and where it was built."""
     sources = tmp_path_factory.mktemp("port") / "sources"
-    shutil.copytree(TREE / "examples" / "port", sources)
+    shutil.copytree(prefix / "share" / "doc" / "appsync" / "examples" / "port", sources)
     built = sources.parent / "built"
     run("cmake", "-G", "Ninja", "-S", sources, "-B", built, "-DCMAKE_PREFIX_PATH=%s" % prefix,
         "-DCMAKE_CXX_FLAGS=-Wall -Wextra -Werror")
