@@ -90,14 +90,16 @@ std::string definitions() {
 std::string darkStyle() {
     std::string text = "<style>@media (prefers-color-scheme: dark) {\n";
     for (const Pen pen : kGroundPens) {
-        const std::string color = hexColor(colorOf(pen, true));
-        text += "rect." + className(pen) + ",text." + className(pen) + "{fill:" + color +
-                "} line." + className(pen) + "{stroke:" + color + "}\n";
+        const std::string name = "." + className(pen);
+        const std::string color = hexColor(colorOf(pen, true)) + "}";
+        text.append("rect").append(name).append(",text").append(name);
+        text.append("{fill:").append(color);
+        text.append(" line").append(name).append("{stroke:").append(color).append("\n");
     }
     return text + "}</style>\n";
 }
 
-std::string ended(std::string element, const char* name, const std::string& title) {
+std::string ended(const std::string& element, const char* name, const std::string& title) {
     if (title.empty()) return element + "/>\n";
     return element + "><title>" + escapedMarkup(title) + "</title></" + name + ">\n";
 }
