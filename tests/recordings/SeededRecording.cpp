@@ -30,6 +30,10 @@ std::string SeededRecording::record() {
     if (oneIn(3)) restore();
     sync();
     if (oneIn(8)) client_->prepareForBackup();
+    if (choices_.isEventful) {
+        if (oneIn(2)) sync();
+        askRareThings();
+    }
     world_.settle();
     world_.faults.stop();
     endClient();
@@ -50,6 +54,151 @@ void SeededRecording::arrange() {
     if (oneIn(10)) {
         world_.platform.policy.set(PolicyFeature::AppInstallationAllowed, PolicyAnswer::No);
     }
+    if (choices_.isEventful) arrangeEvents();
+}
+
+void SeededRecording::arrangeEvents() {
+    for (std::size_t i = 0; i < choices_.identifiers; ++i) arrangeApplication(identifier(i));
+    if (oneIn(2)) {
+        std::vector<std::string> last = someIdentifiers();
+        last.emplace_back("com.example.gone");
+        world_.platform.addPropertyList(std::string(kLastSyncAppStatePath),
+                                        PropertyList::strings(last));
+    }
+    if (oneIn(2)) world_.stageDemoted(someIdentifiers(), someIdentifiers());
+    arrangeServices();
+}
+
+void SeededRecording::arrangeApplication(const std::string& identifier) {
+    constexpr std::uint64_t kInstallTypes = 9;
+    constexpr std::uint64_t kStates = 6;
+    constexpr std::uint64_t kPhases = 4;
+    SimulatedAppRegistry& registry = world_.platform.registry;
+    if (oneIn(2)) {
+        registry.addApplication(identifier, oneIn(2) ? "0.9" : "1.0");
+        if (!oneIn(4)) {
+            const std::string path = registry.installed(identifier)->bundleContainerPath;
+            world_.platform.addPropertyList(path + "/VessikMetadata.plist", anyStoreMetadata());
+        }
+        if (oneIn(2)) world_.platform.homeScreen.setRunning(identifier, true);
+        if (oneIn(3)) world_.platform.installer.addUninstalled(identifier);
+    }
+    if (oneIn(3)) registry.addPlaceholder(identifier, random_() % kInstallTypes);
+    if (oneIn(3) && registry.placeholder(identifier)) {
+        registry.setProgress(identifier, {random_() % kStates, random_() % kPhases, 100, 10});
+    }
+    if (oneIn(3)) world_.platform.backup.addRestoreData(identifier);
+    if (oneIn(4)) {
+        AppProxy system;
+        system.applicationIdentifier = "com.korvu.system" + identifier;
+        system.bundleVersion = "1.0";
+        system.bundleContainerPath = "/private/" + identifier;
+        system.bundlePath = system.bundleContainerPath + "/System.app";
+        system.applicationType = "System";
+        system.installType = random_() % kInstallTypes;
+        system.state.placeholder = true;
+        registry.add(system);
+    }
+}
+
+void SeededRecording::arrangeServices() {
+    SimulatedPlatform& simulated = world_.platform;
+    const ErrorRecord refused = ErrorRecord::make("Installer", 1, "refused");
+    if (oneIn(3)) simulated.registry.failNextInstall(anyIdentifier(), refused);
+    if (oneIn(3)) simulated.registry.failNextPlaceholderInstall(anyIdentifier(), refused);
+    if (oneIn(3)) simulated.registry.failNextUninstall(anyIdentifier(), refused);
+    if (oneIn(4)) simulated.transfers.setCanCancelTransfers(false);
+    if (oneIn(4)) simulated.host.setTransferService(nullptr);
+    if (oneIn(4)) simulated.icons.failAt(static_cast<IconStep>(random_() % 4));
+    if (oneIn(4)) simulated.homeScreen.setReachable(false);
+    if (oneIn(4)) simulated.policy.set(PolicyFeature::AppRemovalAllowed, PolicyAnswer::No);
+    if (oneIn(4)) simulated.host.setRecoverableTest([](const ErrorRecord&) { return false; });
+    if (oneIn(3)) simulated.coordination.setPlaceholderDuration(std::chrono::seconds(12));
+}
+
+/// What a store may have written, and what it may not have.
+PropertyList SeededRecording::anyStoreMetadata() {
+    const auto oneOf = [this](std::vector<PropertyList> values) {
+        return values[random_() % values.size()];
+    };
+    PropertyList account = PropertyList::map();
+    if (!oneIn(4)) account.set("KorvuID", oneOf({"account 0", "account 1", 7}));
+    if (!oneIn(4)) account.set("QPPersonID", oneOf({7, 8, std::uint64_t{1} << 63U, "person"}));
+    if (!oneIn(4)) account.set("AltQPID", oneOf({"other", 7}));
+    PropertyList download = PropertyList::map();
+    if (!oneIn(4)) download.set("accountInfo", oneOf({account, account, account, "none"}));
+    PropertyList metadata = PropertyList::map({{"itemName", "Sold"}});
+    if (!oneIn(4)) metadata.set("korvuId", oneOf({"account 0", "account 0", 7}));
+    if (!oneIn(4)) {
+        metadata.set("com.korvu.VessikStore.downloadInfo",
+                     oneOf({download, download, download, "none"}));
+    }
+    if (oneIn(3)) metadata.set("launchProhibited", oneIn(2));
+    return metadata;
+}
+
+std::vector<std::string> SeededRecording::someIdentifiers() {
+    std::vector<std::string> some;
+    for (std::size_t i = 0; i < choices_.identifiers; ++i) {
+        if (oneIn(2)) some.push_back(identifier(i));
+    }
+    return some;
+}
+
+/// Restore information that lacks something, or has it in another form.
+void SeededRecording::stageEventfulRestore() {
+    const PropertyList metadata = anyStoreMetadata();
+    PropertyList info = PropertyList::map();
+    for (const std::string& each : someIdentifiers()) {
+        PropertyList entry = PropertyList::map();
+        const Bytes encoded =
+            oneIn(4) ? Bytes{1, 2} : *world_.codec.serialize(metadata, PropertyListFormat::Binary);
+        if (!oneIn(5)) entry.set("VessikMetadata", encoded);
+        if (!oneIn(5)) entry.set("ApplicationSINF", Bytes{9, 8, 7});
+        if (oneIn(2)) entry.set("PlaceholderIcon", Bytes{1, 2, 3, 4});
+        if (oneIn(8)) {
+            info.set(each, "none");
+        } else {
+            info.set(each, entry);
+        }
+    }
+    if (oneIn(6)) info.set("../com.example.unsafe", PropertyList::map());
+    world_.platform.addPropertyList(std::string(kRestoreInfoPath), info,
+                                    PropertyListFormat::Binary);
+}
+
+void SeededRecording::askRareThings() {
+    static_cast<void>(client_->currentSyncAnchor());
+    static_cast<void>(client_->korvuIDsForAssets());
+    static_cast<void>(client_->accountsForAssets());
+    static_cast<void>(client_->installedAssetMetrics());
+    client_->prepareForBackup();
+    if (oneIn(3)) client_->clearSyncData();
+}
+
+/// The package of an application that restores, and its data, or one of them.
+void SeededRecording::transferRestore() {
+    constexpr unsigned kBothParts = 3;
+    for (unsigned parts = 1; parts <= kBothParts; ++parts) {
+        if (oneIn(2)) continue;
+        auto asset = std::make_shared<SyncAsset>();
+        asset->identifier = anyIdentifier();
+        asset->dataclass = "Application";
+        asset->isRestore = true;
+        asset->completedParts = parts;
+        asset->variantOptions = PropertyList::map({{"Version", "1.0"}, {"AssetParts", parts}});
+        transfer(asset);
+    }
+}
+
+/// An entry of a todo list as few hosts write it.
+PropertyList SeededRecording::anyEntry(const std::string& identifier) {
+    static const std::vector<const char*> operations = {"install", "install",   "remove", "SENT",
+                                                        "FAILED",  "INSTALLED", "strange"};
+    PropertyList entry = World::entry(identifier, operations[random_() % operations.size()]);
+    if (oneIn(4)) entry.set("version", oneIn(2) ? PropertyList("2.0") : PropertyList(2));
+    if (oneIn(6)) entry.set("identifier", "../" + identifier);
+    return entry;
 }
 
 void SeededRecording::startClient() {
@@ -87,8 +236,11 @@ void SeededRecording::restore() {
         if (oneIn(2)) identifiers.push_back(identifier(i));
     }
     world_.stageRestore(identifiers);
+    if (choices_.isEventful && !oneIn(3)) stageEventfulRestore();
     std::optional<ErrorRecord> error;
-    static_cast<void>(client_->reconcileRestoreOfType(2, &error));
+    const bool isRare = choices_.isEventful && oneIn(3);
+    static_cast<void>(client_->reconcileRestoreOfType(
+        isRare ? static_cast<std::int64_t>(random_() % 4) : 2, &error));
 }
 
 void SeededRecording::sync() {
@@ -104,6 +256,7 @@ void SeededRecording::sync() {
     static_cast<void>(client_->installedAssetMetrics());
     static_cast<void>(client_->accountsForAssets());
     for (const SyncAssetPointer& asset : client_->outstandingAssetTransfers()) transfer(asset);
+    if (choices_.isEventful && oneIn(2)) transferRestore();
     const bool success = !oneIn(4);
     client_->assetTransferEndedWithSuccess(success);
     client_->syncEndedWithSuccess(success);
@@ -113,6 +266,10 @@ PropertyList SeededRecording::anyTodoList() {
     PropertyList list = PropertyList::array();
     for (std::size_t i = 0; i < choices_.identifiers; ++i) {
         if (oneIn(4)) continue;
+        if (choices_.isEventful && oneIn(3)) {
+            list.append(anyEntry(identifier(i)));
+            continue;
+        }
         list.append(World::entry(identifier(i), oneIn(4) ? "remove" : "install"));
     }
     return list;
@@ -149,6 +306,8 @@ void SeededRecording::transfer(const SyncAssetPointer& asset) {
         client_->assetTransferSucceeded(asset, false, oneIn(2) ? &lost : nullptr);
     } else {
         world_.receive(asset);
+        if (choices_.isEventful && oneIn(8)) asset->path = "../" + asset->identifier + ".zip";
+        if (choices_.isEventful && oneIn(8)) asset->isDownload = false;
         client_->assetTransferSucceeded(asset, true, nullptr);
     }
 }

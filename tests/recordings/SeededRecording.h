@@ -8,6 +8,7 @@
 #include <random>
 #include <string>
 #include <string_view>
+#include <vector>
 
 #include "platform/PlugInTable.h"
 #include "recording/RecordedClient.h"
@@ -36,6 +37,8 @@ class SeededRecording {
         /// Nothing: the seed decides.
         std::optional<bool> isCoordinated = std::nullopt;
         std::size_t identifiers = 6;
+        /// A device on which much has happened before, and hosts that ask and send what is rare.
+        bool isEventful = false;
     };
 
     explicit SeededRecording(std::uint64_t seed, Choices choices);
@@ -52,6 +55,15 @@ class SeededRecording {
     }
 
     void arrange();
+    void arrangeEvents();
+    void arrangeApplication(const std::string& identifier);
+    void arrangeServices();
+    void stageEventfulRestore();
+    void askRareThings();
+    void transferRestore();
+    [[nodiscard]] PropertyList anyStoreMetadata();
+    [[nodiscard]] std::vector<std::string> someIdentifiers();
+    [[nodiscard]] PropertyList anyEntry(const std::string& identifier);
     void startClient();
     void endClient();
     void restore();
