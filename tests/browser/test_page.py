@@ -148,14 +148,15 @@ def test_names_with_markup_are_only_text(appsync, tmp_path, serve, page):
     library = str(tmp_path / "library")
     packages.make_package(library, A, "<b>1</b>", name=MARKUP)
     device.sync(library)
-    page.open(serve(device.path), "#/phone/" + A)
+    served = serve(device.path)
+    page.open(served, "#/phone/" + A)
     page.wait("return document.getElementById('application-name')?.innerText === arguments[0]", MARKUP)
     page.wait_for_text(".versions", "<b>1</b>")
     assert [tile["name"] for tile in page.tiles()] == [MARKUP]
     assert page.tiles()[0]["label"].startswith(MARKUP)
     set_filter(page, "text", MARKUP)
     page.wait("return !document.getElementById('no-lines').hidden || document.querySelector('#lines .line')")
-    page.open(serve(device.path), "#/" + urllib.parse.quote(MARKUP, safe=""))
+    page.open(served, "#/" + urllib.parse.quote(MARKUP, safe=""))
     page.wait_for_text("#notice", f"There is no device called {MARKUP} here.")
     assert page.run("return window.owned === undefined && document.querySelector('main script, main b') === null")
 

@@ -6,7 +6,7 @@ import { ask, Coalesced, deviceUrl } from "./live.js";
 import { applicationState, clock, installType, size } from "./words.js";
 
 const ABSENT = { text: "The device has nothing of it." };
-const HISTORY_LENGTH = 50; // entries that are shown until all are asked for
+const HISTORY_LENGTH = 8; // entries that are shown until all are asked for
 
 export class ApplicationPanel {
   constructor(onClose, onLog) {
