@@ -160,9 +160,11 @@ DeviceViewer::DeviceViewer(std::string key) : key_(std::move(key)) {
     last_ = std::move(first);
 }
 
-std::shared_ptr<const DeviceView> DeviceViewer::show(const Result<DeviceReading>& reading) {
+std::shared_ptr<const DeviceView> DeviceViewer::show(const Result<DeviceReading>& reading,
+                                                     bool hasLog) {
     auto next = std::make_shared<DeviceView>(*last_);
     ++next->stamp;
+    next->hasTimeline = reading && hasLog;
     if (reading) {
         showReading(*next, *reading);
     } else {
@@ -175,7 +177,8 @@ std::shared_ptr<const DeviceView> DeviceViewer::show(const Result<DeviceReading>
         next->stateChanged == next->stamp || next->applicationsChanged == next->stamp ||
         next->coordinators.changed == next->stamp || next->session.changed == next->stamp;
     // What has no part in that, the free space for one, goes along with the next change.
-    if (hasChanged || next->status != last_->status) last_ = std::move(next);
+    if (hasChanged || next->status != last_->status || next->hasTimeline != last_->hasTimeline)
+        last_ = std::move(next);
     return last_;
 }
 
@@ -251,6 +254,9 @@ std::string viewText(const DeviceView& view, const std::string& name,
         appendMember(text, "coordinators", view.coordinators.json);
     }
     appendMember(text, "session", view.session.json);
+    appendMember(text, "timeline",
+                 view.hasTimeline ? dumped("/api/device/" + percentEncoded(name) + "/timeline.svg")
+                                  : std::string("null"));
     appendMember(text, "status", view.status);
     return text + "}";
 }

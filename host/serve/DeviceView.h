@@ -52,6 +52,8 @@ struct DeviceView {
     ViewedText screen;
     ViewedText coordinators;
     ViewedText session;
+    /// There may be a session to draw.
+    bool hasTimeline = false;
     /// As `status --json`; its space changes unnoticed.
     std::string status = "null";
 };
@@ -67,7 +69,8 @@ class DeviceViewer {
     explicit DeviceViewer(std::string key);
 
     /// The next view, of what was read; the same one again where nothing has changed.
-    [[nodiscard]] std::shared_ptr<const DeviceView> show(const Result<DeviceReading>& reading);
+    [[nodiscard]] std::shared_ptr<const DeviceView> show(const Result<DeviceReading>& reading,
+                                                         bool hasLog);
     /// The last one, with more in the log.
     [[nodiscard]] std::shared_ptr<const DeviceView> showLogChanged();
 

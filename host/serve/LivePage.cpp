@@ -24,6 +24,8 @@
 #include "host/serve/LogPage.h"
 #include "host/serve/PageFiles.h"
 #include "host/serve/ServedDevice.h"
+#include "host/timeline/TimelineOfDevice.h"
+#include "host/timeline/TimelineSvg.h"
 
 namespace appsync {
 namespace {
@@ -94,6 +96,16 @@ HttpAnswer historyAnswer(Device& device, const std::optional<std::string>& ident
         if (!identifier || each.identifier == *identifier) list.push_back(jsonOf(each));
     }
     return {.body = dumped(list)};
+}
+
+// Of the last session, or the one under way.
+HttpAnswer timelineAnswer(Device& device, const std::string& name) {
+    const Result<Timeline> timeline =
+        timelineOfDevice(device, name, {.now = std::chrono::system_clock::now()});
+    if (!timeline) return refusal(503, timeline.error().description());
+    return {.type = "image/svg+xml",
+            .body = timelineSvg(*timeline),
+            .policy = "default-src 'none'; style-src 'unsafe-inline'; sandbox"};
 }
 
 std::optional<LogQuestion> logQuestion(const HttpRequest& request) {
@@ -207,6 +219,10 @@ HttpAnswer LivePage::ofDevice(const std::shared_ptr<ServedDevice>& device,
     if (path.size() == 5) return applicationAnswer(*device, path[3], path[4]);
     if (path.size() != 4) return nothingHere();
     if (path[3] == "events") return {.events = eventsOf(device, bell_)};
+    if (path[3] == "timeline.svg") {
+        return device->answerSeldom(
+            [name = device->name()](Device& opened) { return timelineAnswer(opened, name); });
+    }
     if (path[3] == "log") return logAnswer(*device, request);
     if (path[3] == "history") {
         return device->answer([](Device& opened) { return historyAnswer(opened, std::nullopt); });

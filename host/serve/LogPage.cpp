@@ -158,14 +158,14 @@ LogLinesRead linesWithin(const std::vector<LogPiece>& pieces, std::uint64_t wind
                          const LogQuestion& question) {
     LogLinesRead read;
     std::uint64_t behind = 0;  // bytes of the pieces that follow
-    for (auto piece = pieces.rbegin(); piece != pieces.rend(); ++piece) behind += piece->size;
+    for (const LogPiece& piece : pieces) behind += piece.size;
     for (const LogPiece& piece : pieces) {
         behind -= piece.size;
         const std::uint64_t share = window > behind ? std::min(window - behind, piece.size) : 0;
         std::uint64_t from = piece.size - share;
         bool isWhole = from == 0;
         read.next = {piece.number, from};
-        (void)eachLine(piece, from, [&](std::string_view line, std::uint64_t end) {
+        eachLine(piece, from, [&](std::string_view line, std::uint64_t end) {
             read.next.offset = end;
             std::optional<std::string> shown;
             if (std::exchange(isWhole, true)) {

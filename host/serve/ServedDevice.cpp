@@ -93,6 +93,25 @@ HttpAnswer ServedDevice::answer(Question question) {
     return refusal(503, "the device cannot be read at the moment: try again");
 }
 
+HttpAnswer ServedDevice::answerSeldom(Question question) {
+    {
+        const std::lock_guard lock(mutex_);
+        if (seldomAnswer_ && ReadingClock::now() < seldomUntil_) return *seldomAnswer_;
+    }
+    return answer([this, question = std::move(question)](Device& device) {
+        const ReadingClock::time_point begin = ReadingClock::now();
+        HttpAnswer made = question(device);
+        keepSeldom(made, ReadingClock::now() - begin);
+        return made;
+    });
+}
+
+void ServedDevice::keepSeldom(const HttpAnswer& answer, ReadingClock::duration cost) {
+    const std::lock_guard lock(mutex_);
+    seldomAnswer_ = answer;
+    seldomUntil_ = ReadingClock::now() + (isUnderWay_ ? cost * kShareOfTime : cost * 0);
+}
+
 HttpAnswer ServedDevice::icon(const std::string& identifier) {
     std::shared_ptr<const DeviceView> shown = lastView();
     if (!shown) shown = view(ask(), kLongestAnswering);
@@ -129,7 +148,7 @@ void ServedDevice::run() {
         std::erase_if(questions, [](const auto& each) { return each->isAbandoned; });
         const std::uint64_t ticket = tickets_;
         lock.unlock();
-        work(std::move(questions));
+        work(questions);
         lock.lock();
         served_ = ticket;
         nextLook_ = ReadingClock::now() + kLookInterval;
@@ -151,7 +170,7 @@ void ServedDevice::waitForWork(std::unique_lock<std::mutex>& lock) {
     }
 }
 
-void ServedDevice::work(std::deque<std::shared_ptr<Asked>> questions) {
+void ServedDevice::work(const std::deque<std::shared_ptr<Asked>>& questions) {
     const DeviceStamp stamp = deviceStampOf(path_);
     const bool reads = hasToRead(stamp);
     if (reads || !questions.empty()) {
@@ -181,7 +200,7 @@ void ServedDevice::read(Result<std::unique_ptr<Device>>& device, const DeviceSta
     stamp_ = stamp;
     hasFailed_ = !reading;
     isUnderWay_ = reading && reading->moment.session.isUnderWay;
-    std::shared_ptr<const DeviceView> view = viewer_.show(reading);
+    std::shared_ptr<const DeviceView> view = viewer_.show(reading, stamp.log.size > 0);
     if (logGrew) view = viewer_.showLogChanged();
     publish(std::move(view));
     lastReading_ = ReadingClock::now();

@@ -51,6 +51,9 @@ class ServedDevice {
     /// What is to be asked of the device itself, and how the error of opening it is answered.
     using Question = std::function<HttpAnswer(Device& device)>;
     [[nodiscard]] HttpAnswer answer(Question question);
+    /// The same of the one question that takes long and is asked again and again: while a session
+    /// is under way the last answer stands until asking anew takes at most a thirtieth of the time.
+    [[nodiscard]] HttpAnswer answerSeldom(Question question);
 
     /// The icon as it is shown for an identifier; 204 where there is none.
     [[nodiscard]] HttpAnswer icon(const std::string& identifier);
@@ -75,12 +78,13 @@ class ServedDevice {
     void run();
     [[nodiscard]] bool hasToWork() const;
     void waitForWork(std::unique_lock<std::mutex>& lock);
-    void work(std::deque<std::shared_ptr<Asked>> questions);
+    void work(const std::deque<std::shared_ptr<Asked>>& questions);
     [[nodiscard]] bool hasToRead(const DeviceStamp& stamp) const;
     void read(Result<std::unique_ptr<Device>>& device, const DeviceStamp& stamp);
     void publish(std::shared_ptr<const DeviceView> view);
     void answerAll(const std::deque<std::shared_ptr<Asked>>& questions,
                    Result<std::unique_ptr<Device>>& device);
+    void keepSeldom(const HttpAnswer& answer, ReadingClock::duration cost);
     [[nodiscard]] HttpAnswer drawIcon(Device& device, const ApplicationRecord& record);
 
     const std::string path_;
@@ -99,6 +103,8 @@ class ServedDevice {
     ReadingClock::time_point nextLook_;
     std::map<std::string, Bytes> icons_;  // by bundle
     std::size_t iconBytes_ = 0;
+    std::optional<HttpAnswer> seldomAnswer_;
+    ReadingClock::time_point seldomUntil_;
     std::thread thread_;  // from the first time that somebody wants something
 
     // The thread's own.

@@ -356,6 +356,21 @@ def waiting(view):
 
 
 @ON_ONE_PATH
+def test_the_timeline_of_the_last_session_is_drawn(appsync, device, library, serving):
+    assert serving.view()["timeline"] is None
+    device.sync(library)
+    address = serving.view()["timeline"]
+    status, headers, body = serving.ask(address)
+    assert (status, headers["Content-Type"]) == (200, "image/svg+xml") and body.startswith(b"<")
+    assert all(each.encode() in body for each in IDS)
+    assert headers.get_all("Content-Security-Policy") == [
+        "default-src 'none'; style-src 'unsafe-inline'; sandbox"]
+    packages.make_package(library, "com.example.later")
+    device.sync(library)
+    assert b"com.example.later" in serving.ask(address)[2]
+
+
+@ON_ONE_PATH
 def test_a_killed_session_is_seen_though_no_file_changes(appsync, device, library):
     device.sync(library)
     packages.make_library(library, 1, "2.0")

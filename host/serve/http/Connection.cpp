@@ -48,11 +48,9 @@ std::string_view Connection::rest() const {
 
 void Connection::take(std::size_t count) { taken_ += std::min(count, headSize_ - taken_); }
 
-void Connection::allow(std::chrono::steady_clock::duration time) {
-    deadline_ = ConnectionClock::now() + time;
-}
-
 bool Connection::write(std::string_view bytes) {
+    const Time deadline =
+        ConnectionClock::now() + kLongestSending + std::chrono::seconds(bytes.size() / kLeastRate);
     while (!bytes.empty()) {
         const ssize_t count =
             ::send(socket_.get(), bytes.data(), bytes.size(), MSG_NOSIGNAL | MSG_DONTWAIT);
@@ -62,7 +60,7 @@ bool Connection::write(std::string_view bytes) {
         }
         if (count < 0 && errno == EINTR) continue;
         if (count < 0 && errno != EAGAIN && errno != EWOULDBLOCK) return false;
-        if (!waitFor(POLLOUT, deadline_)) return false;
+        if (!waitFor(POLLOUT, deadline)) return false;
     }
     return true;
 }

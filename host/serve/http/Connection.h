@@ -13,7 +13,8 @@ namespace appsync {
 inline constexpr std::size_t kLongestHead = std::size_t{16} << 10U;
 inline constexpr std::chrono::seconds kLongestIdle{5};
 inline constexpr std::chrono::seconds kLongestSending{5};
-inline constexpr std::chrono::seconds kLongestAnswer{30};
+// A piece of an answer has as long, and a second more for each of these bytes of it.
+inline constexpr std::size_t kLeastRate = std::size_t{100} << 10U;
 
 /// One connection of a server's: reads no more than the heads of requests, and waits for nobody
 /// longer than the bounds above say. Used by one thread; `shutDown` may be called on any.
@@ -33,9 +34,7 @@ class Connection {
     [[nodiscard]] std::string_view rest() const;
     void take(std::size_t count);
 
-    /// The answer has this long from now on.
-    void allow(std::chrono::steady_clock::duration time);
-    /// Whether all of it went to the system in that time.
+    /// Whether all of it went to the system in time.
     [[nodiscard]] bool write(std::string_view bytes);
 
     /// No more is read or written; whoever waits goes on.
@@ -57,7 +56,6 @@ class Connection {
     std::string buffer_;        // the head, and what has been received behind it
     std::size_t headSize_ = 0;  // 0 where it is not whole
     std::size_t taken_ = 0;     // of the head
-    Time deadline_;             // of what is written
 };
 
 }  // namespace appsync

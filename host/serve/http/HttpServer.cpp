@@ -153,8 +153,6 @@ struct Served {
     std::thread thread;
 };
 
-thread_local Connection* servedHere = nullptr;  // the connection that this thread serves
-
 }  // namespace
 
 HttpAnswer refusal(int status, const std::string& message) {
@@ -188,7 +186,6 @@ namespace {
 void refuseAtOnce(Connection& connection, int status, std::string_view reason,
                   const std::string& message) {
     const std::string body = messageBody(message);
-    connection.allow(std::chrono::seconds(1));
     const bool isTold =
         connection.write("HTTP/1.1 " + std::to_string(status) + " " + std::string(reason) +
                          "\r\nContent-Type: application/json\r\nX-Content-Type-Options: nosniff\r\n"
@@ -216,7 +213,6 @@ Result<UniqueFd> listenOnLoopback(std::uint16_t port) {
     address.sin_family = AF_INET;
     address.sin_port = htons(port);
     address.sin_addr.s_addr = htonl(INADDR_LOOPBACK);
-    // NOLINTNEXTLINE(cppcoreguidelines-pro-type-reinterpret-cast): as the call wants it
     const auto* generic = reinterpret_cast<const sockaddr*>(&address);
     if (::bind(listener.get(), generic, sizeof(address)) != 0 ||
         ::listen(listener.get(), kBacklog) != 0) {
@@ -228,7 +224,6 @@ Result<UniqueFd> listenOnLoopback(std::uint16_t port) {
 Result<std::uint16_t> portOf(const UniqueFd& listener) {
     sockaddr_in address{};
     socklen_t size = sizeof(address);
-    // NOLINTNEXTLINE(cppcoreguidelines-pro-type-reinterpret-cast): as the call wants it
     auto* generic = reinterpret_cast<sockaddr*>(&address);
     if (::getsockname(listener.get(), generic, &size) != 0) {
         return posixError(errno, "look at", "the port");
@@ -294,6 +289,10 @@ void HttpServer::State::give(const httplib::Request& request, HttpAnswer answer,
                         answer.keptSeconds == 0
                             ? "no-store"
                             : "private, immutable, max-age=" + std::to_string(answer.keptSeconds));
+    if (!answer.policy.empty()) {
+        response.headers.erase("Content-Security-Policy");
+        response.set_header("Content-Security-Policy", answer.policy);
+    }
     if (answer.status == 405) response.set_header("Allow", "GET, HEAD");
     if (answer.events && request.method != "HEAD") return giveEvents(answer.events, response);
     response.set_content(answer.body, answer.type);
@@ -305,7 +304,6 @@ void HttpServer::State::giveEvents(const std::shared_ptr<EventStream>& events,
     response.set_chunked_content_provider(
         "text/event-stream", [events, inFlight](std::size_t, httplib::DataSink& sink) {
             const std::optional<std::string> next = events->next();
-            if (servedHere != nullptr) servedHere->allow(kLongestSending);
             if (next) return sink.write(next->data(), next->size());
             sink.done();
             return true;
@@ -313,11 +311,9 @@ void HttpServer::State::giveEvents(const std::shared_ptr<EventStream>& events,
 }
 
 void HttpServer::State::serve(Connection& connection) {
-    servedHere = &connection;
     Connection::Head head = connection.readHead();
     bool goesOn = true;
     while (goesOn && head == Connection::Head::Whole) {
-        connection.allow(kLongestAnswer);
         goesOn = protocol.exchange(connection);
         if (goesOn) head = connection.readHead();
     }
@@ -347,9 +343,12 @@ void HttpServer::State::begin(UniqueFd socket) {
     Served& added = served.emplace_back(std::move(socket));
     try {
         added.thread = std::thread([this, &added, isFull] {
-            isFull ? refuseAtOnce(added.connection, 503, "Service Unavailable",
-                                  "too many connections at once: try again")
-                   : serve(added.connection);
+            if (isFull) {
+                refuseAtOnce(added.connection, 503, "Service Unavailable",
+                             "too many connections at once: try again");
+            } else {
+                serve(added.connection);
+            }
             added.connection.shutDown();
             added.isOver = true;
         });

@@ -41,6 +41,8 @@ struct HttpAnswer {
     std::string body = {};
     /// For how many seconds it may be kept; 0: not at all.
     int keptSeconds = 0;
+    /// What it may do as a document of its own; empty: what the page may.
+    std::string policy = {};
     /// In place of a body.
     std::shared_ptr<EventStream> events = nullptr;
 };
