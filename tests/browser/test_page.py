@@ -49,6 +49,24 @@ def test_a_sync_is_seen_without_a_reload(appsync, tmp_path, serve, page):
     page.wait("return document.querySelector('#icons img').naturalWidth > 0")
 
 
+def test_the_timeline_of_a_session_grows(appsync, tmp_path, serve, page):
+    device = device_of(appsync, tmp_path, 1)
+    appsync("run", device.path, A)
+    page.open(serve(device.path))
+    sync = appsync.start("sync", device.path, library_of(tmp_path, 1, "newer", version="2.0"), "--json")
+    page.wait_for_text("#waits", "running application")
+    page.wait("return document.getElementById('timeline-picture').naturalWidth > 0")
+    shown = page.run("return document.getElementById('timeline-picture').src")
+    appsync("quit", device.path, A)
+    sync.communicate()
+    page.wait_for_text("#session-badge", "none under way")
+    page.wait("return document.getElementById('timeline-picture').src !== arguments[0]", shown)
+    with urllib.request.urlopen(page.run("return document.getElementById('timeline-link').href")) as answer:
+        drawn = answer.read().decode()
+    assert "App00" in drawn or A in drawn
+    assert page.run("return document.getElementById('timeline-picture').naturalWidth > 0")
+
+
 def test_a_waiting_install_says_for_whom_and_goes_on(appsync, tmp_path, serve, page):
     device = device_of(appsync, tmp_path)
     appsync("run", device.path, A)
