@@ -10,7 +10,7 @@ namespace appsync {
 
 namespace {
 
-constexpr std::chrono::milliseconds kLookInterval{250};
+constexpr std::chrono::milliseconds kStampInterval{250};
 // Longer than any reading of a device that is not in somebody's way.
 constexpr std::chrono::seconds kLongestAnswering{3};
 constexpr int kShareOfTime = 30;
@@ -151,7 +151,7 @@ void ServedDevice::run() {
         work(questions);
         lock.lock();
         served_ = ticket;
-        nextLook_ = ReadingClock::now() + kLookInterval;
+        nextLook_ = ReadingClock::now() + kStampInterval;
         changed_.notify_all();
     }
 }
