@@ -1,6 +1,7 @@
 #include "device/coordination/CoordinationHerald.h"
 
 #include <algorithm>
+#include <chrono>
 #include <iterator>
 #include <system_error>
 #include <utility>
@@ -10,6 +11,8 @@
 namespace appsync {
 
 namespace {
+
+constexpr std::chrono::milliseconds kMoment{2};
 
 // Whom this thread helps.
 thread_local const CoordinationHerald* helped = nullptr;
@@ -129,7 +132,7 @@ void CoordinationHerald::release(const LiveCoordinator& coordinator) {
 
 // With the lock held.
 void CoordinationHerald::wake() {
-    wakes_.notify_all();
+    if (isIdle_) wakes_.notify_all();
     if (thread_.joinable()) return;
     try {
         thread_ = std::thread([this] { work(); });
@@ -157,9 +160,13 @@ void CoordinationHerald::close() {
 void CoordinationHerald::work() {
     std::unique_lock lock(mutex_);
     while (true) {
+        isIdle_ = true;
         wakes_.wait(lock, [this] { return closing_ || (!news_.empty() && !isTelling_); });
+        isIdle_ = false;
         if (closing_) return;
         deliverAll(lock);
+        // What comes within a moment need not wake anybody.
+        wakes_.wait_for(lock, kMoment, [this] { return closing_; });
     }
 }
 

@@ -81,6 +81,7 @@ class CoordinationHerald {
     // Protected by mutex_.
     std::condition_variable wakes_;
     bool isTelling_ = false;  // some thread delivers news, until there is none
+    bool isIdle_ = false;     // the own thread waits to be woken
     std::deque<News> news_;
     std::map<std::int64_t, std::vector<News>> held_;  // by the ids of their coordinators
     bool closing_ = false;
