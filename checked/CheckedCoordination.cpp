@@ -44,7 +44,7 @@ InstallCoordinatorService::Coordinator CheckedCoordination::coordinator(
 }
 
 void CheckedCoordination::checkFound(const Coordinator& found, const std::string& identifier,
-                                     CoordinationClient client, Creation creation) {
+                                     CoordinationClient client, Creation creation) const {
     if (found.error) book_->checkHasDomain(*found.error, "the coordination service");
     if (found.coordinator == nullptr) return;
     if (creation == Creation::OnlyExisting && found.wasCreated)
@@ -66,7 +66,7 @@ void CheckedCoordination::checkFound(const Coordinator& found, const std::string
 }
 
 void CheckedCoordination::checkIdentifier(const InstallCoordinator& found,
-                                          const std::string& identifier) {
+                                          const std::string& identifier) const {
     if (!isLegalIdentifier(identifier))
         book_->broken(
             "platform/InstallCoordinatorService.h",

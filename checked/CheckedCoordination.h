@@ -48,8 +48,8 @@ class CheckedCoordination final : public InstallCoordinatorService {
 
   private:
     void checkFound(const Coordinator& found, const std::string& identifier,
-                    CoordinationClient client, Creation creation);
-    void checkIdentifier(const InstallCoordinator& found, const std::string& identifier);
+                    CoordinationClient client, Creation creation) const;
+    void checkIdentifier(const InstallCoordinator& found, const std::string& identifier) const;
 
     InstallCoordinatorService& service_;
     WorkQueues& queues_;

@@ -148,7 +148,7 @@ Status CheckedCoordinator::setPlaceholderPromise(
     return status;
 }
 
-void CheckedCoordinator::checkPlaceholder(const InstallPlaceholder* placeholder) {
+void CheckedCoordinator::checkPlaceholder(const InstallPlaceholder* placeholder) const {
     if (placeholder == nullptr) {
         brokenRefusal("null was taken for a placeholder");
         return;

@@ -50,7 +50,7 @@ class CheckedCoordinator final : public ForwardingCoordinator {
     Status setOnce(std::string_view piece, const Has& has, const Set& set);
     template <typename Set>
     Status setUntilCancelled(std::string_view piece, const Set& set);
-    void checkPlaceholder(const InstallPlaceholder* placeholder);
+    void checkPlaceholder(const InstallPlaceholder* placeholder) const;
     void brokenOnce(const std::string& seen) const;
     void brokenRefusal(const std::string& seen) const;
 
