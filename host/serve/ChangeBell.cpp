@@ -18,6 +18,11 @@ void ChangeBell::waitBeyond(std::uint64_t rings, std::chrono::milliseconds longe
     rung_.wait_for(lock, longest, [&] { return isSilenced_ || rings_ > rings; });
 }
 
+void ChangeBell::waitForSilence(std::chrono::milliseconds longest) const {
+    std::unique_lock lock(mutex_);
+    if (longest.count() > 0) rung_.wait_for(lock, longest, [&] { return isSilenced_; });
+}
+
 void ChangeBell::silence() {
     const std::lock_guard lock(mutex_);
     isSilenced_ = true;

@@ -17,6 +17,9 @@ class ChangeBell {
     /// until it is silenced.
     void waitBeyond(std::uint64_t rings, std::chrono::milliseconds longest) const;
 
+    /// Waits that long, or until it is silenced; not at all where the time is negative.
+    void waitForSilence(std::chrono::milliseconds longest) const;
+
     /// It is over: nobody waits any more.
     void silence();
     [[nodiscard]] bool isSilenced() const;

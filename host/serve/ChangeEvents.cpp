@@ -21,6 +21,8 @@ using EventClock = std::chrono::steady_clock;
 
 constexpr std::chrono::seconds kHeartbeat{10};
 constexpr std::chrono::milliseconds kFolderGlance{1000};
+// Each makes a page ask for what is new.
+constexpr std::chrono::milliseconds kBetweenEvents{250};
 
 std::string eventText(const nlohmann::ordered_json& data) {
     return "event: device\ndata: " + dumped(data) + "\n\n";
@@ -57,11 +59,16 @@ class BellEvents : public EventStream {
         : bell_(bell), longestWait_(longestWait) {}
 
     [[nodiscard]] std::optional<std::string> next() final {
+        bell_.waitForSilence(std::chrono::ceil<std::chrono::milliseconds>(
+            lastNews_ + kBetweenEvents - EventClock::now()));
         const EventClock::time_point heartbeat = EventClock::now() + kHeartbeat;
         while (!bell_.isSilenced()) {
             const std::uint64_t rings = bell_.rings();
             std::string text = news();
-            if (!text.empty()) return text;
+            if (!text.empty()) {
+                lastNews_ = EventClock::now();
+                return text;
+            }
             const auto left =
                 std::chrono::ceil<std::chrono::milliseconds>(heartbeat - EventClock::now());
             if (left.count() <= 0) return ": nothing new\n\n";
@@ -76,6 +83,7 @@ class BellEvents : public EventStream {
   private:
     const ChangeBell& bell_;
     const std::chrono::milliseconds longestWait_;
+    EventClock::time_point lastNews_;
 };
 
 class DeviceEvents final : public BellEvents {

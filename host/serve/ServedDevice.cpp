@@ -178,8 +178,11 @@ void ServedDevice::work(const std::deque<std::shared_ptr<Asked>>& questions) {
         if (reads) read(device, stamp);
         answerAll(questions, device);
     }
-    if (!reads && !(stamp.log == stamp_->log)) {
+    const bool tellsOfLog = !reads && !(stamp.log == stamp_->log) &&
+                            ReadingClock::now() - lastLogChange_ >= kStampInterval;
+    if (tellsOfLog) {
         stamp_->log = stamp.log;
+        lastLogChange_ = ReadingClock::now();
         publish(viewer_.showLogChanged());
     }
 }

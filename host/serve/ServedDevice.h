@@ -113,7 +113,8 @@ class ServedDevice {
     bool isUnderWay_ = false;
     bool hasFailed_ = false;
     ReadingClock::time_point lastReading_;
-    ReadingClock::duration pause_{};  // until the next one
+    ReadingClock::time_point lastLogChange_;  // that was told
+    ReadingClock::duration pause_{};          // until the next one
 };
 
 }  // namespace appsync

@@ -371,6 +371,20 @@ def test_the_timeline_of_the_last_session_is_drawn(appsync, device, library, ser
 
 
 @ON_ONE_PATH
+def test_events_come_four_times_a_second_at_most(appsync, device, serving):
+    path = os.path.join(device.path, "log", "system.log")
+    events = Events(serving, "/api/device/device/events")
+    events.next()
+    begin = time.monotonic()
+    for _ in range(3):
+        with open(path, "a") as file:
+            file.write(LINE % (1, 8, "info", "more"))
+        serving.view()  # who asks does not make it tell sooner
+        assert events.next()["changed"] == ["log"]
+    assert time.monotonic() - begin >= 0.7
+
+
+@ON_ONE_PATH
 def test_a_killed_session_is_seen_though_no_file_changes(appsync, device, library):
     device.sync(library)
     packages.make_library(library, 1, "2.0")
