@@ -52,8 +52,10 @@ std::optional<std::size_t> indexedFind(const PropertyListKeyIndex& index, std::u
 /// A bit that equal keys have in common. Few keys share one with another.
 std::uint64_t markOf(std::string_view key) {
     if (key.empty()) return 1;
-    const auto at = [key](std::size_t i) { return static_cast<unsigned char>(key[i]); };
-    return std::uint64_t{1} << ((key.size() * 7 + at(0) * 3U + at(key.size() - 1)) & 63U);
+    const auto at = [key](std::size_t i) -> std::size_t {
+        return static_cast<unsigned char>(key[i]);
+    };
+    return std::uint64_t{1} << ((key.size() * 7 + at(0) * 3 + at(key.size() - 1)) & 63U);
 }
 
 std::optional<std::size_t> repeatedAmongFew(Entries entries) {
