@@ -79,6 +79,8 @@ export class SessionView {
       byId("timeline-link").href = this.wanted;
       show(byId("timeline"), true);
     });
+    // The device cannot be read at this moment.
+    next.addEventListener("error", () => setTimeout(() => this.shownPicture === url && this.wanted && this.load(url), PICTURE_MS));
     next.src = url;
   }
 }
