@@ -447,9 +447,9 @@ struct EarlierObserversHearToo : ForwardingCoordination {
         Coordinator(const Handle& target, EarlierObserversHearToo& all)
             : ForwardingCoordinator(target), service(all) {}
         void setObserver(WeakListener observer) override {
-            WeakListener& earlier = service.earlier[bundleIdentifier().value_or("")];
-            service.kept.push_back(std::make_shared<Both>(observer, earlier));
-            earlier = observer;
+            WeakListener& former = service.earlier[bundleIdentifier().value_or("")];
+            service.kept.push_back(std::make_shared<Both>(observer, former));
+            former = observer;
             target()->setObserver(service.kept.back());
         }
         EarlierObserversHearToo& service;
