@@ -65,7 +65,7 @@ TEST_P(AppRegistryContract, AnUpdateReplacesTheVersion) {
            "before.");
     ASSERT_TRUE(installPackage({kA, "1.0"}));
     ASSERT_TRUE(installPackage({kA, "2.0"}));
-    EXPECT_EQ(application(kA)->bundleVersion, "2.0");
+    EXPECT_EQ(application(kA).value().bundleVersion, "2.0");
     EXPECT_THAT(bundles(AppRegistry::kEveryBundle), ElementsAre(kA));
 }
 
@@ -150,7 +150,7 @@ TEST_P(AppRegistryContract, APlaceholderIsACopy) {
            "Installs a directory as a placeholder; the registry takes its own copy, and leaves the "
            "directory to whoever made it.");
     ASSERT_TRUE(installPlaceholder({kA}, kInstallTypeSync));  // removes what was copied
-    EXPECT_TRUE(services_.files.itemExists(preferred(kA)->bundlePath + "/Info.plist"));
+    EXPECT_TRUE(services_.files.itemExists(preferred(kA).value().bundlePath + "/Info.plist"));
 }
 
 TEST_P(AppRegistryContract, StoreMetadataAndSinfMayComeWithAPlaceholder) {
@@ -162,7 +162,7 @@ TEST_P(AppRegistryContract, StoreMetadataAndSinfMayComeWithAPlaceholder) {
     options.set(StoreMetadataKey, Bytes{1, 2, 3});
     options.set(AppSinfKey, PropertyList());
     EXPECT_TRUE(registry_.installPlaceholderBundle(FileURL::fromPath(path, true).value(), options));
-    EXPECT_EQ(preferred(kA)->installType, std::uint64_t{kInstallTypeRestore});
+    EXPECT_EQ(preferred(kA).value().installType, std::uint64_t{kInstallTypeRestore});
 }
 
 TEST_P(AppRegistryContract, StoreMetadataComesToStandInTheContainer) {
@@ -176,8 +176,8 @@ TEST_P(AppRegistryContract, StoreMetadataComesToStandInTheContainer) {
     PropertyList options = placeholderOptions(kA, kInstallTypeRestore);
     options.set(StoreMetadataKey, *metadata);
     ASSERT_TRUE(registry_.installPlaceholderBundle(FileURL::fromPath(path, true).value(), options));
-    const Result<Bytes> written =
-        services_.files.readFile(preferred(kA)->bundleContainerPath + "/VessikMetadata.plist");
+    const Result<Bytes> written = services_.files.readFile(
+        preferred(kA).value().bundleContainerPath + "/VessikMetadata.plist");
     ASSERT_TRUE(written) << written.error().description();
     EXPECT_EQ(*written, *metadata);
 }
@@ -185,7 +185,7 @@ TEST_P(AppRegistryContract, StoreMetadataComesToStandInTheContainer) {
 TEST_P(AppRegistryContract, ABundleTakesRoomOnDisk) {
     checks("platform/AppRegistry.h", "Bytes that the bundle takes on disk.");
     ASSERT_TRUE(installPackage({kA}));
-    EXPECT_GT(application(kA)->staticDiskUsage, 0U);
+    EXPECT_GT(application(kA).value().staticDiskUsage, 0U);
 }
 
 TEST_P(AppRegistryContract, AMissingPlaceholderBundleIsRefused) {
@@ -201,9 +201,9 @@ TEST_P(AppRegistryContract, APlaceholderCoversTheApplication) {
            "An installed application that the placeholder covers stays usable;");
     ASSERT_TRUE(installPackage({kA, "1.0"}));
     ASSERT_TRUE(installPlaceholder({kA, "2.0"}, kInstallTypeSync));
-    EXPECT_EQ(application(kA)->bundleVersion, "1.0");
-    EXPECT_EQ(preferred(kA)->bundleVersion, "2.0");
-    EXPECT_TRUE(services_.files.itemExists(application(kA)->bundlePath));
+    EXPECT_EQ(application(kA).value().bundleVersion, "1.0");
+    EXPECT_EQ(preferred(kA).value().bundleVersion, "2.0");
+    EXPECT_TRUE(services_.files.itemExists(application(kA).value().bundlePath));
     checks("platform/AppRegistry.h",
            "An update under way has both: the installed application, and the placeholder that "
            "covers it.");
@@ -216,7 +216,7 @@ TEST_P(AppRegistryContract, InstallingThePackageTakesThePlaceholderAway) {
            "before.");
     ASSERT_TRUE(installPlaceholder({kA, "2.0"}, kInstallTypeSync));
     ASSERT_TRUE(installPackage({kA, "2.0"}));
-    EXPECT_TRUE(preferred(kA)->state.installed);
+    EXPECT_TRUE(preferred(kA).value().state.installed);
     EXPECT_THAT(bundles(AppRegistry::kEveryBundle), ElementsAre(kA));
 }
 
@@ -227,8 +227,8 @@ TEST_P(AppRegistryContract, AFailedInstallLeavesBothAsTheyWere) {
     ASSERT_TRUE(installPackage({kA, "1.0"}));
     ASSERT_TRUE(installPlaceholder({kA, "2.0"}, kInstallTypeSync));
     EXPECT_FALSE(installFrom(device_->addPackage({kB}), kA));
-    EXPECT_EQ(application(kA)->bundleVersion, "1.0");
-    EXPECT_EQ(preferred(kA)->bundleVersion, "2.0");
+    EXPECT_EQ(application(kA).value().bundleVersion, "1.0");
+    EXPECT_EQ(preferred(kA).value().bundleVersion, "2.0");
     EXPECT_NE(progress(kA), nullptr);
 }
 
@@ -260,7 +260,7 @@ TEST_P(AppRegistryContract, AnUninstallLimitedToPlaceholdersSparesTheApplication
 TEST_P(AppRegistryContract, UninstallingRemovesTheFiles) {
     checks("platform/AppRegistry.h", "What is removed goes with its container.");
     ASSERT_TRUE(installPackage({kA}));
-    const std::string container = application(kA)->bundleContainerPath;
+    const std::string container = application(kA).value().bundleContainerPath;
     ASSERT_TRUE(registry_.uninstallApplication(kA, {}));
     EXPECT_FALSE(services_.files.itemExists(container));
 }

@@ -409,7 +409,7 @@ TEST_P(CoordinationContract, ThePackageIsInstalledWhenItsPromiseIsKept) {
     EXPECT_THAT(observer_->heard(),
                 ElementsAre("placeholder com.example.a", "complete com.example.a"));
     ASSERT_TRUE(application(kA));
-    EXPECT_EQ(application(kA)->bundleVersion, "2.5");
+    EXPECT_EQ(application(kA).value().bundleVersion, "2.5");
     EXPECT_THAT(bundles(AppRegistry::kEveryBundle), ElementsAre(kA));
     EXPECT_FALSE(coordinator->error());
     EXPECT_EQ(service_.existingCoordinator(kA, SyncClientID), nullptr);
@@ -425,10 +425,10 @@ TEST_P(CoordinationContract, AnUpdateReplacesTheVersion) {
            "service installs on threads of its own, and the coordinator is gone afterwards.");
     ASSERT_TRUE(installPackage({kA, "1.0"}));
     const auto coordinator = prepared(Kind::Updating, kA);
-    EXPECT_EQ(application(kA)->bundleVersion, "1.0");
+    EXPECT_EQ(application(kA).value().bundleVersion, "1.0");
     keepAsset(*coordinator, device_->addPackage({kA, "2.0"}));
     observer_->waitForOne();
-    EXPECT_EQ(application(kA)->bundleVersion, "2.0");
+    EXPECT_EQ(application(kA).value().bundleVersion, "2.0");
     EXPECT_THAT(bundles(AppRegistry::kEveryBundle), ElementsAre(kA));
 }
 
@@ -471,7 +471,7 @@ TEST_P(CoordinationContract, AFailedInstallKeepsTheOldVersionAndTakesThePlacehol
     EXPECT_THAT(observer_->heard(),
                 ElementsAre("placeholder com.example.a", "complete com.example.a, failed"));
     EXPECT_TRUE(coordinator->error());
-    EXPECT_EQ(application(kA)->bundleVersion, "1.0");
+    EXPECT_EQ(application(kA).value().bundleVersion, "1.0");
     EXPECT_THAT(bundles(AppRegistry::kEveryBundle), ElementsAre(kA));
     EXPECT_EQ(service_.existingCoordinator(kA, SyncClientID), nullptr);
 }
@@ -534,7 +534,7 @@ TEST_P(CoordinationContract, ACancelTakesThePlaceholderAndKeepsTheVersion) {
     checks("platform/InstallCoordinator.h",
            "Ends it: its placeholder goes, its promises are given up, an installed version stays.");
     EXPECT_THAT(bundles(AppRegistry::kEveryBundle), ElementsAre(kA));
-    EXPECT_EQ(application(kA)->bundleVersion, "1.0");
+    EXPECT_EQ(application(kA).value().bundleVersion, "1.0");
     EXPECT_EQ(coordinator->error(), reason());
     EXPECT_EQ(service_.existingCoordinator(kA, SyncClientID), nullptr);
 }

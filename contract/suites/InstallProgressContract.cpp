@@ -78,7 +78,7 @@ TEST_P(InstallProgressContract, CancellingSaysSo) {
     ASSERT_NE(record, nullptr);
     record->cancel();
     EXPECT_EQ(record->installState(), std::uint64_t{kInstallStateCanceled});
-    EXPECT_TRUE(preferred(kA)->state.placeholder);
+    EXPECT_TRUE(preferred(kA).value().state.placeholder);
 }
 
 TEST_P(InstallProgressContract, ARecordHasADescription) {
