@@ -34,9 +34,7 @@ class SessionSorting {
     void add(const LoggedMessage& line) {
         const TimelineEventKind kind = line.message->kind;
         const bool isTransfer = kind == TransferGoesOn || kind == TransferEnds;
-        if (kind == SyncBegins || kind == RestoreBegins) {
-            begin(false);
-        } else if (isOver_ && isTransfer) {
+        if (kind == SyncBegins || kind == RestoreBegins || (isOver_ && isTransfer)) {
             begin(false);
         } else if (sessions_.empty() && !isOfSession(kind)) {
             begin(true);

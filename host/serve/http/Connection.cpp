@@ -30,7 +30,7 @@ Connection::Head Connection::readHead() {
     for (;;) {
         const std::size_t end = buffer_.find(kEndOfHead, looked);
         looked = buffer_.size() - std::min(buffer_.size(), kEndOfHead.size() - 1);
-        if (end != std::string::npos && end <= kLongestHead) {
+        if (end <= kLongestHead) {
             headSize_ = end + kEndOfHead.size();
             return Head::Whole;
         }
