@@ -96,9 +96,10 @@ TimedEvents eventsBefore(const std::vector<HistoryRecord>& records,
     TimedEvents events;
     std::optional<WallTime> next = time;
     for (auto record = records.rbegin(); record != records.rend(); ++record) {
-        if (next && record->time >= *next) continue;
+        if (time && record->time >= *time) continue;
         if (next && *next - record->time > kBetweenSessions) break;
-        next = record->time;
+        // Several threads write them: their times need not rise.
+        next = std::min(next.value_or(record->time), record->time);
         std::optional<TimelineEvent> event = eventOfHistory(*record);
         if (event) events.push_back({record->time, *std::move(event)});
     }

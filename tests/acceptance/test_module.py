@@ -55,8 +55,9 @@ def story_of(appsync, folder, coordination, *options):
         story.append(appsync.json("inventory", each.path))
         messages = [re.sub(r"[0-9A-F-]{36}", "UUID", line.split(" ", 5)[-1])
                     for line in appsync("log", each.path).stdout.splitlines()]
-        # How many are still to come when the plug-in begins to wait is a matter of moments.
-        story.append(sorted({each for each in messages if "Will wait for" not in each}))
+        # How many placeholders are still to come at a moment is a matter of moments.
+        messages = [re.sub(r"Count \d+", "Count", each) for each in messages if "Will wait for" not in each]
+        story.append(sorted(set(messages)))
     return story
 
 
