@@ -111,6 +111,11 @@ ErrorRecord databaseError(const Failure& failure) {
                                what + " is damaged (" + failure.reason +
                                    "); put a copy of the device in its place, or create a new "
                                    "device and sync it");
+        case SQLITE_NOMEM:
+            return deviceError(DeviceErrorCode::CannotUse,
+                               "out of means: " + what +
+                                   " cannot be used, as there is not enough memory; end other "
+                                   "programs, and run it again");
         case SQLITE_BUSY:
         case SQLITE_LOCKED:
             return deviceError(DeviceErrorCode::InUse,
