@@ -12,7 +12,7 @@ namespace {
 // The clock of file systems goes on by 4 or 10 milliseconds.
 constexpr std::chrono::milliseconds kYouth{50};
 
-FileStamp fileStamp(const std::string& path) {
+ServedFileStamp fileStamp(const std::string& path) {
     struct stat status {};
     if (::stat(path.c_str(), &status) != 0) return {};
     const auto changed = std::chrono::seconds(status.st_ctim.tv_sec) +
@@ -20,7 +20,7 @@ FileStamp fileStamp(const std::string& path) {
     return {status.st_dev, status.st_ino, status.st_size, changed.count()};
 }
 
-bool isYoungAt(const FileStamp& stamp, std::chrono::nanoseconds now) {
+bool isYoungAt(const ServedFileStamp& stamp, std::chrono::nanoseconds now) {
     return std::chrono::nanoseconds(stamp.changed) + kYouth > now;
 }
 
