@@ -80,7 +80,7 @@ TEST(TimelineGroups, WhatFailedOrTookLongStandsByItself) {
     timeline.lanes[502].spans.front().end += milliseconds(100);
     timeline.lanes[503].spans.push_back({SpanKind::Turn, milliseconds(0), milliseconds(2000)});
     const std::set<std::string> single = singleIn(groupedLanes(timeline));
-    for (const std::size_t index : {500, 501, 502}) {
+    for (const std::size_t index : {500U, 501U, 502U}) {
         EXPECT_TRUE(single.contains(timeline.lanes[index].identifier)) << index;
     }
     // To wait for others is no doing of its own.
@@ -172,7 +172,7 @@ TEST(TimelineSvg, NamesOfAnyKindStayText) {
 
 TEST(TimelineSvg, LikeFailuresAreToldOnce) {
     Timeline timeline = timelineWith(40);
-    for (const std::size_t index : {3, 4, 5, 9}) {
+    for (const std::size_t index : {3U, 4U, 5U, 9U}) {
         timeline.lanes[index].outcome = LaneOutcome::Failed;
         timeline.lanes[index].reason = index == 9 ? "no room" : "damaged";
     }
