@@ -298,8 +298,8 @@ class HandmadeNews : public ForwardingCoordination {
       public:
         Coordinator(const Handle& target, HandmadeNews& news)
             : ForwardingCoordinator(target), news_(news) {}
-        void setObserver(std::weak_ptr<InstallCoordinatorObserver> observer) override {
-            news_.observer = std::move(observer);
+        void setObserver(std::weak_ptr<InstallCoordinatorObserver> toTell) override {
+            news_.observer = std::move(toTell);
         }
         Status setInstallOptions(const InstallOptions& options) override {
             if (news_.onOptions) news_.onOptions(target());
@@ -350,7 +350,7 @@ TEST_F(HandmadeNewsTest, UnderALockThatAnObserverNeedsAreTold) {
     const auto coordinator =
         service().coordinator(Kind::Initiating, kA, SyncClientID, Creation::CreateIfNotExisting);
     coordinator.coordinator->setObserver(observer_);
-    news_.onError = [unlocked] { unlocked->wait(); };
+    news_.onError = [unlocked] { (void)unlocked->wait(); };
     const auto handle = news_.existingCoordinator(kA, SyncClientID);
     platform_.scheduler.spawn("service",
                               [&] { news_.observer.lock()->coordinatorShouldPrioritize(handle); });
