@@ -124,7 +124,7 @@ double brightnessOf(const PictureColor& color) {
 }
 
 double contrastOf(const PictureColor& left, const PictureColor& right) {
-    const auto [darker, lighter] = std::minmax(brightnessOf(left), brightnessOf(right));
+    const auto [darker, lighter] = std::minmax({brightnessOf(left), brightnessOf(right)});
     return (lighter + 0.05) / (darker + 0.05);
 }
 
