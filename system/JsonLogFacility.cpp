@@ -8,7 +8,7 @@
 #include <utility>
 
 #include "platform/LogRendering.h"
-#include "system/PosixError.h"
+#include "system/file/PosixError.h"
 
 namespace appsync {
 

@@ -1,5 +1,19 @@
 #pragma once
 
+// system: the parts of a platform that any device on POSIX can use, each one service of platform/
+// or what several need:
+//
+//     log             JsonLogFacility.h, over LogFile.h, which bounds it
+//     notifications   SystemNotifications.h
+//     registry        RegistryObservers.h, which calls those who observe one, and
+//                     MemoryProgressRecord.h
+//     accounts        ActingAccount.h
+//     memory          AllocatorTuning.h
+//     file/, threads/, property_list/  files, work, both encodings: rooms of their own
+//
+// Includes platform/ and POSIX; knows no device, no database, no plug-in. Called by device/ and
+// host/; a port to another POSIX device takes it as it is (docs/porting.md).
+
 #include <chrono>
 #include <cstdint>
 #include <functional>

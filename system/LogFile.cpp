@@ -10,7 +10,7 @@
 #include <cstdio>
 #include <utility>
 
-#include "system/DescriptorIO.h"
+#include "system/file/DescriptorIO.h"
 
 namespace appsync {
 

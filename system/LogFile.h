@@ -9,7 +9,7 @@
 #include <string_view>
 #include <utility>
 
-#include "system/UniqueFd.h"
+#include "system/file/UniqueFd.h"
 
 namespace appsync {
 

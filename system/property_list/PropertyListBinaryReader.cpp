@@ -41,7 +41,8 @@ class BinaryReader {
         std::size_t size = 0;
     };
 
-    bool refuse(std::size_t at, std::string problem) {
+    // Cold: what leads there is kept apart from what is read in each object.
+    [[gnu::cold]] bool refuse(std::size_t at, std::string problem) {
         problemAt_ = at;
         problem_ = std::move(problem);
         return false;
@@ -79,6 +80,13 @@ class BinaryReader {
                                            " bytes of the offset table");
         }
         return true;
+    }
+
+    /// Every value here is the null marker until it is read, which holds nothing that would have to
+    /// be destroyed.
+    template <typename Content>
+    static void fill(PropertyList& value, Content&& content) {
+        std::construct_at(&value, std::forward<Content>(content));
     }
 
     /// Reads the object that is referred to at `from`.
@@ -132,7 +140,7 @@ class BinaryReader {
                           "or map), found an object of kind " +
                               std::to_string(marker));
         }
-        value = marker == kBinaryTrue;
+        fill(value, marker == kBinaryTrue);
         return true;
     }
 
@@ -152,7 +160,7 @@ class BinaryReader {
         const std::uint8_t* content = bytes_.data() + at + 1;
         if (width < 16) {
             // Narrow ones have no sign; those of 8 bytes do.
-            value = static_cast<std::int64_t>(bigEndian(content, width));
+            fill(value, static_cast<std::int64_t>(bigEndian(content, width)));
             return true;
         }
         return readWideInteger(at, bigEndian(content, 8), bigEndian(content + 8, 8), value);
@@ -162,9 +170,9 @@ class BinaryReader {
                          PropertyList& value) {
         const bool negative = low >> 63U != 0;
         if (high == 0 && negative) {
-            value = low;
+            fill(value, low);
         } else if (high == (negative ? UINT64_MAX : 0)) {
-            value = static_cast<std::int64_t>(low);
+            fill(value, static_cast<std::int64_t>(low));
         } else {
             return refuse(at, "expected an integer of at most 64 bits");
         }
@@ -179,8 +187,8 @@ class BinaryReader {
         const std::size_t width = std::size_t{1} << exponent;
         if (!checkSize(at + 1, width)) return false;
         const std::uint64_t bits = bigEndian(bytes_.data() + at + 1, width);
-        value = width == 8 ? std::bit_cast<double>(bits)
-                           : double{std::bit_cast<float>(static_cast<std::uint32_t>(bits))};
+        fill(value, width == 8 ? std::bit_cast<double>(bits)
+                               : double{std::bit_cast<float>(static_cast<std::uint32_t>(bits))});
         return true;
     }
 
@@ -191,7 +199,7 @@ class BinaryReader {
         if (!std::isfinite(seconds)) {
             return refuse(at, "expected a date, found one that is no point in time");
         }
-        value = PropertyList::Date{seconds};
+        fill(value, PropertyList::Date{seconds});
         return true;
     }
 
@@ -229,7 +237,7 @@ class BinaryReader {
         if (!readSpan(at, kindOf(bytes_[at]) == kBinaryUtf16 ? 2 : 1, span)) return false;
         if (span.size <= kBinaryCopiedSize) return makeBlock(at, span, value);
         if (const auto known = longBlocks_.find(at); known != longBlocks_.end()) {
-            value = known->second;
+            fill(value, known->second);
             return true;
         }
         if (span.size > longBytesLeft_) {
@@ -245,13 +253,13 @@ class BinaryReader {
         const ByteView content = bytes_.subspan(span.at, span.size);
         const std::uint8_t kind = kindOf(bytes_[at]);
         if (kind == kBinaryData) {
-            value = Bytes(content.begin(), content.end());
+            fill(value, Bytes(content.begin(), content.end()));
             return true;
         }
         if (kind == kBinaryAscii && span.size <= kBinaryCopiedSize) {
             std::string_view text;
             if (!readAscii(span, text)) return false;
-            value = PropertyList(text);
+            fill(value, text);
             return true;
         }
         std::string text;

@@ -10,8 +10,8 @@
 #include <sys/wait.h>
 #include <unistd.h>
 
-#include "system/RootedFileSystem.h"
-#include "system/TemporaryFile.h"
+#include "system/file/RootedFileSystem.h"
+#include "system/file/TemporaryFile.h"
 #include "tests/system/DeviceFilesTest.h"
 #include "tests/system/FailingCalls.h"
 

@@ -1,4 +1,4 @@
-#include "system/DescriptorIO.h"
+#include "system/file/DescriptorIO.h"
 
 #include <array>
 #include <cerrno>
@@ -15,6 +15,7 @@ namespace {
 using testing::bytes;
 using testing::Call;
 using testing::FailingCall;
+using testing::kForever;
 using testing::text;
 
 class DescriptorIOTest : public ::testing::Test {
@@ -65,6 +66,14 @@ TEST_F(DescriptorIOTest, ASignalInterruptsNeitherReadingNorWriting) {
         fill("contents");
     }
     const FailingCall failing(Call::Read, EINTR, 3);
+    Bytes read;
+    EXPECT_EQ(readWhole(file_.get(), 8, 100, read), 0);
+    EXPECT_EQ(text(read), "contents");
+}
+
+TEST_F(DescriptorIOTest, WhatIsAsLongAsExpectedTakesOneRead) {
+    fill("contents");
+    const FailingCall failing(Call::Read, EIO, kForever, 1);
     Bytes read;
     EXPECT_EQ(readWhole(file_.get(), 8, 100, read), 0);
     EXPECT_EQ(text(read), "contents");

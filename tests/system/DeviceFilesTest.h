@@ -10,7 +10,7 @@
 #include <gtest/gtest.h>
 
 #include "platform/Bytes.h"
-#include "system/RootedFileSystem.h"
+#include "system/file/RootedFileSystem.h"
 
 namespace appsync::testing {
 

@@ -6,7 +6,7 @@
 #include <iterator>
 
 #include "contract/TemporaryMachineDirectory.h"
-#include "system/RootedFileSystem.h"
+#include "system/file/RootedFileSystem.h"
 
 namespace appsync {
 

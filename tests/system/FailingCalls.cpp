@@ -71,6 +71,11 @@ int __wrap_fstat(int descriptor, struct stat* status) {
     return fails(Call::Fstat) ? -1 : __real_fstat(descriptor, status);
 }
 
+int __real_fstatat(int directory, const char* path, struct stat* status, int flags);
+int __wrap_fstatat(int directory, const char* path, struct stat* status, int flags) {
+    return fails(Call::Fstatat) ? -1 : __real_fstatat(directory, path, status, flags);
+}
+
 int __real_mkdirat(int directory, const char* path, mode_t mode);
 int __wrap_mkdirat(int directory, const char* path, mode_t mode) {
     return fails(Call::Mkdirat) ? -1 : __real_mkdirat(directory, path, mode);

@@ -9,6 +9,7 @@ enum class Call {
     Flock,
     Fsync,
     Fstat,
+    Fstatat,
     Mkdirat,
     Openat,
     Openat2,

@@ -3,7 +3,7 @@
 
 #include <sys/stat.h>
 
-#include "system/RootedFileSystem.h"
+#include "system/file/RootedFileSystem.h"
 #include "tests/system/DeviceFilesTest.h"
 #include "tests/system/FailingCalls.h"
 
@@ -14,6 +14,7 @@ namespace fs = std::filesystem;
 using testing::bytes;
 using testing::Call;
 using testing::FailingCall;
+using testing::kForever;
 
 class InPlaceWriteTest : public testing::DeviceFilesTest {
   protected:
@@ -91,8 +92,14 @@ TEST_F(InPlaceWriteTest, ReplacesAPipeWithoutWaiting) {
     EXPECT_EQ(contents(kFile), "0");
 }
 
+TEST_F(InPlaceWriteTest, LooksForTheFileOnce) {
+    put(kFile, "0123");
+    const FailingCall failing(Call::Openat2, EIO, kForever, 1);
+    EXPECT_TRUE(staysTheSameWith("0124"));
+}
+
 TEST_F(InPlaceWriteTest, WritesAnewWhenAStepFails) {
-    for (const Call call : {Call::Openat, Call::Fstat, Call::Pread}) {
+    for (const Call call : {Call::Openat2, Call::Fstat, Call::Pread}) {
         put(kFile, "0123");
         const FailingCall failing(call, EIO, 1);
         EXPECT_FALSE(staysTheSameWith("0124"));

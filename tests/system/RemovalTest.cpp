@@ -10,8 +10,8 @@
 #include <sys/stat.h>
 #include <unistd.h>
 
-#include "system/RootedFileSystem.h"
-#include "system/TreeWalk.h"
+#include "system/file/RootedFileSystem.h"
+#include "system/file/TreeWalk.h"
 #include "tests/system/DeviceFilesTest.h"
 #include "tests/system/FailingCalls.h"
 
@@ -143,9 +143,16 @@ TEST_F(RemovalTest, ADirectoryThatCannotBeOpenedIsNamed) {
 }
 
 TEST_F(RemovalTest, ADirectoryThatCannotBeExaminedIsTold) {
-    fs::create_directories(real("/a/b"));
+    makeChain(real("/a"), 20);
     const FailingCall failing(Call::Fstat, EIO);
     EXPECT_EQ(files_->removeItem("/a").error().code, EIO);
+}
+
+TEST_F(RemovalTest, NoDirectoryOfAFlatTreeIsExamined) {
+    put("/a/b/c/file", "");
+    const FailingCall failing(Call::Fstat, EIO);
+    EXPECT_TRUE(files_->removeItem("/a"));
+    EXPECT_FALSE(fs::exists(real("/a")));
 }
 
 TEST_F(RemovalTest, WhatWasAddedMeanwhileIsRemovedToo) {

@@ -1,4 +1,4 @@
-#include "system/RootDirectory.h"
+#include "system/file/RootDirectory.h"
 
 #include <cerrno>
 

@@ -1,4 +1,4 @@
-#include "system/RootedFileSystem.h"
+#include "system/file/RootedFileSystem.h"
 
 #include <cerrno>
 #include <fstream>
@@ -16,6 +16,7 @@ namespace fs = std::filesystem;
 using testing::bytes;
 using testing::Call;
 using testing::FailingCall;
+using testing::kForever;
 using testing::text;
 
 constexpr uid_t kOtherUser = 4242;
@@ -255,9 +256,22 @@ TEST_F(RootedFileSystemTest, WhatCannotBeGivenAwayIsNotLeftBehind) {
 }
 
 TEST_F(RootedFileSystemTest, ADirectoryThatCannotBeExaminedIsNotLeftBehind) {
-    const FailingCall failing(Call::Fstat, EIO);
+    const FailingCall failing(Call::Fstatat, EIO);
     EXPECT_EQ(codeOf(files_->createDirectory("/new", false, &kMobile)), EIO);
     EXPECT_FALSE(fs::exists(real("/new")));
+}
+
+TEST_F(RootedFileSystemTest, ADirectoryThatIsItsOwnersAlreadyIsNotOpened) {
+    const FailingCall failing(Call::Openat, EMFILE);
+    EXPECT_TRUE(files_->createDirectory("/new", false, &kMobile));
+    EXPECT_EQ(failing.failures(), 0);
+}
+
+TEST_F(RootedFileSystemTest, WhereOnlyTheLastDirectoryIsMissingNoOtherIsLookedFor) {
+    put("/a/b/c/file", "");
+    const FailingCall failing(Call::Openat2, EIO, kForever, 2);
+    EXPECT_TRUE(files_->createDirectory("/a/b/c/new", true, nullptr));
+    EXPECT_EQ(failing.failures(), 0);
 }
 
 TEST_F(RootedFileSystemTest, MovesFilesAndDirectories) {

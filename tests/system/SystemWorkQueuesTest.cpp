@@ -1,4 +1,4 @@
-#include "system/SystemWorkQueues.h"
+#include "system/threads/SystemWorkQueues.h"
 
 #include <atomic>
 #include <chrono>

@@ -1,4 +1,4 @@
-#include "system/MachinePath.h"
+#include "system/file/MachinePath.h"
 
 #include <algorithm>
 #include <string_view>

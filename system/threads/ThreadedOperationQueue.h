@@ -8,7 +8,7 @@
 #include <vector>
 
 #include "platform/WorkQueues.h"
-#include "system/SystemWorkQueues.h"
+#include "system/threads/SystemWorkQueues.h"
 
 namespace appsync {
 

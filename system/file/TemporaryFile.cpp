@@ -1,4 +1,4 @@
-#include "system/TemporaryFile.h"
+#include "system/file/TemporaryFile.h"
 
 #include <algorithm>
 #include <array>
@@ -10,12 +10,12 @@
 
 #include <fcntl.h>
 #include <sys/file.h>
-#include <sys/random.h>
 #include <sys/stat.h>
 #include <unistd.h>
 
-#include "system/DescriptorIO.h"
-#include "system/PosixError.h"
+#include "system/file/DescriptorIO.h"
+#include "system/file/PosixError.h"
+#include "system/file/RandomBytes.h"
 
 namespace appsync {
 
@@ -42,7 +42,7 @@ std::string_view stemOf(std::string_view name) {
 std::string randomSuffix() {
     std::array<std::uint8_t, kSuffixLength> noise{};
     // It blocks only before the machine has any entropy, and cannot fail with so few bytes.
-    if (::getrandom(noise.data(), noise.size(), 0) < 0) noise.fill(0);
+    if (!fillWithRandomBytes(noise)) noise.fill(0);
     std::string suffix;
     for (const std::uint8_t byte : noise) {
         suffix += kSuffixCharacters[byte % kSuffixCharacters.size()];
@@ -54,11 +54,6 @@ std::string temporaryNameFor(std::string_view name) {
     std::string result = ".";
     result.append(stemOf(name)).append(kMark).append(randomSuffix());
     return result;
-}
-
-bool isStillLinked(int descriptor) {
-    struct stat status {};
-    return ::fstat(descriptor, &status) == 0 && status.st_nlink > 0;
 }
 
 }  // namespace
@@ -101,7 +96,8 @@ TemporaryFile::TemporaryFile(TemporaryFile&& other) noexcept
     : place_(std::move(other.place_)),
       path_(std::move(other.path_)),
       temporaryName_(std::exchange(other.temporaryName_, {})),
-      file_(std::move(other.file_)) {}
+      file_(std::move(other.file_)),
+      status_(other.status_) {}
 
 TemporaryFile::~TemporaryFile() {
     if (!temporaryName_.empty()) {
@@ -125,25 +121,30 @@ int TemporaryFile::openOnce() {
     temporaryName_ = std::move(name);
     file_ = std::move(file);
     const int error = ::flock(file_.get(), LOCK_EX | LOCK_NB) == 0 ? 0 : errno;
-    if (error == 0 && isStillLinked(file_.get())) return 0;
+    if (error == 0 && isStillLinked()) return 0;
     ::unlinkat(place_.directory.get(), temporaryName_.c_str(), 0);
     temporaryName_.clear();
     return error == 0 || error == EWOULDBLOCK ? EEXIST : error;
 }
 
+bool TemporaryFile::isStillLinked() {
+    return ::fstat(file_.get(), &status_) == 0 && status_.st_nlink > 0;
+}
+
 void TemporaryFile::inheritFromTarget() {
     struct stat target {};
-    struct stat own {};
     if (::fstatat(place_.directory.get(), place_.name.c_str(), &target, AT_SYMLINK_NOFOLLOW) != 0 ||
-        !S_ISREG(target.st_mode) || ::fstat(file_.get(), &own) != 0) {
+        !S_ISREG(target.st_mode)) {
         return;
     }
     // Where the system refuses either, the new file stays the writer's own.
-    if (target.st_uid != own.st_uid || target.st_gid != own.st_gid) {
-        (void)!::fchown(file_.get(), target.st_uid, target.st_gid);
+    const bool isOwn = target.st_uid == status_.st_uid && target.st_gid == status_.st_gid;
+    if (!isOwn && ::fchown(file_.get(), target.st_uid, target.st_gid) == 0) {
+        status_.st_uid = target.st_uid;
+        status_.st_gid = target.st_gid;
     }
     const mode_t permissions = target.st_mode & (S_IRWXU | S_IRWXG | S_IRWXO);
-    if (permissions != (own.st_mode & 0777U)) ::fchmod(file_.get(), permissions);
+    if (permissions != (status_.st_mode & 0777U)) ::fchmod(file_.get(), permissions);
 }
 
 Status TemporaryFile::write(ByteView contents) {

@@ -1,21 +1,12 @@
 #pragma once
 
-// system: the parts of a platform that any device on POSIX can use, each one service of platform/
-// or what several need:
+// system/file: the files of a device below one directory, as any device on POSIX can use them.
+// `RootedFileSystem` (this header) is a service of platform/, over RootDirectory.h, which no path
+// leads out of; MachinePath.h, TreeWalk.h, TemporaryFile.h, InPlaceWrite.h, DescriptorIO.h,
+// UniqueFd.h, RandomBytes.h and PosixError.h are what it and others need.
 //
-//     files           RootedFileSystem.h, over RootDirectory.h, which no path leads out of;
-//                     MachinePath.h, TreeWalk.h, TemporaryFile.h, InPlaceWrite.h, DescriptorIO.h,
-//                     UniqueFd.h, PosixError.h
-//     work            SystemWorkQueues.h, with ThreadedOperationQueue.h and DelayedWork.h
-//     log             JsonLogFacility.h, over LogFile.h, which bounds it
-//     notifications   SystemNotifications.h
-//     registry        RegistryObservers.h, which calls those who observe one, and
-//                     MemoryProgressRecord.h
-//     accounts        ActingAccount.h
-//     property_list/  both encodings, a room of its own
-//
-// Includes platform/ and POSIX; knows no device, no database, no plug-in. Called by device/ and
-// host/; a port to another POSIX device takes it as it is (docs/porting.md).
+// Includes platform/ and POSIX. Called by system/, device/ and host/; a port to another POSIX
+// device takes it as it is (docs/porting.md).
 
 #include <functional>
 #include <map>
@@ -28,7 +19,7 @@
 #include <sys/types.h>
 
 #include "platform/FileSystem.h"
-#include "system/RootDirectory.h"
+#include "system/file/RootDirectory.h"
 
 namespace appsync {
 
@@ -54,8 +45,8 @@ struct RootedFileSystemOptions {
 ///
 /// Files are written through a temporary file in the same directory, named after the target (see
 /// `isTemporaryName`); the finished file takes the target's name, and where the target was a link,
-/// the link's place. Only a change of a few bytes is written in place (system/InPlaceWrite.h). A
-/// file that is replaced keeps its permissions and its owner. A crash can leave a temporary file;
+/// the link's place. Only a change of a few bytes is written in place (system/file/InPlaceWrite.h).
+/// A file that is replaced keeps its permissions and its owner. A crash can leave a temporary file;
 /// `removeStaleTemporaries` clears it.
 ///
 /// What begins with the path of the temporary directory is changed there only: where ".." would

@@ -1,4 +1,4 @@
-#include "system/UniqueFd.h"
+#include "system/file/UniqueFd.h"
 
 #include <cerrno>
 

@@ -8,7 +8,7 @@
 #include <sys/types.h>
 
 #include "platform/Result.h"
-#include "system/UniqueFd.h"
+#include "system/file/UniqueFd.h"
 
 namespace appsync {
 
@@ -37,8 +37,8 @@ struct ItemPlace {
 ///
 /// Callable on any thread, by several at once. Failures are errors of `kPosixErrorDomain` that name
 /// the operation and the path: EINVAL for a path that is empty, not absolute, or holds a NUL;
-/// ENAMETOOLONG for one that is too long, or has a name that is (system/MachinePath.h says which
-/// longer names there are). Descriptors belong to the caller and are closed on exec.
+/// ENAMETOOLONG for one that is too long, or has a name that is (system/file/MachinePath.h says
+/// which longer names there are). Descriptors belong to the caller and are closed on exec.
 class RootDirectory {
   public:
     /// Opens the root at a path of the machine. ENOSYS when the kernel cannot resolve inside a

@@ -1,4 +1,4 @@
-#include "system/InPlaceWrite.h"
+#include "system/file/InPlaceWrite.h"
 
 #include <algorithm>
 #include <array>
@@ -11,7 +11,7 @@
 #include <sys/stat.h>
 #include <unistd.h>
 
-#include "system/UniqueFd.h"
+#include "system/file/UniqueFd.h"
 
 namespace appsync {
 
@@ -63,15 +63,13 @@ bool differsInOneWord(int file, ByteView contents, std::size_t& word) {
 
 }  // namespace
 
-bool writeInPlace(const ItemPlace& place, ByteView contents) {
-    if (place.mustBeDirectory) return false;
-    const int flags = O_RDWR | O_NOFOLLOW | O_NONBLOCK | O_NOCTTY | O_CLOEXEC;
-    const UniqueFd file(::openat(place.directory.get(), place.name.c_str(), flags));
-    if (!file || !isSolelyHere(file.get(), contents.size())) return false;
+bool writeInPlace(const RootDirectory& root, const std::string& path, ByteView contents) {
+    const Result<UniqueFd> file = root.openFile(path, O_RDWR | O_NOFOLLOW | O_NONBLOCK);
+    if (!file || !isSolelyHere(file->get(), contents.size())) return false;
     std::size_t word = 0;
-    if (!differsInOneWord(file.get(), contents, word)) return false;
+    if (!differsInOneWord(file->get(), contents, word)) return false;
     const std::size_t size = std::min(kWordSize, contents.size() - word);
-    return ::pwrite(file.get(), contents.data() + word, size, static_cast<off_t>(word)) ==
+    return ::pwrite(file->get(), contents.data() + word, size, static_cast<off_t>(word)) ==
            static_cast<ssize_t>(size);
 }
 

@@ -1,4 +1,4 @@
-#include "system/RootDirectory.h"
+#include "system/file/RootDirectory.h"
 
 #include <cerrno>
 #include <memory>
@@ -12,8 +12,8 @@
 #include <sys/syscall.h>
 #include <unistd.h>
 
-#include "system/MachinePath.h"
-#include "system/PosixError.h"
+#include "system/file/MachinePath.h"
+#include "system/file/PosixError.h"
 
 namespace appsync {
 

@@ -8,7 +8,7 @@
 #include <vector>
 
 #include "platform/WorkQueues.h"
-#include "system/ThreadedOperationQueue.h"
+#include "system/threads/ThreadedOperationQueue.h"
 
 namespace appsync {
 

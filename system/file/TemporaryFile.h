@@ -3,10 +3,12 @@
 #include <string>
 #include <string_view>
 
+#include <sys/stat.h>
+
 #include "platform/Bytes.h"
 #include "platform/Result.h"
-#include "system/RootDirectory.h"
-#include "system/UniqueFd.h"
+#include "system/file/RootDirectory.h"
+#include "system/file/UniqueFd.h"
 
 namespace appsync {
 
@@ -41,6 +43,8 @@ class TemporaryFile {
 
     /// The open file; still owned.
     [[nodiscard]] int descriptor() const noexcept { return file_.get(); }
+    /// What it was when it was made, and whose it is.
+    [[nodiscard]] const struct stat& status() const noexcept { return status_; }
 
     /// Appends. After a failure the file is good for nothing but to be destroyed.
     Status write(ByteView contents);
@@ -55,12 +59,14 @@ class TemporaryFile {
 
     int open();
     int openOnce();
+    bool isStillLinked();
     void inheritFromTarget();
 
     ItemPlace place_;
     std::string path_;
     std::string temporaryName_;  // empty when there is nothing to remove
     UniqueFd file_;
+    struct stat status_ {};
 };
 
 }  // namespace appsync

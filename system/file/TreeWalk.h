@@ -22,8 +22,9 @@ struct TreeActions {
 
 /// Walks the directory `name` of the open directory `parent`, and everything below it, at whatever
 /// depth: it needs no more than a few descriptors, and no stack that grows. No link is followed; a
-/// directory that somebody moves away meanwhile ends the walk with EAGAIN. What vanishes meanwhile
-/// is passed over.
+/// directory that was moved away when `afterDirectory` does not find it, or when the walk has to
+/// find the way back from far below, ends the walk with EAGAIN. What vanishes meanwhile is passed
+/// over.
 ///
 /// Ends with the first failure, told as `operation` on the place below `path`.
 Status walkTree(int parent, const std::string& name, const TreeActions& actions,

@@ -1,4 +1,4 @@
-#include "system/DelayedWork.h"
+#include "system/threads/DelayedWork.h"
 
 #include <algorithm>
 #include <utility>

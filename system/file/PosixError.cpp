@@ -1,4 +1,4 @@
-#include "system/PosixError.h"
+#include "system/file/PosixError.h"
 
 #include <algorithm>
 #include <array>

@@ -1,4 +1,4 @@
-#include "system/SystemWorkQueues.h"
+#include "system/threads/SystemWorkQueues.h"
 
 #include <algorithm>
 #include <condition_variable>
@@ -8,8 +8,8 @@
 #include <string>
 #include <utility>
 
-#include "system/DelayedWork.h"
-#include "system/ThreadedOperationQueue.h"
+#include "system/threads/DelayedWork.h"
+#include "system/threads/ThreadedOperationQueue.h"
 
 namespace appsync {
 

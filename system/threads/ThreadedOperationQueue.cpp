@@ -1,4 +1,4 @@
-#include "system/ThreadedOperationQueue.h"
+#include "system/threads/ThreadedOperationQueue.h"
 
 #include <algorithm>
 #include <deque>

@@ -1,5 +1,8 @@
 #pragma once
 
+// system/threads: queues, groups and the clock on threads of this process, as any device on POSIX
+// can use them, with ThreadedOperationQueue.h and DelayedWork.h. Includes platform/ alone.
+
 #include <functional>
 #include <memory>
 #include <thread>

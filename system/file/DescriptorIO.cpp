@@ -1,4 +1,4 @@
-#include "system/DescriptorIO.h"
+#include "system/file/DescriptorIO.h"
 
 #include <algorithm>
 #include <cerrno>
@@ -23,10 +23,10 @@ ssize_t readSome(int descriptor, std::uint8_t* target, std::size_t size) {
 
 int readInto(int descriptor, std::uint64_t expected, std::uint64_t limit, Bytes& contents) {
     if (expected > limit) return EFBIG;
-    // One byte more than expected: the read that fills the rest then also meets the end.
+    // One byte more than expected: where that is not filled, the read has met the end.
     contents.resize(static_cast<std::size_t>(expected) + 1);
     std::size_t filled = 0;
-    while (true) {
+    while (filled == 0 || filled != expected) {
         const ssize_t count =
             readSome(descriptor, contents.data() + filled, contents.size() - filled);
         if (count < 0) return errno;

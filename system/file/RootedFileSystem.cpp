@@ -1,4 +1,4 @@
-#include "system/RootedFileSystem.h"
+#include "system/file/RootedFileSystem.h"
 
 #include <algorithm>
 #include <cerrno>
@@ -10,11 +10,11 @@
 #include <sys/stat.h>
 #include <unistd.h>
 
-#include "system/DescriptorIO.h"
-#include "system/InPlaceWrite.h"
-#include "system/PosixError.h"
-#include "system/TemporaryFile.h"
-#include "system/TreeWalk.h"
+#include "system/file/DescriptorIO.h"
+#include "system/file/InPlaceWrite.h"
+#include "system/file/PosixError.h"
+#include "system/file/TemporaryFile.h"
+#include "system/file/TreeWalk.h"
 
 namespace appsync {
 
@@ -90,22 +90,31 @@ std::string below(const std::string& directory, const std::string& name) {
     return directory.ends_with('/') ? directory + name : directory + "/" + name;
 }
 
+bool isGivenTo(const struct stat& status, const Ownership& owner) {
+    return status.st_uid == owner.user.value_or(status.st_uid) &&
+           status.st_gid == owner.group.value_or(status.st_gid);
+}
+
 /// Gives an errno value, or 0. No system call is made that would change nothing: an ordinary
 /// account may not make it.
-int giveTo(int descriptor, const Ownership& owner) {
-    struct stat status {};
-    if (::fstat(descriptor, &status) != 0) return errno;
+int giveTo(int descriptor, const struct stat& status, const Ownership& owner) {
+    if (isGivenTo(status, owner)) return 0;
     const uid_t user = owner.user.value_or(status.st_uid);
     const gid_t group = owner.group.value_or(status.st_gid);
-    if (user == status.st_uid && group == status.st_gid) return 0;
     return ::fchown(descriptor, user, group) == 0 ? 0 : errno;
 }
 
+/// Only what is not the owner's yet has to be opened for that.
 int giveDirectoryTo(const ItemPlace& place, const Ownership& owner) {
     if (!owner.user && !owner.group) return 0;
+    const int parent = place.directory.get();
+    struct stat status {};
+    if (::fstatat(parent, place.name.c_str(), &status, AT_SYMLINK_NOFOLLOW) != 0) return errno;
+    if (S_ISDIR(status.st_mode) && isGivenTo(status, owner)) return 0;
     const int flags = O_RDONLY | O_DIRECTORY | O_NOFOLLOW | O_CLOEXEC;
-    const UniqueFd opened(::openat(place.directory.get(), place.name.c_str(), flags));
-    return opened ? giveTo(opened.get(), owner) : errno;
+    const UniqueFd opened(::openat(parent, place.name.c_str(), flags));
+    if (!opened || ::fstat(opened.get(), &status) != 0) return errno;
+    return giveTo(opened.get(), status, owner);
 }
 
 Status makeDirectory(const RootDirectory& root, const std::string& path, const Ownership& owner) {
@@ -135,6 +144,8 @@ Status makeDirectories(const RootDirectory& root, const std::string& path, const
     if (there) return {};
     const std::int64_t code = there.error().code;
     if (code != ENOENT && code != ENOTDIR) return there.error();
+    // Most often nothing but the last is missing.
+    if (makeDirectory(root, path, owner)) return {};
     std::size_t end = 0;
     while (end != std::string::npos) {
         end = path.find('/', path.find_first_not_of('/', end));
@@ -358,10 +369,8 @@ Result<Bytes> RootedFileSystem::readFile(const std::string& path) {
 
 Status RootedFileSystem::writeFileAtomically(const std::string& path, ByteView contents) {
     if (Status status = checkStays(path, kWrite); !status) return status;
-    Result<ItemPlace> place = root_.place(path, kWrite);
-    if (!place) return place.error();
-    if (writeInPlace(*place, contents)) return {};
-    Result<TemporaryFile> file = TemporaryFile::create(*std::move(place), path);
+    if (writeInPlace(root_, path, contents)) return {};
+    Result<TemporaryFile> file = TemporaryFile::create(root_, path);
     if (!file) return file.error();
     if (Status written = file->write(contents); !written) return written;
     if (!isTemporary(path)) {
@@ -378,7 +387,7 @@ Status RootedFileSystem::createFile(const std::string& path, ByteView contents,
     if (!owner) return owner.error();
     Result<TemporaryFile> file = TemporaryFile::create(root_, path);
     if (!file) return file.error();
-    if (const int error = giveTo(file->descriptor(), *owner); error != 0) {
+    if (const int error = giveTo(file->descriptor(), file->status(), *owner); error != 0) {
         return posixError(error, kCreate, path);
     }
     if (Status written = file->write(contents); !written) return written;

@@ -1,27 +1,28 @@
-#include "system/TreeWalk.h"
+#include "system/file/TreeWalk.h"
 
+#include <array>
 #include <cerrno>
 #include <cstring>
-#include <memory>
 #include <optional>
+#include <utility>
 #include <vector>
 
 #include <dirent.h>
 #include <fcntl.h>
 #include <sys/stat.h>
+#include <unistd.h>
 
-#include "system/PosixError.h"
-#include "system/UniqueFd.h"
+#include "system/file/PosixError.h"
+#include "system/file/UniqueFd.h"
 
 namespace appsync {
 
 namespace {
 
 constexpr int kMostVisits = 16;
-
-struct CloseStream {
-    void operator()(DIR* stream) const { ::closedir(stream); }
-};
+/// Of the directories that lead to where the walk is, so many stay open, the outermost.
+constexpr std::size_t kMostOpen = 8;
+constexpr std::size_t kEntriesBytes = std::size_t{32} << 10U;
 
 /// Which directory it is, whatever its name.
 struct Identity {
@@ -33,7 +34,8 @@ struct Identity {
 /// A directory that the walk is in.
 struct Level {
     std::string name;
-    Identity identity;
+    UniqueFd directory;                       // closed while the walk is far below
+    std::optional<Identity> identity;         // of one that is closed meanwhile
     std::vector<std::string> subdirectories;  // still to be entered
     int visits = 0;
 };
@@ -44,11 +46,16 @@ std::optional<Identity> identityOf(int descriptor) {
     return Identity{status.st_dev, status.st_ino};
 }
 
-bool isDirectory(int directory, const dirent& entry) {
+bool isDirectory(int directory, const dirent64& entry) {
     if (entry.d_type != DT_UNKNOWN) return entry.d_type == DT_DIR;
     struct stat status {};
     return ::fstatat(directory, entry.d_name, &status, AT_SYMLINK_NOFOLLOW) == 0 &&
            S_ISDIR(status.st_mode);
+}
+
+bool isRemoved(int directory) {
+    struct stat status {};
+    return ::fstat(directory, &status) == 0 && status.st_nlink == 0;
 }
 
 UniqueFd openSubdirectory(int parent, const char* name) {
@@ -57,7 +64,8 @@ UniqueFd openSubdirectory(int parent, const char* name) {
 
 class TreeWalk {
   public:
-    TreeWalk(int top, const TreeActions& actions) : top_(top), actions_(actions) {}
+    TreeWalk(int top, const TreeActions& actions)  // NOLINT(*-member-init): what is read fills it
+        : top_(top), actions_(actions) {}
 
     /// An errno value, or 0.
     int run(const std::string& name) {
@@ -80,16 +88,19 @@ class TreeWalk {
         if (waiting.empty()) return leave();
         const std::string name = std::move(waiting.back());
         waiting.pop_back();
-        return enter(current_.get(), name);
+        return enter(levels_.back().directory.get(), name);
     }
 
     int enter(int parent, const std::string& name) {
         UniqueFd opened = openSubdirectory(parent, name.c_str());
         if (!opened) return explainRefusal(parent, name, errno);
-        const std::optional<Identity> identity = identityOf(opened.get());
-        if (!identity) return errno;
-        levels_.push_back({name, *identity, {}, 0});
-        current_ = std::move(opened);
+        std::optional<Identity> identity;
+        if (levels_.size() >= kMostOpen) {
+            identity = identityOf(opened.get());
+            if (!identity) return errno;
+        }
+        if (levels_.size() > kMostOpen) levels_.back().directory.reset();
+        levels_.push_back({name, std::move(opened), identity, {}, 0});
         return visit();
     }
 
@@ -102,36 +113,33 @@ class TreeWalk {
     }
 
     int visit() {
-        Level& level = levels_.back();
-        ++level.visits;
-        const int copy = ::fcntl(current_.get(), F_DUPFD_CLOEXEC, 0);
-        if (copy < 0) return errno;
-        const std::unique_ptr<DIR, CloseStream> stream(::fdopendir(copy));
-        if (stream == nullptr) {
-            const int error = errno;
-            UniqueFd(copy).reset();
-            return error;
-        }
-        ::rewinddir(stream.get());
-        return visitEntries(*stream);
-    }
-
-    int visitEntries(DIR& stream) {
+        const int directory = levels_.back().directory.get();
+        if (levels_.back().visits++ > 0 && ::lseek(directory, 0, SEEK_SET) != 0) return errno;
         while (true) {
-            errno = 0;
-            const dirent* entry = ::readdir(&stream);
-            if (entry == nullptr) return errno;
-            if (std::strcmp(entry->d_name, ".") == 0 || std::strcmp(entry->d_name, "..") == 0) {
-                continue;
+            const ssize_t size = ::getdents64(directory, entries_.data(), entries_.size());
+            // A directory that was removed has no entries.
+            if (size < 0) return errno == ENOENT ? 0 : errno;
+            if (size == 0) return 0;
+            if (const int error = visitEntries(static_cast<std::size_t>(size)); error != 0) {
+                return error;
             }
-            if (const int error = visitEntry(*entry); error != 0) return error;
         }
     }
 
-    int visitEntry(const dirent& entry) {
-        const std::string name = entry.d_name;
-        const int error =
-            isDirectory(current_.get(), entry) ? EISDIR : actions_.item(current_.get(), name);
+    int visitEntries(std::size_t size) {
+        for (std::size_t at = 0; at < size;) {
+            const auto& entry = *reinterpret_cast<const dirent64*>(&entries_.at(at));
+            at += entry.d_reclen;
+            const std::string name = &entry.d_name[0];
+            if (name == "." || name == "..") continue;
+            if (const int error = visitEntry(entry, name); error != 0) return error;
+        }
+        return 0;
+    }
+
+    int visitEntry(const dirent64& entry, const std::string& name) {
+        const int directory = levels_.back().directory.get();
+        const int error = isDirectory(directory, entry) ? EISDIR : actions_.item(directory, name);
         if (error == EISDIR) {
             levels_.back().subdirectories.push_back(name);
             return 0;
@@ -141,25 +149,33 @@ class TreeWalk {
     }
 
     int leave() {
-        UniqueFd parent;
-        if (levels_.size() > 1) {
-            parent = openSubdirectory(current_.get(), "..");
-            if (!parent) return errno;
-            if (identityOf(parent.get()) != levels_[levels_.size() - 2].identity) return EAGAIN;
-        }
-        const int parentDescriptor = parent ? parent.get() : top_;
-        const int error = actions_.afterDirectory(parentDescriptor, levels_.back().name);
+        if (const int error = openParent(); error != 0) return error;
+        const bool isTop = levels_.size() == 1;
+        const int parent = isTop ? top_ : levels_[levels_.size() - 2].directory.get();
+        const int error = actions_.afterDirectory(parent, levels_.back().name);
         if (error == ENOTEMPTY && levels_.back().visits < kMostVisits) return visit();
+        if (error == ENOENT && !isTop && !isRemoved(levels_.back().directory.get())) return EAGAIN;
         if (error != 0 && error != ENOENT) return error;
         levels_.pop_back();
-        current_ = std::move(parent);
+        return 0;
+    }
+
+    /// Where the directory above the walk's is closed, opens it again.
+    int openParent() {
+        if (levels_.size() == 1) return 0;
+        Level& parent = levels_[levels_.size() - 2];
+        if (parent.directory) return 0;
+        UniqueFd opened = openSubdirectory(levels_.back().directory.get(), "..");
+        if (!opened) return errno;
+        if (identityOf(opened.get()) != parent.identity) return EAGAIN;
+        parent.directory = std::move(opened);
         return 0;
     }
 
     const int top_;
     const TreeActions& actions_;
     std::vector<Level> levels_;
-    UniqueFd current_;  // the directory of the last level
+    alignas(dirent64) std::array<char, kEntriesBytes> entries_;  // as the system tells them
     std::string failedName_;
 };
 
