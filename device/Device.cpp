@@ -25,9 +25,9 @@
 #include "device/install/KeptBundles.h"
 #include "device/install/PlaceholderInstall.h"
 #include "device/install/ProgressBook.h"
-#include "device/install/Reconciliation.h"
 #include "device/install/RestoreData.h"
-#include "device/install/Rollback.h"
+#include "device/install/recovery/Reconciliation.h"
+#include "device/install/recovery/Rollback.h"
 #include "device/registry/DeviceRegistry.h"
 #include "device/screen/CairoIconRenderer.h"
 #include "device/screen/DeviceHomeScreen.h"
@@ -35,12 +35,12 @@
 #include "device/values/DeviceError.h"
 #include "device/values/DevicePaths.h"
 #include "device/values/PackageIdentifier.h"
-#include "system/PosixError.h"
-#include "system/RootDirectory.h"
-#include "system/RootedFileSystem.h"
 #include "system/SystemNotifications.h"
-#include "system/SystemWorkQueues.h"
+#include "system/file/PosixError.h"
+#include "system/file/RootDirectory.h"
+#include "system/file/RootedFileSystem.h"
 #include "system/property_list/PropertyListCodec.h"
+#include "system/threads/SystemWorkQueues.h"
 
 namespace appsync {
 

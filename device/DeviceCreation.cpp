@@ -18,8 +18,8 @@
 #include "device/values/DeviceError.h"
 #include "device/values/DevicePaths.h"
 #include "device/values/PackageText.h"
-#include "system/PosixError.h"
-#include "system/UniqueFd.h"
+#include "system/file/PosixError.h"
+#include "system/file/UniqueFd.h"
 
 namespace appsync {
 

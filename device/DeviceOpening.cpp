@@ -15,7 +15,7 @@
 #include "device/values/DeviceError.h"
 #include "device/values/DevicePaths.h"
 #include "system/ActingAccount.h"
-#include "system/PosixError.h"
+#include "system/file/PosixError.h"
 
 namespace appsync {
 

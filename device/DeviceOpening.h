@@ -8,7 +8,7 @@
 #include "device/SessionLock.h"
 #include "device/database/DeviceDatabase.h"
 #include "platform/Result.h"
-#include "system/RootedFileSystem.h"
+#include "system/file/RootedFileSystem.h"
 
 namespace appsync {
 

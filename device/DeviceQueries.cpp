@@ -13,8 +13,8 @@
 #include "device/install/ProgressBook.h"
 #include "device/screen/IconDrawing.h"
 #include "device/values/WallClock.h"
-#include "system/DescriptorIO.h"
-#include "system/RootDirectory.h"
+#include "system/file/DescriptorIO.h"
+#include "system/file/RootDirectory.h"
 
 namespace appsync {
 

@@ -7,7 +7,7 @@
 #include <chrono>
 #include <thread>
 
-#include "system/PosixError.h"
+#include "system/file/PosixError.h"
 
 namespace appsync {
 

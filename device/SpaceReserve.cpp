@@ -11,7 +11,7 @@
 #include <optional>
 
 #include "device/values/DevicePaths.h"
-#include "system/UniqueFd.h"
+#include "system/file/UniqueFd.h"
 
 namespace appsync {
 

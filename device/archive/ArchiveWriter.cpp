@@ -15,8 +15,8 @@
 #include "device/archive/PackageArchiveFormat.h"
 #include "device/archive/PackageError.h"
 #include "device/archive/PackageFolder.h"
-#include "system/PosixError.h"
-#include "system/UniqueFd.h"
+#include "system/file/PosixError.h"
+#include "system/file/UniqueFd.h"
 
 namespace appsync {
 

@@ -13,7 +13,7 @@
 #include "device/archive/PackageEntries.h"
 #include "device/archive/PackageError.h"
 #include "device/archive/PackageFile.h"
-#include "system/PosixError.h"
+#include "system/file/PosixError.h"
 
 namespace appsync {
 

@@ -10,7 +10,7 @@
 
 #include "device/archive/PackageError.h"
 #include "device/values/PackageText.h"
-#include "system/PosixError.h"
+#include "system/file/PosixError.h"
 
 namespace appsync {
 
@@ -24,16 +24,16 @@ Result<PackageFile> PackageFile::open(const std::string& path) {
         return posixError(error, "open", path,
                           posixReason(error) + "; name a file that can be read");
     }
-    return take(std::move(descriptor), path);
+    return examine(std::move(descriptor), path);
 }
 
 Result<PackageFile> PackageFile::duplicate(int fileDescriptor, std::string_view name) {
     UniqueFd descriptor(::fcntl(fileDescriptor, F_DUPFD_CLOEXEC, 0));
     if (!descriptor) return posixError(errno, "open", name);
-    return take(std::move(descriptor), name);
+    return examine(std::move(descriptor), name);
 }
 
-Result<PackageFile> PackageFile::take(UniqueFd descriptor, std::string_view name) {
+Result<PackageFile> PackageFile::examine(UniqueFd descriptor, std::string_view name) {
     struct stat status = {};
     if (::fstat(descriptor.get(), &status) != 0) return posixError(errno, "examine", name);
     if (!S_ISREG(status.st_mode)) {
@@ -41,7 +41,11 @@ Result<PackageFile> PackageFile::take(UniqueFd descriptor, std::string_view name
                             "package " + quotedName(name) +
                                 ": it is not a regular file; name the .zip file itself");
     }
-    PackageFile file(std::move(descriptor), static_cast<std::uint64_t>(status.st_size), name);
+    return take({std::move(descriptor), static_cast<std::uint64_t>(status.st_size), 0}, name);
+}
+
+Result<PackageFile> PackageFile::take(RegularFile opened, std::string_view name) {
+    PackageFile file(std::move(opened.descriptor), opened.size, name);
     const std::uint64_t kept = std::min(file.size_, kKeptBytes);
     Result<Bytes> end = file.readExactly(file.size_ - kept, kept);
     if (!end) return end.error();

@@ -8,7 +8,8 @@
 
 #include "platform/Bytes.h"
 #include "platform/Result.h"
-#include "system/UniqueFd.h"
+#include "system/file/RootDirectory.h"
+#include "system/file/UniqueFd.h"
 
 namespace appsync {
 
@@ -22,6 +23,9 @@ class PackageFile {
     /// Opens a path of this machine. `NotARegularFile` for anything else, without waiting on a
     /// pipe.
     [[nodiscard]] static Result<PackageFile> open(const std::string& path);
+
+    /// Takes an open file over. `name` is what errors call it.
+    [[nodiscard]] static Result<PackageFile> take(RegularFile file, std::string_view name);
 
     /// Duplicates a descriptor. `name` is what errors call the file.
     [[nodiscard]] static Result<PackageFile> duplicate(int fileDescriptor, std::string_view name);
@@ -44,7 +48,7 @@ class PackageFile {
     PackageFile(UniqueFd descriptor, std::uint64_t size, std::string_view name);
     [[nodiscard]] std::size_t readKept(std::uint64_t offset,
                                        std::span<std::uint8_t> bytes) const noexcept;
-    [[nodiscard]] static Result<PackageFile> take(UniqueFd descriptor, std::string_view name);
+    [[nodiscard]] static Result<PackageFile> examine(UniqueFd descriptor, std::string_view name);
 
     UniqueFd descriptor_;
     std::uint64_t size_;

@@ -10,7 +10,7 @@
 
 #include "device/archive/PackageEntries.h"
 #include "device/values/PackageText.h"
-#include "system/PosixError.h"
+#include "system/file/PosixError.h"
 
 namespace appsync {
 

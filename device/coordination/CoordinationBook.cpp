@@ -78,14 +78,27 @@ Lookup CoordinationBook::begin(CoordinatorKind kind, const std::string& identifi
     stored.kind = kind;
     stored.client = client;
     const auto made = std::make_shared<LiveCoordinator>(stored, LiveCoordinator::Origin::New);
-    if (access_ == Access::Look) {
-        saveNow(made);
-        return {handle(made), true, std::nullopt};
-    }
+    if (access_ == Access::Look) return writeAtOnce(made);
     const Coordinator known = keepUnlessBegun(made);
     if (known != made) return answer(kind, known);
     saveLater(made);
     return {handle(made), true, std::nullopt};
+}
+
+// Beside a session nothing is written later.
+Lookup CoordinationBook::writeAtOnce(const Coordinator& made) {
+    bool written = false;
+    const Status status = context_.database.change(Durability::Soon, [&](Database& database) {
+        const Result<bool> saved = made->save(database);
+        if (!saved) return Status(saved.error());
+        written = *saved;
+        return Status();
+    });
+    if (!status) return nothing(status.error());
+    if (written) return {handle(made), true, std::nullopt};
+    // Somebody else was faster.
+    return lookUp(made->kind, made->identifier, made->client,
+                  InstallCoordinatorService::Creation::OnlyExisting);
 }
 
 // What another thread has begun meanwhile stays.

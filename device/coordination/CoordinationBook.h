@@ -110,6 +110,7 @@ class CoordinationBook : public std::enable_shared_from_this<CoordinationBook> {
     [[nodiscard]] InstallCoordinatorService::Coordinator begin(CoordinatorKind kind,
                                                                const std::string& identifier,
                                                                CoordinationClient client);
+    [[nodiscard]] InstallCoordinatorService::Coordinator writeAtOnce(const Coordinator& made);
     [[nodiscard]] Status requireInstalled(const std::string& identifier);
     [[nodiscard]] Result<std::int64_t> takeId();
     [[nodiscard]] Coordinator begun(const std::string& identifier) const;

@@ -10,8 +10,8 @@
 #include "device/values/DevicePaths.h"
 #include "device/values/WallClock.h"
 #include "platform/InstallProgressRecord.h"
-#include "system/RootDirectory.h"
-#include "system/RootedFileSystem.h"
+#include "system/file/RootDirectory.h"
+#include "system/file/RootedFileSystem.h"
 
 namespace appsync {
 

@@ -8,9 +8,10 @@
 #include <filesystem>
 #include <utility>
 
+#include "device/database/JoinedLog.h"
 #include "device/values/DeviceError.h"
 #include "device/values/DevicePaths.h"
-#include "system/PosixError.h"
+#include "system/file/PosixError.h"
 
 namespace appsync {
 
@@ -224,7 +225,8 @@ Result<std::unique_ptr<Database>> Database::openNamed(const std::string& path,
     sqlite3* handle = nullptr;
     const int creation = mode == Mode::Create ? SQLITE_OPEN_CREATE : 0;
     const int flags = SQLITE_OPEN_READWRITE | SQLITE_OPEN_NOMUTEX | SQLITE_OPEN_EXRESCODE;
-    const int resultCode = sqlite3_open_v2(path.c_str(), &handle, flags | creation, nullptr);
+    const int resultCode =
+        sqlite3_open_v2(path.c_str(), &handle, flags | creation, joinedLogLayer());
     std::unique_ptr<Database> database(new Database(handle, name));
     if (resultCode != SQLITE_OK) return database->error(resultCode);
     sqlite3_busy_timeout(handle, kBusyTimeoutMilliseconds);

@@ -15,9 +15,9 @@
 #include <utility>
 
 #include "device/values/DeviceError.h"
-#include "system/DescriptorIO.h"
-#include "system/PosixError.h"
-#include "system/UniqueFd.h"
+#include "system/file/DescriptorIO.h"
+#include "system/file/PosixError.h"
+#include "system/file/UniqueFd.h"
 
 namespace appsync {
 

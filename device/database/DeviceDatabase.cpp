@@ -86,12 +86,21 @@ DeviceDatabase::~DeviceDatabase() {
     flush().ignore();
 }
 
+/// Gives the writer back, also where the reading throws.
+struct DeviceDatabase::Loan {
+    explicit Loan(DeviceDatabase& lender) : database(lender) {}
+    Loan(const Loan&) = delete;
+    Loan& operator=(const Loan&) = delete;
+    ~Loan() { database.giveWriterBack(); }
+
+    DeviceDatabase& database;
+};
+
 Status DeviceDatabase::read(const Reading& reading) {
     if (!reader_) return change(Durability::Soon, reading);
     if (borrowWriter()) {
-        Status status = reading(*writer_);
-        giveWriterBack();
-        return noteFailure(std::move(status));
+        const Loan loan(*this);
+        return noteFailure(reading(*writer_));
     }
     const std::lock_guard lock(readerMutex_);
     return noteFailure(reading(*reader_));
@@ -171,25 +180,58 @@ void DeviceDatabase::lead(std::unique_lock<std::mutex>& lock) {
     wakeNext();
 }
 
-// Those that come until the commit begins join.
-void DeviceDatabase::commitTogether(std::vector<Waiting*>& batch, std::vector<Change> later) {
+// What throws ends the process: others wait for what it was part of.
+void DeviceDatabase::commitTogether(std::vector<Waiting*>& batch,
+                                    std::vector<Change> later) noexcept {
     const bool onDisk = std::any_of(batch.begin(), batch.end(), [](const Waiting* waiting) {
         return waiting->durability == Durability::OnDisk;
     });
     const Durability durability = onDisk ? Durability::OnDisk : Durability::Soon;
-    const Status begun = beginTransaction(durability);
-    if (!begun) {
-        for (Waiting* waiting : batch) waiting->status = begun;
-        return;
+    Status whole = beginTransaction(durability);
+    if (whole) {
+        whole = makeAll(batch, std::move(later), durability);
+        if (whole) whole = commit();
+    } else {
+        leaveAgain(std::move(later));
     }
+    if (whole) return;
+    for (Waiting* waiting : batch) {
+        if (waiting->status) waiting->status = whole;
+    }
+}
+
+// Those that come until the commit begins join.
+Status DeviceDatabase::makeAll(std::vector<Waiting*>& batch, std::vector<Change> later,
+                               Durability durability) {
     std::size_t made = 0;
     for (int joins = kMostJoins; made < batch.size() || !later.empty(); --joins) {
-        for (const Change& change : later) noteFailure(change(*writer_)).ignore();
+        for (const Change& change : later) {
+            if (Status lost = whyLost(noteFailure(change(*writer_))); !lost) return lost;
+        }
         later.clear();
-        for (; made < batch.size(); ++made) batch[made]->status = makeChange(batch[made]->change);
+        for (; made < batch.size(); ++made) {
+            batch[made]->status = makeChange(batch[made]->change);
+            if (Status lost = whyLost(batch[made]->status); !lost) return lost;
+        }
         if (joins > 0) later = joinArrived(batch, durability);
     }
-    endTransaction(batch);
+    return {};
+}
+
+// Some failures (a full disk) end the transaction on their own, with all that was done in it.
+Status DeviceDatabase::whyLost(const Status& last) const {
+    if (writer_->inTransaction()) return {};
+    if (!last) return last;
+    return deviceError(DeviceErrorCode::CannotUse,
+                       "the device's database " + writer_->path() +
+                           " did not keep what was written; check the disk, and run it again");
+}
+
+// They were left before what is left now.
+void DeviceDatabase::leaveAgain(std::vector<Change> later) {
+    const std::lock_guard lock(mutex_);
+    std::move(later_.begin(), later_.end(), std::back_inserter(later));
+    later_ = std::move(later);
 }
 
 // How safe a transaction is going to be cannot be changed any more.
@@ -218,6 +260,7 @@ Status DeviceDatabase::beginTransaction(Durability durability) {
 Status DeviceDatabase::makeChange(const Change& change) {
     if (Status status = writer_->query("SAVEPOINT change").run(); !status) return status;
     Status status = change(*writer_);
+    if (!writer_->inTransaction()) return status;
     if (!status) writer_->query("ROLLBACK TO change").run().ignore();
     if (Status released = writer_->query("RELEASE change").run(); !released && status) {
         return released;
@@ -225,18 +268,10 @@ Status DeviceDatabase::makeChange(const Change& change) {
     return status;
 }
 
-void DeviceDatabase::endTransaction(const std::vector<Waiting*>& batch) {
-    // Some failures (a full disk) roll the whole transaction back on their own.
-    const Status committed = writer_->query("COMMIT").run();
-    if (committed) return;
-    if (writer_->inTransaction()) writer_->query("ROLLBACK").run().ignore();
-    const auto culprit = std::find_if(batch.begin(), batch.end(), [](const Waiting* waiting) {
-        return !waiting->status && waiting->status.error().domain == kDeviceErrorDomain;
-    });
-    const Status cause = culprit == batch.end() ? committed : (*culprit)->status;
-    for (Waiting* waiting : batch) {
-        if (waiting->status) waiting->status = cause;
-    }
+Status DeviceDatabase::commit() {
+    Status committed = writer_->query("COMMIT").run();
+    if (!committed && writer_->inTransaction()) writer_->query("ROLLBACK").run().ignore();
+    return committed;
 }
 
 void DeviceDatabase::changeLater(Change change) {

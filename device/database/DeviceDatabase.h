@@ -5,7 +5,8 @@
 // KeptTable.h, SumTable.h and CoordinationTables.h are their statements, as functions that run
 // inside a transaction of the caller's. `DeviceDatabase` (this header) is what the other rooms
 // hold: it reads, and it makes changes whole, with as few waits for the disk as their durability
-// allows. DatabaseCopy.h is for those who may only read.
+// allows. JoinedLog.h writes a transaction at once, and DatabaseCopy.h is for those who may only
+// read.
 //
 // A new table, or a new column, begins in DeviceSchema.cpp, with a new schema version, and in
 // docs/device-format.md. Includes device/values, system/ and SQLite. Called by screen, services,
@@ -41,7 +42,7 @@ enum class Durability {
 /// Writers that come at the same time share one transaction and one sync: the first of them
 /// commits for all that wait by then, or come before the commit. Callable on any thread. The
 /// functions that are passed in may run on another thread than the caller's, but not after the call
-/// has returned; they must not call this object.
+/// has returned; they must not call this object. A change that throws ends the process.
 class DeviceDatabase {
   public:
     using Change = std::function<Status(Database&)>;
@@ -82,9 +83,9 @@ class DeviceDatabase {
     void changeAll(Durability durability, std::vector<Joint>& changes);
 
     /// Leaves a change for later: it goes with the next change of anyone's, at the latest a tenth
-    /// of a second from now. It runs after those that were left before it. A statement that fails
-    /// changes nothing; what the change did before is kept. A crash may lose it. It may run after
-    /// this call has returned.
+    /// of a second from now, or when the database takes changes again. It runs after those that
+    /// were left before it. A statement that fails changes nothing; what the change did before is
+    /// kept. A crash may lose it. It may run after this call has returned.
     void changeLater(Change change);
 
     /// Makes the changes that were left for later, now.
@@ -99,6 +100,7 @@ class DeviceDatabase {
 
   private:
     struct Waiting;
+    struct Loan;
 
     DeviceDatabase(std::unique_ptr<Database> reader, std::unique_ptr<Database> writer);
 
@@ -110,11 +112,14 @@ class DeviceDatabase {
     void wakeNext();
     void makeInTurn(std::vector<Waiting>& own);
     void lead(std::unique_lock<std::mutex>& lock);
-    void commitTogether(std::vector<Waiting*>& batch, std::vector<Change> later);
+    void commitTogether(std::vector<Waiting*>& batch, std::vector<Change> later) noexcept;
+    Status makeAll(std::vector<Waiting*>& batch, std::vector<Change> later, Durability durability);
+    Status whyLost(const Status& last) const;
+    void leaveAgain(std::vector<Change> later);
     std::vector<Change> joinArrived(std::vector<Waiting*>& batch, Durability durability);
     Status beginTransaction(Durability durability);
     Status makeChange(const Change& change);
-    void endTransaction(const std::vector<Waiting*>& batch);
+    Status commit();
     Status noteFailure(Status status);
     void flushNowAndThen();
 

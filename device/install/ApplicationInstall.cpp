@@ -18,9 +18,9 @@
 #include "device/package/PackageReader.h"
 #include "device/values/DeviceError.h"
 #include "platform/FileURL.h"
-#include "system/PosixError.h"
-#include "system/RootDirectory.h"
-#include "system/RootedFileSystem.h"
+#include "system/file/PosixError.h"
+#include "system/file/RootDirectory.h"
+#include "system/file/RootedFileSystem.h"
 
 namespace appsync {
 
@@ -28,11 +28,11 @@ namespace {
 
 Result<PackageReader> openPackage(const InstallContext& context, const std::string& identifier,
                                   const FileURL& package) {
-    const Result<RegularFile> file =
+    Result<RegularFile> file =
         context.files.root().openRegularFile(package.path(), "read the package");
     if (!file) return file.error();
-    Result<PackageReader> reader = PackageReader::open(
-        file->descriptor.get(), displayPath(package.path()), context.propertyLists);
+    Result<PackageReader> reader =
+        PackageReader::open(*std::move(file), displayPath(package.path()), context.propertyLists);
     if (!reader) return reader;
     if (Status status = reader->expectIdentifier(identifier); !status) return status.error();
     return reader;

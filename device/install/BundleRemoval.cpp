@@ -12,7 +12,7 @@
 #include "device/values/DeviceError.h"
 #include "device/values/DevicePaths.h"
 #include "device/values/WallClock.h"
-#include "system/RootedFileSystem.h"
+#include "system/file/RootedFileSystem.h"
 
 namespace appsync {
 

@@ -1,7 +1,6 @@
 #include "device/install/Containers.h"
 
 #include <fcntl.h>
-#include <sys/random.h>
 #include <sys/stat.h>
 #include <unistd.h>
 
@@ -9,9 +8,10 @@
 #include <cerrno>
 
 #include "device/values/DevicePaths.h"
-#include "system/PosixError.h"
-#include "system/RootDirectory.h"
-#include "system/RootedFileSystem.h"
+#include "system/file/PosixError.h"
+#include "system/file/RandomBytes.h"
+#include "system/file/RootDirectory.h"
+#include "system/file/RootedFileSystem.h"
 
 namespace appsync {
 
@@ -22,7 +22,7 @@ constexpr mode_t kContainerMode = 0755;
 // A random UUID (version 4) in upper case; empty when the system has no random bytes.
 std::string makeUuid() {
     std::array<unsigned char, 16> bytes{};
-    if (::getrandom(bytes.data(), bytes.size(), 0) != static_cast<ssize_t>(bytes.size())) return {};
+    if (!fillWithRandomBytes(bytes)) return {};
     bytes[6] = static_cast<unsigned char>((bytes[6] & 0x0fU) | 0x40U);
     bytes[8] = static_cast<unsigned char>((bytes[8] & 0x3fU) | 0x80U);
     constexpr std::string_view digits = "0123456789ABCDEF";

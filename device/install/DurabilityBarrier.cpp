@@ -4,7 +4,7 @@
 
 #include <cerrno>
 
-#include "system/PosixError.h"
+#include "system/file/PosixError.h"
 
 namespace appsync {
 

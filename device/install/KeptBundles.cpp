@@ -21,9 +21,9 @@
 #include "device/install/InstallContext.h"
 #include "device/values/DevicePaths.h"
 #include "platform/Error.h"
-#include "system/PosixError.h"
-#include "system/RootDirectory.h"
-#include "system/RootedFileSystem.h"
+#include "system/file/PosixError.h"
+#include "system/file/RootDirectory.h"
+#include "system/file/RootedFileSystem.h"
 
 namespace appsync {
 

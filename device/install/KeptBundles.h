@@ -6,7 +6,7 @@
 #include <vector>
 
 #include "platform/Result.h"
-#include "system/UniqueFd.h"
+#include "system/file/UniqueFd.h"
 
 namespace appsync {
 

@@ -20,11 +20,11 @@
 #include "device/values/PackageText.h"
 #include "platform/AppRegistry.h"
 #include "platform/PropertyListSerialization.h"
-#include "system/DescriptorIO.h"
-#include "system/MachinePath.h"
-#include "system/PosixError.h"
-#include "system/RootDirectory.h"
-#include "system/RootedFileSystem.h"
+#include "system/file/DescriptorIO.h"
+#include "system/file/MachinePath.h"
+#include "system/file/PosixError.h"
+#include "system/file/RootDirectory.h"
+#include "system/file/RootedFileSystem.h"
 
 namespace appsync {
 

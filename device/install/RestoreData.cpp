@@ -13,8 +13,8 @@
 #include "device/values/DeviceError.h"
 #include "device/values/DevicePaths.h"
 #include "device/values/PackageIdentifier.h"
-#include "system/RootDirectory.h"
-#include "system/RootedFileSystem.h"
+#include "system/file/RootDirectory.h"
+#include "system/file/RootedFileSystem.h"
 
 namespace appsync {
 

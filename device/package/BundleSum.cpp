@@ -10,9 +10,9 @@
 
 #include "device/archive/Crc.h"
 #include "platform/Bytes.h"
-#include "system/PosixError.h"
-#include "system/RootDirectory.h"
-#include "system/UniqueFd.h"
+#include "system/file/PosixError.h"
+#include "system/file/RootDirectory.h"
+#include "system/file/UniqueFd.h"
 
 namespace appsync {
 

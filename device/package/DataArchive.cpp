@@ -23,9 +23,9 @@
 #include "device/package/PackageReader.h"
 #include "device/package/PackageUnpacker.h"
 #include "device/values/PackageText.h"
-#include "system/DescriptorIO.h"
-#include "system/PosixError.h"
-#include "system/RootDirectory.h"
+#include "system/file/DescriptorIO.h"
+#include "system/file/PosixError.h"
+#include "system/file/RootDirectory.h"
 
 namespace appsync {
 

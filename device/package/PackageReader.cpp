@@ -77,6 +77,14 @@ Result<PackageReader> PackageReader::open(int fileDescriptor, std::string_view n
     return open(*std::move(file), propertyLists, limits);
 }
 
+Result<PackageReader> PackageReader::open(RegularFile opened, std::string_view name,
+                                          PropertyListSerialization& propertyLists,
+                                          const PackageLimits& limits) {
+    Result<PackageFile> file = PackageFile::take(std::move(opened), name);
+    if (!file) return file.error();
+    return open(*std::move(file), propertyLists, limits);
+}
+
 Result<PackageReader> PackageReader::open(PackageFile file,
                                           PropertyListSerialization& propertyLists,
                                           const PackageLimits& limits) {

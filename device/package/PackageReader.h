@@ -25,6 +25,7 @@ namespace appsync {
 class PackageArchive;
 class PackageFile;
 class PropertyListSerialization;
+struct RegularFile;
 
 /// A file fills its last block of the device's disk, and a directory takes one.
 inline constexpr std::uint64_t kBlockBytes = 4096;
@@ -92,6 +93,11 @@ class PackageReader {
     /// closed or moved at once: the reader keeps a duplicate and reads at offsets of its own.
     /// `name` is what errors call the package.
     [[nodiscard]] static Result<PackageReader> open(int fileDescriptor, std::string_view name,
+                                                    PropertyListSerialization& propertyLists,
+                                                    const PackageLimits& limits = {});
+
+    /// The same, of an open file that the reader takes over. `name` is what errors call it.
+    [[nodiscard]] static Result<PackageReader> open(RegularFile file, std::string_view name,
                                                     PropertyListSerialization& propertyLists,
                                                     const PackageLimits& limits = {});
 

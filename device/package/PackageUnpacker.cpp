@@ -11,8 +11,8 @@
 
 #include "device/archive/PackageArchive.h"
 #include "device/archive/PackageError.h"
-#include "system/DescriptorIO.h"
-#include "system/PosixError.h"
+#include "system/file/DescriptorIO.h"
+#include "system/file/PosixError.h"
 
 namespace appsync {
 

@@ -9,7 +9,7 @@
 #include "device/package/PackageReader.h"
 #include "platform/Bytes.h"
 #include "platform/Result.h"
-#include "system/UniqueFd.h"
+#include "system/file/UniqueFd.h"
 
 namespace appsync {
 

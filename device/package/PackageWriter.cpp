@@ -16,8 +16,8 @@
 #include "device/archive/PackageError.h"
 #include "device/archive/PackageFolder.h"
 #include "device/values/PackageText.h"
-#include "system/PosixError.h"
-#include "system/UniqueFd.h"
+#include "system/file/PosixError.h"
+#include "system/file/UniqueFd.h"
 
 namespace appsync {
 

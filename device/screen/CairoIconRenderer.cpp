@@ -9,8 +9,8 @@
 #include "platform/AppRegistry.h"
 #include "platform/PropertyList.h"
 #include "platform/PropertyListSerialization.h"
-#include "system/DescriptorIO.h"
-#include "system/RootDirectory.h"
+#include "system/file/DescriptorIO.h"
+#include "system/file/RootDirectory.h"
 
 namespace appsync {
 

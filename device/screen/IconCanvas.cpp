@@ -1,7 +1,6 @@
 #include "device/screen/IconCanvas.h"
 
 #include <cairo.h>
-#include <png.h>
 
 #include <algorithm>
 #include <array>
@@ -11,6 +10,7 @@
 #include <numbers>
 
 #include "device/screen/IconDrawing.h"
+#include "device/screen/PngFile.h"
 #include "device/values/PackageText.h"
 #include "platform/Error.h"
 
@@ -103,38 +103,38 @@ cairo_status_t readPng(void* closure, unsigned char* data, unsigned int length) 
     return CAIRO_STATUS_SUCCESS;
 }
 
-// The order of cairo's bytes: the pixels are numbers of 32 bits.
-constexpr png_uint_32 kPixelFormat =
-    std::endian::native == std::endian::little ? PNG_FORMAT_BGRA : PNG_FORMAT_ARGB;
-
-/// A pixel as PNG has it: its colours not yet multiplied by how opaque it is.
-std::uint32_t straight(std::uint32_t pixel) noexcept {
+/// A pixel as PNG has it, in the order of its bytes: its colours not yet multiplied by how opaque
+/// it is.
+void putStraight(std::uint32_t pixel, std::uint8_t* to) noexcept {
     const std::uint32_t alpha = pixel >> 24U;
-    if (alpha == 0) return 0;
-    if (alpha == 255) return pixel;
-    const auto color = [&](unsigned int shift) {
-        const std::uint32_t value = pixel >> shift & 0xffU;
-        return (value * 255U + alpha / 2) / alpha << shift;
-    };
-    return alpha << 24U | color(16) | color(8) | color(0);
+    std::uint32_t straight = pixel << 8U | alpha;
+    if (alpha != 0 && alpha != 255) {
+        const auto color = [&](unsigned int shift) {
+            return ((pixel >> shift & 0xffU) * 255U + alpha / 2) / alpha;
+        };
+        straight = color(16) << 24U | color(8) << 16U | color(0) << 8U | alpha;
+    }
+    to[0] = static_cast<std::uint8_t>(straight >> 24U);
+    to[1] = static_cast<std::uint8_t>(straight >> 16U);
+    to[2] = static_cast<std::uint8_t>(straight >> 8U);
+    to[3] = static_cast<std::uint8_t>(straight);
 }
 
-Bytes straightPixels(cairo_surface_t* surface) {
-    const auto width = static_cast<std::size_t>(::cairo_image_surface_get_width(surface));
-    const auto height = static_cast<std::size_t>(::cairo_image_surface_get_height(surface));
+PngRows rowsOf(cairo_surface_t* surface) {
+    const auto width = static_cast<std::uint32_t>(::cairo_image_surface_get_width(surface));
+    const auto height = static_cast<std::uint32_t>(::cairo_image_surface_get_height(surface));
     const auto stride = static_cast<std::size_t>(::cairo_image_surface_get_stride(surface));
     const unsigned char* from = ::cairo_image_surface_get_data(surface);
-    Bytes pixels(width * height * sizeof(std::uint32_t));
-    std::uint8_t* to = pixels.data();
+    PngRows rows(width, height);
     for (std::size_t row = 0; row < height; ++row, from += stride) {
+        std::uint8_t* to = rows.row(row);
         for (std::size_t column = 0; column < width; ++column, to += sizeof(std::uint32_t)) {
-            std::uint32_t pixel = 0;
+            std::uint32_t pixel = 0;  // cairo's are numbers of 32 bits
             std::memcpy(&pixel, from + column * sizeof pixel, sizeof pixel);
-            pixel = straight(pixel);
-            std::memcpy(to, &pixel, sizeof pixel);
+            putStraight(pixel, to);
         }
     }
-    return pixels;
+    return rows;
 }
 
 std::uint32_t hashOf(std::string_view text) noexcept {
@@ -206,21 +206,7 @@ Result<Bytes> encodePng(cairo_surface_t* surface) {
     ::cairo_surface_flush(surface);
     const cairo_status_t status = ::cairo_surface_status(surface);
     if (status != CAIRO_STATUS_SUCCESS) return cairoFailure(status);
-    png_image image{};
-    image.version = PNG_IMAGE_VERSION;
-    image.width = static_cast<png_uint_32>(::cairo_image_surface_get_width(surface));
-    image.height = static_cast<png_uint_32>(::cairo_image_surface_get_height(surface));
-    image.format = kPixelFormat;
-    // An icon is written with each install: its size matters less than the time.
-    image.flags = PNG_IMAGE_FLAG_FAST;
-    const Bytes pixels = straightPixels(surface);
-    png_alloc_size_t size = PNG_IMAGE_PNG_SIZE_MAX(image);
-    Bytes png(size);
-    if (::png_image_write_to_memory(&image, png.data(), &size, 0, pixels.data(), 0, nullptr) == 0) {
-        return refusal(std::string("cannot write the image: ") + &image.message[0]);
-    }
-    png.resize(size);
-    return png;
+    return rowsOf(surface).file();
 }
 
 void setColor(cairo_t* context, const Color& color) {

@@ -18,6 +18,8 @@ class DevicePlatformFixture : public DeviceFixture {
         if (!platform_) platform_.emplace(device().platform(host_, log_));
         return *platform_;
     }
+    /// That of another handle on the device.
+    [[nodiscard]] Platform platformOf(Device& other) { return other.platform(host_, log_); }
     void endSession() {
         platform_.reset();
         close();

@@ -11,7 +11,7 @@
 #include "contract/TemporaryMachineDirectory.h"
 #include "device/archive/PackageFolder.h"
 #include "device/package/DataArchive.h"
-#include "system/UniqueFd.h"
+#include "system/file/UniqueFd.h"
 
 namespace appsync {
 

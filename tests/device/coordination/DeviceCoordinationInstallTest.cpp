@@ -62,6 +62,22 @@ TEST_F(DeviceCoordinationInstallTest, ofTwoProcessesThatBeginAnInstallOneHasIt) 
     EXPECT_EQ(hasPlaceholder(kAtlas), ours.ok());
 }
 
+TEST_F(DeviceCoordinationInstallTest, whatBesideASessionCannotBeWrittenWasNotCreated) {
+    const auto beside = look();
+    InstallCoordinatorService& theirs = platformOf(*beside).coordination;
+    const auto create = [&](const char* identifier) {
+        return theirs.coordinator(CoordinatorKind::Initiating, identifier, AppStoreClientID,
+                                  InstallCoordinatorService::Creation::CreateIfNotExisting);
+    };
+    ASSERT_NE(create(kBoat).coordinator, nullptr);
+    EXPECT_EQ(number("SELECT id FROM coordinators"), 1);
+    sql("INSERT INTO coordinators (id, identifier, kind, client, created)"
+        " VALUES (2, 'com.example.in.the.way', 0, 1, 0)");
+    const auto made = create(kAtlas);
+    EXPECT_EQ(made.coordinator, nullptr);
+    EXPECT_TRUE(made.error);
+}
+
 TEST_F(DeviceCoordinationInstallTest, aConfiguredPlaceholderStandsAtOnceWithAllThatItWasGiven) {
     const auto made = prepare(kAtlas);
     const std::optional<AppProxy> proxy = either(kAtlas);

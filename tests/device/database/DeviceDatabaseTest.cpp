@@ -6,9 +6,13 @@
 
 #include <atomic>
 #include <filesystem>
+#include <new>
+#include <string_view>
 #include <thread>
+#include <vector>
 
 #include "device/database/Database.h"
+#include "device/values/DeviceError.h"
 #include "device/values/DevicePaths.h"
 #include "tests/device/DeviceFixture.h"
 
@@ -28,6 +32,13 @@ class DeviceDatabaseTest : public DeviceFixture {
             .run();
     }
     std::int64_t rows() const { return number("SELECT count(*) FROM restore_data"); }
+
+    static constexpr std::string_view kNoRoom = "there is no room";
+    /// Fails as a statement does that takes the transaction with it.
+    static Status loseTransaction(Database& database) {
+        database.execute("ROLLBACK").ignore();
+        return deviceError(DeviceErrorCode::NoSpace, kNoRoom);
+    }
 };
 
 TEST_F(DeviceDatabaseTest, aChangeIsSeenByEverybodyWhenTheCallReturns) {
@@ -196,6 +207,64 @@ TEST_F(DeviceDatabaseTest, aLaterChangeThatFailsHoldsNobodyUp) {
     database->changeLater([](Database& writer) { return insert(writer, "later"); });
     EXPECT_TRUE(succeeded(database->flush()));
     EXPECT_EQ(rows(), 1);
+}
+
+TEST_F(DeviceDatabaseTest, aFailureThatEndsTheTransactionFailsAllOfItsChanges) {
+    const auto database = open();
+    const DeviceDatabase::Change before = [](Database& writer) { return insert(writer, "before"); };
+    const DeviceDatabase::Change after = [](Database& writer) { return insert(writer, "after"); };
+    const DeviceDatabase::Change losing = loseTransaction;
+    std::vector<DeviceDatabase::Joint> changes;
+    changes.push_back({before, {}});
+    changes.push_back({losing, {}});
+    changes.push_back({after, {}});
+    database->changeAll(Durability::OnDisk, changes);
+    for (const DeviceDatabase::Joint& each : changes) {
+        ASSERT_FALSE(each.status);
+        EXPECT_EQ(each.status.error().description(), kNoRoom);
+    }
+    EXPECT_EQ(rows(), 0);
+    EXPECT_TRUE(succeeded(database->change(Durability::OnDisk, after)));
+    EXPECT_EQ(rows(), 1);
+}
+
+TEST_F(DeviceDatabaseTest, aLaterChangeThatEndsTheTransactionTellsWhy) {
+    const auto database = open();
+    database->changeLater(loseTransaction);
+    const Status status = database->change(
+        Durability::OnDisk, [](Database& writer) { return insert(writer, "with it"); });
+    ASSERT_FALSE(status);
+    EXPECT_EQ(status.error().description(), kNoRoom);
+    EXPECT_EQ(rows(), 0);
+}
+
+TEST_F(DeviceDatabaseTest, whatWasLeftForLaterWaitsUntilATransactionCanBegin) {
+    const auto database = open();
+    const auto perform = [&](const char* statement) {
+        return database->read([&](Database& writer) { return writer.execute(statement); });
+    };
+    ASSERT_TRUE(succeeded(perform("BEGIN")));  // so none can begin within it
+    database->changeLater([](Database& writer) { return insert(writer, "later"); });
+    EXPECT_FALSE(database->flush());
+    while (!perform("ROLLBACK")) std::this_thread::yield();
+    EXPECT_TRUE(succeeded(database->flush()));
+    EXPECT_EQ(rows(), 1);
+}
+
+TEST_F(DeviceDatabaseTest, aReadingThatThrowsHoldsNobodyUp) {
+    const auto database = open();
+    const auto lacksMemory = [](Database&) -> Status { throw std::bad_alloc(); };
+    EXPECT_THROW(database->read(lacksMemory).ignore(), std::bad_alloc);
+    EXPECT_TRUE(succeeded(database->change(
+        Durability::OnDisk, [](Database& writer) { return insert(writer, "next"); })));
+}
+
+TEST_F(DeviceDatabaseTest, aChangeThatThrowsEndsTheProcess) {
+    const auto database = open();
+    const auto lacksMemory = [](Database&) -> Status { throw std::bad_alloc(); };
+    EXPECT_EXIT(database->change(Durability::OnDisk, lacksMemory).ignore(),
+                testing::KilledBySignal(SIGABRT), "");
+    EXPECT_EQ(rows(), 0);
 }
 
 TEST_F(DeviceDatabaseTest, aFailureOfTheDatabaseIsRemembered) {

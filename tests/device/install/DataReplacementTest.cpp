@@ -3,7 +3,7 @@
 #include <filesystem>
 
 #include "device/values/DevicePaths.h"
-#include "system/UniqueFd.h"
+#include "system/file/UniqueFd.h"
 #include "tests/device/DeviceFixture.h"
 
 #include <fcntl.h>

@@ -13,10 +13,10 @@
 #include "device/install/JointCommits.h"
 #include "device/install/KeptBundles.h"
 #include "device/install/ProgressBook.h"
-#include "device/install/Rollback.h"
+#include "device/install/recovery/Rollback.h"
 #include "device/values/DevicePaths.h"
-#include "system/PosixError.h"
-#include "system/RootedFileSystem.h"
+#include "system/file/PosixError.h"
+#include "system/file/RootedFileSystem.h"
 #include "system/property_list/PropertyListCodec.h"
 #include "tests/device/DeviceFixture.h"
 

@@ -4,7 +4,7 @@
 #include <filesystem>
 #include <fstream>
 
-#include "system/RootDirectory.h"
+#include "system/file/RootDirectory.h"
 #include "tests/device/package/PackageFixture.h"
 
 namespace appsync {

@@ -14,7 +14,7 @@
 
 #include "contract/TemporaryMachineDirectory.h"
 #include "device/archive/PackageError.h"
-#include "system/RootDirectory.h"
+#include "system/file/RootDirectory.h"
 #include "tests/device/package/PackageZip.h"
 
 namespace appsync {

@@ -10,8 +10,8 @@
 
 #include "contract/TemporaryMachineDirectory.h"
 #include "device/package/DataArchive.h"
-#include "system/RootDirectory.h"
-#include "system/UniqueFd.h"
+#include "system/file/RootDirectory.h"
+#include "system/file/UniqueFd.h"
 
 namespace appsync {
 

@@ -10,7 +10,7 @@
 #include "device/archive/PackageError.h"
 #include "device/package/PackageReader.h"
 #include "platform/PropertyListSerialization.h"
-#include "system/UniqueFd.h"
+#include "system/file/UniqueFd.h"
 #include "tests/device/package/PackageZip.h"
 
 namespace appsync {

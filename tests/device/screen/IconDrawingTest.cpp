@@ -1,7 +1,11 @@
 #include "device/screen/IconDrawing.h"
 
+#include <cairo.h>
 #include <gtest/gtest.h>
 #include <sys/resource.h>
+
+#include <cstring>
+#include <utility>
 
 #include "tests/device/screen/IconPng.h"
 
@@ -22,6 +26,33 @@ TEST(IconDrawingTest, iconsGetTheirSizeAndRoundCorners) {
         EXPECT_EQ(pixelOf(*icon, 0, 0), 0U);
         EXPECT_EQ(pixelOf(*icon, 119, 119), 0U);
     }
+}
+
+/// Every opacity beside every share of a colour that goes with it.
+Surface manyPixels() {
+    Result<Surface> surface = makeSurface(256, 256);
+    unsigned char* pixels = ::cairo_image_surface_get_data(surface->get());
+    for (std::uint32_t alpha = 0; alpha < 256; ++alpha) {
+        for (std::uint32_t part = 0; part < 256; ++part) {
+            const std::uint32_t red = part * alpha / 255;
+            const std::uint32_t pixel = alpha << 24U | red << 16U | (alpha - red) << 8U | red / 2;
+            std::memcpy(pixels + (alpha * 256 + part) * 4, &pixel, sizeof pixel);
+        }
+    }
+    ::cairo_surface_mark_dirty(surface->get());
+    return std::move(*surface);
+}
+
+TEST(IconDrawingTest, picturesComeBackPixelForPixel) {
+    const Surface written = manyPixels();
+    const Result<Bytes> png = encodePng(written.get());
+    ASSERT_TRUE(png.ok());
+    const Result<Surface> read = decodePng(*png);
+    ASSERT_TRUE(read.ok()) << read.error().description();
+    ASSERT_EQ(::cairo_image_surface_get_stride(read->get()), 256 * 4);
+    EXPECT_EQ(std::memcmp(::cairo_image_surface_get_data(read->get()),
+                          ::cairo_image_surface_get_data(written.get()), 256 * 256 * 4),
+              0);
 }
 
 TEST(IconDrawingTest, anImageThatIsNotSquareFillsTheIcon) {

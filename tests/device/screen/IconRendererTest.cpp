@@ -5,7 +5,7 @@
 
 #include "device/screen/CairoIconRenderer.h"
 #include "device/screen/IconDrawing.h"
-#include "system/RootDirectory.h"
+#include "system/file/RootDirectory.h"
 #include "tests/device/package/PackageFixture.h"
 #include "tests/device/screen/IconPng.h"
 

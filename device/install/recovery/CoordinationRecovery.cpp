@@ -1,4 +1,4 @@
-#include "device/install/CoordinationRecovery.h"
+#include "device/install/recovery/CoordinationRecovery.h"
 
 #include <vector>
 

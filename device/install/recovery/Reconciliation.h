@@ -1,5 +1,9 @@
 #pragma once
 
+// device/install/recovery: what puts a device in order before a session: after a crash (this
+// header, with CoordinationRecovery.h), and from an update back to what it replaced (Rollback.h).
+// Called by Device alone.
+
 #include <string>
 #include <vector>
 

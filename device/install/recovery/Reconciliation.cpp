@@ -1,4 +1,4 @@
-#include "device/install/Reconciliation.h"
+#include "device/install/recovery/Reconciliation.h"
 
 #include <unistd.h>
 
@@ -12,19 +12,19 @@
 #include "device/database/RegistryTables.h"
 #include "device/database/SumTable.h"
 #include "device/install/Containers.h"
-#include "device/install/CoordinationRecovery.h"
 #include "device/install/DurabilityBarrier.h"
 #include "device/install/InstallContext.h"
 #include "device/install/KeptBundles.h"
 #include "device/install/RestoreData.h"
+#include "device/install/recovery/CoordinationRecovery.h"
 #include "device/values/DevicePaths.h"
 #include "device/values/PackageIdentifier.h"
 #include "device/values/WallClock.h"
 #include "platform/InstallProgressRecord.h"
-#include "system/PosixError.h"
-#include "system/RootDirectory.h"
-#include "system/RootedFileSystem.h"
-#include "system/TemporaryFile.h"
+#include "system/file/PosixError.h"
+#include "system/file/RootDirectory.h"
+#include "system/file/RootedFileSystem.h"
+#include "system/file/TemporaryFile.h"
 
 namespace appsync {
 

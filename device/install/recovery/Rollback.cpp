@@ -1,4 +1,4 @@
-#include "device/install/Rollback.h"
+#include "device/install/recovery/Rollback.h"
 
 #include <cerrno>
 #include <optional>
@@ -21,9 +21,9 @@
 #include "device/values/WallClock.h"
 #include "platform/AppRegistry.h"
 #include "platform/PropertyListSerialization.h"
-#include "system/PosixError.h"
-#include "system/RootDirectory.h"
-#include "system/RootedFileSystem.h"
+#include "system/file/PosixError.h"
+#include "system/file/RootDirectory.h"
+#include "system/file/RootedFileSystem.h"
 
 namespace appsync {
 
