@@ -189,6 +189,13 @@ std::shared_ptr<const DeviceView> DeviceViewer::showLogChanged() {
     return last_;
 }
 
+std::shared_ptr<const DeviceView> DeviceViewer::showStateAgain() {
+    auto next = std::make_shared<DeviceView>(*last_);
+    next->stateChanged = ++next->stamp;
+    last_ = std::move(next);
+    return last_;
+}
+
 void DeviceViewer::showReading(DeviceView& next, const DeviceReading& reading) {
     session_.see(reading.moment);
     next.state = reading.moment.session.isUnderWay ? "syncing" : "idle";

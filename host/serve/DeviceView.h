@@ -73,6 +73,8 @@ class DeviceViewer {
                                                          bool hasLog);
     /// The last one, with more in the log.
     [[nodiscard]] std::shared_ptr<const DeviceView> showLogChanged();
+    /// The last one, whose state is to be told again: somebody was shown another.
+    [[nodiscard]] std::shared_ptr<const DeviceView> showStateAgain();
 
   private:
     void showReading(DeviceView& next, const DeviceReading& reading);

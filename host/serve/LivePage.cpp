@@ -70,8 +70,7 @@ PageJson cardOf(const ServedDevice& device, const DeviceView& view) {
             {"applications", view.applications->installed},
             {"installing", view.applications->installing},
             {"placeholders", view.applications->placeholders},
-            {"session", PageJson::parse(view.session.json)},
-            {"lastSession", nullptr}};
+            {"session", PageJson::parse(view.session.json)}};
 }
 
 HttpAnswer whyAnswer(Device& device, const std::string& identifier) {

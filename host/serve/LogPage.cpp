@@ -16,8 +16,8 @@
 
 #include "host/console/JsonWriting.h"
 #include "system/LogFile.h"
-#include "system/PosixError.h"
-#include "system/UniqueFd.h"
+#include "system/file/PosixError.h"
+#include "system/file/UniqueFd.h"
 
 #include <nlohmann/json.hpp>
 

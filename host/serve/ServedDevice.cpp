@@ -35,8 +35,8 @@ struct ServedDevice::Asked {
 
 ServedDevice::Watching::Watching(ServedDevice& device) : device_(device) {
     const std::lock_guard lock(device_.mutex_);
-    ++device_.watchers_;
     device_.wake();
+    ++device_.watchers_;
 }
 
 ServedDevice::Watching::~Watching() {
@@ -69,11 +69,13 @@ std::uint64_t ServedDevice::ask() {
 }
 
 std::shared_ptr<const DeviceView> ServedDevice::view(std::uint64_t ticket,
-                                                     std::chrono::milliseconds longest) const {
+                                                     std::chrono::milliseconds longest) {
     std::unique_lock lock(mutex_);
     const bool isThere =
         changed_.wait_for(lock, longest, [&] { return isOver_ || served_ >= ticket; });
-    return isThere && view_ ? view_ : lockedView(view_.get());
+    if (isThere && view_) return view_;
+    wasShownLocked_ = true;
+    return lockedView(view_.get());
 }
 
 std::shared_ptr<const DeviceView> ServedDevice::lastView() const {
@@ -94,11 +96,10 @@ HttpAnswer ServedDevice::answer(Question question) {
 }
 
 HttpAnswer ServedDevice::answerSeldom(Question question) {
-    {
-        const std::lock_guard lock(mutex_);
-        if (seldomAnswer_ && ReadingClock::now() < seldomUntil_) return *seldomAnswer_;
-    }
+    if (std::optional<HttpAnswer> kept = seldomAnswer()) return *std::move(kept);
     return answer([this, question = std::move(question)](Device& device) {
+        // Of those who ask at once the first has it made for all.
+        if (std::optional<HttpAnswer> kept = seldomAnswer()) return *std::move(kept);
         const ReadingClock::time_point begin = ReadingClock::now();
         HttpAnswer made = question(device);
         keepSeldom(made, ReadingClock::now() - begin);
@@ -106,10 +107,23 @@ HttpAnswer ServedDevice::answerSeldom(Question question) {
     });
 }
 
+std::optional<HttpAnswer> ServedDevice::seldomAnswer() const {
+    const std::lock_guard lock(mutex_);
+    if (ReadingClock::now() < seldomUntil_) return seldomAnswer_;
+    return std::nullopt;
+}
+
 void ServedDevice::keepSeldom(const HttpAnswer& answer, ReadingClock::duration cost) {
     const std::lock_guard lock(mutex_);
     seldomAnswer_ = answer;
     seldomUntil_ = ReadingClock::now() + (isUnderWay_ ? cost * kShareOfTime : cost * 0);
+}
+
+// What was made while the session went on is not what there is to show of it once it is seen to be
+// over.
+void ServedDevice::forgetSeldom() {
+    const std::lock_guard lock(mutex_);
+    seldomAnswer_.reset();
 }
 
 HttpAnswer ServedDevice::icon(const std::string& identifier) {
@@ -185,6 +199,7 @@ void ServedDevice::work(const std::deque<std::shared_ptr<Asked>>& questions) {
         lastLogChange_ = ReadingClock::now();
         publish(viewer_.showLogChanged());
     }
+    takeBackLocked();
 }
 
 bool ServedDevice::hasToRead(const DeviceStamp& stamp) const {
@@ -203,6 +218,7 @@ void ServedDevice::read(Result<std::unique_ptr<Device>>& device, const DeviceSta
     stamp_ = stamp;
     hasFailed_ = !reading;
     isUnderWay_ = reading && reading->moment.session.isUnderWay;
+    if (!isUnderWay_) forgetSeldom();
     std::shared_ptr<const DeviceView> view = viewer_.show(reading, stamp.log.size > 0);
     if (logGrew) view = viewer_.showLogChanged();
     publish(std::move(view));
@@ -219,6 +235,14 @@ void ServedDevice::publish(std::shared_ptr<const DeviceView> view) {
         view_ = std::move(view);
     }
     bell_.ring();
+}
+
+void ServedDevice::takeBackLocked() {
+    {
+        const std::lock_guard lock(mutex_);
+        if (!std::exchange(wasShownLocked_, false)) return;
+    }
+    publish(viewer_.showStateAgain());
 }
 
 void ServedDevice::answerAll(const std::deque<std::shared_ptr<Asked>>& questions,

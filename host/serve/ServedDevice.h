@@ -44,7 +44,7 @@ class ServedDevice {
     /// Waits until that view is there; where it does not come in that time, the device is shown as
     /// locked.
     [[nodiscard]] std::shared_ptr<const DeviceView> view(std::uint64_t ticket,
-                                                         std::chrono::milliseconds longest) const;
+                                                         std::chrono::milliseconds longest);
     /// The last one; nothing before the first.
     [[nodiscard]] std::shared_ptr<const DeviceView> lastView() const;
 
@@ -82,8 +82,11 @@ class ServedDevice {
     [[nodiscard]] bool hasToRead(const DeviceStamp& stamp) const;
     void read(Result<std::unique_ptr<Device>>& device, const DeviceStamp& stamp);
     void publish(std::shared_ptr<const DeviceView> view);
+    void takeBackLocked();
     void answerAll(const std::deque<std::shared_ptr<Asked>>& questions,
                    Result<std::unique_ptr<Device>>& device);
+    [[nodiscard]] std::optional<HttpAnswer> seldomAnswer() const;
+    void forgetSeldom();
     void keepSeldom(const HttpAnswer& answer, ReadingClock::duration cost);
     [[nodiscard]] HttpAnswer drawIcon(Device& device, const ApplicationRecord& record);
 
@@ -97,7 +100,8 @@ class ServedDevice {
     std::shared_ptr<const DeviceView> view_;
     std::deque<std::shared_ptr<Asked>> questions_;
     std::uint64_t tickets_ = 0;
-    std::uint64_t served_ = 0;  // the last ticket whose view is there
+    std::uint64_t served_ = 0;     // the last ticket whose view is there
+    bool wasShownLocked_ = false;  // because a view did not come in time
     int watchers_ = 0;
     bool isOver_ = false;
     ReadingClock::time_point nextLook_;

@@ -9,7 +9,7 @@
 #include "host/serve/ChangeBell.h"
 #include "host/serve/ServedDevice.h"
 #include "host/serve/http/PercentDecoding.h"
-#include "system/PosixError.h"
+#include "system/file/PosixError.h"
 
 namespace appsync {
 namespace {

@@ -29,7 +29,7 @@ std::string withUnit(double value, const char* unit) {
 
 void addTo(WaitSum& sum, const TimelineWait& wait) {
     ++sum.count;
-    sum.total += wait.length();
+    sum.total = together(sum.total, wait.length());
     sum.isOpen = sum.isOpen || wait.isOpen;
     if (sum.count > 1 && wait.length() <= sum.longest) return;
     sum.longest = wait.length();
@@ -61,13 +61,22 @@ bool isWaitForOthers(SpanKind kind) { return kind == SpanKind::Turn || kind == S
 TimelineMoment TimelineLane::ownTime() const {
     TimelineMoment time{0};
     for (const TimelineSpan& span : spans) {
-        if (!isWaitForOthers(span.kind)) time += span.length();
+        if (!isWaitForOthers(span.kind)) time = together(time, span.length());
     }
     return time;
 }
 
 bool needsAttention(const TimelineLane& lane) {
     return lane.outcome == LaneOutcome::Failed || lane.outcome == LaneOutcome::Cancelled;
+}
+
+bool isNotOver(const TimelineLane& lane) {
+    return lane.outcome == LaneOutcome::Open || lane.outcome == LaneOutcome::Waiting;
+}
+
+TimelineMoment together(TimelineMoment left, TimelineMoment right) {
+    const TimelineMoment longest = TimelineMoment::max();
+    return right > longest - left ? longest : left + right;
 }
 
 std::string durationText(TimelineMoment length) {

@@ -133,6 +133,10 @@ struct Timeline {
 [[nodiscard]] bool isWaitForOthers(SpanKind kind);
 /// Whether the application is one that somebody should look at.
 [[nodiscard]] bool needsAttention(const TimelineLane& lane);
+/// Whether nobody knows yet what becomes of the application.
+[[nodiscard]] bool isNotOver(const TimelineLane& lane);
+/// Both times; the longest that there is, where what tells of them is so wrong that it is shorter.
+[[nodiscard]] TimelineMoment together(TimelineMoment left, TimelineMoment right);
 /// "12 ms", "3.4 s", "2 min 5 s".
 [[nodiscard]] std::string durationText(TimelineMoment length);
 /// "5 applications: 4 installed, 1 failed".

@@ -1,5 +1,6 @@
 #pragma once
 
+#include <chrono>
 #include <cstdint>
 #include <string>
 #include <string_view>
@@ -53,6 +54,12 @@ struct TimelineEvent {
     std::string detail{};
     std::string version{};
     std::uint64_t thread = 0;
+};
+
+/// The same with the time of day, where that is known.
+struct TimedEvent {
+    std::chrono::system_clock::time_point time;
+    TimelineEvent event;
 };
 
 /// Which of a message's arguments say what; the first is the plug-in's own identifier.

@@ -23,10 +23,6 @@ LaneGroup allOf(const Timeline& timeline, const char* heading,
     return group;
 }
 
-bool isNotOver(const TimelineLane& lane) {
-    return lane.outcome == LaneOutcome::Open || lane.outcome == LaneOutcome::Waiting;
-}
-
 /// The longest of a group, as many as have room, in their order; the rest stays in the group.
 LaneGroup takeLongest(LaneGroup& group, std::size_t most) {
     std::vector<const TimelineLane*> byLength = group.lanes;

@@ -45,19 +45,15 @@ const std::vector<SpanKind> kDoing = {SpanKind::Install, SpanKind::Transfer, Spa
 const std::vector<SpanKind> kWaiting = {SpanKind::Termination, SpanKind::Store, SpanKind::Queue,
                                         SpanKind::Turn};
 
-bool isNotOver(LaneOutcome outcome) {
-    return outcome == LaneOutcome::Open || outcome == LaneOutcome::Waiting;
-}
-
 const char* markOf(const TimelineLane& lane) {
     if (needsAttention(lane)) return kCrossMark;
-    if (isNotOver(lane.outcome)) return kOpenMark;
+    if (isNotOver(lane)) return kOpenMark;
     return lane.outcome == LaneOutcome::Skipped ? kDashMark : kCheckMark;
 }
 
 Paint paintOf(const TimelineLane& lane) {
     if (needsAttention(lane)) return {Pen::Bad};
-    const bool isDone = !isNotOver(lane.outcome) && lane.outcome != LaneOutcome::Skipped;
+    const bool isDone = !isNotOver(lane) && lane.outcome != LaneOutcome::Skipped;
     return {isDone ? Pen::Good : Pen::Faint};
 }
 
@@ -379,7 +375,7 @@ void PictureLayout::addLongest() {
         for (const TimelineSpan& span : lane->spans) {
             if (isWaitForOthers(span.kind)) continue;
             const double x = ownScale.at(begin);
-            begin += span.length();
+            begin = together(begin, span.length());
             addSpanBox({x,
                         y_ + 3,
                         ownScale.at(begin) - x,

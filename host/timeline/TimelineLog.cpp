@@ -3,8 +3,10 @@
 #include <algorithm>
 #include <array>
 #include <charconv>
+#include <chrono>
 #include <cstdint>
 #include <string>
+#include <unordered_set>
 #include <utility>
 
 #include <nlohmann/json.hpp>
@@ -27,21 +29,38 @@ std::string_view formatOfLine(std::string_view line) {
     return line.substr(std::min(begin + kBefore.size(), line.size()));
 }
 
-/// Puts lines into sessions. Of a restore the last message may be the one on its placeholders: what
-/// is transferred after it belongs to another session.
+/// The identifier that a message names, as it stands in the line.
+std::string identifierIn(const LoggedMessage& line) {
+    constexpr std::string_view kBefore = R"("message":")";
+    constexpr std::string_view kBehind = R"(","format":")";
+    const std::size_t before = line.line.find(kBefore);
+    const std::size_t end = line.line.rfind(kBehind);
+    if (before == std::string_view::npos || end < before + kBefore.size()) return {};
+    const std::size_t begin = before + kBefore.size();
+    const std::vector<std::string> arguments =
+        argumentsOfMessage(line.message->format, line.line.substr(begin, end - begin));
+    const auto at = static_cast<std::size_t>(line.message->identifier);
+    return at < arguments.size() ? arguments[at] : std::string();
+}
+
+/// Puts lines into sessions. Nothing tells that packages are sent unasked: those that are
+/// transferred when a session is over, or when nobody goes on with it, begin another. Of a restore
+/// the last message may be the one on its placeholders.
 class SessionSorting {
   public:
     void add(const LoggedMessage& line) {
         const TimelineEventKind kind = line.message->kind;
         const bool isTransfer = kind == TransferGoesOn || kind == TransferEnds;
-        if (kind == SyncBegins || kind == RestoreBegins || (isOver_ && isTransfer)) {
-            begin(false);
+        if (kind == SyncBegins || kind == RestoreBegins || (isTransfer && isUnasked(line))) {
+            begin(kind);
         } else if (sessions_.empty() && !isOfSession(kind)) {
-            begin(true);
+            begin(kind);
+            sessions_.back().lacksBeginning = true;
         }
         if (sessions_.empty() || (isOver_ && !isOfRestore_)) return;
         sessions_.back().lines.push_back(line);
-        isOfRestore_ = isOfRestore_ || kind == RestoreBegins;
+        if (kind == Asked) asked_.insert(identifierIn(line));
+        hasTransferred_ = hasTransferred_ || kind == TransfersEnd;
         isOver_ = kind == SessionEnds || (isOver_ && isOfRestore_) ||
                   (isOfRestore_ && kind == PlaceholdersThere);
     }
@@ -49,14 +68,26 @@ class SessionSorting {
     [[nodiscard]] std::vector<LoggedSession> take() { return std::move(sessions_); }
 
   private:
-    void begin(bool lacksBeginning) {
-        sessions_.push_back({{}, lacksBeginning});
+    void begin(TimelineEventKind kind) {
+        sessions_.emplace_back();
+        asked_.clear();
         isOver_ = false;
-        isOfRestore_ = false;
+        hasTransferred_ = false;
+        isOfSync_ = kind == SyncBegins;
+        isOfRestore_ = kind == RestoreBegins;
+    }
+
+    /// A sync that was killed ends without a word.
+    [[nodiscard]] bool isUnasked(const LoggedMessage& line) const {
+        if (isOver_ || hasTransferred_) return true;
+        return isOfSync_ && !asked_.contains(identifierIn(line));
     }
 
     std::vector<LoggedSession> sessions_;
+    std::unordered_set<std::string> asked_;  // of the session
     bool isOver_ = false;
+    bool hasTransferred_ = false;
+    bool isOfSync_ = false;
     bool isOfRestore_ = false;
 };
 
@@ -70,6 +101,10 @@ std::optional<int> digitsOf(std::string_view& text, std::size_t count) {
     text.remove_prefix(count);
     return number;
 }
+
+/// Any two times between them can be subtracted.
+constexpr int kFirstYear = 1970;
+constexpr int kLastYear = 2200;
 
 /// "2026-11-23T07:30:03.267953Z"
 std::optional<LogTime> timeOfLine(std::string_view text) {
@@ -85,7 +120,7 @@ std::optional<LogTime> timeOfLine(std::string_view text) {
     const std::chrono::year_month_day day{std::chrono::year{parts[0]},
                                           std::chrono::month{static_cast<unsigned>(parts[1])},
                                           std::chrono::day{static_cast<unsigned>(parts[2])}};
-    if (!day.ok()) return std::nullopt;
+    if (!day.ok() || parts[0] < kFirstYear || parts[0] > kLastYear) return std::nullopt;
     return std::chrono::sys_days(day) + std::chrono::hours(parts[3]) +
            std::chrono::minutes(parts[4]) + std::chrono::seconds(parts[5]) +
            std::chrono::microseconds(parts[6]);
@@ -110,13 +145,13 @@ std::vector<LoggedSession> sessionsInLog(std::string_view text) {
     return sorting.take();
 }
 
-std::optional<LoggedEvent> eventOfLine(const LoggedMessage& line) {
+std::optional<TimedEvent> eventOfLine(const LoggedMessage& line) {
     const nlohmann::json parsed =
         nlohmann::json::parse(line.line.begin(), line.line.end(), nullptr, false);
     if (!parsed.is_object()) return std::nullopt;
     const std::optional<LogTime> time = timeOfLine(textOf(parsed, "time"));
     if (!time) return std::nullopt;
-    return LoggedEvent{
+    return TimedEvent{
         *time, eventOfMessage(*line.message,
                               argumentsOfMessage(line.message->format, textOf(parsed, "message")))};
 }

@@ -1,6 +1,5 @@
 #pragma once
 
-#include <chrono>
 #include <optional>
 #include <string_view>
 #include <vector>
@@ -27,10 +26,6 @@ struct LoggedSession {
 [[nodiscard]] std::vector<LoggedSession> sessionsInLog(std::string_view text);
 
 /// What a line tells of, and when; nothing where the line is damaged.
-struct LoggedEvent {
-    std::chrono::system_clock::time_point time;
-    TimelineEvent event;
-};
-[[nodiscard]] std::optional<LoggedEvent> eventOfLine(const LoggedMessage& line);
+[[nodiscard]] std::optional<TimedEvent> eventOfLine(const LoggedMessage& line);
 
 }  // namespace appsync

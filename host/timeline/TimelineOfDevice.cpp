@@ -22,10 +22,6 @@ constexpr std::uint64_t kLargestLogPart = std::uint64_t{64} << 20U;
 /// The history knows no sessions: what lies further apart belongs to two.
 constexpr std::chrono::seconds kBetweenSessions{60};
 
-struct TimedEvent {
-    WallTime time;
-    TimelineEvent event;
-};
 using TimedEvents = std::vector<TimedEvent>;
 
 /// What is known of one session of a device.
@@ -39,7 +35,7 @@ struct DeviceSession {
 
 Result<Bytes> logPart(const std::string& path) {
     if (!isHostFile(path)) return Bytes();
-    Result<Bytes> bytes = readHostFile(path, kLargestLogPart);
+    Result<Bytes> bytes = readGrowingHostFile(path, kLargestLogPart);
     if (!bytes) return unusable(bytes.error());
     return bytes;
 }
@@ -55,8 +51,8 @@ TimedEvents eventsOf(const LoggedSession& session) {
     TimedEvents events;
     events.reserve(session.lines.size());
     for (const LoggedMessage& line : session.lines) {
-        std::optional<LoggedEvent> event = eventOfLine(line);
-        if (event) events.push_back({event->time, std::move(event->event)});
+        std::optional<TimedEvent> event = eventOfLine(line);
+        if (event) events.push_back(*std::move(event));
     }
     return events;
 }
@@ -89,23 +85,6 @@ struct ReadLog {
         return log;
     }
 };
-
-/// The records that were made before that time, and belong together; without one, the last that do.
-TimedEvents eventsBefore(const std::vector<HistoryRecord>& records,
-                         const std::optional<WallTime>& time) {
-    TimedEvents events;
-    std::optional<WallTime> next = time;
-    for (auto record = records.rbegin(); record != records.rend(); ++record) {
-        if (time && record->time >= *time) continue;
-        if (next && *next - record->time > kBetweenSessions) break;
-        // Several threads write them: their times need not rise.
-        next = std::min(next.value_or(record->time), record->time);
-        std::optional<TimelineEvent> event = eventOfHistory(*record);
-        if (event) events.push_back({record->time, *std::move(event)});
-    }
-    std::reverse(events.begin(), events.end());
-    return events;
-}
 
 /// What the history knows in addition: all of it where the log has nothing.
 Status addHistory(Device& device, DeviceSession& session, bool isLogged) {
@@ -229,6 +208,18 @@ std::optional<TimelineEventKind> kindOfStep(const HistoryRecord& record) {
                : std::nullopt;
 }
 
+/// Nothing where the record is of no interest here.
+std::optional<TimelineEvent> eventOfHistory(const HistoryRecord& record) {
+    const std::optional<TimelineEventKind> kind =
+        record.kind == HistoryRecord::Kind::Scenario ? kindOfScenario(record) : kindOfStep(record);
+    if (!kind) return std::nullopt;
+    TimelineEvent event;
+    event.kind = *kind;
+    event.identifier = record.identifier;
+    if (!record.success) event.detail = record.description;
+    return event;
+}
+
 /// What is installed now, in a session of which nobody has told the end, was installed.
 Status addOutcomes(Device& device, Timeline& timeline) {
     const Result<std::vector<ApplicationRecord>> applications = device.applications();
@@ -241,9 +232,7 @@ Status addOutcomes(Device& device, Timeline& timeline) {
         if (each.isPlaceholder) installed.erase(each.identifier);
     }
     for (TimelineLane& lane : timeline.lanes) {
-        const bool isOpen =
-            lane.outcome == LaneOutcome::Open || lane.outcome == LaneOutcome::Waiting;
-        if (!isOpen || !installed.contains(lane.identifier)) continue;
+        if (!isNotOver(lane) || !installed.contains(lane.identifier)) continue;
         lane.outcome = LaneOutcome::Installed;
         std::erase_if(lane.spans, [](const TimelineSpan& span) {
             return span.isOpen && span.kind == SpanKind::Turn;
@@ -258,15 +247,20 @@ Status addOutcomes(Device& device, Timeline& timeline) {
 
 }  // namespace
 
-std::optional<TimelineEvent> eventOfHistory(const HistoryRecord& record) {
-    const std::optional<TimelineEventKind> kind =
-        record.kind == HistoryRecord::Kind::Scenario ? kindOfScenario(record) : kindOfStep(record);
-    if (!kind) return std::nullopt;
-    TimelineEvent event;
-    event.kind = *kind;
-    event.identifier = record.identifier;
-    if (!record.success) event.detail = record.description;
-    return event;
+std::vector<TimedEvent> eventsBefore(const std::vector<HistoryRecord>& records,
+                                     const std::optional<WallTime>& time) {
+    TimedEvents events;
+    std::optional<WallTime> next = time;
+    for (auto record = records.rbegin(); record != records.rend(); ++record) {
+        if (time && record->time >= *time) continue;
+        // Either way, as the clock may have been set back between two sessions.
+        if (next && std::chrono::abs(*next - record->time) > kBetweenSessions) break;
+        next = record->time;
+        std::optional<TimelineEvent> event = eventOfHistory(*record);
+        if (event) events.push_back({record->time, *std::move(event)});
+    }
+    std::reverse(events.begin(), events.end());
+    return events;
 }
 
 Result<Timeline> timelineOfDevice(Device& device, const std::string& shownName,

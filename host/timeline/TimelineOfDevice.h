@@ -28,7 +28,10 @@ struct DeviceTimelineOptions {
 [[nodiscard]] Result<Timeline> timelineOfDevice(Device& device, const std::string& shownName,
                                                 const DeviceTimelineOptions& options = {});
 
-/// What a record of the transaction log tells of; nothing where that is of no interest here.
-[[nodiscard]] std::optional<TimelineEvent> eventOfHistory(const HistoryRecord& record);
+/// What the records of the transaction log tell of that were made before that time, and belong
+/// together; without one, the last that do. In the order of the records: several threads write
+/// them, and their times need not rise.
+[[nodiscard]] std::vector<TimedEvent> eventsBefore(const std::vector<HistoryRecord>& records,
+                                                   const std::optional<WallTime>& time);
 
 }  // namespace appsync

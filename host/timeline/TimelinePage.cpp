@@ -61,7 +61,8 @@ std::string tableOf(const char* heading, const std::vector<const char*>& columns
 std::array<TimelineMoment, kSpanKinds> timesOf(const TimelineLane& lane) {
     std::array<TimelineMoment, kSpanKinds> times{};
     for (const TimelineSpan& span : lane.spans) {
-        times.at(static_cast<std::size_t>(span.kind)) += span.length();
+        TimelineMoment& time = times.at(static_cast<std::size_t>(span.kind));
+        time = together(time, span.length());
     }
     return times;
 }

@@ -52,8 +52,10 @@ std::vector<TimelineTick> ticksOf(TimelineMoment length) {
     const TimelineMoment step = stepOf(length);
     std::vector<TimelineTick> ticks;
     ticks.reserve(kMostTicks + 1);
-    for (TimelineMoment at{0}; at <= length && ticks.size() <= kMostTicks; at += step) {
+    TimelineMoment at{0};
+    while (at <= length && ticks.size() <= kMostTicks) {
         ticks.push_back({at, tickText(at, step)});
+        at = together(at, step);
     }
     return ticks;
 }

@@ -23,7 +23,7 @@ std::string timesOfKinds(const std::vector<const TimelineLane*>& lanes) {
     for (const TimelineLane* lane : lanes) {
         for (const TimelineSpan& span : lane->spans) {
             const auto kind = static_cast<std::size_t>(span.kind);
-            totals.at(kind) += span.length();
+            totals.at(kind) = together(totals.at(kind), span.length());
             longest.at(kind) = std::max(longest.at(kind), span.length());
         }
     }
@@ -80,7 +80,7 @@ std::string outcomesOf(const std::vector<const TimelineLane*>& lanes) {
 
 TimelineMoment meanLength(const std::vector<const TimelineLane*>& lanes) {
     TimelineMoment total{0};
-    for (const TimelineLane* lane : lanes) total += lane->length();
+    for (const TimelineLane* lane : lanes) total = together(total, lane->length());
     return lanes.empty() ? total : total / static_cast<std::int64_t>(lanes.size());
 }
 

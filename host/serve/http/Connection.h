@@ -5,7 +5,7 @@
 #include <string>
 #include <string_view>
 
-#include "system/UniqueFd.h"
+#include "system/file/UniqueFd.h"
 
 namespace appsync {
 

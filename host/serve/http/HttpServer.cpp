@@ -27,8 +27,8 @@
 #include "host/console/JsonWriting.h"
 #include "host/serve/http/Connection.h"
 #include "host/serve/http/PercentDecoding.h"
-#include "system/PosixError.h"
-#include "system/UniqueFd.h"
+#include "system/file/PosixError.h"
+#include "system/file/UniqueFd.h"
 
 namespace appsync {
 namespace {

@@ -4,6 +4,7 @@ import { byId, element, setText, show } from "./elements.js";
 import { ask, Coalesced, deviceUrl } from "./live.js";
 import { clock } from "./words.js";
 
+const FILTERS = ["level", "category", "app", "text"];
 const SHOWN_LINES = 500; // the older ones go
 const TYPING_MS = 200;
 const NEAR_PX = 40; // from its end: who reads there wants to see what comes
@@ -13,6 +14,7 @@ export class LogView {
     this.lines = byId("lines");
     this.form = byId("filters");
     this.loading = new Coalesced(() => this.load());
+    this.begun = 0; // how often it was shown anew
     this.form.addEventListener("input", () => this.filterSoon());
     this.form.addEventListener("submit", (event) => {
       event.preventDefault();
@@ -48,6 +50,7 @@ export class LogView {
   begin() {
     clearTimeout(this.timer);
     this.next = null;
+    this.begun += 1;
     return this.more();
   }
 
@@ -56,21 +59,23 @@ export class LogView {
   }
 
   async load() {
-    const { name, next } = this;
+    const { name, next, begun } = this;
     if (!name) return;
     const answer = await ask(deviceUrl(name, `/log?${this.query()}`)).catch((error) => ({ lines: null, message: error.message }));
-    if (name !== this.name || next !== this.next) return;
+    if (name !== this.name || begun !== this.begun) return;
     if (!answer.lines) {
       this.refuse(answer.message);
       return;
     }
     this.next = answer.next;
     this.add(answer.lines, next === null);
+    // There may be more; only the last of them are shown.
+    if (next !== null && answer.lines.length === SHOWN_LINES) this.begin();
   }
 
   query() {
     const query = new URLSearchParams({ limit: SHOWN_LINES });
-    for (const key of ["level", "category", "app", "text"]) {
+    for (const key of FILTERS) {
       const value = this.form.elements[key].value.trim();
       if (value) query.set(key, value);
     }
@@ -86,7 +91,8 @@ export class LogView {
     else this.lines.append(fragment);
     while (this.lines.childElementCount > SHOWN_LINES) this.lines.firstElementChild.remove();
     if (isAtEnd) this.lines.scrollTop = this.lines.scrollHeight;
-    this.tellLength("No line of the log is like that.");
+    const isFiltered = FILTERS.some((key) => this.form.elements[key].value.trim() !== "");
+    this.tellLength(isFiltered ? "No line of the log is like that." : "The log is empty.");
   }
 
   refuse(message) {

@@ -34,9 +34,9 @@ class Card {
     this.badge = element("span", { class: "badge" });
     this.counts = element("p", { class: "card-counts" });
     this.bar = element("progress", { "aria-label": `The session of ${name}`, hidden: true });
-    this.last = element("p", { class: "aside" });
+    this.about = element("p", { class: "aside" });
     const head = element("span", { class: "card-head" }, element("h2", {}, name), this.badge);
-    this.link = element("a", { class: "card", href: `#/${encodeURIComponent(name)}` }, head, this.counts, this.bar, this.last);
+    this.link = element("a", { class: "card", href: `#/${encodeURIComponent(name)}` }, head, this.counts, this.bar, this.about);
     this.item = element("li", {}, this.link);
   }
 
@@ -45,11 +45,11 @@ class Card {
     setAttribute(this.badge, "data-state", device.state);
     setAttribute(this.link, "data-state", device.state);
     setText(this.counts, device.state === "damaged" || device.state === "gone" ? device.message : countsOf(device));
-    const session = device.session ?? device.lastSession;
+    const { session } = device;
     show(this.bar, Boolean(session?.running));
     setAttribute(this.bar, "max", session?.total || null);
     setAttribute(this.bar, "value", session?.total ? session.done ?? 0 : null);
-    setText(this.last, lastSession(session));
+    setText(this.about, aboutSession(session));
   }
 }
 
@@ -60,9 +60,8 @@ function countsOf(device) {
   return parts.join(" · ");
 }
 
-function lastSession(session) {
+function aboutSession(session) {
   if (!session) return "";
-  if (session.running) return session.began ? `session since ${clock(session.began)}` : "session under way";
-  const when = session.ended ?? session.began;
-  return when ? `last session ${clock(when)}` : "no session under way";
+  if (!session.running) return "the last session was interrupted";
+  return session.began ? `session since ${clock(session.began)}` : "session under way";
 }

@@ -87,7 +87,11 @@ export class SessionView {
 
 const wasInterrupted = (model) => model.status?.session === "interrupted";
 
+// A device that cannot be read tells nothing of its sessions.
+const isUnknown = (model) => !model.status && model.state !== "idle";
+
 function badge(model) {
+  if (isUnknown(model)) return "unknown";
   return wasInterrupted(model) ? "interrupted" : "none under way";
 }
 
@@ -97,6 +101,7 @@ function sessionText(model) {
     const steps = session.total ? `: ${session.done} of ${count(session.total, "application")}` : "";
     return `${phase(session.phase)}${steps}${session.began ? `, since ${clock(session.began)}` : ""}.`;
   }
+  if (isUnknown(model)) return "The device cannot be read.";
   if (wasInterrupted(model)) {
     return "The last session was interrupted; the same command, run again, brings the device in step.";
   }
