@@ -120,8 +120,8 @@ void Recording::finish() {
     RecordText text = newText();
     text.member("finished");
     text.add(true);
-    write(text);
     const std::lock_guard guard(mutex_);
+    if (!isOver_) writeLine(threadNumber(), text);
     isOver_ = true;
 }
 

@@ -14,7 +14,7 @@
 #include "host/console/Console.h"
 #include "host/console/Problem.h"
 #include "host/file/HostFile.h"
-#include "system/DescriptorIO.h"
+#include "system/file/DescriptorIO.h"
 
 namespace appsync {
 namespace {
@@ -25,6 +25,14 @@ constexpr std::size_t kPiece = std::size_t{256} * 1024;
 /// Whether the file system has no pieces to give.
 bool isUnsupported(int error) {
     return error == EOPNOTSUPP || error == ENOSYS || error == ENODEV || error == EINVAL;
+}
+
+/// A signal, such as that of a terminal which stops the process, may interrupt it.
+int takeRoom(int file, off_t offset) {
+    while (::fallocate(file, 0, offset, kPiece) != 0) {
+        if (errno != EINTR) return errno;
+    }
+    return 0;
 }
 
 }  // namespace
@@ -96,7 +104,8 @@ int RecordingFile::append(std::string_view text) noexcept {
 int RecordingFile::nextPiece() noexcept {
     const auto offset =
         static_cast<off_t>(piece_ == nullptr ? pieceOffset_ : pieceOffset_ + kPiece);
-    if (::fallocate(file_.get(), 0, offset, kPiece) != 0) return errno;
+    const int taken = takeRoom(file_.get(), offset);
+    if (taken != 0) return taken;
     void* const memory = ::mmap(nullptr, kPiece, PROT_READ | PROT_WRITE, MAP_SHARED | MAP_POPULATE,
                                 file_.get(), offset);
     if (memory == MAP_FAILED) {

@@ -19,7 +19,7 @@
 
 #include "platform/Result.h"
 #include "recording/Recording.h"
-#include "system/UniqueFd.h"
+#include "system/file/UniqueFd.h"
 
 namespace appsync {
 

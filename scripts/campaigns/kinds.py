@@ -14,7 +14,9 @@ import typing
 from campaigns.tree import ROOT, Refusal
 from campaigns.units import TAIL, Finding, Record, Unit, by_hand, finish
 
-RELIABILITY = ROOT / "build" / "release" / "tests" / "test_reliability"
+TESTS = ROOT / "build" / "release" / "tests"
+RELIABILITY = TESTS / "test_reliability"
+RECORDINGS = TESTS / "test_recordings"
 COMMAND = ROOT / "build" / "release" / "appsync"
 FUZZ = ROOT / "build" / "fuzz" / "fuzz"
 PREPARED = ROOT / "build" / "mutate" / "prepared.json"
@@ -100,28 +102,29 @@ def complaint(ended):
 
 
 @functools.cache
-def names_in(suite, test=r"\w+"):
-    """The parameterized tests of a suite: `Test/Instance`."""
-    if not RELIABILITY.exists():
+def names_in(suite, test=r"\w+/\w+", program=RELIABILITY):
+    """The tests of a suite; the parameterized ones, `Test/Instance`, if nothing else is said."""
+    if not program.exists():
         return []
     listing = subprocess.run(
-        [str(RELIABILITY), "--gtest_list_tests", f"--gtest_filter=*{suite}.*"], capture_output=True, text=True, check=False
+        [str(program), "--gtest_list_tests", f"--gtest_filter=*{suite}.*"], capture_output=True, text=True, check=False
     )
-    return re.findall(rf"^ +({test}/\w+)", listing.stdout, re.MULTILINE)
+    return re.findall(rf"^ +({test})", listing.stdout, re.MULTILINE)
 
 
-def gtest(name, says, suite, environment, tried, covered, size=1, rounds=lambda: None, parts=None, smaller=Kind.smaller):
-    """A kind that is a suite of test_reliability; its parts are the suite's tests if nothing else is said."""
+def gtest(name, says, suite, environment, tried, covered, size=1, rounds=lambda: None, parts=None, smaller=Kind.smaller,
+          program=RELIABILITY):
+    """A kind that is a suite of a test program; its parts are the suite's tests if nothing else is said."""
 
     def command(unit):
-        words = [str(RELIABILITY), "--gtest_brief=1", f"--gtest_filter=*{suite}.{unit.part or '*'}"]
+        words = [str(program), "--gtest_brief=1", f"--gtest_filter=*{suite}.{unit.part or '*'}"]
         return words, environment(unit)
 
     def replays(_unit, output):
         return GTEST_REPLAY.findall(output)
 
     read = reader(tried, covered, replays, command)
-    return Kind(name, says, "release", RELIABILITY, parts or (lambda: names_in(suite)), command, read, size, rounds,
+    return Kind(name, says, "release", program, parts or (lambda: names_in(suite)), command, read, size, rounds,
                 smaller)
 
 
@@ -272,7 +275,7 @@ KINDS = {
               parts=lambda: ["OfManySessionsKeepsTheInvariants"], smaller=small_session),
         gtest("faults", "each call of a scenario fails, in one of the ways of the sweep", "EveryFault", lambda _unit: {},
               r'"runs": "(\d+)"', {"faults": r'"faults": "(\d+)"'}, rounds=lambda: 1,
-              parts=lambda: names_in("EveryFault", r"\w+IsSurvived")),
+              parts=lambda: names_in("EveryFault", r"\w+IsSurvived/\w+")),
         gtest("crashes", "a crash at every instant of a scenario, with 16 seeds", "EveryInstant",
               lambda unit: {"APPSYNC_CRASH_BASE": unit.first, "APPSYNC_CRASH_SEEDS": unit.count},
               r", (\d+) crashes with", {"crashes": r", (\d+) crashes with"}, 16),
@@ -284,6 +287,9 @@ KINDS = {
                  r"(\d+) kills in", r"--kill (\d+): "),
         hardship("failing-calls", "one in 8 of a scenario's calls fails, with one of the errors",
                  "tests/hardship/test_failing_calls.py", r"(\d+) failing calls of", r"--at (\d+): "),
+        gtest("recordings", "250 sessions that seeds decide, each recorded, and replayed twice", "Replay",
+              lambda unit: {"APPSYNC_FIRST_SEED": unit.first, "APPSYNC_SEEDS": unit.count}, r'"seeds": "(\d+)"', {}, 250,
+              parts=lambda: names_in("Replay", r"RepeatsSessions\w+", RECORDINGS), program=RECORDINGS),
         mutants(),
         fuzz(),
         walks(),

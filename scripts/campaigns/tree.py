@@ -13,7 +13,7 @@ WORK = ROOT / "build" / "campaign"
 BUILDS = {
     "release": [
         ["cmake", "--preset", "release"],
-        ["cmake", "--build", "--preset", "release", "--target", "test_reliability", "appsync"],
+        ["cmake", "--build", "--preset", "release", "--target", "test_reliability", "test_recordings", "appsync"],
     ],
     "fuzz": [["cmake", "--preset", "fuzz"], ["cmake", "--build", "--preset", "fuzz"]],
     "mutate": [["/usr/bin/python3", "scripts/mutate", "--prepare"]],

@@ -3,14 +3,39 @@
 #include <sys/wait.h>
 #include <unistd.h>
 
+#include <cerrno>
 #include <csignal>
+#include <deque>
 #include <filesystem>
 #include <fstream>
 #include <sstream>
 #include <string>
 
+#include "host/console/Console.h"
 #include "host/replay/RecordingReader.h"
 #include "tests/recordings/SeededRecording.h"
+
+namespace appsync {
+namespace {
+
+/// The next calls of fallocate fail with these.
+std::deque<int> roomFailures;
+
+}  // namespace
+}  // namespace appsync
+
+// The linker sends every call of fallocate to the first, and of the second to the system.
+extern "C" {
+
+int __real_fallocate(int file, int mode, off_t offset, off_t length);
+int __wrap_fallocate(int file, int mode, off_t offset, off_t length) {
+    if (appsync::roomFailures.empty()) return __real_fallocate(file, mode, offset, length);
+    errno = appsync::roomFailures.front();
+    appsync::roomFailures.pop_front();
+    return -1;
+}
+
+}  // extern "C"
 
 namespace appsync {
 namespace {
@@ -27,6 +52,13 @@ struct RecordingFileTest : testing::Test {
         std::ostringstream text;
         text << std::ifstream(path).rdbuf();
         return text.str();
+    }
+
+    /// The text as it stands in the file while its piece is mapped.
+    static std::string withPiece(std::string text) {
+        constexpr std::size_t kPiece = std::size_t{256} * 1024;
+        text.resize(kPiece, '\0');
+        return text;
     }
 
     const std::string path;
@@ -49,6 +81,35 @@ TEST_F(RecordingFileTest, TakesALineThatIsLongerThanItsPieces) {
         file->write("one\n");
     }
     EXPECT_EQ(contents(), line + "one\n");
+}
+
+TEST_F(RecordingFileTest, LosesNothingToASignalAndIsWrittenLineByLineWhereThereAreNoPieces) {
+    for (const int error : {EINTR, EOPNOTSUPP}) {
+        std::filesystem::remove(path);
+        roomFailures = {error};
+        {
+            const auto file = *RecordingFile::create(path);
+            EXPECT_EQ(roomFailures.size(), 0U);
+            file->write("one\n");
+            EXPECT_EQ(contents(), error == EINTR ? withPiece("one\n") : "one\n");
+        }
+        EXPECT_EQ(contents(), "one\n");
+    }
+}
+
+TEST_F(RecordingFileTest, EndsWithItsLastWholeLineWhereTheDiskIsFull) {
+    const std::string line = std::string(100'000, 'x') + "\n";
+    std::ostringstream out;
+    std::ostringstream err;
+    {
+        const auto file = *RecordingFile::create(path);
+        roomFailures = {ENOSPC};
+        for (int i = 0; i < 4; ++i) file->write(line);
+        file->tellLoss(Console{out, err});
+    }
+    EXPECT_TRUE(contents().starts_with(line + line));
+    EXPECT_EQ(contents().find('\n', 2 * line.size()), std::string::npos);
+    EXPECT_THAT(err.str(), testing::HasSubstr("No space left on device"));
 }
 
 TEST_F(RecordingFileTest, IsGoneWhenNothingWasWritten) {

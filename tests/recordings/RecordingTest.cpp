@@ -1,7 +1,9 @@
 #include "recording/Recording.h"
 
 #include <algorithm>
+#include <atomic>
 #include <string>
+#include <thread>
 
 #include "host/replay/RecordingReader.h"
 #include "tests/recordings/SeededRecording.h"
@@ -83,6 +85,26 @@ TEST_F(RecordingFixture, TellsWhenACallCameBackAfterWhatAnotherThreadDid) {
     EXPECT_EQ(last(), R"({"t":0,"w":1,"back":true})");
     { const AnnouncedCall call(*shared, "WaitGroup.leave", 1); }
     EXPECT_THAT(last(), HasSubstr("WaitGroup.leave"));
+}
+
+TEST_F(RecordingFixture, WritesNothingOfOtherThreadsAfterItsEnd) {
+    for (int i = 0; i < 200; ++i) {
+        std::atomic<bool> isOver = false;
+        std::atomic<int> written = 0;
+        const auto shared = make({});
+        std::thread other([&] {
+            while (!isOver) {
+                CallRecord(*shared, "A.b", 0).announce();
+                ++written;
+            }
+        });
+        while (written == 0) std::this_thread::yield();
+        shared->finish();
+        isOver = true;
+        other.join();
+        ASSERT_THAT(last(), HasSubstr("finished"));
+        sink.text.clear();
+    }
 }
 
 TEST_F(RecordingFixture, WritesNothingAfterItsEnd) {

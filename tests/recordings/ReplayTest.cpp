@@ -38,6 +38,13 @@ SeededRecording::Choices eventful(std::uint64_t seed) {
     return choices;
 }
 
+/// The same, in which much goes wrong.
+SeededRecording::Choices troubled(std::uint64_t seed) {
+    SeededRecording::Choices choices = eventful(seed);
+    choices.isTroubled = true;
+    return choices;
+}
+
 std::uint64_t numberOr(const char* variable, std::uint64_t otherwise) {
     const char* text = std::getenv(variable);
     return text != nullptr ? std::stoull(text) : otherwise;
@@ -59,25 +66,30 @@ std::string whatDiverges(const std::string& text, bool isStrict = true) {
     return told;
 }
 
-TEST(Replay, RepeatsSessionsOfEveryKind) {
+SeededRecording::Choices ordinary(std::uint64_t /*seed*/) { return {}; }
+
+/// Records the session of each seed, and replays it twice, the second time strictly.
+void replaySeeds(SeededRecording::Choices (*choicesOf)(std::uint64_t)) {
     const std::uint64_t first = numberOr(kFirstVariable, 0);
     const std::uint64_t count = numberOr(kSeedsVariable, kUsualSeeds);
+    const char* test = testing::UnitTest::GetInstance()->current_test_info()->name();
     for (std::uint64_t seed = first; seed < first + count; ++seed) {
-        SeededRecording session(seed);
-        const std::string text = session.record();
-        EXPECT_EQ(whatDiverges(text), "") << "seed " << seed;
-        EXPECT_EQ(whatDiverges(text), "") << "seed " << seed << ", the second time";
+        const std::string text = SeededRecording(seed, choicesOf(seed)).record();
+        for (const bool isStrict : {false, true}) {
+            EXPECT_EQ(whatDiverges(text, isStrict), "")
+                << (isStrict ? "strictly" : "at first") << ", again:\n"
+                << kFirstVariable << "=" << seed << " " << kSeedsVariable
+                << "=1 build/release/tests/test_recordings --gtest_filter=Replay." << test;
+        }
     }
+    testing::Test::RecordProperty("seeds", static_cast<int>(count));
 }
 
-TEST(Replay, RepeatsSessionsInWhichMuchHappens) {
-    const std::uint64_t first = numberOr(kFirstVariable, 0);
-    const std::uint64_t count = numberOr(kSeedsVariable, kUsualSeeds);
-    for (std::uint64_t seed = first; seed < first + count; ++seed) {
-        const std::string text = SeededRecording(seed, eventful(seed)).record();
-        EXPECT_EQ(whatDiverges(text), "") << "seed " << seed;
-    }
-}
+TEST(Replay, RepeatsSessionsOfEveryKind) { replaySeeds(ordinary); }
+
+TEST(Replay, RepeatsSessionsInWhichMuchHappens) { replaySeeds(eventful); }
+
+TEST(Replay, RepeatsSessionsInWhichMuchGoesWrong) { replaySeeds(troubled); }
 
 // What the last one to leave a group does next was replayed too early, when it had come back after
 // what others did.
@@ -250,6 +262,16 @@ constexpr std::array kStoredSeeds = {
     374, 396, 411, 461, 465, 489, 490, 514, 516, 517, 529, 543, 601, 639, 672, 687,
     699, 705, 708, 727, 736, 738, 744, 757, 771, 798, 807, 810, 837, 852, 858, 888};
 
+/// The same of sessions in which much goes wrong.
+constexpr std::array kStoredTroubledSeeds = {2,  5,  6,  8,   10,  11,  16,  20,  29,  38,
+                                             45, 71, 87, 112, 135, 136, 149, 185, 195, 205};
+
+void store(std::uint64_t seed, const char* sort, const std::string& text) {
+    const char* path = seed % 4 < 2 ? "coordinated" : "direct";
+    std::ofstream(std::string(kStored) + "/" + std::to_string(seed) + "-" + path + sort + ".jsonl")
+        << text;
+}
+
 // Makes them; scripts/make_recordings runs it.
 TEST(StoredRecordings, DISABLED_AreMade) {
     std::filesystem::remove_all(kStored);
@@ -259,9 +281,11 @@ TEST(StoredRecordings, DISABLED_AreMade) {
         const auto seed = static_cast<std::uint64_t>(each);
         std::string text = SeededRecording(seed, eventful(seed)).record();
         if (++number % 12 == 0) text.resize(text.size() * 3 / 4);
-        std::ofstream(std::string(kStored) + "/" + std::to_string(seed) +
-                      (seed % 4 < 2 ? "-coordinated" : "-direct") + ".jsonl")
-            << text;
+        store(seed, "", text);
+    }
+    for (const int each : kStoredTroubledSeeds) {
+        const auto seed = static_cast<std::uint64_t>(each);
+        store(seed, "-troubled", SeededRecording(seed, troubled(seed)).record());
     }
 }
 

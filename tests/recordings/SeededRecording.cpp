@@ -14,14 +14,24 @@ Scheduling schedulingOf(std::uint64_t seed) {
     return seed % 2 == 0 ? Scheduling::seeded(seed) : Scheduling::prioritized(seed, kChangePoints);
 }
 
+std::vector<std::string> identifiersOf(const SeededRecording::Choices& choices) {
+    std::vector<std::string> identifiers;
+    for (std::size_t i = 0; i < choices.identifiers; ++i) {
+        identifiers.push_back("com.example.app" + std::to_string(i));
+    }
+    // What a path may hold and a URL holds in another form.
+    if (choices.isTroubled) identifiers.back() += " @AZ[`az{09:\u00e4\u20ac";
+    return identifiers;
+}
+
 }  // namespace
 
 SeededRecording::SeededRecording(std::uint64_t seed, Choices choices)
-    : choices_(choices), random_(seed), world_(schedulingOf(seed)) {}
-
-std::string SeededRecording::identifier(std::size_t index) const {
-    return "com.example.app" + std::to_string(index);
-}
+    : choices_(choices),
+      random_(seed),
+      world_(schedulingOf(seed)),
+      identifiers_(identifiersOf(choices)),
+      troubles_(world_, random_, identifiers_) {}
 
 std::string SeededRecording::record() {
     arrange();
@@ -45,9 +55,9 @@ void SeededRecording::arrange() {
     world_.isInDaemon = !oneIn(4);
     for (std::size_t i = 0; i < choices_.identifiers; ++i) {
         if (!oneIn(4)) continue;
-        world_.platform.registry.addApplication(identifier(i), "0.9");
-        if (oneIn(3)) world_.platform.homeScreen.setRunning(identifier(i), true);
-        if (oneIn(4)) world_.platform.installer.addUninstalled(identifier(i));
+        world_.platform.registry.addApplication(identifiers_[i], "0.9");
+        if (oneIn(3)) world_.platform.homeScreen.setRunning(identifiers_[i], true);
+        if (oneIn(4)) world_.platform.installer.addUninstalled(identifiers_[i]);
     }
     if (oneIn(3)) world_.platform.registry.setInstallDuration(std::chrono::seconds(random_() % 60));
     if (oneIn(3)) world_.platform.host.setRecoverableTest([](const ErrorRecord&) { return true; });
@@ -55,10 +65,11 @@ void SeededRecording::arrange() {
         world_.platform.policy.set(PolicyFeature::AppInstallationAllowed, PolicyAnswer::No);
     }
     if (choices_.isEventful) arrangeEvents();
+    if (choices_.isTroubled) troubles_.arrange();
 }
 
 void SeededRecording::arrangeEvents() {
-    for (std::size_t i = 0; i < choices_.identifiers; ++i) arrangeApplication(identifier(i));
+    for (std::size_t i = 0; i < choices_.identifiers; ++i) arrangeApplication(identifiers_[i]);
     if (oneIn(2)) {
         std::vector<std::string> last = someIdentifiers();
         last.emplace_back("com.example.gone");
@@ -134,13 +145,23 @@ PropertyList SeededRecording::anyStoreMetadata() {
                      oneOf({download, download, download, "none"}));
     }
     if (oneIn(3)) metadata.set("launchProhibited", oneIn(2));
+    if (!choices_.isTroubled) return metadata;
+    const auto anyFlag = [&oneOf] {
+        return oneOf({true, false, 1, -1, 0, std::uint64_t{1} << 63U, 0.0, 0.5, "YES", "no", "True",
+                      "maybe", PropertyList::array()});
+    };
+    for (const char* key : {"is-auto-download", "VKPresselApp", "RGApplicationLaunchProhibited",
+                            "title", "itemName", "bundleVersion"}) {
+        if (oneIn(3)) metadata.set(key, anyFlag());
+    }
+    if (oneIn(2)) metadata.set("launchProhibited", anyFlag());
     return metadata;
 }
 
 std::vector<std::string> SeededRecording::someIdentifiers() {
     std::vector<std::string> some;
     for (std::size_t i = 0; i < choices_.identifiers; ++i) {
-        if (oneIn(2)) some.push_back(identifier(i));
+        if (oneIn(2)) some.push_back(identifiers_[i]);
     }
     return some;
 }
@@ -233,7 +254,7 @@ void SeededRecording::endClient() {
 void SeededRecording::restore() {
     std::vector<std::string> identifiers;
     for (std::size_t i = 0; i < choices_.identifiers; ++i) {
-        if (oneIn(2)) identifiers.push_back(identifier(i));
+        if (oneIn(2)) identifiers.push_back(identifiers_[i]);
     }
     world_.stageRestore(identifiers);
     if (choices_.isEventful && !oneIn(3)) stageEventfulRestore();
@@ -245,6 +266,7 @@ void SeededRecording::restore() {
 
 void SeededRecording::sync() {
     if (!oneIn(12)) world_.stage(anyTodoList());
+    if (choices_.isTroubled) troubles_.spoilStaging();
     disturb();
     static_cast<void>(client_->supportedDataclasses());
     static_cast<void>(client_->disabledAssetTypes());
@@ -255,11 +277,35 @@ void SeededRecording::sync() {
     static_cast<void>(client_->installedAssets());
     static_cast<void>(client_->installedAssetMetrics());
     static_cast<void>(client_->accountsForAssets());
-    for (const SyncAssetPointer& asset : client_->outstandingAssetTransfers()) transfer(asset);
+    transferAll();
     if (choices_.isEventful && oneIn(2)) transferRestore();
+    if (choices_.isTroubled && oneIn(5)) return;  // the host has gone
     const bool success = !oneIn(4);
     client_->assetTransferEndedWithSuccess(success);
     client_->syncEndedWithSuccess(success);
+}
+
+void SeededRecording::transferAll() {
+    for (const SyncAssetPointer& asset : client_->outstandingAssetTransfers()) {
+        if (choices_.isTroubled && oneIn(2)) {
+            transferTroubled(asset);
+        } else {
+            transfer(asset);
+        }
+    }
+}
+
+/// One that is begun and not ended, or ends without a file or a reason.
+void SeededRecording::transferTroubled(const SyncAssetPointer& asset) {
+    asset->downloadProgress = troubles_.anyFraction();
+    client_->assetTransferUpdatedProgress(asset, troubles_.anyFraction());
+    if (oneIn(2)) return;
+    if (oneIn(3)) world_.platform.coordination.postDidBeginFulfillment(random_() % 4);
+    if (oneIn(3) && world_.platform.registry.progress(asset->identifier)) {
+        world_.platform.registry.cancelInstalls({asset->identifier});
+    }
+    if (oneIn(4)) asset->path = std::string(1, '\0');
+    client_->assetTransferSucceeded(asset, !oneIn(3), nullptr);
 }
 
 PropertyList SeededRecording::anyTodoList() {
@@ -267,10 +313,10 @@ PropertyList SeededRecording::anyTodoList() {
     for (std::size_t i = 0; i < choices_.identifiers; ++i) {
         if (oneIn(4)) continue;
         if (choices_.isEventful && oneIn(3)) {
-            list.append(anyEntry(identifier(i)));
+            list.append(anyEntry(identifiers_[i]));
             continue;
         }
-        list.append(World::entry(identifier(i), oneIn(4) ? "remove" : "install"));
+        list.append(World::entry(identifiers_[i], oneIn(4) ? "remove" : "install"));
     }
     return list;
 }
@@ -281,7 +327,7 @@ void SeededRecording::disturb() {
     for (std::size_t i = 0; i < choices_.identifiers; ++i) {
         simulated.scheduler.spawnAfter(
             std::chrono::seconds(random_() % 90), "person",
-            [&simulated, each = identifier(i)] { simulated.homeScreen.setRunning(each, false); });
+            [&simulated, each = identifiers_[i]] { simulated.homeScreen.setRunning(each, false); });
     }
     if (!oneIn(2)) return;
     simulated.scheduler.spawnAfter(std::chrono::seconds(random_() % 90), "another client",

@@ -14,6 +14,7 @@
 #include "recording/RecordedClient.h"
 #include "recording/Recording.h"
 #include "recording/RecordingPlatform.h"
+#include "tests/recordings/Troubles.h"
 #include "tests/reliability/World.h"
 
 namespace appsync {
@@ -39,6 +40,8 @@ class SeededRecording {
         std::size_t identifiers = 6;
         /// A device on which much has happened before, and hosts that ask and send what is rare.
         bool isEventful = false;
+        /// Services that refuse, others who are in the way, and a host that loses its thread.
+        bool isTroubled = false;
     };
 
     explicit SeededRecording(std::uint64_t seed, Choices choices);
@@ -49,9 +52,8 @@ class SeededRecording {
 
   private:
     [[nodiscard]] bool oneIn(std::uint64_t count) { return random_() % count == 0; }
-    [[nodiscard]] std::string identifier(std::size_t index) const;
-    [[nodiscard]] std::string anyIdentifier() {
-        return identifier(random_() % choices_.identifiers);
+    [[nodiscard]] const std::string& anyIdentifier() {
+        return identifiers_[random_() % identifiers_.size()];
     }
 
     void arrange();
@@ -70,11 +72,15 @@ class SeededRecording {
     void sync();
     void disturb();
     void transfer(const SyncAssetPointer& asset);
+    void transferAll();
+    void transferTroubled(const SyncAssetPointer& asset);
     [[nodiscard]] PropertyList anyTodoList();
 
     const Choices choices_;
     std::mt19937_64 random_;
     World world_;
+    const std::vector<std::string> identifiers_;
+    Troubles troubles_;
     TextSink sink_;
     std::shared_ptr<Recording> recording_;
     std::unique_ptr<RecordingPlatform> platform_;
