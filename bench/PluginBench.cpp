@@ -21,7 +21,7 @@
 #include "client/Paths.h"
 #include "client/TodoList.h"
 #include "simulation/SimulatedPlatform.h"
-#include "system/RootedFileSystem.h"
+#include "system/file/RootedFileSystem.h"
 #include "system/property_list/PropertyListCodec.h"
 
 namespace appsync {

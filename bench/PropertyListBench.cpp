@@ -17,6 +17,7 @@
 #include <pugixml.hpp>
 #include <string>
 
+#include "system/AllocatorTuning.h"
 #include "system/property_list/PropertyListCodec.h"
 
 namespace appsync {
@@ -60,6 +61,7 @@ Bytes encoded(const PropertyList& list, PropertyListFormat format) {
 
 /// The list to measure with, left in a file as well if somebody asked.
 PropertyList todoList(const benchmark::State& state) {
+    tuneAllocator();  // as the command does
     if (const char* path = std::getenv("APPSYNC_BENCH_PLIST")) {
         return *SystemPropertyLists().parse(readFile(path));
     }
