@@ -5,9 +5,9 @@
 #include "platform/AppRegistry.h"
 #include "platform/SyncHost.h"
 #include "platform/absent/AbsentServices.h"
-#include "system/RootedFileSystem.h"
-#include "system/SystemWorkQueues.h"
+#include "system/file/RootedFileSystem.h"
 #include "system/property_list/PropertyListCodec.h"
+#include "system/threads/SystemWorkQueues.h"
 
 namespace port {
 

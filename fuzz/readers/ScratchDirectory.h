@@ -3,7 +3,7 @@
 #include <string>
 
 #include "platform/Bytes.h"
-#include "system/UniqueFd.h"
+#include "system/file/UniqueFd.h"
 
 namespace appsync {
 

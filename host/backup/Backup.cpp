@@ -14,7 +14,7 @@
 #include "host/console/JsonWriting.h"
 #include "host/console/Problem.h"
 #include "host/file/HostFile.h"
-#include "system/PosixError.h"
+#include "system/file/PosixError.h"
 
 namespace appsync {
 namespace {

@@ -17,7 +17,7 @@
 #include "host/backup/Backup.h"
 #include "host/console/Problem.h"
 #include "host/file/HostFile.h"
-#include "system/DescriptorIO.h"
+#include "system/file/DescriptorIO.h"
 
 namespace appsync {
 namespace {

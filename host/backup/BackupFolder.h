@@ -5,7 +5,7 @@
 
 #include "platform/Bytes.h"
 #include "platform/Result.h"
-#include "system/UniqueFd.h"
+#include "system/file/UniqueFd.h"
 
 namespace appsync {
 

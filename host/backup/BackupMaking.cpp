@@ -27,9 +27,9 @@
 #include "platform/AppRegistry.h"
 #include "platform/FileSystem.h"
 #include "platform/PropertyListSerialization.h"
-#include "system/DescriptorIO.h"
-#include "system/RootDirectory.h"
-#include "system/UniqueFd.h"
+#include "system/file/DescriptorIO.h"
+#include "system/file/RootDirectory.h"
+#include "system/file/UniqueFd.h"
 
 namespace appsync {
 namespace {

@@ -26,7 +26,7 @@
 #include "platform/SyncClient.h"
 #include "restore/DemotedApps.h"
 #include "restore/RestoredApp.h"
-#include "system/PosixError.h"
+#include "system/file/PosixError.h"
 
 namespace appsync {
 namespace {

@@ -8,7 +8,7 @@
 #include "device/package/DataArchive.h"
 #include "host/console/Problem.h"
 #include "host/file/Checksum.h"
-#include "system/RootDirectory.h"
+#include "system/file/RootDirectory.h"
 
 namespace appsync {
 namespace {

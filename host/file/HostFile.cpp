@@ -9,7 +9,7 @@
 #include <system_error>
 #include <utility>
 
-#include "system/PosixError.h"
+#include "system/file/PosixError.h"
 
 namespace appsync {
 
@@ -68,24 +68,43 @@ Result<std::size_t> HostFile::read(std::span<std::uint8_t> buffer) {
     }
 }
 
-Result<Bytes> readHostFile(const std::string& path, std::uint64_t maximumBytes) {
-    Result<HostFile> file = HostFile::open(path);
-    if (!file) return file.error();
-    const ErrorRecord tooLarge =
-        ErrorRecord::make(kPosixErrorDomain, EFBIG,
-                          path + " is too large, or grows while it is read; see what it is");
-    if (file->size() > maximumBytes) return tooLarge;
-    Bytes contents(file->size() + 1);
+namespace {
+
+ErrorRecord tooLarge(const std::string& path) {
+    return ErrorRecord::make(kPosixErrorDomain, EFBIG,
+                             path + " is too large, or grows while it is read; see what it is");
+}
+
+// The first bytes of the file, at most so many.
+Result<Bytes> readFirst(HostFile& file, const std::string& path, std::size_t most) {
+    Bytes contents(most);
     std::size_t length = 0;
     while (length < contents.size()) {
-        const Result<std::size_t> count = file->read(std::span(contents).subspan(length));
+        const Result<std::size_t> count = file.read(std::span(contents).subspan(length));
         if (!count) return count.error().withContext(path);
         if (*count == 0) break;
         length += *count;
     }
-    if (length == contents.size()) return tooLarge;
     contents.resize(length);
     return contents;
+}
+
+}  // namespace
+
+Result<Bytes> readHostFile(const std::string& path, std::uint64_t maximumBytes) {
+    Result<HostFile> file = HostFile::open(path);
+    if (!file) return file.error();
+    if (file->size() > maximumBytes) return tooLarge(path);
+    Result<Bytes> contents = readFirst(*file, path, file->size() + 1);
+    if (contents && contents->size() > file->size()) return tooLarge(path);
+    return contents;
+}
+
+Result<Bytes> readGrowingHostFile(const std::string& path, std::uint64_t maximumBytes) {
+    Result<HostFile> file = HostFile::open(path);
+    if (!file) return file.error();
+    if (file->size() > maximumBytes) return tooLarge(path);
+    return readFirst(*file, path, file->size());
 }
 
 Result<Bytes> readStandardInput(std::uint64_t maximumBytes) {

@@ -40,6 +40,10 @@ class HostFile {
 /// The whole of a file of this machine; an error when it holds more than `maximumBytes`.
 [[nodiscard]] Result<Bytes> readHostFile(const std::string& path, std::uint64_t maximumBytes);
 
+/// The same of a file that others append to meanwhile: what it held when it was opened.
+[[nodiscard]] Result<Bytes> readGrowingHostFile(const std::string& path,
+                                                std::uint64_t maximumBytes);
+
 /// All that standard input brings, whatever it is; an error when that is more than `maximumBytes`.
 [[nodiscard]] Result<Bytes> readStandardInput(std::uint64_t maximumBytes);
 

@@ -16,7 +16,7 @@
 #include "host/console/Text.h"
 #include "host/file/HostFile.h"
 #include "platform/Bytes.h"
-#include "system/PosixError.h"
+#include "system/file/PosixError.h"
 
 namespace appsync {
 namespace {

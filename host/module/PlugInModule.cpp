@@ -11,7 +11,7 @@
 #include "host/console/Problem.h"
 #include "host/module/ModuleFile.h"
 #include "host/module/Trial.h"
-#include "system/PosixError.h"
+#include "system/file/PosixError.h"
 
 namespace appsync {
 namespace {

@@ -11,17 +11,18 @@
 #include <array>
 #include <cerrno>
 #include <csignal>
-#include <cstdint>
+#include <cstddef>
 #include <utility>
 
-#include "system/DescriptorIO.h"
-#include "system/PosixError.h"
-#include "system/UniqueFd.h"
+#include "system/file/DescriptorIO.h"
+#include "system/file/PosixError.h"
+#include "system/file/UniqueFd.h"
 
 namespace appsync {
 namespace {
 
 constexpr char kEndOfAnswer = '\0';
+constexpr std::size_t kLongestAnswer = 65'536;
 
 void silence() {
     const rlimit noDump = {0, 0};
@@ -94,15 +95,16 @@ class Trial {
         }
     }
 
-    // Whether more may be told.
+    // Whether more may be told, and will be heard: nobody is heard out who does not come to an end.
     bool hear() {
         std::array<char, 4096> piece{};
-        while (true) {
+        while (told_.size() <= kLongestAnswer) {
             const ssize_t count = ::read(heard_.get(), piece.data(), piece.size());
             if (count > 0) told_.append(piece.data(), static_cast<std::size_t>(count));
             if (count < 0 && errno == EINTR) continue;
             if (count <= 0) return count < 0 && errno == EAGAIN;
         }
+        return false;
     }
 
     const pid_t process_;

@@ -11,7 +11,7 @@ namespace appsync {
 
 /// What came of an action that another process was given.
 struct TrialOutcome {
-    /// Nothing where the process ended before it.
+    /// Nothing where the process ended before it, or told more than 64 KiB.
     std::optional<std::string> answer;
     /// How it ended: "signal 11", "status 3".
     std::string end;

@@ -17,9 +17,9 @@
 #include "device/values/PackageIdentifier.h"
 #include "device/values/PackageText.h"
 #include "host/file/Checksum.h"
-#include "system/DescriptorIO.h"
-#include "system/RootDirectory.h"
-#include "system/UniqueFd.h"
+#include "system/file/DescriptorIO.h"
+#include "system/file/RootDirectory.h"
+#include "system/file/UniqueFd.h"
 
 namespace appsync {
 namespace {

@@ -13,7 +13,7 @@
 #include "host/file/HostFile.h"
 #include "host/plan/TransferError.h"
 #include "platform/PropertyListSerialization.h"
-#include "system/PosixError.h"
+#include "system/file/PosixError.h"
 
 namespace appsync {
 namespace {

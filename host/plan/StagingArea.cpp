@@ -22,7 +22,7 @@
 #include "platform/AppRegistry.h"
 #include "platform/FileSystem.h"
 #include "platform/PropertyListSerialization.h"
-#include "system/RootDirectory.h"
+#include "system/file/RootDirectory.h"
 
 namespace appsync {
 namespace {

@@ -10,7 +10,7 @@
 #include "device/values/DeviceError.h"
 #include "device/values/PackageIdentifier.h"
 #include "host/plan/SyncPlan.h"
-#include "system/RootDirectory.h"
+#include "system/file/RootDirectory.h"
 
 namespace appsync {
 namespace {

@@ -15,8 +15,8 @@
 #include "host/plan/TransferError.h"
 #include "host/watch/SyncDaemon.h"
 #include "platform/FileSystem.h"
-#include "system/DescriptorIO.h"
-#include "system/RootDirectory.h"
+#include "system/file/DescriptorIO.h"
+#include "system/file/RootDirectory.h"
 
 namespace appsync {
 
@@ -25,10 +25,10 @@ class NewFile {
   public:
     NewFile(const UniqueFd& directory, std::string name)
         : directory_(directory.get()), name_(std::move(name)) {
+        open();
+        if (error_ != EEXIST) return;
         ::unlinkat(directory_, name_.c_str(), 0);
-        descriptor_.reset(::openat(directory_, name_.c_str(),
-                                   O_WRONLY | O_CREAT | O_EXCL | O_NOFOLLOW | O_CLOEXEC, 0644));
-        if (!descriptor_) error_ = errno;
+        open();
     }
     NewFile(const NewFile&) = delete;
     NewFile& operator=(const NewFile&) = delete;
@@ -56,6 +56,12 @@ class NewFile {
     }
 
   private:
+    void open() {
+        descriptor_.reset(::openat(directory_, name_.c_str(),
+                                   O_WRONLY | O_CREAT | O_EXCL | O_NOFOLLOW | O_CLOEXEC, 0644));
+        error_ = descriptor_ ? 0 : errno;
+    }
+
     const int directory_;
     const std::string name_;
     UniqueFd descriptor_;
@@ -87,6 +93,8 @@ ErrorRecord cannotWrite(int errorNumber, const std::string& path) {
 }
 
 Result<UniqueFd> openTarget(Device& device, const std::string& directory) {
+    Result<UniqueFd> there = device.root().openDirectory(directory);
+    if (there) return there;
     const FileAttributes mobile{"mobile", "mobile"};
     const Status made = device.files().createDirectory(directory, true, &mobile);
     if (!made) return made.error();

@@ -8,6 +8,7 @@ import re
 import signal
 import socket
 import sqlite3
+import threading
 import time
 import urllib.parse
 
@@ -82,6 +83,15 @@ class Events:
     def next(self):
         """The next event's data; None at the end."""
         while line := self.answer.readline():
+            if line.startswith(b"data: "):
+                return json.loads(line[6:])
+        return None
+
+    def soon(self):
+        """The next event's data; None where the server has had none for so long that it says so."""
+        while line := self.answer.readline():
+            if line.startswith(b":"):
+                return None
             if line.startswith(b"data: "):
                 return json.loads(line[6:])
         return None
@@ -371,6 +381,45 @@ def test_the_timeline_of_the_last_session_is_drawn(appsync, device, library, ser
 
 
 @ON_ONE_PATH
+def test_the_timeline_is_drawn_while_its_log_grows(appsync, device, library, serving):
+    device.sync(library)
+    path = os.path.join(device.path, "log", "system.log")
+    stop = threading.Event()
+
+    def grow():
+        with open(path, "a", buffering=1) as log:
+            while not stop.is_set() and log.tell() < 1 << 23:
+                log.write(LINE % (1, 8, "info", "more" * 20))
+
+    growing = threading.Thread(target=grow)
+    growing.start()
+    try:
+        assert {serving.ask("/api/device/device/timeline.svg")[0] for _ in range(60)} == {200}
+        appsync("timeline", device.path, "--out", device.path + ".svg")
+    finally:
+        stop.set()
+        growing.join()
+
+
+@ON_ONE_PATH
+def test_the_timeline_of_a_session_that_has_ended_is_another(appsync, device, library, serving):
+    device.sync(library)
+    packages.make_library(library, 5, "2.0", payload=os.urandom(8_000_000))
+    address = serving.view()["timeline"]
+    with open(os.path.join(device.path, "log", "system.log"), "a") as log:
+        log.write(LINE % (1, 8, "info", "more" * 25) * 20_000)  # so that drawing takes a while
+
+    def goes_on():
+        return b"The session goes on." in serving.ask(address)[2]
+
+    sync = appsync.start("sync", device.path, library)
+    eventually(goes_on)
+    while sync.poll() is None or serving.state() != "idle":
+        goes_on()
+    assert not goes_on()
+
+
+@ON_ONE_PATH
 def test_events_come_four_times_a_second_at_most(appsync, device, serving):
     path = os.path.join(device.path, "log", "system.log")
     events = Events(serving, "/api/device/device/events")
@@ -439,6 +488,24 @@ def test_a_device_whose_database_somebody_keeps_to_himself(appsync, device, libr
     holder.execute("COMMIT")
     holder.close()
     assert eventually(lambda: serving.state() == "idle")
+
+
+@ON_ONE_PATH
+def test_a_reader_who_was_told_of_a_locked_device_learns_that_it_is_none(appsync, device, serving):
+    assert serving.state() == "idle"
+    events = Events(serving, "/api/device/device/events")
+    events.next()
+    holder = sqlite3.connect(os.path.join(device.path, "device.db"), isolation_level=None)
+    holder.execute("PRAGMA locking_mode = EXCLUSIVE")
+    holder.execute("BEGIN EXCLUSIVE")
+    holder.execute("DELETE FROM running")
+    os.utime(os.path.join(device.path, "device.db"))
+    assert serving.state() == "locked"
+    holder.execute("ROLLBACK")
+    holder.close()
+    told = iter(events.soon, None)
+    assert any("state" in event["changed"] for event in told)
+    assert serving.state() == "idle"
 
 
 @ON_ONE_PATH

@@ -173,6 +173,11 @@ def test_what_is_no_recording_is_refused(appsync, tmp_path, contents):
     assert not (tmp_path / "out.svg").exists()
 
 
+def test_where_nothing_is_both_are_asked_for(appsync, tmp_path):
+    told = appsync("timeline", tmp_path / "nothing", "--out", tmp_path / "out.svg", expect=3).stderr
+    assert "neither a device nor a recording" in told and str(tmp_path / "nothing") in told
+
+
 def test_hostile_messages_in_a_recording_are_drawn_or_left_out(appsync, tmp_path):
     recording = tmp_path / "recording"
     header = {"recording": 1, "plug-in": "1", "process": "p", "bundle": "b", "anonymous": False}
@@ -242,6 +247,10 @@ def test_a_session_that_was_killed_says_so(appsync, tmp_path, library):
     assert "The session goes on." in goes_on
     page = drawn(appsync, tmp_path, device.path)
     assert "The session was interrupted." in page
+    packages.make_package(library, "com.example.sent")
+    appsync("send", device.path, "com.example.sent", library / "com.example.sent.zip")
+    assert lanes(drawn(appsync, tmp_path, device.path)) == {"com.example.sent": "installed"}
+    assert list(lanes(drawn(appsync, tmp_path, device.path, "html", "--session", "2"))) == ["com.example.app02"]
 
 
 def wait_until(holds, seconds=30):

@@ -7,10 +7,10 @@
 
 #include "contract/TemporaryMachineDirectory.h"
 #include "simulation/SimulatedPlatform.h"
-#include "system/RootedFileSystem.h"
 #include "system/SystemNotifications.h"
-#include "system/SystemWorkQueues.h"
+#include "system/file/RootedFileSystem.h"
 #include "system/property_list/PropertyListCodec.h"
+#include "system/threads/SystemWorkQueues.h"
 #include "tests/contract/OurPorts.h"
 
 namespace appsync {

@@ -29,6 +29,7 @@ echo '"seeds": "250", "faults": "3"'
 LISTS = """cmake_minimum_required(VERSION 3.20)
 project(standin NONE)
 add_custom_target(appsync COMMAND cmake -E touch ${CMAKE_BINARY_DIR}/appsync)
+add_custom_target(test_recordings COMMAND cmake -E touch ${CMAKE_BINARY_DIR}/tests/test_recordings)
 add_custom_target(test_reliability
     COMMAND cmake -E copy ${CMAKE_SOURCE_DIR}/program ${CMAKE_BINARY_DIR}/tests/test_reliability)
 """
@@ -400,14 +401,16 @@ def test_mutants_end_with_the_last_and_survivors_are_findings(tree):
     assert finding["replay"] == "scripts/mutate --numbers 9-9" and "client/A.cpp:1: run: without a()" in finding["what"]
 
 
-REAL = {"seeds": 2, "faults": 2, "crashes": 2, "crash-pairs": 1, "kills": 2, "failing-calls": 2, "walks": 1}  # units
+REAL = {"seeds": 2, "faults": 2, "crashes": 2, "crash-pairs": 1, "kills": 2, "failing-calls": 2, "recordings": 3,
+        "walks": 1}  # units
 
 
 @pytest.fixture(scope="module")
 def real(tmp_path_factory):
     """The campaigns of this tree itself, and two workers for all of its kinds."""
-    if not (ROOT / "build" / "release" / "tests" / "test_reliability").exists():
-        pytest.skip("test_reliability is not built")
+    for test in ("test_reliability", "test_recordings"):
+        if not (ROOT / "build" / "release" / "tests" / test).exists():
+            pytest.skip(f"{test} is not built")
     from campaigns import engine
 
     with engine.local(2, [engine.resource("release", "this")]) as cluster:
@@ -456,6 +459,8 @@ def unit_of(name):
      "APPSYNC_FIRST_WALK=7 APPSYNC_WALKS=1 "),
     ("crashes", "APPSYNC_CRASH=A:1:2 build/release/tests/test_reliability --gtest_filter=Crash.One\nA: 2 operations, "
      "32 crashes with the seeds", "APPSYNC_CRASH=A:1:2 "),
+    ("recordings", "at first, again:\nAPPSYNC_FIRST_SEED=7 APPSYNC_SEEDS=1 build/release/tests/test_recordings "
+     '--gtest_filter=Replay.RepeatsSessionsOfEveryKind\n"seeds": "250"', "APPSYNC_FIRST_SEED=7 APPSYNC_SEEDS=1 "),
 ])
 def test_what_a_kind_says_of_a_failure_becomes_the_line_that_repeats_it(name, said, replay):
     if not (ROOT / "build" / "release" / "tests" / "test_reliability").exists():

@@ -24,6 +24,12 @@ def test_the_summary_tells_how_many(capsys):
     assert "2 mutants, 2 caught, 0 survived" in out and "7 changes more do not compile" in out
 
 
+def test_what_recordings_notice_is_told_of_each_folder():
+    results = list(zip(edits("a", "b", "c"), ("failed", "", "crashed")))
+    assert mutate.share_of("client", results) == "client: 2 of 3 noticed"
+    assert mutate.share_of("platform", results) == "platform: 0 of 0 noticed"
+
+
 def test_what_was_prepared_is_met_by_number(tmp_path, monkeypatch, capsys):
     monkeypatch.setattr(mutate, "PREPARED", tmp_path / "prepared.json")
     monkeypatch.setattr(mutate, "remembered", set)

@@ -63,7 +63,7 @@ def test_skipped_tests_are_read_from_pytests_report(tmp_path):
         "def test_not_here(): pytest.skip('no mounts')\n")
     report = tmp_path / "report.xml"
     subprocess.run([sys.executable, "-m", "pytest", "-p", "no:cacheprovider", f"--junitxml={report}", tmp_path],
-                   capture_output=True, check=False)
+                   capture_output=True, check=False, cwd=tmp_path)
     assert run_checks.pytest_counts(report, False) == Counts(1, 1, ["test_it.test_not_here: no mounts"])
 
 

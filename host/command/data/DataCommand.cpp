@@ -29,8 +29,8 @@
 #include "host/console/Text.h"
 #include "host/file/HostFile.h"
 #include "platform/FileSystem.h"
-#include "system/RootDirectory.h"
-#include "system/UniqueFd.h"
+#include "system/file/RootDirectory.h"
+#include "system/file/UniqueFd.h"
 
 namespace appsync {
 namespace {

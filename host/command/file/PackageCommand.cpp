@@ -12,7 +12,7 @@
 #include "host/console/Text.h"
 #include "host/file/HostFile.h"
 #include "host/output/JsonRecords.h"
-#include "system/PosixError.h"
+#include "system/file/PosixError.h"
 #include "system/property_list/PropertyListCodec.h"
 
 namespace appsync {

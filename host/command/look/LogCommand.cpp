@@ -18,8 +18,8 @@
 #include "host/console/Console.h"
 #include "host/console/Problem.h"
 #include "system/LogFile.h"
-#include "system/PosixError.h"
-#include "system/UniqueFd.h"
+#include "system/file/PosixError.h"
+#include "system/file/UniqueFd.h"
 
 namespace appsync {
 namespace {

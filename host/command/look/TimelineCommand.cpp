@@ -51,6 +51,11 @@ bool isFileToRead(const std::string& path) {
     return std::filesystem::is_regular_file(path, code);
 }
 
+bool isThere(const std::string& path) {
+    std::error_code code;
+    return std::filesystem::exists(path, code) || code;
+}
+
 Result<Timeline> timelineIn(const TimelineArguments& arguments) {
     if (isFileToRead(arguments.source)) {
         if (arguments.session) {
@@ -59,6 +64,10 @@ Result<Timeline> timelineIn(const TimelineArguments& arguments) {
         const Result<RecordedSession> session = readRecordingFile(arguments.source);
         if (!session) return session.error();
         return timelineOfRecording(*session, fileNameOf(arguments.source));
+    }
+    if (!isThere(arguments.source)) {
+        return unusable("there is neither a device nor a recording at '" + arguments.source + "'",
+                        "give the path of one");
     }
     const auto device = openDevice(arguments.source, DeviceAccess::Look);
     if (!device) return device.error();

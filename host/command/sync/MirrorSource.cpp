@@ -8,7 +8,7 @@
 #include "host/command/argument/OpenDevice.h"
 #include "host/console/Problem.h"
 #include "host/plan/Library.h"
-#include "system/PosixError.h"
+#include "system/file/PosixError.h"
 
 namespace appsync {
 namespace {

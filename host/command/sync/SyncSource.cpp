@@ -10,7 +10,7 @@
 #include "host/command/sync/SyncCommands.h"
 #include "host/console/Problem.h"
 #include "host/plan/LibraryReader.h"
-#include "system/PosixError.h"
+#include "system/file/PosixError.h"
 
 namespace appsync {
 namespace {

@@ -9,7 +9,7 @@
 #include <iterator>
 
 #include "host/plan/LibraryReader.h"
-#include "system/UniqueFd.h"
+#include "system/file/UniqueFd.h"
 #include "system/property_list/PropertyListCodec.h"
 #include "tests/host/HostFixture.h"
 

@@ -219,13 +219,44 @@ TEST(TimelineLog, SessionsAreToldApart) {
     EXPECT_FALSE(sessions[0].lacksBeginning);
 }
 
+std::string askedFor(const std::string& identifier) {
+    return lineOfLog(
+        2,
+        "Asset %{public}@ (pretty=%{public}@, version=%{public}@) prepped with icon %{public}@, at "
+        "%{public}@, meta at %{public}@, info at %{public}@, storePid=%lld, isRestore=%c",
+        "Asset " + identifier +
+            " (pretty=A, version=1) prepped with icon i, at a, meta at m, info at n, storePid=0, "
+            "isRestore=n");
+}
+
+std::string transferOf(const std::string& identifier) {
+    return lineOfLog(3, "finished transferring %lf for %{public}@",
+                     "finished transferring 1.000000 for " + identifier);
+}
+
+// A sync that is killed says nothing more.
+TEST(TimelineLog, WhatIsSentAfterASyncThatWasKilledIsNoPartOfIt) {
+    const std::string begin = lineOfLog(1, "starting to reconcile sync with new anchor %{public}@",
+                                        "starting to reconcile sync");
+    const std::string transferred =
+        lineOfLog(4, "asset transfer ended withsuccess: %c", "asset transfer ended withsuccess: y");
+    const std::string sync = begin + askedFor("com.a") + askedFor("com.b") + transferOf("com.a");
+    EXPECT_THAT(sessionsInLog(sync + transferOf("com.b")), SizeIs(1));
+    for (const std::string& text : {sync + transferOf("com.c") + transferOf("com.c"),
+                                    sync + transferred + transferOf("com.b")}) {
+        const std::vector<LoggedSession> sessions = sessionsInLog(text);
+        ASSERT_THAT(sessions, SizeIs(2));
+        EXPECT_FALSE(sessions[1].lacksBeginning);
+    }
+}
+
 TEST(TimelineLog, ALogThatBeginsWithinASessionSaysSo) {
     const std::string text =
         lineOfLog(1, "Performing install for %{public}@", "Performing install for com.a");
     const std::vector<LoggedSession> sessions = sessionsInLog(text);
     ASSERT_THAT(sessions, SizeIs(1));
     EXPECT_TRUE(sessions[0].lacksBeginning);
-    const std::optional<LoggedEvent> event = eventOfLine(sessions[0].lines.front());
+    const std::optional<TimedEvent> event = eventOfLine(sessions[0].lines.front());
     ASSERT_TRUE(event);
     EXPECT_EQ(event->event.identifier, "com.a");
     EXPECT_EQ(event->time.time_since_epoch() % std::chrono::seconds(1),
@@ -236,6 +267,7 @@ TEST(TimelineLog, ALineWithoutATimeTellsNothing) {
     const TimelineMessage* message = messageOfFormat("%s|Wait completed");
     for (const char* line :
          {"", "[]", R"({"time":"yesterday"})", R"({"time":"2026-13-02T03:04:05.000005Z"})",
+          R"({"time":"9999-01-02T03:04:05.000005Z"})", R"({"time":"1969-01-02T03:04:05.000005Z"})",
           R"({"time":7,"message":"own|Wait completed"})"}) {
         EXPECT_FALSE(eventOfLine({line, message})) << line;
     }

@@ -106,8 +106,11 @@ TEST(TimelineStacks, TheHeightIsThatOfTheMostAtOnce) {
 TEST(TimelineScale, TicksAreFewAndRound) {
     for (const std::int64_t length :
          {std::int64_t{0}, std::int64_t{1}, std::int64_t{999}, std::int64_t{123'456'789},
-          std::int64_t{31'000'000'000}, std::int64_t{900'000'000'000'000'000}}) {
-        EXPECT_LE(ticksOf(TimelineMoment(length)).size(), 11U) << length;
+          std::int64_t{31'000'000'000}, std::int64_t{900'000'000'000'000'000},
+          TimelineMoment::max().count()}) {
+        const std::vector<TimelineTick> some = ticksOf(TimelineMoment(length));
+        EXPECT_LE(some.size(), 11U) << length;
+        for (const TimelineTick& tick : some) EXPECT_GE(tick.at.count(), 0) << length;
     }
     const std::vector<TimelineTick> ticks = ticksOf(std::chrono::seconds(31));
     ASSERT_THAT(ticks, SizeIs(7));
@@ -168,6 +171,19 @@ TEST(TimelineSvg, NamesOfAnyKindStayText) {
         EXPECT_THAT(text, Not(HasSubstr("\xEF\xBF\xBF")));
         EXPECT_THAT(text, Not(testing::ContainsRegex("[\x01-\x08\x1b\xff]")));
     }
+}
+
+TEST(TimelinePage, TimesThatAreTooLongForASumHaveNone) {
+    Timeline timeline = timelineWith(2 * kMostSingleLanes);
+    timeline.length = TimelineMoment::max();
+    for (TimelineLane& lane : timeline.lanes) {
+        lane.end = timeline.length;
+        for (const SpanKind kind : {SpanKind::Transfer, SpanKind::Transfer, SpanKind::Store}) {
+            lane.spans.push_back({kind, lane.asked, lane.end, true, 0});
+        }
+        timeline.waits.push_back({lane.identifier, "its turn", lane.asked, lane.end, true});
+    }
+    EXPECT_THAT(timelinePage(timeline), Not(testing::ContainsRegex("(: |>|, )-[0-9]")));
 }
 
 TEST(TimelineSvg, LikeFailuresAreToldOnce) {
