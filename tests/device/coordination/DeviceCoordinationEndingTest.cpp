@@ -211,22 +211,25 @@ TEST_F(DeviceCoordinationEndingTest, aHandleOutlivesTheDevice) {
 }
 
 TEST_F(DeviceCoordinationEndingTest, anObserverMayGoWhileItIsCalled) {
+    struct Meeting {
+        std::promise<void> called;
+        std::promise<void> released;
+    };
     auto mortal = std::make_shared<CoordinationListener>();
-    std::promise<void> called;
     const auto made = coordinator(kAtlas, CoordinatorKind::Initiating);
     made->setObserver(mortal);
-    std::promise<void> released;
-    auto releasedBefore = released.get_future().share();
-    mortal->setReaction([&](const std::string&) {
-        called.set_value();
-        releasedBefore.wait();
+    // Shared with the listener, whose thread may be the last that lets go of it.
+    const auto meeting = std::make_shared<Meeting>();
+    mortal->setReaction([meeting](const std::string&) {
+        meeting->called.set_value();
+        meeting->released.get_future().wait();
     });
     made->cancelForReason(reason(), SyncClientID);
-    called.get_future().wait();
+    meeting->called.get_future().wait();
     const std::weak_ptr<CoordinationListener> watch = mortal;
     mortal.reset();
     EXPECT_FALSE(watch.expired());
-    released.set_value();
+    meeting->released.set_value();
     EXPECT_TRUE(eventually([&] { return watch.expired(); }));
 }
 
