@@ -22,6 +22,10 @@ namespace appsync {
 inline constexpr const char* kA = "com.example.a";
 inline constexpr const char* kB = "com.example.b";
 inline constexpr const char* kC = "com.example.c";
+/// The version that is asked for.
+inline const std::string kOneZero = "1.0";
+/// Where the client makes the placeholder of the first.
+inline const std::string kBundle = "/tmp/com.korvu.trd.Apps/com.example.a.app";
 
 inline PropertyList todoEntry(const PropertyList& identifier, std::string_view operation) {
     return PropertyList::map({{kTodoIdentifierKey, identifier},

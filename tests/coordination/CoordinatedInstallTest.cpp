@@ -16,7 +16,6 @@ using testing::SizeIs;
 using testing::StartsWith;
 using Access = AppsClientTestAccess;
 
-constexpr const char* kBundle = "/tmp/com.korvu.trd.Apps/com.example.a.app";
 constexpr const char* kFinished =
     "processing app install for bundle com.example.a finished with status 1 error (null)";
 
@@ -191,7 +190,7 @@ TEST_F(CoordinatedInstall, GoesOnWithoutAnIconThatCannotBeCopied) {
 }
 
 TEST_F(CoordinatedInstall, GoesOnWithoutAnIconWhereOneIsLeftOver) {
-    const std::string leftOver = std::string(kBundle) + "/Icon.png";
+    const std::string leftOver = kBundle + "/Icon.png";
     platform_.files.addFile(leftOver, "left over");
     EXPECT_TRUE(prepare());
     EXPECT_EQ(platform_.files.text(leftOver), "left over");
@@ -202,7 +201,7 @@ TEST_F(CoordinatedInstall, GoesOnWithoutAnIconWhereOneIsLeftOver) {
 }
 
 TEST_F(CoordinatedInstall, GoesOnWithoutAnIconOfUnknownSize) {
-    platform_.files.failNext(FileOperation::Attributes, std::string(kBundle) + "/Icon.png", EIO);
+    platform_.files.failNext(FileOperation::Attributes, kBundle + "/Icon.png", EIO);
     EXPECT_TRUE(prepare());
     EXPECT_EQ(service().promise(std::string(kA) + "-Icon"), nullptr);
     EXPECT_TRUE(state()->placeholder->configurationComplete);

@@ -16,8 +16,6 @@ using testing::IsEmpty;
 using testing::Not;
 using testing::StartsWith;
 
-const std::string kBundle = "/tmp/com.korvu.trd.Apps/com.example.a.app";
-
 // One application that is restored through a coordinator.
 class CoordinatedRestore : public RestoreFixture {
   protected:

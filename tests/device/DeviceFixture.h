@@ -16,6 +16,12 @@
 
 namespace appsync {
 
+/// What is on the devices of the tests.
+inline constexpr const char* kAtlas = "com.example.atlas";
+inline constexpr const char* kBoat = "com.example.boat";
+inline constexpr const char* kBrook = "com.example.brook";
+inline constexpr const char* kCrane = "com.example.crane";
+
 /// A directory of its own for each test, an empty device in it, and packages for it.
 class DeviceFixture : public ::testing::Test {
   protected:

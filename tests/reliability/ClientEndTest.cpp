@@ -21,7 +21,7 @@ constexpr const char* kRunning = "com.example.running";
 constexpr const char* kRefused = "com.example.refused";
 constexpr const char* kUnwanted = "com.example.unwanted";
 constexpr const char* kRestoring = "com.example.restoring";
-constexpr std::uint64_t kSeeds = 20;
+constexpr std::uint64_t kSeedsToEnd = 20;
 /// The answer to a wish of the client's, which is logged whether or not the client is still there.
 constexpr std::string_view kLateAnswer = "Prioritize ";
 
@@ -156,7 +156,7 @@ class ClientEnd : public testing::TestWithParam<bool> {
     /// Leaves after each call, with each seed. Who let the client go last.
     std::set<std::string> leaveAfterEachCall() {
         std::set<std::string> holders;
-        for (std::uint64_t seed = 0; seed < kSeeds; ++seed) {
+        for (std::uint64_t seed = 0; seed < kSeedsToEnd; ++seed) {
             std::size_t calls = 0;
             while (leave(calls, seed, holders)) ++calls;
             EXPECT_GE(calls, 10U);

@@ -4,7 +4,6 @@
 #include <cstdlib>
 #include <exception>
 #include <functional>
-#include <ostream>
 #include <sstream>
 #include <stdexcept>
 
@@ -12,6 +11,7 @@
 #include "simulation/DeviceImage.h"
 #include "tests/reliability/DeviceState.h"
 #include "tests/reliability/Scenarios.h"
+#include "tests/reliability/SeedRange.h"
 
 #if defined(__SANITIZE_ADDRESS__) || defined(__SANITIZE_THREAD__)
 #define APPSYNC_SANITIZED 1
@@ -23,9 +23,6 @@
 
 namespace appsync {
 
-/// GoogleTest prints scenarios with it.
-static void PrintTo(const Scenario& scenario, std::ostream* out) { *out << scenario.name; }
-
 namespace {
 
 using testing::IsEmpty;
@@ -34,27 +31,22 @@ using testing::IsEmpty;
 /// ":operation:seed".
 constexpr const char* kOneCrash = "APPSYNC_CRASH";
 /// How many seeds each instant is tried with, and the first of them.
-constexpr const char* kManySeeds = "APPSYNC_CRASH_SEEDS";
-constexpr const char* kFirstSeed = "APPSYNC_CRASH_BASE";
+constexpr const char* kManyCrashSeeds = "APPSYNC_CRASH_SEEDS";
+constexpr const char* kFirstCrashSeed = "APPSYNC_CRASH_BASE";
 /// The scenarios whose recovery crashes at every instant, too, and the seeds of both crashes.
 constexpr const char* kCrashedTwice[] = {"DirectSync", "CoordinatedSync"};
 // Sanitizers take ten times as long, and look for something else.
 #ifdef APPSYNC_SANITIZED
-constexpr std::uint64_t kSeeds = 4;
+constexpr std::uint64_t kSeedsToCrash = 4;
 constexpr std::uint64_t kSeedsOfVariants = 4;
 constexpr std::uint64_t kSeedsOfPairs = 1;
 #else
-constexpr std::uint64_t kSeeds = 32;
+constexpr std::uint64_t kSeedsToCrash = 32;
 constexpr std::uint64_t kSeedsOfVariants = 12;
 constexpr std::uint64_t kSeedsOfPairs = 3;
 #endif
 
 using Violations = std::vector<std::string>;
-
-std::uint64_t numberIn(const char* variable, std::uint64_t otherwise) {
-    const char* text = std::getenv(variable);
-    return text != nullptr ? std::stoull(text) : otherwise;
-}
 
 /// An instant at which a run was crashed, and which crash it was.
 struct Crash {
@@ -290,8 +282,8 @@ class EveryInstant : public testing::TestWithParam<Scenario> {};
 
 TEST_P(EveryInstant, OfACrashIsRecoveredFrom) {
     const std::uint64_t seeds =
-        numberIn(kManySeeds, GetParam().isVariant ? kSeedsOfVariants : kSeeds);
-    const std::uint64_t first = numberIn(kFirstSeed, 0);
+        numberIn(kManyCrashSeeds).value_or(GetParam().isVariant ? kSeedsOfVariants : kSeedsToCrash);
+    const std::uint64_t first = numberIn(kFirstCrashSeed).value_or(0);
     const Expectation expectation = runPlainly(GetParam(), seedsFrom(first, seeds));
     EXPECT_GT(expectation.operations, 0U);
     for (const Crashed& each : expectation.pictures) {
@@ -324,9 +316,8 @@ std::size_t crashAgain(const Scenario& scenario, const Expectation& expectation,
 }
 
 TEST_P(EveryPairOfInstants, OfCrashesIsRecoveredFrom) {
-    const std::uint64_t first = numberIn(kFirstSeed, 0);
-    const std::uint64_t seeds =
-        std::getenv(kManySeeds) != nullptr ? numberIn(kManySeeds, 0) : kSeedsOfPairs;
+    const std::uint64_t first = numberIn(kFirstCrashSeed).value_or(0);
+    const std::uint64_t seeds = numberIn(kManyCrashSeeds).value_or(kSeedsOfPairs);
     const SeedsOf chosen = seedsFrom(first, seeds);
     const Expectation expectation = runPlainly(GetParam(), chosen);
     std::size_t pairs = 0;

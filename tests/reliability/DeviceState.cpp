@@ -7,7 +7,7 @@ namespace appsync {
 namespace {
 
 /// Property lists by what they say, whatever their encoding.
-std::string textOf(World& world, const std::string& path) {
+std::string textOfFile(World& world, const std::string& path) {
     if (path.ends_with(".plist")) {
         if (const auto list = world.platform.propertyListAt(path)) return callText(*list);
     }
@@ -68,7 +68,7 @@ DeviceState stateOf(World& world) {
     state["uninstalled"] = callText(world.platform.installer.uninstalled());
     for (const std::string& path : world.platform.files.paths("/var")) {
         if (path == kRestoreStatePath || belongsToLastSession(path)) continue;
-        state[path] = textOf(world, path);
+        state[path] = textOfFile(world, path);
     }
     state["packages that wait for data"] = textOfRestoreState(world);
     return state;

@@ -1,13 +1,9 @@
 #include <cstdio>
 #include <exception>
-#include <ostream>
 
 #include "tests/reliability/Scenarios.h"
 
 namespace appsync {
-
-/// GoogleTest prints scenarios with it.
-static void PrintTo(const Scenario& scenario, std::ostream* out) { *out << scenario.name; }
 
 namespace {
 
@@ -54,7 +50,7 @@ void goThroughAgain(const Scenario& scenario, World& world, Outcome& outcome) {
     }
 }
 
-void tryOut(const Scenario& scenario, const std::optional<Aim>& aim, Outcome& outcome) {
+void tryFault(const Scenario& scenario, const std::optional<Aim>& aim, Outcome& outcome) {
     World world;
     scenario.setUp(world);
     scenario.arrange(world);
@@ -86,7 +82,7 @@ class EveryFault : public testing::TestWithParam<Scenario> {
                 extent == FaultExtent::Everything ? 1 : plain.opportunities[call].ways;
             for (std::size_t way = 0; way < ways; ++way) {
                 Outcome outcome;
-                tryOut(GetParam(), Aim{call, way, extent}, outcome);
+                tryFault(GetParam(), Aim{call, way, extent}, outcome);
                 EXPECT_THAT(outcome.violations, IsEmpty()) << call << ": " << outcome.firstFault;
                 EXPECT_THAT(outcome.shortcomings, IsEmpty())
                     << "the next session, after " << call << ": " << outcome.firstFault;
@@ -100,7 +96,7 @@ class EveryFault : public testing::TestWithParam<Scenario> {
     }
     [[nodiscard]] Outcome plainRun() const {
         Outcome outcome;
-        tryOut(GetParam(), std::nullopt, outcome);
+        tryFault(GetParam(), std::nullopt, outcome);
         return outcome;
     }
 };

@@ -12,8 +12,8 @@ using Draws = std::set<std::size_t>;
 constexpr std::size_t kMostTries = 5000;
 
 // In the order in which they are put to rest: most often the later ones are what is needed.
-constexpr std::array kSources = {&SessionChanges::turns, &SessionChanges::faults,
-                                 &SessionChanges::choices};
+constexpr std::array kKindsOfUnrest = {&SessionChanges::turns, &SessionChanges::faults,
+                                       &SessionChanges::choices};
 
 Draws without(const std::vector<std::size_t>& draws, std::size_t begin, std::size_t count) {
     Draws left(draws.begin(), draws.end());
@@ -86,7 +86,7 @@ SessionChanges reduced(SessionChanges whole,
                        const std::function<bool(const SessionChanges&)>& fails) {
     for (std::size_t before = sizeOf(whole) + 1; sizeOf(whole) < before;) {
         before = sizeOf(whole);
-        for (const auto source : kSources) {
+        for (const auto source : kKindsOfUnrest) {
             const Draws all = *(whole.*source).kept;
             (whole.*source).kept = fewest(all, [&](const Draws& some) {
                 SessionChanges changes = whole;
@@ -95,7 +95,7 @@ SessionChanges reduced(SessionChanges whole,
             });
         }
     }
-    for (const auto source : kSources) {
+    for (const auto source : kKindsOfUnrest) {
         std::erase_if((whole.*source).replaced, [&](const auto& replaced) {
             return !(whole.*source).kept->contains(replaced.first);
         });

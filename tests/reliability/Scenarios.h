@@ -1,6 +1,7 @@
 #pragma once
 
 #include <functional>
+#include <ostream>
 #include <string>
 #include <vector>
 
@@ -36,6 +37,9 @@ struct Scenario {
     /// Says to a new world what it has to know of the scenario. What is on it comes after that.
     void setUp(World& world) const;
 };
+
+/// GoogleTest prints scenarios with it.
+inline void PrintTo(const Scenario& scenario, std::ostream* out) { *out << scenario.name; }
 
 /// A whole sync that brings the device in step with what is wanted. A host that plans stages what
 /// is left to do of that, and starts the client.

@@ -16,7 +16,7 @@ using testing::IsEmpty;
 
 /// The environment variable that asks for the least of a seed that fails.
 constexpr const char* kSmall = "APPSYNC_SMALL";
-constexpr std::uint64_t kSeeds = 2000;
+constexpr std::uint64_t kSeedsToTry = 2000;
 constexpr std::uint64_t kChangess = 8;
 
 std::string firstDifference(const std::vector<std::string>& one,
@@ -28,7 +28,7 @@ std::string firstDifference(const std::vector<std::string>& one,
 }
 
 /// How many calls were made to fail.
-std::size_t tryOut(std::uint64_t seed, const SessionChanges& changes = {}) {
+std::size_t trySeed(std::uint64_t seed, const SessionChanges& changes = {}) {
     SCOPED_TRACE(std::string(kOneSeed) + "=" + std::to_string(seed) +
                  " build/release/tests/test_reliability --gtest_filter=Seeds.One");
     RandomSession first(seed, changes);
@@ -44,11 +44,11 @@ class ManySeeds : public testing::TestWithParam<std::uint64_t> {};
 
 TEST_P(ManySeeds, KeepTheInvariantsAndRepeatThemselves) {
     const std::uint64_t first = numberIn(kFirstSeed).value_or(0);
-    const std::uint64_t count = numberIn(kManySeeds).value_or(kSeeds);
+    const std::uint64_t count = numberIn(kManySeeds).value_or(kSeedsToTry);
     std::size_t seeds = 0;
     std::size_t faults = 0;
     for (std::uint64_t i = GetParam(); i < count; i += kChangess, ++seeds)
-        faults += tryOut(first + i);
+        faults += trySeed(first + i);
     RecordProperty("seeds", static_cast<int>(seeds));
     RecordProperty("faults", static_cast<int>(faults));
 }
@@ -76,7 +76,7 @@ void printSmall(std::uint64_t seed) {
 /// the least of it that does, too.
 TEST(Seeds, One) {
     const std::uint64_t seed = numberIn(kOneSeed).value_or(1);
-    tryOut(seed, givenChanges());
+    trySeed(seed, givenChanges());
     if (std::getenv(kSmall) != nullptr) printSmall(seed);
     if (std::getenv("APPSYNC_TRACE") == nullptr) return;
     RandomSession session(seed, givenChanges());
@@ -90,7 +90,7 @@ TEST(Seeds, One) {
 // and that an uninstall takes.
 TEST(Seeds, ThatWereFound) {
     for (const std::uint64_t seed : {2644U, 8968U, 14216U, 17069U, 24793U, 24953U, 46102U, 48892U})
-        tryOut(seed);
+        trySeed(seed);
 }
 
 TEST(Seeds, MakeSessionsThatDiffer) {

@@ -11,7 +11,6 @@ using testing::HasSubstr;
 using testing::IsEmpty;
 
 const FileAttributes kMobile{"mobile", "mobile"};
-const std::string kBundle = "/tmp/com.korvu.trd.Apps/com.example.a.app";
 
 class PlaceholderBundles : public AppsClientFixture {};
 

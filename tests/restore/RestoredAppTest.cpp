@@ -10,8 +10,6 @@ using testing::ElementsAre;
 using testing::HasSubstr;
 using testing::IsEmpty;
 
-const std::string kBundle = "/tmp/com.korvu.trd.Apps/com.example.a.app";
-
 // An application that is restored directly.
 class RestoredAppPlaceholder : public RestoreFixture {
   protected:

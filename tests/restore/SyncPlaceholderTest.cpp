@@ -11,8 +11,6 @@ using testing::HasSubstr;
 using testing::IsEmpty;
 using testing::StartsWith;
 
-const std::string kBundle = "/tmp/com.korvu.trd.Apps/com.example.a.app";
-
 class SyncPlaceholder : public AppsClientFixture {
   protected:
     SyncPlaceholder() {

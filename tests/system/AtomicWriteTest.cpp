@@ -19,14 +19,14 @@ namespace appsync {
 namespace {
 
 namespace fs = std::filesystem;
-using testing::bytes;
-using testing::Call;
-using testing::FailingCall;
-using testing::text;
+using device_files::bytes;
+using device_files::Call;
+using device_files::FailingCall;
+using device_files::text;
 
 using Names = std::vector<std::string>;
 
-class AtomicWriteTest : public testing::DeviceFilesTest {
+class AtomicWriteTest : public device_files::DeviceFilesTest {
   protected:
     AtomicWriteTest() { fs::create_directory(real("/a")); }
 };

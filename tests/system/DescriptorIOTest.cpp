@@ -12,11 +12,11 @@
 namespace appsync {
 namespace {
 
-using testing::bytes;
-using testing::Call;
-using testing::FailingCall;
-using testing::kForever;
-using testing::text;
+using device_files::bytes;
+using device_files::Call;
+using device_files::FailingCall;
+using device_files::kForever;
+using device_files::text;
 
 class DescriptorIOTest : public ::testing::Test {
   protected:
@@ -28,7 +28,7 @@ class DescriptorIOTest : public ::testing::Test {
         ASSERT_EQ(::lseek(file_.get(), 0, SEEK_SET), 0);
     }
 
-    testing::ScratchDirectory scratch_;
+    device_files::ScratchDirectory scratch_;
     UniqueFd file_;
 };
 

@@ -9,7 +9,7 @@
 #include <sys/stat.h>
 #include <unistd.h>
 
-namespace appsync::testing {
+namespace appsync::device_files {
 
 namespace fs = std::filesystem;
 
@@ -88,4 +88,4 @@ bool DeviceFilesTest::outsideIsUntouched() const {
     return found == kSecret && std::distance(fs::directory_iterator(outside()), {}) == 1;
 }
 
-}  // namespace appsync::testing
+}  // namespace appsync::device_files

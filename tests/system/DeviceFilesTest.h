@@ -12,7 +12,7 @@
 #include "platform/Bytes.h"
 #include "system/file/RootedFileSystem.h"
 
-namespace appsync::testing {
+namespace appsync::device_files {
 
 /// A fresh directory of the machine, removed with everything in it at the end.
 class ScratchDirectory {
@@ -55,4 +55,4 @@ class DeviceFilesTest : public ::testing::Test {
     std::unique_ptr<RootedFileSystem> files_;
 };
 
-}  // namespace appsync::testing
+}  // namespace appsync::device_files

@@ -13,7 +13,7 @@ using ::testing::ElementsAre;
 using ::testing::HasSubstr;
 
 /// Whole directories of a device: what is in them, and copies of them.
-class DirectoryCopyTest : public testing::DeviceFilesTest {
+class DirectoryCopyTest : public device_files::DeviceFilesTest {
   protected:
     DirectoryCopyTest() {
         put("/from/Info.plist", "info");

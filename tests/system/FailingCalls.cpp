@@ -9,7 +9,7 @@
 #include <sys/syscall.h>
 #include <unistd.h>
 
-namespace appsync::testing {
+namespace appsync::device_files {
 
 namespace {
 
@@ -44,12 +44,12 @@ FailingCall::~FailingCall() { plan = {}; }
 
 int FailingCall::failures() const { return plan.failures; }
 
-}  // namespace appsync::testing
+}  // namespace appsync::device_files
 
 // The linker sends every call of `name` to __wrap_name, and of __real_name to the system.
-using appsync::testing::Call;
-using appsync::testing::fails;
-using appsync::testing::plan;
+using appsync::device_files::Call;
+using appsync::device_files::fails;
+using appsync::device_files::plan;
 
 extern "C" {
 

@@ -1,6 +1,6 @@
 #pragma once
 
-namespace appsync::testing {
+namespace appsync::device_files {
 
 /// The system calls that can be made to fail.
 enum class Call {
@@ -39,4 +39,4 @@ class FailingCall {
     [[nodiscard]] int failures() const;
 };
 
-}  // namespace appsync::testing
+}  // namespace appsync::device_files

@@ -11,12 +11,12 @@ namespace appsync {
 namespace {
 
 namespace fs = std::filesystem;
-using testing::bytes;
-using testing::Call;
-using testing::FailingCall;
-using testing::kForever;
+using device_files::bytes;
+using device_files::Call;
+using device_files::FailingCall;
+using device_files::kForever;
 
-class InPlaceWriteTest : public testing::DeviceFilesTest {
+class InPlaceWriteTest : public device_files::DeviceFilesTest {
   protected:
     ino_t inode() const {
         struct stat status {};

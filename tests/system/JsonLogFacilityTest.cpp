@@ -12,9 +12,9 @@ namespace appsync {
 namespace {
 
 using std::string_view_literals::operator""sv;
-using testing::Call;
-using testing::FailingCall;
-using testing::kForever;
+using device_files::Call;
+using device_files::FailingCall;
+using device_files::kForever;
 
 LogLine lineWith(std::string_view message) {
     return {std::chrono::system_clock::time_point(), LogCategory::Applications, LogLevel::Error,
@@ -89,7 +89,7 @@ class JsonLogFacilityTest : public ::testing::Test {
         log_.write({LogCategory::Coordination, level, "says %s", {&argument, 1}});
     }
 
-    testing::ScratchDirectory scratch_;
+    device_files::ScratchDirectory scratch_;
     JsonLogFacility log_;
 };
 

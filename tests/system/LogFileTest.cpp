@@ -18,8 +18,8 @@ namespace appsync {
 namespace {
 
 namespace fs = std::filesystem;
-using testing::Call;
-using testing::FailingCall;
+using device_files::Call;
+using device_files::FailingCall;
 using Lines = std::vector<std::string>;
 
 constexpr off_t kMost = std::numeric_limits<off_t>::max();
@@ -47,7 +47,7 @@ class LogFileTest : public ::testing::Test {
         return result;
     }
 
-    testing::ScratchDirectory scratch_;
+    device_files::ScratchDirectory scratch_;
 };
 
 TEST_F(LogFileTest, AppendsToWhatIsThere) {

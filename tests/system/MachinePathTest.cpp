@@ -39,7 +39,7 @@ TEST(MachinePathTest, GivesEachBundleANameOfItsOwn) {
     }
 }
 
-using LongBundles = testing::DeviceFilesTest;
+using LongBundles = device_files::DeviceFilesTest;
 
 TEST_F(LongBundles, AreMadeReadAndRemovedUnderTheirNames) {
     const std::string bundle = "/tmp/" + named(255) + ".app";
@@ -47,10 +47,10 @@ TEST_F(LongBundles, AreMadeReadAndRemovedUnderTheirNames) {
     ASSERT_TRUE(files_->createDirectory(bundle, true, nullptr));
     ASSERT_TRUE(files_->createDirectory(other + "/in", true, nullptr));
     EXPECT_TRUE(files_->createDirectory(bundle, true, nullptr)) << "it exists";
-    ASSERT_TRUE(files_->createFile(bundle + "/Icon.png", testing::bytes("icon"), {}));
-    ASSERT_TRUE(files_->writeFileAtomically(bundle + "/Info.plist", testing::bytes("info")));
+    ASSERT_TRUE(files_->createFile(bundle + "/Icon.png", device_files::bytes("icon"), {}));
+    ASSERT_TRUE(files_->writeFileAtomically(bundle + "/Info.plist", device_files::bytes("info")));
     ASSERT_TRUE(files_->copyItem(bundle + "/Icon.png", other + "/Icon.png"));
-    EXPECT_EQ(testing::text(*files_->readFile(other + "/Icon.png")), "icon");
+    EXPECT_EQ(device_files::text(*files_->readFile(other + "/Icon.png")), "icon");
     EXPECT_TRUE(files_->attributes(bundle)->isDirectory);
     EXPECT_EQ(names("/tmp").size(), 2U);
     EXPECT_TRUE(files_->removeItem(bundle));

@@ -19,11 +19,11 @@ namespace appsync {
 namespace {
 
 namespace fs = std::filesystem;
-using testing::Call;
-using testing::FailingCall;
-using testing::kForever;
+using device_files::Call;
+using device_files::FailingCall;
+using device_files::kForever;
 
-class RemovalTest : public testing::DeviceFilesTest {
+class RemovalTest : public device_files::DeviceFilesTest {
   protected:
     /// A chain of directories under `top`, each called "d", with a file in the last.
     void makeChain(const fs::path& top, int depth) const {

@@ -15,18 +15,18 @@
 namespace appsync {
 namespace {
 
-using testing::Call;
-using testing::FailingCall;
+using device_files::Call;
+using device_files::FailingCall;
 using std::string_literals::operator""s;
 
-class RootDirectoryTest : public testing::DeviceFilesTest {
+class RootDirectoryTest : public device_files::DeviceFilesTest {
   protected:
     [[nodiscard]] const RootDirectory& root() const { return files_->root(); }
 
     /// What stands in the file that the path leads to, or why there is none.
     [[nodiscard]] std::string read(const std::string& path) const {
         const Result<Bytes> contents = files_->readFile(path);
-        return contents ? testing::text(*contents) : contents.error().description();
+        return contents ? device_files::text(*contents) : contents.error().description();
     }
     [[nodiscard]] std::int64_t openingFailsWith(const std::string& path) const {
         const auto opened = root().openFile(path, O_RDONLY | O_NONBLOCK);

@@ -13,11 +13,11 @@ namespace appsync {
 namespace {
 
 namespace fs = std::filesystem;
-using testing::bytes;
-using testing::Call;
-using testing::FailingCall;
-using testing::kForever;
-using testing::text;
+using device_files::bytes;
+using device_files::Call;
+using device_files::FailingCall;
+using device_files::kForever;
+using device_files::text;
 
 constexpr uid_t kOtherUser = 4242;
 constexpr gid_t kOtherGroup = 4343;
@@ -30,7 +30,7 @@ struct stat statusOf(const fs::path& path) {
     return status;
 }
 
-class RootedFileSystemTest : public testing::DeviceFilesTest {
+class RootedFileSystemTest : public device_files::DeviceFilesTest {
   protected:
     /// The same device, with an account "guest" whose numbers are nobody's.
     [[nodiscard]] std::unique_ptr<RootedFileSystem> withGuest() const {

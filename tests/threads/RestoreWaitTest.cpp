@@ -35,7 +35,7 @@ constexpr const char* kOffloaded = "com.example.offloaded";
 constexpr const char* kUnused = "com.example.unused";
 constexpr std::size_t kApplications = 3;
 /// Only a test that fails waits for so long.
-constexpr std::chrono::seconds kPatience{20};
+constexpr std::chrono::seconds kLongestWait{20};
 
 class Process final : public SyncHost {
   public:
@@ -58,7 +58,7 @@ class Reports final : public LogFacility {
         if (!message.format.starts_with("%s|coordinatorDidInstallPlaceholder")) return;
         ++begun_;
         changed_.notify_all();
-        changed_.wait_for(lock, kPatience, [this] { return areLetThrough_; });
+        changed_.wait_for(lock, kLongestWait, [this] { return areLetThrough_; });
     }
     [[nodiscard]] std::unique_ptr<LogHandle> makeHandle(std::string_view,
                                                         std::string_view) override {
@@ -73,7 +73,7 @@ class Reports final : public LogFacility {
     /// Whether that many have begun, at last.
     [[nodiscard]] bool haveBegun(std::size_t count) {
         std::unique_lock lock(mutex_);
-        return changed_.wait_for(lock, kPatience, [this, count] { return begun_ >= count; });
+        return changed_.wait_for(lock, kLongestWait, [this, count] { return begun_ >= count; });
     }
     [[nodiscard]] std::vector<std::string> messages() {
         const std::lock_guard lock(mutex_);
@@ -239,7 +239,7 @@ TEST_F(RestoreWait, LastsItsWholeTimeInsideTheDaemonAlthoughEveryPlaceholderStan
 TEST_F(RestoreWait, EndsWithTheLastReportElsewhere) {
     restoreIn("com.example.other", [this](WaitGroup& group, auto) {
         reports_.letThrough();
-        return group.waitFor(kPatience);
+        return group.waitFor(kLongestWait);
     });
     EXPECT_THAT(asked_, ElementsAre(15s));
     EXPECT_TRUE(answered_);

@@ -19,8 +19,6 @@ constexpr int kGranted = TerminationAssertionResult::kGranted;
 constexpr int kDenied = TerminationAssertionResult::kDenied;
 constexpr int kNoSuchApplication = TerminationAssertionResult::kNoSuchApplication;
 
-const std::string kOneZero = "1.0";
-
 class InstallQueue : public AppsClientFixture {
   protected:
     InstallQueue() {

@@ -9,8 +9,6 @@ using testing::HasSubstr;
 using testing::IsEmpty;
 using Access = AppsClientTestAccess;
 
-const std::string kOneZero = "1.0";
-
 class TransferCompletion : public TransferEventsFixture {};
 
 TEST_F(TransferCompletion, ForgetATransferThatHasEnded) {

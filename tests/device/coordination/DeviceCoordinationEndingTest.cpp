@@ -11,7 +11,6 @@ namespace {
 
 using Texts = std::vector<std::string>;
 
-constexpr const char* kAtlas = "com.example.atlas";
 constexpr CoordinationClient kOther = 7;
 
 ErrorRecord reason(std::int64_t code = 30) { return ErrorRecord::make("TRError", code, "enough"); }

@@ -16,9 +16,6 @@ namespace {
 
 using Texts = std::vector<std::string>;
 
-constexpr const char* kAtlas = "com.example.atlas";
-constexpr const char* kBoat = "com.example.boat";
-
 class DeviceCoordinationInstallTest : public DeviceCoordinationFixture {
   protected:
     /// What the registry tells of installs under way: "identifier state phase".

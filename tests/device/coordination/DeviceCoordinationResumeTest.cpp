@@ -13,8 +13,6 @@ namespace {
 
 using Texts = std::vector<std::string>;
 
-constexpr const char* kAtlas = "com.example.atlas";
-constexpr const char* kBoat = "com.example.boat";
 constexpr std::chrono::seconds kLong{60};
 
 class DeviceCoordinationResumeTest : public DeviceCoordinationFixture {

@@ -3,8 +3,6 @@
 namespace appsync {
 namespace {
 
-constexpr const char* kAtlas = "com.example.atlas";
-
 /// An update of an application that runs.
 class DeviceCoordinationRunningTest : public DeviceCoordinationFixture {
   protected:

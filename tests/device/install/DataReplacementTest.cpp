@@ -15,17 +15,15 @@ namespace {
 
 namespace fs = std::filesystem;
 
-constexpr const char* kA = "com.example.a";
-
 Status failing(const char* why) { return ErrorRecord::make(kPosixErrorDomain, ENOSPC, why); }
 
 /// Data that comes from elsewhere while the device goes on.
 class DataReplacementTest : public DeviceFixture {
   protected:
     void SetUp() override {
-        ASSERT_TRUE(succeeded(install(kA)));
-        fs::create_directories(rootPath(Device::dataPath(kA)));
-        write(Device::dataPath(kA) + "/letter", "old");
+        ASSERT_TRUE(succeeded(install(kAtlas)));
+        fs::create_directories(rootPath(Device::dataPath(kAtlas)));
+        write(Device::dataPath(kAtlas) + "/letter", "old");
     }
 
     static Status writeLetter(int directory) {
@@ -33,7 +31,7 @@ class DataReplacementTest : public DeviceFixture {
         if (!file || ::write(file.get(), "new", 3) != 3) return failing("cannot write");
         return {};
     }
-    [[nodiscard]] std::string letter() const { return read(Device::dataPath(kA) + "/letter"); }
+    [[nodiscard]] std::string letter() const { return read(Device::dataPath(kAtlas) + "/letter"); }
     [[nodiscard]] bool nothingIsLeftBeside() const {
         return !exists(std::string(kUnpackedDataDirectory)) ||
                fs::is_empty(rootPath(kUnpackedDataDirectory));
@@ -41,21 +39,21 @@ class DataReplacementTest : public DeviceFixture {
 };
 
 TEST_F(DataReplacementTest, takesThePlaceOfAllThatWasThere) {
-    write(Device::dataPath(kA) + "/other", "old");
-    EXPECT_TRUE(succeeded(device().replaceData(kA, writeLetter)));
+    write(Device::dataPath(kAtlas) + "/other", "old");
+    EXPECT_TRUE(succeeded(device().replaceData(kAtlas, writeLetter)));
     EXPECT_EQ(letter(), "new");
-    EXPECT_FALSE(exists(Device::dataPath(kA) + "/other"));
+    EXPECT_FALSE(exists(Device::dataPath(kAtlas) + "/other"));
     EXPECT_TRUE(nothingIsLeftBeside());
 }
 
 TEST_F(DataReplacementTest, isTheFirstDataWhereThereWasNone) {
-    fs::remove_all(rootPath(Device::dataPath(kA)));
-    EXPECT_TRUE(succeeded(device().replaceData(kA, writeLetter)));
+    fs::remove_all(rootPath(Device::dataPath(kAtlas)));
+    EXPECT_TRUE(succeeded(device().replaceData(kAtlas, writeLetter)));
     EXPECT_EQ(letter(), "new");
 }
 
 TEST_F(DataReplacementTest, changesNothingWhenItFailsOnTheWay) {
-    const Status status = device().replaceData(kA, [](int directory) {
+    const Status status = device().replaceData(kAtlas, [](int directory) {
         const Status written = writeLetter(directory);
         return written ? failing("the disk is full") : written;
     });
@@ -65,8 +63,8 @@ TEST_F(DataReplacementTest, changesNothingWhenItFailsOnTheWay) {
 }
 
 TEST_F(DataReplacementTest, isRefusedWhenTheApplicationWasStartedMeanwhile) {
-    const Status status = device().replaceData(kA, [&](int directory) {
-        EXPECT_TRUE(succeeded(look()->run(kA)));
+    const Status status = device().replaceData(kAtlas, [&](int directory) {
+        EXPECT_TRUE(succeeded(look()->run(kAtlas)));
         return writeLetter(directory);
     });
     EXPECT_TRUE(refusedBy(status, RegistryErrorCode::Running, "quit"));
@@ -75,37 +73,36 @@ TEST_F(DataReplacementTest, isRefusedWhenTheApplicationWasStartedMeanwhile) {
 }
 
 TEST_F(DataReplacementTest, leavesNothingWhenTheApplicationWasUninstalledMeanwhile) {
-    const Status status = device().replaceData(kA, [&](int directory) {
-        EXPECT_TRUE(succeeded(look()->uninstall(kA)));
+    const Status status = device().replaceData(kAtlas, [&](int directory) {
+        EXPECT_TRUE(succeeded(look()->uninstall(kAtlas)));
         return writeLetter(directory);
     });
     EXPECT_TRUE(refusedBy(status, RegistryErrorCode::NothingInstalled));
-    EXPECT_FALSE(exists(Device::dataPath(kA)));
+    EXPECT_FALSE(exists(Device::dataPath(kAtlas)));
     EXPECT_TRUE(nothingIsLeftBeside());
 }
 
 TEST_F(DataReplacementTest, isRefusedBehindThePlaceholderOfASync) {
-    constexpr const char* kB = "com.example.b";
-    ASSERT_TRUE(succeeded(installPlaceholder(kB, kInstallTypeSync)));
+    ASSERT_TRUE(succeeded(installPlaceholder(kBrook, kInstallTypeSync)));
     EXPECT_TRUE(
-        refusedBy(device().replaceData(kB, writeLetter), RegistryErrorCode::NothingInstalled));
-    EXPECT_FALSE(exists(Device::dataPath(kB)));
+        refusedBy(device().replaceData(kBrook, writeLetter), RegistryErrorCode::NothingInstalled));
+    EXPECT_FALSE(exists(Device::dataPath(kBrook)));
 }
 
 TEST_F(DataReplacementTest, isRefusedWhileARestoreBringsData) {
-    ASSERT_TRUE(succeeded(device().setRestoreDataExpected(kA, true)));
+    ASSERT_TRUE(succeeded(device().setRestoreDataExpected(kAtlas, true)));
     EXPECT_TRUE(
-        refusedBy(device().replaceData(kA, writeLetter), RegistryErrorCode::UpdateUnderWay));
+        refusedBy(device().replaceData(kAtlas, writeLetter), RegistryErrorCode::UpdateUnderWay));
     EXPECT_EQ(letter(), "old");
 }
 
 TEST_F(DataReplacementTest, needsTheDeviceForItself) {
-    EXPECT_FALSE(look()->replaceData(kA, writeLetter).ok());
+    EXPECT_FALSE(look()->replaceData(kAtlas, writeLetter).ok());
     EXPECT_EQ(letter(), "old");
 }
 
 TEST_F(DataReplacementTest, isLeftByACrashAsItWasAndTheNextSessionClearsTheRest) {
-    const std::string unpacked = std::string(kUnpackedDataDirectory) + "/" + kA;
+    const std::string unpacked = std::string(kUnpackedDataDirectory) + "/" + kAtlas;
     close();
     fs::create_directories(rootPath(unpacked));
     write(unpacked + "/letter", "half");

@@ -23,8 +23,6 @@
 namespace appsync {
 namespace {
 
-constexpr const char* kAtlas = "com.example.atlas";
-
 /// Each of its syncs makes durable what was written when it began.
 struct CountingDisk {
     std::atomic<int> written{0};

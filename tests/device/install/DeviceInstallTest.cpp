@@ -12,8 +12,6 @@
 namespace appsync {
 namespace {
 
-constexpr const char* kAtlas = "com.example.atlas";
-
 using DeviceInstallTest = DeviceFixture;
 
 TEST_F(DeviceInstallTest, aPackageBecomesAnApplication) {

@@ -6,8 +6,6 @@
 namespace appsync {
 namespace {
 
-constexpr const char* kAtlas = "com.example.atlas";
-
 class DevicePlaceholderTest : public DeviceFixture {
   protected:
     Status installFromBundle(const std::string& bundle, PropertyList options) {

@@ -13,9 +13,6 @@ namespace {
 
 namespace fs = std::filesystem;
 
-constexpr const char* kAtlas = "com.example.atlas";
-constexpr const char* kBrook = "com.example.brook";
-
 class DeviceReconciliationTest : public DevicePlatformFixture {
   protected:
     /// Ends the session, and begins another one after `between` has changed the device.

@@ -6,9 +6,6 @@
 namespace appsync {
 namespace {
 
-constexpr const char* kAtlas = "com.example.atlas";
-constexpr const char* kBrook = "com.example.brook";
-
 class DeviceUninstallTest : public DeviceFixture {
   protected:
     Status uninstall(const PropertyList& options = {}) {

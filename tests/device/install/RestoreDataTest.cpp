@@ -16,8 +16,6 @@ namespace {
 namespace fs = std::filesystem;
 using testing::HasSubstr;
 
-constexpr const char* kA = "com.example.a";
-
 /// Archives that a restore has left, and applications that come after it.
 class RestoreDataTest : public DeviceFixture {
   protected:
@@ -25,29 +23,29 @@ class RestoreDataTest : public DeviceFixture {
         fs::create_directories(rootPath(kRestoreDataDirectory));
         write(restoreArchiveOf(identifier), archive);
     }
-    void leaveLetter(const std::string& identifier = kA) const {
+    void leaveLetter(const std::string& identifier = kAtlas) const {
         leave(identifier, ZipBuilder()
                               .add({zipDirectory("Documents/"),
                                     zipFile("Documents/letter", "of " + identifier)})
                               .bytes());
     }
     void writeData(const std::string& name, const std::string& contents) const {
-        const std::string path = Device::dataPath(kA) + "/" + name;
+        const std::string path = Device::dataPath(kAtlas) + "/" + name;
         fs::create_directories(fs::path(rootPath(path)).parent_path());
         write(path, contents);
     }
-    [[nodiscard]] std::string letterOf(const std::string& identifier = kA) const {
+    [[nodiscard]] std::string letterOf(const std::string& identifier = kAtlas) const {
         return read(Device::dataPath(identifier) + "/Documents/letter");
     }
-    [[nodiscard]] bool waits(const std::string& identifier = kA) const {
+    [[nodiscard]] bool waits(const std::string& identifier = kAtlas) const {
         return exists(restoreArchiveOf(identifier));
     }
 };
 
 TEST_F(RestoreDataTest, comesBackWithTheInstall) {
     leaveLetter();
-    EXPECT_TRUE(succeeded(install(kA)));
-    EXPECT_EQ(letterOf(), "of com.example.a");
+    EXPECT_TRUE(succeeded(install(kAtlas)));
+    EXPECT_EQ(letterOf(), "of com.example.atlas");
     EXPECT_FALSE(waits()) << "it is restored once";
     EXPECT_TRUE(!exists(std::string(kUnpackedDataDirectory)) ||
                 fs::is_empty(rootPath(kUnpackedDataDirectory)));
@@ -56,16 +54,16 @@ TEST_F(RestoreDataTest, comesBackWithTheInstall) {
 TEST_F(RestoreDataTest, takesThePlaceOfWhatWasThere) {
     writeData("Documents/newer", "newer");
     leaveLetter();
-    EXPECT_TRUE(succeeded(install(kA)));
-    EXPECT_EQ(letterOf(), "of com.example.a");
-    EXPECT_FALSE(exists(Device::dataPath(kA) + "/Documents/newer"));
+    EXPECT_TRUE(succeeded(install(kAtlas)));
+    EXPECT_EQ(letterOf(), "of com.example.atlas");
+    EXPECT_FALSE(exists(Device::dataPath(kAtlas) + "/Documents/newer"));
 }
 
 TEST_F(RestoreDataTest, isLeftAloneWhereThereIsNoArchive) {
     writeData("kept", "kept");
     leaveLetter("com.example.b");
-    EXPECT_TRUE(succeeded(install(kA)));
-    EXPECT_EQ(read(Device::dataPath(kA) + "/kept"), "kept");
+    EXPECT_TRUE(succeeded(install(kAtlas)));
+    EXPECT_EQ(read(Device::dataPath(kAtlas) + "/kept"), "kept");
     EXPECT_TRUE(waits("com.example.b"));
 }
 
@@ -76,14 +74,14 @@ TEST_F(RestoreDataTest, thatCannotBeUsedFailsTheInstallAndLeavesTheDataAsItWas) 
     const std::vector<std::string> archives = {"no archive", "", ZipBuilder().add(damaged).bytes(),
                                                ZipBuilder().add(zipFile("../escape", "2")).bytes()};
     for (const std::string& archive : archives) {
-        leave(kA, archive);
-        const Status installed = install(kA);
+        leave(kAtlas, archive);
+        const Status installed = install(kAtlas);
         ASSERT_FALSE(installed.ok());
         EXPECT_THAT(installed.error().description(),
-                    HasSubstr("the data of com.example.a cannot be restored"));
-        EXPECT_EQ(read(Device::dataPath(kA) + "/kept"), "kept");
-        EXPECT_FALSE(application(kA));
-        EXPECT_FALSE(exists(std::string(kUnpackedDataDirectory) + "/" + kA));
+                    HasSubstr("the data of com.example.atlas cannot be restored"));
+        EXPECT_EQ(read(Device::dataPath(kAtlas) + "/kept"), "kept");
+        EXPECT_FALSE(application(kAtlas));
+        EXPECT_FALSE(exists(std::string(kUnpackedDataDirectory) + "/" + kAtlas));
         EXPECT_TRUE(waits());
     }
     EXPECT_FALSE(exists("/var/mobile/tmp/escape"));
@@ -91,22 +89,22 @@ TEST_F(RestoreDataTest, thatCannotBeUsedFailsTheInstallAndLeavesTheDataAsItWas) 
 
 TEST_F(RestoreDataTest, isUnpackedAgainAfterAnInstallThatWasCutOff) {
     leaveLetter();
-    fs::create_directories(rootPath(std::string(kUnpackedDataDirectory) + "/" + kA));
-    write(std::string(kUnpackedDataDirectory) + "/" + kA + "/half", "half of it");
-    EXPECT_TRUE(succeeded(install(kA)));
-    EXPECT_EQ(letterOf(), "of com.example.a");
-    EXPECT_FALSE(exists(Device::dataPath(kA) + "/half"));
+    fs::create_directories(rootPath(std::string(kUnpackedDataDirectory) + "/" + kAtlas));
+    write(std::string(kUnpackedDataDirectory) + "/" + kAtlas + "/half", "half of it");
+    EXPECT_TRUE(succeeded(install(kAtlas)));
+    EXPECT_EQ(letterOf(), "of com.example.atlas");
+    EXPECT_FALSE(exists(Device::dataPath(kAtlas) + "/half"));
 }
 
 TEST_F(RestoreDataTest, goesWithTheRemovalOfItsPlaceholder) {
-    EXPECT_TRUE(succeeded(installPlaceholder(kA, kInstallTypeRestore)));
+    EXPECT_TRUE(succeeded(installPlaceholder(kAtlas, kInstallTypeRestore)));
     leaveLetter();
-    EXPECT_TRUE(succeeded(device().registry().uninstallApplication(kA, {})));
+    EXPECT_TRUE(succeeded(device().registry().uninstallApplication(kAtlas, {})));
     EXPECT_FALSE(waits());
 }
 
 TEST_F(RestoreDataTest, ofAnInstalledApplicationAndWhatIsNoneGoWithTheNextSession) {
-    EXPECT_TRUE(succeeded(install(kA)));
+    EXPECT_TRUE(succeeded(install(kAtlas)));
     close();
     leaveLetter();
     leaveLetter("com.example.b");

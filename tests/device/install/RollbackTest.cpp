@@ -12,8 +12,6 @@ namespace {
 
 namespace fs = std::filesystem;
 
-constexpr const char* kAtlas = "com.example.atlas";
-constexpr const char* kBrook = "com.example.brook";
 constexpr std::uint64_t kMoreThanThereIs = std::numeric_limits<std::uint64_t>::max();
 
 class RollbackTest : public DeviceFixture {

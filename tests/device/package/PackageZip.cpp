@@ -13,7 +13,7 @@ void put(std::string& bytes, std::uint64_t value, std::size_t count) {
     for (std::size_t i = 0; i < count; ++i) bytes += static_cast<char>(value >> (8U * i) & 0xffU);
 }
 
-std::uint32_t crcOf(std::string_view bytes) {
+std::uint32_t crcOfText(std::string_view bytes) {
     std::uint32_t crc = 0xffffffff;
     for (const char character : bytes) {
         crc ^= static_cast<unsigned char>(character);
@@ -72,7 +72,7 @@ std::string extraOf(const ZipEntry& entry) {
     put(extra, 0x7075, 2);
     put(extra, 5 + entry.unicodeName->size(), 2);
     put(extra, 1, 1);
-    put(extra, crcOf(entry.name), 4);
+    put(extra, crcOfText(entry.name), 4);
     return extra + *entry.unicodeName;
 }
 
@@ -98,7 +98,9 @@ void putShared(std::string& header, std::uint16_t flags, const Claims& claims, s
     put(header, extraSize, 2);
 }
 
-std::uint32_t crcClaim(const ZipEntry& entry) { return entry.crc.value_or(crcOf(entry.contents)); }
+std::uint32_t crcClaim(const ZipEntry& entry) {
+    return entry.crc.value_or(crcOfText(entry.contents));
+}
 
 std::string localHeader(const ZipEntry& entry, std::size_t packedSize, std::uint32_t size) {
     const std::string& name = entry.localName ? *entry.localName : entry.name;
@@ -153,7 +155,7 @@ ZipEntry zipStreamed(ZipEntry entry, ZipDescriptorForm form) {
     entry.localCrc = entry.localPackedSize = entry.localSize = 0;
     const std::size_t width = form.isLarge ? 8 : 4;
     entry.descriptor = form.hasSignature ? "PK\7\10" : "";
-    put(entry.descriptor, crcOf(entry.contents), 4);
+    put(entry.descriptor, crcOfText(entry.contents), 4);
     put(entry.descriptor, entry.packed.value_or(entry.contents).size(), width);
     put(entry.descriptor, entry.contents.size(), width);
     return entry;

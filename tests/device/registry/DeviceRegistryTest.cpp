@@ -7,10 +7,6 @@
 namespace appsync {
 namespace {
 
-constexpr const char* kAtlas = "com.example.atlas";
-constexpr const char* kBrook = "com.example.brook";
-constexpr const char* kCrane = "com.example.crane";
-
 std::vector<std::string> identifiersOf(const std::vector<AppProxy>& proxies) {
     std::vector<std::string> identifiers;
     for (const AppProxy& proxy : proxies) identifiers.push_back(proxy.applicationIdentifier);

@@ -10,10 +10,6 @@
 namespace appsync {
 namespace {
 
-constexpr const char* kAtlas = "com.example.atlas";
-constexpr const char* kBrook = "com.example.brook";
-constexpr const char* kCrane = "com.example.crane";
-
 class DeviceHomeScreenTest : public DevicePlatformFixture {
   protected:
     HomeScreenService& screen() { return platform().homeScreen; }

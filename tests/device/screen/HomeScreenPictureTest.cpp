@@ -10,8 +10,6 @@ namespace appsync {
 
 namespace {
 
-constexpr Color kRed = {1, 0, 0};
-constexpr std::uint32_t kOpaqueRed = 0xffff0000;
 // A place inside the first icon, away from its middle, and the same in the one to its right.
 constexpr int kFirstX = 60;
 constexpr int kSecondX = kFirstX + 152;

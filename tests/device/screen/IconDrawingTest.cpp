@@ -13,9 +13,6 @@ namespace appsync {
 
 namespace {
 
-constexpr Color kRed = {1, 0, 0};
-constexpr std::uint32_t kOpaqueRed = 0xffff0000;
-
 TEST(IconDrawingTest, iconsGetTheirSizeAndRoundCorners) {
     for (const int side : {1, 57, 120, 1024}) {
         const Result<Bytes> icon = renderIcon(pngOf(side, side, kRed));

@@ -16,7 +16,7 @@ void putBigEndian(Bytes& bytes, std::size_t offset, std::uint32_t value) {
     }
 }
 
-std::uint32_t crcOf(ByteView bytes) {
+std::uint32_t crcOfChunk(ByteView bytes) {
     std::uint32_t crc = 0xffffffff;
     for (const std::uint8_t byte : bytes) {
         crc ^= byte;
@@ -53,7 +53,7 @@ Bytes pngOf(int width, int height, const Color& color) {
 Bytes claimingSize(Bytes png, std::uint32_t width, std::uint32_t height) {
     putBigEndian(png, 16, width);
     putBigEndian(png, 20, height);
-    putBigEndian(png, 29, crcOf(ByteView(png).subspan(12, 17)));
+    putBigEndian(png, 29, crcOfChunk(ByteView(png).subspan(12, 17)));
     return png;
 }
 

@@ -9,6 +9,10 @@
 
 namespace appsync {
 
+inline constexpr Color kRed = {1, 0, 0};
+/// What a pixel of it is.
+inline constexpr std::uint32_t kOpaqueRed = 0xffff0000;
+
 /// A PNG of one colour.
 [[nodiscard]] Bytes pngOf(int width, int height, const Color& color);
 

@@ -9,9 +9,6 @@
 namespace appsync {
 namespace {
 
-constexpr const char* kAtlas = "com.example.atlas";
-constexpr const char* kBrook = "com.example.brook";
-
 class DeviceServicesTest : public DevicePlatformFixture {};
 
 TEST_F(DeviceServicesTest, aPolicyIsReadAnewAtEachAsk) {

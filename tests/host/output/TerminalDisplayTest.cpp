@@ -31,7 +31,7 @@ SyncEvent failed(const std::string& identifier) {
     return of(SyncEventKind::Ended, SyncPhase::Install, identifier, 0, SyncState::Failed);
 }
 
-SyncEvent installed(const std::string& identifier) {
+SyncEvent installedEvent(const std::string& identifier) {
     return of(SyncEventKind::Ended, SyncPhase::Install, identifier, 1024, SyncState::Finished);
 }
 
@@ -86,7 +86,7 @@ TEST_F(TerminalDisplayTest, OneBarIsOfTheWholeAndTheOthersOfWhatIsActive) {
 TEST_F(TerminalDisplayTest, WhatEndsWellGoesAwayAndWhatFailsStays) {
     display.expect({2, 0});
     drawnAfter(installing("com.a"));
-    EXPECT_THAT(drawnAfter(installed("com.a")), Not(HasSubstr("com.a")));
+    EXPECT_THAT(drawnAfter(installedEvent("com.a")), Not(HasSubstr("com.a")));
     drawnAfter(installing("com.b"));
     now += 100ms;
     display.show(failed("com.b"));

@@ -17,7 +17,7 @@ using testing::HasSubstr;
 using testing::IsEmpty;
 using testing::Not;
 
-PropertyList entry(const std::string& identifier, const char* operation) {
+PropertyList stagedEntry(const std::string& identifier, const char* operation) {
     return PropertyList::map({{"identifier", identifier}, {"operation", operation}});
 }
 
@@ -52,10 +52,11 @@ class InterruptedStaging : public HostFixture {
 
 TEST_F(InterruptedStaging, TheSameCommandDoesWhatIsLeft) {
     for (const char* each : {"com.a", "com.b", "com.c", "com.d"}) addPackage(each, "1");
-    interrupt(PropertyList::array({entry("com.a", "install"), entry("com.b", "install"),
-                                   entry("com.c", "install"), entry("com.d", "install")}),
-              PropertyList::array({entry("com.a", "INSTALLED"), entry("com.b", "DOWNLOADED"),
-                                   entry("com.c", "install"), entry("com.d", "FAILED")}));
+    interrupt(
+        PropertyList::array({stagedEntry("com.a", "install"), stagedEntry("com.b", "install"),
+                             stagedEntry("com.c", "install"), stagedEntry("com.d", "install")}),
+        PropertyList::array({stagedEntry("com.a", "INSTALLED"), stagedEntry("com.b", "DOWNLOADED"),
+                             stagedEntry("com.c", "install"), stagedEntry("com.d", "FAILED")}));
     EXPECT_EQ(run({"plan", device, library, "--staged", "--json"}), 0);
     EXPECT_THAT(out.str(), Not(HasSubstr("\"com.a\"")));
     EXPECT_THAT(out.str(), HasSubstr("takes up the session that was interrupted"));
@@ -68,8 +69,8 @@ TEST_F(InterruptedStaging, TheSameCommandDoesWhatIsLeft) {
 
 TEST_F(InterruptedStaging, WhatWasInstalledWithoutANoteIsNotSentAgain) {
     addPackage("com.a", "1");
-    interrupt(PropertyList::array({entry("com.a", "install")}),
-              PropertyList::array({entry("com.a", "DOWNLOADED")}));
+    interrupt(PropertyList::array({stagedEntry("com.a", "install")}),
+              PropertyList::array({stagedEntry("com.a", "DOWNLOADED")}));
     EXPECT_EQ(run({"send", device, "com.a", library + "/com.a.zip"}), 0);
     EXPECT_EQ(sync({"--staged"}), 0);
     EXPECT_THAT(out.str(), HasSubstr("\"requested\": []"));
@@ -78,8 +79,9 @@ TEST_F(InterruptedStaging, WhatWasInstalledWithoutANoteIsNotSentAgain) {
 TEST_F(InterruptedStaging, ARemovalThatWasFollowedByItsInstallIsNotDoneAgain) {
     addPackage("com.a", "1");
     EXPECT_EQ(sync(), 0);
-    interrupt(PropertyList::array({entry("com.a", "remove"), entry("com.a", "install")}),
-              PropertyList::array({entry("com.a", "INSTALLED"), entry("com.a", "install")}));
+    interrupt(
+        PropertyList::array({stagedEntry("com.a", "remove"), stagedEntry("com.a", "install")}),
+        PropertyList::array({stagedEntry("com.a", "INSTALLED"), stagedEntry("com.a", "install")}));
     EXPECT_EQ(sync({"--staged"}), 0);
     EXPECT_THAT(out.str(), HasSubstr("\"removed\": []"));
     EXPECT_THAT(out.str(), HasSubstr("\"requested\": []"));
@@ -89,26 +91,26 @@ TEST_F(InterruptedStaging, ARemovalThatWasFollowedByItsInstallIsNotDoneAgain) {
 TEST_F(InterruptedStaging, AnAreaThatWaitsComesBeforeIt) {
     addPackage("com.a", "1");
     addPackage("com.b", "1");
-    interrupt(PropertyList::array({entry("com.a", "install")}),
-              PropertyList::array({entry("com.a", "install")}));
-    stage(PropertyList::array({entry("com.b", "install")}));
+    interrupt(PropertyList::array({stagedEntry("com.a", "install")}),
+              PropertyList::array({stagedEntry("com.a", "install")}));
+    stage(PropertyList::array({stagedEntry("com.b", "install")}));
     EXPECT_EQ(sync({"--staged"}), 0);
     EXPECT_THAT(applications(), ElementsAre("com.b 1"));
     EXPECT_FALSE(isLeft());
 }
 
 TEST_F(InterruptedStaging, AListThatSomebodyHasChangedIsNotTakenUp) {
-    interrupt(PropertyList::array({entry("com.a", "install")}),
-              PropertyList::array({entry("com.b", "install")}));
+    interrupt(PropertyList::array({stagedEntry("com.a", "install")}),
+              PropertyList::array({stagedEntry("com.b", "install")}));
     EXPECT_FALSE(isLeft());
-    interrupt(PropertyList::array({entry("com.a", "install")}), PropertyList::array({}));
+    interrupt(PropertyList::array({stagedEntry("com.a", "install")}), PropertyList::array({}));
     EXPECT_FALSE(isLeft());
     EXPECT_EQ(sync({"--staged"}), 0);
 }
 
 TEST_F(InterruptedStaging, ForgettingEverythingForgetsItToo) {
-    interrupt(PropertyList::array({entry("com.a", "install")}),
-              PropertyList::array({entry("com.a", "install")}));
+    interrupt(PropertyList::array({stagedEntry("com.a", "install")}),
+              PropertyList::array({stagedEntry("com.a", "install")}));
     EXPECT_TRUE(isLeft());
     EXPECT_EQ(run({"reset", device}), 0);
     EXPECT_FALSE(isLeft());
@@ -116,11 +118,11 @@ TEST_F(InterruptedStaging, ForgettingEverythingForgetsItToo) {
 
 TEST_F(InterruptedStaging, ASyncOfTheLibrarySaysThatItGivesUpWhatAHostHasStaged) {
     addPackage("com.a", "1");
-    interrupt(PropertyList::array({entry("com.b", "install")}),
-              PropertyList::array({entry("com.b", "install")}));
+    interrupt(PropertyList::array({stagedEntry("com.b", "install")}),
+              PropertyList::array({stagedEntry("com.b", "install")}));
     EXPECT_EQ(run({"plan", device, library}), 0);
     EXPECT_THAT(out.str(), HasSubstr("interrupted sync --staged"));
-    stage(PropertyList::array({entry("com.b", "install")}));
+    stage(PropertyList::array({stagedEntry("com.b", "install")}));
     EXPECT_EQ(sync(), 0);
     EXPECT_THAT(err.str(), HasSubstr("the staging area that waits on the device is given up"));
     EXPECT_THAT(applications(), ElementsAre("com.a 1"));
@@ -158,8 +160,8 @@ TEST_F(InterruptedStaging, APlanOfAStagingAreaKnowsPackagesThatAreNamedByIdentif
     addPackage("com.a", "1");
     std::filesystem::copy(library + "/com.a.zip", library + "/com.x.zip");
     write(library + "/com.y.zip", "no package");
-    stage(PropertyList::array({entry("com.a", "install"), entry("com.x", "install"),
-                               entry("com.y", "install"), entry("com.z", "install")}));
+    stage(PropertyList::array({stagedEntry("com.a", "install"), stagedEntry("com.x", "install"),
+                               stagedEntry("com.y", "install"), stagedEntry("com.z", "install")}));
     EXPECT_EQ(run({"plan", device, library, "--staged"}), 1);
     EXPECT_THAT(out.str(), HasSubstr("install  com.a 1"));
     EXPECT_THAT(out.str(), HasSubstr("failed   com.x: " + library + "/com.x.zip is a package of"));

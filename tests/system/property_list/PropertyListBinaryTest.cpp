@@ -10,7 +10,7 @@ namespace {
 using namespace std::string_literals;
 using namespace std::string_view_literals;
 
-std::string problem(const Bytes& bytes) {
+std::string binaryProblem(const Bytes& bytes) {
     const std::string all = refusal(bytes);
     const std::string_view prefix = "binary property list, ";
     return all.starts_with(prefix) ? all.substr(prefix.size()) : all;
@@ -133,7 +133,7 @@ TEST(BinaryPropertyListReader, RefusesAKeyThatIsRepeatedAfterMapsWithTheSameKeys
                                 "b")
                             .add("\x09")
                             .bytes();
-    EXPECT_EQ(problem(bytes), "offset 18: expected a key that the map does not have yet");
+    EXPECT_EQ(binaryProblem(bytes), "offset 18: expected a key that the map does not have yet");
 }
 
 TEST(BinaryPropertyListReader, RefusesTheGreatestReferenceAsAKey) {
@@ -143,7 +143,7 @@ TEST(BinaryPropertyListReader, RefusesTheGreatestReferenceAsAKey) {
             .add("\xD1" + BinaryList::number(UINT64_MAX, 8) + BinaryList::number(1, 8))
             .add("\x09")
             .bytes();
-    EXPECT_EQ(problem(bytes).substr(0, 10), "offset 9: ");
+    EXPECT_EQ(binaryProblem(bytes).substr(0, 10), "offset 9: ");
 }
 
 TEST(BinaryPropertyListReader, RefusesOtherVersions) {
@@ -160,7 +160,7 @@ TEST(BinaryPropertyListReader, KeepsFractionsOfTheSecondsOfDates) {
 
 TEST(BinaryPropertyListReader, RefusesDatesThatAreNoPointInTime) {
     for (const std::string_view bits : {"\x7f\xf8"sv, "\xff\xf8"sv, "\x7f\xf0"sv, "\xff\xf0"sv}) {
-        EXPECT_EQ(problem(single("\x33" + std::string(bits) + std::string(6, '\0'))),
+        EXPECT_EQ(binaryProblem(single("\x33" + std::string(bits) + std::string(6, '\0'))),
                   "offset 8: expected a date, found one that is no point in time");
     }
 }
@@ -180,86 +180,89 @@ TEST(BinaryPropertyListReader, RefusesObjectsThatAreNoValues) {
     const std::string expected =
         "offset 8: expected a value (boolean, integer, real, date, data, string, array or map), "
         "found an object of kind ";
-    EXPECT_EQ(problem(single("\0"s)), expected + "0");
-    EXPECT_EQ(problem(single("\x0F")), expected + "15");
-    EXPECT_EQ(problem(single("\x80\x01")), expected + "128");
-    EXPECT_EQ(problem(single("\xC0")), expected + "192");
-    EXPECT_EQ(problem(single("\xFF")), expected + "255");
-    EXPECT_EQ(problem(single("\x15")), "offset 8: expected an integer of 1, 2, 4, 8 or 16 bytes");
-    EXPECT_EQ(problem(single("\x21\x00\x00"s)), "offset 8: expected a real number of 4 or 8 bytes");
+    EXPECT_EQ(binaryProblem(single("\0"s)), expected + "0");
+    EXPECT_EQ(binaryProblem(single("\x0F")), expected + "15");
+    EXPECT_EQ(binaryProblem(single("\x80\x01")), expected + "128");
+    EXPECT_EQ(binaryProblem(single("\xC0")), expected + "192");
+    EXPECT_EQ(binaryProblem(single("\xFF")), expected + "255");
+    EXPECT_EQ(binaryProblem(single("\x15")),
+              "offset 8: expected an integer of 1, 2, 4, 8 or 16 bytes");
+    EXPECT_EQ(binaryProblem(single("\x21\x00\x00"s)),
+              "offset 8: expected a real number of 4 or 8 bytes");
 }
 
 TEST(BinaryPropertyListReader, RefusesIntegersAbove64Bits) {
-    EXPECT_EQ(problem(single("\x14" + BinaryList::number(1, 8) + BinaryList::number(0, 8))),
+    EXPECT_EQ(binaryProblem(single("\x14" + BinaryList::number(1, 8) + BinaryList::number(0, 8))),
               "offset 8: expected an integer of at most 64 bits");
-    EXPECT_EQ(
-        problem(single("\x14" + BinaryList::number(UINT64_MAX, 8) + BinaryList::number(0, 8))),
-        "offset 8: expected an integer of at most 64 bits");
+    EXPECT_EQ(binaryProblem(
+                  single("\x14" + BinaryList::number(UINT64_MAX, 8) + BinaryList::number(0, 8))),
+              "offset 8: expected an integer of at most 64 bits");
 }
 
 TEST(BinaryPropertyListReader, RefusesClaimsBeyondTheInput) {
-    EXPECT_EQ(problem(single("\x13\x00"s)),
+    EXPECT_EQ(binaryProblem(single("\x13\x00"s)),
               "offset 9: expected 8 more bytes before the offset table, found 1");
-    EXPECT_EQ(problem(single("\x33")),
+    EXPECT_EQ(binaryProblem(single("\x33")),
               "offset 9: expected 8 more bytes before the offset table, found 0");
-    EXPECT_EQ(problem(single("\x55"
-                             "abc")),
+    EXPECT_EQ(binaryProblem(single("\x55"
+                                   "abc")),
               "offset 8: expected a count that 3 bytes before the offset table can hold, found 5");
-    EXPECT_EQ(problem(single("\x4F\x13" + BinaryList::number(UINT64_MAX, 8))),
+    EXPECT_EQ(binaryProblem(single("\x4F\x13" + BinaryList::number(UINT64_MAX, 8))),
               "offset 8: expected a count that 0 bytes before the offset table can hold, found "
               "18446744073709551615");
-    EXPECT_EQ(problem(single("\x6F\x13" + BinaryList::number(std::uint64_t{1} << 63U, 8))),
+    EXPECT_EQ(binaryProblem(single("\x6F\x13" + BinaryList::number(std::uint64_t{1} << 63U, 8))),
               "offset 8: expected a count that 0 bytes before the offset table can hold, found "
               "9223372036854775808");
-    EXPECT_EQ(problem(single("\xDF\x12\x7F\xFF\xFF\xFF")),
+    EXPECT_EQ(binaryProblem(single("\xDF\x12\x7F\xFF\xFF\xFF")),
               "offset 8: expected a count that 0 bytes before the offset table can hold, found "
               "2147483647");
-    EXPECT_EQ(problem(single("\xAF\x09")),
+    EXPECT_EQ(binaryProblem(single("\xAF\x09")),
               "offset 9: expected a count, an integer of 1, 2, 4 or 8 bytes");
-    EXPECT_EQ(problem(single("\xAF")),
+    EXPECT_EQ(binaryProblem(single("\xAF")),
               "offset 9: expected 1 more bytes before the offset table, found 0");
 }
 
 TEST(BinaryPropertyListReader, RefusesTextsInTheWrongEncoding) {
-    EXPECT_EQ(problem(single("\x53"
-                             "a\xC3\xBC")),
+    EXPECT_EQ(binaryProblem(single("\x53"
+                                   "a\xC3\xBC")),
               "offset 10: expected an ASCII character");
-    EXPECT_EQ(problem(single("\x62\x00\x61\xD8\x3D"s)),
+    EXPECT_EQ(binaryProblem(single("\x62\x00\x61\xD8\x3D"s)),
               "offset 11: expected UTF-16, found half of a surrogate pair");
-    EXPECT_EQ(problem(single("\x62\xDE\x00\xD8\x3D"s)),
+    EXPECT_EQ(binaryProblem(single("\x62\xDE\x00\xD8\x3D"s)),
               "offset 9: expected UTF-16, found half of a surrogate pair");
-    EXPECT_EQ(problem(single("\x62\xD8\x3D\x00\x61"s)),
+    EXPECT_EQ(binaryProblem(single("\x62\xD8\x3D\x00\x61"s)),
               "offset 9: expected UTF-16, found half of a surrogate pair");
 }
 
 TEST(BinaryPropertyListReader, RefusesReferencesThatLeadNowhere) {
-    EXPECT_EQ(problem(BinaryList().add("\xA1\x05").bytes()),
+    EXPECT_EQ(binaryProblem(BinaryList().add("\xA1\x05").bytes()),
               "offset 9: expected the number of an object below 1, found 5");
-    EXPECT_EQ(problem(BinaryList().add("\x09").top(1).bytes()),
+    EXPECT_EQ(binaryProblem(BinaryList().add("\x09").top(1).bytes()),
               "offset 27: expected the number of an object below 1, found 1");
     EXPECT_EQ(
-        problem(BinaryList().add("\x09").offsetOf(0, 7).bytes()),
+        binaryProblem(BinaryList().add("\x09").offsetOf(0, 7).bytes()),
         "offset 9: expected the offset of an object, between the header and the offset table, "
         "found 7");
     EXPECT_EQ(
-        problem(BinaryList().add("\x09").offsetOf(0, 9).bytes()),
+        binaryProblem(BinaryList().add("\x09").offsetOf(0, 9).bytes()),
         "offset 9: expected the offset of an object, between the header and the offset table, "
         "found 9");
 }
 
 TEST(BinaryPropertyListReader, RefusesATrailerThatDoesNotFit) {
-    EXPECT_EQ(problem(bytesOf("bplist00")), "offset 8: expected at least 42 bytes, found the end");
+    EXPECT_EQ(binaryProblem(bytesOf("bplist00")),
+              "offset 8: expected at least 42 bytes, found the end");
     EXPECT_EQ(
-        problem(BinaryList().add("\x09").objectCount(2).bytes()),
+        binaryProblem(BinaryList().add("\x09").objectCount(2).bytes()),
         "offset 19: expected the number of objects, one for each 2 bytes of the offset table");
     EXPECT_EQ(
-        problem(BinaryList().add("\x09").objectCount(UINT64_MAX / 2).bytes()),
+        binaryProblem(BinaryList().add("\x09").objectCount(UINT64_MAX / 2).bytes()),
         "offset 19: expected the number of objects, one for each 2 bytes of the offset table");
     Bytes bytes = single("\x09");
     const auto with = [&bytes](std::size_t at, std::uint8_t value) {
         Bytes changed = bytes;
         changed[at] = value;
-        return problem(changed);
+        return binaryProblem(changed);
     };
     EXPECT_EQ(with(17, 0), "offset 17: expected the width of an offset, 1 to 8");
     EXPECT_EQ(with(17, 9), "offset 17: expected the width of an offset, 1 to 8");
@@ -273,28 +276,28 @@ TEST(BinaryPropertyListReader, RefusesATrailerThatDoesNotFit) {
 }
 
 TEST(BinaryPropertyListReader, RefusesKeysThatAreNoStringsOrEqual) {
-    EXPECT_EQ(problem(BinaryList().add("\xD1\x01\x01").add("\x09").bytes()),
+    EXPECT_EQ(binaryProblem(BinaryList().add("\xD1\x01\x01").add("\x09").bytes()),
               "offset 11: expected a string, the key of an entry");
-    EXPECT_EQ(problem(BinaryList()
-                          .add("\xD2\x01\x02\x03\x03")
-                          .add("\x51"
-                               "a")
-                          .add("\x51"
-                               "a")
-                          .add("\x09")
-                          .bytes()),
+    EXPECT_EQ(binaryProblem(BinaryList()
+                                .add("\xD2\x01\x02\x03\x03")
+                                .add("\x51"
+                                     "a")
+                                .add("\x51"
+                                     "a")
+                                .add("\x09")
+                                .bytes()),
               "offset 10: expected a key that the map does not have yet");
 }
 
 TEST(BinaryPropertyListReader, RefusesContainersInsideThemselves) {
-    EXPECT_EQ(problem(BinaryList().add("\xA1\x00"s).bytes()),
+    EXPECT_EQ(binaryProblem(BinaryList().add("\xA1\x00"s).bytes()),
               "offset 8: expected a container that is not inside itself");
-    EXPECT_EQ(problem(BinaryList()
-                          .add("\xA1\x01")
-                          .add("\xD1\x02\x00"s)
-                          .add("\x51"
-                               "a")
-                          .bytes()),
+    EXPECT_EQ(binaryProblem(BinaryList()
+                                .add("\xA1\x01")
+                                .add("\xD1\x02\x00"s)
+                                .add("\x51"
+                                     "a")
+                                .bytes()),
               "offset 8: expected a container that is not inside itself");
 }
 
@@ -323,14 +326,15 @@ BinaryList chain(std::size_t depth, std::string_view reference) {
 
 TEST(BinaryPropertyListReader, EndsAtADepthOf128) {
     EXPECT_EQ(*parse(chain(128, "+").bytes()), nestedArrays(128));
-    EXPECT_EQ(problem(chain(129, "+").bytes()),
+    EXPECT_EQ(binaryProblem(chain(129, "+").bytes()),
               "offset 264: expected at most 128 containers in one another");
 }
 
 TEST(BinaryPropertyListReader, DoesNotExpandABillionLaughs) {
     const std::string expected = "expected no more values than an input of this size can hold";
-    EXPECT_NE(problem(chain(30, "++").bytes()).find(expected), std::string::npos);
-    EXPECT_NE(problem(chain(128, "++++++++++++++").bytes()).find(expected), std::string::npos);
+    EXPECT_NE(binaryProblem(chain(30, "++").bytes()).find(expected), std::string::npos);
+    EXPECT_NE(binaryProblem(chain(128, "++++++++++++++").bytes()).find(expected),
+              std::string::npos);
 }
 
 TEST(BinaryPropertyListReader, SharesLongTextsInMemory) {
@@ -360,8 +364,8 @@ TEST(BinaryPropertyListReader, RefusesTextsThatOverlapToSeemMore) {
     list.add(references).add(object);
     for (int i = 1; i < 200; ++i) list.add("");
     for (std::size_t i = 0; i < 200; ++i) list.offsetOf(i + 1, 8 + references.size() + i * 4);
-    EXPECT_NE(problem(list.bytes()).find("expected "), std::string::npos);
-    EXPECT_NE(problem(list.bytes()).find("do not overlap"), std::string::npos);
+    EXPECT_NE(binaryProblem(list.bytes()).find("expected "), std::string::npos);
+    EXPECT_NE(binaryProblem(list.bytes()).find("do not overlap"), std::string::npos);
 }
 
 TEST(BinaryPropertyListErrors, CarryTheOffsetForPrograms) {

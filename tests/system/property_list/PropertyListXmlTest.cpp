@@ -19,7 +19,7 @@ PropertyList content(std::string_view value) {
 }
 
 /// The refusal of a document around this value, whose text begins in line 2.
-std::string problem(std::string_view value) {
+std::string xmlProblem(std::string_view value) {
     const std::string all = refusal(xml(value));
     const std::string_view prefix = "XML property list, ";
     return all.starts_with(prefix) ? all.substr(prefix.size()) : all;
@@ -118,7 +118,7 @@ TEST(XmlPropertyListDates, AreReadStrictly) {
           "0000-01-01T00:00:00Z", "2001-01-01T00:00:00", "2001-01-01 00:00:00Z", "2001-01-01",
           "01-01-01T00:00:00Z", "2001-01-01T00:00:00.Z", "2001-01-01T00:00:09.25Z",
           "2001-01-01T00:00:00+0", "", "x"}) {
-        EXPECT_NE(problem("<date>" + bad + "</date>").find("expected a date"), std::string::npos)
+        EXPECT_NE(xmlProblem("<date>" + bad + "</date>").find("expected a date"), std::string::npos)
             << bad;
     }
 }
@@ -132,11 +132,11 @@ TEST(XmlPropertyListIntegers, AreReadInEveryForm) {
 }
 
 TEST(XmlPropertyListIntegers, AreRefusedWhereTheyGoWrong) {
-    EXPECT_EQ(problem("<integer>12a</integer>"),
+    EXPECT_EQ(xmlProblem("<integer>12a</integer>"),
               "line 2, column 12: expected an integer of at most 64 bits");
     for (const std::string bad : {"18446744073709551616", "-9223372036854775809", "", "-", "--1",
                                   "1 2", "1.0", "0x", "0xg", "1e3"}) {
-        EXPECT_NE(problem("<integer>" + bad + "</integer>").find("expected an integer"),
+        EXPECT_NE(xmlProblem("<integer>" + bad + "</integer>").find("expected an integer"),
                   std::string::npos)
             << bad;
     }
@@ -149,9 +149,10 @@ TEST(XmlPropertyListReals, AreReadInEveryForm) {
     EXPECT_EQ(content("<real>+infinity</real>"), PropertyList(infinity));
     EXPECT_EQ(content("<real>-INF</real>"), PropertyList(-infinity));
     EXPECT_EQ(content("<real>nan</real>"), PropertyList(std::numeric_limits<double>::quiet_NaN()));
-    EXPECT_EQ(problem("<real>1.5x</real>"), "line 2, column 10: expected a number");
+    EXPECT_EQ(xmlProblem("<real>1.5x</real>"), "line 2, column 10: expected a number");
     for (const std::string bad : {"", "x", "1e999", "--1", "+-1", "1,5", "0x10"}) {
-        EXPECT_NE(problem("<real>" + bad + "</real>").find("expected a number"), std::string::npos)
+        EXPECT_NE(xmlProblem("<real>" + bad + "</real>").find("expected a number"),
+                  std::string::npos)
             << bad;
     }
 }
@@ -164,11 +165,11 @@ TEST(XmlPropertyListData, IsReadWithAnyWhiteSpace) {
 }
 
 TEST(XmlPropertyListData, IsRefusedWhereItGoesWrong) {
-    EXPECT_EQ(problem("<data>AQ*D</data>"), "line 2, column 9: expected base64");
-    EXPECT_EQ(problem("<data>AQID\n  AQ</data>"), "line 3, column 5: expected base64");
+    EXPECT_EQ(xmlProblem("<data>AQ*D</data>"), "line 2, column 9: expected base64");
+    EXPECT_EQ(xmlProblem("<data>AQID\n  AQ</data>"), "line 3, column 5: expected base64");
     for (const std::string bad :
          {"A", "AQI", "AQ=", "=", "AQID=", "AQ==AQ==", "AR==", "AQJ=", "A==="}) {
-        EXPECT_NE(problem("<data>" + bad + "</data>").find("expected base64"), std::string::npos)
+        EXPECT_NE(xmlProblem("<data>" + bad + "</data>").find("expected base64"), std::string::npos)
             << bad;
     }
 }
@@ -197,16 +198,16 @@ TEST(XmlPropertyListTexts, HaveTheirReferencesExpanded) {
 }
 
 TEST(XmlPropertyListTexts, RefuseReferencesThatStandForNothing) {
-    EXPECT_EQ(problem("<string>ab&foo;</string>"),
+    EXPECT_EQ(xmlProblem("<string>ab&foo;</string>"),
               "line 2, column 11: expected &lt; &gt; &amp; &quot; &apos; or a reference to a "
               "character that XML can carry");
     for (const std::string bad :
          {"&", "&;", "&#;", "&#x;", "&#0;", "&#1;", "&#xD800;", "&#x110000;", "&#99999999999;",
           "&#xFFFF;", "&#-5;", "&#65", "&lt", "&LT;", "& lt;", "&#X41;", "&#x4g;"}) {
-        EXPECT_NE(problem("<string>" + bad + "</string>").find("column 9: expected &lt;"),
+        EXPECT_NE(xmlProblem("<string>" + bad + "</string>").find("column 9: expected &lt;"),
                   std::string::npos)
             << bad;
-        EXPECT_NE(problem("<dict><key>" + bad + "</key><true/></dict>").find("column 12"),
+        EXPECT_NE(xmlProblem("<dict><key>" + bad + "</key><true/></dict>").find("column 12"),
                   std::string::npos)
             << bad;
     }
@@ -295,12 +296,12 @@ TEST(XmlPropertyListForm, RefusesEverythingOutOfPlace) {
         {"<dict>x<key>a</key><true/></dict>",
          "line 2, column 7: expected <key> or </dict>, found text"},
     };
-    for (const auto& [value, expected] : cases) EXPECT_EQ(problem(value), expected);
+    for (const auto& [value, expected] : cases) EXPECT_EQ(xmlProblem(value), expected);
 }
 
 TEST(XmlPropertyListForm, RefusesEqualKeys) {
-    EXPECT_EQ(problem("<dict><key>a</key><true/><key>b</key><true/>\n"
-                      "<key>&#97;</key><false/></dict>"),
+    EXPECT_EQ(xmlProblem("<dict><key>a</key><true/><key>b</key><true/>\n"
+                         "<key>&#97;</key><false/></dict>"),
               "line 3, column 1: expected a key that the map does not have yet");
 }
 
@@ -321,13 +322,13 @@ TEST(XmlPropertyListForm, RefusesDamagedMarkup) {
 }
 
 TEST(XmlPropertyListForm, RefusesWhatIsNotUtf8AndSaysWhere) {
-    EXPECT_EQ(problem("<string>\u20acx\xFFy</string>"),
+    EXPECT_EQ(xmlProblem("<string>\u20acx\xFFy</string>"),
               "line 2, column 11: expected UTF-8, found a byte that is not");
-    EXPECT_EQ(problem("<string>a\r\rb\x01</string>"),
+    EXPECT_EQ(xmlProblem("<string>a\r\rb\x01</string>"),
               "line 4, column 2: expected a character that XML can carry, found U+0001");
-    EXPECT_EQ(problem(std::string("<string>") + '\0' + "</string>"),
+    EXPECT_EQ(xmlProblem(std::string("<string>") + '\0' + "</string>"),
               "line 2, column 9: expected a character that XML can carry, found U+0000");
-    EXPECT_EQ(problem("<string>" + std::string(100, 'x') + "\xED\xA0\x80</string>"),
+    EXPECT_EQ(xmlProblem("<string>" + std::string(100, 'x') + "\xED\xA0\x80</string>"),
               "line 2, column 109: expected UTF-8, found a byte that is not");
 }
 
@@ -348,16 +349,17 @@ std::string nestedXml(std::size_t depth, std::string_view open, std::string_view
 
 TEST(XmlPropertyListDepth, EndsAt128) {
     EXPECT_EQ(content(nestedXml(128, "<array>", "</array>")), nestedArrays(128));
-    EXPECT_EQ(problem(nestedXml(129, "<array>", "</array>")),
+    EXPECT_EQ(xmlProblem(nestedXml(129, "<array>", "</array>")),
               "line 2, column 897: expected at most 128 containers in one another");
-    EXPECT_EQ(problem(nestedXml(129, "<dict><key>a</key>", "</dict>")),
+    EXPECT_EQ(xmlProblem(nestedXml(129, "<dict><key>a</key>", "</dict>")),
               "line 2, column 2305: expected at most 128 containers in one another");
 }
 
 TEST(XmlPropertyListDepth, AMillionContainersAreRefused) {
-    EXPECT_NE(problem(nestedXml(1'000'000, "<array>", "</array>")).find("at most 128"),
+    EXPECT_NE(xmlProblem(nestedXml(1'000'000, "<array>", "</array>")).find("at most 128"),
               std::string::npos);
-    EXPECT_NE(problem(nestedXml(1'000'000, "<array>", "")).find("still open"), std::string::npos);
+    EXPECT_NE(xmlProblem(nestedXml(1'000'000, "<array>", "")).find("still open"),
+              std::string::npos);
 }
 
 TEST(XmlPropertyListDamage, ADocumentCutOffAnywhereIsRefused) {
