@@ -68,6 +68,7 @@ Session::Session(Device& device, PlugIn& plugIn, SyncEvents& events, SessionFact
       events_(events),
       facts_(facts),
       stopRequested_(stopRequested),
+      log_(plugIn.platform()),
       sender_(device) {}
 
 SessionEnd Session::sync(const Order& order) {
@@ -140,6 +141,8 @@ SessionEnd Session::deliver(const Parcel& parcel) {
         end_.error = ready.error();
         return end_;
     }
+    log_.general(Level::Default, "%s sends %{public}@, which the device has not asked for",
+                 host_.mainBundleIdentifier(), parcel.asset->identifier);
     device_.letCoordinatedInstallsGo();
     client_.prepareForSyncWithHostAnchor(client_.currentSyncAnchor(), ignoreProgress, nullptr);
     facts_.reconciled();

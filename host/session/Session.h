@@ -20,6 +20,7 @@
 #include <string>
 #include <vector>
 
+#include "client/Log.h"
 #include "host/session/PackageSender.h"
 #include "platform/Error.h"
 #include "platform/Result.h"
@@ -109,6 +110,7 @@ class Session {
     SyncEvents& events_;
     SessionFacts& facts_;
     const std::atomic<bool>& stopRequested_;
+    const Log log_;
     PackageSender sender_;
     std::vector<std::string> givenUp_;  // whose transfers have failed for good
     std::set<std::string> takenUp_;     // whose packages an earlier session has delivered

@@ -154,6 +154,10 @@ void TimelineBuilding::addToLane(const TimelineEvent& event) {
             if (!event.version.empty()) lane.version = event.version;
             transfersFreeAt_ = event.at;
             return;
+        case DeliveryBegins:
+            beginSession("send");
+            transfersFreeAt_ = event.at;
+            return;
         case Skipped:
             return endLane(lane, LaneOutcome::Skipped, event);
         case PlaceholderBegins:

@@ -32,6 +32,7 @@ constexpr std::array kMessages = {
                     Asked, 1, 2, 3},
     TimelineMessage{"%s|processing vessik restore info for '%{public}@' demotionStatus :%lu", Asked,
                     1},
+    TimelineMessage{"%s sends %{public}@, which the device has not asked for", DeliveryBegins, 1},
     TimelineMessage{"%s|skipping %{public}@ - its not a restore and app installation is disabled",
                     Skipped, 1, 0, 0, 0, "device policy does not allow installing applications"},
     TimelineMessage{"%s|%{public}@ is currenlty marked as to be ignored for download - skipping",

@@ -25,7 +25,8 @@ enum class TimelineEventKind {
     TransfersEnd,
     SessionEnds,
     // Of one application.
-    Asked,  // with its name and version
+    Asked,           // with its name and version
+    DeliveryBegins,  // the host sends it unasked, in a session of its own
     Skipped,
     PlaceholderBegins,
     PlaceholderEnds,
@@ -62,7 +63,7 @@ struct TimedEvent {
     TimelineEvent event;
 };
 
-/// Which of a message's arguments say what; the first is the plug-in's own identifier.
+/// Which of a message's arguments say what; the first is whose message it is.
 struct TimelineMessage {
     std::string_view format;
     TimelineEventKind kind;

@@ -43,15 +43,16 @@ std::string identifierIn(const LoggedMessage& line) {
     return at < arguments.size() ? arguments[at] : std::string();
 }
 
-/// Puts lines into sessions. Nothing tells that packages are sent unasked: those that are
-/// transferred when a session is over, or when nobody goes on with it, begin another. Of a restore
-/// the last message may be the one on its placeholders.
+/// Puts lines into sessions. Where nothing tells that packages are sent unasked, as in logs of
+/// former versions, those that are transferred when a session is over, or when nobody goes on with
+/// it, begin another. Of a restore the last message may be the one on its placeholders.
 class SessionSorting {
   public:
     void add(const LoggedMessage& line) {
         const TimelineEventKind kind = line.message->kind;
         const bool isTransfer = kind == TransferGoesOn || kind == TransferEnds;
-        if (kind == SyncBegins || kind == RestoreBegins || (isTransfer && isUnasked(line))) {
+        const bool isBegin = kind == SyncBegins || kind == RestoreBegins || kind == DeliveryBegins;
+        if (isBegin || (isTransfer && isUnasked(line))) {
             begin(kind);
         } else if (sessions_.empty() && !isOfSession(kind)) {
             begin(kind);

@@ -2,6 +2,7 @@
 
 import html.parser
 import json
+import os
 import pathlib
 import re
 import signal
@@ -178,6 +179,12 @@ def test_where_nothing_is_both_are_asked_for(appsync, tmp_path):
     assert "neither a device nor a recording" in told and str(tmp_path / "nothing") in told
 
 
+def test_what_is_neither_a_directory_nor_a_file_is_taken_for_a_recording(appsync, tmp_path):
+    os.mkfifo(tmp_path / "fifo")
+    told = appsync("timeline", tmp_path / "fifo", "--out", tmp_path / "out.svg", expect=3).stderr
+    assert "is not a regular file" in told and "device" not in told
+
+
 def test_hostile_messages_in_a_recording_are_drawn_or_left_out(appsync, tmp_path):
     recording = tmp_path / "recording"
     header = {"recording": 1, "plug-in": "1", "process": "p", "bundle": "b", "anonymous": False}
@@ -251,6 +258,17 @@ def test_a_session_that_was_killed_says_so(appsync, tmp_path, library):
     appsync("send", device.path, "com.example.sent", library / "com.example.sent.zip")
     assert lanes(drawn(appsync, tmp_path, device.path)) == {"com.example.sent": "installed"}
     assert list(lanes(drawn(appsync, tmp_path, device.path, "html", "--session", "2"))) == ["com.example.app02"]
+
+
+def test_what_a_killed_sync_was_transferring_is_sent_in_a_session_of_its_own(appsync, tmp_path, library):
+    device = Device(appsync, tmp_path / "device", "off")
+    log = pathlib.Path(device.path) / "log" / "system.log"
+    log.parent.mkdir(exist_ok=True)
+    log.write_text("".join(list(log_of(1))[:3]).replace("com.example.app00000", "com.example.app01"))
+    assert lanes(drawn(appsync, tmp_path, device.path)) == {"com.example.app01": "waits for its turn"}
+    appsync("send", device.path, "com.example.app01", library / "com.example.app01.zip")
+    assert lanes(drawn(appsync, tmp_path, device.path)) == {"com.example.app01": "installed"}
+    assert lanes(drawn(appsync, tmp_path, device.path, "html", "--session", "2")) == {"com.example.app01": "waits for its turn"}
 
 
 def wait_until(holds, seconds=30):

@@ -46,28 +46,20 @@ std::string fileNameOf(const std::string& path) {
     return name.empty() || name == "." || name == ".." ? path : name;
 }
 
-bool isFileToRead(const std::string& path) {
-    std::error_code code;
-    return std::filesystem::is_regular_file(path, code);
-}
-
-bool isThere(const std::string& path) {
-    std::error_code code;
-    return std::filesystem::exists(path, code) || code;
-}
-
 Result<Timeline> timelineIn(const TimelineArguments& arguments) {
-    if (isFileToRead(arguments.source)) {
+    std::error_code code;
+    const std::filesystem::file_type type = std::filesystem::status(arguments.source, code).type();
+    if (type == std::filesystem::file_type::not_found) {
+        return unusable("there is neither a device nor a recording at '" + arguments.source + "'",
+                        "give the path of one");
+    }
+    if (type != std::filesystem::file_type::directory) {
         if (arguments.session) {
             return wrongUsage("--session with a recording", "a recording holds one session");
         }
         const Result<RecordedSession> session = readRecordingFile(arguments.source);
         if (!session) return session.error();
         return timelineOfRecording(*session, fileNameOf(arguments.source));
-    }
-    if (!isThere(arguments.source)) {
-        return unusable("there is neither a device nor a recording at '" + arguments.source + "'",
-                        "give the path of one");
     }
     const auto device = openDevice(arguments.source, DeviceAccess::Look);
     if (!device) return device.error();

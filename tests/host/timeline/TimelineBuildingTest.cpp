@@ -250,6 +250,26 @@ TEST(TimelineLog, WhatIsSentAfterASyncThatWasKilledIsNoPartOfIt) {
     }
 }
 
+// Its transfer alone would look like the one that the killed sync was about to make.
+TEST(TimelineLog, WhatIsSentOfWhatAKilledSyncWasTransferringIsNoPartOfIt) {
+    const std::string sync = lineOfLog(1, "starting to reconcile sync with new anchor %{public}@",
+                                       "starting to reconcile sync") +
+                             askedFor("com.a") + transferOf("com.a");
+    const std::string sent =
+        R"({"time":"2026-01-02T03:04:05.000005Z","category":0,"level":"default","message":)"
+        R"("com.korvu.trd sends com.a, which the device has not asked for","format":)"
+        R"("%s sends %{public}@, which the device has not asked for"})"
+        "\n";
+    const std::vector<LoggedSession> sessions = sessionsInLog(sync + sent + transferOf("com.a"));
+    ASSERT_THAT(sessions, SizeIs(2));
+    EXPECT_FALSE(sessions[1].lacksBeginning);
+    ASSERT_THAT(sessions[1].lines, SizeIs(2));
+    const std::optional<TimedEvent> begin = eventOfLine(sessions[1].lines.front());
+    ASSERT_TRUE(begin);
+    EXPECT_EQ(begin->event.kind, TimelineEventKind::DeliveryBegins);
+    EXPECT_EQ(begin->event.identifier, "com.a");
+}
+
 TEST(TimelineLog, ALogThatBeginsWithinASessionSaysSo) {
     const std::string text =
         lineOfLog(1, "Performing install for %{public}@", "Performing install for com.a");
