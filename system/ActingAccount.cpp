@@ -13,6 +13,11 @@ namespace {
 
 constexpr std::uint32_t bitOf(int capability) { return std::uint32_t{1} << unsigned(capability); }
 
+constexpr uid_t kUnchanged = static_cast<uid_t>(-1);
+
+/// Whether the account is this thread's own, and not that of the process.
+thread_local bool actsAlone = false;  // NOLINT(cppcoreguidelines-avoid-non-const-global-variables)
+
 // Not that of giving files away: what replaces a file of root's is to be the account's.
 constexpr std::uint32_t kKept =
     bitOf(CAP_DAC_OVERRIDE) | bitOf(CAP_DAC_READ_SEARCH) | bitOf(CAP_FOWNER);
@@ -29,7 +34,7 @@ void keepAccess() noexcept {
 }  // namespace
 
 void actAs(uid_t user, gid_t group) noexcept {
-    if (::geteuid() != 0 || user == 0) return;
+    if (actsAlone || ::geteuid() != 0 || user == 0) return;
     const gid_t before = ::getegid();
     if (::setegid(group) != 0) return;
     if (::seteuid(user) == 0) {
@@ -37,6 +42,17 @@ void actAs(uid_t user, gid_t group) noexcept {
     } else if (::setegid(before) != 0) {
         return;  // the files' group is all that is left to differ
     }
+}
+
+// The C library's calls change the account of all threads; the system's own that of the caller.
+void actOnThisThreadAs(uid_t user, gid_t group) noexcept {
+    if (!actsAlone && ::geteuid() != 0) return;
+    const gid_t itsGroup = user == 0 ? ::getgid() : group;
+    if (actsAlone && ::geteuid() == user && ::getegid() == itsGroup) return;
+    if (::syscall(SYS_setresuid, kUnchanged, 0, kUnchanged) != 0) return;
+    actsAlone = true;
+    if (::syscall(SYS_setresgid, kUnchanged, itsGroup, kUnchanged) != 0) return;
+    if (user != 0 && ::syscall(SYS_setresuid, kUnchanged, user, kUnchanged) == 0) keepAccess();
 }
 
 }  // namespace appsync

@@ -10,4 +10,8 @@ namespace appsync {
 /// account of root, and where the system does not know the account.
 void actAs(uid_t user, gid_t group) noexcept;
 
+/// The same for this thread alone and those that it starts. It may be told of another account
+/// later, that of root too; `actAs` leaves it as it is.
+void actOnThisThreadAs(uid_t user, gid_t group) noexcept;
+
 }  // namespace appsync

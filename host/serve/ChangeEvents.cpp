@@ -1,6 +1,7 @@
 #include "host/serve/ChangeEvents.h"
 
 #include <chrono>
+#include <cstddef>
 #include <cstdint>
 #include <map>
 #include <string>
@@ -114,12 +115,15 @@ class FolderEvents final : public BellEvents {
         for (const std::shared_ptr<ServedDevice>& each : devices_.all()) {
             hasNew = known_.try_emplace(each->name(), each).second || hasNew;
         }
+        const std::size_t leftOut = devices_.leftOut();
+        hasNew = std::exchange(leftOut_, leftOut) != leftOut || hasNew;
         if (!hasNew) return {};
         return eventText({{"name", nullptr}, {"changed", {"devices"}}, {"stamp", nullptr}});
     }
 
     ServedDevices& devices_;
     std::map<std::string, KnownDevice> known_;
+    std::size_t leftOut_ = 0;
 };
 
 }  // namespace

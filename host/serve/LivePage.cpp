@@ -171,6 +171,11 @@ Result<std::unique_ptr<LivePage>> LivePage::open(const std::string& path,
     return page;
 }
 
+std::size_t LivePage::leftOut() {
+    static_cast<void>(devices_->all());
+    return devices_->leftOut();
+}
+
 void LivePage::end() { bell_.silence(); }
 
 HttpAnswer LivePage::answer(const HttpRequest& request) {
@@ -201,6 +206,7 @@ HttpAnswer LivePage::devicesAnswer() {
     }
     return {.body = dumped({{"version", version_},
                             {"folder", devices_->isFolder()},
+                            {"leftOut", devices_->leftOut()},
                             {"devices", std::move(cards)}})};
 }
 

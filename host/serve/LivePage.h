@@ -7,6 +7,7 @@
 // those who listen, LogPage.h finds lines of the log, PageFiles.h are the page itself. HTTP is
 // spoken in the room host/serve/http. Nothing here changes a device.
 
+#include <cstddef>
 #include <memory>
 #include <string>
 
@@ -26,6 +27,8 @@ class LivePage {
                                                                 std::string version);
 
     [[nodiscard]] HttpAnswer answer(const HttpRequest& request);
+    /// How many devices of the folder are not shown, as there are too many.
+    [[nodiscard]] std::size_t leftOut();
     /// Ends all events.
     void end();
 

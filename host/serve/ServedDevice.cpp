@@ -1,10 +1,13 @@
 #include "host/serve/ServedDevice.h"
 
+#include <sys/stat.h>
+
 #include <algorithm>
 #include <utility>
 
 #include "device/Device.h"
 #include "host/serve/ChangeBell.h"
+#include "system/ActingAccount.h"
 
 namespace appsync {
 
@@ -18,6 +21,12 @@ constexpr std::chrono::seconds kLongestPause{3};
 // A session that is killed changes no file, and what stands in the way of a reading may go unseen.
 constexpr std::chrono::seconds kLongestTrust{2};
 constexpr std::size_t kMostIconBytes = std::size_t{64} << 20U;
+
+// Devices of several owners may stand in one folder.
+void actAsItsOwner(const std::string& device) {
+    struct stat status = {};
+    if (::stat(device.c_str(), &status) == 0) actOnThisThreadAs(status.st_uid, status.st_gid);
+}
 
 HttpAnswer pictureAnswer(const Bytes& png) {
     constexpr int kWeek = 7 * 24 * 3600;
@@ -185,6 +194,7 @@ void ServedDevice::waitForWork(std::unique_lock<std::mutex>& lock) {
 }
 
 void ServedDevice::work(const std::deque<std::shared_ptr<Asked>>& questions) {
+    actAsItsOwner(path_);
     const DeviceStamp stamp = deviceStampOf(path_);
     const bool reads = hasToRead(stamp);
     if (reads || !questions.empty()) {

@@ -69,6 +69,11 @@ std::vector<std::shared_ptr<ServedDevice>> ServedDevices::all() {
     return devices;
 }
 
+std::size_t ServedDevices::leftOut() {
+    const std::lock_guard lock(mutex_);
+    return leftOut_;
+}
+
 std::shared_ptr<ServedDevice> ServedDevices::find(const std::string& name) {
     const std::lock_guard lock(mutex_);
     look();
@@ -80,15 +85,27 @@ void ServedDevices::look() {
     const auto now = std::chrono::steady_clock::now();
     if (!isFolder_ || (!devices_.empty() && now - lastLook_ < kFolderInterval)) return;
     lastLook_ = now;
-    const std::size_t before = devices_.size();
+    const std::set<std::string> newcomers = newNames();
+    std::size_t added = 0;
+    for (const std::string& name : newcomers) {
+        if (devices_.size() == kMostDevices) break;
+        add((fs::path(path_) / name).string(), name);
+        ++added;
+    }
+    const std::size_t before = std::exchange(leftOut_, newcomers.size() - added);
+    if (added > 0 || leftOut_ != before) bell_.ring();
+}
+
+std::set<std::string> ServedDevices::newNames() const {
+    std::set<std::string> names;
     std::error_code code;
     fs::directory_iterator each(path_, code);
     for (; !code && each != fs::directory_iterator(); each.increment(code)) {
         const std::string name = each->path().filename();
-        if (devices_.size() == kMostDevices) break;
-        if (isShownName(name) && isDevice_(each->path())) add(each->path(), name);
+        const bool isNew = isShownName(name) && !devices_.contains(name);
+        if (isNew && isDevice_(each->path())) names.insert(name);
     }
-    if (devices_.size() > before) bell_.ring();
+    return names;
 }
 
 void ServedDevices::add(const std::string& path, const std::string& name) {

@@ -1,10 +1,12 @@
 #pragma once
 
 #include <chrono>
+#include <cstddef>
 #include <functional>
 #include <map>
 #include <memory>
 #include <mutex>
+#include <set>
 #include <string>
 #include <vector>
 
@@ -15,8 +17,8 @@ namespace appsync {
 class ChangeBell;
 class ServedDevice;
 
-/// What is served: one device, or those in a folder, in which new ones may appear. A device that
-/// has gone is still among them, and says so. Callable on any thread.
+/// What is served: one device, or those in a folder, in which new ones may appear, at most 500. A
+/// device that has gone is still among them, and says so. Callable on any thread.
 class ServedDevices {
   public:
     using IsDevice = bool (*)(const std::string& path);
@@ -30,6 +32,8 @@ class ServedDevices {
     [[nodiscard]] bool isFolder() const noexcept { return isFolder_; }
     /// By name. Looks for new ones, once a second at most.
     [[nodiscard]] std::vector<std::shared_ptr<ServedDevice>> all();
+    /// How many more there are in the folder than are served, as `all` and `find` have seen it.
+    [[nodiscard]] std::size_t leftOut();
     /// Nothing where there is none of that name.
     [[nodiscard]] std::shared_ptr<ServedDevice> find(const std::string& name);
 
@@ -37,6 +41,7 @@ class ServedDevices {
     ServedDevices(std::string path, bool isFolder, IsDevice isDevice, ChangeBell& bell);
 
     void look();
+    [[nodiscard]] std::set<std::string> newNames() const;
     void add(const std::string& path, const std::string& name);
 
     const std::string path_;
@@ -46,6 +51,7 @@ class ServedDevices {
     std::mutex mutex_;
     // Protected by mutex_.
     std::map<std::string, std::shared_ptr<ServedDevice>> devices_;
+    std::size_t leftOut_ = 0;
     std::chrono::steady_clock::time_point lastLook_;
 };
 

@@ -2,11 +2,14 @@
 
 import json
 import os
+import pathlib
+import re
 import shutil
 import sqlite3
 import stat
 import subprocess
 import tempfile
+import urllib.request
 
 import pytest
 
@@ -113,6 +116,30 @@ def test_what_root_makes_belongs_to_the_owner_of_the_device(place, coordination)
     told = json.loads(place.as_nobody("sync", device.path, library, "--json", expect=None).stdout)
     assert told["updated"] == [IDS[0]]
     assert place.as_nobody("inventory", device.path).stderr == ""
+
+
+@pytest.mark.plain_build  # who has taken on another account is not looked into for leaks
+def test_root_looks_at_each_device_of_a_folder_as_its_owner(place):
+    another, library = NOBODY - 1, place.library()
+    folder = place.path("many")
+    os.mkdir(folder)
+    for name, owner in (("first", NOBODY), ("second", another), ("third", 0)):
+        device = Device(place.appsync, os.path.join(folder, name))
+        give(device.path, owner)
+        device.sync(library)
+    process = place.appsync.start("serve", folder, "--port", "0")
+    try:
+        address = re.search(r"http://[^/]*/", process.stdout.readline())[0]
+        with urllib.request.urlopen(address + "api/devices") as answer:
+            cards = json.load(answer)["devices"]
+        accounts = {re.search(r"\nUid:\s\d+\s(\d+)", each.read_text())[1]
+                    for each in pathlib.Path("/proc/%d/task" % process.pid).glob("*/status")}
+    finally:
+        process.terminate()
+        assert process.wait() == 0
+    assert [(card["state"], card["applications"]) for card in cards] == [("idle", 5)] * 3
+    assert accounts == {"0", str(NOBODY), str(another)}
+    assert owners(os.path.join(folder, "first")) == {}
 
 
 @pytest.mark.plain_build  # who has taken on another account is not looked into for leaks

@@ -568,6 +568,26 @@ def test_a_folder_of_devices(appsync, device, library, tmp_path):
 
 
 @ON_ONE_PATH
+def test_devices_beyond_the_most_that_are_served_are_told_of(appsync, tmp_path):
+    folder = tmp_path / "many"
+    for number in range(502):
+        (folder / ("device%03d" % number)).mkdir(parents=True)
+        (folder / ("device%03d" % number) / "device.db").write_bytes(b"")
+    serving = Serving(appsync, str(folder))
+    listed = serving.json("/api/devices")
+    assert [each["name"] for each in listed["devices"]] == ["device%03d" % number for number in range(500)]
+    assert listed["leftOut"] == 2
+    events = Events(serving, "/api/events")
+    events.until(lambda event: event["changed"] == ["devices"])
+    (folder / "device501" / "device.db").unlink()
+    events.until(lambda event: event["changed"] == ["devices"], most=2000)
+    assert serving.json("/api/devices")["leftOut"] == 1
+    serving.end()
+    told = serving.process.stderr.read()
+    assert "2 devices of" in told and "500" in told
+
+
+@ON_ONE_PATH
 def test_what_cannot_be_served_is_said(appsync, device, serving, tmp_path):
     (tmp_path / "empty").mkdir()
     (tmp_path / "file").write_text("x")

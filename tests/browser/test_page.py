@@ -326,6 +326,14 @@ def test_a_folder_is_a_card_for_each_device(appsync, tmp_path, serve, page):
     page.wait_for_text("#no-lines", "The log is empty.")
 
 
+def test_a_folder_with_more_devices_than_are_shown_says_so(tmp_path, serve, page):
+    for number in range(501):
+        (tmp_path / "folder" / ("device%03d" % number)).mkdir(parents=True)
+        (tmp_path / "folder" / ("device%03d" % number) / "device.db").write_bytes(b"")
+    page.open(serve(tmp_path / "folder"))
+    page.wait_for_text("#left-out", "1 more device stands in this folder, and at most 500 are shown at once.")
+
+
 def test_a_server_that_is_gone_is_told_and_found_again(appsync, tmp_path, serve, page):
     device = device_of(appsync, tmp_path, 2)
     served = serve(device.path)

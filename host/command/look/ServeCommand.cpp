@@ -1,6 +1,7 @@
 #include <unistd.h>
 
 #include <chrono>
+#include <cstddef>
 #include <memory>
 #include <ostream>
 #include <string>
@@ -9,9 +10,11 @@
 #include "host/command/look/LookCommands.h"
 #include "host/console/Console.h"
 #include "host/console/Problem.h"
+#include "host/console/Text.h"
 #include "host/serve/LivePage.h"
 #include "host/serve/http/HttpServer.h"
 #include "host/session/StopSignals.h"
+#include "system/file/PosixError.h"
 
 namespace appsync {
 namespace {
@@ -40,6 +43,12 @@ int runServe(const ServeArguments& arguments, const Console& console) {
         kPatienceOfServer, [&server] { (*server)->stop(); }, [] { ::_exit(kExitDone); });
     console.out << "Serving at http://127.0.0.1:" << (*server)->port() << "/ - Ctrl-C ends it."
                 << std::endl;
+    if (const std::size_t leftOut = (*page)->leftOut(); leftOut != 0) {
+        console.complain(counted(leftOut, "device") + " of " + displayPath(arguments.place) +
+                         (leftOut == 1 ? " is" : " are") +
+                         " left out, as at most 500 are served at once: serve a folder with fewer, "
+                         "or one of them by itself");
+    }
     (*server)->run([&page] { (*page)->end(); });
     page->reset();  // while a signal still ends what may take long
     return kExitDone;

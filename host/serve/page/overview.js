@@ -8,7 +8,7 @@ export class Overview {
     this.cards = new Map();
   }
 
-  update(devices) {
+  update(devices, leftOut) {
     const nodes = devices.map((device) => this.card(device).item);
     const names = new Set(devices.map((device) => device.name));
     for (const name of this.cards.keys()) {
@@ -16,6 +16,11 @@ export class Overview {
     }
     arrange(byId("cards"), nodes);
     show(byId("no-devices"), devices.length === 0);
+    show(byId("left-out"), leftOut > 0);
+    if (leftOut > 0) {
+      const those = leftOut === 1 ? "1 more device stands" : `${count(leftOut, "more device")} stand`;
+      setText(byId("left-out"), `${those} in this folder, and at most ${devices.length} are shown at once.`);
+    }
   }
 
   card(device) {

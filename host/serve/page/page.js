@@ -76,10 +76,10 @@ class Page {
 
   async list() {
     try {
-      const { devices } = await ask("/api/devices");
+      const { devices, leftOut } = await ask("/api/devices");
       if (this.name !== null) return;
       this.known = new Set(devices.map((device) => device.name));
-      this.overview.update(devices);
+      this.overview.update(devices, leftOut);
       this.route(); // what was asked for may be there now
     } catch (error) {
       this.tell(error.message);
