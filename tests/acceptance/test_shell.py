@@ -104,6 +104,16 @@ def test_a_shell_completes_options_and_their_values(place, complete):
 
 
 @SHELLS
+def test_a_shell_completes_settings(place, complete):
+    assert complete(place, "set", "my\\ phone", "removal=no", "coord") == {"coordination=on", "coordination=off"}
+
+
+def test_bash_that_parts_words_at_equals_signs_completes_what_stands_behind(place):
+    assert in_bash(place, "set", "my\\ phone", "removal", "=", "no", "coordination", "=", "of") == {"off"}
+    assert in_bash(place, "set", "my\\ phone", "coordination", "=") == {"on", "off"}
+
+
+@SHELLS
 def test_a_shell_completes_what_is_on_the_device_that_is_named(place, complete):
     assert complete(place, "why", "my\\ phone", "com.example.") == {A, B}
     assert complete(place, "why", "my\\ phone", "com.example.b") == {B}

@@ -2,6 +2,7 @@
 
 #include <algorithm>
 #include <set>
+#include <sstream>
 #include <string_view>
 
 #include "host/console/Text.h"
@@ -127,8 +128,25 @@ class Finder {
             found_.paths = Completions::Paths::Files;
             return;
         }
+        if (argument.name == "NAME=VALUE") return addSettings(argument.description);
         const bool saysMore = argument.value == kNewPlace || !wordsOfValue(argument.value).empty();
         addValues(saysMore ? argument.value : argument.name);
+    }
+
+    // The description names them: "coordination=on|off". Each is set once.
+    void addSettings(const std::string& description) {
+        std::istringstream settings(description);
+        for (std::string each; settings >> each;) {
+            const std::size_t behindName = each.find('=') + 1;
+            const std::string name = each.substr(0, behindName);
+            const bool isSet =
+                std::any_of(line_.placed.begin(), line_.placed.end(),
+                            [&name](const std::string& word) { return word.starts_with(name); });
+            if (isSet) continue;
+            for (const std::string& value : wordsOfValue(each.substr(behindName))) {
+                add(name + value);
+            }
+        }
     }
 
     void addValues(const std::string& value) {
@@ -141,7 +159,7 @@ class Finder {
             found_.paths = Completions::Paths::Devices;
         } else if (isDirectory(value)) {
             found_.paths = Completions::Paths::Directories;
-        } else if (value != "N" && value != "TIME" && value != "NAME=VALUE") {
+        } else if (value != "N" && value != "TIME") {
             found_.paths = Completions::Paths::Files;
         }
     }
@@ -152,11 +170,20 @@ class Finder {
     Completions found_;
 };
 
-// bash gives the words of the line as they were typed: backslashes are taken off here.
+// bash gives the words of the line as they were typed: backslashes are taken off here. It parts
+// them at "=" too, and replaces what stands behind that alone.
 constexpr std::string_view kBashScript =
     R"(# bash completion of appsync: made by "appsync completion bash".
 _appsync() {
-    local line each found words=("${COMP_WORDS[@]:1:COMP_CWORD}")
+    local line each found before words=()
+    for each in "${COMP_WORDS[@]:1:COMP_CWORD}"; do
+        if [ ${#words[@]} -gt 0 ] && { [ "$each" = "=" ] || [[ ${words[-1]} == *= ]]; }; then
+            words[-1]+=$each
+        else
+            words+=("$each")
+        fi
+    done
+    before=${words[-1]%"${words[-1]##*=}"}
     words=("${words[@]//\\/}")
     words=("${words[@]/#\~\//$HOME/}")
     COMPREPLY=()
@@ -171,7 +198,7 @@ _appsync() {
             if [ ${#COMPREPLY[@]} -eq 0 ]; then COMPREPLY=("${found[@]}"); fi ;;
         :directories) compopt -o filenames 2>/dev/null; mapfile -t COMPREPLY < <(compgen -d -- "${COMP_WORDS[COMP_CWORD]}") ;;
         :files) compopt -o filenames 2>/dev/null; mapfile -t COMPREPLY < <(compgen -f -- "${COMP_WORDS[COMP_CWORD]}") ;;
-        *) COMPREPLY+=("${line%%$'\t'*}") ;;
+        *) line=${line%%$'\t'*}; COMPREPLY+=("${line#"$before"}") ;;
         esac
     done < <("${COMP_WORDS[0]}" complete -- "${words[@]}" 2>/dev/null)
 }

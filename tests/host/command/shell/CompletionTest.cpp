@@ -87,6 +87,17 @@ TEST_F(Completion, OfAnIdentifierIsWhatIsOnTheDevice) {
     EXPECT_THAT(wordsOf({"coordinator", device, "cancel", "x"}), IsEmpty());
 }
 
+TEST_F(Completion, OfASettingIsWhatIsNotSetYet) {
+    EXPECT_THAT(wordsOf({"set", ""}), ElementsAre(":devices"));
+    EXPECT_THAT(
+        wordsOf({"set", device, ""}),
+        ElementsAre("installation=yes", "installation=no", "installation=unset", "removal=yes",
+                    "removal=no", "removal=unset", "coordination=on", "coordination=off"));
+    EXPECT_THAT(wordsOf({"set", device, "coordination=of"}), ElementsAre("coordination=off"));
+    EXPECT_THAT(wordsOf({"set", device, "installation=yes", "removal=no", ""}),
+                ElementsAre("coordination=on", "coordination=off"));
+}
+
 TEST_F(Completion, WhereThereIsNoDeviceSaysNothing) {
     EXPECT_THAT(linesOf({"why", directory.path() + "/nowhere", ""}), IsEmpty());
     EXPECT_THAT(linesOf({"why", library, ""}), IsEmpty());
