@@ -168,7 +168,7 @@ class AppRegistry {
     /// alive, so that the last of it may go on the registry's thread.
     virtual void addObserver(std::weak_ptr<AppRegistryObserver> observer) = 0;
     /// No call begins after this one has returned. Known by its address: it may be called from the
-    /// observer's destructor.
+    /// observer's destructor. Nothing happens where it observes no more: it may be removed twice.
     virtual void removeObserver(const AppRegistryObserver* observer) = 0;
 };
 

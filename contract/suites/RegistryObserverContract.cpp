@@ -166,6 +166,18 @@ TEST_P(RegistryObserverContract, ARemovedObserverHearsNoMore) {
     registry_.removeObserver(other.get());
 }
 
+TEST_P(RegistryObserverContract, AnObserverMayBeRemovedAgain) {
+    checks("platform/AppRegistry.h",
+           "Nothing happens where it observes no more: it may be removed twice.");
+    const auto removed = observe();
+    const auto other = observe();
+    registry_.removeObserver(removed.get());
+    registry_.removeObserver(removed.get());
+    ASSERT_TRUE(installPlaceholder({kA}, kInstallTypeSync));
+    other->waitFor({kA}, {});
+    registry_.removeObserver(other.get());
+}
+
 /// Asks the registry, and leaves it, while it is being told something.
 class AskingObserver : public AppRegistryObserver {
   public:
