@@ -14,6 +14,14 @@ constexpr std::chrono::milliseconds kBetweenTimes{250};
 
 }  // namespace
 
+std::string workWithin(const std::string& text, std::size_t width) {
+    const std::size_t comma = text.find(", ");
+    if (comma == std::string::npos || displayWidth(text) <= width) return text;
+    std::string count = text.substr(comma + 2);
+    std::string shorter = text.substr(0, text.find_first_of(" ,")) + " " + count;
+    return displayWidth(shorter) <= width ? shorter : count;
+}
+
 LiveLine::LiveLine(const Console& console) : console_(console), isOver_(!console.isTerminal) {}
 
 void LiveLine::say(std::string_view what) {
@@ -55,8 +63,13 @@ void LiveLine::draw() {
     const auto time = std::chrono::duration_cast<std::chrono::seconds>(drawn_ - begin_);
     // Some terminals go on to the next line once the last column is filled.
     const std::size_t width = console_.currentWidth();
-    const std::string text = printable(what_) + "  " + formatDuration(time);
-    console_.out << '\r' << fitted(text, width > 0 ? width - 1 : 0, console_.cutMark) << std::flush;
+    const std::size_t room = width > 0 ? width - 1 : 0;
+    const std::string what = printable(what_);
+    const std::string text = what + "  " + formatDuration(time);
+    console_.out << '\r'
+                 << fitted(displayWidth(text) > room ? workWithin(what, room) : text, room,
+                           console_.cutMark)
+                 << std::flush;
 }
 
 }  // namespace appsync

@@ -12,6 +12,10 @@ namespace appsync {
 
 struct Console;
 
+/// "asking the device, 790 of 1000" with as many of the words as there is room for: the count is
+/// what tells that it goes on.
+[[nodiscard]] std::string workWithin(const std::string& text, std::size_t width);
+
 /// One line of a terminal that says from the beginning what is being done, and for how long, drawn
 /// anew by a thread of its own; it is gone afterwards. Where there is no terminal that can redraw
 /// lines, it says nothing. Callable on any thread.

@@ -5,6 +5,7 @@
 #include <utility>
 
 #include "host/console/Console.h"
+#include "host/console/LiveLine.h"
 #include "host/console/Text.h"
 #include "host/output/SyncDisplays.h"
 
@@ -31,6 +32,11 @@ std::string joined(const std::vector<std::string>& pieces, std::size_t width,
         }
     }
     return line;
+}
+
+std::string preparationText(const std::string& text, std::size_t width) {
+    const std::string whole = "prepare  " + text;
+    return displayWidth(whole) <= width ? whole : workWithin(text, width);
 }
 
 // Rounded, as it is an estimate.
@@ -139,7 +145,7 @@ std::vector<std::string> TerminalDisplay::preparationPieces() const {
     const auto preparation = std::ranges::find(bars_, SyncPhase::Prepare, &SyncEvent::phase);
     if (preparation == bars_.end())
         return {doing_.empty() ? "working" : printable(doing_), elapsed()};
-    return {"prepare  " + printable(preparation->text),
+    return {preparationText(printable(preparation->text), lineWidth()),
             percentBar(percentOf(preparation->done, preparation->total), lineWidth()), elapsed()};
 }
 

@@ -37,6 +37,15 @@ TEST_F(LiveLineTest, StaysInItsLineWhateverTheText) {
     EXPECT_EQ(out.str().substr(0, 30), "\rsomething that is longer t...");
 }
 
+TEST_F(LiveLineTest, OnANarrowTerminalTheCountIsWhatStays) {
+    LiveLine line(terminal);
+    line.say("asking the device again", 790, 1000);
+    line.clear();
+    EXPECT_EQ(out.str().substr(0, 20), "\rasking 790 of 1000 ");
+    EXPECT_EQ(workWithin("asking, 790 of 1000", 12), "790 of 1000");
+    EXPECT_EQ(workWithin("asking the device", 12), "asking the device");
+}
+
 TEST_F(LiveLineTest, IsNotThereWhereNothingWasSaid) {
     LiveLine(terminal).clear();
     EXPECT_EQ(out.str(), "");

@@ -175,6 +175,21 @@ TEST_F(TerminalDisplayTest, ThePreparationHasItsOwnBar) {
     EXPECT_THAT(drawnAfter(prepares), HasSubstr("0 of 1"));
 }
 
+TEST_F(TerminalDisplayTest, OnANarrowTerminalTheCountOfThePreparationIsWhatStays) {
+    SyncEvent prepares = of(SyncEventKind::Progress, SyncPhase::Prepare, "", 256);
+    prepares.text = "asking the device, 790 of 1000";
+    for (const auto& [width, text] :
+         {std::pair(40U, "prepare  asking the device, 790 of 1000\n"),
+          std::pair(31U, "asking the device, 790 of 1000\n"),
+          std::pair(20U, "asking 790 of 1000\n"), std::pair(13U, "790 of 1000\n")}) {
+        out.str("");
+        const Console narrow{out, err, true, width};
+        TerminalDisplay shown(narrow, false, [this] { return now += 100ms; });
+        shown.show(prepares);
+        EXPECT_EQ(drawn(), text);
+    }
+}
+
 TEST_F(TerminalDisplayTest, ANoticeStandsAboveTheBars) {
     display.expect({1, 0});
     drawnAfter(installing("com.a"));
