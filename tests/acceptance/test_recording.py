@@ -140,6 +140,10 @@ def test_a_recording_is_shown(appsync, tmp_path, library):
     middle = lines[len(lines) // 2]["seconds"]
     assert len(shown("--from", middle)) + len(shown("--to", middle)) >= len(lines)
     assert all(line["seconds"] >= middle for line in shown("--from", middle))
+    for options in (("--app", "com.example.none"), ("--thread", "99")):
+        assert appsync("recording", "show", recording, *options).stdout == "no line fits, of %d lines\n" % len(lines)
+    told = appsync("recording", "show", recording, "--service", "FileSystems").stdout
+    assert "FileSystem, " in told and "AppRegistry, " in told
     table = appsync("recording", "show", recording).stdout.splitlines()
     assert table[0].split() == ["SECONDS", "THREAD", "WHAT"] and len(table) == len(lines) + 1
 

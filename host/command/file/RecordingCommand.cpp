@@ -2,6 +2,9 @@
 #include <chrono>
 #include <cstdio>
 #include <ostream>
+#include <set>
+#include <string>
+#include <string_view>
 #include <utility>
 
 #include <nlohmann/json.hpp>
@@ -11,6 +14,7 @@
 #include "host/console/JsonWriting.h"
 #include "host/console/Problem.h"
 #include "host/console/Table.h"
+#include "host/console/Text.h"
 #include "host/replay/RecordingReader.h"
 #include "host/replay/RecordingText.h"
 
@@ -68,14 +72,33 @@ void printLinesAsJson(const RecordedSession& session, const ShowRecordingArgumen
                 << '\n';
 }
 
+// Who mistypes a service is told which there are.
+std::string sayNothingFits(const RecordedSession& session,
+                           const ShowRecordingArguments& arguments) {
+    std::set<std::string_view> services;
+    for (const RecordLine& each : session.lines) services.insert(serviceOf(each));
+    services.erase("");
+    std::string text = "no line fits, of " + counted(session.lines.size(), "line");
+    if (!arguments.service || services.contains(*arguments.service)) return text + "\n";
+    text += "; what is recorded is of ";
+    const char* between = "";
+    for (const std::string_view each : services) {
+        text.append(std::exchange(between, ", ")).append(each);
+    }
+    return text + "\n";
+}
+
 void printLinesAsTable(const RecordedSession& session, const ShowRecordingArguments& arguments,
                        const Console& console) {
     Table table({"SECONDS", "THREAD", "WHAT"});
+    bool isEmpty = true;
     for (const RecordLine& each : session.lines) {
         if (!isShown(each, arguments)) continue;
+        isEmpty = false;
         table.add({microsecondsOf(each), std::to_string(each.thread), recordText(each)});
     }
-    console.out << table.textFor(console);
+    const bool nothingFits = isEmpty && !session.lines.empty();
+    console.out << (nothingFits ? sayNothingFits(session, arguments) : table.textFor(console));
     if (session.isCutOff) console.out << "the recording is cut off: the session went on\n";
 }
 
