@@ -15,47 +15,6 @@ namespace {
 
 // Those that are in every version, the same.
 constexpr const char* kTables = R"sql(
-CREATE TABLE applications (
-    identifier TEXT PRIMARY KEY,
-    version TEXT,
-    name TEXT,
-    type TEXT NOT NULL,
-    install_type INTEGER NOT NULL,
-    container TEXT NOT NULL UNIQUE,
-    bundle TEXT NOT NULL,
-    icon TEXT NOT NULL,
-    bytes INTEGER NOT NULL,
-    arrived INTEGER NOT NULL
-) STRICT;
-CREATE INDEX applications_by_arrival ON applications (arrived);
-
-CREATE TABLE placeholders (
-    identifier TEXT PRIMARY KEY,
-    version TEXT,
-    name TEXT,
-    type TEXT NOT NULL,
-    install_type INTEGER NOT NULL,
-    container TEXT NOT NULL UNIQUE,
-    bundle TEXT NOT NULL,
-    icon TEXT NOT NULL,
-    bytes INTEGER NOT NULL,
-    arrived INTEGER NOT NULL,
-    unsynced_boot TEXT,
-    sinf BLOB
-) STRICT;
-CREATE INDEX placeholders_by_arrival ON placeholders (arrived);
-CREATE INDEX placeholders_unsynced ON placeholders (unsynced_boot)
-    WHERE unsynced_boot IS NOT NULL;
-
-CREATE TABLE progress (
-    identifier TEXT PRIMARY KEY REFERENCES placeholders (identifier) ON DELETE CASCADE,
-    state INTEGER NOT NULL,
-    phase INTEGER NOT NULL,
-    total INTEGER NOT NULL,
-    completed INTEGER NOT NULL,
-    unpacked INTEGER NOT NULL DEFAULT 0
-) STRICT;
-
 CREATE TABLE coordinators (
     id INTEGER PRIMARY KEY AUTOINCREMENT,
     identifier TEXT NOT NULL UNIQUE,
@@ -102,10 +61,6 @@ CREATE TABLE icon_layout (
     state BLOB NOT NULL
 ) STRICT;
 
-CREATE TABLE running (
-    identifier TEXT PRIMARY KEY REFERENCES applications (identifier) ON DELETE CASCADE
-) STRICT;
-
 CREATE TABLE assertions (
     identifier TEXT PRIMARY KEY,
     count INTEGER NOT NULL
@@ -127,19 +82,6 @@ CREATE TABLE failures (
 
 CREATE TABLE restore_data (
     identifier TEXT PRIMARY KEY
-) STRICT;
-
-CREATE TABLE history (
-    id INTEGER PRIMARY KEY AUTOINCREMENT,
-    time INTEGER NOT NULL,
-    kind INTEGER NOT NULL,
-    scenario TEXT NOT NULL,
-    step INTEGER NOT NULL,
-    party INTEGER NOT NULL,
-    phase INTEGER NOT NULL,
-    success INTEGER NOT NULL,
-    identifier TEXT NOT NULL,
-    description TEXT NOT NULL
 ) STRICT;
 )sql";
 
@@ -183,6 +125,122 @@ CREATE TABLE sums (
 ) STRICT, WITHOUT ROWID;
 )sql";
 
+constexpr const char* kTableOfRunning = R"sql(
+CREATE TABLE running (
+    identifier TEXT PRIMARY KEY REFERENCES applications (identifier) ON DELETE CASCADE
+) STRICT;
+)sql";
+
+constexpr const char* kTablesUntilVersion4 = R"sql(
+CREATE TABLE applications (
+    identifier TEXT PRIMARY KEY,
+    version TEXT,
+    name TEXT,
+    type TEXT NOT NULL,
+    install_type INTEGER NOT NULL,
+    container TEXT NOT NULL UNIQUE,
+    bundle TEXT NOT NULL,
+    icon TEXT NOT NULL,
+    bytes INTEGER NOT NULL,
+    arrived INTEGER NOT NULL
+) STRICT;
+CREATE INDEX applications_by_arrival ON applications (arrived);
+
+CREATE TABLE placeholders (
+    identifier TEXT PRIMARY KEY,
+    version TEXT,
+    name TEXT,
+    type TEXT NOT NULL,
+    install_type INTEGER NOT NULL,
+    container TEXT NOT NULL UNIQUE,
+    bundle TEXT NOT NULL,
+    icon TEXT NOT NULL,
+    bytes INTEGER NOT NULL,
+    arrived INTEGER NOT NULL,
+    unsynced_boot TEXT,
+    sinf BLOB
+) STRICT;
+CREATE INDEX placeholders_by_arrival ON placeholders (arrived);
+CREATE INDEX placeholders_unsynced ON placeholders (unsynced_boot)
+    WHERE unsynced_boot IS NOT NULL;
+
+CREATE TABLE progress (
+    identifier TEXT PRIMARY KEY REFERENCES placeholders (identifier) ON DELETE CASCADE,
+    state INTEGER NOT NULL,
+    phase INTEGER NOT NULL,
+    total INTEGER NOT NULL,
+    completed INTEGER NOT NULL,
+    unpacked INTEGER NOT NULL DEFAULT 0
+) STRICT;
+
+CREATE TABLE history (
+    id INTEGER PRIMARY KEY AUTOINCREMENT,
+    time INTEGER NOT NULL,
+    kind INTEGER NOT NULL,
+    scenario TEXT NOT NULL,
+    step INTEGER NOT NULL,
+    party INTEGER NOT NULL,
+    phase INTEGER NOT NULL,
+    success INTEGER NOT NULL,
+    identifier TEXT NOT NULL,
+    description TEXT NOT NULL
+) STRICT;
+)sql";
+
+// Each row stands in as few pages as it can, as every page that a transaction touches is written:
+// a place in the order of arrival is nobody else's, and so it is the key.
+constexpr const char* kTablesSinceVersion5 = R"sql(
+CREATE TABLE applications (
+    identifier TEXT NOT NULL UNIQUE,
+    version TEXT,
+    name TEXT,
+    type TEXT NOT NULL,
+    install_type INTEGER NOT NULL,
+    container TEXT NOT NULL,
+    bundle TEXT NOT NULL,
+    icon TEXT NOT NULL,
+    bytes INTEGER NOT NULL,
+    arrived INTEGER PRIMARY KEY
+) STRICT;
+
+CREATE TABLE placeholders (
+    identifier TEXT NOT NULL UNIQUE,
+    version TEXT,
+    name TEXT,
+    type TEXT NOT NULL,
+    install_type INTEGER NOT NULL,
+    container TEXT NOT NULL,
+    bundle TEXT NOT NULL,
+    icon TEXT NOT NULL,
+    bytes INTEGER NOT NULL,
+    arrived INTEGER PRIMARY KEY,
+    unsynced_boot TEXT,
+    sinf BLOB
+) STRICT;
+
+CREATE TABLE progress (
+    identifier TEXT PRIMARY KEY REFERENCES placeholders (identifier) ON DELETE CASCADE,
+    state INTEGER NOT NULL,
+    phase INTEGER NOT NULL,
+    total INTEGER NOT NULL,
+    completed INTEGER NOT NULL,
+    unpacked INTEGER NOT NULL DEFAULT 0
+) STRICT, WITHOUT ROWID;
+
+CREATE TABLE history (
+    id INTEGER PRIMARY KEY,
+    time INTEGER NOT NULL,
+    kind INTEGER NOT NULL,
+    scenario TEXT NOT NULL,
+    step INTEGER NOT NULL,
+    party INTEGER NOT NULL,
+    phase INTEGER NOT NULL,
+    success INTEGER NOT NULL,
+    identifier TEXT NOT NULL,
+    description TEXT NOT NULL
+) STRICT;
+)sql";
+
 constexpr const char* kTablesOfVersion1 = R"sql(
 CREATE TABLE uninstalled (
     identifier TEXT PRIMARY KEY,
@@ -209,9 +267,49 @@ constexpr const char* kTakeOverVersion1 =
     "DROP TABLE former_uninstalled;"
     "DROP TABLE former_session;";
 
+// With the tables that refer to them, whose references a renaming changes.
+constexpr const char* kSetVersion4Aside =
+    "ALTER TABLE applications RENAME TO former_applications;"
+    "ALTER TABLE placeholders RENAME TO former_placeholders;"
+    "ALTER TABLE progress RENAME TO former_progress;"
+    "ALTER TABLE running RENAME TO former_running;"
+    "ALTER TABLE kept RENAME TO former_kept;"
+    "ALTER TABLE history RENAME TO former_history;";
+
+constexpr const char* kTakeOverVersion4 = R"sql(
+CREATE TABLE arrivals (place INTEGER PRIMARY KEY, identifier TEXT UNIQUE);
+INSERT INTO arrivals (identifier)
+    SELECT identifier FROM (SELECT identifier, arrived FROM former_applications
+                            UNION ALL SELECT identifier, arrived FROM former_placeholders)
+    GROUP BY identifier ORDER BY min(arrived), identifier;
+INSERT INTO applications
+    SELECT identifier, version, name, type, install_type, container, bundle, icon, bytes, place
+    FROM former_applications JOIN arrivals USING (identifier);
+INSERT INTO placeholders
+    SELECT identifier, version, name, type, install_type, container, bundle, icon, bytes, place,
+           unsynced_boot, sinf
+    FROM former_placeholders JOIN arrivals USING (identifier);
+INSERT INTO progress SELECT * FROM former_progress
+    WHERE identifier IN (SELECT identifier FROM placeholders);
+INSERT INTO running SELECT * FROM former_running
+    WHERE identifier IN (SELECT identifier FROM applications);
+INSERT INTO kept SELECT * FROM former_kept
+    WHERE identifier IN (SELECT identifier FROM applications);
+INSERT INTO history SELECT * FROM former_history;
+DROP TABLE arrivals;
+DROP TABLE former_progress;
+DROP TABLE former_running;
+DROP TABLE former_kept;
+DROP TABLE former_placeholders;
+DROP TABLE former_applications;
+DROP TABLE former_history;
+)sql";
+
 std::string tablesOf(std::int64_t version) {
-    return std::string(kTables) + (version == 1 ? kTablesOfVersion1 : kTablesSinceVersion2) +
-           (version < 3 ? "" : kTablesSinceVersion3) + (version < 4 ? "" : kTablesSinceVersion4);
+    return std::string(kTables) + kTableOfRunning +
+           (version == 1 ? kTablesOfVersion1 : kTablesSinceVersion2) +
+           (version < 3 ? "" : kTablesSinceVersion3) + (version < 4 ? "" : kTablesSinceVersion4) +
+           (version < 5 ? kTablesUntilVersion4 : kTablesSinceVersion5);
 }
 
 ErrorRecord halfCreated(const Database& database) {
@@ -287,6 +385,14 @@ Status leaveVersion1(Database& database) {
     return status ? database.execute(kTakeOverVersion1) : status;
 }
 
+Status leaveVersion4(Database& database) {
+    Status status = database.execute(kSetVersion4Aside);
+    for (const char* tables : {kTablesSinceVersion5, kTableOfRunning, kTablesSinceVersion3}) {
+        if (status) status = database.execute(tables);
+    }
+    return status ? database.execute(kTakeOverVersion4) : status;
+}
+
 }  // namespace
 
 Status createDeviceSchema(Database& database) {
@@ -333,6 +439,7 @@ Status bringSchemaUpToDate(Database& database) {
     if (*version < 2) status = leaveVersion1(database);
     if (status && *version < 3) status = database.execute(kTablesSinceVersion3);
     if (status && *version < 4) status = database.execute(kTablesSinceVersion4);
+    if (status && *version < 5) status = leaveVersion4(database);
     if (!status || *version == kDeviceSchemaVersion) return status;
     const std::string mark = "PRAGMA user_version = " + std::to_string(kDeviceSchemaVersion);
     return database.execute(mark.c_str());

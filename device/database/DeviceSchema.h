@@ -11,7 +11,7 @@ inline constexpr int kDeviceApplicationId = 0x41707073;
 
 /// The schema that this version makes; docs/device-format.md describes it. One of an earlier
 /// version serves whoever looks; a session brings it up to date first.
-inline constexpr int kDeviceSchemaVersion = 4;
+inline constexpr int kDeviceSchemaVersion = 5;
 
 /// Makes the tables of an empty database, and marks it as a device's.
 Status createDeviceSchema(Database& database);

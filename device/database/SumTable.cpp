@@ -22,9 +22,8 @@ Result<std::optional<std::uint64_t>> findSum(Database& database, const std::stri
 Status forgetOldSums(Database& database) {
     return database
         .query(
-            "DELETE FROM sums WHERE"
-            " NOT EXISTS (SELECT 1 FROM applications WHERE applications.container = sums.container)"
-            " AND NOT EXISTS (SELECT 1 FROM kept WHERE kept.container = sums.container)")
+            "DELETE FROM sums WHERE container NOT IN"
+            " (SELECT container FROM applications UNION ALL SELECT container FROM kept)")
         .run();
 }
 

@@ -42,7 +42,7 @@ TEST_F(DeviceOpeningTest, creationKeepsWhatWasAskedFor) {
 
 TEST_F(DeviceOpeningTest, creationWritesAheadAndSyncsEachCommit) {
     EXPECT_EQ(number("SELECT journal_mode = 'wal' FROM pragma_journal_mode"), 1);
-    EXPECT_EQ(number("PRAGMA user_version"), 4);
+    EXPECT_EQ(number("PRAGMA user_version"), 5);
 }
 
 TEST_F(DeviceOpeningTest, creationRefusesAPathThatExists) {
@@ -181,9 +181,29 @@ TEST_F(DeviceOpeningTest, aNewerSchemaIsRefusedAndLeftAlone) {
     EXPECT_EQ(number("PRAGMA user_version"), 99);
 }
 
-class DeviceOfVersion1Test : public DeviceOpeningTest {
+class DeviceOfVersion4Test : public DeviceOpeningTest {
+  protected:
+    /// Makes the device one of version 4, with all that it holds.
+    void goBack() {
+        close();
+        std::ifstream file(VERSION4_SQL);
+        const std::string script(std::istreambuf_iterator<char>(file), {});
+        ASSERT_FALSE(script.empty());
+        sql(script.c_str());
+    }
+
+    std::string onHomeScreen() {
+        std::string all;
+        const auto items = look()->homeScreen();
+        for (const HomeScreenItem& item : *items) all += item.identifier + " ";
+        return all;
+    }
+};
+
+class DeviceOfVersion1Test : public DeviceOfVersion4Test {
   protected:
     DeviceOfVersion1Test() {
+        goBack();
         sql("DROP TABLE sums; DROP TABLE kept; DROP TABLE uninstalled; DROP TABLE session;"
             "CREATE TABLE uninstalled (\n"
             "    identifier TEXT PRIMARY KEY,\n"
@@ -216,7 +236,7 @@ TEST_F(DeviceOfVersion1Test, aPersonRemovesApplicationsFromIt) {
 
 TEST_F(DeviceOfVersion1Test, aSessionBringsItUpToDateAndLosesNothing) {
     ASSERT_TRUE(succeeded(install("com.example.b")));  // in a session that began after its removal
-    EXPECT_EQ(number("PRAGMA user_version"), 4);
+    EXPECT_EQ(number("PRAGMA user_version"), 5);
     EXPECT_EQ(number("SELECT count(*) FROM uninstalled WHERE identifier = 'com.example.a'"
                      " AND version = '2.0' AND time = 1"),
               1);
@@ -233,11 +253,11 @@ TEST_F(DeviceOfVersion1Test, aSessionThatWasCutOffIsStillKnown) {
     EXPECT_EQ(number("SELECT count(*) FROM session"), 0) << "it has ended in order";
 }
 
-class DeviceOfVersion2Test : public DeviceOpeningTest {
+class DeviceOfVersion2Test : public DeviceOfVersion4Test {
   protected:
     DeviceOfVersion2Test() {
         EXPECT_TRUE(succeeded(install("com.example.a", "1.0")));
-        close();
+        goBack();
         sql("DROP TABLE sums; DROP TABLE kept; PRAGMA user_version = 2");
     }
 };
@@ -258,7 +278,7 @@ TEST_F(DeviceOfVersion2Test, aPersonRemovesApplicationsFromIt) {
 TEST_F(DeviceOfVersion2Test, aSessionBringsItUpToDateAndLosesNothing) {
     sql("INSERT INTO uninstalled VALUES (7, 'com.example.b', '2.0', 1)");
     ASSERT_TRUE(succeeded(install("com.example.a", "2.0")));
-    EXPECT_EQ(number("PRAGMA user_version"), 4);
+    EXPECT_EQ(number("PRAGMA user_version"), 5);
     EXPECT_EQ(number("SELECT id FROM uninstalled"), 7);
     EXPECT_EQ(device().applications()->front().kept->version, "1.0");
     close();
@@ -270,13 +290,13 @@ TEST_F(DeviceOfVersion2Test, aTableOfTheNextVersionIsNotItsOwn) {
     EXPECT_TRUE(unusable(openSession(devicePath()), DeviceErrorCode::Damaged, "kept"));
 }
 
-class DeviceOfVersion3Test : public DeviceOpeningTest {
+class DeviceOfVersion3Test : public DeviceOfVersion4Test {
   protected:
     DeviceOfVersion3Test() {
         for (const char* version : {"1.0", "2.0"}) {
             EXPECT_TRUE(succeeded(install("com.example.a", version)));
         }
-        close();
+        goBack();
         sql("DROP TABLE sums; PRAGMA user_version = 3");
     }
 };
@@ -290,9 +310,59 @@ TEST_F(DeviceOfVersion3Test, aLookTellsWhatIsKept) {
 
 TEST_F(DeviceOfVersion3Test, aSessionBringsItUpToDateAndWhatIsKeptComesBack) {
     EXPECT_TRUE(device().rollBack("com.example.a"));
-    EXPECT_EQ(number("PRAGMA user_version"), 4);
+    EXPECT_EQ(number("PRAGMA user_version"), 5);
     EXPECT_EQ(device().applications()->front().version, "1.0");
     EXPECT_EQ(device().applications()->front().kept->version, "2.0");
+}
+
+TEST_F(DeviceOfVersion4Test, aLookUsesItAsItIs) {
+    ASSERT_TRUE(succeeded(install("com.example.a")));
+    goBack();
+    EXPECT_EQ(look()->applications()->size(), 1U);
+    ASSERT_TRUE(succeeded(look()->uninstall("com.example.a")));
+    EXPECT_TRUE(look()->applications()->empty());
+    EXPECT_EQ(number("PRAGMA user_version"), 4);
+}
+
+TEST_F(DeviceOfVersion4Test, aSessionBringsItUpToDateAndLosesNothing) {
+    for (const char* version : {"1.0", "2.0"}) {
+        ASSERT_TRUE(succeeded(install("com.example.a", version)));
+    }
+    ASSERT_TRUE(succeeded(install("com.example.b")));
+    ASSERT_TRUE(succeeded(install("com.example.c")));
+    ASSERT_TRUE(succeeded(device().demote("com.example.c", DemotedBy::Person)));
+    goBack();
+    sql("INSERT INTO running VALUES ('com.example.a');"
+        "INSERT INTO progress VALUES ('com.example.c', 1, 2, 3, 4, 5);"
+        "UPDATE applications SET arrived = 9 - arrived");
+    const std::int64_t records = number("SELECT count(*) FROM history");
+
+    ASSERT_TRUE(openSession(devicePath()).ok());
+
+    EXPECT_EQ(number("PRAGMA user_version"), 5);
+    EXPECT_EQ(look()->applications()->size(), 3U);
+    EXPECT_EQ(look()->applications()->front().kept->version, "1.0");
+    EXPECT_EQ(number("SELECT count(*) FROM running WHERE identifier = 'com.example.a'"), 1);
+    EXPECT_EQ(number("SELECT completed FROM progress WHERE identifier = 'com.example.c'"), 4);
+    EXPECT_EQ(number("SELECT count(*) FROM history"), records);
+    EXPECT_EQ(onHomeScreen(), "com.example.c com.example.b com.example.a ") << "by arrival";
+    ASSERT_TRUE(succeeded(install("com.example.d")));
+    EXPECT_EQ(look()->homeScreen()->back().identifier, "com.example.d");
+}
+
+TEST_F(DeviceOfVersion4Test, twoWithOnePlaceInTheOrderOfArrivalGetTwo) {
+    for (const char* identifier : {"com.example.b", "com.example.a"}) {
+        ASSERT_TRUE(succeeded(install(identifier)));
+    }
+    goBack();
+    sql("UPDATE applications SET arrived = 7");
+    ASSERT_TRUE(openSession(devicePath()).ok());
+    EXPECT_EQ(onHomeScreen(), "com.example.a com.example.b ");
+}
+
+TEST_F(DeviceOfVersion4Test, aTableOfTheNextVersionIsNotItsOwn) {
+    sql("PRAGMA user_version = 4");
+    EXPECT_TRUE(unusable(openSession(devicePath()), DeviceErrorCode::Damaged, "applications"));
 }
 
 TEST_F(DeviceOfVersion1Test, tablesOfTheNextVersionAreNotItsOwn) {

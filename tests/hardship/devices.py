@@ -1,5 +1,6 @@
 """Small devices to do something to, and what can be seen of one afterwards."""
 
+import contextlib
 import hashlib
 import json
 import os
@@ -123,6 +124,16 @@ class Sync(Scenario):
 
     def command(self):
         return ["sync", self.device, self.library, "--remove", GOES]
+
+
+class FormerSync(Sync):
+    """The same on a device that an earlier version of the program has made."""
+
+    def prepare(self):
+        super().prepare()
+        script = (HERE.parent / "device" / "version4.sql").read_text()
+        with contextlib.closing(sqlite3.connect(os.path.join(self.base, "device.db"))) as database:
+            database.executescript(script)
 
 
 class Restore(Scenario):
@@ -255,6 +266,7 @@ def check_kept(device):
 SCENARIOS = {
     "sync": lambda appsync, folder: Sync(appsync, folder, "off"),
     "coordinated-sync": lambda appsync, folder: Sync(appsync, folder, "on"),
+    "former-sync": lambda appsync, folder: FormerSync(appsync, folder, "off"),
     "restore": lambda appsync, folder: Restore(appsync, folder, "off"),
     "coordinated-restore": lambda appsync, folder: Restore(appsync, folder, "on"),
     "rollback": lambda appsync, folder: Rollback(appsync, folder, "off"),
