@@ -189,7 +189,7 @@ class DeviceOfVersion4Test : public DeviceOpeningTest {
         std::ifstream file(VERSION4_SQL);
         const std::string script(std::istreambuf_iterator<char>(file), {});
         ASSERT_FALSE(script.empty());
-        sql(script.c_str());
+        sql(script);
     }
 
     std::string onHomeScreen() {
