@@ -51,7 +51,7 @@ std::string identifierInOptions(const RecordEntry& entry) {
 
 ErrorRecord refusal() { return ErrorRecord::make("Fault", 1, "refused"); }
 
-Way refused(std::string name) { return {std::move(name), {}, {}}; }
+Way refusedWay(std::string name) { return {std::move(name), {}, {}}; }
 
 Way failingFile(FileOperation operation, int error, std::string name) {
     return {std::move(name),
@@ -129,7 +129,7 @@ using WaysByCall = std::map<std::string, Ways, std::less<>>;
 
 WaysByCall fileWaysByCall() {
     return {
-        {"FileSystem.itemExists", {refused("not seen")}},
+        {"FileSystem.itemExists", {refusedWay("not seen")}},
         {"FileSystem.attributes", fileWays(FileOperation::Attributes, false)},
         {"FileSystem.createDirectory", fileWays(FileOperation::CreateDirectory, true)},
         {"FileSystem.removeItem", fileWays(FileOperation::RemoveItem, false)},
@@ -141,9 +141,9 @@ WaysByCall fileWaysByCall() {
         {"FileSystem.createFile",
          with(fileWays(FileOperation::CreateFile, true), tornFile(FileOperation::CreateFile, 0))},
         {"FileSystem.setTimesToNow", fileWays(FileOperation::SetTimesToNow, false)},
-        {"PropertyListSerialization.parse", {refused("no property list")}},
-        {"PropertyListSerialization.serialize", {refused("not written")}},
-        {"PropertyListSerialization.replaceText", {refused("not replaced")}},
+        {"PropertyListSerialization.parse", {refusedWay("no property list")}},
+        {"PropertyListSerialization.serialize", {refusedWay("not written")}},
+        {"PropertyListSerialization.replaceText", {refusedWay("not replaced")}},
     };
 }
 
@@ -157,14 +157,14 @@ WaysByCall coordinationWaysByCall() {
            },
            {}},
           nothingMade(CoordinationObject::Coordinator, 1)}},
-        {"InstallCoordinatorService.existingCoordinator", {refused("null")}},
+        {"InstallCoordinatorService.existingCoordinator", {refusedWay("null")}},
         {"InstallCoordinatorService.makePathTransferPromise",
          {nothingMade(CoordinationObject::PathTransferPromise, 0)}},
         {"InstallCoordinatorService.makeOutOfBandPromise",
          {nothingMade(CoordinationObject::OutOfBandPromise, 0)}},
         {"InstallCoordinatorService.makeAppPlaceholder",
          {nothingMade(CoordinationObject::Placeholder, 1)}},
-        {"InstallCoordinatorService.makeAppInstallObserver", {refused("null")}},
+        {"InstallCoordinatorService.makeAppInstallObserver", {refusedWay("null")}},
         {"InstallCoordinatorService.uninstallApp", uninstallWays()},
         {"InstallCoordinator.setInstallOptions", {refusedStep(CoordinationStep::InstallOptions)}},
         {"InstallCoordinator.setInitialODRAssetPromises",
@@ -186,8 +186,8 @@ WaysByCall coordinationWaysByCall() {
 
 WaysByCall serviceWaysByCall() {
     return {
-        {"AppRegistry.proxyForIdentifier", {refused("nothing")}},
-        {"AppRegistry.installProgress", {refused("null")}},
+        {"AppRegistry.proxyForIdentifier", {refusedWay("nothing")}},
+        {"AppRegistry.installProgress", {refusedWay("null")}},
         {"AppRegistry.installPackage",
          {refusedInstall(kInstallerErrorDomain, "package refused"),
           refusedInstall(kPosixErrorDomain, "I/O error")}},
@@ -198,18 +198,18 @@ WaysByCall serviceWaysByCall() {
            },
            {}}}},
         {"AppRegistry.uninstallApplication", uninstallWays()},
-        {"HomeScreenService.blockableConnection", {refused("null")}},
+        {"HomeScreenService.blockableConnection", {refusedWay("null")}},
         {"HomeScreenService.takeTerminationAssertion",
          {terminationOutcome(kUnknownOutcome, "unknown outcome"),
           terminationOutcome(TerminationAssertionResult::kDenied, "denied"),
           terminationOutcome(TerminationAssertionResult::kNoSuchApplication, "not found")}},
-        {"HomeScreenConnection.setIconState", {refused("no")}},
-        {"HomeScreenConnection.flattenedIconState", {refused("nothing")}},
-        {"IconRenderer.openBundle", {refused("null")}},
-        {"IconRenderer.homeScreenIcon", {refused("null")}},
-        {"IconRenderer.createImageDestination", {refused("null")}},
-        {"ImageDestination.finalize", {refused("no")}},
-        {"InstallerService.lookupUninstalled", {refused("nothing")}},
+        {"HomeScreenConnection.setIconState", {refusedWay("no")}},
+        {"HomeScreenConnection.flattenedIconState", {refusedWay("nothing")}},
+        {"IconRenderer.openBundle", {refusedWay("null")}},
+        {"IconRenderer.homeScreenIcon", {refusedWay("null")}},
+        {"IconRenderer.createImageDestination", {refusedWay("null")}},
+        {"ImageDestination.finalize", {refusedWay("no")}},
+        {"InstallerService.lookupUninstalled", {refusedWay("nothing")}},
         {"InstallerService.clearUninstalled",
          {{"no",
            [](SimulatedPlatform& platform, const RecordEntry&) {

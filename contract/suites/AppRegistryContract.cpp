@@ -5,15 +5,13 @@
 #include <vector>
 
 #include "contract/DeviceContract.h"
+#include "contract/suites/Applications.h"
 
 namespace appsync {
 namespace {
 
 using testing::ElementsAre;
 using testing::IsEmpty;
-
-constexpr const char* kA = "com.example.a";
-constexpr const char* kB = "com.example.b";
 
 class AppRegistryContract : public DeviceContract {};
 

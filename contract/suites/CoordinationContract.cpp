@@ -9,6 +9,7 @@
 #include <vector>
 
 #include "contract/DeviceContract.h"
+#include "contract/suites/Applications.h"
 #include "platform/InstallCoordinator.h"
 #include "platform/InstallPlaceholder.h"
 #include "platform/InstallPromises.h"
@@ -26,8 +27,6 @@ using testing::Not;
 using Creation = InstallCoordinatorService::Creation;
 using Kind = CoordinatorKind;
 
-constexpr const char* kA = "com.example.a";
-constexpr const char* kB = "com.example.b";
 constexpr CoordinationClient kOtherClient = 7;
 
 ErrorRecord reason(std::int64_t code = 30) { return {std::string(kSyncErrorDomain), code, {}}; }

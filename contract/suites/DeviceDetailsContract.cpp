@@ -12,6 +12,7 @@
 
 #include "contract/DeviceContract.h"
 #include "contract/Sentence.h"
+#include "contract/suites/Applications.h"
 #include "platform/InstallCoordinator.h"
 #include "platform/SyncHost.h"
 
@@ -22,9 +23,6 @@ void linkDeviceDetailsContract() {}
 namespace {
 
 using testing::ElementsAre;
-
-constexpr const char* kA = "com.example.a";
-constexpr const char* kB = "com.example.b";
 
 class BackupDetailsContract : public DeviceContract {};
 

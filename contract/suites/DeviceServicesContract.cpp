@@ -5,6 +5,7 @@
 #include <vector>
 
 #include "contract/DeviceContract.h"
+#include "contract/suites/Applications.h"
 
 namespace appsync {
 namespace {
@@ -12,9 +13,6 @@ namespace {
 using testing::ElementsAre;
 using testing::IsEmpty;
 using Outcome = TerminationAssertionResult;
-
-constexpr const char* kA = "com.example.a";
-constexpr const char* kB = "com.example.b";
 
 class HomeScreenContract : public DeviceContract {
   protected:

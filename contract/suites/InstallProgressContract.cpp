@@ -6,15 +6,13 @@
 #include <vector>
 
 #include "contract/DeviceContract.h"
+#include "contract/suites/Applications.h"
 
 namespace appsync {
 namespace {
 
 using testing::ElementsAre;
 using testing::IsEmpty;
-
-constexpr const char* kA = "com.example.a";
-constexpr const char* kB = "com.example.b";
 
 class InstallProgressContract : public DeviceContract {
   protected:

@@ -7,14 +7,12 @@
 #include <vector>
 
 #include "contract/DeviceContract.h"
+#include "contract/suites/Applications.h"
 #include "platform/InstallCoordinator.h"
 #include "platform/InstallPromises.h"
 
 namespace appsync {
 namespace {
-
-constexpr const char* kA = "com.example.a";
-constexpr const char* kB = "com.example.b";
 
 /// What the next process finds of what this one has done.
 class LastingContract : public DeviceContract {

@@ -10,15 +10,13 @@
 
 #include "contract/DeviceContract.h"
 #include "contract/Sentence.h"
+#include "contract/suites/Applications.h"
 
 namespace appsync {
 
 void linkRegistryDetailsContract() {}
 
 namespace {
-
-constexpr const char* kA = "com.example.a";
-constexpr const char* kB = "com.example.b";
 
 class AppRegistryDetailsContract : public DeviceContract {};
 

@@ -10,14 +10,12 @@
 #include <vector>
 
 #include "contract/DeviceContract.h"
+#include "contract/suites/Applications.h"
 
 namespace appsync {
 namespace {
 
 using namespace std::chrono_literals;
-
-constexpr const char* kA = "com.example.a";
-constexpr const char* kB = "com.example.b";
 
 /// Keeps the reports that it hears; the test waits for those that it expects.
 class ReportKeeper : public AppRegistryObserver {

@@ -12,6 +12,7 @@
 #include "client/Paths.h"
 #include "client/TodoList.h"
 #include "contract/DeviceContract.h"
+#include "contract/suites/Applications.h"
 #include "platform/HomeScreenService.h"
 #include "platform/SyncAsset.h"
 
@@ -22,8 +23,6 @@ using namespace std::chrono_literals;
 using testing::ElementsAre;
 using testing::IsEmpty;
 
-constexpr const char* kA = "com.example.a";
-constexpr const char* kB = "com.example.b";
 constexpr const char* kC = "com.example.c";
 
 // How often is looked for what comes on threads of the device's, and how many times.

@@ -16,21 +16,23 @@
 namespace appsync {
 namespace {
 
-constexpr std::string_view kService = "InstallCoordinatorService";
-constexpr std::string_view kObserver = "InstallCoordinatorObserver";
+constexpr std::string_view kCoordinationService = "InstallCoordinatorService";
+constexpr std::string_view kCoordinatorObserver = "InstallCoordinatorObserver";
 constexpr std::string_view kDomain = "InstallCoordination";
 // 1 to 9 are codes of errors that a person may see.
 constexpr std::int64_t kOtherKind = 10;
 constexpr std::int64_t kNotInstalled = 12;
 constexpr std::int64_t kAlreadySet = 15;
-constexpr std::int64_t kRefused = 16;
+constexpr std::int64_t kCoordinationRefused = 16;
 constexpr std::int64_t kOver = 17;
 
 ErrorRecord failureOf(std::int64_t code, const std::string& why) {
     return ErrorRecord::make(kDomain, code, why);
 }
 
-ErrorRecord refused(const std::string& why) { return failureOf(kRefused, why); }
+ErrorRecord coordinationRefused(const std::string& why) {
+    return failureOf(kCoordinationRefused, why);
+}
 
 std::string_view kindName(CoordinatorKind kind) {
     constexpr std::array<std::string_view, 4> kNames{"initiating", "updating", "restoring",
@@ -179,7 +181,7 @@ SimulatedCoordination::~SimulatedCoordination() = default;
 // The interface.
 
 bool SimulatedCoordination::isCoordinationEnabled() {
-    RecordedCall call(recorder_, kService, "isCoordinationEnabled");
+    RecordedCall call(recorder_, kCoordinationService, "isCoordinationEnabled");
     return call.result(enabled_);
 }
 
@@ -188,7 +190,7 @@ SimulatedCoordination::Coordinator SimulatedCoordination::coordinator(Coordinato
                                                                       CoordinationClient client,
                                                                       Creation creation) {
     RecordedCall call(
-        recorder_, kService, "coordinator", kindName(kind), identifier, client,
+        recorder_, kCoordinationService, "coordinator", kindName(kind), identifier, client,
         creation == Creation::OnlyExisting ? "only existing" : "create if not existing");
     Coordinator result = lookUp(kind, identifier, client, creation);
     std::string text = coordinatorText(result, identifier);
@@ -205,7 +207,7 @@ SimulatedCoordination::Coordinator SimulatedCoordination::lookUp(CoordinatorKind
         return failure(status.error());
     }
     if (!isLegalIdentifier(identifier)) {
-        return failure(refused("'" + identifier + "' is no identifier"));
+        return failure(coordinationRefused("'" + identifier + "' is no identifier"));
     }
     if (const State found = find(identifier)) {
         if (found->kind == kind) return {handle(found), false, std::nullopt};
@@ -222,7 +224,7 @@ SimulatedCoordination::Coordinator SimulatedCoordination::lookUp(CoordinatorKind
 
 std::shared_ptr<InstallCoordinator> SimulatedCoordination::existingCoordinator(
     const std::string& identifier, CoordinationClient client) {
-    RecordedCall call(recorder_, kService, "existingCoordinator", identifier, client);
+    RecordedCall call(recorder_, kCoordinationService, "existingCoordinator", identifier, client);
     const bool none = takeNone(CoordinationObject::ExistingCoordinator, identifier);
     const State found = none ? nullptr : find(identifier);
     if (found == nullptr) return call.result(std::shared_ptr<InstallCoordinator>(), "(null)");
@@ -232,8 +234,8 @@ std::shared_ptr<InstallCoordinator> SimulatedCoordination::existingCoordinator(
 std::shared_ptr<PathTransferPromise> SimulatedCoordination::makePathTransferPromise(
     const std::string& name, CoordinationClient client, const std::optional<FileURL>& path,
     std::uint64_t diskSpaceNeeded) {
-    RecordedCall call(recorder_, kService, "makePathTransferPromise", name, client, path,
-                      diskSpaceNeeded);
+    RecordedCall call(recorder_, kCoordinationService, "makePathTransferPromise", name, client,
+                      path, diskSpaceNeeded);
     std::shared_ptr<PathTransferPromise> promise;
     if (!takeNone(CoordinationObject::PathTransferPromise, name)) {
         const auto state = newPromise(name, client, diskSpaceNeeded);
@@ -246,7 +248,8 @@ std::shared_ptr<PathTransferPromise> SimulatedCoordination::makePathTransferProm
 
 std::shared_ptr<OutOfBandPromise> SimulatedCoordination::makeOutOfBandPromise(
     const std::string& name, CoordinationClient client, std::uint64_t diskSpaceNeeded) {
-    RecordedCall call(recorder_, kService, "makeOutOfBandPromise", name, client, diskSpaceNeeded);
+    RecordedCall call(recorder_, kCoordinationService, "makeOutOfBandPromise", name, client,
+                      diskSpaceNeeded);
     std::shared_ptr<OutOfBandPromise> promise;
     if (!takeNone(CoordinationObject::OutOfBandPromise, name)) {
         const auto state = newPromise(name, client, diskSpaceNeeded);
@@ -269,8 +272,8 @@ std::shared_ptr<SimulatedPromiseState> SimulatedCoordination::newPromise(
 std::shared_ptr<InstallPlaceholder> SimulatedCoordination::makeAppPlaceholder(
     const std::string& name, const std::string& identifier, std::uint64_t installType,
     CoordinationClient client) {
-    RecordedCall call(recorder_, kService, "makeAppPlaceholder", name, identifier, installType,
-                      client);
+    RecordedCall call(recorder_, kCoordinationService, "makeAppPlaceholder", name, identifier,
+                      installType, client);
     if (takeNone(CoordinationObject::Placeholder, identifier)) {
         return call.result(std::shared_ptr<InstallPlaceholder>(), "(null)");
     }
@@ -287,7 +290,7 @@ std::shared_ptr<InstallPlaceholder> SimulatedCoordination::makeAppPlaceholder(
 
 void SimulatedCoordination::uninstallApp(const std::string& identifier,
                                          UninstallCompletion completion) {
-    const RecordedCall call(recorder_, kService, "uninstallApp", identifier);
+    const RecordedCall call(recorder_, kCoordinationService, "uninstallApp", identifier);
     submit([this, identifier, completion = std::move(completion)] {
         const Status status = registry_.uninstall(identifier);
         completion(status ? nullptr : &status.error());
@@ -296,7 +299,7 @@ void SimulatedCoordination::uninstallApp(const std::string& identifier,
 
 ErrorRecord SimulatedCoordination::userPresentableError(
     std::int64_t code, const std::optional<ErrorRecord>& underlying) {
-    RecordedCall call(recorder_, kService, "userPresentableError", code, underlying);
+    RecordedCall call(recorder_, kCoordinationService, "userPresentableError", code, underlying);
     ErrorRecord error = ErrorRecord::make(kDomain, code, "the application could not be installed");
     if (underlying) {
         error.userInfo.set("underlying", PropertyList::map({{"domain", underlying->domain},
@@ -309,7 +312,7 @@ ErrorRecord SimulatedCoordination::userPresentableError(
 std::shared_ptr<AppInstallObserver> SimulatedCoordination::makeAppInstallObserver(
     const std::string& serviceName, const std::set<CoordinationClient>& clients,
     std::weak_ptr<InstallCoordinatorObserver> delegate) {
-    RecordedCall call(recorder_, kService, "makeAppInstallObserver", serviceName,
+    RecordedCall call(recorder_, kCoordinationService, "makeAppInstallObserver", serviceName,
                       clientsText(clients));
     if (takeNone(CoordinationObject::AppInstallObserver, serviceName)) {
         return call.result(std::shared_ptr<AppInstallObserver>(), "(null)");
@@ -363,8 +366,9 @@ Status SimulatedCoordination::checkSet(CoordinationStep piece,
 Status SimulatedCoordination::checkChange(CoordinationStep piece,
                                           const SimulatedPlaceholderState& state) {
     if (Status failure = takeFailure(piece, state.identifier); !failure) return failure;
-    if (state.cancelled) return refused("the placeholder was cancelled");
-    if (state.configurationComplete) return refused("the placeholder's configuration is complete");
+    if (state.cancelled) return coordinationRefused("the placeholder was cancelled");
+    if (state.configurationComplete)
+        return coordinationRefused("the placeholder's configuration is complete");
     return {};
 }
 
@@ -372,12 +376,14 @@ Status SimulatedCoordination::checkPlaceholder(const SimulatedCoordinatorState& 
                                                const SimulatedPlaceholderState* placeholder) {
     if (placeholder == nullptr) return nothingGiven();
     if (placeholder->identifier != state.identifier) {
-        return refused("the placeholder is that of '" + placeholder->identifier + "'");
+        return coordinationRefused("the placeholder is that of '" + placeholder->identifier + "'");
     }
     return {};
 }
 
-ErrorRecord SimulatedCoordination::nothingGiven() { return refused("there is nothing to set"); }
+ErrorRecord SimulatedCoordination::nothingGiven() {
+    return coordinationRefused("there is nothing to set");
+}
 
 void SimulatedCoordination::cancelPromise(SimulatedPromiseState& promise, const ErrorRecord& reason,
                                           CoordinationClient client) {
@@ -502,7 +508,7 @@ void SimulatedCoordination::install(const State& state) {
 
 Status SimulatedCoordination::installPackage(const SimulatedCoordinatorState& state) {
     if (!state.appAsset->path) {
-        return refused("the package has no path");
+        return coordinationRefused("the package has no path");
     }
     return registry_.install(*state.identifier, state.appAsset->path->path());
 }
@@ -547,7 +553,8 @@ void SimulatedCoordination::report(const State& state, std::string_view method,
                                    const std::string& arguments, const Call& call) {
     const std::string identifier = state->identifier.value_or("(null)");
     for (const Listener& listener : listeners(*state)) {
-        const RecordedCall recorded(recorder_, kObserver, method, identifier + arguments);
+        const RecordedCall recorded(recorder_, kCoordinatorObserver, method,
+                                    identifier + arguments);
         if (listener.hears()) call(*listener.observer, handle(state));
     }
 }
@@ -706,7 +713,7 @@ SimulatedCoordination::State SimulatedCoordination::reported(const Identifier& i
 void SimulatedCoordination::postDidBeginFulfillment(std::uint64_t promise) {
     submit([this, promise] {
         for (const Listener& delegate : delegates(SyncClientID)) {
-            const RecordedCall call(recorder_, kObserver,
+            const RecordedCall call(recorder_, kCoordinatorObserver,
                                     "promiseDidBeginFulfillmentWithIdentifier", promise);
             if (!delegate.hears()) continue;
             delegate.observer->promiseDidBeginFulfillmentWithIdentifier(promise);

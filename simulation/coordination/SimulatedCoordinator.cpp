@@ -10,7 +10,7 @@
 namespace appsync {
 namespace {
 
-constexpr std::string_view kService = "InstallCoordinator";
+constexpr std::string_view kCoordinator = "InstallCoordinator";
 
 /// The record behind a handle; null when there is none.
 template <typename Handle, typename Interface>
@@ -48,35 +48,35 @@ std::string namesOf(const PromiseStates& states) {
 std::string SimulatedCoordinator::name() const { return state_->identifier.value_or("(null)"); }
 
 std::optional<std::string> SimulatedCoordinator::bundleIdentifier() const {
-    RecordedCall call(service_.recorder_, kService, "bundleIdentifier", name());
+    RecordedCall call(service_.recorder_, kCoordinator, "bundleIdentifier", name());
     return call.result(state_->identifier);
 }
 
 CoordinationClient SimulatedCoordinator::creatorIdentifier() const {
-    RecordedCall call(service_.recorder_, kService, "creatorIdentifier", name());
+    RecordedCall call(service_.recorder_, kCoordinator, "creatorIdentifier", name());
     return call.result(state_->creator);
 }
 
 std::optional<ErrorRecord> SimulatedCoordinator::error() const {
-    RecordedCall call(service_.recorder_, kService, "error", name());
+    RecordedCall call(service_.recorder_, kCoordinator, "error", name());
     return call.result(state_->error);
 }
 
 std::string SimulatedCoordinator::description() const { return "Coordinator(" + name() + ")"; }
 
 void SimulatedCoordinator::setObserver(std::weak_ptr<InstallCoordinatorObserver> observer) {
-    const RecordedCall call(service_.recorder_, kService, "setObserver", name());
+    const RecordedCall call(service_.recorder_, kCoordinator, "setObserver", name());
     state_->observer = std::move(observer);
 }
 
 bool SimulatedCoordinator::hasInstallOptions() const {
-    RecordedCall call(service_.recorder_, kService, "hasInstallOptions", name());
+    RecordedCall call(service_.recorder_, kCoordinator, "hasInstallOptions", name());
     return call.result(service_.has(CoordinationStep::InstallOptions, *state_,
                                     state_->installOptions.has_value()));
 }
 
 Status SimulatedCoordinator::setInstallOptions(const InstallOptions& options) {
-    RecordedCall call(service_.recorder_, kService, "setInstallOptions", name(), options);
+    RecordedCall call(service_.recorder_, kCoordinator, "setInstallOptions", name(), options);
     Status status = service_.checkSet(CoordinationStep::InstallOptions, *state_,
                                       state_->installOptions.has_value());
     if (!status) return call.result(status);
@@ -87,7 +87,7 @@ Status SimulatedCoordinator::setInstallOptions(const InstallOptions& options) {
 }
 
 bool SimulatedCoordinator::hasInitialODRAssetPromises() const {
-    RecordedCall call(service_.recorder_, kService, "hasInitialODRAssetPromises", name());
+    RecordedCall call(service_.recorder_, kCoordinator, "hasInitialODRAssetPromises", name());
     return call.result(service_.has(CoordinationStep::InitialODRAssetPromises, *state_,
                                     state_->initialODRAssets.has_value()));
 }
@@ -95,7 +95,7 @@ bool SimulatedCoordinator::hasInitialODRAssetPromises() const {
 Status SimulatedCoordinator::setInitialODRAssetPromises(
     const std::vector<std::shared_ptr<PathTransferPromise>>& promises) {
     PromiseStates states = statesOf(promises);
-    RecordedCall call(service_.recorder_, kService, "setInitialODRAssetPromises", name(),
+    RecordedCall call(service_.recorder_, kCoordinator, "setInitialODRAssetPromises", name(),
                       namesOf(states));
     Status status = service_.checkSet(CoordinationStep::InitialODRAssetPromises, *state_,
                                       state_->initialODRAssets.has_value());
@@ -108,7 +108,7 @@ Status SimulatedCoordinator::setInitialODRAssetPromises(
 }
 
 std::shared_ptr<PathTransferPromise> SimulatedCoordinator::appAssetPromise() const {
-    RecordedCall call(service_.recorder_, kService, "appAssetPromise", name());
+    RecordedCall call(service_.recorder_, kCoordinator, "appAssetPromise", name());
     std::shared_ptr<PathTransferPromise> promise;
     if (service_.has(CoordinationStep::AppAssetPromise, *state_, state_->appAsset != nullptr) &&
         state_->appAsset != nullptr) {
@@ -121,7 +121,8 @@ std::shared_ptr<PathTransferPromise> SimulatedCoordinator::appAssetPromise() con
 Status SimulatedCoordinator::setAppAssetPromise(
     const std::shared_ptr<PathTransferPromise>& promise) {
     const auto asset = stateOf<SimulatedPathTransferPromise>(promise);
-    RecordedCall call(service_.recorder_, kService, "setAppAssetPromise", name(), nameOf(asset));
+    RecordedCall call(service_.recorder_, kCoordinator, "setAppAssetPromise", name(),
+                      nameOf(asset));
     Status status =
         service_.checkSet(CoordinationStep::AppAssetPromise, *state_, state_->appAsset != nullptr);
     if (status && asset == nullptr) status = SimulatedCoordination::nothingGiven();
@@ -134,13 +135,13 @@ Status SimulatedCoordinator::setAppAssetPromise(
 }
 
 std::optional<CoordinationClient> SimulatedCoordinator::appAssetPromiseResponsibleClient() const {
-    RecordedCall call(service_.recorder_, kService, "appAssetPromiseResponsibleClient", name());
+    RecordedCall call(service_.recorder_, kCoordinator, "appAssetPromiseResponsibleClient", name());
     return call.result(state_->responsibleClient);
 }
 
 Status SimulatedCoordinator::setAppAssetPromiseResponsibleClient(CoordinationClient client) {
-    RecordedCall call(service_.recorder_, kService, "setAppAssetPromiseResponsibleClient", name(),
-                      client);
+    RecordedCall call(service_.recorder_, kCoordinator, "setAppAssetPromiseResponsibleClient",
+                      name(), client);
     Status status = service_.checkSet(CoordinationStep::AppAssetPromiseResponsibleClient, *state_,
                                       state_->responsibleClient.has_value());
     if (status) {
@@ -151,14 +152,14 @@ Status SimulatedCoordinator::setAppAssetPromiseResponsibleClient(CoordinationCli
 }
 
 bool SimulatedCoordinator::hasUserDataPromise() const {
-    RecordedCall call(service_.recorder_, kService, "hasUserDataPromise", name());
+    RecordedCall call(service_.recorder_, kCoordinator, "hasUserDataPromise", name());
     return call.result(
         service_.has(CoordinationStep::UserDataPromise, *state_, state_->userData != nullptr));
 }
 
 Status SimulatedCoordinator::setUserDataPromise(const std::shared_ptr<OutOfBandPromise>& promise) {
     const auto data = stateOf<SimulatedOutOfBandPromise>(promise);
-    RecordedCall call(service_.recorder_, kService, "setUserDataPromise", name(), nameOf(data));
+    RecordedCall call(service_.recorder_, kCoordinator, "setUserDataPromise", name(), nameOf(data));
     Status status =
         service_.checkSet(CoordinationStep::UserDataPromise, *state_, state_->userData != nullptr);
     if (status && data == nullptr) status = SimulatedCoordination::nothingGiven();
@@ -171,7 +172,7 @@ Status SimulatedCoordinator::setUserDataPromise(const std::shared_ptr<OutOfBandP
 }
 
 bool SimulatedCoordinator::hasPlaceholderPromise() const {
-    RecordedCall call(service_.recorder_, kService, "hasPlaceholderPromise", name());
+    RecordedCall call(service_.recorder_, kCoordinator, "hasPlaceholderPromise", name());
     return call.result(service_.has(CoordinationStep::PlaceholderPromise, *state_,
                                     state_->placeholder != nullptr));
 }
@@ -179,7 +180,8 @@ bool SimulatedCoordinator::hasPlaceholderPromise() const {
 Status SimulatedCoordinator::setPlaceholderPromise(
     const std::shared_ptr<InstallPlaceholder>& placeholder) {
     const auto given = stateOf<SimulatedPlaceholder>(placeholder);
-    RecordedCall call(service_.recorder_, kService, "setPlaceholderPromise", name(), nameOf(given));
+    RecordedCall call(service_.recorder_, kCoordinator, "setPlaceholderPromise", name(),
+                      nameOf(given));
     Status status = service_.checkSet(CoordinationStep::PlaceholderPromise, *state_,
                                       state_->placeholder != nullptr);
     if (status) status = SimulatedCoordination::checkPlaceholder(*state_, given.get());
@@ -193,7 +195,7 @@ Status SimulatedCoordinator::setPlaceholderPromise(
 }
 
 void SimulatedCoordinator::cancelForReason(const ErrorRecord& reason, CoordinationClient client) {
-    const RecordedCall call(service_.recorder_, kService, "cancelForReason", name(), reason,
+    const RecordedCall call(service_.recorder_, kCoordinator, "cancelForReason", name(), reason,
                             client);
     service_.cancelNow(state_, reason, client);
 }

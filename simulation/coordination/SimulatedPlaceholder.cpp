@@ -9,7 +9,7 @@
 
 namespace appsync {
 namespace {
-constexpr std::string_view kService = "InstallPlaceholder";
+constexpr std::string_view kPlaceholder = "InstallPlaceholder";
 }
 
 std::string SimulatedPlaceholder::description() const {
@@ -18,7 +18,7 @@ std::string SimulatedPlaceholder::description() const {
 
 Status SimulatedPlaceholder::setIconPromise(const std::shared_ptr<PathTransferPromise>& promise) {
     const auto* simulated = dynamic_cast<const SimulatedPathTransferPromise*>(promise.get());
-    RecordedCall call(service_.recorder_, kService, "setIconPromise", state_->identifier,
+    RecordedCall call(service_.recorder_, kPlaceholder, "setIconPromise", state_->identifier,
                       simulated != nullptr ? simulated->state()->name : "(null)");
     Status status = service_.checkChange(CoordinationStep::IconPromise, *state_);
     if (status && simulated == nullptr) status = SimulatedCoordination::nothingGiven();
@@ -31,7 +31,7 @@ Status SimulatedPlaceholder::setIconPromise(const std::shared_ptr<PathTransferPr
 }
 
 Status SimulatedPlaceholder::setAttributes(const PlaceholderAttributes& attributes) {
-    RecordedCall call(service_.recorder_, kService, "setAttributes", state_->identifier,
+    RecordedCall call(service_.recorder_, kPlaceholder, "setAttributes", state_->identifier,
                       attributes);
     Status status = service_.checkChange(CoordinationStep::Attributes, *state_);
     if (status) state_->attributes = attributes;
@@ -39,7 +39,8 @@ Status SimulatedPlaceholder::setAttributes(const PlaceholderAttributes& attribut
 }
 
 Status SimulatedPlaceholder::setMetadata(const std::optional<StoreMetadata>& metadata) {
-    RecordedCall call(service_.recorder_, kService, "setMetadata", state_->identifier, metadata);
+    RecordedCall call(service_.recorder_, kPlaceholder, "setMetadata", state_->identifier,
+                      metadata);
     Status status = service_.checkChange(CoordinationStep::Metadata, *state_);
     if (!status) return call.result(status);
     state_->metadataSet = true;
@@ -48,14 +49,15 @@ Status SimulatedPlaceholder::setMetadata(const std::optional<StoreMetadata>& met
 }
 
 Status SimulatedPlaceholder::setSinf(const Bytes& sinf) {
-    RecordedCall call(service_.recorder_, kService, "setSinf", state_->identifier, sinf);
+    RecordedCall call(service_.recorder_, kPlaceholder, "setSinf", state_->identifier, sinf);
     Status status = service_.checkChange(CoordinationStep::Sinf, *state_);
     if (status) state_->sinf = sinf;
     return call.result(status);
 }
 
 Status SimulatedPlaceholder::setConfigurationComplete() {
-    RecordedCall call(service_.recorder_, kService, "setConfigurationComplete", state_->identifier);
+    RecordedCall call(service_.recorder_, kPlaceholder, "setConfigurationComplete",
+                      state_->identifier);
     Status status = service_.checkChange(CoordinationStep::ConfigurationComplete, *state_);
     if (!status) return call.result(status);
     state_->configurationComplete = true;
@@ -65,7 +67,7 @@ Status SimulatedPlaceholder::setConfigurationComplete() {
 }
 
 void SimulatedPlaceholder::cancelForReason(const ErrorRecord& reason, CoordinationClient client) {
-    const RecordedCall call(service_.recorder_, kService, "cancelForReason", state_->identifier,
+    const RecordedCall call(service_.recorder_, kPlaceholder, "cancelForReason", state_->identifier,
                             reason, client);
     if (!state_->cancelled) state_->cancelled = SimulatedCancel{reason, client};
 }

@@ -10,7 +10,7 @@ namespace {
 
 constexpr std::string_view kPathTransferPromise = "PathTransferPromise";
 template <typename Interface>
-constexpr std::string_view kService = std::is_same_v<Interface, PathTransferPromise>
+constexpr std::string_view kPromise = std::is_same_v<Interface, PathTransferPromise>
                                           ? kPathTransferPromise
                                           : std::string_view("OutOfBandPromise");
 
@@ -18,25 +18,25 @@ constexpr std::string_view kService = std::is_same_v<Interface, PathTransferProm
 
 template <typename Interface>
 std::string SimulatedPromise<Interface>::name() const {
-    RecordedCall call(service_.recorder_, kService<Interface>, "name", state_->name);
+    RecordedCall call(service_.recorder_, kPromise<Interface>, "name", state_->name);
     return call.result(state_->name);
 }
 
 template <typename Interface>
 CoordinationClient SimulatedPromise<Interface>::clientIdentifier() const {
-    RecordedCall call(service_.recorder_, kService<Interface>, "clientIdentifier", state_->name);
+    RecordedCall call(service_.recorder_, kPromise<Interface>, "clientIdentifier", state_->name);
     return call.result(state_->client);
 }
 
 template <typename Interface>
 double SimulatedPromise<Interface>::percentComplete() const {
-    RecordedCall call(service_.recorder_, kService<Interface>, "percentComplete", state_->name);
+    RecordedCall call(service_.recorder_, kPromise<Interface>, "percentComplete", state_->name);
     return call.result(state_->percent);
 }
 
 template <typename Interface>
 void SimulatedPromise<Interface>::setPercentComplete(double percent) {
-    [[maybe_unused]] const RecordedCall call(service_.recorder_, kService<Interface>,
+    [[maybe_unused]] const RecordedCall call(service_.recorder_, kPromise<Interface>,
                                              "setPercentComplete", state_->name, percent);
     if (state_->over) return;
     state_->percent = percent;
@@ -45,13 +45,13 @@ void SimulatedPromise<Interface>::setPercentComplete(double percent) {
 
 template <typename Interface>
 bool SimulatedPromise<Interface>::isComplete() const {
-    RecordedCall call(service_.recorder_, kService<Interface>, "isComplete", state_->name);
+    RecordedCall call(service_.recorder_, kPromise<Interface>, "isComplete", state_->name);
     return call.result(state_->complete);
 }
 
 template <typename Interface>
 void SimulatedPromise<Interface>::setComplete() {
-    [[maybe_unused]] const RecordedCall call(service_.recorder_, kService<Interface>, "setComplete",
+    [[maybe_unused]] const RecordedCall call(service_.recorder_, kPromise<Interface>, "setComplete",
                                              state_->name);
     if (state_->over || !state_->isAwaited()) return;
     state_->complete = true;
@@ -62,7 +62,7 @@ void SimulatedPromise<Interface>::setComplete() {
 template <typename Interface>
 void SimulatedPromise<Interface>::cancelForReason(const ErrorRecord& reason,
                                                   CoordinationClient client) {
-    [[maybe_unused]] const RecordedCall call(service_.recorder_, kService<Interface>,
+    [[maybe_unused]] const RecordedCall call(service_.recorder_, kPromise<Interface>,
                                              "cancelForReason", state_->name, reason, client);
     service_.cancelPromise(*state_, reason, client);
 }

@@ -9,7 +9,7 @@
 namespace appsync {
 namespace {
 
-constexpr const char* kTemporaryMark = ".appsync-lost0";
+constexpr const char* kLostMark = ".appsync-lost0";
 
 FileNode::Contents share(Bytes bytes) { return std::make_shared<const Bytes>(std::move(bytes)); }
 
@@ -86,7 +86,7 @@ class FileJournal::Crash {
         if (operation.written == Written::Nothing || operation.changes.empty()) return;
         if (loss_.kind != FileLoss::Kind::LastOperation && random_() % 2 == 0) return;
         const Change& change = operation.changes.back();
-        childrenOf(change.directory)["." + change.name + kTemporaryMark] = change.after;
+        childrenOf(change.directory)["." + change.name + kLostMark] = change.after;
     }
 
     static void put(FileNode::Children& children, const std::string& name,

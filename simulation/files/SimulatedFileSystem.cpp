@@ -17,7 +17,7 @@ bool isTemporary(std::string_view path) {
            path.substr(kTemporaryDirectory.size()).starts_with('/');
 }
 
-constexpr std::string_view kService = "FileSystem";
+constexpr std::string_view kFileSystem = "FileSystem";
 constexpr std::string_view kDefaultAccount = "mobile";
 constexpr std::size_t kLongestPath = 4095;
 constexpr std::size_t kLongestName = 255;
@@ -79,12 +79,12 @@ SimulatedFileSystem::SimulatedFileSystem(Recorder& recorder) : recorder_(recorde
 SimulatedFileSystem::~SimulatedFileSystem() = default;
 
 bool SimulatedFileSystem::itemExists(const std::string& path) {
-    RecordedCall call(recorder_, kService, "itemExists", path);
+    RecordedCall call(recorder_, kFileSystem, "itemExists", path);
     return call.result(exists(path));
 }
 
 Result<ItemAttributes> SimulatedFileSystem::attributes(const std::string& path) {
-    RecordedCall call(recorder_, kService, "attributes", path);
+    RecordedCall call(recorder_, kFileSystem, "attributes", path);
     NodePointer node;
     int error = fault(FileOperation::Attributes, path);
     if (error == 0) error = resolve(path, node);
@@ -98,7 +98,7 @@ Result<ItemAttributes> SimulatedFileSystem::attributes(const std::string& path) 
 Status SimulatedFileSystem::createDirectory(const std::string& path, bool withIntermediates,
                                             const FileAttributes* attributes) {
     const FileAttributes wanted = attributes != nullptr ? *attributes : FileAttributes{};
-    RecordedCall call(recorder_, kService, "createDirectory", path,
+    RecordedCall call(recorder_, kFileSystem, "createDirectory", path,
                       withIntermediates ? "with intermediates" : "alone",
                       attributes != nullptr ? callText(wanted) : "(null)");
     int error = fault(FileOperation::CreateDirectory, path);
@@ -111,7 +111,7 @@ Status SimulatedFileSystem::createDirectory(const std::string& path, bool withIn
 }
 
 Status SimulatedFileSystem::removeItem(const std::string& path) {
-    RecordedCall call(recorder_, kService, "removeItem", path);
+    RecordedCall call(recorder_, kFileSystem, "removeItem", path);
     int error = fault(FileOperation::RemoveItem, path);
     if (error == 0) error = removeAt(path);
     tell(error, "removeItem", path);
@@ -119,7 +119,7 @@ Status SimulatedFileSystem::removeItem(const std::string& path) {
 }
 
 Status SimulatedFileSystem::moveItem(const std::string& from, const std::string& to) {
-    RecordedCall call(recorder_, kService, "moveItem", from, to);
+    RecordedCall call(recorder_, kFileSystem, "moveItem", from, to);
     int error = fault(FileOperation::MoveItem, from);
     if (error == 0) error = moveTo(from, to);
     tell(error, "moveItem", from + ", " + to);
@@ -127,7 +127,7 @@ Status SimulatedFileSystem::moveItem(const std::string& from, const std::string&
 }
 
 Status SimulatedFileSystem::copyItem(const std::string& from, const std::string& to) {
-    RecordedCall call(recorder_, kService, "copyItem", from, to);
+    RecordedCall call(recorder_, kFileSystem, "copyItem", from, to);
     int error = fault(FileOperation::CopyItem, from);
     if (error == 0) error = copyTo(from, to);
     tell(error, "copyItem", from + ", " + to);
@@ -135,7 +135,7 @@ Status SimulatedFileSystem::copyItem(const std::string& from, const std::string&
 }
 
 Result<Bytes> SimulatedFileSystem::readFile(const std::string& path) {
-    RecordedCall call(recorder_, kService, "readFile", path);
+    RecordedCall call(recorder_, kFileSystem, "readFile", path);
     NodePointer node;
     int error = fault(FileOperation::ReadFile, path);
     if (error == 0) error = regularFileAt(path, node);
@@ -144,7 +144,7 @@ Result<Bytes> SimulatedFileSystem::readFile(const std::string& path) {
 }
 
 Status SimulatedFileSystem::writeFileAtomically(const std::string& path, ByteView contents) {
-    RecordedCall call(recorder_, kService, "writeFileAtomically", path, contents);
+    RecordedCall call(recorder_, kFileSystem, "writeFileAtomically", path, contents);
     int error = fault(FileOperation::WriteFileAtomically, path);
     const Written written = isTemporary(path) ? Written::Unsynced : Written::Synced;
     if (error == 0) error = replaceFile(path, share(contents), {}, written);
@@ -154,7 +154,7 @@ Status SimulatedFileSystem::writeFileAtomically(const std::string& path, ByteVie
 
 Status SimulatedFileSystem::createFile(const std::string& path, ByteView contents,
                                        const FileAttributes& attributes) {
-    RecordedCall call(recorder_, kService, "createFile", path, contents, attributes);
+    RecordedCall call(recorder_, kFileSystem, "createFile", path, contents, attributes);
     int error = fault(FileOperation::CreateFile, path);
     if (error == 0) error = checkAttributes(attributes);
     if (error == 0) error = replaceFile(path, share(contents), attributes, Written::Unsynced);
@@ -163,7 +163,7 @@ Status SimulatedFileSystem::createFile(const std::string& path, ByteView content
 }
 
 Status SimulatedFileSystem::setTimesToNow(const std::string& path) {
-    RecordedCall call(recorder_, kService, "setTimesToNow", path);
+    RecordedCall call(recorder_, kFileSystem, "setTimesToNow", path);
     NodePointer node;
     int error = fault(FileOperation::SetTimesToNow, path);
     if (error == 0) error = resolve(path, node);
@@ -173,7 +173,7 @@ Status SimulatedFileSystem::setTimesToNow(const std::string& path) {
 }
 
 std::string SimulatedFileSystem::temporaryDirectory() {
-    RecordedCall call(recorder_, kService, "temporaryDirectory");
+    RecordedCall call(recorder_, kFileSystem, "temporaryDirectory");
     return call.result(std::string(kTemporaryDirectory));
 }
 
@@ -396,7 +396,7 @@ void SimulatedFileSystem::recordRemovals(const NodePointer& directory) {
 
 void SimulatedFileSystem::tell(int error, std::string_view method, const std::string& arguments) {
     if (error != 0 || !recorder_.isChangeListening()) return;
-    recorder_.filesChanged(std::string(kService) + "." + std::string(method) + "(" + arguments +
+    recorder_.filesChanged(std::string(kFileSystem) + "." + std::string(method) + "(" + arguments +
                            ")");
 }
 

@@ -12,16 +12,16 @@
 namespace appsync {
 namespace {
 
-constexpr std::string_view kService = "AppRegistry";
-constexpr std::string_view kObserver = "AppRegistryObserver";
-constexpr std::int64_t kRefused = 1;
+constexpr std::string_view kAppRegistry = "AppRegistry";
+constexpr std::string_view kRegistryObserver = "AppRegistryObserver";
+constexpr std::int64_t kRegistryRefused = 1;
 constexpr std::int64_t kNotFound = 2;
 constexpr std::int64_t kPackageRefused = 1;
 constexpr const char* kPlaceholders = "/var/containers/Bundle/Placeholder";
 constexpr const char* kApplications = "/var/containers/Bundle/Application";
 
-ErrorRecord refused(const std::string& why) {
-    return ErrorRecord::make(kRegistryErrorDomain, kRefused, why);
+ErrorRecord registryRefused(const std::string& why) {
+    return ErrorRecord::make(kRegistryErrorDomain, kRegistryRefused, why);
 }
 
 ErrorRecord packageRefused(const std::string& why) {
@@ -36,11 +36,12 @@ bool isDemoted(std::uint64_t installType) {
 Result<std::string> checkedIdentifier(const PropertyList& options, std::string_view packageType) {
     const std::string* type = options.findString(PackageTypeKey);
     if (type == nullptr || *type != packageType) {
-        return refused("the package type is not " + std::string(packageType));
+        return registryRefused("the package type is not " + std::string(packageType));
     }
     const std::string* identifier = options.findString(BundleIdentifierKey);
-    if (identifier == nullptr) return refused("the options name no bundle identifier");
-    if (!isLegalIdentifier(*identifier)) return refused("'" + *identifier + "' is no identifier");
+    if (identifier == nullptr) return registryRefused("the options name no bundle identifier");
+    if (!isLegalIdentifier(*identifier))
+        return registryRefused("'" + *identifier + "' is no identifier");
     return *identifier;
 }
 
@@ -99,7 +100,7 @@ SimulatedAppRegistry::~SimulatedAppRegistry() = default;
 std::optional<AppProxy> SimulatedAppRegistry::proxyForIdentifier(const std::string& identifier,
                                                                  Placeholders placeholders) {
     const bool included = placeholders == Placeholders::Included;
-    RecordedCall call(recorder_, kService, "proxyForIdentifier", identifier,
+    RecordedCall call(recorder_, kAppRegistry, "proxyForIdentifier", identifier,
                       included ? "placeholders included" : "placeholders excluded");
     std::optional<AppProxy> proxy = included ? placeholder(identifier) : std::nullopt;
     if (!proxy) proxy = installed(identifier);
@@ -107,12 +108,13 @@ std::optional<AppProxy> SimulatedAppRegistry::proxyForIdentifier(const std::stri
 }
 
 bool SimulatedAppRegistry::isApplicationInstalled(const std::string& identifier) {
-    RecordedCall call(recorder_, kService, "isApplicationInstalled", identifier);
+    RecordedCall call(recorder_, kAppRegistry, "isApplicationInstalled", identifier);
     return call.result(find(identifier) != nullptr);
 }
 
 void SimulatedAppRegistry::enumerateBundles(BundleType type, const ProxyCallback& callback) {
-    const RecordedCall call(recorder_, kService, "enumerateBundles", static_cast<unsigned>(type));
+    const RecordedCall call(recorder_, kAppRegistry, "enumerateBundles",
+                            static_cast<unsigned>(type));
     bool stop = false;
     for (const AppProxy& proxy : bundles(type)) {
         callback(proxy, stop);
@@ -139,7 +141,7 @@ std::vector<AppProxy> SimulatedAppRegistry::bundles(BundleType type) const {
 
 std::shared_ptr<InstallProgressRecord> SimulatedAppRegistry::installProgress(const AppProxy& proxy,
                                                                              std::uint64_t phase) {
-    RecordedCall call(recorder_, kService, "installProgress", proxy, phase);
+    RecordedCall call(recorder_, kAppRegistry, "installProgress", proxy, phase);
     const Application* application = find(proxy.applicationIdentifier);
     const bool found = application != nullptr && application->progress != nullptr;
     std::shared_ptr<SimulatedProgressRecord> record = found ? application->progress : nullptr;
@@ -150,7 +152,7 @@ std::shared_ptr<InstallProgressRecord> SimulatedAppRegistry::installProgress(con
 void SimulatedAppRegistry::finishInstallPhase(InstallProgressRecord& record) {
     auto* simulated = dynamic_cast<SimulatedProgressRecord*>(&record);
     if (simulated == nullptr) throw SimulationFailure("the record is of another registry");
-    const RecordedCall call(recorder_, kService, "finishInstallPhase", simulated->identifier());
+    const RecordedCall call(recorder_, kAppRegistry, "finishInstallPhase", simulated->identifier());
     if (simulated->isOver()) return;
     simulated->setValues(afterPhase(simulated->values()));
     recorder_.recordsChanged("the progress of " + simulated->identifier(), Persistence::Soon);
@@ -160,7 +162,7 @@ void SimulatedAppRegistry::finishInstallPhase(InstallProgressRecord& record) {
 // Changes.
 
 Status SimulatedAppRegistry::installPackage(const FileURL& package, const PropertyList& options) {
-    RecordedCall call(recorder_, kService, "installPackage", package, options);
+    RecordedCall call(recorder_, kAppRegistry, "installPackage", package, options);
     return call.result(installPackageNow(package, options));
 }
 
@@ -245,7 +247,7 @@ void SimulatedAppRegistry::commitPackage(const std::string& identifier, const st
 
 Status SimulatedAppRegistry::installPlaceholderBundle(const FileURL& directory,
                                                       const PropertyList& options) {
-    RecordedCall call(recorder_, kService, "installPlaceholderBundle", directory, options);
+    RecordedCall call(recorder_, kAppRegistry, "installPlaceholderBundle", directory, options);
     return call.result(installPlaceholderNow(directory, options));
 }
 
@@ -256,7 +258,7 @@ Status SimulatedAppRegistry::installPlaceholderNow(const FileURL& directory,
     const PropertyList* type = options.find(InstallTypeKey);
     const std::optional<std::uint64_t> installType =
         type != nullptr ? type->asUnsigned() : std::nullopt;
-    if (!installType) return refused("the options name no install type");
+    if (!installType) return registryRefused("the options name no install type");
     if (Status failure = takeFailure(placeholderFailures_, *identifier); !failure) return failure;
     AppProxy proxy = proxyWithUsualPaths(*identifier, true);
     proxy.installType = *installType;
@@ -290,12 +292,12 @@ Status SimulatedAppRegistry::describeFromBundle(const std::string& directory,
                                                 AppProxy& proxy) const {
     const std::string path = directory + "/Info.plist";
     const std::optional<Bytes> bytes = files_.contents(path);
-    if (!bytes) return refused("there is no '" + path + "'");
+    if (!bytes) return registryRefused("there is no '" + path + "'");
     const Result<PropertyList> info = codec_.parse(*bytes);
-    if (!info) return refused("'" + path + "' cannot be read");
+    if (!info) return registryRefused("'" + path + "' cannot be read");
     const std::string* identifier = info->findString(BundleIdentifierKey);
     if (identifier == nullptr || *identifier != proxy.applicationIdentifier) {
-        return refused("'" + path + "' is not that of " + proxy.applicationIdentifier);
+        return registryRefused("'" + path + "' is not that of " + proxy.applicationIdentifier);
     }
     if (const std::string* version = info->findString(BundleVersionKey)) {
         proxy.bundleVersion = *version;
@@ -308,14 +310,15 @@ Status SimulatedAppRegistry::describeFromBundle(const std::string& directory,
 
 Status SimulatedAppRegistry::uninstallApplication(const std::string& identifier,
                                                   const PropertyList& options) {
-    RecordedCall call(recorder_, kService, "uninstallApplication", identifier, options);
+    RecordedCall call(recorder_, kAppRegistry, "uninstallApplication", identifier, options);
     return call.result(uninstallNow(identifier, options));
 }
 
 Status SimulatedAppRegistry::uninstallNow(const std::string& identifier,
                                           const PropertyList& options) {
-    if (!isLegalIdentifier(identifier)) return refused("'" + identifier + "' is no identifier");
-    if (!options.isNull() && !options.isMap()) return refused("the options are no map");
+    if (!isLegalIdentifier(identifier))
+        return registryRefused("'" + identifier + "' is no identifier");
+    if (!options.isNull() && !options.isMap()) return registryRefused("the options are no map");
     if (Status failure = takeFailure(uninstallFailures_, identifier); !failure) return failure;
     const PropertyList* only = options.find(UninstallPlaceholderOnlyKey);
     const bool placeholderOnly = only != nullptr && only->booleanConversion().value_or(false);
@@ -371,7 +374,7 @@ void SimulatedAppRegistry::dropIfEmpty(const std::string& identifier) {
 // Observers.
 
 void SimulatedAppRegistry::addObserver(std::weak_ptr<AppRegistryObserver> observer) {
-    const RecordedCall call(recorder_, kService, "addObserver");
+    const RecordedCall call(recorder_, kAppRegistry, "addObserver");
     auto subscription = std::make_shared<Subscription>();
     subscription->address = observer.lock().get();
     subscription->observer = std::move(observer);
@@ -381,7 +384,7 @@ void SimulatedAppRegistry::addObserver(std::weak_ptr<AppRegistryObserver> observ
 }
 
 void SimulatedAppRegistry::removeObserver(const AppRegistryObserver* observer) {
-    const RecordedCall call(recorder_, kService, "removeObserver");
+    const RecordedCall call(recorder_, kAppRegistry, "removeObserver");
     const auto found = std::find_if(subscriptions_.begin(), subscriptions_.end(),
                                     [&](const auto& each) { return each->address == observer; });
     if (found == subscriptions_.end()) return;
@@ -417,7 +420,7 @@ void SimulatedAppRegistry::deliverReport(Subscription& subscription,
     Subscription::Lists lists{identifiersOf(now.prioritized), identifiersOf(now.paused)};
     if (subscription.heard == lists) return;
     subscription.heard = std::move(lists);
-    const RecordedCall call(recorder_, kObserver, "applicationInstallsArePrioritized",
+    const RecordedCall call(recorder_, kRegistryObserver, "applicationInstallsArePrioritized",
                             now.prioritized, now.paused);
     if (subscription.removed) return;
     observer.applicationInstallsArePrioritized(now.prioritized, now.paused);
@@ -427,7 +430,8 @@ void SimulatedAppRegistry::deliverCancel(Subscription& subscription,
                                          AppRegistryObserver& observer) const {
     const std::vector<AppProxy> cancelled = std::move(subscription.cancels.front());
     subscription.cancels.pop_front();
-    const RecordedCall call(recorder_, kObserver, "applicationInstallsDidCancel", cancelled);
+    const RecordedCall call(recorder_, kRegistryObserver, "applicationInstallsDidCancel",
+                            cancelled);
     if (subscription.removed) return;
     observer.applicationInstallsDidCancel(cancelled);
 }

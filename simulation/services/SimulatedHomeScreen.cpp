@@ -6,7 +6,7 @@
 
 namespace appsync {
 namespace {
-constexpr std::string_view kService = "HomeScreenService";
+constexpr std::string_view kHomeScreenService = "HomeScreenService";
 constexpr std::string_view kConnectionService = "HomeScreenConnection";
 }  // namespace
 
@@ -51,7 +51,7 @@ class SimulatedHomeScreen::Assertion : public TerminationAssertion {
 };
 
 std::shared_ptr<HomeScreenConnection> SimulatedHomeScreen::blockableConnection() {
-    RecordedCall call(recorder_, kService, "blockableConnection");
+    RecordedCall call(recorder_, kHomeScreenService, "blockableConnection");
     std::shared_ptr<Connection> connection;
     if (reachable_) connection = std::make_shared<Connection>(*this);
     return call.result(std::move(connection), reachable_ ? "a connection" : "(null)");
@@ -59,7 +59,8 @@ std::shared_ptr<HomeScreenConnection> SimulatedHomeScreen::blockableConnection()
 
 TerminationAssertionResult SimulatedHomeScreen::takeTerminationAssertion(
     const std::string& identifier, std::uint64_t reason) {
-    RecordedCall call(recorder_, kService, "takeTerminationAssertion", identifier, reason);
+    RecordedCall call(recorder_, kHomeScreenService, "takeTerminationAssertion", identifier,
+                      reason);
     if (reason != 0) throw SimulationFailure("the reason of a termination assertion is always 0");
     TerminationAssertionResult result;
     result.outcome = outcomeFor(identifier);

@@ -8,11 +8,13 @@
 namespace appsync {
 namespace {
 
-constexpr std::string_view kService = "IconRenderer";
+constexpr std::string_view kIconRenderer = "IconRenderer";
 constexpr std::string_view kDestinationService = "ImageDestination";
 
+}  // namespace
+
 /// Counts itself as long as it lives.
-class Counted {
+class SimulatedIconRenderer::Counted {
   public:
     explicit Counted(std::size_t& count) : count_(count) { ++count_; }
     ~Counted() { --count_; }
@@ -22,8 +24,6 @@ class Counted {
   private:
     std::size_t& count_;
 };
-
-}  // namespace
 
 class SimulatedIconRenderer::Bundle : public AppBundle {
   public:
@@ -82,7 +82,7 @@ class SimulatedIconRenderer::Destination : public ImageDestination {
 };
 
 std::unique_ptr<AppBundle> SimulatedIconRenderer::openBundle(const FileURL& url) {
-    RecordedCall call(recorder_, kService, "openBundle", url);
+    RecordedCall call(recorder_, kIconRenderer, "openBundle", url);
     if (fails(IconStep::OpenBundle)) return call.result(std::unique_ptr<Bundle>(), "(null)");
     return call.result(std::make_unique<Bundle>(liveObjects_, url.path()), "a bundle");
 }
@@ -90,14 +90,15 @@ std::unique_ptr<AppBundle> SimulatedIconRenderer::openBundle(const FileURL& url)
 std::unique_ptr<IconImage> SimulatedIconRenderer::homeScreenIcon(const AppBundle& bundle) {
     const auto* simulated = dynamic_cast<const Bundle*>(&bundle);
     if (simulated == nullptr) throw SimulationFailure("the bundle is of another renderer");
-    RecordedCall call(recorder_, kService, "homeScreenIcon", simulated->path);
+    RecordedCall call(recorder_, kIconRenderer, "homeScreenIcon", simulated->path);
     if (fails(IconStep::HomeScreenIcon)) return call.result(std::unique_ptr<Image>(), "(null)");
     return call.result(std::make_unique<Image>(liveObjects_, simulated->path), "an image");
 }
 
 std::unique_ptr<ImageDestination> SimulatedIconRenderer::createImageDestination(
     std::string_view typeIdentifier, std::size_t imageCount, Bytes& buffer) {
-    RecordedCall call(recorder_, kService, "createImageDestination", typeIdentifier, imageCount);
+    RecordedCall call(recorder_, kIconRenderer, "createImageDestination", typeIdentifier,
+                      imageCount);
     if (fails(IconStep::CreateImageDestination) || typeIdentifier != "public.png") {
         return call.result(std::unique_ptr<Destination>(), "(null)");
     }

@@ -31,6 +31,7 @@ class SimulatedIconRenderer : public IconRenderer {
     [[nodiscard]] std::size_t liveObjects() const { return liveObjects_; }
 
   private:
+    class Counted;
     class Bundle;
     class Image;
     class Destination;

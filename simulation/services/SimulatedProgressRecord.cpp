@@ -7,7 +7,7 @@
 
 namespace appsync {
 namespace {
-constexpr std::string_view kService = "InstallProgressRecord";
+constexpr std::string_view kProgressRecord = "InstallProgressRecord";
 }
 
 SimulatedProgressRecord::SimulatedProgressRecord(Recorder& recorder, std::string identifier,
@@ -17,12 +17,12 @@ SimulatedProgressRecord::SimulatedProgressRecord(Recorder& recorder, std::string
       stateChanged_(std::move(stateChanged)) {}
 
 std::uint64_t SimulatedProgressRecord::installState() const {
-    RecordedCall call(recorder_, kService, "installState", identifier_);
+    RecordedCall call(recorder_, kProgressRecord, "installState", identifier_);
     return call.result(values_.state);
 }
 
 void SimulatedProgressRecord::setInstallState(std::uint64_t state) {
-    const RecordedCall call(recorder_, kService, "setInstallState", identifier_, state);
+    const RecordedCall call(recorder_, kProgressRecord, "setInstallState", identifier_, state);
     if (over_) return;
     values_.state = state;
     tell();
@@ -30,39 +30,40 @@ void SimulatedProgressRecord::setInstallState(std::uint64_t state) {
 }
 
 std::uint64_t SimulatedProgressRecord::installPhase() const {
-    RecordedCall call(recorder_, kService, "installPhase", identifier_);
+    RecordedCall call(recorder_, kProgressRecord, "installPhase", identifier_);
     return call.result(values_.phase);
 }
 
 void SimulatedProgressRecord::setInstallPhase(std::uint64_t phase) {
-    const RecordedCall call(recorder_, kService, "setInstallPhase", identifier_, phase);
+    const RecordedCall call(recorder_, kProgressRecord, "setInstallPhase", identifier_, phase);
     if (over_) return;
     values_.phase = phase;
     tell();
 }
 
 std::int64_t SimulatedProgressRecord::totalUnitCount() const {
-    RecordedCall call(recorder_, kService, "totalUnitCount", identifier_);
+    RecordedCall call(recorder_, kProgressRecord, "totalUnitCount", identifier_);
     return call.result(values_.total);
 }
 
 void SimulatedProgressRecord::setTotalUnitCount(std::int64_t count) {
-    const RecordedCall call(recorder_, kService, "setTotalUnitCount", identifier_, count);
+    const RecordedCall call(recorder_, kProgressRecord, "setTotalUnitCount", identifier_, count);
     if (!over_) values_.total = count;
 }
 
 std::int64_t SimulatedProgressRecord::completedUnitCount() const {
-    RecordedCall call(recorder_, kService, "completedUnitCount", identifier_);
+    RecordedCall call(recorder_, kProgressRecord, "completedUnitCount", identifier_);
     return call.result(values_.completed);
 }
 
 void SimulatedProgressRecord::setCompletedUnitCount(std::int64_t count) {
-    const RecordedCall call(recorder_, kService, "setCompletedUnitCount", identifier_, count);
+    const RecordedCall call(recorder_, kProgressRecord, "setCompletedUnitCount", identifier_,
+                            count);
     if (!over_) values_.completed = count;
 }
 
 void SimulatedProgressRecord::cancel() {
-    const RecordedCall call(recorder_, kService, "cancel", identifier_);
+    const RecordedCall call(recorder_, kProgressRecord, "cancel", identifier_);
     if (over_) return;
     values_.state = kInstallStateCanceled;
     tell();
@@ -70,7 +71,7 @@ void SimulatedProgressRecord::cancel() {
 }
 
 std::string SimulatedProgressRecord::description() const {
-    RecordedCall call(recorder_, kService, "description", identifier_);
+    RecordedCall call(recorder_, kProgressRecord, "description", identifier_);
     return call.result(text());
 }
 

@@ -7,7 +7,7 @@
 namespace appsync {
 namespace {
 
-constexpr std::string_view kService = "PropertyListSerialization";
+constexpr std::string_view kPropertyLists = "PropertyListSerialization";
 
 ErrorRecord takeFirst(std::deque<ErrorRecord>& errors) {
     ErrorRecord error = std::move(errors.front());
@@ -18,7 +18,7 @@ ErrorRecord takeFirst(std::deque<ErrorRecord>& errors) {
 }  // namespace
 
 Result<PropertyList> SimulatedPropertyLists::parse(ByteView bytes) {
-    RecordedCall call(recorder_, kService, "parse", bytes);
+    RecordedCall call(recorder_, kPropertyLists, "parse", bytes);
     if (!parseFailures_.empty()) {
         return call.result(Result<PropertyList>(takeFirst(parseFailures_)));
     }
@@ -27,7 +27,7 @@ Result<PropertyList> SimulatedPropertyLists::parse(ByteView bytes) {
 
 Result<Bytes> SimulatedPropertyLists::serialize(const PropertyList& value,
                                                 PropertyListFormat format) {
-    RecordedCall call(recorder_, kService, "serialize", value,
+    RecordedCall call(recorder_, kPropertyLists, "serialize", value,
                       format == PropertyListFormat::Xml ? "XML" : "binary");
     if (!serializeFailures_.empty()) {
         return call.result(Result<Bytes>(takeFirst(serializeFailures_)));
@@ -37,7 +37,7 @@ Result<Bytes> SimulatedPropertyLists::serialize(const PropertyList& value,
 
 bool SimulatedPropertyLists::replaceText(Bytes& bytes, std::size_t index, std::string_view key,
                                          std::string_view text) {
-    RecordedCall call(recorder_, kService, "replaceText", index, key, text);
+    RecordedCall call(recorder_, kPropertyLists, "replaceText", index, key, text);
     Bytes changed = bytes;
     const bool replaced = call.result(codec_.replaceText(changed, index, key, text));
     if (replaced) bytes = std::move(changed);

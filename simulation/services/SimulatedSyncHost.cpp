@@ -6,11 +6,11 @@
 
 namespace appsync {
 namespace {
-constexpr std::string_view kService = "SyncHost";
+constexpr std::string_view kSyncHost = "SyncHost";
 }
 
 std::string SimulatedSyncHost::mainBundleIdentifier() const {
-    RecordedCall call(recorder_, kService, "mainBundleIdentifier");
+    RecordedCall call(recorder_, kSyncHost, "mainBundleIdentifier");
     return call.result(main_);
 }
 
@@ -18,12 +18,12 @@ std::string SimulatedSyncHost::mainBundleIdentifier() const {
 std::string SimulatedSyncHost::pluginBundleIdentifier() const { return plugin_; }
 
 bool SimulatedSyncHost::isRecoverableError(const ErrorRecord& error) const {
-    RecordedCall call(recorder_, kService, "isRecoverableError", error);
+    RecordedCall call(recorder_, kSyncHost, "isRecoverableError", error);
     return call.result(recoverable_(error));
 }
 
 TransferService* SimulatedSyncHost::transferService() {
-    RecordedCall call(recorder_, kService, "transferService");
+    RecordedCall call(recorder_, kSyncHost, "transferService");
     return call.result(transfers_, transfers_ != nullptr ? "a service" : "(null)");
 }
 

@@ -8,27 +8,27 @@
 
 namespace appsync {
 namespace {
-constexpr std::string_view kService = "TransferService";
+constexpr std::string_view kTransferService = "TransferService";
 }
 
 bool SimulatedTransferService::canCancelTransfers() const {
-    RecordedCall call(recorder_, kService, "canCancelTransfers");
+    RecordedCall call(recorder_, kTransferService, "canCancelTransfers");
     return call.result(canCancel_);
 }
 
 void SimulatedTransferService::cancelTransferForFailedAsset(const SyncAsset& asset) {
-    const RecordedCall call(recorder_, kService, "cancelTransferForFailedAsset", asset);
+    const RecordedCall call(recorder_, kTransferService, "cancelTransferForFailedAsset", asset);
     if (!canCancel_) throw SimulationFailure("this device service cancels no transfers");
 }
 
 bool SimulatedTransferService::canPrioritizeAssets() const {
-    RecordedCall call(recorder_, kService, "canPrioritizeAssets");
+    RecordedCall call(recorder_, kTransferService, "canPrioritizeAssets");
     return call.result(canPrioritize_);
 }
 
 void SimulatedTransferService::prioritizeAsset(const SyncAsset& asset,
                                                PrioritizeCompletion completion) {
-    const RecordedCall call(recorder_, kService, "prioritizeAsset", asset);
+    const RecordedCall call(recorder_, kTransferService, "prioritizeAsset", asset);
     if (!canPrioritize_) throw SimulationFailure("this device service prioritizes no assets");
     std::optional<ErrorRecord> error;
     if (auto& failures = failures_[asset.identifier]; !failures.empty()) {
