@@ -8,15 +8,20 @@ function(appsync_add_folder target)
     target_sources(${target} PRIVATE "${CMAKE_CURRENT_SOURCE_DIR}/CMakeLists.txt" ${sources})
 endfunction()
 
+# Compiles the sources of TARGET a dozen at a time, where that is asked for.
+function(appsync_merge_sources target)
+    if(APPSYNC_MERGE_SOURCES)
+        set_target_properties(${target} PROPERTIES UNITY_BUILD ON UNITY_BUILD_BATCH_SIZE 12)
+    endif()
+endfunction()
+
 # Settings that every library shares: includes are written from the root of the tree, or of the installed headers.
 function(appsync_finish_library target)
     set_target_properties(${target} PROPERTIES LINKER_LANGUAGE CXX)
     target_include_directories(${target} PUBLIC "$<BUILD_INTERFACE:${PROJECT_SOURCE_DIR}>"
                                                 "$<INSTALL_INTERFACE:include/appsync>")
     target_compile_features(${target} PUBLIC cxx_std_20)
-    if(APPSYNC_MERGE_SOURCES)
-        set_target_properties(${target} PROPERTIES UNITY_BUILD ON UNITY_BUILD_BATCH_SIZE 12)
-    endif()
+    appsync_merge_sources(${target})
 endfunction()
 
 # A static library TARGET of the calling folder's sources, linked with LIBRARIES.
@@ -55,5 +60,6 @@ function(appsync_tests)
     target_link_libraries(${target} PRIVATE ${ARGN} GTest::gmock GTest::gtest GTest::gtest_main Threads::Threads)
     target_precompile_headers(${target} REUSE_FROM appsync_test_headers)
     set_target_properties(${target} PROPERTIES RUNTIME_OUTPUT_DIRECTORY "${PROJECT_BINARY_DIR}/tests")
+    appsync_merge_sources(${target})
     add_test(NAME ${target} COMMAND ${target})
 endfunction()
