@@ -12,6 +12,10 @@ endfunction()
 function(appsync_merge_sources target)
     if(APPSYNC_MERGE_SOURCES)
         set_target_properties(${target} PROPERTIES UNITY_BUILD ON UNITY_BUILD_BATCH_SIZE 12)
+        if(CMAKE_CXX_COMPILER_ID STREQUAL "GNU")
+            # A source that is included looks to it like a header, which many may include.
+            target_compile_options(${target} PRIVATE -Wno-subobject-linkage)
+        endif()
     endif()
 endfunction()
 
