@@ -145,7 +145,7 @@ void CoordinatedInstaller::installNow(const Coordinator& coordinator) {
     }
 }
 
-Status CoordinatedInstaller::unpackAndCommit(const LiveCoordinator& coordinator) {
+Status CoordinatedInstaller::unpackAndCommit(LiveCoordinator& coordinator) {
     const auto asset = coordinator.promise(PromiseRole::Asset);
     const std::optional<std::string> path = asset ? asset->values().path : std::nullopt;
     const std::optional<FileURL> package =
@@ -158,7 +158,7 @@ Status CoordinatedInstaller::unpackAndCommit(const LiveCoordinator& coordinator)
     return installApplicationWith(
         context_, coordinator.identifier, *package, book_.installTypeOf(coordinator),
         [&](Database& database) -> Status {
-            const Result<bool> forgotten = forgetCoordinator(database, coordinator.id);
+            const Result<bool> forgotten = coordinator.forget(database);
             if (!forgotten) return forgotten.error();
             if (*forgotten) return {};
             return coordinationError(CoordinationErrorCode::Cancelled,

@@ -71,7 +71,7 @@ class CoordinatedInstaller {
     [[nodiscard]] bool runs(const std::string& identifier);
 
     void installNow(const Coordinator& coordinator);
-    Status unpackAndCommit(const LiveCoordinator& coordinator);
+    Status unpackAndCommit(LiveCoordinator& coordinator);
 
     const InstallContext context_;
     CoordinationBook& book_;

@@ -79,8 +79,11 @@ Lookup CoordinationBook::begin(CoordinatorKind kind, const std::string& identifi
     stored.client = client;
     const auto made = std::make_shared<LiveCoordinator>(stored, LiveCoordinator::Origin::New);
     if (access_ == Access::Look) return writeAtOnce(made);
-    const Coordinator known = keepUnlessBegun(made);
-    if (known != made) return answer(kind, known);
+    if (const Result<Coordinator> other = keepUnlessKnown(made); !other) {
+        return nothing(other.error());
+    } else if (*other != nullptr) {
+        return answer(kind, *other);
+    }
     saveLater(made);
     return {handle(made), true, std::nullopt};
 }
@@ -101,12 +104,24 @@ Lookup CoordinationBook::writeAtOnce(const Coordinator& made) {
                   InstallCoordinatorService::Creation::OnlyExisting);
 }
 
-// What another thread has begun meanwhile stays.
-CoordinationBook::Coordinator CoordinationBook::keepUnlessBegun(const Coordinator& made) {
+// What another thread has begun meanwhile stays, and so does what that one has got further with:
+// unless the database, which has that, tells that it is over.
+Result<CoordinationBook::Coordinator> CoordinationBook::keepUnlessKnown(const Coordinator& made) {
+    const Coordinator other = keep(made, nullptr);
+    if (other == nullptr || other->isBegun()) return other;
+    const Result<Coordinator> found = hearAndFind(made->identifier);
+    if (!found || *found != nullptr) return found;
+    return keep(made, other);
+}
+
+// Null when it is kept; else the one that goes on in its place. `over` does not.
+CoordinationBook::Coordinator CoordinationBook::keep(const Coordinator& made,
+                                                     const Coordinator& over) {
     const std::lock_guard lock(mutex_);
     Coordinator& known = coordinators_[made->identifier];
-    if (known == nullptr || !known->isBegun()) known = made;
-    return known;
+    if (known != nullptr && known != over && known->goesOn()) return known;
+    known = made;
+    return nullptr;
 }
 
 Status CoordinationBook::requireInstalled(const std::string& identifier) {

@@ -114,7 +114,8 @@ class CoordinationBook : public std::enable_shared_from_this<CoordinationBook> {
     [[nodiscard]] Status requireInstalled(const std::string& identifier);
     [[nodiscard]] Result<std::int64_t> takeId();
     [[nodiscard]] Coordinator begun(const std::string& identifier) const;
-    [[nodiscard]] Coordinator keepUnlessBegun(const Coordinator& made);
+    [[nodiscard]] Result<Coordinator> keepUnlessKnown(const Coordinator& made);
+    [[nodiscard]] Coordinator keep(const Coordinator& made, const Coordinator& over);
     [[nodiscard]] InstallCoordinatorService::Coordinator answer(CoordinatorKind kind,
                                                                 const Coordinator& found);
     Coordinator adopt(const StoredCoordinator& stored);

@@ -211,7 +211,7 @@ void CoordinationBook::finishWithoutInstall(const Coordinator& coordinator) {
     bool existed = false;
     const Status status =
         context_.database.change(Durability::Soon, [&](Database& database) -> Status {
-            const Result<bool> forgotten = forgetCoordinator(database, coordinator->id);
+            const Result<bool> forgotten = coordinator->forget(database);
             if (!forgotten) return forgotten.error();
             existed = *forgotten;
             return {};

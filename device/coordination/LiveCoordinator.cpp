@@ -3,6 +3,7 @@
 #include <algorithm>
 #include <utility>
 
+#include "device/database/Database.h"
 #include "device/values/DeviceError.h"
 
 namespace appsync {
@@ -179,6 +180,11 @@ bool LiveCoordinator::isBegun() const {
     return origin == Origin::New && !claimed_ && !ending_ && !ended_;
 }
 
+bool LiveCoordinator::goesOn() const {
+    const std::lock_guard lock(mutex_);
+    return !ending_ && !ended_;
+}
+
 bool LiveCoordinator::beginEnding() {
     const std::lock_guard lock(mutex_);
     if (ending_ || ended_) return false;
@@ -219,30 +225,55 @@ bool LiveCoordinator::beginSaving() {
     return !std::exchange(saving_, true);
 }
 
+std::optional<LiveCoordinator::Writing> LiveCoordinator::takeWriting(std::uint64_t losses) {
+    const std::lock_guard lock(mutex_);
+    saving_ = false;
+    if (ended_) return std::nullopt;
+    Writing writing;
+    writing.isNew = !std::exchange(isWritten_, true);
+    writing.mayBeLost = losses_ && *losses_ != losses && !ending_ && !isLeaving_;
+    losses_ = losses;
+    const bool hasChanged = std::exchange(rowChanged_, false);
+    if (hasChanged || writing.isNew || writing.mayBeLost) writing.row = snapshotLocked();
+    writing.pieces = pieces_;
+    return writing;
+}
+
+// Of one that was cancelled by somebody else the database tells.
+Result<bool> LiveCoordinator::saveRow(Database& database, const Writing& writing) const {
+    if (writing.isNew) return insertReserved(database, *writing.row);
+    const Result<bool> updated = updateCoordinator(database, *writing.row);
+    if (!updated || *updated || !writing.mayBeLost || origin != Origin::New) return updated;
+    const Result<bool> cancelled = wasCancelled(database, id);
+    if (!cancelled) return cancelled;
+    return *cancelled ? Result<bool>(false) : insertReserved(database, *writing.row);
+}
+
 Result<bool> LiveCoordinator::save(Database& database) {
-    std::vector<Piece> pieces;
-    std::optional<StoredCoordinator> now;
-    bool isNew = false;
-    {
-        const std::lock_guard lock(mutex_);
-        saving_ = false;
-        if (ended_) return false;
-        isNew = !std::exchange(isWritten_, true);
-        if (std::exchange(rowChanged_, false) || isNew) now = snapshotLocked();
-        pieces = pieces_;
-    }
-    if (now) {
-        const Result<bool> written =
-            isNew ? insertReserved(database, *now) : updateCoordinator(database, *now);
+    const std::optional<Writing> writing = takeWriting(database.losses());
+    if (!writing) return false;
+    if (writing->row) {
+        const Result<bool> written = saveRow(database, *writing);
         if (!written || !*written) return written;
     }
-    for (const Piece& piece : pieces) {
-        const std::optional<PromiseValues> values = piece.promise->takeChanged();
+    for (const Piece& piece : writing->pieces) {
+        std::optional<PromiseValues> values = piece.promise->takeChanged();
+        if (!values && writing->mayBeLost) values = piece.promise->values();
         if (!values) continue;
         const Status stored = storePromise(database, id, {piece.role, piece.position, *values});
         if (!stored) return stored.error();
     }
     return true;
+}
+
+Result<bool> LiveCoordinator::forget(Database& database) {
+    const Result<bool> saved = save(database);
+    if (!saved || !*saved) return saved;
+    {
+        const std::lock_guard lock(mutex_);
+        isLeaving_ = true;
+    }
+    return forgetCoordinator(database, id);
 }
 
 }  // namespace appsync

@@ -63,6 +63,8 @@ class LiveCoordinator {
 
     /// Whether it is a new one that goes on and that the database need not have yet.
     [[nodiscard]] bool isBegun() const;
+    /// Whether nobody has ended it yet, or is about to.
+    [[nodiscard]] bool goesOn() const;
 
     /// True for the one caller who may try to end it.
     [[nodiscard]] bool beginEnding();
@@ -75,9 +77,12 @@ class LiveCoordinator {
 
     /// True for the one caller who has to see to it that changes are written.
     [[nodiscard]] bool beginSaving();
-    /// Writes the changes that were not written yet, inside a transaction. False when it turns out
-    /// that the database has it no longer.
+    /// Writes the changes that were not written yet, inside a transaction; all of it where the
+    /// database has lost something since. False when it turns out that the database has it no
+    /// longer.
     [[nodiscard]] Result<bool> save(Database& database);
+    /// Takes it away with the transaction that installs it. False as that of `save`.
+    [[nodiscard]] Result<bool> forget(Database& database);
 
   private:
     struct Piece {  // by role and position
@@ -85,6 +90,16 @@ class LiveCoordinator {
         std::int64_t position;
         std::shared_ptr<LivePromise> promise;
     };
+
+    /// What is to be written, by which way. Nothing where it has ended.
+    struct Writing {
+        bool isNew = false;
+        bool mayBeLost = false;
+        std::optional<StoredCoordinator> row;  // where it has changed
+        std::vector<Piece> pieces;
+    };
+    [[nodiscard]] std::optional<Writing> takeWriting(std::uint64_t losses);
+    [[nodiscard]] Result<bool> saveRow(Database& database, const Writing& writing) const;
 
     [[nodiscard]] Status mayAdd(bool alreadyThere, const char* what) const;
     void removePiece(PromiseRole role);
@@ -106,6 +121,8 @@ class LiveCoordinator {
     bool saving_ = false;
     bool rowChanged_ = false;
     bool isWritten_ = false;
+    bool isLeaving_ = false;               // what installs it takes it away
+    std::optional<std::uint64_t> losses_;  // of the database, when it was written last
 };
 
 }  // namespace appsync

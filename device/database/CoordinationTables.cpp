@@ -348,6 +348,14 @@ Result<std::vector<Cancellation>> cancellationsSince(Database& database, std::in
     return all;
 }
 
+Result<bool> wasCancelled(Database& database, std::int64_t coordinator) {
+    Query rows = database.query("SELECT 1 FROM cancellations WHERE coordinator = ?");
+    rows.bind(coordinator);
+    const bool found = rows.next();
+    if (Status read = rows.status(); !read) return read.error();
+    return found;
+}
+
 Status forgetCancellations(Database& database, std::int64_t upTo) {
     return database.query("DELETE FROM cancellations WHERE id <= ?").bind(upTo).run();
 }

@@ -129,6 +129,8 @@ Status announceCancellation(Database& database, const Cancellation& cancellation
 /// Those that came after the one with that id, oldest first.
 [[nodiscard]] Result<std::vector<Cancellation>> cancellationsSince(Database& database,
                                                                    std::int64_t id);
+/// Whether somebody told that this coordinator was cancelled, and it is not forgotten yet.
+[[nodiscard]] Result<bool> wasCancelled(Database& database, std::int64_t coordinator);
 Status forgetCancellations(Database& database, std::int64_t upTo);
 
 /// Cancels whatever coordinator the identifier has, because what it was to put in place is being

@@ -242,7 +242,11 @@ Result<std::unique_ptr<Database>> Database::openNamed(const std::string& path,
     return database;
 }
 
-Database::Database(sqlite3* handle, std::string path) : handle_(handle), path_(std::move(path)) {}
+Database::Database(sqlite3* handle, std::string path) : handle_(handle), path_(std::move(path)) {
+    if (handle_ == nullptr) return;
+    sqlite3_rollback_hook(
+        handle_, [](void* self) { ++static_cast<Database*>(self)->losses_; }, this);
+}
 
 Database::~Database() {
     for (const auto& [sql, statement] : statements_) sqlite3_finalize(statement);
@@ -273,6 +277,11 @@ Result<std::int64_t> Database::integer(const char* sql) {
 }
 
 bool Database::inTransaction() const { return sqlite3_get_autocommit(handle_) == 0; }
+
+void Database::undoSince(const char* rollback) {
+    ++losses_;
+    query(rollback).run().ignore();
+}
 
 std::size_t Database::changedRows() const {
     return static_cast<std::size_t>(sqlite3_changes64(handle_));

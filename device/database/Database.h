@@ -106,6 +106,10 @@ class Database {
 
     /// Whether a transaction is open.
     [[nodiscard]] bool inTransaction() const;
+    /// How often what was written has not been kept: a transaction, or a part of one, was undone.
+    [[nodiscard]] std::uint64_t losses() const noexcept { return losses_; }
+    /// Undoes what was written since that savepoint.
+    void undoSince(const char* rollback);
     /// Rows that the last statement changed.
     [[nodiscard]] std::size_t changedRows() const;
     [[nodiscard]] const std::string& path() const noexcept { return path_; }
@@ -123,6 +127,7 @@ class Database {
     sqlite3* handle_;
     const std::string path_;
     std::unordered_map<const char*, sqlite3_stmt*> statements_;
+    std::uint64_t losses_ = 0;
 };
 
 }  // namespace appsync

@@ -261,7 +261,7 @@ Status DeviceDatabase::makeChange(const Change& change) {
     if (Status status = writer_->query("SAVEPOINT change").run(); !status) return status;
     Status status = change(*writer_);
     if (!writer_->inTransaction()) return status;
-    if (!status) writer_->query("ROLLBACK TO change").run().ignore();
+    if (!status) writer_->undoSince("ROLLBACK TO change");
     if (Status released = writer_->query("RELEASE change").run(); !released && status) {
         return released;
     }
