@@ -14,9 +14,11 @@ namespace appsync {
 namespace {
 
 constexpr std::chrono::milliseconds kStampInterval{250};
+// The log of a session grows all the time, and who is told of it asks for hundreds of lines.
+constexpr std::chrono::milliseconds kLogIntervalOfSession{1000};
 // Longer than any reading of a device that is not in somebody's way.
 constexpr std::chrono::seconds kLongestAnswering{3};
-constexpr int kShareOfTime = 30;
+constexpr int kShareOfTime = 60;
 constexpr std::chrono::seconds kLongestPause{3};
 // A session that is killed changes no file, and what stands in the way of a reading may go unseen.
 constexpr std::chrono::seconds kLongestTrust{2};
@@ -198,18 +200,24 @@ void ServedDevice::work(const std::deque<std::shared_ptr<Asked>>& questions) {
     const DeviceStamp stamp = deviceStampOf(path_);
     const bool reads = hasToRead(stamp);
     if (reads || !questions.empty()) {
+        const ReadingClock::time_point begin = ReadingClock::now();
         Result<std::unique_ptr<Device>> device = Device::open(path_);
-        if (reads) read(device, stamp);
+        if (reads) read(device, stamp, begin);
         answerAll(questions, device);
     }
-    const bool tellsOfLog = !reads && !(stamp.log == stamp_->log) &&
-                            ReadingClock::now() - lastLogChange_ >= kStampInterval;
-    if (tellsOfLog) {
-        stamp_->log = stamp.log;
-        lastLogChange_ = ReadingClock::now();
-        publish(viewer_.showLogChanged());
-    }
+    if (!reads && tellsOfLog(stamp)) publish(viewer_.showLogChanged());
     takeBackLocked();
+}
+
+// Whether the log has grown, and it is time to say so.
+bool ServedDevice::tellsOfLog(const DeviceStamp& stamp) {
+    if (stamp.log == toldLog_) return false;
+    const ReadingClock::duration interval = isUnderWay_ ? kLogIntervalOfSession : kStampInterval;
+    const ReadingClock::time_point now = ReadingClock::now();
+    if (now - lastLogChange_ < interval) return false;
+    toldLog_ = stamp.log;
+    lastLogChange_ = now;
+    return true;
 }
 
 bool ServedDevice::hasToRead(const DeviceStamp& stamp) const {
@@ -220,17 +228,17 @@ bool ServedDevice::hasToRead(const DeviceStamp& stamp) const {
     return !stamp.holdsSameAs(*stamp_);
 }
 
-void ServedDevice::read(Result<std::unique_ptr<Device>>& device, const DeviceStamp& stamp) {
-    const ReadingClock::time_point begin = ReadingClock::now();
+void ServedDevice::read(Result<std::unique_ptr<Device>>& device, const DeviceStamp& stamp,
+                        ReadingClock::time_point begin) {
     const Result<DeviceReading> reading =
         device ? readDevice(**device) : Result<DeviceReading>(device.error());
-    const bool logGrew = stamp_ && !(stamp.log == stamp_->log);
+    if (!stamp_) toldLog_ = stamp.log;  // what has grown nobody has seen
     stamp_ = stamp;
     hasFailed_ = !reading;
     isUnderWay_ = reading && reading->moment.session.isUnderWay;
     if (!isUnderWay_) forgetSeldom();
     std::shared_ptr<const DeviceView> view = viewer_.show(reading, stamp.log.size > 0);
-    if (logGrew) view = viewer_.showLogChanged();
+    if (tellsOfLog(stamp)) view = viewer_.showLogChanged();
     publish(std::move(view));
     lastReading_ = ReadingClock::now();
     const ReadingClock::duration pause = (lastReading_ - begin) * kShareOfTime;

@@ -25,9 +25,10 @@ class Device;
 /// A device that is shown to as many as want to see it: one thread looks at it for all of them.
 ///
 /// While somebody watches, it compares stamps four times a second, and reads the device only where
-/// they tell of a change; while a session is under way, so seldom that the reading takes a
-/// thirtieth of the time. It opens the device for each reading and closes it again, so that a
-/// device may be locked, damaged, removed and replaced as if nobody looked.
+/// they tell of a change; while a session is under way, so seldom that the reading takes a sixtieth
+/// of the time, and it tells once a second at most that the log has grown. It opens the device for
+/// each reading and closes it again, so that a device may be locked, damaged, removed and replaced
+/// as if nobody looked.
 class ServedDevice {
   public:
     /// `key` stands for it in an address. The bell outlives it.
@@ -52,7 +53,7 @@ class ServedDevice {
     using Question = std::function<HttpAnswer(Device& device)>;
     [[nodiscard]] HttpAnswer answer(Question question);
     /// The same of the one question that takes long and is asked again and again: while a session
-    /// is under way the last answer stands until asking anew takes at most a thirtieth of the time.
+    /// is under way the last answer stands until asking anew takes at most a sixtieth of the time.
     [[nodiscard]] HttpAnswer answerSeldom(Question question);
 
     /// The icon as it is shown for an identifier; 204 where there is none.
@@ -80,7 +81,9 @@ class ServedDevice {
     void waitForWork(std::unique_lock<std::mutex>& lock);
     void work(const std::deque<std::shared_ptr<Asked>>& questions);
     [[nodiscard]] bool hasToRead(const DeviceStamp& stamp) const;
-    void read(Result<std::unique_ptr<Device>>& device, const DeviceStamp& stamp);
+    [[nodiscard]] bool tellsOfLog(const DeviceStamp& stamp);
+    void read(Result<std::unique_ptr<Device>>& device, const DeviceStamp& stamp,
+              ReadingClock::time_point begin);
     void publish(std::shared_ptr<const DeviceView> view);
     void takeBackLocked();
     void answerAll(const std::deque<std::shared_ptr<Asked>>& questions,
@@ -117,6 +120,7 @@ class ServedDevice {
     bool isUnderWay_ = false;
     bool hasFailed_ = false;
     ReadingClock::time_point lastReading_;
+    ServedFileStamp toldLog_;                 // of which was told
     ReadingClock::time_point lastLogChange_;  // that was told
     ReadingClock::duration pause_{};          // until the next one
 };

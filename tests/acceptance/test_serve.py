@@ -434,6 +434,26 @@ def test_events_come_four_times_a_second_at_most(appsync, device, serving):
 
 
 @ON_ONE_PATH
+def test_the_log_of_a_session_is_told_of_once_a_second(appsync, device, library):
+    device.sync(library)
+    packages.make_library(library, 1, "2.0")
+    appsync("run", device.path, IDS[0])
+    serving = Serving(appsync, device.path)
+    sync = appsync.start("sync", device.path, library)
+    eventually(lambda: waiting(serving.view()))
+    events = Events(serving, "/api/device/device/events")
+    events.next()
+    begin = time.monotonic()
+    for _ in range(3):
+        with open(os.path.join(device.path, "log", "system.log"), "a") as file:
+            file.write(LINE % (1, 8, "info", "more"))
+        events.until(lambda event: "log" in event["changed"])
+    assert time.monotonic() - begin >= 1.9
+    sync.kill()
+    sync.wait()
+
+
+@ON_ONE_PATH
 def test_a_killed_session_is_seen_though_no_file_changes(appsync, device, library):
     device.sync(library)
     packages.make_library(library, 1, "2.0")
