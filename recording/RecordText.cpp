@@ -71,12 +71,19 @@ ContentSum sumInLanes(ByteView contents, std::index_sequence<Lane...>) {
     return sum;
 }
 
-/// Whether JSON takes all of it as it stands; most texts are so.
+/// Whether JSON takes all of it as it stands; most texts are so. Eight characters at a time.
 bool needsNoEscapes(std::string_view text) {
-    return std::all_of(text.begin(), text.end(), [](char each) {
+    const auto isPlain = [](char each) {
         const auto byte = static_cast<unsigned char>(each);
         return byte >= ' ' && byte < 0x7F && each != '"' && each != '\\';
-    });
+    };
+    constexpr std::size_t kStep = 8;
+    for (; text.size() >= kStep; text.remove_prefix(kStep)) {
+        bool arePlain = true;
+        for (std::size_t i = 0; i < kStep; ++i) arePlain = arePlain & isPlain(text[i]);
+        if (!arePlain) return false;
+    }
+    return std::all_of(text.begin(), text.end(), isPlain);
 }
 
 /// How many bytes the character that begins so has; 0 where none does.
@@ -112,6 +119,11 @@ bool isUtf8(std::string_view bytes) {
         bytes.remove_prefix(length);
     }
     return true;
+}
+
+bool isNumberedFormat(std::string_view format) {
+    constexpr std::size_t kLongest = 256;
+    return format.size() <= kLongest && isUtf8(format);
 }
 
 std::string base64(std::string_view bytes) {
@@ -154,35 +166,22 @@ std::string quoted(std::string_view text) {
     return result += '"';
 }
 
-void RecordText::separate() {
-    if (text_.empty() || text_.back() == '[' || text_.back() == '{' || text_.back() == ':') return;
-    text_ += ',';
-}
-
 void RecordText::member(std::string_view name) {
-    separate();
-    text_ += '"';
-    text_ += name;
-    text_ += "\":";
+    addName(name);
+    text_.put(':');
 }
-
-void RecordText::begin(char bracket) {
-    separate();
-    text_ += bracket;
-}
-
-void RecordText::end(char bracket) { text_ += bracket; }
 
 void RecordText::addLiteral(std::string_view text) {
     separate();
-    text_ += text;
+    text_.put(text);
 }
 
-void RecordText::addName(std::string_view name) {
+void RecordText::addName(std::string_view name, std::string_view rest) {
     separate();
-    text_ += '"';
-    text_ += name;
-    text_ += '"';
+    text_.put('"');
+    text_.put(name);
+    text_.put(rest);
+    text_.put('"');
 }
 
 void RecordText::addQuoted(std::string_view text) { addLiteral(quoted(text)); }
@@ -203,8 +202,7 @@ void RecordText::addPlain(std::string_view text) {
 }
 
 void RecordText::add(const RecordText& value) {
-    separate();
-    text_ += value.text_;
+    addLiteral(value.text());
     contents_.insert(contents_.end(), value.contents_.begin(), value.contents_.end());
     longContents_.insert(longContents_.end(), value.longContents_.begin(),
                          value.longContents_.end());
@@ -258,8 +256,7 @@ void RecordText::add(ByteView contents) {
             const auto alias = aliases_->find(sum);
             if (alias != aliases_->end()) sum = alias->second;
         }
-        member("sum");
-        addQuoted(hexadecimal(sum));
+        addSum(sum);
         if (contents.size() <= limit_) {
             contents_.push_back({sum, contents});
         } else if (!isAnswer_) {
@@ -269,18 +266,25 @@ void RecordText::add(ByteView contents) {
     end('}');
 }
 
+void RecordText::addSum(ContentSum sum) {
+    constexpr int kHexadecimal = 16;
+    member("sum");
+    text_.put('"');
+    text_.putNumber(sum, kHexadecimal);
+    text_.put('"');
+}
+
 void RecordText::add(const PropertyList& list) {
     if (anonymizer_ != nullptr) return addLeftOut();
     RecordText tree(nullptr, limit_);
     tree.setAliases(aliases_);
     tree.isAnswer_ = isAnswer_;
     tree.addTree(list);
-    if (tree.text_.size() <= kLongestList || isAnswer_) return add(tree);
+    if (tree.text().size() <= kLongestList || isAnswer_) return add(tree);
     begin('{');
     member("long");
-    add(tree.text_.size());
-    member("sum");
-    addQuoted(hexadecimal(sumOf(bytesOf(tree.text_))));
+    add(tree.text().size());
+    addSum(sumOf(bytesOf(tree.text())));
     end('}');
 }
 

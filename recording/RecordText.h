@@ -1,7 +1,5 @@
 #pragma once
 
-#include <array>
-#include <charconv>
 #include <concepts>
 #include <cstddef>
 #include <cstdint>
@@ -22,6 +20,7 @@
 #include "platform/PropertyList.h"
 #include "platform/Result.h"
 #include "platform/SyncAccountInfo.h"
+#include "recording/LineBuffer.h"
 
 namespace appsync {
 
@@ -48,6 +47,11 @@ struct PlainText {
     std::string_view text;
 };
 
+/// What a message is made from. The plug-in has some dozens, each of which is written once.
+struct MessageFormat {
+    std::string_view format;
+};
+
 /// What a message is made with. The identifier with which the plug-in's messages begin is 0 there.
 struct MessageArguments {
     std::span<const LogArgument> arguments;
@@ -63,9 +67,8 @@ class RecordText {
   public:
     /// Contents of up to `limit` bytes are collected beside the text. They are not copied: who has
     /// them keeps them until the record is written.
-    RecordText(Anonymizer* anonymizer, std::size_t limit) : anonymizer_(anonymizer), limit_(limit) {
-        text_.reserve(kUsualLength);
-    }
+    RecordText(Anonymizer* anonymizer, std::size_t limit)
+        : anonymizer_(anonymizer), limit_(limit) {}
 
     /// The sums that contents are named by in the place of their own.
     void setAliases(const std::map<ContentSum, ContentSum>* aliases) { aliases_ = aliases; }
@@ -76,17 +79,24 @@ class RecordText {
         isAnswer_ = true;
     }
 
-    [[nodiscard]] const std::string& text() const { return text_; }
+    /// A message's format is left out of it.
+    [[nodiscard]] std::string_view text() const { return text_.text(); }
+    /// Of a message, and where in the text it belongs.
+    [[nodiscard]] const std::optional<MessageFormat>& format() const { return format_; }
+    [[nodiscard]] std::size_t placeOfFormat() const { return placeOfFormat_; }
     [[nodiscard]] const std::vector<NamedContents>& contents() const { return contents_; }
     /// The sums of longer contents, those of answers left out.
     [[nodiscard]] const std::vector<ContentSum>& longContents() const { return longContents_; }
 
     /// `"name":`, a value follows. The name stays as it is.
     void member(std::string_view name);
-    void begin(char bracket);
-    void end(char bracket);
-    /// The name of a call, which JSON needs no escapes for.
-    void addName(std::string_view name);
+    void begin(char bracket) {
+        separate();
+        text_.put(bracket);
+    }
+    void end(char bracket) { text_.put(bracket); }
+    /// The name of a call, in one piece or two, which JSON needs no escapes for.
+    void addName(std::string_view name, std::string_view rest = {});
     /// A text that nobody has chosen: it stays as it is.
     void addPlain(std::string_view text);
     void addNull();
@@ -100,10 +110,8 @@ class RecordText {
     void add(double value);
     template <std::integral Number>
     requires(!std::same_as<Number, bool>) void add(Number value) {
-        constexpr std::size_t kLongest = 24;
-        std::array<char, kLongest> digits{};
-        const auto end = std::to_chars(digits.data(), digits.data() + digits.size(), value);
-        addLiteral({digits.data(), end.ptr});
+        separate();
+        text_.putNumber(value);
     }
     template <typename Enumeration>
     requires std::is_enum_v<Enumeration>
@@ -125,6 +133,12 @@ class RecordText {
     void add(const LogArgument& argument);
     void add(const MessageArguments& message);
     void add(const PlainText& plain) { addPlain(plain.text); }
+    /// Not the first of a list.
+    void add(const MessageFormat& format) {
+        separate();
+        format_ = format;
+        placeOfFormat_ = text_.text().size();
+    }
     void add(const PersonIdentifier& person);
     void add(const SyncAccountInfo& account);
     void add(const Status& status);
@@ -164,14 +178,16 @@ class RecordText {
     void add(std::span<const std::string> values) { addEach(values); }
 
   private:
-    /// Most records are shorter.
-    static constexpr std::size_t kUsualLength = 256;
-
-    void separate();
+    void separate() {
+        if (text_.isEmpty()) return;
+        const char last = text_.last();
+        if (last != '[' && last != '{' && last != ':') text_.put(',');
+    }
     void addLiteral(std::string_view text);
     void addQuoted(std::string_view text);
     void addTree(const PropertyList& list);
     void addLeftOut();
+    void addSum(ContentSum sum);
     template <typename Values>
     void addEach(const Values& values) {
         begin('[');
@@ -182,14 +198,19 @@ class RecordText {
     Anonymizer* anonymizer_;
     std::size_t limit_;
     const std::map<ContentSum, ContentSum>* aliases_ = nullptr;
-    std::string text_;
+    LineBuffer text_;
     std::vector<NamedContents> contents_;
     std::vector<ContentSum> longContents_;
     bool isAnswer_ = false;
+    std::optional<MessageFormat> format_;
+    std::size_t placeOfFormat_ = 0;
 };
 
 /// Whether the bytes are text in UTF-8.
 [[nodiscard]] bool isUtf8(std::string_view bytes);
+/// Whether a format of messages is named by a number once it was written. So no line tells much
+/// more than it holds.
+[[nodiscard]] bool isNumberedFormat(std::string_view format);
 /// The bytes in base 64.
 [[nodiscard]] std::string base64(std::string_view bytes);
 /// The text in the quotes of JSON. It is UTF-8.

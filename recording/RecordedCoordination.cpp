@@ -81,12 +81,12 @@ class RecordedPromise : public RecordedHandle<Interface> {
   protected:
     template <typename... Arguments>
     CallRecord call(const char* method, const Arguments&... arguments) const {
-        return CallRecord(this->recording(), std::string(kPromise<Interface>) + method,
-                          this->number(), arguments...);
+        return CallRecord(this->recording(), CallName(kPromise<Interface>, method), this->number(),
+                          arguments...);
     }
     template <typename... Arguments>
     AnnouncedCall announced(const char* method, const Arguments&... arguments) const {
-        return AnnouncedCall(this->recording(), std::string(kPromise<Interface>) + method,
+        return AnnouncedCall(this->recording(), CallName(kPromise<Interface>, method),
                              this->number(), arguments...);
     }
 };
@@ -137,7 +137,7 @@ class RecordedPlaceholder : public RecordedHandle<InstallPlaceholder> {
   private:
     template <typename... Arguments>
     CallRecord call(const char* method, const Arguments&... arguments) const {
-        return CallRecord(recording(), std::string("InstallPlaceholder.") + method, number(),
+        return CallRecord(recording(), CallName("InstallPlaceholder.", method), number(),
                           arguments...);
     }
 };
@@ -282,12 +282,12 @@ class RecordedCoordinator : public RecordedHandle<InstallCoordinator> {
   private:
     template <typename... Arguments>
     CallRecord call(const char* method, const Arguments&... arguments) const {
-        return CallRecord(recording(), std::string("InstallCoordinator.") + method, number(),
+        return CallRecord(recording(), CallName("InstallCoordinator.", method), number(),
                           arguments...);
     }
     template <typename... Arguments>
     AnnouncedCall announced(const char* method, const Arguments&... arguments) const {
-        return AnnouncedCall(recording(), std::string("InstallCoordinator.") + method, number(),
+        return AnnouncedCall(recording(), CallName("InstallCoordinator.", method), number(),
                              arguments...);
     }
 

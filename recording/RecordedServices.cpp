@@ -70,7 +70,8 @@ void RecordedLog::write(const LogMessage& message) noexcept {
     inner_.write(message);
     try {
         CallRecord(recording_, "LogFacility.write", 0, message.category, message.level,
-                   PlainText{message.format}, MessageArguments{message.arguments, ownIdentifier_})
+                   MessageFormat{message.format},
+                   MessageArguments{message.arguments, ownIdentifier_})
             .announce();
     } catch (...) {
         // Out of memory: the message is in the log, and the recording goes without it.
@@ -242,8 +243,7 @@ class RecordedDestination : public ImageDestination {
     bool finalize() override {
         CallRecord record(recording_, "ImageDestination.finalize", number_);
         const bool isWritten = inner_->finalize();
-        static_cast<void>(
-            record.shortAnswer(isWritten ? std::optional(buffer_) : std::optional<Bytes>()));
+        static_cast<void>(record.shortAnswer(isWritten ? &buffer_ : nullptr));
         return isWritten;
     }
 

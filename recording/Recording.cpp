@@ -1,8 +1,6 @@
 #include "recording/Recording.h"
 
 #include <algorithm>
-#include <array>
-#include <charconv>
 
 #include "platform/SyncHost.h"
 
@@ -11,13 +9,6 @@ namespace {
 
 std::chrono::nanoseconds steadyTime() {
     return std::chrono::steady_clock::now().time_since_epoch();
-}
-
-void appendNumber(std::string& line, std::uint64_t number) {
-    constexpr std::size_t kLongest = 20;
-    std::array<char, kLongest> digits{};
-    line.append(digits.data(),
-                std::to_chars(digits.data(), digits.data() + digits.size(), number).ptr);
 }
 
 const void* threadOfMachine() {
@@ -46,13 +37,10 @@ Recording::Recording(RecordingSink& sink, const SyncHost& host, const std::strin
     text.member("anonymous");
     text.add(options_.isAnonymous);
     text.end('}');
-    sink_.write(text.text() + '\n');
+    sink_.write(std::string(text.text()) + '\n');
 }
 
-std::uint64_t Recording::newNumber() {
-    const std::lock_guard guard(mutex_);
-    return ++numbers_;
-}
+std::uint64_t Recording::newNumber() { return ++numbers_; }
 
 RecordText Recording::newText() {
     return {options_.isAnonymous ? &anonymizer_ : nullptr, kPassedContentLimit};
@@ -67,61 +55,82 @@ void Recording::remember(ContentSum sum) {
     if (passed_.size() > kRememberedContents) passed_.pop_front();
 }
 
-void Recording::addContents(const RecordText& record, std::string& line) {
+void Recording::addContents(const RecordText& record) {
     bool isFirst = true;
     for (const NamedContents& each : record.contents()) {
         if (isKnown(each.sum)) continue;
         kept_.insert(each.sum);
-        line += isFirst ? ",\"kept\":[" : ",";
+        line_.put(isFirst ? ",\"kept\":[" : ",");
         isFirst = false;
         const std::string_view characters(reinterpret_cast<const char*>(each.bytes.data()),
                                           each.bytes.size());
         RecordText text(nullptr, 0);
         text.addPlain(characters);
-        line += text.text();
+        line_.put(text.text());
     }
-    if (!isFirst) line += ']';
+    if (!isFirst) line_.put(']');
 }
 
-std::size_t Recording::threadNumber() {
-    return threads_.try_emplace(options_.thread(), threads_.size() + 1).first->second;
+void Recording::addText(const RecordText& record) {
+    const std::string_view text = record.text();
+    if (!record.format()) return line_.put(text);
+    line_.put(text.substr(0, record.placeOfFormat()));
+    addFormat(record.format()->format);
+    line_.put(text.substr(record.placeOfFormat()));
+}
+
+void Recording::addFormat(std::string_view format) {
+    const auto known = formats_.find(format);
+    if (known != formats_.end()) return line_.putNumber(known->second);
+    if (isNumberedFormat(format)) formats_.emplace(format, formats_.size() + 1);
+    RecordText text(nullptr, 0);
+    text.addPlain(format);
+    line_.put(text.text());
+}
+
+std::size_t Recording::numberOf(const void* thread) {
+    return threads_.try_emplace(thread, threads_.size() + 1).first->second;
 }
 
 void Recording::write(const RecordText& record) {
+    const void* const thread = options_.thread();
     const std::lock_guard guard(mutex_);
-    if (!isOver_) writeLine(threadNumber(), record);
+    if (!isOver_) writeLine(thread, record);
 }
 
+// What another thread has written because of the call is seen here without the lock.
 void Recording::writeReturn() {
-    const std::lock_guard guard(mutex_);
-    const std::size_t thread = threadNumber();
-    if (isOver_ || lastThread_ == thread) return;
+    const void* const thread = options_.thread();
+    if (lastThread_.load(std::memory_order_relaxed) == thread) return;
     RecordText text = newText();
     text.member("back");
     text.add(true);
-    writeLine(thread, text);
+    const std::lock_guard guard(mutex_);
+    if (!isOver_) writeLine(thread, text);
 }
 
-void Recording::writeLine(std::size_t thread, const RecordText& record) {
-    lastThread_ = thread;
-    line_ = "{\"t\":";
-    appendNumber(line_, static_cast<std::uint64_t>((options_.clock() - begin_).count()));
-    line_ += ",\"w\":";
-    appendNumber(line_, thread);
-    line_ += ',';
-    line_ += record.text();
-    addContents(record, line_);
+void Recording::writeLine(const void* thread, const RecordText& record) {
+    lastThread_.store(thread, std::memory_order_relaxed);
+    line_.clear();
+    line_.put("{\"t\":");
+    line_.putNumber(static_cast<std::uint64_t>((options_.clock() - begin_).count()));
+    line_.put(",\"w\":");
+    line_.putNumber(numberOf(thread));
+    line_.put(',');
+    addText(record);
+    addContents(record);
     for (const ContentSum sum : record.longContents()) remember(sum);
-    line_ += "}\n";
-    sink_.write(line_);
+    line_.put("}\n");
+    sink_.write(line_.text());
 }
 
 void Recording::finish() {
     RecordText text = newText();
     text.member("finished");
     text.add(true);
+    const void* const thread = options_.thread();
     const std::lock_guard guard(mutex_);
-    if (!isOver_) writeLine(threadNumber(), text);
+    if (!isOver_) writeLine(thread, text);
     isOver_ = true;
 }
 

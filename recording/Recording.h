@@ -6,6 +6,7 @@
 // host and the plug-in. RecordText.h is the form of values, with Anonymizer.h what becomes of names
 // in an anonymous one. Standard library and platform/ only, so that it runs on a device.
 
+#include <atomic>
 #include <chrono>
 #include <cstddef>
 #include <cstdint>
@@ -21,6 +22,7 @@
 
 #include "platform/Bytes.h"
 #include "recording/Anonymizer.h"
+#include "recording/LineBuffer.h"
 #include "recording/RecordText.h"
 
 namespace appsync {
@@ -28,7 +30,9 @@ namespace appsync {
 class SyncHost;
 
 /// The version of the form that recordings have.
-inline constexpr int kRecordingVersion = 1;
+inline constexpr int kRecordingVersion = 2;
+/// That of the oldest ones that can still be read.
+inline constexpr int kOldestRecordingVersion = 1;
 
 /// Contents of up to so many bytes that the plug-in passes are kept; longer ones are named by size
 /// and sum.
@@ -82,24 +86,44 @@ class Recording : public std::enable_shared_from_this<Recording> {
 
   private:
     [[nodiscard]] bool isKnown(ContentSum sum) const;
-    [[nodiscard]] std::size_t threadNumber();
-    void writeLine(std::size_t thread, const RecordText& record);
-    void addContents(const RecordText& record, std::string& line);
+    [[nodiscard]] std::size_t numberOf(const void* thread);
+    void writeLine(const void* thread, const RecordText& record);
+    void addText(const RecordText& record);
+    void addFormat(std::string_view format);
+    void addContents(const RecordText& record);
     void remember(ContentSum sum);
 
     RecordingSink& sink_;
     RecordingOptions options_;
     Anonymizer anonymizer_;
+    std::chrono::nanoseconds begin_;
+    std::atomic<std::uint64_t> numbers_ = 0;
     std::mutex mutex_;
     // Guarded by mutex_.
-    std::chrono::nanoseconds begin_;
     bool isOver_ = false;
-    std::uint64_t numbers_ = 0;
     std::map<const void*, std::size_t> threads_;
-    std::size_t lastThread_ = 0;  // the one that wrote last
+    std::atomic<const void*> lastThread_ = nullptr;  // the one that wrote last; read without it
     std::unordered_set<ContentSum> kept_;
     std::deque<ContentSum> passed_;  // lately, by the plug-in
-    std::string line_;
+    std::map<std::string, std::size_t, std::less<>> formats_;
+    LineBuffer line_;
+};
+
+/// The name of a call, "FileSystem.readFile", in one piece or two.
+class CallName {
+  public:
+    CallName(const char* whole) : service_(whole) {}
+    CallName(std::string_view whole) : service_(whole) {}
+    /// `service` with the full stop.
+    CallName(std::string_view service, std::string_view method)
+        : service_(service), method_(method) {}
+
+    [[nodiscard]] std::string_view service() const { return service_; }
+    [[nodiscard]] std::string_view method() const { return method_; }
+
+  private:
+    std::string_view service_;
+    std::string_view method_;
 };
 
 /// One call across platform/, written when it is answered, when it says so, or when this goes.
@@ -107,11 +131,11 @@ class CallRecord {
   public:
     /// `object` is the number of what is called; 0 for a service.
     template <typename... Arguments>
-    CallRecord(Recording& recording, std::string_view call, std::uint64_t object,
+    CallRecord(Recording& recording, const CallName& call, std::uint64_t object,
                const Arguments&... arguments)
         : recording_(recording), text_(recording.newText()) {
         text_.member("call");
-        text_.addName(call);
+        text_.addName(call.service(), call.method());
         if (object != 0) {
             text_.member("on");
             text_.add(object);
@@ -166,7 +190,7 @@ class CallRecord {
 class AnnouncedCall {
   public:
     template <typename... Arguments>
-    AnnouncedCall(Recording& recording, std::string_view call, std::uint64_t object,
+    AnnouncedCall(Recording& recording, const CallName& call, std::uint64_t object,
                   const Arguments&... arguments)
         : recording_(recording) {
         CallRecord(recording, call, object, arguments...).announce();

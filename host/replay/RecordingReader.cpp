@@ -94,9 +94,10 @@ class Reading {
     Status header(const ParsedJson& line) {
         const std::optional<std::uint64_t> version = memberNumber(line, "recording");
         if (!version) return noRecording("its first line is no header");
-        if (*version != kRecordingVersion) {
+        if (*version < kOldestRecordingVersion || *version > kRecordingVersion) {
             return unusable("the recording has version " + std::to_string(*version) +
-                                ", and this command reads version " +
+                                ", and this command reads versions " +
+                                std::to_string(kOldestRecordingVersion) + " to " +
                                 std::to_string(kRecordingVersion),
                             "use the appsync that wrote it");
         }
@@ -120,6 +121,7 @@ class Reading {
         RecordLine line;
         std::string wrong = readWhoAndWhen(value, line);
         if (wrong.empty()) wrong = readKind(value, line);
+        if (wrong.empty()) wrong = nameFormat(line);
         if (wrong.empty()) wrong = keepContents(value);
         if (wrong.empty()) wrong = place(line);
         if (wrong.empty()) session_.lines.push_back(std::move(line));
@@ -176,6 +178,23 @@ class Reading {
         if (value.contains("a")) line.arguments = std::move(value["a"]);
         if (!line.arguments.is_array()) return "its arguments are no list";
         if (value.contains("r")) line.answer = std::move(value["r"]);
+        return {};
+    }
+
+    /// A message whose format was there before has its number in its place.
+    std::string nameFormat(RecordLine& line) {
+        constexpr std::size_t kPlace = 2;
+        const bool isMessage = line.kind == RecordKind::Call && line.name == "LogFacility.write" &&
+                               line.arguments.size() > kPlace;
+        if (!isMessage) return {};
+        ParsedJson& format = line.arguments[kPlace];
+        if (format.is_string() && isNumberedFormat(format.get_ref<const std::string&>())) {
+            formats_.push_back(format);
+        }
+        if (!format.is_number_unsigned()) return {};
+        const auto number = format.get<std::uint64_t>();
+        if (number == 0 || number > formats_.size()) return "its format is none";
+        format = formats_[number - 1];
         return {};
     }
 
@@ -282,6 +301,7 @@ class Reading {
     std::uint64_t hostThread_ = 0;
     std::vector<std::vector<std::size_t>> open_;  // for each thread, the stretches that go on
     std::set<std::uint64_t> items_;               // that were queued and have not run
+    std::vector<ParsedJson> formats_;             // of messages, as they came
 };
 
 }  // namespace

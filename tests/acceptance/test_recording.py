@@ -185,7 +185,7 @@ def test_a_hostile_recording_gets_a_sentence(appsync, tmp_path, damage):
     text = {
         "empty": "",
         "rubbish": "rubbish\n" * 100,
-        "version": header.replace("1", "2", 1),
+        "version": header.replace("1", "3", 1),
         "reordered": header + call + '{"t":4,"w":1,"end":true}\n',
         "long": header + "x" * (17 << 20) + "\n",
         "zeros": "\0" * 4096,

@@ -36,6 +36,31 @@ TEST(RecordingReader, ReadsWhatWasWritten) {
     EXPECT_EQ(session->lines.back().kind, RecordKind::Finished);
 }
 
+TEST(RecordingReader, KnowsTheFormatsOfMessagesByTheirNumbers) {
+    const auto message = [](const std::string& format) {
+        return R"({"t":1,"w":1,"call":"LogFacility.write","a":[8,0,)" + format + ",[]]}\n";
+    };
+    const std::string longest = '"' + std::string(257, 'x') + '"';
+    const std::string lines = kHeader + kHost + message(R"("one")") + message(longest) +
+                              message(R"({"bytes":"/w=="})") + message(R"("two")") + message("2") +
+                              message("1");
+    const Result<RecordedSession> session = readRecording(lines);
+    ASSERT_TRUE(session);
+    EXPECT_EQ(session->lines[5].arguments[2], "two");
+    EXPECT_EQ(session->lines[6].arguments[2], "one");
+    EXPECT_THAT(refusalOf(lines + message("3")), HasSubstr("its format is none"));
+    EXPECT_THAT(refusalOf(kHeader + kHost + message("0")), HasSubstr("its format is none"));
+}
+
+TEST(RecordingReader, ReadsThisVersionAndTheOneBefore) {
+    for (const char* version : {"1", "2"}) {
+        std::string header = kHeader;
+        header.replace(header.find('1'), 1, version);
+        EXPECT_EQ(refusalOf(header + kHost), "");
+    }
+    EXPECT_THAT(refusalOf("{\"recording\":0}\n"), HasSubstr("reads versions 1 to 2"));
+}
+
 TEST(RecordingReader, LeavesOutALineThatWasBeingWritten) {
     const Result<RecordedSession> session = readRecording(kHeader + kHost + R"({"t":2,"w":1,"ca)");
     ASSERT_TRUE(session);

@@ -38,7 +38,7 @@ struct RecordingFixture : testing::Test {
 
 TEST_F(RecordingFixture, BeginsWithAHeader) {
     EXPECT_THAT(sink.text,
-                StartsWith(R"({"recording":1,"plug-in":"1.2","process":"com.korvu.trd")"));
+                StartsWith(R"({"recording":2,"plug-in":"1.2","process":"com.korvu.trd")"));
 }
 
 TEST_F(RecordingFixture, WritesACallWithItsArgumentsAndItsAnswer) {
@@ -46,9 +46,45 @@ TEST_F(RecordingFixture, WritesACallWithItsArgumentsAndItsAnswer) {
     EXPECT_EQ(last(), R"({"t":0,"w":1,"call":"A.b","a":["x\u000a\"",7,true],"r":true})");
 }
 
+TEST_F(RecordingFixture, EscapesACharacterWhereverItStands) {
+    constexpr std::size_t kLength = 20;
+    for (std::size_t place = 0; place < kLength; ++place) {
+        std::string text(kLength, 'x');
+        text[place] = '"';
+        CallRecord(*recording, "A.b", 0, text).announce();
+        text.insert(place, 1, '\\');
+        EXPECT_THAT(last(), HasSubstr("[\"" + text + "\"]"));
+    }
+}
+
+TEST_F(RecordingFixture, WritesLinesOfAnyLength) {
+    for (std::size_t length = 1; length < 2000; length = length * 3 / 2 + 1) {
+        const std::string text(length, 'x');
+        CallRecord(*recording, CallName("A.", "b"), 0, text, 7, text).announce();
+        EXPECT_EQ(last(),
+                  "{\"t\":0,\"w\":1,\"call\":\"A.b\",\"a\":[\"" + text + "\",7,\"" + text + "\"]}");
+    }
+}
+
 TEST_F(RecordingFixture, WritesTextThatIsNoUtf8) {
     CallRecord(*recording, "A.b", 0, "\xff").announce();
     EXPECT_THAT(last(), HasSubstr(R"("a":[{"bytes":"/w=="}])"));
+}
+
+TEST_F(RecordingFixture, WritesTheFormatOfAMessageOnce) {
+    const auto write = [this](std::string_view format) {
+        CallRecord(*recording, "LogFacility.write", 0, 8, MessageFormat{format}, 7).announce();
+        return last().substr(last().find("\"a\""));
+    };
+    EXPECT_EQ(write("one \"%d\""), R"("a":[8,"one \"%d\"",7]})");
+    EXPECT_EQ(write("two"), R"("a":[8,"two",7]})");
+    EXPECT_EQ(write("one \"%d\""), R"("a":[8,1,7]})");
+    EXPECT_EQ(write("two"), R"("a":[8,2,7]})");
+    const std::string longest(257, 'x');
+    EXPECT_THAT(write(longest), HasSubstr(longest));
+    EXPECT_THAT(write(longest), HasSubstr(longest));
+    EXPECT_EQ(write("three"), R"("a":[8,"three",7]})");
+    EXPECT_EQ(write("three"), R"("a":[8,3,7]})");
 }
 
 TEST_F(RecordingFixture, KeepsContentsOnce) {
