@@ -7,7 +7,7 @@ import re
 import signal
 import sys
 
-from campaigns import kinds, report, state
+from campaigns import kept, kinds, report, state
 from campaigns.tree import WORK, Refusal, commit_of
 from campaigns.units import LIMIT
 
@@ -17,7 +17,10 @@ USAGE = """Searches for failures with as many processes and machines as there ar
     campaign KIND --scheduler tcp://HOST:8786 --units 10000
     campaign worker --scheduler tcp://HOST:8786
                                             one machine more: builds the commit that the campaign asks for, and works
-    campaign sum STATE... --page PAGE       several states, added up; what two of them hold counts once
+    campaign keep STATE...                  adds what was done to docs/campaigns/KIND.json and docs/reliability.md, to be
+                                            committed: later campaigns begin behind it; if none is named, only the table
+    campaign sum [STATE...] [--page PAGE]   states and kept files, added up; what two of them hold counts once. All that is
+                                            kept, if none is named
     campaign kinds                          what there is, and whether it can be run here
 
 The state is an SQLite file (build/campaign/KIND.db). A campaign that was stopped or killed goes on with it where it
@@ -45,15 +48,15 @@ def options_of(arguments):
         prog="campaign", description=USAGE, formatter_class=argparse.RawDescriptionHelpFormatter, allow_abbrev=False,
         epilog="kinds:\n" + "\n".join(f"  {kind.name:<15}{kind.says}" for kind in kinds.KINDS.values()),
     )
-    parser.add_argument("what", metavar="KIND|worker|sum|kinds", choices=[*kinds.KINDS, "worker", "sum", "kinds"])
-    parser.add_argument("states", nargs="*", type=pathlib.Path, metavar="STATE", help="sum: the states")
+    parser.add_argument("what", metavar="KIND|worker|keep|sum|kinds", choices=[*kinds.KINDS, "worker", "keep", "sum", "kinds"])
+    parser.add_argument("states", nargs="*", type=pathlib.Path, metavar="STATE", help="keep, sum: the states")
     parser.add_argument("--scheduler", metavar="ADDRESS", help="where the scheduler is")
     parser.add_argument("--local", type=number, metavar="N", help="so many workers here, with a scheduler of their own (2)")
     parser.add_argument("--for", dest="seconds", type=duration, metavar="DURATION", help="how long: 90s, 15m, 8h, 2d")
     parser.add_argument("--units", type=number, metavar="N", help="until the state has so many units")
     parser.add_argument("--state", type=pathlib.Path, metavar="FILE", help="build/campaign/KIND.db if nothing is said")
-    parser.add_argument("--first", type=int, metavar="N", help="the seed to begin with, for a campaign to be added up "
-                        "with another one; the range that holds it is the first")
+    parser.add_argument("--first", type=int, metavar="N", help="the seed to begin with (behind those that are kept in "
+                        "the tree, of whatever commit); the range that holds it is the first")
     parser.add_argument("--limit", type=duration, metavar="DURATION", default=LIMIT, help="after which a unit hangs (10m)")
     parser.add_argument("--processes", type=number, metavar="N", default=os.cpu_count(), help="worker: how many (one for "
                         "each processor)")
@@ -62,10 +65,8 @@ def options_of(arguments):
     parser.add_argument("--built", action="store_true", help="worker: build nothing; refused if this is another commit")
     parser.add_argument("--page", type=pathlib.Path, metavar="FILE", help="sum: writes FILE.html and FILE.json")
     options = parser.parse_args(arguments)
-    if options.states and options.what != "sum":
-        parser.error("only sum takes states")
-    if options.what == "sum" and not options.states:
-        parser.error("sum: which states?")
+    if options.states and options.what not in ("keep", "sum"):
+        parser.error("only keep and sum take states")
     if options.what == "worker" and not options.scheduler:
         parser.error("worker: which --scheduler?")
     if options.scheduler and options.local:
@@ -81,13 +82,23 @@ def list_kinds():
 
 
 def add_up(options):
-    campaigns = state.added_up(options.states)
-    totals = [report.summary(*of, results) for of, results in campaigns.items()]
-    if options.page:
-        report.write(options.page, campaigns)
-    for total in totals:
-        print(report.sentence(total))
+    paths = options.states or sorted(kept.FOLDER.glob("*.json"))
+    if not paths:
+        raise Refusal("sum: which states? Nothing is kept in docs/campaigns")
+    campaigns = state.added_up([path for path in paths if path.suffix != ".json"])
+    sums = kept.together([path for path in paths if path.suffix == ".json"], campaigns)
+    totals = report.write(options.page, sums, campaigns) if options.page else [report.summary(each) for each in sums.values()]
+    for line in (*map(report.sentence, totals), *report.in_all(totals)):
+        print(line)
     return 1 if any(total["findings"] for total in totals) else 0
+
+
+def keep(options):
+    for path in options.states:
+        sums, added = kept.keep(*state.read(path))
+        print(f"{path}: {added:,} units more; {report.sentence(report.summary(sums))}")
+    kept.write_table()
+    return 0
 
 
 def work(options):
@@ -110,10 +121,11 @@ def run(options):
     commit = commit_of()
     book = state.State(path)
     try:
-        begins = book.belong_to(kind.name, commit, options.first)
+        begins = book.belong_to(kind.name, commit, options.first, kept.begin_of(kind.name))
         print(f"campaign: {kind.name} at {commit}, begins at {begins}, state {path}", flush=True)
         sit(kind, book, commit, options)
-        totals = report.write(path, {(kind.name, commit): book.results()})
+        campaigns = {(kind.name, commit): book.results()}
+        totals = report.write(path, kept.together([], campaigns), campaigns)
     finally:
         book.close()
     print(report.sentence(totals[0]))
@@ -145,7 +157,7 @@ def go(campaign):
 
 def main(arguments=None):
     options = options_of(sys.argv[1:] if arguments is None else arguments)
-    tasks = {"worker": work, "sum": add_up, "kinds": lambda _: list_kinds()}
+    tasks = {"worker": work, "sum": add_up, "keep": keep, "kinds": lambda _: list_kinds()}
     try:
         return tasks.get(options.what, run)(options)
     except Refusal as refusal:

@@ -4,8 +4,8 @@ import collections
 import threading
 import time
 
-from campaigns import engine
-from campaigns.units import LIMIT, Finding, Record, by_hand, run
+from campaigns import engine, kept
+from campaigns.units import LIMIT, Finding, Record, Unit, by_hand, run
 
 DIED = "its worker has died, more than once"
 
@@ -15,7 +15,9 @@ class Gone(Exception):
 
 
 class Campaign:
-    """One sitting of a campaign. Only what is in the state counts as done; all else is given out again."""
+    """One sitting of a campaign. Only what is in the state, or kept in the tree of the same commit, counts as done; all else
+    is given out again.
+    """
 
     def __init__(self, kind, state, commit, bar, address, most=None, seconds=None, limit=LIMIT):
         self.kind = kind
@@ -28,6 +30,8 @@ class Campaign:
         self.limit = limit
         self.wanted = engine.resource(kind.build, commit)
         self.done = state.done()
+        self.kept = kept.of_kind(kind.name).get(commit, kept.Sums(kind.name, commit))
+        self.kept_elsewhere = self.kept.units - sum(self.kept.has(Unit.of_key(kind.name, key)) for key in self.done)
         self.suspects = collections.deque(state.suspects())
         self.again = collections.deque()  # given out, and lost on the way
         self.fresh = self.fresh_units()
@@ -40,12 +44,12 @@ class Campaign:
     def fresh_units(self):
         known = self.done | {unit.key for unit in self.suspects}
         for unit in self.kind.units(int(self.state.get("first", "0"))):
-            if unit.key not in known:
+            if unit.key not in known and not self.kept.has(unit):
                 yield unit
 
     def go(self):
         """Until nothing is left. Whatever ends it, nothing that is in the state is lost."""
-        self.state.begin_sitting()
+        self.state.begin_sitting(len(self.kind.parts()), self.kind.rounds())
         while not self.is_over():
             try:
                 with engine.connect(self.address) as client:
@@ -170,5 +174,7 @@ class Campaign:
 
     def left(self):
         """How many units are to come; nothing when only the clock says."""
-        totals = [each for each in (self.most, self.kind.total()) if each is not None]
-        return max(0, min(totals) - len(self.done)) if totals else None
+        totals = [] if self.most is None else [self.most - len(self.done)]
+        if self.kind.total() is not None:
+            totals.append(self.kind.total() - len(self.done) - self.kept_elsewhere)
+        return max(0, min(totals)) if totals else None

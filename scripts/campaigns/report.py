@@ -1,6 +1,5 @@
 """What is seen of a campaign: a line that changes while it runs, and a page and a JSON file of what there is."""
 
-import collections
 import html
 import json
 import shutil
@@ -74,34 +73,39 @@ def clock(seconds):
     return f"{seconds // 3600}:{seconds // 60 % 60:02}:{seconds % 60:02}"
 
 
-def summary(kind, commit, results):
-    """One campaign's results, as the JSON file has them."""
-    covered = collections.Counter()
-    for result in results.values():
-        covered.update(result.covered)
-    seconds = sum(result.seconds for result in results.values())
-    tried = sum(result.tried for result in results.values())
+def summary(sums):
+    """What came of one kind at one commit, as the JSON file has it."""
+    tried, failed, seconds, processor = (sums.sum_of(name) for name in ("tried", "failed", "seconds", "processor"))
     return {
-        "kind": kind,
-        "commit": commit,
-        "units": len(results),
+        "kind": sums.kind,
+        "commit": sums.commit,
+        "units": sums.units,
         "tried": tried,
-        "passed": sum(result.passed for result in results.values()),
-        "failed": sum(result.failed for result in results.values()),
-        "covered": dict(sorted(covered.items())),
+        "passed": tried - failed,
+        "failed": failed,
+        "covered": dict(sorted(sums.covered.items())),
         "seconds_of_workers": round(seconds, 1),
-        "tried_per_worker_hour": round(3600 * tried / seconds) if seconds else 0,
+        "seconds_of_processors": round(processor, 1),
+        "tried_per_core_hour": round(3600 * tried / processor) if processor else 0,
         "findings": [
-            {"unit": key, "what": each.what, "replay": each.replay, "output": each.output}
-            for key, result in results.items() for each in result.findings
+            {"unit": key, "what": each.what, "replay": each.replay, "output": each.output} for key, each in sums.findings
         ],
     }
+
+
+def in_all(totals):
+    """A sentence for each kind that has several of these summaries."""
+    for kind in dict.fromkeys(total["kind"] for total in totals):
+        of_kind = [total for total in totals if total["kind"] == kind]
+        if len(of_kind) > 1:
+            units, tried, failed = (sum(total[name] for total in of_kind) for name in ("units", "tried", "failed"))
+            yield f"{kind} at {len(of_kind)} commits: {units:,} units, {tried:,} tried, {failed:,} failed"
 
 
 def sentence(total):
     covered = "".join(f", {number:,} {name}" for name, number in total["covered"].items())
     return (f"{total['kind']} at {total['commit'][:12]}: {total['units']:,} units, {total['tried']:,} tried, "
-            f"{total['failed']:,} failed{covered}; {total['tried_per_worker_hour']:,} for each hour of a worker")
+            f"{total['failed']:,} failed{covered}; {total['tried_per_core_hour']:,} for each hour of a processor")
 
 
 def curve(points, end, most):
@@ -152,8 +156,8 @@ def section(total, results):
     rows = "".join(
         f"<tr><th>{html.escape(name.replace('_', ' '))}</th><td>{value:,}</td></tr>"
         for name, value in {**{key: total[key] for key in ("units", "tried", "passed", "failed")}, **total["covered"],
-                            "seconds_of_workers": total["seconds_of_workers"],
-                            "tried_per_worker_hour": total["tried_per_worker_hour"]}.items()
+                            **{key: total[key] for key in ("seconds_of_workers", "seconds_of_processors",
+                                                           "tried_per_core_hour")}}.items()
     )
     findings = "".join(
         f"<li><p>{html.escape(each['what'])}</p><pre>{html.escape(each['replay'])}</pre>"
@@ -161,7 +165,7 @@ def section(total, results):
         for each in total["findings"]
     )
     return (f"<h1>{html.escape(total['kind'])}</h1><p>commit <code>{html.escape(total['commit'])}</code></p>"
-            f"{picture(results)}<table>{rows}</table><h2>Findings</h2>"
+            f"{picture(results) if results else ''}<table>{rows}</table><h2>Findings</h2>"
             + (f"<ol>{findings}</ol>" if findings else "<p>none</p>"))
 
 
@@ -169,11 +173,13 @@ STYLE = "body{font:15px sans-serif;max-width:760px;margin:2em auto}th{text-align
         "td{text-align:right}pre{white-space:pre-wrap;word-break:break-all}svg text{font-size:13px}"
 
 
-def write(stem, campaigns):
-    """STEM.html and STEM.json of (kind, commit) -> results. Gives their summaries."""
-    totals = [summary(*of, results) for of, results in campaigns.items()]
+def write(stem, sums, campaigns):
+    """STEM.html and STEM.json of (kind, commit) -> sums, with pictures of those whose results are in `campaigns`. Gives their
+    summaries.
+    """
+    totals = [summary(each) for each in sums.values()]
     stem.with_suffix(".json").write_text(json.dumps(totals, indent=1) + "\n")
-    body = "".join(section(total, results) for total, results in zip(totals, campaigns.values()))
+    body = "".join(section(total, campaigns.get(of, {})) for of, total in zip(sums, totals))
     stem.with_suffix(".html").write_text(
         f'<!doctype html><html lang="en"><meta charset="utf-8"><title>Campaign</title><style>{STYLE}</style>{body}</html>\n'
     )

@@ -8,14 +8,14 @@ import time
 from campaigns.tree import Refusal
 from campaigns.units import Finding, Record, Unit
 
-FORMAT = "1"
+FORMAT = "2"
 
 TABLES = """
 CREATE TABLE about (name TEXT PRIMARY KEY, value TEXT NOT NULL);
 CREATE TABLE sittings (number INTEGER PRIMARY KEY, seconds REAL NOT NULL);
 CREATE TABLE units (
     key TEXT PRIMARY KEY, tried INTEGER NOT NULL, failed INTEGER NOT NULL, covered TEXT NOT NULL,
-    seconds REAL NOT NULL, sitting INTEGER NOT NULL, at REAL NOT NULL);
+    seconds REAL NOT NULL, processor REAL NOT NULL, sitting INTEGER NOT NULL, at REAL NOT NULL);
 CREATE TABLE findings (
     key TEXT NOT NULL, what TEXT NOT NULL, replay TEXT NOT NULL, output TEXT NOT NULL, PRIMARY KEY (key, replay));
 CREATE TABLE suspects (
@@ -64,21 +64,26 @@ class State:
     def set(self, name, value):
         self.base.execute("INSERT OR REPLACE INTO about VALUES (?, ?)", (name, str(value)))
 
-    def belong_to(self, kind, commit, first):
-        """Notes what it is of, or refuses where it is of something else. Gives where its units begin."""
+    def belong_to(self, kind, commit, first, otherwise=0):
+        """Notes what it is of, or refuses where it is of something else. Gives where its units begin: at `otherwise` if it is
+        new and nothing else is asked for.
+        """
         for name, value, what in (("kind", kind, "of"), ("commit", commit, "at")):
             was = self.get(name, value)
             if was != value:
                 raise Refusal(f"{self.path} is the state of a campaign {what} {was}, this one is {what} {value}: "
                               f"name another file with --state, and add them up with `campaign sum`")
             self.set(name, value)
-        was = self.get("first", str(first or 0))
+        was = self.get("first", str(otherwise if first is None else first))
         if first is not None and was != str(first):
             raise Refusal(f"{self.path} is the state of a campaign that begins at {was}")
         self.set("first", was)
         return int(was)
 
-    def begin_sitting(self):
+    def begin_sitting(self, parts, rounds):
+        """`parts` and `rounds` are how many parts the kind has in this tree, and ranges in each (none: no end)."""
+        self.set("parts", parts)
+        self.set("rounds", json.dumps(rounds))
         self.sitting = self.base.execute("SELECT count(*) FROM sittings").fetchone()[0] + 1
         self.begun = time.monotonic()
         self.base.execute("INSERT INTO sittings VALUES (?, 0)", (self.sitting,))
@@ -88,8 +93,9 @@ class State:
         now = time.monotonic() - self.begun
         self.base.execute("BEGIN")
         added = self.base.execute(
-            "INSERT OR IGNORE INTO units VALUES (?, ?, ?, ?, ?, ?, ?)",
-            (unit.key, record.tried, record.failed, json.dumps(record.covered), record.seconds, self.sitting, now),
+            "INSERT OR IGNORE INTO units VALUES (?, ?, ?, ?, ?, ?, ?, ?)",
+            (unit.key, record.tried, record.failed, json.dumps(record.covered), record.seconds, record.processor,
+             self.sitting, now),
         ).rowcount
         if added:
             for each in record.findings:
@@ -132,8 +138,8 @@ def results_in(base):
         sitting_begins[number] = before
         before += seconds
     results = {}
-    for key, tried, failed, covered, seconds, sitting, at in base.execute("SELECT * FROM units ORDER BY sitting, at"):
-        results[key] = Result(tried, failed, json.loads(covered), [], seconds)
+    for key, tried, failed, covered, seconds, processor, sitting, at in base.execute("SELECT * FROM units ORDER BY sitting, at"):
+        results[key] = Result(tried, failed, json.loads(covered), [], seconds, processor)
         results[key].at = sitting_begins.get(sitting, 0.0) + at
     for key, what, replay, output in base.execute("SELECT * FROM findings ORDER BY rowid"):
         if key in results:
@@ -149,7 +155,7 @@ def read(path):
         base = sqlite3.connect(f"{path.resolve().as_uri()}?mode=ro", uri=True, timeout=1)
         try:
             about = dict(base.execute("SELECT name, value FROM about"))
-            if about.get("format") != FORMAT or "kind" not in about:
+            if about.get("format") != FORMAT or not {"kind", "commit", "parts", "rounds"} <= about.keys():
                 raise Refusal(f"{path} is no state of a campaign that has begun")
             return about, results_in(base)
         except ValueError as error:
@@ -160,9 +166,10 @@ def read(path):
 
 def added_up(paths):
     """(kind, commit) -> key -> result, of all these states. What two of them hold is one result."""
-    sums = {}
+    campaigns = {}
     for path in paths:
         about, results = read(path)
+        campaign = campaigns.setdefault((about["kind"], about["commit"]), {})
         for key, result in results.items():
-            sums.setdefault((about["kind"], about["commit"]), {}).setdefault(key, result)
-    return sums
+            campaign.setdefault(key, result)
+    return campaigns

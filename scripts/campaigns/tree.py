@@ -8,6 +8,7 @@ import subprocess
 
 ROOT = pathlib.Path(__file__).resolve().parent.parent.parent
 WORK = ROOT / "build" / "campaign"
+CODE = [".", ":(exclude)docs", ":(exclude,glob)*.md"]  # all but documents
 
 # What must be built for a kind, by the name that a kind calls it.
 BUILDS = {
@@ -29,18 +30,20 @@ def git(*words, tree=ROOT):
 
 
 def commit_of(tree=ROOT):
-    """The tree's commit; where it differs from that, with a mark of how."""
-    head = git("rev-parse", "HEAD", tree=tree)
+    """The last commit that changed more than documents, so that sums can be kept in the tree and the campaign go on; where
+    the tree differs from that, with a mark of how.
+    """
+    head = git("log", "-1", "--format=%H", "--", *CODE, tree=tree)
     if head.returncode != 0:
         raise Refusal("this tree has no commit: a campaign needs a clone")
     commit = head.stdout.decode().strip()
-    changes = git("diff", "HEAD", "--binary", tree=tree).stdout + new_files(tree)
+    changes = git("diff", "HEAD", "--binary", "--", *CODE, tree=tree).stdout + new_files(tree)
     return f"{commit}+{hashlib.sha256(changes).hexdigest()[:8]}" if changes else commit
 
 
 def new_files(tree):
     """Names and contents of what is not yet part of the tree."""
-    names = git("ls-files", "--others", "--exclude-standard", "-z", tree=tree).stdout.split(b"\0")
+    names = git("ls-files", "--others", "--exclude-standard", "-z", "--", *CODE, tree=tree).stdout.split(b"\0")
     paths = [pathlib.Path(tree, os.fsdecode(name)) for name in sorted(names) if name]
     return b"".join(os.fsencode(path.name) + path.read_bytes() for path in paths if path.is_file())
 

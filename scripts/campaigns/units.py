@@ -3,6 +3,7 @@
 import dataclasses
 import os
 import pathlib
+import resource
 import shlex
 import signal
 import subprocess
@@ -30,6 +31,11 @@ class Unit:
         """Names it, in whichever campaign."""
         return f"{self.part}:{self.first}:{self.count}"
 
+    @classmethod
+    def of_key(cls, kind, key):
+        part, first, count = key.rsplit(":", 2)
+        return cls(kind, part, int(first), int(count))
+
 
 @dataclasses.dataclass
 class Finding:
@@ -48,7 +54,8 @@ class Record:
     failed: int = 0
     covered: dict = dataclasses.field(default_factory=dict)  # name -> how many
     findings: list = dataclasses.field(default_factory=list)
-    seconds: float = 0.0
+    seconds: float = 0.0  # by the clock
+    processor: float = 0.0  # seconds that the programs had it
     hangs: bool = False
 
     @property
@@ -111,13 +118,19 @@ def kill(process):
         pass
 
 
+def processor_seconds():
+    """Of all programs that have ended for this process."""
+    usage = resource.getrusage(resource.RUSAGE_CHILDREN)
+    return usage.ru_utime + usage.ru_stime
+
+
 def run(unit, limit=LIMIT):
     """Does a unit, on a worker. What goes wrong with it is a finding, never an exception."""
     from campaigns.kinds import KINDS  # which needs this module
 
     kind = KINDS[unit.kind]
     command, environment = kind.command(unit)
-    start = time.monotonic()
+    start, processor = time.monotonic(), processor_seconds()
     with tempfile.TemporaryDirectory(prefix="campaign-") as made:
         try:
             ended = finish(command, environment, limit, made)
@@ -128,6 +141,7 @@ def run(unit, limit=LIMIT):
             few, others = record.findings[:MOST_MADE_SMALL], record.findings[MOST_MADE_SMALL:]
             record.findings = [kind.smaller(each, made) for each in few] + others
     record.seconds = time.monotonic() - start
+    record.processor = processor_seconds() - processor
     if ended.hangs:
         record.hangs = True
         record.findings = [Finding(f"no end after {limit:g} s", by_hand(command, environment), ended.output[-TAIL:])]

@@ -2,6 +2,7 @@
 
 import json
 import os
+import re
 import shutil
 import signal
 import socket
@@ -249,12 +250,143 @@ def test_a_state_is_not_used_twice_at_once(tree):
     (["seeds", "--for", "soon"], "is no duration"),
     (["seeds", "--units", "0"], "is no number"),
     (["sum"], "which states"),
+    (["seeds", "some.db"], "only keep and sum take states"),
+    (["keep", "gone.db"], "there is no gone.db"),
     (["worker"], "which --scheduler"),
     (["fuzz"], "fuzz cannot be run: there is no build/fuzz/fuzz"),
     (["sum", "gone.db"], "there is no gone.db"),
 ])
 def test_wrong_usage_is_told(tree, words, what):
     assert what in tree.campaign(*words, status=2)
+
+
+# --- what is kept in the tree --------------------------------------------------------------------
+
+
+LINE = "APPSYNC_SEED=501 build/release/tests/test_reliability --gtest_filter=Seeds.One"
+DOCUMENT = """Before.
+
+<!-- This table is made by `scripts/campaign keep`. -->
+<!-- Its end. -->
+
+After.
+"""
+
+
+@pytest.fixture
+def keeping(tree):
+    """A tree whose documents have a place for the table."""
+    (tree.path / "docs").mkdir()
+    (tree.path / "docs" / "reliability.md").write_text(DOCUMENT)
+    shutil.copy(FOLDER / "check_docs", tree.path / "scripts")
+    tree.commit()
+    tree.campaign("keep")
+    return tree
+
+
+def kept_of(tree, kind="seeds"):
+    return json.loads((tree.path / "docs" / "campaigns" / f"{kind}.json").read_text())["sums"]
+
+
+def made_state(tree, name, *firsts, failing=None):
+    """A state of seeds at the tree's commit, with units that begin at these; one of them has a finding."""
+    from campaigns.state import State
+    from campaigns.units import Finding, Record, Unit
+
+    state = State(tree.path / "build" / name)
+    state.belong_to("seeds", tree.git("rev-parse", "HEAD"), None)
+    state.begin_sitting(1, None)
+    for first in firsts:
+        findings = [Finding("failed", LINE, "said")] if first == failing else []
+        state.record(Unit("seeds", "", first, 250), Record(250, len(findings), {"faults": 3}, findings, 2.0, 1.0))
+    state.close()
+    return tree.path / "build" / name
+
+
+def row_of(tree, kind):
+    [row] = re.findall(rf"^\| {kind} .*$", (tree.path / "docs" / "reliability.md").read_text(), re.MULTILINE)
+    return row
+
+
+def test_what_is_kept_counts_nothing_twice(keeping):
+    one = made_state(keeping, "one.db", 0, 250, 500, failing=500)
+    other = made_state(keeping, "other.db", 500, 750, 1000, 1250, failing=500)
+    assert "4 units more" in keeping.campaign("keep", other)
+    assert "2 units more" in keeping.campaign("keep", one) and "0 units more" in keeping.campaign("keep", one, other)
+    [sums] = kept_of(keeping)
+    assert sums["commit"] == keeping.git("log", "-1", "--format=%H", "--", "scripts")
+    assert sums["parts"] == {"": {"done": "0-1500/250", "tried": 1500, "failed": 1, "seconds": 12.0, "processor": 6.0,
+                                  "covered": {"faults": 18}}}
+    assert sums["findings"] == [{"unit": ":500:250", "what": "failed", "replay": LINE}]
+    for words in ([], [one, other], [keeping.path / "docs" / "campaigns" / "seeds.json", one]):
+        out = keeping.campaign("sum", *words, status=1)
+        assert out.startswith(f"seeds at {sums['commit'][:12]}: 6 units, 1,500 tried, 1 failed"), out
+
+
+def test_a_later_sitting_goes_on_behind_what_is_kept(keeping):
+    state = keeping.path / "build" / "campaign" / "seeds.db"
+    keeping.campaign("seeds", "--local", 1, "--units", 2)
+    keeping.campaign("keep", state)
+    keeping.commit()  # of documents only: it is the same campaign
+    state.unlink()
+    assert "begins at 500" in keeping.campaign("seeds", "--local", 1, "--units", 2)
+    keeping.campaign("keep", state)
+    keeping.campaign("seeds", "--local", 1, "--units", 1, "--first", 0, "--state", keeping.path / "build" / "again.db")
+    assert keeping.ran() == {seed: 1 for seed in range(0, 1250, 250)}
+    keeping.commit()
+    (keeping.path / "program").write_text(PROGRAM + "# changed\n")
+    keeping.commit()
+    state.unlink()
+    assert "begins at 1000" in keeping.campaign("seeds", "--local", 1, "--units", 1)
+    keeping.campaign("keep", state)
+    assert [each["parts"][""]["done"] for each in kept_of(keeping)] == ["0-1000/250", "1000-1250/250"]
+    assert "seeds at 2 commits: 5 units, 1,250 tried, 0 failed" in keeping.campaign("sum")
+
+
+def test_the_table_is_that_of_what_is_kept(keeping):
+    keeping.campaign("keep", made_state(keeping, "seeds.db", 0, 250, 500, 750))
+    row = row_of(keeping, "seeds")
+    commit = keeping.git("log", "-1", "--format=%h", "--abbrev=7", "--", "scripts")
+    assert row_of(keeping, "fuzz") == "| fuzz | none | | 0 | 0 | | | all |"
+    assert row.startswith(f"| seeds | {commit} | 20") and row.endswith(" | 1,000 | 0 | 0.001 | 900,000 | 1,999,000 of 2,000,000 |")
+    document = keeping.path / "docs" / "reliability.md"
+    text = document.read_text()
+    assert text.startswith("Before.\n") and text.endswith("\nAfter.\n")
+
+    def check():
+        return subprocess.run(["/usr/bin/python3", str(keeping.path / "scripts" / "check_docs")], capture_output=True,
+                              text=True, check=False).stdout
+
+    assert check() == ""
+    for wrong in (text.replace("1,999,000", "1,999,001"), text.replace("made by", "made for")):
+        document.write_text(wrong)
+        assert check().startswith("docs/reliability.md: the table of campaigns is not that of docs/campaigns/")
+
+
+@pytest.mark.parametrize("rubbish", ["rubbish", "[]", '{"kind": "seeds", "sums": [{"commit": "a"}]}'])
+def test_rubbish_is_nothing_that_was_kept(keeping, rubbish):
+    (keeping.path / "docs" / "campaigns").mkdir()
+    (keeping.path / "docs" / "campaigns" / "seeds.json").write_text(rubbish)
+    for words in (["seeds", "--local", 1, "--units", 1], ["sum"], ["keep"]):
+        assert "has no sums that were kept" in keeping.campaign(*words, status=2)
+
+
+@pytest.mark.parametrize("kind, parts, rounds, done, left", [
+    ("fuzz", 2, None, [("One", 0, 70_000_000), ("One", 1, 70_000_000), ("Two", 0, 5_000_000)], "95,000,000 of 200,000,000"),
+    ("crash-pairs", 3, None, [("A", 0, 10), ("A", 3, 10), ("B", 0, 10)], "1 of 3 scenarios"),
+    ("kills", 2, 64, [("A", 0, 10), ("B", 0, 10)], "126 of 128 units"),
+    ("mutants", 1, 2, [("", 0, 8), ("", 8, 8)], "none of 2 units"),
+    ("walks", 1, None, [("", 0, 49_998)], "2 of 50,000"),
+    ("crashes", 1, None, [("A", 0, 10)], "has no goal"),
+])
+def test_what_is_left_to_a_goal(kind, parts, rounds, done, left):
+    from campaigns import kept
+    from campaigns.units import Record
+
+    sums = kept.Sums(kind, "this")
+    sums.parts_in_all, sums.rounds = parts, rounds
+    sums.add({f"{part}:{first}:1": Record(tried) for part, first, tried in done})
+    assert kept.left(kind, {"this": sums}) == left
 
 
 # --- workers on other machines -------------------------------------------------------------------
@@ -391,14 +523,32 @@ print(len(numbers), "mutants,", len(numbers) - (9 in numbers), "caught")
 """
 
 
-def test_mutants_end_with_the_last_and_survivors_are_findings(tree):
+def prepare_mutants(tree):
     (tree.path / "scripts" / "mutate").write_text(MUTATE)
     (tree.path / "build" / "mutate").mkdir()
     (tree.path / "build" / "mutate" / "prepared.json").write_text(json.dumps({"mutants": 12}))
+
+
+def test_mutants_end_with_the_last_and_survivors_are_findings(tree):
+    prepare_mutants(tree)
     tree.campaign("mutants", "--local", 2, status=1)
     assert count_of(tree.figures("mutants")) == (2, 12, 1)
     [finding] = tree.figures("mutants")["findings"]
     assert finding["replay"] == "scripts/mutate --numbers 9-9" and "client/A.cpp:1: run: without a()" in finding["what"]
+
+
+def test_what_was_kept_of_a_kind_that_ends_is_not_done_again(keeping):
+    prepare_mutants(keeping)
+    keeping.commit()
+    keeping.campaign("mutants", "--local", 1, "--units", 1)
+    state = keeping.path / "build" / "campaign" / "mutants.db"
+    keeping.campaign("keep", state)
+    assert row_of(keeping, "mutants").endswith(" | 8 | 0 | 0.000 |  | 1 of 2 units |")
+    state.unlink()
+    keeping.campaign("mutants", "--local", 1, status=1)  # the ninth survives
+    assert count_of(keeping.figures("mutants")) == (1, 4, 1)
+    keeping.campaign("keep", state)
+    assert row_of(keeping, "mutants").endswith(" | 12 | 1 | 0.000 |  | none of 2 units |")
 
 
 REAL = {"seeds": 2, "faults": 2, "crashes": 2, "crash-pairs": 1, "kills": 2, "failing-calls": 2, "recordings": 3,
