@@ -20,6 +20,8 @@ constexpr std::chrono::milliseconds kLogIntervalOfSession{1000};
 constexpr std::chrono::seconds kLongestAnswering{3};
 constexpr int kShareOfTime = 60;
 constexpr std::chrono::seconds kLongestPause{3};
+// A session that has just begun has said nothing yet, and the answer is of the one before it.
+constexpr std::chrono::seconds kLongestSeldom{15};
 // A session that is killed changes no file, and what stands in the way of a reading may go unseen.
 constexpr std::chrono::seconds kLongestTrust{2};
 constexpr std::size_t kMostIconBytes = std::size_t{64} << 20U;
@@ -127,7 +129,8 @@ std::optional<HttpAnswer> ServedDevice::seldomAnswer() const {
 void ServedDevice::keepSeldom(const HttpAnswer& answer, ReadingClock::duration cost) {
     const std::lock_guard lock(mutex_);
     seldomAnswer_ = answer;
-    seldomUntil_ = ReadingClock::now() + (isUnderWay_ ? cost * kShareOfTime : cost * 0);
+    const ReadingClock::duration share = isUnderWay_ ? cost * kShareOfTime : cost * 0;
+    seldomUntil_ = ReadingClock::now() + std::min<ReadingClock::duration>(share, kLongestSeldom);
 }
 
 // What was made while the session went on is not what there is to show of it once it is seen to be

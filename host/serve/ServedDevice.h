@@ -53,7 +53,8 @@ class ServedDevice {
     using Question = std::function<HttpAnswer(Device& device)>;
     [[nodiscard]] HttpAnswer answer(Question question);
     /// The same of the one question that takes long and is asked again and again: while a session
-    /// is under way the last answer stands until asking anew takes at most a sixtieth of the time.
+    /// is under way the last answer stands until asking anew takes at most a sixtieth of the time,
+    /// or for fifteen seconds.
     [[nodiscard]] HttpAnswer answerSeldom(Question question);
 
     /// The icon as it is shown for an identifier; 204 where there is none.
