@@ -45,7 +45,7 @@ class ActingAccount : public ::testing::Test {
     }
 
   private:
-    const testing::ScratchDirectory directory_;
+    const device_files::ScratchDirectory directory_;
 };
 
 TEST_F(ActingAccount, OfOneThreadIsThatOfItAloneAndOfThoseThatItStarts) {
