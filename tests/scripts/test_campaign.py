@@ -30,7 +30,9 @@ echo '"seeds": "250", "faults": "3"'
 LISTS = """cmake_minimum_required(VERSION 3.20)
 project(standin NONE)
 add_custom_target(appsync COMMAND cmake -E touch ${CMAKE_BINARY_DIR}/appsync)
-add_custom_target(test_recordings COMMAND cmake -E touch ${CMAKE_BINARY_DIR}/tests/test_recordings)
+add_custom_target(test_recordings
+    COMMAND cmake -E make_directory ${CMAKE_BINARY_DIR}/tests
+    COMMAND cmake -E touch ${CMAKE_BINARY_DIR}/tests/test_recordings)
 add_custom_target(test_reliability
     COMMAND cmake -E copy ${CMAKE_SOURCE_DIR}/program ${CMAKE_BINARY_DIR}/tests/test_reliability)
 """
