@@ -587,7 +587,6 @@ def test_a_folder_of_devices(appsync, device, library, tmp_path):
     assert states == {names[0]: "idle", names[1]: "gone", names[2]: "idle"}
 
 
-@ON_ONE_PATH
 def test_devices_beyond_the_most_that_are_served_are_told_of(appsync, tmp_path):
     folder = tmp_path / "many"
     for number in range(502):
