@@ -260,7 +260,8 @@ TEST(TimelineLog, WhatIsSentOfWhatAKilledSyncWasTransferringIsNoPartOfIt) {
         R"("com.korvu.trd sends com.a, which the device has not asked for","format":)"
         R"("%s sends %{public}@, which the device has not asked for"})"
         "\n";
-    const std::vector<LoggedSession> sessions = sessionsInLog(sync + sent + transferOf("com.a"));
+    const std::string text = sync + sent + transferOf("com.a");
+    const std::vector<LoggedSession> sessions = sessionsInLog(text);
     ASSERT_THAT(sessions, SizeIs(2));
     EXPECT_FALSE(sessions[1].lacksBeginning);
     ASSERT_THAT(sessions[1].lines, SizeIs(2));
