@@ -20,8 +20,9 @@ constexpr std::chrono::milliseconds kLogIntervalOfSession{1000};
 constexpr std::chrono::seconds kLongestAnswering{3};
 constexpr int kShareOfTime = 60;
 constexpr std::chrono::seconds kLongestPause{3};
-// A session that has just begun has said nothing yet, and the answer is of the one before it.
 constexpr std::chrono::seconds kLongestSeldom{15};
+// A session that has just begun has said nothing yet, and an answer is of the one before it.
+constexpr std::chrono::seconds kBeginOfSession{3};
 // A session that is killed changes no file, and what stands in the way of a reading may go unseen.
 constexpr std::chrono::seconds kLongestTrust{2};
 constexpr std::size_t kMostIconBytes = std::size_t{64} << 20U;
@@ -129,8 +130,10 @@ std::optional<HttpAnswer> ServedDevice::seldomAnswer() const {
 void ServedDevice::keepSeldom(const HttpAnswer& answer, ReadingClock::duration cost) {
     const std::lock_guard lock(mutex_);
     seldomAnswer_ = answer;
-    const ReadingClock::duration share = isUnderWay_ ? cost * kShareOfTime : cost * 0;
-    seldomUntil_ = ReadingClock::now() + std::min<ReadingClock::duration>(share, kLongestSeldom);
+    const ReadingClock::time_point now = ReadingClock::now();
+    const bool goesOn = isUnderWay_ && now - cost - underWaySince_ >= kBeginOfSession;
+    const ReadingClock::duration share = goesOn ? cost * kShareOfTime : cost * 0;
+    seldomUntil_ = now + std::min<ReadingClock::duration>(share, kLongestSeldom);
 }
 
 // What was made while the session went on is not what there is to show of it once it is seen to be
@@ -238,7 +241,9 @@ void ServedDevice::read(Result<std::unique_ptr<Device>>& device, const DeviceSta
     if (!stamp_) toldLog_ = stamp.log;  // what has grown nobody has seen
     stamp_ = stamp;
     hasFailed_ = !reading;
+    const bool wasUnderWay = isUnderWay_;
     isUnderWay_ = reading && reading->moment.session.isUnderWay;
+    if (isUnderWay_ && !wasUnderWay) underWaySince_ = ReadingClock::now();
     if (!isUnderWay_) forgetSeldom();
     std::shared_ptr<const DeviceView> view = viewer_.show(reading, stamp.log.size > 0);
     if (tellsOfLog(stamp)) view = viewer_.showLogChanged();

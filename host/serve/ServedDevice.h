@@ -54,7 +54,7 @@ class ServedDevice {
     [[nodiscard]] HttpAnswer answer(Question question);
     /// The same of the one question that takes long and is asked again and again: while a session
     /// is under way the last answer stands until asking anew takes at most a sixtieth of the time,
-    /// or for fifteen seconds.
+    /// or for fifteen seconds; not in the first three of a session.
     [[nodiscard]] HttpAnswer answerSeldom(Question question);
 
     /// The icon as it is shown for an identifier; 204 where there is none.
@@ -119,6 +119,7 @@ class ServedDevice {
     DeviceViewer viewer_;
     std::optional<DeviceStamp> stamp_;  // of the last reading
     bool isUnderWay_ = false;
+    ReadingClock::time_point underWaySince_;
     bool hasFailed_ = false;
     ReadingClock::time_point lastReading_;
     ServedFileStamp toldLog_;                 // of which was told
