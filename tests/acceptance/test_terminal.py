@@ -49,8 +49,8 @@ def waiting(appsync, device, library):
 
 
 def has_come_to_wait(lines):
-    """A line for the whole, and one for the application that runs, with the time of the next try."""
-    return len(lines) == 2 and re.search(r"\d\d:\d\d:\d\d", lines[1])
+    """A line for the whole, where the four others have ended, and one for the one that runs: when its next try is."""
+    return len(lines) == 2 and "4 of 5" in lines[0] and re.search(r"\d\d:\d\d:\d\d", lines[1])
 
 
 # The whole and its parts.
@@ -58,7 +58,7 @@ def has_come_to_wait(lines):
 
 def test_one_line_is_of_the_whole_and_the_others_of_what_is_active(device, waiting, terminal):
     shown = terminal("sync", device.path, waiting)
-    shown.read_until(lambda lines: has_come_to_wait(lines) and "  4 of 5  " in lines[0])
+    shown.read_until(has_come_to_wait)
     whole, install = shown.shown()
     assert re.match(r"\[#+\.+\] +\d+ %  4 of 5  \S+ \w+ of \S+ \w+  ", whole), whole
     assert install.startswith("install ") and A in install and "next try" in install
@@ -167,14 +167,14 @@ def test_ctrl_c_during_the_wait_leaves_every_line_whole(device, waiting, termina
 @pytest.mark.parametrize("locale", ["C", "C.UTF-8"])
 def test_no_line_is_broken_whatever_the_width(device, waiting, terminal, columns, locale):
     shown = terminal("sync", device.path, waiting, columns=columns, locale=locale)
-    shown.read_until(lambda lines: has_come_to_wait(lines) and "4 of 5" in lines[0])
+    shown.read_until(has_come_to_wait)
     assert " %" in shown.shown()[0]
     assert locale != "C" or shown.written.isascii()
 
 
 def test_a_terminal_that_becomes_narrower_gets_lines_that_fit(device, waiting, terminal):
     shown = terminal("sync", device.path, waiting, columns=120)
-    shown.read_until(lambda lines: has_come_to_wait(lines) and "4 of 5" in lines[0])
+    shown.read_until(has_come_to_wait)
     shown.resize(30)
     erased = shown.written.count("\x1b[J")
     # What a line that was just being drawn has left above is the terminal's.
@@ -228,7 +228,7 @@ def test_in_tmux_it_is_as_without(appsync, device, waiting, tmp_path):
             time.sleep(0.05)
 
     try:
-        lines_when(lambda lines: has_come_to_wait(lines) and "  4 of 5  " in lines[0])
+        lines_when(has_come_to_wait)
         subprocess.run([*tmux, "send-keys", "C-c"], check=True)
         lines = lines_when(lambda lines: lines and lines[-1] == "status 1")
         assert any("%s: interrupted" % A in "".join(lines) for line in lines)
