@@ -8,10 +8,10 @@ function(appsync_add_folder target)
     target_sources(${target} PRIVATE "${CMAKE_CURRENT_SOURCE_DIR}/CMakeLists.txt" ${sources})
 endfunction()
 
-# Compiles the sources of TARGET a dozen at a time, where that is asked for.
+# Compiles the sources of TARGET three dozen at a time, where that is asked for.
 function(appsync_merge_sources target)
     if(APPSYNC_MERGE_SOURCES)
-        set_target_properties(${target} PROPERTIES UNITY_BUILD ON UNITY_BUILD_BATCH_SIZE 12)
+        set_target_properties(${target} PROPERTIES UNITY_BUILD ON UNITY_BUILD_BATCH_SIZE 36)
         if(CMAKE_CXX_COMPILER_ID STREQUAL "GNU")
             # A source that is included looks to it like a header, which many may include.
             target_compile_options(${target} PRIVATE -Wno-subobject-linkage)

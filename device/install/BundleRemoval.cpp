@@ -19,7 +19,7 @@ namespace appsync {
 namespace {
 
 /// What a removal found, and what it leaves to be done once it is committed.
-struct Outcome {
+struct RemovalOutcome {
     std::optional<BundleRow> application;
     std::optional<BundleRow> placeholder;
     bool removedApplication = false;
@@ -35,7 +35,7 @@ struct Outcome {
     }
 };
 
-Status find(Database& database, const std::string& identifier, Outcome& outcome) {
+Status find(Database& database, const std::string& identifier, RemovalOutcome& outcome) {
     auto application = findBundle(database, BundleTable::Applications, identifier);
     if (!application) return application.error();
     outcome.application = std::move(*application);
@@ -57,7 +57,7 @@ const char* nothingToRemove(Removal removal) {
 }
 
 // Decides what goes. An error when that is nothing.
-Status decide(const std::string& identifier, Removal removal, Outcome& outcome) {
+Status decide(const std::string& identifier, Removal removal, RemovalOutcome& outcome) {
     outcome.removedPlaceholder =
         outcome.placeholder && (removal != Removal::SyncPlaceholderOnly ||
                                 outcome.placeholder->installType == kInstallTypeSync);
@@ -78,7 +78,8 @@ Status runFor(Database& database, const char* sql, const std::string& identifier
     return database.query(sql).bind(identifier).run();
 }
 
-Status noteUninstalled(Database& database, const std::string& identifier, const Outcome& outcome) {
+Status noteUninstalled(Database& database, const std::string& identifier,
+                       const RemovalOutcome& outcome) {
     const std::optional<BundleRow>& row =
         outcome.application ? outcome.application : outcome.placeholder;
     return database
@@ -87,7 +88,7 @@ Status noteUninstalled(Database& database, const std::string& identifier, const 
         .run();
 }
 
-Status forget(Database& database, const std::string& identifier, Outcome& outcome) {
+Status forget(Database& database, const std::string& identifier, RemovalOutcome& outcome) {
     Status status;
     if (outcome.removedPlaceholder) {
         status = forgetPlaceholder(database, identifier, outcome.freed.placeholder);
@@ -104,7 +105,7 @@ Status forget(Database& database, const std::string& identifier, Outcome& outcom
 }
 
 Status removeRows(Database& database, const std::string& identifier, Removal removal,
-                  Outcome& outcome) {
+                  RemovalOutcome& outcome) {
     outcome = {};
     Status status = find(database, identifier, outcome);
     if (status) status = decide(identifier, removal, outcome);
@@ -118,7 +119,7 @@ Status removeRows(Database& database, const std::string& identifier, Removal rem
 
 Status removeBundles(const InstallContext& context, const std::string& identifier,
                      Removal removal) {
-    Outcome outcome;
+    RemovalOutcome outcome;
     const Status committed = context.database.change(Durability::OnDisk, [&](Database& database) {
         return removeRows(database, identifier, removal, outcome);
     });

@@ -16,6 +16,8 @@
 namespace appsync {
 namespace {
 
+using Json = nlohmann::ordered_json;
+
 // As `set` takes them.
 const char* settingText(PolicyAnswer answer) {
     switch (answer) {
@@ -206,7 +208,6 @@ std::string overviewText(const DeviceOverview& overview, std::size_t width) {
 std::string jsonText(const DeviceOverview& overview) { return indented(jsonOf(overview)); }
 
 nlohmann::ordered_json jsonOf(const DeviceOverview& overview) {
-    using Json = nlohmann::ordered_json;
     const DeviceSettings& settings = overview.settings;
     const std::optional<std::int64_t>& process = overview.session.process;
     return {{"installation", settingText(settings.installation)},

@@ -11,6 +11,8 @@
 namespace appsync {
 namespace {
 
+using Json = nlohmann::ordered_json;
+
 bool isArriving(const ApplicationStatus& status) {
     return (status.placeholder && isOpenInstall(*status.placeholder)) ||
            (status.coordinator && isOpenInstall(*status.coordinator));
@@ -64,7 +66,6 @@ void ObservedSession::seeInstalls(const DeviceMoment& moment) {
 }
 
 nlohmann::ordered_json ObservedSession::json() const {
-    using Json = nlohmann::ordered_json;
     if (!record_.isUnderWay && !record_.wasInterrupted) return {};
     const bool isCounted = record_.isUnderWay && !begun_.empty();
     return {{"running", record_.isUnderWay},

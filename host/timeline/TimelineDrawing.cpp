@@ -14,7 +14,7 @@ constexpr std::array<SpanLook, kSpanKinds> kLooks = {{
     {{0x00, 0x72, 0xB2}, PicturePattern::Plain, 'T', true},
     {{0xF0, 0xE4, 0x42}, PicturePattern::Dots, 'Q', false},
     {{0xE6, 0x9F, 0x00}, PicturePattern::Rising, 'W', false},
-    {{0xCC, 0x79, 0xA7}, PicturePattern::Level, 'S', false},
+    {{0xCC, 0x79, 0xA7}, PicturePattern::Flat, 'S', false},
     {{0x00, 0x9E, 0x73}, PicturePattern::Plain, 'I', false},
     {{0x99, 0x99, 0x99}, PicturePattern::Crossed, 'R', false},
 }};

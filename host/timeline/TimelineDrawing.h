@@ -96,7 +96,7 @@ struct PictureColor {
 };
 
 /// The pattern that a kind of span has beside its colour, and the letter that stands in it.
-enum class PicturePattern { Plain, Dots, Rising, Level, Crossed };
+enum class PicturePattern { Plain, Dots, Rising, Flat, Crossed };
 struct SpanLook {
     PictureColor color;
     PicturePattern pattern = PicturePattern::Plain;

@@ -35,7 +35,7 @@ void strokePattern(cairo_t* context, PicturePattern pattern) {
             line(-1, 1, 1, -1);
             line(kEnd - 1, kEnd + 1, kEnd + 1, kEnd - 1);
             break;
-        case PicturePattern::Level:
+        case PicturePattern::Flat:
             line(0, 1.5, kEnd, 1.5);
             line(0, 4.5, kEnd, 4.5);
             break;

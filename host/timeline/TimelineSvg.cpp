@@ -62,7 +62,7 @@ const char* patternContent(PicturePattern pattern) {
             return R"(<circle cx="3" cy="3" r="1" fill="#1a1a1a"/>)";
         case PicturePattern::Rising:
             return R"(<path d="M-1 7L7 -1M-1 1L1 -1M5 7L7 5" stroke="#1a1a1a" fill="none"/>)";
-        case PicturePattern::Level:
+        case PicturePattern::Flat:
             return R"(<path d="M0 1.5H6M0 4.5H6" stroke="#1a1a1a" stroke-width=".8" fill="none"/>)";
         case PicturePattern::Crossed:
             return R"(<path d="M0 0L6 6M0 6L6 0" stroke="#1a1a1a" stroke-width=".8" fill="none"/>)";

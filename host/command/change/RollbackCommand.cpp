@@ -14,6 +14,8 @@
 namespace appsync {
 namespace {
 
+using Json = nlohmann::ordered_json;
+
 std::string toldVersion(const std::optional<std::string>& version) {
     return version ? printable(*version) : "-";
 }
@@ -26,7 +28,6 @@ std::string rollbackLine(const std::string& identifier, const RollbackRecord& re
 }
 
 std::string rollbackJson(const std::string& identifier, const RollbackRecord& record) {
-    using Json = nlohmann::ordered_json;
     return indented({{"identifier", identifier},
                      {"state", "rolled back"},
                      {"changed", true},
