@@ -39,6 +39,8 @@ class SimulatedHomeScreen::Assertion : public TerminationAssertion {
     Assertion(const Assertion&) = delete;
     Assertion& operator=(const Assertion&) = delete;
 
+    // What is thrown is a mistake of the simulation itself, which ends the test.
+    // NOLINTNEXTLINE(bugprone-exception-escape)
     ~Assertion() override {
         const RecordedCall call(recorder_, "TerminationAssertion", "release", *position_);
         held_->erase(position_);
