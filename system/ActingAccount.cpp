@@ -13,6 +13,15 @@ namespace {
 
 constexpr std::uint32_t bitOf(int capability) { return std::uint32_t{1} << unsigned(capability); }
 
+// Where there are two, the former one cuts numbers off.
+#ifdef SYS_setresuid32
+constexpr long kSetUsers = SYS_setresuid32;
+constexpr long kSetGroups = SYS_setresgid32;
+#else
+constexpr long kSetUsers = SYS_setresuid;
+constexpr long kSetGroups = SYS_setresgid;
+#endif
+
 constexpr uid_t kUnchanged = static_cast<uid_t>(-1);
 
 /// Whether the account is this thread's own, and not that of the process.
@@ -49,10 +58,10 @@ void actOnThisThreadAs(uid_t user, gid_t group) noexcept {
     if (!actsAlone && ::geteuid() != 0) return;
     const gid_t itsGroup = user == 0 ? ::getgid() : group;
     if (actsAlone && ::geteuid() == user && ::getegid() == itsGroup) return;
-    if (::syscall(SYS_setresuid, kUnchanged, 0, kUnchanged) != 0) return;
+    if (::syscall(kSetUsers, kUnchanged, 0, kUnchanged) != 0) return;
     actsAlone = true;
-    if (::syscall(SYS_setresgid, kUnchanged, itsGroup, kUnchanged) != 0) return;
-    if (user != 0 && ::syscall(SYS_setresuid, kUnchanged, user, kUnchanged) == 0) keepAccess();
+    if (::syscall(kSetGroups, kUnchanged, itsGroup, kUnchanged) != 0) return;
+    if (user != 0 && ::syscall(kSetUsers, kUnchanged, user, kUnchanged) == 0) keepAccess();
 }
 
 }  // namespace appsync

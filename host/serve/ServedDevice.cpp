@@ -131,7 +131,7 @@ void ServedDevice::keepSeldom(const HttpAnswer& answer, ReadingClock::duration c
     const std::lock_guard lock(mutex_);
     seldomAnswer_ = answer;
     const ReadingClock::time_point now = ReadingClock::now();
-    const bool goesOn = isUnderWay_ && now - cost - underWaySince_ >= kBeginOfSession;
+    const bool goesOn = session_.isUnderWay && now - cost - underWaySince_ >= kBeginOfSession;
     const ReadingClock::duration share = goesOn ? cost * kShareOfTime : cost * 0;
     seldomUntil_ = now + std::min<ReadingClock::duration>(share, kLongestSeldom);
 }
@@ -218,7 +218,8 @@ void ServedDevice::work(const std::deque<std::shared_ptr<Asked>>& questions) {
 // Whether the log has grown, and it is time to say so.
 bool ServedDevice::tellsOfLog(const DeviceStamp& stamp) {
     if (stamp.log == toldLog_) return false;
-    const ReadingClock::duration interval = isUnderWay_ ? kLogIntervalOfSession : kStampInterval;
+    const ReadingClock::duration interval =
+        session_.isUnderWay ? kLogIntervalOfSession : kStampInterval;
     const ReadingClock::time_point now = ReadingClock::now();
     if (now - lastLogChange_ < interval) return false;
     toldLog_ = stamp.log;
@@ -230,7 +231,7 @@ bool ServedDevice::hasToRead(const DeviceStamp& stamp) const {
     if (!stamp_) return true;
     const ReadingClock::duration age = ReadingClock::now() - lastReading_;
     if (age < pause_) return false;
-    if ((isUnderWay_ || hasFailed_) && age >= kLongestTrust) return true;
+    if ((session_.isUnderWay || hasFailed_) && age >= kLongestTrust) return true;
     return !stamp.holdsSameAs(*stamp_);
 }
 
@@ -241,17 +242,24 @@ void ServedDevice::read(Result<std::unique_ptr<Device>>& device, const DeviceSta
     if (!stamp_) toldLog_ = stamp.log;  // what has grown nobody has seen
     stamp_ = stamp;
     hasFailed_ = !reading;
-    const bool wasUnderWay = isUnderWay_;
-    isUnderWay_ = reading && reading->moment.session.isUnderWay;
-    if (isUnderWay_ && !wasUnderWay) underWaySince_ = ReadingClock::now();
-    if (!isUnderWay_) forgetSeldom();
+    see(reading ? reading->moment.session : SessionRecord());
     std::shared_ptr<const DeviceView> view = viewer_.show(reading, stamp.log.size > 0);
     if (tellsOfLog(stamp)) view = viewer_.showLogChanged();
     publish(std::move(view));
     lastReading_ = ReadingClock::now();
     const ReadingClock::duration pause = (lastReading_ - begin) * kShareOfTime;
-    pause_ = isUnderWay_ ? std::min<ReadingClock::duration>(pause, kLongestPause)
-                         : ReadingClock::duration{};
+    pause_ = session_.isUnderWay ? std::min<ReadingClock::duration>(pause, kLongestPause)
+                                 : ReadingClock::duration{};
+}
+
+// One that ends and another that begins may lie between two readings.
+void ServedDevice::see(const SessionRecord& session) {
+    const bool isTheSame = session.isUnderWay && session_.isUnderWay &&
+                           session.process == session_.process && session.since == session_.since;
+    session_ = session;
+    if (isTheSame) return;
+    underWaySince_ = ReadingClock::now();
+    forgetSeldom();
 }
 
 void ServedDevice::publish(std::shared_ptr<const DeviceView> view) {

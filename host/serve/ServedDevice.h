@@ -12,6 +12,7 @@
 #include <string>
 #include <thread>
 
+#include "device/values/DeviceRecords.h"
 #include "host/serve/DeviceStamp.h"
 #include "host/serve/DeviceView.h"
 #include "host/serve/http/HttpServer.h"
@@ -85,6 +86,7 @@ class ServedDevice {
     [[nodiscard]] bool tellsOfLog(const DeviceStamp& stamp);
     void read(Result<std::unique_ptr<Device>>& device, const DeviceStamp& stamp,
               ReadingClock::time_point begin);
+    void see(const SessionRecord& session);
     void publish(std::shared_ptr<const DeviceView> view);
     void takeBackLocked();
     void answerAll(const std::deque<std::shared_ptr<Asked>>& questions,
@@ -118,7 +120,7 @@ class ServedDevice {
     // The thread's own.
     DeviceViewer viewer_;
     std::optional<DeviceStamp> stamp_;  // of the last reading
-    bool isUnderWay_ = false;
+    SessionRecord session_;             // as it was read last
     ReadingClock::time_point underWaySince_;
     bool hasFailed_ = false;
     ReadingClock::time_point lastReading_;

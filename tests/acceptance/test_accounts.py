@@ -1,5 +1,6 @@
 """Who may use a device: its owner, root, and those who may only read it."""
 
+import contextlib
 import json
 import os
 import pathlib
@@ -118,6 +119,24 @@ def test_what_root_makes_belongs_to_the_owner_of_the_device(place, coordination)
     assert place.as_nobody("inventory", device.path).stderr == ""
 
 
+def cards_when_all_are_idle(address):
+    """One that takes long to be read is shown as locked until it has been."""
+    for _ in range(20):
+        with urllib.request.urlopen(address + "api/devices") as answer:
+            cards = json.load(answer)["devices"]
+        if all(card["state"] == "idle" for card in cards):
+            break
+    return cards
+
+
+def accounts_of_threads(process):
+    accounts = set()
+    for each in pathlib.Path("/proc/%d/task" % process).glob("*/status"):
+        with contextlib.suppress(OSError):  # a thread that has ended meanwhile
+            accounts.add(re.search(r"\nUid:\s\d+\s(\d+)", each.read_text())[1])
+    return accounts
+
+
 @pytest.mark.plain_build  # who has taken on another account is not looked into for leaks
 def test_root_looks_at_each_device_of_a_folder_as_its_owner(place):
     another, library = NOBODY - 1, place.library()
@@ -130,10 +149,8 @@ def test_root_looks_at_each_device_of_a_folder_as_its_owner(place):
     process = place.appsync.start("serve", folder, "--port", "0")
     try:
         address = re.search(r"http://[^/]*/", process.stdout.readline())[0]
-        with urllib.request.urlopen(address + "api/devices") as answer:
-            cards = json.load(answer)["devices"]
-        accounts = {re.search(r"\nUid:\s\d+\s(\d+)", each.read_text())[1]
-                    for each in pathlib.Path("/proc/%d/task" % process.pid).glob("*/status")}
+        cards = cards_when_all_are_idle(address)
+        accounts = accounts_of_threads(process.pid)
     finally:
         process.terminate()
         assert process.wait() == 0

@@ -404,19 +404,25 @@ def test_the_timeline_is_drawn_while_its_log_grows(appsync, device, library, ser
 @ON_ONE_PATH
 def test_the_timeline_of_a_session_that_has_ended_is_another(appsync, device, library, serving):
     device.sync(library)
-    packages.make_library(library, 5, "2.0", payload=os.urandom(8_000_000))
+    packages.make_library(library, 5, "2.0")
+    appsync("run", device.path, IDS[0])
     address = serving.view()["timeline"]
     with open(os.path.join(device.path, "log", "system.log"), "a") as log:
         log.write(LINE % (1, 8, "info", "more" * 25) * 20_000)  # so that drawing takes a while
 
-    def goes_on():
-        return b"The session goes on." in serving.ask(address)[2]
+    def picture():
+        return serving.ask(address)[2]
+
+    def is_kept():
+        """One that is drawn anew has grown."""
+        return b"The session goes on." in picture() and picture() == picture()
 
     sync = appsync.start("sync", device.path, library)
-    eventually(goes_on)
-    while sync.poll() is None or serving.state() != "idle":
-        goes_on()
-    assert not goes_on()
+    eventually(is_kept)
+    sync.kill()
+    sync.wait()
+    eventually(lambda: serving.state() != "syncing")
+    assert b"The session goes on." not in picture()
 
 
 @ON_ONE_PATH

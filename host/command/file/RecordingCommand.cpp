@@ -1,7 +1,9 @@
 #include <array>
 #include <chrono>
+#include <cstddef>
 #include <cstdio>
 #include <ostream>
+#include <ranges>
 #include <set>
 #include <string>
 #include <string_view>
@@ -80,11 +82,12 @@ std::string sayNothingFits(const RecordedSession& session,
     services.erase("");
     std::string text = "no line fits, of " + counted(session.lines.size(), "line");
     if (!arguments.service || services.contains(*arguments.service)) return text + "\n";
-    text += "; what is recorded is of ";
-    const char* between = "";
-    for (const std::string_view each : services) {
-        text.append(std::exchange(between, ", ")).append(each);
+    constexpr std::size_t kMost = 30;  // more than there are, but for a file that somebody made up
+    const char* between = "; what is recorded is of ";
+    for (const std::string_view each : services | std::views::take(kMost)) {
+        text.append(std::exchange(between, ", ")).append(printable(std::string(each)));
     }
+    if (services.size() > kMost) text += ", and more";
     return text + "\n";
 }
 

@@ -184,6 +184,7 @@ _appsync() {
         fi
     done
     before=${words[-1]%"${words[-1]##*=}"}
+    if [[ $COMP_WORDBREAKS != *=* ]]; then before=; fi
     words=("${words[@]//\\/}")
     words=("${words[@]/#\~\//$HOME/}")
     COMPREPLY=()

@@ -153,6 +153,15 @@ struct Served {
     std::thread thread;
 };
 
+// Where no thread or no memory is left for what it looks at, it is over; who reads it asks again.
+std::optional<std::string> nextOf(EventStream& events) {
+    try {
+        return events.next();
+    } catch (const std::exception&) {
+        return std::nullopt;
+    }
+}
+
 }  // namespace
 
 HttpAnswer refusal(int status, const std::string& message) {
@@ -303,7 +312,7 @@ void HttpServer::State::giveEvents(const std::shared_ptr<EventStream>& events,
     const auto inFlight = std::make_shared<EventsInFlight>(eventStreams);
     response.set_chunked_content_provider(
         "text/event-stream", [events, inFlight](std::size_t, httplib::DataSink& sink) {
-            const std::optional<std::string> next = events->next();
+            const std::optional<std::string> next = nextOf(*events);
             if (next) return sink.write(next->data(), next->size());
             sink.done();
             return true;
