@@ -231,8 +231,9 @@ std::optional<LiveCoordinator::Writing> LiveCoordinator::takeWriting(std::uint64
     if (ended_) return std::nullopt;
     Writing writing;
     writing.isNew = !std::exchange(isWritten_, true);
-    writing.mayBeLost = losses_ && *losses_ != losses && !ending_ && !isLeaving_;
-    losses_ = losses;
+    const bool stays = !ending_ && !isLeaving_ && !isPreceded_;
+    writing.mayBeLost = stays && losses_ && *losses_ != losses;
+    if (stays || !losses_) losses_ = losses;  // what is not mended now may be later
     const bool hasChanged = std::exchange(rowChanged_, false);
     if (hasChanged || writing.isNew || writing.mayBeLost) writing.row = snapshotLocked();
     writing.pieces = pieces_;
@@ -249,11 +250,17 @@ Result<bool> LiveCoordinator::saveRow(Database& database, const Writing& writing
     return *cancelled ? Result<bool>(false) : insertReserved(database, *writing.row);
 }
 
+void LiveCoordinator::giveWay() {
+    const std::lock_guard lock(mutex_);
+    isPreceded_ = true;
+}
+
 Result<bool> LiveCoordinator::save(Database& database) {
     const std::optional<Writing> writing = takeWriting(database.losses());
     if (!writing) return false;
     if (writing->row) {
         const Result<bool> written = saveRow(database, *writing);
+        if (writing->isNew && written && !*written) giveWay();
         if (!written || !*written) return written;
     }
     for (const Piece& piece : writing->pieces) {

@@ -100,6 +100,7 @@ class LiveCoordinator {
     };
     [[nodiscard]] std::optional<Writing> takeWriting(std::uint64_t losses);
     [[nodiscard]] Result<bool> saveRow(Database& database, const Writing& writing) const;
+    void giveWay();
 
     [[nodiscard]] Status mayAdd(bool alreadyThere, const char* what) const;
     void removePiece(PromiseRole role);
@@ -122,6 +123,7 @@ class LiveCoordinator {
     bool rowChanged_ = false;
     bool isWritten_ = false;
     bool isLeaving_ = false;               // what installs it takes it away
+    bool isPreceded_ = false;              // another process had begun one of its identifier
     std::optional<std::uint64_t> losses_;  // of the database, when it was written last
 };
 

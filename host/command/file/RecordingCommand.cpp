@@ -3,7 +3,6 @@
 #include <cstddef>
 #include <cstdio>
 #include <ostream>
-#include <ranges>
 #include <set>
 #include <string>
 #include <string_view>
@@ -84,10 +83,11 @@ std::string sayNothingFits(const RecordedSession& session,
     if (!arguments.service || services.contains(*arguments.service)) return text + "\n";
     constexpr std::size_t kMost = 30;  // more than there are, but for a file that somebody made up
     const char* between = "; what is recorded is of ";
-    for (const std::string_view each : services | std::views::take(kMost)) {
+    std::size_t told = 0;
+    for (const std::string_view each : services) {
+        if (told++ == kMost) return text + ", and more\n";
         text.append(std::exchange(between, ", ")).append(printable(std::string(each)));
     }
-    if (services.size() > kMost) text += ", and more";
     return text + "\n";
 }
 

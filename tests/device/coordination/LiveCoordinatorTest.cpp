@@ -94,6 +94,34 @@ TEST_F(LiveCoordinatorTest, whatIsGoneWithNothingLostIsOver) {
     EXPECT_FALSE(save());
 }
 
+TEST_F(LiveCoordinatorTest, whatWasLostIsWrittenOnceItDoesNotEndAfterAll) {
+    saveInVain([](Database&) { return Status(noRoom()); });
+    ASSERT_TRUE(coordinator_->beginEnding());
+    static_cast<void>(save());
+    EXPECT_EQ(rows(), 0);
+    coordinator_->abandonEnding();
+    EXPECT_TRUE(save());
+    EXPECT_EQ(rows(), 1);
+}
+
+TEST_F(LiveCoordinatorTest, whatCameAfterAnotherIsOverThoughThatOneIsGoneAndSomethingIsLost) {
+    StoredCoordinator another;
+    another.id = 8;
+    another.identifier = kAtlas;
+    LiveCoordinator former(another, LiveCoordinator::Origin::New);
+    ASSERT_TRUE(database_->change(Durability::Soon, [&](Database& database) {
+        const Result<bool> saved = former.save(database);
+        EXPECT_TRUE(saved && *saved);
+        return Status();
+    }));
+    EXPECT_FALSE(save());
+    sql("DELETE FROM coordinators");
+    EXPECT_FALSE(database_->change(Durability::Soon, [](Database&) { return Status(noRoom()); }));
+    ASSERT_TRUE(coordinator_->setResponsible(SyncClientID));
+    EXPECT_FALSE(save());
+    EXPECT_EQ(rows(), 0);
+}
+
 TEST_F(LiveCoordinatorTest, whatItsInstallHasTakenAwayIsNotWrittenAgain) {
     ASSERT_TRUE(save());
     ASSERT_TRUE(database_->change(Durability::Soon, [&](Database& database) {
