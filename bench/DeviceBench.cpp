@@ -262,7 +262,7 @@ void restoreDirectly(benchmark::State& state) {
         }
     }
 }
-BENCHMARK(restoreDirectly)->Arg(1000)->UseManualTime()->Unit(benchmark::kMillisecond);
+BENCHMARK(restoreDirectly)->Arg(300)->UseManualTime()->Unit(benchmark::kMillisecond);
 
 std::string bytesOf(const fs::path& path) {
     std::ifstream file(path, std::ios::binary);
@@ -304,7 +304,7 @@ void restorePlainFiles(benchmark::State& state) {
     }
     state.counters["files"] = static_cast<double>(files.size());
 }
-BENCHMARK(restorePlainFiles)->Arg(1000)->UseManualTime()->Unit(benchmark::kMillisecond);
+BENCHMARK(restorePlainFiles)->Arg(300)->UseManualTime()->Unit(benchmark::kMillisecond);
 
 }  // namespace
 }  // namespace appsync

@@ -21,7 +21,7 @@ elseif(CMAKE_CXX_COMPILER_ID STREQUAL "GNU" AND CMAKE_CXX_COMPILER_VERSION VERSI
                         $<$<CONFIG:Release>:-Wno-stringop-overread>)
 endif()
 
-if(NOT APPSYNC_SANITIZE STREQUAL "none" OR APPSYNC_FUZZ)
+if(NOT APPSYNC_SANITIZE STREQUAL "none")
     # Line tables are all that a sanitizer's stack trace needs.
     if(CMAKE_CXX_COMPILER_ID STREQUAL "Clang")
         set(CMAKE_CXX_FLAGS_DEBUG "-O1 -gline-tables-only -fno-omit-frame-pointer")
@@ -46,11 +46,9 @@ elseif(NOT APPSYNC_SANITIZE STREQUAL "none")
 endif()
 
 if(APPSYNC_FUZZ)
-    if(NOT CMAKE_CXX_COMPILER_ID STREQUAL "Clang")
-        message(FATAL_ERROR "APPSYNC_FUZZ needs clang, which brings libFuzzer; use the preset 'fuzz'")
+    if(NOT CMAKE_CXX_COMPILER_ID STREQUAL "Clang" OR NOT APPSYNC_SANITIZE STREQUAL "address")
+        message(FATAL_ERROR "APPSYNC_FUZZ needs clang, which brings libFuzzer, and AddressSanitizer; use the preset 'fuzz'")
     endif()
-    add_compile_options(-fsanitize=fuzzer-no-link,address,undefined -fno-sanitize-recover=all)
-    add_link_options(-fsanitize=address,undefined)
 endif()
 
 if(APPSYNC_COVERAGE)

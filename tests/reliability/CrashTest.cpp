@@ -13,14 +13,6 @@
 #include "tests/reliability/Scenarios.h"
 #include "tests/reliability/SeedRange.h"
 
-#if defined(__SANITIZE_ADDRESS__) || defined(__SANITIZE_THREAD__)
-#define APPSYNC_SANITIZED 1
-#elif defined(__has_feature)
-#if __has_feature(address_sanitizer) || __has_feature(thread_sanitizer)
-#define APPSYNC_SANITIZED 1
-#endif
-#endif
-
 namespace appsync {
 
 namespace {
@@ -35,16 +27,9 @@ constexpr const char* kManyCrashSeeds = "APPSYNC_CRASH_SEEDS";
 constexpr const char* kFirstCrashSeed = "APPSYNC_CRASH_BASE";
 /// The scenarios whose recovery crashes at every instant, too, and the seeds of both crashes.
 constexpr const char* kCrashedTwice[] = {"DirectSync", "CoordinatedSync"};
-// Sanitizers take ten times as long, and look for something else.
-#ifdef APPSYNC_SANITIZED
-constexpr std::uint64_t kSeedsToCrash = 4;
-constexpr std::uint64_t kSeedsOfVariants = 4;
-constexpr std::uint64_t kSeedsOfPairs = 1;
-#else
-constexpr std::uint64_t kSeedsToCrash = 32;
-constexpr std::uint64_t kSeedsOfVariants = 12;
-constexpr std::uint64_t kSeedsOfPairs = 3;
-#endif
+constexpr std::uint64_t kSeedsToCrash = kIsSanitized ? 2 : 32;
+constexpr std::uint64_t kSeedsOfVariants = kIsSanitized ? 2 : 12;
+constexpr std::uint64_t kSeedsOfPairs = kIsSanitized ? 1 : 3;
 
 using Violations = std::vector<std::string>;
 

@@ -2,6 +2,7 @@
 #include <exception>
 
 #include "tests/reliability/Scenarios.h"
+#include "tests/reliability/SeedRange.h"
 
 namespace appsync {
 
@@ -72,12 +73,17 @@ void tryFault(const Scenario& scenario, const std::optional<Aim>& aim, Outcome& 
     }
 }
 
+/// Of the calls that a fault which lasts begins with, each one of so many. One that does not last
+/// is tried at each call.
+constexpr std::size_t kStepOfLastingFaults = kIsSanitized ? 3 : 1;
+
 class EveryFault : public testing::TestWithParam<Scenario> {
   protected:
     void failEach(const Outcome& plain, FaultExtent extent) {
         std::size_t injected = 0;
         std::size_t runs = 0;
-        for (std::size_t call = 0; call < plain.opportunities.size(); ++call) {
+        const std::size_t step = extent == FaultExtent::Once ? 1 : kStepOfLastingFaults;
+        for (std::size_t call = 0; call < plain.opportunities.size(); call += step) {
             const std::size_t ways =
                 extent == FaultExtent::Everything ? 1 : plain.opportunities[call].ways;
             for (std::size_t way = 0; way < ways; ++way) {

@@ -5,7 +5,21 @@
 #include <optional>
 #include <string>
 
+#if defined(__SANITIZE_ADDRESS__) || defined(__SANITIZE_THREAD__)
+#define APPSYNC_IS_SANITIZED true
+#elif defined(__has_feature)
+#if __has_feature(address_sanitizer) || __has_feature(thread_sanitizer)
+#define APPSYNC_IS_SANITIZED true
+#endif
+#endif
+#ifndef APPSYNC_IS_SANITIZED
+#define APPSYNC_IS_SANITIZED false
+#endif
+
 namespace appsync {
+
+/// Sanitizers take ten times as long, and look for something else: there the sweeps are shorter.
+inline constexpr bool kIsSanitized = APPSYNC_IS_SANITIZED;
 
 /// The environment variable that names one seed; those that say how many to try, from which on.
 inline constexpr const char* kOneSeed = "APPSYNC_SEED";

@@ -16,12 +16,7 @@ using testing::IsEmpty;
 
 /// The environment variable that asks for the least of a seed that fails.
 constexpr const char* kSmall = "APPSYNC_SMALL";
-// Sanitizers take ten times as long, and look for something else.
-#ifdef APPSYNC_SANITIZED
-constexpr std::uint64_t kSeedsToTry = 500;
-#else
-constexpr std::uint64_t kSeedsToTry = 2000;
-#endif
+constexpr std::uint64_t kSeedsToTry = kIsSanitized ? 250 : 2000;
 constexpr std::uint64_t kParts = 8;
 
 std::string firstDifference(const std::vector<std::string>& one,
