@@ -120,17 +120,25 @@ Status takeLock(const fs::path& device, std::optional<SessionLock>& lock) {
     return {};
 }
 
-Status readyForSession(DeviceDatabase& database) {
-    bool isFormer = false;
+bool hasRoom(const fs::path& device, std::uint64_t bytes) {
+    std::error_code error;
+    const fs::space_info space = fs::space(device, error);
+    return error || space.available >= bytes;
+}
+
+// What a full disk keeps from being brought up to date serves on as it is.
+Status readyForSession(const fs::path& device, DeviceDatabase& database) {
+    std::uint64_t room = 0;
     const Status checked = database.read([&](Database& whole) -> Status {
         if (Status status = checkDeviceDatabase(whole); !status) return status;
-        const Result<bool> former = isOfFormerSchema(whole);
-        if (!former) return former.error();
-        isFormer = *former;
+        const Result<std::uint64_t> needed = roomToBringSchemaUpToDate(whole);
+        if (!needed) return needed.error();
+        room = *needed;
         return {};
     });
-    if (!checked || !isFormer) return checked;
-    return database.change(Durability::OnDisk, bringSchemaUpToDate);
+    if (!checked || room == 0) return checked;
+    return database.change(Durability::OnDisk,
+                           hasRoom(device, room) ? bringSchemaUpToDate : makeSchemaUsable);
 }
 
 Status openDatabase(const fs::path& device, bool session, OpenedDevice& opened) {
@@ -140,7 +148,7 @@ Status openDatabase(const fs::path& device, bool session, OpenedDevice& opened) 
     if (!database) return database.error();
     opened.database = std::move(*database);
     if (!session) return {};
-    return readyForSession(*opened.database);
+    return readyForSession(device, *opened.database);
 }
 
 Status openFiles(const fs::path& device, OpenedDevice& opened) {

@@ -393,6 +393,22 @@ Status leaveVersion4(Database& database) {
     return status ? database.execute(kTakeOverVersion4) : status;
 }
 
+// The tables of the versions from this one on have the same columns.
+constexpr std::int64_t kUsableVersion = 4;
+
+Status bringSchemaTo(Database& database, std::int64_t wanted) {
+    const Result<std::int64_t> version = database.integer("PRAGMA user_version");
+    if (!version) return version.error();
+    if (*version >= wanted) return {};
+    Status status;
+    if (*version < 2) status = leaveVersion1(database);
+    if (status && *version < 3) status = database.execute(kTablesSinceVersion3);
+    if (status && *version < 4) status = database.execute(kTablesSinceVersion4);
+    if (status && wanted >= 5) status = leaveVersion4(database);
+    if (!status) return status;
+    return database.execute(("PRAGMA user_version = " + std::to_string(wanted)).c_str());
+}
+
 }  // namespace
 
 Status createDeviceSchema(Database& database) {
@@ -420,10 +436,20 @@ Status checkDeviceSchema(Database& database) {
     return checkDefinitions(database, *version);
 }
 
-Result<bool> isOfFormerSchema(Database& database) {
+// Its rows stand there twice until it is done, in the log and, once that is taken over, in the
+// file: three times its size were measured, and a session needs some room for itself.
+Result<std::uint64_t> roomToBringSchemaUpToDate(Database& database) {
+    constexpr std::uint64_t kForTheSession = std::uint64_t{512} << 10U;
+    std::uint64_t room = 3;
     const Result<std::int64_t> version = database.integer("PRAGMA user_version");
     if (!version) return version.error();
-    return *version < kDeviceSchemaVersion;
+    if (*version >= kDeviceSchemaVersion) return std::uint64_t{0};
+    for (const char* factor : {"PRAGMA page_count", "PRAGMA page_size"}) {
+        const Result<std::int64_t> value = database.integer(factor);
+        if (!value) return value.error();
+        room *= static_cast<std::uint64_t>(*value);
+    }
+    return room + kForTheSession;
 }
 
 Result<bool> hasKeptTable(Database& database) {
@@ -433,17 +459,10 @@ Result<bool> hasKeptTable(Database& database) {
 }
 
 Status bringSchemaUpToDate(Database& database) {
-    const Result<std::int64_t> version = database.integer("PRAGMA user_version");
-    if (!version) return version.error();
-    Status status;
-    if (*version < 2) status = leaveVersion1(database);
-    if (status && *version < 3) status = database.execute(kTablesSinceVersion3);
-    if (status && *version < 4) status = database.execute(kTablesSinceVersion4);
-    if (status && *version < 5) status = leaveVersion4(database);
-    if (!status || *version == kDeviceSchemaVersion) return status;
-    const std::string mark = "PRAGMA user_version = " + std::to_string(kDeviceSchemaVersion);
-    return database.execute(mark.c_str());
+    return bringSchemaTo(database, kDeviceSchemaVersion);
 }
+
+Status makeSchemaUsable(Database& database) { return bringSchemaTo(database, kUsableVersion); }
 
 Status checkDeviceDatabase(Database& database) {
     Query lines = database.query("PRAGMA quick_check(1)");

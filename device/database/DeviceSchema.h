@@ -1,5 +1,7 @@
 #pragma once
 
+#include <cstdint>
+
 #include "platform/Result.h"
 
 namespace appsync {
@@ -10,7 +12,8 @@ class Database;
 inline constexpr int kDeviceApplicationId = 0x41707073;
 
 /// The schema that this version makes; docs/device-format.md describes it. One of an earlier
-/// version serves whoever looks; a session brings it up to date first.
+/// version serves whoever looks; a session brings it up to date first, where there is room for
+/// that.
 inline constexpr int kDeviceSchemaVersion = 5;
 
 /// Makes the tables of an empty database, and marks it as a device's.
@@ -21,8 +24,9 @@ Status createDeviceSchema(Database& database);
 /// take part in every statement.
 Status checkDeviceSchema(Database& database);
 
-/// Whether an earlier version has made it.
-[[nodiscard]] Result<bool> isOfFormerSchema(Database& database);
+/// The free space that bringing it up to date takes, with what a session needs besides; 0 where it
+/// is of this version.
+[[nodiscard]] Result<std::uint64_t> roomToBringSchemaUpToDate(Database& database);
 
 /// Whether it has the table `kept`, which came with version 3.
 [[nodiscard]] Result<bool> hasKeptTable(Database& database);
@@ -30,6 +34,9 @@ Status checkDeviceSchema(Database& database);
 /// Makes a database of an earlier version one of this version, in the caller's transaction; nothing
 /// that it holds is lost. No work where it is one already.
 Status bringSchemaUpToDate(Database& database);
+
+/// The same as far as a session needs it, which takes little room, however much the database holds.
+Status makeSchemaUsable(Database& database);
 
 /// Reads the whole database and refuses it when it is damaged.
 Status checkDeviceDatabase(Database& database);

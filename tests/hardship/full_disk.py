@@ -1,6 +1,6 @@
 """What test_full_disk.py runs in a mount namespace of its own, where DISK is a small disk.
 
-    full_disk.py grow|look|remove|small|kept APPSYNC DISK FOLDER COORDINATION each|last
+    full_disk.py grow|look|remove|small|kept|former APPSYNC DISK FOLDER COORDINATION each|last
 """
 
 import json
@@ -12,7 +12,8 @@ import subprocess
 import sys
 import tempfile
 
-sys.path.insert(0, os.path.join(os.path.dirname(os.path.abspath(__file__)), "..", "acceptance"))
+HERE = os.path.dirname(os.path.abspath(__file__))
+sys.path.insert(0, os.path.join(HERE, "..", "acceptance"))
 import packages
 
 PAGE = 4  # KiB
@@ -266,10 +267,63 @@ def versions_kept(runner):
     return {app["identifier"]: app["kept"]["version"] for app in apps if app["kept"]}
 
 
+# More than what the device keeps back has room for a second time.
+MUCH_HISTORY = """
+WITH RECURSIVE numbers (number) AS (SELECT 1 UNION ALL SELECT number + 1 FROM numbers WHERE number < 3000)
+INSERT INTO history (time, kind, scenario, step, party, phase, success, identifier, description)
+SELECT number, 1, '', 1, 2, 0, 1, 'com.example.app00', 'a step like three thousand others, of an application' FROM numbers;
+"""
+
+
+def former(runner, _):
+    """One of an earlier version serves a session where there is no room to make it one of this version, until there is."""
+    runner.ok("sync", runner.device, runner.library)
+    with open(os.path.join(HERE, "..", "device", "version4.sql")) as file:
+        on_database(runner, file.read() + MUCH_HISTORY)
+    assert schema(runner) == 4
+    runner.disk.fill()
+    runner.ok("sync", runner.device, runner.library, "--remove", "com.example.app00")
+    assert schema(runner) == 4
+    os.remove(os.path.join(runner.disk.where, "ballast"))
+    leave(runner.disk, MIB // 2)
+    packages.make_package(runner.library, "com.example.app01", "2.0")
+    runner.ok("sync", runner.device, runner.library)
+    assert versions_kept(runner) == {"com.example.app01": "1.0"}
+    runner.ok("rollback", runner.device, "com.example.app01")
+    runner.ok("demote", runner.device, "com.example.app02")
+    assert len(runner.ok("apps", runner.device).splitlines()) == 4
+    assert schema(runner) == 4
+    os.remove(os.path.join(runner.disk.where, "ballast"))
+    runner.ok("reset", runner.device)  # in a session
+    assert schema(runner) == 5
+    assert versions_kept(runner) == {"com.example.app01": "2.0"}
+    runner.check_intact()
+
+
+def leave(disk, free):
+    """Somebody else's file takes all but so much."""
+    with open(os.path.join(disk.where, "ballast"), "wb") as file:
+        file.write(bytes(disk.free() - free))
+
+
+def on_database(runner, script):
+    database = sqlite3.connect(os.path.join(runner.device, "device.db"))
+    database.executescript(script)
+    database.close()
+
+
+def schema(runner):
+    """What the file's header says, as opening the database takes space."""
+    with open(os.path.join(runner.device, "device.db"), "rb") as file:
+        file.seek(60)
+        return int.from_bytes(file.read(4), "big")
+
+
 def main():
     what, program, where, folder, coordination, sizes = sys.argv[1:]
     disk = Disk(where, 2048 if what == "grow" else 8192)
-    {"grow": grow, "look": look, "remove": remove, "small": small, "kept": kept}[what](Runner(program, disk, folder, coordination), sizes)
+    {"grow": grow, "look": look, "remove": remove, "small": small, "kept": kept,
+     "former": former}[what](Runner(program, disk, folder, coordination), sizes)
 
 
 main()

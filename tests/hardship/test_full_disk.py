@@ -25,7 +25,7 @@ def own_mounts(tmp_path_factory):
 
 
 @pytest.mark.parametrize("coordination", ["off", "on"])
-@pytest.mark.parametrize("what", ["grow", "look", "remove", "small", "kept"])
+@pytest.mark.parametrize("what", ["grow", "look", "remove", "small", "kept", "former"])
 def test_full_disk(appsync, own_mounts, tmp_path, what, coordination):
     disk = tmp_path / "disk"
     disk.mkdir()
