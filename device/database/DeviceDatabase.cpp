@@ -35,11 +35,13 @@ Result<std::unique_ptr<Database>> connect(const std::string& path,
 
 /// A change in the queue, and what became of it.
 struct DeviceDatabase::Waiting {
-    const Change& change;
+    const Change& change;  // none in a flush
     Durability durability;
     std::condition_variable& wakes;  // of those that came together
     Status status = {};
     bool done = false;
+
+    bool isFlush() const { return !change; }
 };
 
 Result<std::unique_ptr<DeviceDatabase>> DeviceDatabase::open(const std::string& path,
@@ -165,13 +167,16 @@ void DeviceDatabase::makeInTurn(std::vector<Waiting>& own) {
 
 // Commits for everybody in the queue, the caller being the first of them.
 void DeviceDatabase::lead(std::unique_lock<std::mutex>& lock) {
-    std::vector<Waiting*> batch(queue_.begin(), queue_.end());
-    std::vector<Change> later = std::exchange(later_, {});
+    std::vector<Waiting*> batch;
+    std::vector<Change> later;
+    join(batch, later, Durability::OnDisk);
     isWriterInUse_ = true;
     lock.unlock();
-    commitTogether(batch, std::move(later));
+    const bool kept = commitTogether(batch, later);
     lock.lock();
     isWriterInUse_ = false;
+    if (!later.empty()) laterFailed_ = !kept;
+    if (!kept) leaveAgain(std::move(later));
     queue_.erase(queue_.begin(), queue_.begin() + static_cast<std::ptrdiff_t>(batch.size()));
     for (Waiting* waiting : batch) {
         waiting->done = true;
@@ -180,40 +185,62 @@ void DeviceDatabase::lead(std::unique_lock<std::mutex>& lock) {
     wakeNext();
 }
 
-// What throws ends the process: others wait for what it was part of.
-void DeviceDatabase::commitTogether(std::vector<Waiting*>& batch,
-                                    std::vector<Change> later) noexcept {
+// Takes those that have come since, up to one that has to be safer, and what was left. With the
+// lock held.
+void DeviceDatabase::join(std::vector<Waiting*>& batch, std::vector<Change>& later,
+                          Durability atMost) {
+    const std::size_t together = countTogether();
+    while (batch.size() < together) {
+        Waiting* arrived = queue_[batch.size()];
+        if (arrived->durability == Durability::OnDisk && atMost == Durability::Soon) break;
+        batch.push_back(arrived);
+    }
+    if (laterFailed_ && !queue_.front()->isFlush()) return;
+    std::move(later_.begin(), later_.end(), std::back_inserter(later));
+    later_.clear();
+}
+
+// What was left and could not be kept may be more than the disk takes: it is tried again by flushes
+// alone, so that nobody else's change fails with it. With the lock held.
+std::size_t DeviceDatabase::countTogether() const {
+    if (!laterFailed_) return queue_.size();
+    const auto flush = std::find_if(queue_.begin(), queue_.end(),
+                                    [](const Waiting* waiting) { return waiting->isFlush(); });
+    return std::max<std::size_t>(1, static_cast<std::size_t>(flush - queue_.begin()));
+}
+
+// What throws ends the process: others wait for what it was part of. False when nothing was kept.
+bool DeviceDatabase::commitTogether(std::vector<Waiting*>& batch,
+                                    std::vector<Change>& later) noexcept {
     const bool onDisk = std::any_of(batch.begin(), batch.end(), [](const Waiting* waiting) {
         return waiting->durability == Durability::OnDisk;
     });
     const Durability durability = onDisk ? Durability::OnDisk : Durability::Soon;
     Status whole = beginTransaction(durability);
-    if (whole) {
-        whole = makeAll(batch, std::move(later), durability);
-        if (whole) whole = commit();
-    } else {
-        leaveAgain(std::move(later));
-    }
-    if (whole) return;
+    if (whole) whole = makeAll(batch, later, durability);
+    if (whole) whole = commit();
+    if (whole) return true;
     for (Waiting* waiting : batch) {
         if (waiting->status) waiting->status = whole;
     }
+    return false;
 }
 
 // Those that come until the commit begins join.
-Status DeviceDatabase::makeAll(std::vector<Waiting*>& batch, std::vector<Change> later,
+Status DeviceDatabase::makeAll(std::vector<Waiting*>& batch, std::vector<Change>& later,
                                Durability durability) {
     std::size_t made = 0;
-    for (int joins = kMostJoins; made < batch.size() || !later.empty(); --joins) {
-        for (const Change& change : later) {
-            if (Status lost = whyLost(noteFailure(change(*writer_))); !lost) return lost;
+    std::size_t madeLater = 0;
+    for (int joins = kMostJoins; made < batch.size() || madeLater < later.size(); --joins) {
+        for (; madeLater < later.size(); ++madeLater) {
+            const Status done = noteFailure(later[madeLater](*writer_));
+            if (Status lost = whyLost(done); !lost) return lost;
         }
-        later.clear();
         for (; made < batch.size(); ++made) {
             batch[made]->status = makeChange(batch[made]->change);
             if (Status lost = whyLost(batch[made]->status); !lost) return lost;
         }
-        if (joins > 0) later = joinArrived(batch, durability);
+        if (joins > 0) joinArrived(batch, later, durability);
     }
     return {};
 }
@@ -227,24 +254,16 @@ Status DeviceDatabase::whyLost(const Status& last) const {
                            " did not keep what was written; check the disk, and run it again");
 }
 
-// They were left before what is left now.
+// They were left before what is left now. With the lock held.
 void DeviceDatabase::leaveAgain(std::vector<Change> later) {
-    const std::lock_guard lock(mutex_);
     std::move(later_.begin(), later_.end(), std::back_inserter(later));
     later_ = std::move(later);
 }
 
-// How safe a transaction is going to be cannot be changed any more.
-std::vector<DeviceDatabase::Change> DeviceDatabase::joinArrived(std::vector<Waiting*>& batch,
-                                                                Durability durability) {
+void DeviceDatabase::joinArrived(std::vector<Waiting*>& batch, std::vector<Change>& later,
+                                 Durability durability) {
     const std::lock_guard lock(mutex_);
-    if (isFrozen_) return {};
-    while (batch.size() < queue_.size()) {
-        Waiting* arrived = queue_[batch.size()];
-        if (arrived->durability == Durability::OnDisk && durability == Durability::Soon) break;
-        batch.push_back(arrived);
-    }
-    return std::exchange(later_, {});
+    if (!isFrozen_) join(batch, later, durability);
 }
 
 Status DeviceDatabase::beginTransaction(Durability durability) {
@@ -258,6 +277,7 @@ Status DeviceDatabase::beginTransaction(Durability durability) {
 }
 
 Status DeviceDatabase::makeChange(const Change& change) {
+    if (!change) return {};
     if (Status status = writer_->query("SAVEPOINT change").run(); !status) return status;
     Status status = change(*writer_);
     if (!writer_->inTransaction()) return status;
@@ -307,7 +327,7 @@ Status DeviceDatabase::flush() {
         const std::lock_guard lock(mutex_);
         if (isFrozen_ || (later_.empty() && queue_.empty())) return {};
     }
-    return change(Durability::Soon, [](Database&) { return Status(); });
+    return change(Durability::Soon, nullptr);
 }
 
 bool DeviceDatabase::freeze(std::chrono::milliseconds longest) {

@@ -61,7 +61,7 @@ class DeviceDatabase {
     [[nodiscard]] static Result<std::unique_ptr<DeviceDatabase>> open(
         const std::string& path, Sharing sharing = Sharing::Always);
 
-    /// Makes the changes that were left for later.
+    /// Makes the changes that were left for later, if the database takes them.
     ~DeviceDatabase();
     DeviceDatabase(const DeviceDatabase&) = delete;
     DeviceDatabase& operator=(const DeviceDatabase&) = delete;
@@ -85,7 +85,9 @@ class DeviceDatabase {
     /// Leaves a change for later: it goes with the next change of anyone's, at the latest a tenth
     /// of a second from now, or when the database takes changes again. It runs after those that
     /// were left before it. A statement that fails changes nothing; what the change did before is
-    /// kept. A crash may lose it. It may run after this call has returned.
+    /// kept. Where the transaction is lost it is made again, without what others change, until it
+    /// is kept; so it may run more than once. A crash may lose it. It may run after this call has
+    /// returned.
     void changeLater(Change change);
 
     /// Makes the changes that were left for later, now.
@@ -112,11 +114,14 @@ class DeviceDatabase {
     void wakeNext();
     void makeInTurn(std::vector<Waiting>& own);
     void lead(std::unique_lock<std::mutex>& lock);
-    void commitTogether(std::vector<Waiting*>& batch, std::vector<Change> later) noexcept;
-    Status makeAll(std::vector<Waiting*>& batch, std::vector<Change> later, Durability durability);
+    void join(std::vector<Waiting*>& batch, std::vector<Change>& later, Durability atMost);
+    [[nodiscard]] std::size_t countTogether() const;
+    bool commitTogether(std::vector<Waiting*>& batch, std::vector<Change>& later) noexcept;
+    Status makeAll(std::vector<Waiting*>& batch, std::vector<Change>& later, Durability durability);
     Status whyLost(const Status& last) const;
     void leaveAgain(std::vector<Change> later);
-    std::vector<Change> joinArrived(std::vector<Waiting*>& batch, Durability durability);
+    void joinArrived(std::vector<Waiting*>& batch, std::vector<Change>& later,
+                     Durability durability);
     Status beginTransaction(Durability durability);
     Status makeChange(const Change& change);
     Status commit();
@@ -134,6 +139,7 @@ class DeviceDatabase {
     std::condition_variable writerIsFree_;  // told of where it is frozen
     std::deque<Waiting*> queue_;
     std::vector<Change> later_;
+    bool laterFailed_ = false;    // their transaction did
     bool isWriterInUse_ = false;  // somebody commits, or reads by way of it
     bool isFrozen_ = false;
     std::optional<ErrorRecord> failure_;

@@ -39,6 +39,13 @@ class DeviceDatabaseTest : public DeviceFixture {
         database.execute("ROLLBACK").ignore();
         return deviceError(DeviceErrorCode::NoSpace, kNoRoom);
     }
+    /// Has the commit fail, as a promise of no coordinator is noticed there.
+    static Status loseCommit(Database& database) {
+        if (Status deferred = database.execute("PRAGMA defer_foreign_keys = ON"); !deferred) {
+            return deferred;
+        }
+        return database.execute("INSERT INTO promises VALUES (99, 0, 0, 'n', 1, NULL, 0, 0, 0, 0)");
+    }
 };
 
 TEST_F(DeviceDatabaseTest, aChangeIsSeenByEverybodyWhenTheCallReturns) {
@@ -249,6 +256,54 @@ TEST_F(DeviceDatabaseTest, whatWasLeftForLaterWaitsUntilATransactionCanBegin) {
     while (!perform("ROLLBACK")) std::this_thread::yield();
     EXPECT_TRUE(succeeded(database->flush()));
     EXPECT_EQ(rows(), 1);
+}
+
+TEST_F(DeviceDatabaseTest, whatWasLeftForLaterIsMadeAgainWhereTheCommitFails) {
+    const auto database = open();
+    const Status status = database->change(Durability::Soon, [&](Database& writer) {
+        for (const char* left : {"later", "and later"}) {  // they join this transaction
+            database->changeLater([=](Database& own) { return insert(own, left); });
+        }
+        return loseCommit(writer);
+    });
+    EXPECT_FALSE(status);
+    EXPECT_TRUE(succeeded(database->flush()));
+    EXPECT_EQ(rows(), 2);
+    EXPECT_EQ(number("SELECT rowid FROM restore_data WHERE identifier = 'later'"), 1)
+        << "in their order";
+}
+
+TEST_F(DeviceDatabaseTest, whatIsLeftAndAlwaysLostHoldsNobodyElseUp) {
+    const auto database = open();
+    database->changeLater(loseTransaction);
+    EXPECT_FALSE(database->flush());
+    for (const char* name : {"first", "second"}) {
+        EXPECT_TRUE(succeeded(database->change(
+            Durability::Soon, [&](Database& writer) { return insert(writer, name); })));
+        EXPECT_FALSE(database->flush()) << "it is not forgotten";
+    }
+    EXPECT_EQ(rows(), 2);
+}
+
+TEST_F(DeviceDatabaseTest, whatWasLeftAndLostGoesWithTheNextChangeOnceItIsKept) {
+    const auto database = open();
+    bool fails = true;  // written by whoever has the transaction
+    database->changeLater([&fails](Database& writer) {
+        return fails ? loseTransaction(writer) : insert(writer, "later");
+    });
+    EXPECT_FALSE(database->flush());
+    EXPECT_TRUE(succeeded(database->change(Durability::Soon, [&](Database&) {
+        fails = false;
+        return Status();
+    })));
+    EXPECT_TRUE(succeeded(database->flush()));
+    EXPECT_EQ(rows(), 1);
+    const Status status = database->change(Durability::Soon, [&](Database& writer) {
+        database->changeLater([](Database& own) { return insert(own, "joins"); });
+        return insert(writer, "next");
+    });
+    EXPECT_TRUE(succeeded(status));
+    EXPECT_EQ(rows(), 3);
 }
 
 TEST_F(DeviceDatabaseTest, aReadingThatThrowsHoldsNobodyUp) {
