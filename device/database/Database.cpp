@@ -245,7 +245,7 @@ Result<std::unique_ptr<Database>> Database::openNamed(const std::string& path,
 Database::Database(sqlite3* handle, std::string path) : handle_(handle), path_(std::move(path)) {
     if (handle_ == nullptr) return;
     sqlite3_rollback_hook(
-        handle_, [](void* self) { ++static_cast<Database*>(self)->losses_; }, this);
+        handle_, [](void* self) { static_cast<Database*>(self)->noteLoss(); }, this);
 }
 
 Database::~Database() {
@@ -279,7 +279,7 @@ Result<std::int64_t> Database::integer(const char* sql) {
 bool Database::inTransaction() const { return sqlite3_get_autocommit(handle_) == 0; }
 
 void Database::undoSince(const char* rollback) {
-    ++losses_;
+    noteLoss();
     query(rollback).run().ignore();
 }
 

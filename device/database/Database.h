@@ -108,6 +108,8 @@ class Database {
     [[nodiscard]] bool inTransaction() const;
     /// How often what was written has not been kept: a transaction, or a part of one, was undone.
     [[nodiscard]] std::uint64_t losses() const noexcept { return losses_; }
+    /// Counts one that only the caller knows of.
+    void noteLoss() noexcept { ++losses_; }
     /// Undoes what was written since that savepoint.
     void undoSince(const char* rollback);
     /// Rows that the last statement changed.

@@ -234,6 +234,7 @@ Status DeviceDatabase::makeAll(std::vector<Waiting*>& batch, std::vector<Change>
     for (int joins = kMostJoins; made < batch.size() || madeLater < later.size(); --joins) {
         for (; madeLater < later.size(); ++madeLater) {
             const Status done = noteFailure(later[madeLater](*writer_));
+            if (!done) writer_->noteLoss();  // what it did not get to
             if (Status lost = whyLost(done); !lost) return lost;
         }
         for (; made < batch.size(); ++made) {

@@ -306,6 +306,22 @@ TEST_F(DeviceDatabaseTest, whatWasLeftAndLostGoesWithTheNextChangeOnceItIsKept) 
     EXPECT_EQ(rows(), 3);
 }
 
+TEST_F(DeviceDatabaseTest, aLaterChangeThatFailsInPartIsALoss) {
+    const auto database = open();
+    std::uint64_t before = 0;
+    std::uint64_t after = 0;
+    const auto losses = [&](std::uint64_t& result) {
+        return database->change(Durability::Soon, [&](Database& writer) {
+            result = writer.losses();
+            return Status();
+        });
+    };
+    ASSERT_TRUE(succeeded(losses(before)));
+    database->changeLater([](Database&) -> Status { return ErrorRecord::make("test", 1, "no"); });
+    ASSERT_TRUE(succeeded(losses(after)));
+    EXPECT_EQ(after, before + 1);
+}
+
 TEST_F(DeviceDatabaseTest, aReadingThatThrowsHoldsNobodyUp) {
     const auto database = open();
     const auto lacksMemory = [](Database&) -> Status { throw std::bad_alloc(); };
