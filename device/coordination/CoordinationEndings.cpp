@@ -26,6 +26,12 @@ Status storeFailure(Database& database, const std::string& identifier, const Err
         .run();
 }
 
+// One that a failed transaction took along ends as one that is there.
+Status saveToEnd(Database& database, LiveCoordinator& coordinator) {
+    const Result<bool> saved = coordinator.save(database, LiveCoordinator::For::End);
+    return saved ? Status() : Status(saved.error());
+}
+
 // Nothing but a restore brings back what stands there.
 bool restores(const LiveCoordinator& coordinator) {
     const bool isRestore = coordinator.kind == CoordinatorKind::Restoring ||
@@ -40,7 +46,8 @@ void CoordinationBook::cancel(const Coordinator& coordinator, const ErrorRecord&
     if (closed_ || !coordinator->beginEnding()) return;
     RemovedCoordinator removed;
     const Status status = context_.database.change(Durability::Soon, [&](Database& database) {
-        Status done = removeCoordinator(database, coordinator->id, removed);
+        Status done = saveToEnd(database, *coordinator);
+        if (done) done = removeCoordinator(database, coordinator->id, removed);
         if (!done || !removed.existed || access_ == Access::Session) return done;
         return announceCancellation(database,
                                     {0, coordinator->id, coordinator->identifier, client, reason});
@@ -74,12 +81,15 @@ void CoordinationBook::failed(const Coordinator& coordinator, const ErrorRecord&
 void CoordinationBook::fail(const Coordinator& coordinator, const ErrorRecord& error,
                             FailureOf what) {
     if (!coordinator->beginEnding()) return;
+    coordinator->stay();
     RemovedCoordinator removed;
     const bool isKept = what == FailureOf::Install && restores(*coordinator);
     const StoredCoordinator known = coordinator->snapshot();
     const Status status = context_.database.change(Durability::Soon, [&](Database& database) {
-        Status done = isKept ? renewRestore(database, known, removed)
-                             : removeCoordinator(database, coordinator->id, removed);
+        Status done = saveToEnd(database, *coordinator);
+        if (!done) return done;
+        done = isKept ? renewRestore(database, known, removed)
+                      : removeCoordinator(database, coordinator->id, removed);
         if (!done || !removed.existed) return done;
         return storeFailure(database, coordinator->identifier, error);
     });

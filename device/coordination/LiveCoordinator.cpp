@@ -225,13 +225,14 @@ bool LiveCoordinator::beginSaving() {
     return !std::exchange(saving_, true);
 }
 
-std::optional<LiveCoordinator::Writing> LiveCoordinator::takeWriting(std::uint64_t losses) {
+std::optional<LiveCoordinator::Writing> LiveCoordinator::takeWriting(std::uint64_t losses,
+                                                                     For what) {
     const std::lock_guard lock(mutex_);
     saving_ = false;
     if (ended_) return std::nullopt;
     Writing writing;
     writing.isNew = !std::exchange(isWritten_, true);
-    const bool stays = !ending_ && !isLeaving_ && !isPreceded_;
+    const bool stays = (!ending_ || what == For::End) && !isLeaving_ && !isPreceded_;
     writing.mayBeLost = stays && losses_ && *losses_ != losses;
     if (stays || !losses_) losses_ = losses;  // what is not mended now may be later
     const bool hasChanged = std::exchange(rowChanged_, false);
@@ -255,8 +256,13 @@ void LiveCoordinator::giveWay() {
     isPreceded_ = true;
 }
 
-Result<bool> LiveCoordinator::save(Database& database) {
-    const std::optional<Writing> writing = takeWriting(database.losses());
+void LiveCoordinator::stay() {
+    const std::lock_guard lock(mutex_);
+    isLeaving_ = false;
+}
+
+Result<bool> LiveCoordinator::save(Database& database, For what) {
+    const std::optional<Writing> writing = takeWriting(database.losses(), what);
     if (!writing) return false;
     if (writing->row) {
         const Result<bool> written = saveRow(database, *writing);

@@ -77,12 +77,17 @@ class LiveCoordinator {
 
     /// True for the one caller who has to see to it that changes are written.
     [[nodiscard]] bool beginSaving();
+    /// What it is saved for: while it is about to end, only the transaction that ends it writes
+    /// what was lost, as it takes that away again.
+    enum class For { Life, End };
     /// Writes the changes that were not written yet, inside a transaction; all of it where the
     /// database has lost something since. False when it turns out that the database has it no
     /// longer.
-    [[nodiscard]] Result<bool> save(Database& database);
+    [[nodiscard]] Result<bool> save(Database& database, For what = For::Life);
     /// Takes it away with the transaction that installs it. False as that of `save`.
     [[nodiscard]] Result<bool> forget(Database& database);
+    /// That transaction has failed.
+    void stay();
 
   private:
     struct Piece {  // by role and position
@@ -98,7 +103,7 @@ class LiveCoordinator {
         std::optional<StoredCoordinator> row;  // where it has changed
         std::vector<Piece> pieces;
     };
-    [[nodiscard]] std::optional<Writing> takeWriting(std::uint64_t losses);
+    [[nodiscard]] std::optional<Writing> takeWriting(std::uint64_t losses, For what);
     [[nodiscard]] Result<bool> saveRow(Database& database, const Writing& writing) const;
     void giveWay();
 

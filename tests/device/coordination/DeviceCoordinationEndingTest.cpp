@@ -15,7 +15,40 @@ constexpr CoordinationClient kOther = 7;
 
 ErrorRecord reason(std::int64_t code = 30) { return ErrorRecord::make("TRError", code, "enough"); }
 
-class DeviceCoordinationEndingTest : public DeviceCoordinationFixture {};
+class DeviceCoordinationEndingTest : public DeviceCoordinationFixture {
+  protected:
+    /// Has the database lose what it has of the coordinators, as a failed transaction does.
+    void loseCoordinators() {
+        ASSERT_TRUE(eventually([&] { return number("SELECT count(*) FROM coordinators") > 0; }));
+        sql("DELETE FROM coordinators");
+        EXPECT_FALSE(device().uninstall("com.example.none"));
+    }
+};
+
+TEST_F(DeviceCoordinationEndingTest, aCancelEndsWhatTheDatabaseHasLost) {
+    const auto made = prepare(kAtlas);
+    loseCoordinators();
+    made->cancelForReason(reason(), kOther);
+    EXPECT_EQ(listener_->waitFor(2).back(), "cancelled com.example.atlas, client 7");
+    EXPECT_TRUE(made->error());
+    EXPECT_FALSE(recordOf(kAtlas));
+}
+
+TEST_F(DeviceCoordinationEndingTest, aFailureOfWhatTheDatabaseHasLostIsRemembered) {
+    const auto made = coordinator(kAtlas, CoordinatorKind::Initiating);
+    const auto shown =
+        service().makeAppPlaceholder("Atlas", kAtlas, kInstallTypeSync, SyncClientID);
+    PlaceholderAttributes attributes;
+    attributes.info.set("Nothing", PropertyList());  // no encoding can carry it
+    ASSERT_TRUE(shown->setAttributes(attributes));
+    ASSERT_TRUE(shown->setConfigurationComplete());
+    loseCoordinators();
+    EXPECT_FALSE(made->setPlaceholderPromise(shown));
+    EXPECT_EQ(listener_->waitFor(2),
+              (Texts{"no placeholder com.example.atlas", "failed com.example.atlas"}));
+    EXPECT_EQ(number("SELECT count(*) FROM failures"), 1);
+    EXPECT_FALSE(recordOf(kAtlas));
+}
 
 TEST_F(DeviceCoordinationEndingTest, aCancelTakesThePlaceholderAndLeavesTheOldVersion) {
     ASSERT_TRUE(install(kAtlas, "1.0"));

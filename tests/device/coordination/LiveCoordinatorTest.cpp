@@ -28,10 +28,10 @@ class LiveCoordinatorTest : public DeviceFixture {
     }
 
     /// What saving it in a transaction of its own gives.
-    bool save() {
+    bool save(LiveCoordinator::For what = LiveCoordinator::For::Life) {
         bool saved = false;
         const Status changed = database_->change(Durability::Soon, [&](Database& database) {
-            const Result<bool> result = coordinator_->save(database);
+            const Result<bool> result = coordinator_->save(database, what);
             saved = result && *result;
             return Status();
         });
@@ -101,6 +101,27 @@ TEST_F(LiveCoordinatorTest, whatWasLostIsWrittenOnceItDoesNotEndAfterAll) {
     EXPECT_EQ(rows(), 0);
     coordinator_->abandonEnding();
     EXPECT_TRUE(save());
+    EXPECT_EQ(rows(), 1);
+}
+
+TEST_F(LiveCoordinatorTest, whatWasLostIsThereForWhoeverEndsIt) {
+    saveInVain([](Database&) { return Status(noRoom()); });
+    ASSERT_TRUE(coordinator_->beginEnding());
+    EXPECT_TRUE(save(LiveCoordinator::For::End));
+    EXPECT_EQ(rows(), 1);
+}
+
+TEST_F(LiveCoordinatorTest, whatWasLostWithTheInstallThatTookItAwayIsThereForWhoeverEndsIt) {
+    saveInVain([&](Database& database) {
+        const Result<bool> forgotten = coordinator_->forget(database);
+        EXPECT_TRUE(forgotten && *forgotten);
+        return Status(noRoom());
+    });
+    ASSERT_TRUE(coordinator_->beginEnding());
+    static_cast<void>(save(LiveCoordinator::For::End));
+    EXPECT_EQ(rows(), 0) << "the install may have been kept";
+    coordinator_->stay();
+    EXPECT_TRUE(save(LiveCoordinator::For::End));
     EXPECT_EQ(rows(), 1);
 }
 
