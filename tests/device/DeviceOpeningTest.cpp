@@ -5,6 +5,7 @@
 #include <fstream>
 
 #include "device/database/Database.h"
+#include "device/database/DeviceSchema.h"
 #include "tests/device/DeviceFixture.h"
 
 namespace appsync {
@@ -242,6 +243,21 @@ TEST_F(DeviceOfVersion1Test, aSessionBringsItUpToDateAndLosesNothing) {
               1);
     close();
     EXPECT_TRUE(openSession(devicePath()).ok());
+}
+
+TEST_F(DeviceOfVersion1Test, isMadeUsableFirstWhereThereIsLittleRoom) {
+    {
+        auto database = Database::open(devicePath("device.db"), Database::Mode::Existing);
+        ASSERT_TRUE(database.ok());
+        EXPECT_GT(*roomToBringSchemaUpToDate(**database), 512U << 10U);
+        ASSERT_TRUE(succeeded(makeSchemaUsable(**database)));
+        EXPECT_TRUE(succeeded(checkDeviceSchema(**database)));
+        EXPECT_TRUE(succeeded(makeSchemaUsable(**database))) << "nothing is left to do";
+    }
+    EXPECT_EQ(number("PRAGMA user_version"), 4);
+    EXPECT_TRUE(look()->status("com.example.a")->uninstalled);
+    ASSERT_TRUE(openSession(devicePath()).ok());
+    EXPECT_EQ(number("PRAGMA user_version"), 5);
 }
 
 TEST_F(DeviceOfVersion1Test, aSessionThatWasCutOffIsStillKnown) {
