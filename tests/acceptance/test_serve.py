@@ -248,6 +248,32 @@ def test_every_answer_is_for_this_page_alone(appsync, device, serving):
         elsewhere.connect((address_of_this_machine(), serving.port))
 
 
+@ON_ONE_PATH
+def test_the_port_that_addresses_leave_out(appsync, device):
+    """A browser that opens http://127.0.0.1/ names no port."""
+    with socket.socket() as probe:
+        probe.setsockopt(socket.SOL_SOCKET, socket.SO_REUSEADDR, 1)
+        try:
+            probe.bind(("127.0.0.1", 80))
+        except OSError as error:
+            pytest.skip("port 80 of this machine is not to be had: %s" % error)
+    process = appsync.start("serve", device.path, "--port", "80")
+    assert process.stdout.readline() == "Serving at http://127.0.0.1:80/ - Ctrl-C ends it.\n"
+
+    def status(host, **headers):
+        connection = http.client.HTTPConnection("127.0.0.1", 80, timeout=20)
+        with contextlib.closing(connection):
+            connection.request("GET", "/api/devices", headers={"Host": host, **headers})
+            return connection.getresponse().status
+
+    for host in ("127.0.0.1", "localhost", "[::1]", "127.0.0.1:80"):
+        assert status(host, Origin="http://" + host) == 200, host
+    assert status("evil.example") == 403
+    assert status("127.0.0.1", Origin="http://evil.example") == 403
+    process.send_signal(signal.SIGINT)
+    assert process.wait(timeout=20) == 0
+
+
 def address_of_this_machine():
     """One that is not the loopback's; 127.0.0.2 where there is none, which is not served either."""
     with socket.socket(socket.AF_INET, socket.SOCK_DGRAM) as probe:

@@ -39,6 +39,7 @@ constexpr int kMostEventStreams = 256;
 // Of those that are too many, so many are told so.
 constexpr std::size_t kMostRefusals = 64;
 constexpr int kBacklog = 512;
+constexpr int kPortOfHttp = 80;
 constexpr std::chrono::milliseconds kWithoutMeans{50};
 
 constexpr std::string_view kContentPolicy =
@@ -243,8 +244,10 @@ Result<std::uint16_t> portOf(const UniqueFd& listener) {
 }  // namespace
 
 void HttpServer::State::setUp() {
-    for (const char* name : {"127.0.0.1:", "localhost:", "[::1]:"}) {
-        hosts.insert(name + std::to_string(port));
+    for (const std::string name : {"127.0.0.1", "localhost", "[::1]"}) {
+        hosts.insert(name + ":" + std::to_string(port));
+        // Browsers leave out the port that an address without one means.
+        if (port == kPortOfHttp) hosts.insert(name);
     }
     protocol.set_default_headers(headersOfAll());
     protocol.set_pre_routing_handler(
