@@ -369,7 +369,8 @@ class Commands {
         const std::string told = error.what();
         const std::string option = told.substr(0, told.find(':'));
         if (dynamic_cast<const CLI::ArgumentMismatch*>(&error) != nullptr) {
-            return option + " needs a value";
+            const bool isTooOften = told.find(": At Most ") != std::string::npos;
+            return option + (isTooOften ? " is given more than once" : " needs a value");
         }
         if (dynamic_cast<const CLI::ConversionError*>(&error) != nullptr) {
             return "an option of " + typed(chosen()) + " does not take its value";

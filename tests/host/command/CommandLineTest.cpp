@@ -97,6 +97,8 @@ INSTANTIATE_TEST_SUITE_P(
                    "--type: two is no whole number: see appsync restore --help"},
         WrongUsage{{"demote", "device", "com.a", "--by"},
                    "--by needs a value: see appsync demote --help"},
+        WrongUsage{{"replay", "file", "--plug-in", "a", "--plug-in", "b"},
+                   "--plug-in is given more than once: see appsync replay --help"},
         WrongUsage{{"sync", "device", "library", "--version"},
                    "--version is not an option of appsync sync: see appsync sync --help"},
         WrongUsage{{"set", "device", ""}, "there is no setting ''"},
