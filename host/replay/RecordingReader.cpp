@@ -316,6 +316,8 @@ std::optional<std::string> textIn(const ParsedJson& value) {
 Result<RecordedSession> readRecording(std::string_view text) {
     Reading reading;
     std::size_t number = 0;
+    // A recording grows by zeros, and a kill before its first line leaves nothing else.
+    if (text.find_first_not_of('\0') == std::string_view::npos) return noRecording("it is empty");
     while (!text.empty()) {
         const std::size_t length = text.find('\n');
         if (length == std::string_view::npos && number > 0) break;  // the process ended in it
@@ -333,7 +335,6 @@ Result<RecordedSession> readRecording(std::string_view text) {
         }
         text.remove_prefix(std::min(length, text.size() - 1) + 1);
     }
-    if (number == 0) return noRecording("it is empty");
     return reading.take();
 }
 

@@ -72,7 +72,8 @@ TEST(RecordingReader, RefusesWhatIsNoRecording) {
     EXPECT_THAT(refusalOf(""), HasSubstr("it is empty"));
     EXPECT_THAT(refusalOf("rubbish"), HasSubstr("no header"));
     EXPECT_THAT(refusalOf("{}\n"), HasSubstr("no header"));
-    EXPECT_THAT(refusalOf(std::string(100, '\0')), HasSubstr("no header"));
+    EXPECT_THAT(refusalOf(std::string(100, '\0')), HasSubstr("it is empty"));
+    EXPECT_THAT(refusalOf(std::string(100, '\0') + "{}\n"), HasSubstr("no header"));
     EXPECT_THAT(refusalOf("{\"recording\":1}\n"), HasSubstr("its header lacks something"));
     EXPECT_THAT(refusalOf("{\"recording\":7}\n"), HasSubstr("version 7"));
 }
