@@ -127,8 +127,8 @@ void RecordingFile::leavePiece() noexcept {
 
 void RecordingFile::tellLoss(const Console& console) const {
     if (lossError_ == 0) return;
-    console.complain("the recording " + path_ +
-                     " is cut off: " + systemError(lossError_, "write").description());
+    console.complain("the recording " + path_ + (isEmpty_ ? " is not kept: " : " is cut off: ") +
+                     systemError(lossError_, "write").description());
 }
 
 Result<std::unique_ptr<RecordingFile>> createRecording(const RecordingArguments& arguments) {

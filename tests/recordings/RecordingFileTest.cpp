@@ -112,6 +112,20 @@ TEST_F(RecordingFileTest, EndsWithItsLastWholeLineWhereTheDiskIsFull) {
     EXPECT_THAT(err.str(), testing::HasSubstr("No space left on device"));
 }
 
+TEST_F(RecordingFileTest, IsNotKeptWhereTheDiskHasNoRoomForItsFirstLine) {
+    roomFailures = {ENOSPC};
+    std::ostringstream out;
+    std::ostringstream err;
+    {
+        const auto file = *RecordingFile::create(path);
+        file->write("a line\n");
+        file->tellLoss(Console{out, err});
+    }
+    EXPECT_EQ(err.str(),
+              "appsync: the recording " + path + " is not kept: write: No space left on device\n");
+    EXPECT_FALSE(std::filesystem::exists(path));
+}
+
 TEST_F(RecordingFileTest, IsGoneWhenNothingWasWritten) {
     static_cast<void>(*RecordingFile::create(path));
     EXPECT_FALSE(std::filesystem::exists(path));
