@@ -1,6 +1,7 @@
 #include "host/replay/RecordingFile.h"
 
 #include <fcntl.h>
+#include <sys/file.h>
 #include <sys/mman.h>
 #include <sys/stat.h>
 #include <unistd.h>
@@ -42,8 +43,11 @@ Result<std::unique_ptr<RecordingFile>> RecordingFile::create(const std::string& 
     UniqueFd file(
         ::open(path.c_str(), O_RDWR | O_CREAT | O_APPEND | O_CLOEXEC | O_NONBLOCK, kMode));
     struct stat status = {};
-    if (!file || ::fstat(file.get(), &status) != 0) return cannotWriteFile(errno, path);
-    if (!S_ISREG(status.st_mode) || status.st_size > 0) {
+    if (!file) return cannotWriteFile(errno, path);
+    // Two sessions that begin at once would both find it empty, were it not locked.
+    const bool isTaken = ::flock(file.get(), LOCK_EX | LOCK_NB) != 0 && errno == EWOULDBLOCK;
+    if (!isTaken && ::fstat(file.get(), &status) != 0) return cannotWriteFile(errno, path);
+    if (isTaken || !S_ISREG(status.st_mode) || status.st_size > 0) {
         return wrongUsage("there is a file " + path + " already",
                           "record into another, or remove it");
     }

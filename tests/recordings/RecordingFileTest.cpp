@@ -126,6 +126,13 @@ TEST_F(RecordingFileTest, IsNotKeptWhereTheDiskHasNoRoomForItsFirstLine) {
     EXPECT_FALSE(std::filesystem::exists(path));
 }
 
+TEST_F(RecordingFileTest, BelongsToOneSessionBeforeItsFirstLine) {
+    roomFailures = {EOPNOTSUPP};
+    const auto file = *RecordingFile::create(path);
+    ASSERT_EQ(std::filesystem::file_size(path), 0U);
+    EXPECT_FALSE(static_cast<bool>(RecordingFile::create(path)));
+}
+
 TEST_F(RecordingFileTest, IsGoneWhenNothingWasWritten) {
     static_cast<void>(*RecordingFile::create(path));
     EXPECT_FALSE(std::filesystem::exists(path));
