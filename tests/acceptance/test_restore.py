@@ -645,7 +645,10 @@ def test_restore_killed_at_random_moments_and_run_again(appsync, tmp_path, coord
         time.sleep(choose.uniform(0, duration))
         process.kill()
         process.communicate()
-        interrupted += process.returncode != 0
+        if process.returncode == 0:
+            duration *= 0.8  # the machine is less busy than it was
+        else:
+            interrupted += 1
         assert restore(device, folder)["screen"] == wanted
         found = appsync.json("apps", device.path)
         assert {app["identifier"]: app["installType"] for app in found} == types

@@ -105,6 +105,11 @@ class Page:
     def wait_for_text(self, selector, text):
         self.wait("return (document.querySelector(arguments[0])?.innerText ?? '').includes(arguments[1])", selector, text)
 
+    def wait_for_opacity(self, condition):
+        """Until there are icons on the home screen, and that of each is as `condition` says ("< 1")."""
+        icons = "[...document.querySelectorAll('#icons .icon > *')]"
+        self.wait(f"return {icons}.length > 0 && {icons}.every((each) => getComputedStyle(each).opacity {condition})")
+
     def tiles(self):
         """What stands on the home screen: identifier, name, state, whether it waits."""
         return self.run("""return [...document.querySelectorAll('#icons .app')].map((app) => ({

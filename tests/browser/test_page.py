@@ -46,7 +46,7 @@ def test_a_sync_is_seen_without_a_reload(appsync, tmp_path, serve, page):
     page.wait_for_text("#session-badge", "none under way")
     page.wait_for_text("#facts", "12")
     assert page.run("return window.isTheSame")
-    page.wait("return document.querySelector('#icons img').naturalWidth > 0")
+    page.wait("return document.querySelector('#icons img')?.naturalWidth > 0")
 
 
 def test_the_timeline_of_a_session_grows(appsync, tmp_path, serve, page):
@@ -84,7 +84,7 @@ def test_a_waiting_install_says_for_whom_and_goes_on(appsync, tmp_path, serve, p
     assert sync.returncode == 0
     page.wait("return document.querySelectorAll('#waits li').length === 0")
     page.wait_for_text("#session-badge", "none under way")
-    page.wait("return document.querySelector('.versions .version').innerText === '2.0'")
+    page.wait("return document.querySelector('.versions .version')?.innerText === '2.0'")
     page.wait_for_text(".versions", "Kept for a rollback\t1.0")
     page.wait_for_tiles({name: "installed" for name in device.apps()})
 
@@ -97,10 +97,10 @@ def test_a_restore_fills_the_screen_at_once(appsync, tmp_path, serve, page):
     page.wait("return !document.getElementById('no-icons').hidden")
     appsync("restore", new.path, tmp_path / "backup")
     page.wait_for_tiles({name: "placeholder" for name in device.apps()})
-    page.wait("return getComputedStyle(document.querySelector('#icons .icon > *')).opacity < 1")
+    page.wait_for_opacity("< 1")
     appsync("store", new.path, tmp_path / "phone-library")
     page.wait_for_tiles({name: "installed" for name in device.apps()})
-    page.wait("return getComputedStyle(document.querySelector('#icons .icon > *')).opacity === '1'")
+    page.wait_for_opacity("=== '1'")
 
 
 def shown_lines(page):
@@ -234,7 +234,7 @@ def test_five_thousand_applications_are_there_in_two_seconds(appsync, tmp_path, 
     print(f"{MANY} applications: {drawn:.2f} s, of which the server takes {server:.2f} s")
     # Two seconds, where the machine is not so slow or busy that the server alone takes long.
     assert drawn < max(2, 8 * server)
-    page.wait("return document.querySelector('.glass img').naturalWidth > 0")
+    page.wait("return document.querySelector('.glass img')?.naturalWidth > 0")
     icons = [url for url in page.requested() if "/icon/" in url]
     assert 0 < len(icons) < 300, "icons that nobody sees are not asked for"
     page.run("document.getElementById('find').focus()")
