@@ -106,9 +106,9 @@ class Page:
         self.wait("return (document.querySelector(arguments[0])?.innerText ?? '').includes(arguments[1])", selector, text)
 
     def wait_for_opacity(self, condition):
-        """Until there are icons on the home screen, and that of each is as `condition` says ("< 1")."""
-        icons = "[...document.querySelectorAll('#icons .icon > *')]"
-        self.wait(f"return {icons}.length > 0 && {icons}.every((each) => getComputedStyle(each).opacity {condition})")
+        """Until there are icons on the home screen, and that of the first is as `condition` says ("< 1")."""
+        icon = "document.querySelector('#icons .icon > *')"
+        self.wait(f"return {icon} !== null && getComputedStyle({icon}).opacity {condition}")
 
     def tiles(self):
         """What stands on the home screen: identifier, name, state, whether it waits."""
